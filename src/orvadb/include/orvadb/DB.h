@@ -1,0 +1,59 @@
+#pragma once
+
+#include <memory>
+#include <string>
+
+struct sqlite3;
+
+namespace orva::db {
+
+class Connection;
+
+/// A connection to one SQLite database file. Used by one thread at a time. Statements and
+/// transactions on it end before it is closed, opened again or destroyed.
+///
+/// Failures of this layer are thrown as std::string: the caller's file and line, SQLite's
+/// message and extended code, and the SQL.
+class DB {
+public:
+  DB();
+  DB(const DB&) = delete;
+  DB& operator=(const DB&) = delete;
+  /// Closes the connection.
+  virtual ~DB();
+
+  /// A text that stands for the database; empty here.
+  virtual std::string GetPrefix() const;
+
+  /// Told of a status to publish; does nothing here.
+  virtual void UpdateStatus(const std::string& key, const std::string& value) const;
+
+  /// Opens the file at `path` for reading and writing and creates it when there is none. A
+  /// connection that is already open is closed first. Links are not followed, and anything
+  /// other than a regular file is refused. Throws std::string.
+  void Open(const std::string& path);
+
+  /// Closes the connection; harmless when closed.
+  void Close();
+
+protected:
+  /// What a connection may do with its file.
+  enum class Access { ReadWrite, ReadOnly };
+
+  /// Open for derived classes: `busyTimeout` is in milliseconds; `immutable` promises that
+  /// nobody writes the file, which then is neither locked nor watched. Only ReadWrite creates.
+  void Open(const std::string& path, Access access, int busyTimeout, bool immutable);
+
+  /// The open connection, null while closed; still owned by this object.
+  sqlite3* Handle() const noexcept { return handle; }
+
+private:
+  friend class Statement;
+  friend class Transaction;
+
+  sqlite3* handle = nullptr; ///< owned; released by Close
+  std::string path;
+  std::unique_ptr<Connection> connection; ///< what belongs to the open handle; null while closed
+};
+
+} // namespace orva::db

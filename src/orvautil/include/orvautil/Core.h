@@ -1,0 +1,19 @@
+#pragma once
+
+#include "orvautil/Config.h"
+
+#include <string>
+
+namespace orva::core {
+
+/// Address of the appliance's notification socket, as Socket::Address takes it. A copy for each
+/// source, so that it is there for the initialisers that follow it.
+const std::string ORVA_NOTIFICATION_SOCKET = ORVA_CONFIG_NOTIFICATION_SOCKET;
+
+/// Folder of the product's own data on the volume at `mountPoint`; makes nothing.
+std::string GetORVA_HOME(const std::string& mountPoint);
+
+/// Path of the media catalog of the volume at `mountPoint`; makes nothing.
+std::string GetCatalogPath(const std::string& mountPoint);
+
+} // namespace orva::core

@@ -1,0 +1,56 @@
+#pragma once
+
+#include "orvautil/deleteAll.h"
+
+#include <memory>
+#include <utility>
+#include <vector>
+
+namespace orva::util {
+
+/// A vector of pointers that owns its elements: they are deleted, first to last, with it.
+/// Only what cannot lose an element is taken over from std::vector; the pointers may be
+/// reordered in place (std::sort). Null elements are allowed.
+template <typename T>
+class OwnerVector : private std::vector<T*> {
+  using Base = std::vector<T*>;
+
+public:
+  using typename Base::const_iterator;
+  using typename Base::iterator;
+  using typename Base::value_type;
+
+  OwnerVector() = default;
+  OwnerVector(OwnerVector&& other) noexcept : Base(std::exchange(other.Mutable(), {})) {}
+  OwnerVector(const OwnerVector&) = delete;
+  OwnerVector& operator=(const OwnerVector&) = delete;
+  OwnerVector& operator=(OwnerVector&&) = delete;
+
+  /// Deletes every element. An element whose destructor throws does not keep the others or
+  /// the storage from being released; the first such exception then continues.
+  ~OwnerVector() noexcept(false) { deleteAll(Mutable()); }
+
+  using Base::back;
+  using Base::begin;
+  using Base::capacity;
+  using Base::empty;
+  using Base::end;
+  using Base::front;
+  using Base::reserve;
+  using Base::size;
+  using Base::operator[];
+
+  /// Appends `element` and takes it over.
+  void push_back(std::unique_ptr<T> element) {
+    Base::push_back(element.get());
+    static_cast<void>(element.release());
+  }
+
+  /// The elements as a plain vector, for operations that only look at them.
+  const std::vector<T*>& Elements() const noexcept { return *this; }
+
+private:
+  std::vector<T*>& Mutable() noexcept { return *this; }
+};
+
+} // namespace orva::util

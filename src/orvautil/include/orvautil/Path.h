@@ -1,0 +1,38 @@
+#pragma once
+
+#include <string>
+
+namespace orva::util {
+
+/// A view of a path held by somebody else: the string must outlive the object.
+class Path {
+public:
+  explicit Path(const std::string& path) noexcept : path_(path) {}
+  explicit Path(std::string&&) = delete;
+
+  /// True when there is something at the path, links followed.
+  bool Exists() const;
+
+  /// Makes this one directory, none of its parents, with `permissions` less the process's
+  /// umask. Returns whether it was made.
+  bool Create(unsigned permissions) const;
+
+  /// The absolute path without links, dots or trailing separator; empty when nothing exists
+  /// there.
+  std::string Canonicalize() const;
+
+  /// The path without trailing separators; the root stays "/".
+  std::string Basic() const;
+
+  static char GetNativePathSeparator() noexcept { return '/'; }
+
+private:
+  const std::string& path_;
+};
+
+/// `directory` and `name` joined by exactly one separator, whether or not the one ends in some
+/// or the other begins with some. An empty directory gives the name alone, an empty name the
+/// directory with a separator behind it.
+std::string MakePath(const std::string& directory, const std::string& name);
+
+} // namespace orva::util

@@ -1,0 +1,53 @@
+#pragma once
+
+#include "orvautil/Stream.h"
+
+#include <sys/socket.h>
+#include <sys/un.h>
+
+#include <string>
+
+namespace orva::util {
+
+/// A local (AF_UNIX) stream socket; owns its descriptor. Interrupted system calls are retried.
+class Socket : public Stream {
+public:
+  /// Address of a local socket.
+  class Address {
+  public:
+    /// `text` is an absolute path, or '@' and a name for an abstract address. Throws Exception
+    /// when it is neither, or longer than the system can take.
+    explicit Address(const std::string& text);
+
+    const sockaddr* Get() const noexcept;
+    socklen_t Length() const noexcept { return length_; }
+
+  private:
+    sockaddr_un address_{};
+    socklen_t length_ = 0;
+  };
+
+  ~Socket() override;
+
+  /// True exactly when the descriptor is not -1.
+  bool IsOpen() const override { return descriptor_ != -1; }
+  void Close() override;
+  /// Nothing is kept back, so there is nothing to do.
+  void Flush() override {}
+  bool IsDataAvailable(unsigned long long* count) override;
+  unsigned Read(void* data, unsigned size) override;
+  /// Never raises SIGPIPE.
+  unsigned Write(const void* data, unsigned size) override;
+
+  /// -1 while not connected. Still owned by the socket.
+  int Descriptor() const noexcept { return descriptor_; }
+
+protected:
+  /// Takes over `descriptor`, -1 for none.
+  explicit Socket(int descriptor) noexcept : descriptor_(descriptor) {}
+
+private:
+  int descriptor_;
+};
+
+} // namespace orva::util
