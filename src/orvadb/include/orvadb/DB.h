@@ -36,6 +36,9 @@ public:
   /// Closes the connection; harmless when closed.
   void Close();
 
+  /// Path of the open file; empty while closed.
+  const std::string& GetPath() const noexcept { return path_; }
+
 protected:
   /// What a connection may do with its file.
   enum class Access { ReadWrite, ReadOnly };
@@ -45,15 +48,15 @@ protected:
   void Open(const std::string& path, Access access, int busyTimeout, bool immutable);
 
   /// The open connection, null while closed; still owned by this object.
-  sqlite3* Handle() const noexcept { return handle; }
+  sqlite3* Handle() const noexcept { return handle_; }
 
 private:
   friend class Statement;
   friend class Transaction;
 
-  sqlite3* handle = nullptr; ///< owned; released by Close
-  std::string path;
-  std::unique_ptr<Connection> connection; ///< what belongs to the open handle; null while closed
+  sqlite3* handle_ = nullptr; ///< owned; released by Close
+  std::string path_;
+  std::unique_ptr<Connection> connection_; ///< what belongs to the open handle; null while closed
 };
 
 } // namespace orva::db

@@ -1,10 +1,9 @@
 #pragma once
 
-#include <ctime>
-#include <memory>
-#include <string>
+#include "orvadb/Connection.h"
 
-struct sqlite3_stmt;
+#include <ctime>
+#include <string>
 
 namespace orva::db {
 
@@ -27,7 +26,7 @@ public:
   Statement(const DB& db, const char* sql, const char* file, unsigned int line);
   Statement(const Statement&) = delete;
   Statement& operator=(const Statement&) = delete;
-  ~Statement();
+  ~Statement() = default;
 
   /// Runs to the next row or the end and returns SQLite's result code, throwing nothing: ROW,
   /// DONE, or another, after which the running transaction cannot be committed.
@@ -57,13 +56,10 @@ public:
   bool GetBool(int column) const;
 
 private:
-  struct CheckedOut;
-
   void CheckBind(int code, const char* file, unsigned int line) const;
 
   const DB& db_;
-  std::unique_ptr<CheckedOut> checkedOut_;
-  sqlite3_stmt* statement_; ///< owned by checkedOut_
+  Connection::CheckedOut statement_;
 };
 
 } // namespace orva::db

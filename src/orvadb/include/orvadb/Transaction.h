@@ -24,6 +24,8 @@ public:
   void Commit(const char* file, unsigned int line);
 
 private:
+  void End() noexcept;
+
   const DB& db_;
   bool open_ = true;
 };

@@ -15,10 +15,10 @@ public:
   VolumeDB(const std::string& path, bool writable);
 
   /// The mount point as it was given.
-  std::string GetPrefix() const override { return prefix; }
+  std::string GetPrefix() const override { return prefix_; }
 
 private:
-  std::string prefix;
+  std::string prefix_;
 };
 
 } // namespace orva::db

@@ -1,6 +1,7 @@
 #pragma once
 
 #include <atomic>
+#include <exception>
 #include <memory>
 #include <string>
 #include <utility>
@@ -50,8 +51,8 @@ public:
   virtual void HandleMessage(Stream& stream, const unsigned char* data, unsigned long length,
                              const xercesc::DOMNode& root) const = 0;
 
-  /// Told of every message given up, with an Error and, unless it was too long to keep, the
-  /// message. This version does nothing.
+  /// Told of every message given up, with an Error and the message; of one that was too long to
+  /// keep, with none. This version does nothing.
   virtual void HandleError(int error, Stream& stream, const unsigned char* data,
                            unsigned long length) const;
 
@@ -66,11 +67,13 @@ protected:
   std::atomic<bool> stop{false};     ///< asks whoever calls ReadMessages to make no new call
   std::vector<unsigned char> buffer; ///< bytes of the message that is still arriving
 
-private:
-  class ParserScope;
+  /// The text of an exception that ended a message, for the log; "unknown exception" for a type
+  /// that has none. Overridden by who knows more types.
+  virtual std::string DescribeException(const std::exception_ptr& exception) const;
 
+private:
   void ProcessMessage(Stream& stream, const unsigned char* data, unsigned long length) const;
-  void GiveUp(Error error, const char* reason, Stream& stream, const unsigned char* data,
+  void GiveUp(Error error, const std::string& reason, Stream& stream, const unsigned char* data,
               unsigned long length) const;
 
   std::unique_ptr<xercesc::XercesDOMParser> parser_; ///< there only during ReadMessages

@@ -3,7 +3,6 @@
 #include <cstddef>
 #include <memory>
 #include <string>
-#include <string_view>
 #include <unordered_map>
 
 struct sqlite3;
@@ -24,24 +23,24 @@ struct StatementFinalizer {
 class Connection {
 public:
   using Compiled = std::unique_ptr<sqlite3_stmt, StatementFinalizer>;
-  /// Keyed by the text that SQLite keeps with the statement.
-  using Statements = std::unordered_map<std::string_view, Compiled>;
+
+  /// Ends a use: puts the statement back into its place, or finalises it when it has none.
+  struct CheckIn {
+    Compiled* place = nullptr; ///< the connection's; stays where it is as long as that lives
+    void operator()(sqlite3_stmt* statement) const noexcept;
+  };
+  using CheckedOut = std::unique_ptr<sqlite3_stmt, CheckIn>;
 
   /// Statements kept at the most; the daemon has about thirty texts.
   static constexpr std::size_t MAXIMUM_STATEMENTS = 64;
 
+  /// Belongs to `handle`, which it does not own.
   Connection(sqlite3* handle, int busyTimeout) noexcept
       : handle_(handle), busyTimeout_(busyTimeout) {}
-  Connection(const Connection&) = delete;
-  Connection& operator=(const Connection&) = delete;
-  ~Connection() = default;
 
-  /// Hands out the compiled form of `sql`; compiles it when none is kept. Throws std::string
-  /// with `file` and `line`.
-  Statements::node_type CheckOut(const char* sql, const char* file, unsigned line);
-
-  /// Takes a statement back.
-  void CheckIn(Statements::node_type statement) noexcept;
+  /// Hands out the compiled form of `sql`; compiles it when none is kept or it is in use. Throws
+  /// std::string with `file` and `line`.
+  CheckedOut CheckOut(const char* sql, const char* file, unsigned line);
 
   /// Busy time-out of the connection in milliseconds, while no transaction has its own.
   int BusyTimeout() const noexcept { return busyTimeout_; }
@@ -50,12 +49,15 @@ public:
   std::string failedStep;
 
 private:
+  Compiled Compile(const char* sql, const char* file, unsigned line) const;
+
   sqlite3* handle_;
   int busyTimeout_;
-  Statements idle_;
+  std::unordered_map<std::string, Compiled> statements_; ///< by text; null while in use
 };
 
-/// The message of a failure on `handle`: "file:line: SQLite's message (extended code), in sql".
+/// The message of the last failure on `handle`: "file:line: SQLite's message (extended code
+/// N) in sql". A null handle is one that there was no memory for.
 std::string ErrorMessage(sqlite3* handle, const char* sql, const char* file, unsigned line);
 
 } // namespace orva::db

@@ -1,0 +1,91 @@
+#include "orvadb/DB.h"
+
+#include "orvadb/Connection.h"
+
+#include "orvautil/FormatString.h"
+
+#include <sqlite3.h>
+
+#include <sys/stat.h>
+
+#include <cerrno>
+#include <cstdio>
+#include <string_view>
+
+namespace orva::db {
+
+namespace {
+
+/// Milliseconds. A reader of the database must not make a change of it fail.
+constexpr int BUSY_TIMEOUT = 1000;
+
+/// SQLite would wait for the other end of a FIFO, or write into a device.
+void RefuseSpecialFile(const std::string& path) {
+  struct stat status {};
+  if (lstat(path.c_str(), &status) == 0 && !S_ISREG(status.st_mode)) {
+    throw util::FormatString("%s:%d: '%s' is not a regular file", __FILE__, __LINE__,
+                             path.c_str());
+  }
+}
+
+/// `path` as a URI that promises that nobody writes the file.
+std::string ImmutableUri(const std::string& path) {
+  std::string uri = "file:";
+  for (const char byte : path) {
+    if (std::string_view("%?#").find(byte) == std::string_view::npos) {
+      uri.push_back(byte);
+    } else {
+      uri += util::FormatString("%%%02x", static_cast<unsigned char>(byte));
+    }
+  }
+  return uri + "?immutable=1";
+}
+
+} // namespace
+
+DB::DB() = default;
+
+DB::~DB() {
+  Close();
+}
+
+std::string DB::GetPrefix() const {
+  return {};
+}
+
+void DB::UpdateStatus(const std::string& /*key*/, const std::string& /*value*/) const {}
+
+void DB::Open(const std::string& path) {
+  Open(path, Access::ReadWrite, BUSY_TIMEOUT, false);
+}
+
+void DB::Open(const std::string& path, Access access, int busyTimeout, bool immutable) {
+  Close();
+  RefuseSpecialFile(path);
+  const int mode = access == Access::ReadWrite ? SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE
+                                               : SQLITE_OPEN_READONLY;
+  const int flags = mode | SQLITE_OPEN_NOFOLLOW | SQLITE_OPEN_PRIVATECACHE |
+                    SQLITE_OPEN_NOMUTEX | (immutable ? SQLITE_OPEN_URI : 0);
+  const std::string& name = immutable ? ImmutableUri(path) : path;
+  const int code = sqlite3_open_v2(name.c_str(), &handle_, flags, nullptr);
+  path_ = path;
+  if (code != SQLITE_OK) {
+    const std::string message =
+        ErrorMessage(handle_, ("open '" + path_ + "'").c_str(), __FILE__, __LINE__);
+    Close();
+    throw message;
+  }
+  sqlite3_extended_result_codes(handle_, 1);
+  sqlite3_busy_timeout(handle_, busyTimeout);
+  connection_ = std::make_unique<Connection>(handle_, busyTimeout);
+}
+
+void DB::Close() {
+  connection_.reset();
+  // The connection has no statements left, so that this cannot be refused.
+  sqlite3_close_v2(handle_);
+  handle_ = nullptr;
+  path_.clear();
+}
+
+} // namespace orva::db

@@ -1,0 +1,188 @@
+#include "orvautil/MessageProcessor.h"
+
+#include "orvautil/Exception.h"
+#include "orvautil/Stream.h"
+#include "orvautil/Xml.h"
+
+#include <xercesc/dom/DOMDocument.hpp>
+#include <xercesc/dom/DOMElement.hpp>
+#include <xercesc/dom/DOMException.hpp>
+#include <xercesc/framework/MemBufInputSource.hpp>
+#include <xercesc/parsers/XercesDOMParser.hpp>
+#include <xercesc/sax/ErrorHandler.hpp>
+#include <xercesc/sax/SAXParseException.hpp>
+#include <xercesc/util/XMLException.hpp>
+
+#include <syslog.h>
+
+#include <algorithm>
+#include <array>
+
+namespace orva::util {
+
+namespace {
+
+/// A message that is no XML document we take.
+class IllFormedMessage : public Exception {
+  using Exception::Exception;
+};
+
+/// Makes the first error end the parse.
+class StrictErrorHandler : public xercesc::ErrorHandler {
+public:
+  void warning(const xercesc::SAXParseException& /*exception*/) override {}
+  void error(const xercesc::SAXParseException& exception) override { throw exception; }
+  void fatalError(const xercesc::SAXParseException& exception) override { throw exception; }
+  void resetErrors() override {}
+};
+
+/// Parser for documents of strangers: no validation, nothing fetched, and no document type
+/// declaration, without which there are no entities to expand.
+class MessageParser : public xercesc::XercesDOMParser {
+public:
+  MessageParser() {
+    setValidationScheme(Val_Never);
+    setLoadExternalDTD(false);
+    setLoadSchema(false);
+    setDisableDefaultEntityResolution(true);
+    setErrorHandler(&errorHandler_);
+  }
+
+  void doctypeDecl(const xercesc::DTDElementDecl& /*elementDecl*/, const XMLCh* /*publicId*/,
+                   const XMLCh* /*systemId*/, bool /*hasInternalSubset*/,
+                   bool /*hasExternalSubset*/) override {
+    throw IllFormedMessage("document type declaration refused", __FILE__, __LINE__);
+  }
+
+private:
+  StrictErrorHandler errorHandler_;
+};
+
+/// Keeps a parser in its place for as long as the scope lives.
+class ParserScope {
+public:
+  explicit ParserScope(std::unique_ptr<xercesc::XercesDOMParser>& place) : place_(place) {
+    place_ = std::make_unique<MessageParser>();
+  }
+  ParserScope(const ParserScope&) = delete;
+  ParserScope& operator=(const ParserScope&) = delete;
+  ~ParserScope() { place_.reset(); }
+
+private:
+  std::unique_ptr<xercesc::XercesDOMParser>& place_;
+};
+
+/// Gives the document's memory back when the message is done.
+class DocumentScope {
+public:
+  explicit DocumentScope(xercesc::XercesDOMParser& parser) : parser_(parser) {}
+  DocumentScope(const DocumentScope&) = delete;
+  DocumentScope& operator=(const DocumentScope&) = delete;
+  ~DocumentScope() { parser_.resetDocumentPool(); }
+
+private:
+  xercesc::XercesDOMParser& parser_;
+};
+
+} // namespace
+
+MessageProcessor::MessageProcessor() = default;
+
+MessageProcessor::~MessageProcessor() = default;
+
+void MessageProcessor::HandleError(int /*error*/, Stream& /*stream*/,
+                                   const unsigned char* /*data*/, unsigned long /*length*/) const {
+}
+
+void MessageProcessor::ReadMessages(Stream& stream) {
+  const ParserScope parser(parser_);
+  const auto [delimiter, delimiterLength] = GetDelimiter();
+
+  std::array<unsigned char, 16 * 1024> chunk{};
+  buffer.clear();
+  std::size_t searched = 0; // bytes of the buffer that hold no beginning of a delimiter
+  bool skipping = false;    // inside a message that is too long
+  while (const unsigned count = stream.Read(chunk.data(), chunk.size())) {
+    buffer.insert(buffer.end(), chunk.begin(), chunk.begin() + count);
+
+    auto message = buffer.begin();
+    auto search = buffer.begin() + static_cast<std::ptrdiff_t>(searched);
+    for (;;) {
+      const auto end = std::search(search, buffer.end(), delimiter, delimiter + delimiterLength);
+      const auto length = static_cast<unsigned long>(end - message);
+      // The bytes that may still turn out to begin a delimiter are no message yet.
+      const bool ended = end != buffer.end();
+      if (!skipping && length > MAXIMUM_MESSAGE_LENGTH + (ended ? 0 : delimiterLength - 1)) {
+        GiveUp(MESSAGE_TOO_LONG, "message of more than 65536 bytes skipped", stream, nullptr, 0);
+        skipping = true;
+      }
+      if (!ended) {
+        break;
+      }
+      if (!skipping) {
+        ProcessMessage(stream, std::to_address(message), length);
+      }
+      skipping = false;
+      message = search = end + static_cast<std::ptrdiff_t>(delimiterLength);
+    }
+
+    const auto unsearched = std::min<std::ptrdiff_t>(
+        buffer.end() - search, static_cast<std::ptrdiff_t>(delimiterLength) - 1);
+    buffer.erase(buffer.begin(), skipping ? buffer.end() - unsearched : message);
+    searched = buffer.size() - static_cast<std::size_t>(unsearched);
+  }
+}
+
+void MessageProcessor::ProcessMessage(Stream& stream, const unsigned char* data,
+                                      unsigned long length) const {
+  try {
+    if (IsValidMessage(std::string(data, data + length))) {
+      ParseMessage(stream, data, length);
+    }
+  } catch (const IllFormedMessage& exception) {
+    GiveUp(MESSAGE_ILL_FORMED, exception.what(), stream, data, length);
+  } catch (...) {
+    GiveUp(MESSAGE_NOT_HANDLED, DescribeException(std::current_exception()), stream, data, length);
+  }
+}
+
+void MessageProcessor::ParseMessage(Stream& stream, const unsigned char* data,
+                                    unsigned long length) const {
+  const DocumentScope document(*parser_);
+  try {
+    parser_->parse(xercesc::MemBufInputSource(data, length, "message"));
+  } catch (const xercesc::SAXException& exception) {
+    throw IllFormedMessage(XMLCh2string(exception.getMessage()), __FILE__, __LINE__);
+  } catch (const xercesc::XMLException& exception) {
+    throw IllFormedMessage(XMLCh2string(exception.getMessage()), __FILE__, __LINE__);
+  } catch (const xercesc::DOMException& exception) {
+    throw IllFormedMessage(XMLCh2string(exception.getMessage()), __FILE__, __LINE__);
+  }
+  HandleMessage(stream, data, length, *parser_->getDocument()->getDocumentElement());
+}
+
+std::string MessageProcessor::DescribeException(const std::exception_ptr& exception) const {
+  try {
+    std::rethrow_exception(exception);
+  } catch (const std::exception& known) {
+    return known.what();
+  } catch (const std::string& text) {
+    return text;
+  } catch (const char* text) {
+    return text;
+  } catch (const xercesc::XMLException& known) {
+    return XMLCh2string(known.getMessage());
+  } catch (const xercesc::DOMException& known) {
+    return XMLCh2string(known.getMessage());
+  } catch (...) {
+    return "unknown exception";
+  }
+}
+
+void MessageProcessor::GiveUp(Error error, const std::string& reason, Stream& stream,
+                              const unsigned char* data, unsigned long length) const {
+  syslog(LOG_LOCAL1 | LOG_ERR, "MessageProcessor:: %s", reason.c_str());
+  HandleError(error, stream, data, length);
+}
+
+} // namespace orva::util

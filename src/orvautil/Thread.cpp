@@ -1,0 +1,28 @@
+#include "orvautil/Thread.h"
+
+#include "orvautil/Exception.h"
+
+#include <cstddef>
+
+namespace orva::util {
+
+Thread::~Thread() {
+  Thread::Wait();
+}
+
+void Thread::Create(int stackMebibytes, unsigned flags, bool detached) {
+  if (stackMebibytes <= 0 || flags != 0 || detached) {
+    throw Exception("A thread needs a stack, knows no flags and is joinable", __FILE__, __LINE__);
+  }
+  boost::thread::attributes attributes;
+  attributes.set_stack_size(static_cast<std::size_t>(stackMebibytes) << 20U);
+  thread_ = boost::thread(attributes, [this] { Run(); });
+}
+
+void Thread::Wait() {
+  if (thread_.joinable()) {
+    thread_.join();
+  }
+}
+
+} // namespace orva::util

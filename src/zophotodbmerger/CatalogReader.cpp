@@ -1,0 +1,117 @@
+#include "stdafx.h"
+
+#include "CatalogReader.h"
+
+#include "FolderItemCmp.h"
+
+#include "orvadb/File.h"
+#include "orvadb/Folder.h"
+#include "orvadb/Statement.h"
+#include "orvadb/VolumeDB.h"
+
+#include "orvautil/Path.h"
+
+#include <algorithm>
+
+namespace orva::dbmerger {
+
+namespace {
+
+using db::Statement;
+
+constexpr int ROOT_FOLDER_CATEGORY = 4;
+constexpr long long TRANSCODED = 3;
+
+/// The row that stands for the volume itself, which has none in its catalog.
+std::unique_ptr<db::Folder> RootFolder(const std::string& volumeMountPoint) {
+  auto folder = std::make_unique<db::Folder>();
+  folder->path = volumeMountPoint;
+  folder->category = ROOT_FOLDER_CATEGORY;
+  folder->lastUpdatedDate = -1;
+  return folder;
+}
+
+/// Reads the columns that folders and files have in common. Their times are 32-bit integers to
+/// every program of the appliance.
+template <typename Item>
+std::unique_ptr<Item> ReadItem(const Statement& row, const std::string& base) {
+  auto item = std::make_unique<Item>();
+  item->id = row.GetInt64(0);
+  item->folderId = row.GetInt64(1);
+  item->path = util::MakePath(base, row.GetText(2));
+  item->name = row.GetText(3);
+  item->category = row.GetInt(4);
+  item->lastModifiedDate = row.GetInt(5);
+  item->isBackup = row.GetBool(6);
+  item->isHidden = row.GetBool(7);
+  item->isSystem = row.GetBool(8);
+  item->isDeleted = row.GetBool(9);
+  item->status = row.GetInt(10);
+  item->lastUpdatedDate = row.GetInt(11);
+  return item;
+}
+
+} // namespace
+
+util::OwnerVector<db::Folder> ReadFolders(const std::string& volumeMountPoint,
+                                          const db::VolumeDB& catalog) {
+  util::OwnerVector<db::Folder> folders;
+  folders.push_back(RootFolder(volumeMountPoint));
+
+  // The unary plus here and below keeps SQLite from an index on a flag.
+  const std::string base = util::Path(volumeMountPoint).Basic();
+  Statement query(catalog,
+                  "SELECT * FROM Folders where +isSystem = 0 AND +isBackup = 0 AND +isHidden = 0",
+                  __FILE__, __LINE__);
+  while (query.Step(__FILE__, __LINE__) == Statement::ROW) {
+    folders.push_back(ReadItem<db::Folder>(query, base));
+  }
+  std::sort(folders.begin(), folders.end(), FolderItemCmp<db::FolderItem>());
+  return folders;
+}
+
+util::OwnerVector<db::File> ReadChangedFiles(const std::string& volumeMountPoint,
+                                             const db::VolumeDB& catalog, std::time_t since) {
+  util::OwnerVector<db::File> files;
+  const std::string base = util::Path(volumeMountPoint).Basic();
+  Statement query(catalog,
+                  "SELECT f.id,f.folderId,f.path,f.name,f.category,f.lastModifiedDate,f.isBackup,"
+                  "f.isHidden,f.isSystem,f.isDeleted,f.status,t.lastUpdatedDate,f.ext,f.size from "
+                  "Files f, Transcodings t WHERE f.id = t.sourceId AND t.lastUpdatedDate > ? AND "
+                  "t.profile = 'cb62bbdd389b48898f2e5244977cb2c5' AND ((f.isDeleted = 0 and "
+                  "t.status = 1) OR (f.isDeleted = 1 and t.status = 0))",
+                  __FILE__, __LINE__);
+  query.BindTime(1, since, __FILE__, __LINE__);
+  while (query.Step(__FILE__, __LINE__) == Statement::ROW) {
+    auto file = ReadItem<db::File>(query, base);
+    file->ext = query.GetText(12);
+    file->size = query.GetInt64(13);
+    files.push_back(std::move(file));
+  }
+  std::sort(files.begin(), files.end(), FolderItemCmp<db::FolderItem>());
+  return files;
+}
+
+PhotoCounts CountPhotos(const std::string& /*volumeMountPoint*/, const db::VolumeDB& catalog) {
+  PhotoCounts counts;
+  {
+    Statement query(catalog,
+                    "SELECT count(*) FROM Files WHERE category = 3 AND status = ? AND +isSystem = "
+                    "0 AND +isBackup = 0 AND +isHidden = 0 AND +isDeleted = 0",
+                    __FILE__, __LINE__);
+    query.BindInt64(1, TRANSCODED, __FILE__, __LINE__);
+    if (query.Step(__FILE__, __LINE__) == Statement::ROW) {
+      counts.transcoded = query.GetInt(0);
+    }
+  }
+  Statement query(catalog,
+                  "SELECT count(*) FROM Files WHERE category = 3 AND +isSystem = 0 AND +isBackup "
+                  "= 0 AND +isHidden = 0 AND +isDeleted = 0",
+                  __FILE__, __LINE__);
+  if (query.Step(__FILE__, __LINE__) == Statement::ROW) {
+    counts.total = query.GetInt(0);
+  }
+  return counts;
+}
+
+} // namespace orva::dbmerger

@@ -1,0 +1,39 @@
+#pragma once
+
+#include "orvautil/OwnerVector.h"
+
+#include <ctime>
+#include <string>
+
+namespace orva::db {
+class File;
+class Folder;
+class VolumeDB;
+} // namespace orva::db
+
+namespace orva::dbmerger {
+
+/// Photos of a catalog that are there and visible.
+struct PhotoCounts {
+  int transcoded = 0; ///< with a finished rendition
+  int total = 0;
+};
+
+// The three reads of a merge. Each takes the volume's mount point and its open catalog, makes
+// full paths from the catalog's relative ones, and leaves the catalog as it is. A list is sorted
+// by full path (FolderItemCmp). A step that fails ends a list; the transaction that the reads
+// stand in says so when it is committed. Throws std::string.
+
+/// The visible folders, deleted ones included, and a first one for the volume's root, whose path
+/// is the mount point as given.
+util::OwnerVector<db::Folder> ReadFolders(const std::string& volumeMountPoint,
+                                          const db::VolumeDB& catalog);
+
+/// The files that appeared with a finished rendition, or disappeared with a withdrawn one,
+/// strictly after `since`.
+util::OwnerVector<db::File> ReadChangedFiles(const std::string& volumeMountPoint,
+                                             const db::VolumeDB& catalog, std::time_t since);
+
+PhotoCounts CountPhotos(const std::string& volumeMountPoint, const db::VolumeDB& catalog);
+
+} // namespace orva::dbmerger

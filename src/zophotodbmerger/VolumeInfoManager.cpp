@@ -1,0 +1,66 @@
+#include "stdafx.h"
+
+#include "VolumeInfoManager.h"
+
+#include "Constants.h"
+
+#include "orvautil/Path.h"
+
+#include <algorithm>
+
+namespace orva::dbmerger {
+
+namespace {
+
+/// Bytes that a master must have more of to hold the merged database: 200 MiB.
+constexpr double MINIMUM_FREE_SPACE = 209715200.0;
+
+} // namespace
+
+VolumeInfoManager* VolumeInfoManager::instance = nullptr;
+
+VolumeInfoManager& VolumeInfoManager::Instance() {
+  if (instance == nullptr) {
+    instance = std::make_unique<VolumeInfoManager>().release();
+  }
+  return *instance;
+}
+
+void VolumeInfoManager::addVolumeInfo(VolumeInfo& volume) {
+  if (!util::Path(volume.mountPoint).Exists()) {
+    syslog(LOG_LOCAL1 | LOG_ERR, "There is no filesystem location for the mountpoint %s",
+           volume.mountPoint.c_str());
+    return;
+  }
+  if (std::find(volumes.begin(), volumes.end(), volume) == volumes.end()) {
+    volumes.push_back(volume);
+  }
+}
+
+void VolumeInfoManager::removeVolumeInfo(VolumeInfo& volume) {
+  if (volume == masterVolume) {
+    masterVolume = EmptyVolumeInfo;
+  }
+  const auto found = std::find(volumes.begin(), volumes.end(), volume);
+  if (found != volumes.end()) {
+    volumes.erase(found);
+  }
+}
+
+bool VolumeInfoManager::reelectMasterVolume() {
+  if (masterVolume != EmptyVolumeInfo) {
+    return true;
+  }
+  std::sort(volumes.begin(), volumes.end(), VolumeInfoComp<VolumeInfo>());
+  for (const VolumeInfo& volume : volumes) {
+    if (volume.capacity - volume.used > MINIMUM_FREE_SPACE && !volume.readOnly) {
+      masterVolume = volume;
+      return true;
+    }
+    syslog(LOG_LOCAL1 | LOG_ERR, "%s  ---------  is not a candidate \n",
+           volume.mountPoint.c_str());
+  }
+  return false;
+}
+
+} // namespace orva::dbmerger
