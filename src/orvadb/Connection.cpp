@@ -29,8 +29,7 @@ Connection::CheckedOut Connection::CheckOut(const char* sql, const char* file, u
     return {Compile(sql, file, line).release(), CheckIn{}};
   }
   Compiled compiled = Compile(sql, file, line);
-  Compiled* const place =
-      statements_.size() < MAXIMUM_STATEMENTS ? &statements_[sql] : nullptr;
+  Compiled* const place = statements_.size() < MAXIMUM_STATEMENTS ? &statements_[sql] : nullptr;
   return {compiled.release(), CheckIn{place}};
 }
 

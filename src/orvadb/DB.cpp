@@ -23,8 +23,7 @@ constexpr int BUSY_TIMEOUT = 1000;
 void RefuseSpecialFile(const std::string& path) {
   struct stat status {};
   if (lstat(path.c_str(), &status) == 0 && !S_ISREG(status.st_mode)) {
-    throw util::FormatString("%s:%d: '%s' is not a regular file", __FILE__, __LINE__,
-                             path.c_str());
+    throw util::FormatString("%s:%d: '%s' is not a regular file", __FILE__, __LINE__, path.c_str());
   }
 }
 
@@ -64,8 +63,8 @@ void DB::Open(const std::string& path, Access access, int busyTimeout, bool immu
   RefuseSpecialFile(path);
   const int mode = access == Access::ReadWrite ? SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE
                                                : SQLITE_OPEN_READONLY;
-  const int flags = mode | SQLITE_OPEN_NOFOLLOW | SQLITE_OPEN_PRIVATECACHE |
-                    SQLITE_OPEN_NOMUTEX | (immutable ? SQLITE_OPEN_URI : 0);
+  const int flags = mode | SQLITE_OPEN_NOFOLLOW | SQLITE_OPEN_PRIVATECACHE | SQLITE_OPEN_NOMUTEX |
+                    (immutable ? SQLITE_OPEN_URI : 0);
   const std::string& name = immutable ? ImmutableUri(path) : path;
   const int code = sqlite3_open_v2(name.c_str(), &handle_, flags, nullptr);
   path_ = path;
@@ -75,7 +74,6 @@ void DB::Open(const std::string& path, Access access, int busyTimeout, bool immu
     Close();
     throw message;
   }
-  sqlite3_extended_result_codes(handle_, 1);
   sqlite3_busy_timeout(handle_, busyTimeout);
   connection_ = std::make_unique<Connection>(handle_, busyTimeout);
 }

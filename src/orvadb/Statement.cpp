@@ -23,8 +23,8 @@ Connection& OpenConnection(Connection* connection, const char* sql, const char* 
 } // namespace
 
 Statement::Statement(const DB& db, const char* sql, const char* file, unsigned int line)
-    : db_(db), statement_(OpenConnection(db.connection_.get(), sql, file, line)
-                              .CheckOut(sql, file, line)) {}
+    : db_(db),
+      statement_(OpenConnection(db.connection_.get(), sql, file, line).CheckOut(sql, file, line)) {}
 
 int Statement::Step(const char* file, unsigned int line) {
   const int code = sqlite3_step(statement_.get());
@@ -59,8 +59,7 @@ void Statement::BindInt64(int index, long long value, const char* file, unsigned
   CheckBind(sqlite3_bind_int64(statement_.get(), index, value), file, line);
 }
 
-void Statement::BindText(int index, const std::string& value, const char* file,
-                         unsigned int line) {
+void Statement::BindText(int index, const std::string& value, const char* file, unsigned int line) {
   CheckBind(sqlite3_bind_text64(statement_.get(), index, value.data(), value.size(),
                                 SQLITE_TRANSIENT, SQLITE_UTF8),
             file, line);

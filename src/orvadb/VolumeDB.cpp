@@ -48,8 +48,7 @@ bool IsAbsentOrEmpty(const std::string& path) {
 VolumeDB::VolumeDB(const std::string& path, bool writable) : prefix_(path) {
   const std::string volume = util::Path(path).Canonicalize();
   if (volume.empty()) {
-    throw util::FormatString("%s:%d: there is no volume at '%s'", __FILE__, __LINE__,
-                             path.c_str());
+    throw util::FormatString("%s:%d: there is no volume at '%s'", __FILE__, __LINE__, path.c_str());
   }
   const std::string catalog = core::GetCatalogPath(volume);
   const Access access = writable ? Access::ReadWrite : Access::ReadOnly;

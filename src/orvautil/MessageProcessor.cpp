@@ -90,9 +90,8 @@ MessageProcessor::MessageProcessor() = default;
 
 MessageProcessor::~MessageProcessor() = default;
 
-void MessageProcessor::HandleError(int /*error*/, Stream& /*stream*/,
-                                   const unsigned char* /*data*/, unsigned long /*length*/) const {
-}
+void MessageProcessor::HandleError(int /*error*/, Stream& /*stream*/, const unsigned char* /*data*/,
+                                   unsigned long /*length*/) const {}
 
 void MessageProcessor::ReadMessages(Stream& stream) {
   const ParserScope parser(parser_);

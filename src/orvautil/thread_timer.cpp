@@ -21,8 +21,8 @@ thread_times Now() {
   rusage usage{};
   getrusage(RUSAGE_THREAD, &usage);
   return {
-      .wall = boost::chrono::nanoseconds(boost::chrono::steady_clock::now().time_since_epoch())
-                  .count(),
+      .wall =
+          boost::chrono::nanoseconds(boost::chrono::steady_clock::now().time_since_epoch()).count(),
       .user = Nanoseconds(usage.ru_utime),
       .system = Nanoseconds(usage.ru_stime),
   };

@@ -1,0 +1,190 @@
+#include "stdafx.h"
+
+#include "DBMerger.h"
+
+#include "CatalogReader.h"
+#include "PhotoDB.h"
+#include "Statistics.h"
+#include "Util.h"
+#include "VolumeInfoManager.h"
+
+#include "orvadb/File.h"
+#include "orvadb/Folder.h"
+#include "orvadb/Transaction.h"
+#include "orvadb/VolumeDB.h"
+
+#include "orvautil/thread_timer.h"
+
+#include <algorithm>
+
+namespace orva::dbmerger {
+
+namespace {
+
+using util::thread_timer;
+
+/// Milliseconds that a merge waits for other users of the merged database.
+constexpr unsigned MERGE_BUSY_TIMEOUT = 1000;
+/// Milliseconds that the reads of a merge wait for the volume's indexer.
+constexpr unsigned CATALOG_BUSY_TIMEOUT = 5000;
+
+std::string Elapsed(const thread_timer& timer) {
+  return thread_timer::format(timer.Elapsed());
+}
+
+std::vector<std::string> RegisteredMountPoints() {
+  std::vector<std::string> mountPoints;
+  for (const VolumeInfo& volume : VolumeInfoManager::Instance().getVolumes()) {
+    mountPoints.push_back(volume.mountPoint);
+  }
+  return mountPoints;
+}
+
+/// The volume's statistics, a new row of zeros when it has none yet.
+std::unique_ptr<Statistics> ReadStatistics(PhotoDB& photos, const std::string& volume) {
+  auto statistics = photos.GetStatistics(volume);
+  if (!statistics) {
+    photos.InsertStatistics(volume);
+    statistics = photos.GetStatistics(volume);
+  }
+  if (!statistics) {
+    throw "No statistics for " + volume;
+  }
+  return statistics;
+}
+
+void ApplyFolders(const PhotoDB& photos, const std::string& volume,
+                  const util::OwnerVector<db::Folder>& folders,
+                  const std::atomic<bool>& stopRequested) {
+  for (db::Folder* const folder : folders) {
+    if (stopRequested) {
+      return;
+    }
+    if (folder->isDeleted) {
+      photos.DeleteFolder(volume, *folder);
+    } else {
+      photos.AddFolder(volume, *folder);
+    }
+  }
+}
+
+/// Returns the time of the newest file applied, or `since` when none is newer.
+std::time_t ApplyFiles(const PhotoDB& photos, const std::string& volume,
+                       const util::OwnerVector<db::File>& files, std::time_t since,
+                       const std::atomic<bool>& stopRequested) {
+  std::time_t newest = since;
+  for (db::File* const file : files) {
+    if (stopRequested) {
+      break;
+    }
+    writeLine({"Processing file ", file->path, " isdeleted=", file->isDeleted ? "1" : "0",
+               " status = ", std::to_string(file->status)});
+    if (file->isSystem) {
+      continue;
+    }
+    if (file->isDeleted) {
+      writeLine({"Removing file ", file->path, " for mount ", volume});
+      photos.DeleteFile(volume, *file);
+    } else {
+      writeLine({"Adding file ", file->path, " for mount ", volume});
+      photos.AddFile(volume, *file);
+    }
+    newest = std::max(newest, file->lastUpdatedDate);
+  }
+  return newest;
+}
+
+} // namespace
+
+DBMerger::DBMerger() {
+  Create(8, 0, false);
+  registryCopied_.wait();
+}
+
+void DBMerger::Run() {
+  std::vector<std::string> mountPoints;
+  {
+    struct Copied {
+      std::latch& latch;
+      ~Copied() { latch.count_down(); }
+    } const copied{registryCopied_};
+    mountPoints = RegisteredMountPoints();
+  }
+  for (const std::string& mountPoint : mountPoints) {
+    if (stopRequested) {
+      break;
+    }
+    syslog(LOG_LOCAL1 | LOG_INFO, "Iterating over mount point %s\n", mountPoint.c_str());
+  }
+}
+
+void DBMerger::MergeDB(const std::string& masterMountPoint, const std::string& volumeMountPoint) {
+  try {
+    const std::lock_guard<std::mutex> lock(mergeMutex);
+    const db::VolumeDB catalog(volumeMountPoint, false);
+    PhotoDB photos(masterMountPoint);
+    photos.Init();
+    db::Transaction transaction(photos, MERGE_BUSY_TIMEOUT, __FILE__, __LINE__);
+    const auto statistics = ReadStatistics(photos, volumeMountPoint);
+    const std::time_t since = statistics->last_updated_time;
+
+    PhotoCounts counts;
+    std::time_t newest = since;
+    {
+      // One view of the catalog for all three reads, let go before the writing begins, so that
+      // the indexer is not kept waiting.
+      db::Transaction snapshot(catalog, CATALOG_BUSY_TIMEOUT, __FILE__, __LINE__);
+
+      thread_timer timer;
+      const auto folders = ReadFolders(volumeMountPoint, catalog);
+      syslog(LOG_LOCAL1 | LOG_INFO, "Retrieved changed folders list for %s in %s\n",
+             volumeMountPoint.c_str(), Elapsed(timer).c_str());
+
+      timer.Start();
+      const auto files = ReadChangedFiles(volumeMountPoint, catalog, since);
+      syslog(LOG_LOCAL1 | LOG_INFO, "Retrieved %d changed files list for %s in %s\n",
+             static_cast<int>(files.size()), volumeMountPoint.c_str(), Elapsed(timer).c_str());
+
+      timer.Start();
+      counts = CountPhotos(volumeMountPoint, catalog);
+      syslog(LOG_LOCAL1 | LOG_INFO, "Retrieved counts from the orva db for mountPoint %s in %s\n",
+             volumeMountPoint.c_str(), Elapsed(timer).c_str());
+      snapshot.Commit(__FILE__, __LINE__);
+
+      timer.Start();
+      ApplyFolders(photos, volumeMountPoint, folders, stopRequested);
+      syslog(LOG_LOCAL1 | LOG_INFO, "Merged %d folders for %s in %s\n",
+             static_cast<int>(folders.size()), volumeMountPoint.c_str(), Elapsed(timer).c_str());
+
+      timer.Start();
+      newest = ApplyFiles(photos, volumeMountPoint, files, since, stopRequested);
+      syslog(LOG_LOCAL1 | LOG_INFO, "Merged %d files for %s in %s\n",
+             static_cast<int>(files.size()), volumeMountPoint.c_str(), Elapsed(timer).c_str());
+    }
+
+    photos.UpdateStatus();
+    statistics->last_updated_time = newest;
+    statistics->photos_xcoded = counts.transcoded;
+    statistics->photos_total = counts.total;
+    photos.UpdateStatistics(*statistics);
+    transaction.Commit(__FILE__, __LINE__);
+  } catch (const std::string& error) {
+    syslog(LOG_LOCAL1 | LOG_ERR, "Error that we will ignore %s\n", error.c_str());
+  }
+}
+
+void DBMerger::ReMergeDB(const std::string& masterMountPoint, const std::string& volumeMountPoint) {
+  PhotoDB photos(masterMountPoint);
+  photos.Init();
+  photos.DeleteVolume(volumeMountPoint);
+  MergeDB(masterMountPoint, volumeMountPoint);
+}
+
+void DBMerger::RemoveVolume(const std::string& masterMountPoint,
+                            const std::string& volumeMountPoint) {
+  PhotoDB photos(masterMountPoint);
+  photos.Init();
+  photos.DeleteVolume(volumeMountPoint);
+}
+
+} // namespace orva::dbmerger

@@ -1,0 +1,75 @@
+#include "stdafx.h"
+
+#include "MasterVolumeScannedState.h"
+
+#include "PhotoDB.h"
+#include "StateMachine.h"
+#include "Util.h"
+#include "VolumeInfoManager.h"
+
+namespace orva::dbmerger {
+
+MasterVolumeScannedState::JoinedMerger::~JoinedMerger() noexcept(false) {
+  merger.stopRequested = true;
+  merger.Wait();
+}
+
+MasterVolumeScannedState::MasterVolumeScannedState() {
+  const std::string master = VolumeInfoManager::Instance().getMasterVolume().mountPoint;
+  PhotoDB photos(master);
+  photos.Init();
+  updateLocatorFile(master);
+}
+
+void MasterVolumeScannedState::handleVolumePlugged(VolumeInfo /*volume*/) {
+  syslog(LOG_LOCAL1 | LOG_INFO, "MasterVolumeScannedState:: VolumePlugged, ignoring! %s", "");
+}
+
+void MasterVolumeScannedState::handleVolumeUnplugged(VolumeInfo volume) {
+  syslog(LOG_LOCAL1 | LOG_INFO, "MasterVolumeScannedState:: Volumeunplugged %s", "");
+  VolumeInfoManager& registry = VolumeInfoManager::Instance();
+  // When the master itself is gone this is the empty record, and the rows are removed from a
+  // database that no volume holds.
+  owned.merger.RemoveVolume(registry.getMasterVolume().mountPoint, volume.mountPoint);
+  owned.merger.stopRequested = true;
+
+  if (registry.reelectMasterVolume()) {
+    syslog(LOG_LOCAL1 | LOG_INFO, "Moving to the scanned state since we can safely do so %s", "");
+    // The blank at the end tells this line from those of the other states.
+    syslog(LOG_LOCAL1 | LOG_INFO, "We now have a master volume %s ",
+           registry.getMasterVolume().ToString().c_str());
+    StateMachine::Instance().setCurrentState(
+        std::make_unique<MasterVolumeScannedState>().release());
+    return;
+  }
+  syslog(LOG_LOCAL1 | LOG_INFO,
+         "We do NOT have a master volume, so going back to the Default State %s", "");
+  StateMachine::Instance().fallBackToDefaultState();
+}
+
+// A scan by itself brings nothing: the volume is merged when its pictures are transcoded.
+void MasterVolumeScannedState::handleVolumeScanned(VolumeInfo /*volume*/) {}
+
+void MasterVolumeScannedState::handlePictureTranscoded(VolumeInfo volume) {
+  const std::string& master = VolumeInfoManager::Instance().getMasterVolume().mountPoint;
+  syslog(LOG_LOCAL1 | LOG_INFO,
+         "MasterVolumeScannedState:: handlePictureTranscoded, doing merge for mountPoint %s using "
+         "master volume at %s",
+         volume.mountPoint.c_str(), master.c_str());
+  owned.merger.MergeDB(master, volume.mountPoint);
+}
+
+void MasterVolumeScannedState::handleVolumePurged(VolumeInfo volume) {
+  const std::string& master = VolumeInfoManager::Instance().getMasterVolume().mountPoint;
+  syslog(LOG_LOCAL1 | LOG_INFO,
+         "MasterVolumeScannedState:: handleVolumePurged, doing merge for mountPoint %s using "
+         "master volume at %s",
+         volume.mountPoint.c_str(), master.c_str());
+  owned.merger.ReMergeDB(master, volume.mountPoint);
+}
+
+int MasterVolumeScannedState::getStateType() {
+  return MASTER_VOLUME_SCANNED;
+}
+
+} // namespace orva::dbmerger

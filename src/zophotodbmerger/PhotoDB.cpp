@@ -1,0 +1,438 @@
+#include "stdafx.h"
+
+#include "PhotoDB.h"
+
+#include "Constants.h"
+#include "File.h"
+#include "Folder.h"
+#include "Statistics.h"
+#include "Util.h"
+
+#include "orvadb/File.h"
+#include "orvadb/Folder.h"
+#include "orvadb/Statement.h"
+
+#include "orvautil/Exception.h"
+#include "orvautil/FormatString.h"
+#include "orvautil/Path.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+namespace orva::dbmerger {
+
+namespace {
+
+using db::Statement;
+
+constexpr unsigned DIRECTORY_PERMISSIONS = 0775;
+/// The programs that read the database are other users, and SQLite's readers write beside it.
+constexpr mode_t EVERYBODY = 0777;
+
+/// Stored in a new database's status row: a fixed placeholder, not the clock.
+constexpr std::time_t NEW_DATABASE_TIME = 1000;
+
+constexpr long long NO_FOLDER = -1;
+
+/// Whether there is anything at `path`; a link is something, wherever it leads.
+bool IsPresent(const std::string& path) {
+  struct stat status {};
+  return lstat(path.c_str(), &status) == 0;
+}
+
+bool IsDirectory(const std::string& path) {
+  struct stat status {};
+  return lstat(path.c_str(), &status) == 0 && S_ISDIR(status.st_mode);
+}
+
+/// chmod for a directory that was made just now: whatever has replaced it since is not touched.
+bool ChangeDirectoryMode(const std::string& path, mode_t mode) {
+  const int descriptor = open(path.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC);
+  if (descriptor == -1) {
+    return false;
+  }
+  const bool changed = fchmod(descriptor, mode) == 0;
+  close(descriptor);
+  return changed;
+}
+
+/// The path of the folder that holds the folder at `path`, with its trailing separator.
+std::string ParentPath(const std::string& path) {
+  return path.substr(0, path.rfind(NATIVE_PATH_SEPARATOR, path.size() - 2) + 1);
+}
+
+/// The path of the folder that holds the file at `path`, with its trailing separator.
+std::string FolderPath(const std::string& path) {
+  return path.substr(0, path.rfind(NATIVE_PATH_SEPARATOR) + 1);
+}
+
+/// The text between the last two separators of a folder's path.
+std::string FolderName(const std::string& path) {
+  const std::size_t end = path.rfind(NATIVE_PATH_SEPARATOR);
+  if (end == std::string::npos) {
+    return path;
+  }
+  const std::size_t begin = end == 0 ? 0 : path.rfind(NATIVE_PATH_SEPARATOR, end - 1) + 1;
+  return path.substr(begin, end - begin);
+}
+
+// Times are 32-bit integers to every reader of the merged database.
+
+std::unique_ptr<Folder> ReadFolder(const Statement& row) {
+  auto folder = std::make_unique<Folder>();
+  folder->folder_id = row.GetInt64(0);
+  folder->parent_folder_id = row.GetInt64(1);
+  folder->name = row.GetText(2);
+  folder->folder_name = FolderName(folder->name);
+  folder->modified_date = row.GetInt(3);
+  folder->volume = row.GetText(4);
+  return folder;
+}
+
+std::unique_ptr<File> ReadFile(const Statement& row) {
+  auto file = std::make_unique<File>();
+  file->file_id = row.GetInt64(0);
+  file->folder_id = row.GetInt64(1);
+  file->name = row.GetText(2);
+  file->modified_date = row.GetInt(3);
+  file->volume = row.GetText(4);
+  file->created_date = row.GetInt(5);
+  return file;
+}
+
+/// Whether a step's result code is no failure.
+bool IsSuccess(int code) {
+  return code == 0 || code == Statement::ROW || code == Statement::DONE;
+}
+
+/// Appends `record` to a list of the caller, who owns it from then on.
+template <typename Record>
+void HandOver(std::unique_ptr<Record> record, std::vector<Record*>& records) {
+  records.push_back(record.get());
+  static_cast<void>(record.release());
+}
+
+} // namespace
+
+PhotoDB::PhotoDB(const std::string& location)
+    : dbLocation(util::MakePath(util::Path(location).Canonicalize(), ".zophotos")) {
+  if (!IsPresent(dbLocation)) {
+    util::Path(dbLocation).Create(DIRECTORY_PERMISSIONS);
+    if (!ChangeDirectoryMode(dbLocation, EVERYBODY)) {
+      throw util::Exception(
+          util::FormatString("Change permissions failed on dbLocation: '%s'", dbLocation.c_str()),
+          __FILE__, __LINE__);
+    }
+  }
+  if (!IsDirectory(dbLocation)) {
+    throw Error("Invalid DB location : '" + dbLocation + "'");
+  }
+}
+
+std::string PhotoDB::FilePath() const {
+  return util::MakePath(dbLocation, PHOTO_DB_NAME);
+}
+
+void PhotoDB::Init() {
+  const std::string path = FilePath();
+  const bool existed = util::Path(path).Exists();
+  Open(path);
+  if (existed) {
+    LoadStatus();
+  } else {
+    CreateTables();
+    CreateIndices();
+  }
+}
+
+void PhotoDB::LoadStatus() {
+  Statement query(*this, "SELECT * FROM Status", __FILE__, __LINE__);
+  if (query.Fetch(__FILE__, __LINE__)) {
+    status.id = query.GetInt64(0);
+    status.mc_version = query.GetText(1);
+    status.mdate = query.GetInt(2);
+    status.etype = query.GetInt(4);
+    status.desc = query.GetText(3);
+  }
+}
+
+void PhotoDB::CreateTables() {
+  Statement(*this,
+            "CREATE TABLE IF NOT EXISTS Status(id INTEGER PRIMARY KEY AUTOINCREMENT, mc_version "
+            "CHAR(16) NOT NULL, mdate INTEGER NOT NULL, desc CHAR(80), etype INTEGER)",
+            __FILE__, __LINE__)
+      .Execute(__FILE__, __LINE__);
+  Statement(*this,
+            "CREATE TABLE IF NOT EXISTS Statistics(id INTEGER PRIMARY KEY AUTOINCREMENT, volume "
+            "TEXT NOT NULL, photos_xcoded INTEGER NOT NULL, photos_total INTEGER NOT NULL, "
+            "last_updated_time INTEGER NOT NULL)",
+            __FILE__, __LINE__)
+      .Execute(__FILE__, __LINE__);
+
+  status.mc_version = "2.0";
+  status.mdate = NEW_DATABASE_TIME;
+  status.desc.clear();
+  status.etype = 0;
+  Statement insertStatus(*this,
+                         "INSERT INTO Status(mc_version, mdate, desc, etype) VALUES(?, ?, ?, ?)",
+                         __FILE__, __LINE__);
+  insertStatus.BindText(1, status.mc_version, __FILE__, __LINE__);
+  insertStatus.BindTime(2, status.mdate, __FILE__, __LINE__);
+  insertStatus.BindText(3, status.desc, __FILE__, __LINE__);
+  insertStatus.BindInt(4, status.etype, __FILE__, __LINE__);
+  insertStatus.Execute(__FILE__, __LINE__);
+
+  Statement(*this,
+            "CREATE TABLE IF NOT EXISTS Folders(folder_id INTEGER PRIMARY KEY AUTOINCREMENT, "
+            "parent_folder_id INTEGER NOT NULL, name TEXT NOT NULL, modified_date INTEGER NOT "
+            "NULL, volume TEXT NOT NULL)",
+            __FILE__, __LINE__)
+      .Execute(__FILE__, __LINE__);
+
+  // The root folder, below which every volume hangs. It gets id 1 because the table is new;
+  // DeleteVolumes counts on that.
+  Statement insertRoot(
+      *this,
+      "INSERT INTO Folders(parent_folder_id, name, modified_date, volume) VALUES(?, ?, ?, ?)",
+      __FILE__, __LINE__);
+  insertRoot.BindInt(1, -1, __FILE__, __LINE__);
+  insertRoot.BindText(2, "/shares/", __FILE__, __LINE__);
+  insertRoot.BindTime(3, 0, __FILE__, __LINE__);
+  insertRoot.BindText(4, "<DUMMY>", __FILE__, __LINE__);
+  insertRoot.Execute(__FILE__, __LINE__);
+
+  Statement(*this,
+            "CREATE TABLE IF NOT EXISTS Files(file_id INTEGER PRIMARY KEY AUTOINCREMENT, folder_id "
+            "INTEGER NOT NULL, name TEXT NOT NULL, modified_date INTEGER NOT NULL, volume TEXT NOT "
+            "NULL, created_date INTEGER NOT NULL, FOREIGN KEY(folder_id) REFERENCES "
+            "Folders(folder_id) ON DELETE CASCADE)",
+            __FILE__, __LINE__)
+      .Execute(__FILE__, __LINE__);
+}
+
+void PhotoDB::CreateIndices() {
+  for (const char* const sql :
+       {"CREATE INDEX IF NOT EXISTS Folders_folderId ON Folders(parent_folder_id)",
+        "CREATE INDEX IF NOT EXISTS Folders_path ON Folders(name)",
+        "CREATE INDEX IF NOT EXISTS Files_folderId ON Files(folder_id)",
+        "CREATE INDEX IF NOT EXISTS Files_name ON Files(name)"}) {
+    Statement(*this, sql, __FILE__, __LINE__).Execute(__FILE__, __LINE__);
+  }
+}
+
+void PhotoDB::Clear() {
+  const std::string path = FilePath();
+  // Closed first: a file that SQLite has open is not taken away under it.
+  Close();
+  unlink(path.c_str());
+  Open(path);
+}
+
+void PhotoDB::DumpTable(const std::string& /*table*/) const {}
+
+std::unique_ptr<Folder> PhotoDB::GetFolder(long long folderId) const {
+  Statement query(*this, "SELECT * FROM Folders WHERE folder_id = ?", __FILE__, __LINE__);
+  query.BindInt64(1, folderId, __FILE__, __LINE__);
+  return query.Fetch(__FILE__, __LINE__) ? ReadFolder(query) : nullptr;
+}
+
+std::unique_ptr<Folder> PhotoDB::GetFolder(const std::string& name,
+                                           const std::string& volume) const {
+  // The unary plus keeps SQLite from an index on the volume.
+  Statement query(*this, "SELECT * FROM Folders WHERE name = ? AND +volume = ?", __FILE__,
+                  __LINE__);
+  query.BindText(1, name, __FILE__, __LINE__);
+  query.BindText(2, volume, __FILE__, __LINE__);
+  return query.Fetch(__FILE__, __LINE__) ? ReadFolder(query) : nullptr;
+}
+
+long long PhotoDB::FindFolder(const std::string& path) const {
+  Statement query(*this, "select * FROM Folders where name = ?", __FILE__, __LINE__);
+  query.BindText(1, path, __FILE__, __LINE__);
+  return query.Fetch(__FILE__, __LINE__) ? query.GetInt64(0) : NO_FOLDER;
+}
+
+long long PhotoDB::FindFolder(const std::string& path, const std::string& volume) const {
+  Statement query(*this, "select * FROM Folders where name = ? and volume = ?", __FILE__, __LINE__);
+  query.BindText(1, path, __FILE__, __LINE__);
+  query.BindText(2, volume, __FILE__, __LINE__);
+  return query.Fetch(__FILE__, __LINE__) ? query.GetInt64(0) : NO_FOLDER;
+}
+
+void PhotoDB::AddFolder(std::string volume, db::Folder& folder) const {
+  {
+    Statement query(*this, "SELECT * FROM Folders where name = ?", __FILE__, __LINE__);
+    query.BindText(1, folder.path, __FILE__, __LINE__);
+    if (query.Fetch(__FILE__, __LINE__)) {
+      return;
+    }
+  }
+  const long long parentId = FindFolder(ParentPath(folder.path));
+  if (parentId == NO_FOLDER) {
+    return;
+  }
+  Statement insert(
+      *this,
+      "INSERT INTO Folders(parent_folder_id, name, modified_date, volume) VALUES(?, ?, ?, ?)",
+      __FILE__, __LINE__);
+  insert.BindInt64(1, parentId, __FILE__, __LINE__);
+  insert.BindText(2, folder.path, __FILE__, __LINE__);
+  insert.BindTime(3, folder.lastModifiedDate, __FILE__, __LINE__);
+  insert.BindText(4, volume, __FILE__, __LINE__);
+  insert.Execute(__FILE__, __LINE__);
+}
+
+void PhotoDB::DeleteVolumes() const {
+  for (const char* const sql : {"DELETE FROM Folders WHERE folder_id != 1", "DELETE FROM Files ",
+                                "DELETE FROM Statistics", "VACUUM"}) {
+    Statement(*this, sql, __FILE__, __LINE__).Execute(__FILE__, __LINE__);
+  }
+}
+
+void PhotoDB::DeleteVolume(const std::string& volume) const {
+  for (const char* const sql :
+       {"DELETE FROM Folders WHERE volume = ?", "DELETE FROM Files WHERE volume = ?",
+        "UPDATE Statistics SET last_updated_time = 0 WHERE volume = ?"}) {
+    Statement change(*this, sql, __FILE__, __LINE__);
+    change.BindText(1, volume, __FILE__, __LINE__);
+    change.Execute(__FILE__, __LINE__);
+  }
+}
+
+std::unique_ptr<File> PhotoDB::GetFile(long long fileId) const {
+  Statement query(*this, "SELECT * FROM Files WHERE file_id = ?", __FILE__, __LINE__);
+  query.BindInt64(1, fileId, __FILE__, __LINE__);
+  return query.Fetch(__FILE__, __LINE__) ? ReadFile(query) : nullptr;
+}
+
+void PhotoDB::AddFile(const std::string& volume, db::File& file) const {
+  const std::string folderPath = FolderPath(file.path);
+  {
+    Statement query(*this,
+                    "SELECT * FROM Files f, Folders o where f.folder_id = o.folder_id and f.name = "
+                    "? and o.name = ? and f.volume = ?",
+                    __FILE__, __LINE__);
+    query.BindText(1, file.name, __FILE__, __LINE__);
+    query.BindText(2, folderPath, __FILE__, __LINE__);
+    query.BindText(3, volume, __FILE__, __LINE__);
+    if (query.Fetch(__FILE__, __LINE__)) {
+      return;
+    }
+  }
+  const long long folderId = FindFolder(folderPath, volume);
+  if (folderId == NO_FOLDER) {
+    return;
+  }
+  Statement insert(*this,
+                   "INSERT INTO Files(folder_id, name, modified_date, volume, created_date) "
+                   "VALUES(?, ?, ?, ?, ?)",
+                   __FILE__, __LINE__);
+  insert.BindInt64(1, folderId, __FILE__, __LINE__);
+  insert.BindText(2, file.name, __FILE__, __LINE__);
+  insert.BindTime(3, file.lastModifiedDate, __FILE__, __LINE__);
+  insert.BindText(4, volume, __FILE__, __LINE__);
+  // To readers a photo was created when it was last modified.
+  insert.BindTime(5, file.lastModifiedDate, __FILE__, __LINE__);
+  insert.Execute(__FILE__, __LINE__);
+}
+
+void PhotoDB::DeleteFolder(const std::string& volume, db::Folder& folder) const {
+  writeLine({"Deleting ", folder.path});
+  const long long folderId = FindFolder(folder.path, volume);
+  if (folderId != NO_FOLDER) {
+    writeLine({"Found folder ", std::to_string(folderId), " for ", folder.path});
+  }
+  for (const char* const sql :
+       {"DELETE FROM Files WHERE folder_id = ?", "DELETE FROM Folders WHERE folder_id = ?"}) {
+    Statement change(*this, sql, __FILE__, __LINE__);
+    change.BindInt64(1, folderId, __FILE__, __LINE__);
+    change.Execute(__FILE__, __LINE__);
+  }
+}
+
+void PhotoDB::DeleteFile(const std::string& /*volume*/, db::File& file) const {
+  writeLine({"Deleting ", file.path});
+  const long long folderId = FindFolder(FolderPath(file.path));
+  if (folderId != NO_FOLDER) {
+    writeLine({"Found parent folder ", std::to_string(folderId), " for ", file.path});
+  }
+  Statement change(*this, "DELETE FROM Files WHERE name = ? and folder_id = ?", __FILE__, __LINE__);
+  change.BindText(1, file.name, __FILE__, __LINE__);
+  change.BindInt64(2, folderId, __FILE__, __LINE__);
+  change.Execute(__FILE__, __LINE__);
+}
+
+void PhotoDB::GetFolderFiles(long long folderId, std::vector<File*>& files) const {
+  Statement query(*this, "SELECT * FROM Files WHERE folder_id = ? ", __FILE__, __LINE__);
+  query.BindInt64(1, folderId, __FILE__, __LINE__);
+  while (query.Fetch(__FILE__, __LINE__)) {
+    HandOver(ReadFile(query), files);
+  }
+}
+
+void PhotoDB::GetFolderFolders(long long parentId, const std::string& volume,
+                               std::vector<Folder*>& folders) const {
+  Statement query(*this, "SELECT * FROM Folders WHERE parent_folder_id = ?  AND +volume = ?",
+                  __FILE__, __LINE__);
+  query.BindInt64(1, parentId, __FILE__, __LINE__);
+  query.BindText(2, volume, __FILE__, __LINE__);
+  while (query.Fetch(__FILE__, __LINE__)) {
+    HandOver(ReadFolder(query), folders);
+  }
+}
+
+std::unique_ptr<Statistics> PhotoDB::GetStatistics(std::string volume) const {
+  Statement query(*this, "SELECT * FROM Statistics WHERE volume = ?", __FILE__, __LINE__);
+  query.BindText(1, volume, __FILE__, __LINE__);
+  if (query.Step(__FILE__, __LINE__) != Statement::ROW) {
+    return nullptr;
+  }
+  auto statistics = std::make_unique<Statistics>();
+  statistics->volume = query.GetText(1);
+  // Counts are 32-bit integers to readers, although they are stored whole.
+  statistics->photos_xcoded = query.GetInt(2);
+  statistics->photos_total = query.GetInt(3);
+  statistics->last_updated_time = query.GetTime(4);
+  return statistics;
+}
+
+void PhotoDB::InsertStatistics(const std::string& volume) {
+  Statement insert(*this,
+                   "INSERT INTO Statistics(volume, photos_xcoded, photos_total, "
+                   "last_updated_time) values (?, 0, 0, 0)",
+                   __FILE__, __LINE__);
+  insert.BindText(1, volume, __FILE__, __LINE__);
+  if (!IsSuccess(insert.Step(__FILE__, __LINE__))) {
+    syslog(LOG_LOCAL1 | LOG_ERR, "Could not insert stats for %s ", volume.c_str());
+  }
+}
+
+void PhotoDB::UpdateStatistics(const Statistics& stats) {
+  Statement update(*this,
+                   "UPDATE Statistics SET photos_xcoded = ?, photos_total = ?, last_updated_time = "
+                   "? where volume = ?",
+                   __FILE__, __LINE__);
+  update.BindInt64(1, stats.photos_xcoded, __FILE__, __LINE__);
+  update.BindInt64(2, stats.photos_total, __FILE__, __LINE__);
+  update.BindTime(3, stats.last_updated_time, __FILE__, __LINE__);
+  update.BindText(4, stats.volume, __FILE__, __LINE__);
+  const int code = update.Step(__FILE__, __LINE__);
+  if (!IsSuccess(code)) {
+    syslog(LOG_LOCAL1 | LOG_ERR, "Could not update stats for %s. Return code %d",
+           stats.volume.c_str(), code);
+  }
+}
+
+void PhotoDB::UpdateStatus() const {
+  Statement update(*this,
+                   "UPDATE Status SET mc_version = ?, mdate = ?, desc = ?, etype = ? WHERE id = 1",
+                   __FILE__, __LINE__);
+  update.BindText(1, status.mc_version, __FILE__, __LINE__);
+  update.BindTime(2, status.mdate, __FILE__, __LINE__);
+  update.BindText(3, status.desc, __FILE__, __LINE__);
+  update.BindInt(4, status.etype, __FILE__, __LINE__);
+  update.Execute(__FILE__, __LINE__);
+}
+
+} // namespace orva::dbmerger

@@ -112,7 +112,8 @@ public:
 private:
   std::string FilePath() const;
   void LoadStatus();
-  long long FindFolder(const char* sql, const std::string& path) const;
+  long long FindFolder(const std::string& path) const;
+  long long FindFolder(const std::string& path, const std::string& volume) const;
 
   std::string dbLocation; ///< the directory of the database file
 

@@ -1,0 +1,97 @@
+#include "stdafx.h"
+
+#include "StateMachine.h"
+
+#include "Constants.h"
+#include "DefaultState.h"
+#include "MasterVolumeScannedState.h"
+#include "PhotoDB.h"
+#include "Util.h"
+#include "VolumeInfoManager.h"
+
+#include "orvautil/OwnerVector.h"
+
+#include <sstream>
+
+namespace orva::dbmerger {
+
+namespace {
+
+/// Makes the shares root the place of the merged database for as long as there is no master.
+void PrepareSharesRoot() {
+  PhotoDB photos(SHARES_ROOT);
+  photos.Init();
+  photos.DeleteVolumes();
+  photos.status.mdate = std::time(nullptr);
+  photos.UpdateStatus();
+
+  updateLocatorFile(SHARES_ROOT + NATIVE_PATH_SEPARATOR);
+
+  VolumeInfo root{.mountPoint = SHARES_ROOT,
+                  .capacity = 104857600000.0,
+                  .used = 100.0,
+                  .photoDbSize = 1,
+                  .timestamp = 1,
+                  .readOnly = false};
+  VolumeInfoManager::Instance().addVolumeInfo(root);
+}
+
+/// One line about a state of the given type; `texts` is by type, and an unknown type has none.
+/// The address tells the objects of a type apart.
+void WriteStateLine(const std::vector<const char*>& texts, State& state) {
+  const auto type = static_cast<std::size_t>(state.getStateType());
+  if (type < texts.size()) {
+    std::ostringstream address;
+    address << static_cast<const void*>(&state);
+    writeLine({texts[type], address.str()});
+  }
+}
+
+} // namespace
+
+StateMachine* StateMachine::instance = nullptr;
+
+StateMachine& StateMachine::Instance() {
+  if (instance == nullptr) {
+    instance = std::make_unique<StateMachine>().release();
+  }
+  return *instance;
+}
+
+StateMachine::StateMachine() : currentState(std::make_unique<DefaultState>()) {
+  PrepareSharesRoot();
+}
+
+StateMachine::~StateMachine() = default;
+
+void StateMachine::setCurrentState(State* newState) {
+  std::unique_ptr<State> next(newState);
+  if (previousState) {
+    WriteStateLine({"Deleting the default state ", "Deleting the plugged state ",
+                    "Deleting the scanned state "},
+                   *previousState);
+    // The vector lets an exception of the destructor pass, which std::unique_ptr would not.
+    util::OwnerVector<State> finished;
+    finished.push_back(std::move(previousState));
+  }
+  previousState = std::move(currentState);
+  WriteStateLine({"Setting the current to default state", "Setting the current to plugged state",
+                  "Setting the current to scanned state"},
+                 *next);
+  currentState = std::move(next);
+}
+
+void StateMachine::moveToScannedState() {
+  syslog(LOG_LOCAL1 | LOG_INFO, "Moving to the scanned state since we can safely do so %s", "");
+  syslog(LOG_LOCAL1 | LOG_INFO, "We now have a master volume %s",
+         VolumeInfoManager::Instance().getMasterVolume().ToString().c_str());
+  setCurrentState(std::make_unique<MasterVolumeScannedState>().release());
+}
+
+void StateMachine::fallBackToDefaultState() {
+  auto next = std::make_unique<DefaultState>();
+  PrepareSharesRoot();
+  setCurrentState(next.release());
+}
+
+} // namespace orva::dbmerger

@@ -17,9 +17,4 @@ void writeLine(std::initializer_list<std::string_view> pieces);
 /// file's place is left alone, and a file that cannot be written is passed over silently.
 void updateLocatorFile(const std::string& mountPoint);
 
-/// Makes the shares root the place of the merged database, as long as there is no master: empties
-/// the database there, points the locator file at it and registers the root as a volume that can
-/// be elected. Throws what PhotoDB throws.
-void fallBackToSharesRoot();
-
 } // namespace orva::dbmerger

@@ -57,8 +57,7 @@ bool VolumeInfoManager::reelectMasterVolume() {
       masterVolume = volume;
       return true;
     }
-    syslog(LOG_LOCAL1 | LOG_ERR, "%s  ---------  is not a candidate \n",
-           volume.mountPoint.c_str());
+    syslog(LOG_LOCAL1 | LOG_ERR, "%s  ---------  is not a candidate \n", volume.mountPoint.c_str());
   }
   return false;
 }

@@ -1,0 +1,72 @@
+#include "stdafx.h"
+
+#include "Constants.h"
+#include "NotificationListener.h"
+#include "StateMachine.h"
+
+#include "orvautil/Core.h"
+#include "orvautil/LoggerMgr.h"
+#include "orvautil/Path.h"
+#include "orvautil/Singleton.h"
+
+#include <xercesc/util/PlatformUtils.hpp>
+
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <csignal>
+#include <cstdlib>
+#include <exception>
+
+namespace {
+
+using namespace orva;
+
+/// Where a log file of the daemon's own would be. Nothing writes one.
+const std::string ORVA_LOG_FILE = util::MakePath(
+    core::GetORVA_HOME({'.', util::Path::GetNativePathSeparator()}), "zodbmerger.log");
+
+/// Deleted at the end of the process, when its thread has ended.
+std::unique_ptr<dbmerger::NotificationListener> notificationListener;
+
+/// Output that nobody reads must not end the daemon, and a socket or a database file must not be
+/// taken for a standard descriptor that was closed when the daemon started.
+void SecureStandardDescriptors() {
+  std::signal(SIGPIPE, SIG_IGN);
+  int descriptor = 0;
+  do {
+    descriptor = open("/dev/null", O_RDWR);
+  } while (descriptor >= STDIN_FILENO && descriptor <= STDERR_FILENO);
+  close(descriptor);
+}
+
+void ListenUntilTheServiceEnds() {
+  dbmerger::StateMachine::Instance();
+  auto listener = std::make_unique<dbmerger::NotificationListener>();
+  listener->Create(8, 0, false);
+  notificationListener = std::move(listener);
+  notificationListener->Wait();
+  syslog(LOG_LOCAL1 | LOG_INFO, "Returning from the %s", "wait");
+}
+
+} // namespace
+
+int main() {
+  SecureStandardDescriptors();
+  xercesc::XMLPlatformUtils::Initialize();
+  try {
+    ListenUntilTheServiceEnds();
+  } catch (const std::exception& exception) {
+    const auto* const log = util::Singleton<util::LoggerMgr>::Instance();
+    if (log->Level() != 0) {
+      log->Log(1, "src/zophotodbmerger/main", 110, "%s.", exception.what());
+    }
+    std::exit(EXIT_FAILURE);
+  } catch (...) {
+    // Nothing else can be told of: the process ends abnormally, but not with the platform up.
+    xercesc::XMLPlatformUtils::Terminate();
+    throw;
+  }
+  xercesc::XMLPlatformUtils::Terminate();
+  return EXIT_SUCCESS;
+}

@@ -26,9 +26,9 @@ class MessageProcessor {
 public:
   /// Why a message was given up.
   enum Error : int {
-    MESSAGE_TOO_LONG = 1,  ///< more than MAXIMUM_MESSAGE_LENGTH bytes without a delimiter
-    MESSAGE_ILL_FORMED,    ///< not well-formed XML, or with a document type declaration
-    MESSAGE_NOT_HANDLED    ///< HandleMessage threw
+    MESSAGE_TOO_LONG = 1, ///< more than MAXIMUM_MESSAGE_LENGTH bytes without a delimiter
+    MESSAGE_ILL_FORMED,   ///< not well-formed XML, or with a document type declaration
+    MESSAGE_NOT_HANDLED   ///< HandleMessage threw
   };
 
   /// Bytes of the longest message that is looked at, its delimiter not counted.

@@ -1,0 +1,18 @@
+#pragma once
+
+#include "State.h"
+
+namespace orva::dbmerger {
+
+/// There is no master volume; the events that can bring one are watched.
+class DefaultState : public State {
+public:
+  void handleVolumePlugged(VolumeInfo volume) override;
+  void handleVolumeUnplugged(VolumeInfo volume) override;
+  void handleVolumeScanned(VolumeInfo volume) override;
+  void handlePictureTranscoded(VolumeInfo volume) override;
+  void handleVolumePurged(VolumeInfo volume) override;
+  int getStateType() override;
+};
+
+} // namespace orva::dbmerger

@@ -1,0 +1,19 @@
+#pragma once
+
+#include "State.h"
+
+namespace orva::dbmerger {
+
+/// A master volume has been elected, but no merged database was opened on it yet: its scan, or a
+/// batch of pictures, is awaited.
+class MasterVolumePluggedState : public State {
+public:
+  void handleVolumePlugged(VolumeInfo volume) override;
+  void handleVolumeUnplugged(VolumeInfo volume) override;
+  void handleVolumeScanned(VolumeInfo volume) override;
+  void handlePictureTranscoded(VolumeInfo volume) override;
+  void handleVolumePurged(VolumeInfo volume) override;
+  int getStateType() override;
+};
+
+} // namespace orva::dbmerger

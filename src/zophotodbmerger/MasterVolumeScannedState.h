@@ -1,0 +1,36 @@
+#pragma once
+
+#include "DBMerger.h"
+#include "State.h"
+
+namespace orva::dbmerger {
+
+/// The working state: there is a master volume with a merged database, which the locator file
+/// names, and events become merges into it.
+class MasterVolumeScannedState : public State {
+public:
+  /// Creates or opens the merged database on the master and points the locator file at it.
+  /// Throws what PhotoDB throws.
+  MasterVolumeScannedState();
+
+  void handleVolumePlugged(VolumeInfo volume) override;
+  void handleVolumeUnplugged(VolumeInfo volume) override;
+  void handleVolumeScanned(VolumeInfo volume) override;
+  void handlePictureTranscoded(VolumeInfo volume) override;
+  void handleVolumePurged(VolumeInfo volume) override;
+  int getStateType() override;
+
+private:
+  /// A merger that is stopped and joined with its owner, also with one whose constructor throws.
+  struct JoinedMerger {
+    DBMerger merger;
+    JoinedMerger() = default;
+    JoinedMerger(const JoinedMerger&) = delete;
+    JoinedMerger& operator=(const JoinedMerger&) = delete;
+    ~JoinedMerger() noexcept(false);
+  };
+
+  JoinedMerger owned;
+};
+
+} // namespace orva::dbmerger
