@@ -1,0 +1,119 @@
+#include "Appliance.h"
+
+#include "Database.h"
+#include "orvautil/Core.h"
+
+#include <algorithm>
+#include <filesystem>
+#include <fstream>
+#include <iterator>
+#include <regex>
+#include <stdexcept>
+
+namespace orva::test {
+
+namespace {
+
+const std::string REFUSAL = "ERROR ! Node name = ";
+const std::string BARRIER = "barrier";
+
+std::string MaskTimes(const std::string& text) {
+  static const std::regex TIME(
+      R"(\d+\.\d{3} W   \d+\.\d{3} U   \d+\.\d{3} S   \d+\.\d%)");
+  return std::regex_replace(text, TIME, "TIME");
+}
+
+std::string MaskAddresses(const std::string& text) {
+  static const std::regex ADDRESS("0x[0-9a-f]+");
+  return std::regex_replace(text, ADDRESS, "ADDRESS");
+}
+
+std::string DatabasePath(const std::string& location) {
+  return location + "/.zophotos/zophotos.db";
+}
+
+} // namespace
+
+void Appliance::Start(const std::vector<std::string>& environment) {
+  daemon_ = std::make_unique<DaemonProcess>("/tmp/daemon", environment);
+  Barrier();
+}
+
+DaemonProcess::End Appliance::Run(const std::vector<std::string>& environment) {
+  daemon_ = std::make_unique<DaemonProcess>("/tmp/daemon", environment);
+  return daemon_->AwaitEnd();
+}
+
+DaemonProcess::End Appliance::Shutdown() {
+  service_.Stop();
+  return daemon_->AwaitEnd();
+}
+
+std::vector<LogLine> Appliance::Handle(const std::string& message) {
+  service_.Send(message);
+  Barrier();
+  return TakeLog();
+}
+
+void Appliance::Barrier() {
+  const std::string name = BARRIER + std::to_string(++barriers_);
+  service_.Send("<" + name + " about=\"ORVANotification\"/>");
+  if (!log_.Await(Error(REFUSAL + name))) {
+    throw std::runtime_error("the daemon has not come to " + name);
+  }
+}
+
+std::vector<LogLine> Appliance::TakeLog() {
+  const std::vector<LogLine> all = log_.Lines();
+  std::vector<LogLine> taken;
+  for (; logTaken_ < all.size(); ++logTaken_) {
+    const LogLine& line = all[logTaken_];
+    if (!line.text.starts_with(REFUSAL + BARRIER) &&
+        !line.text.starts_with("Iterating over mount point ")) {
+      taken.push_back({line.priority, MaskTimes(line.text)});
+    }
+  }
+  return taken;
+}
+
+std::vector<std::string> Appliance::TakeOutput() {
+  const std::vector<std::string> all = daemon_->StandardOutput();
+  std::vector<std::string> taken;
+  for (; outputTaken_ < all.size(); ++outputTaken_) {
+    taken.push_back(MaskAddresses(all[outputTaken_]));
+  }
+  return taken;
+}
+
+std::string Appliance::Locator() {
+  std::ifstream file("/tmp/zophotodbmerger.conf", std::ios::binary);
+  if (!file) {
+    return "(absent)";
+  }
+  return {std::istreambuf_iterator<char>(file), {}};
+}
+
+MergedDatabase::MergedDatabase(const std::string& location) : database_(DatabasePath(location)) {}
+
+std::vector<std::string> MergedDatabase::Folders() const {
+  return database_.Run("SELECT f.name, coalesce(p.name, f.parent_folder_id), f.modified_date, "
+                       "f.volume FROM Folders f LEFT JOIN Folders p "
+                       "ON p.folder_id = f.parent_folder_id ORDER BY f.name");
+}
+
+std::vector<std::string> MergedDatabase::Files() const {
+  return database_.Run("SELECT coalesce(o.name, 'no folder: ') || f.name, f.modified_date, "
+                       "f.created_date, f.volume FROM Files f LEFT JOIN Folders o "
+                       "ON o.folder_id = f.folder_id ORDER BY 1");
+}
+
+std::vector<std::string> MergedDatabase::Statistics() const {
+  return database_.Run("SELECT volume, photos_xcoded, photos_total, last_updated_time "
+                       "FROM Statistics ORDER BY volume");
+}
+
+bool HasMergedDatabase(const std::string& location) {
+  return std::filesystem::exists(DatabasePath(location));
+}
+
+} // namespace orva::test

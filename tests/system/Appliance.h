@@ -1,0 +1,93 @@
+#pragma once
+
+#include "Database.h"
+#include "DaemonProcess.h"
+#include "NotificationService.h"
+#include "Syslog.h"
+#include "Volume.h"
+
+#include <memory>
+#include <string>
+#include <vector>
+
+namespace orva::test {
+
+/// The appliance around the daemon: its system log, its notification service and the files that
+/// the daemon leaves, in the private root that the test runs in. A test makes volumes, starts
+/// the daemon, lets it handle messages and looks at what came of them.
+class Appliance {
+public:
+  /// Brings up the log and the notification service. The daemon does not run yet.
+  Appliance() = default;
+
+  /// Starts the daemon and waits until it reads notifications. `environment` as DaemonProcess.
+  void Start(const std::vector<std::string>& environment = {});
+
+  /// Starts the daemon where it is not expected to come so far, and waits for its end.
+  DaemonProcess::End Run(const std::vector<std::string>& environment = {});
+
+  /// Ends the notification service and waits for the daemon, which then ends by itself.
+  DaemonProcess::End Shutdown();
+
+  /// True while a daemon runs.
+  bool IsRunning() const { return daemon_ != nullptr && daemon_->IsRunning(); }
+
+  /// Sends a message and waits until the daemon has handled it. Returns what the daemon logged
+  /// for it, as TakeLog does.
+  std::vector<LogLine> Handle(const std::string& message);
+
+  /// Waits until the daemon has handled everything that was sent: queues a message with another
+  /// root element behind it and waits for the line that refuses it.
+  void Barrier();
+
+  /// What was logged since the last call, without the refusals of Barrier and without the
+  /// merger thread's "Iterating over mount point" lines, which come at any time. Elapsed times
+  /// read TIME.
+  std::vector<LogLine> TakeLog();
+
+  /// What the daemon wrote to standard output since the last call. The addresses of objects
+  /// read ADDRESS.
+  std::vector<std::string> TakeOutput();
+
+  /// Content of the locator file, to the last byte; "(absent)" when there is none.
+  static std::string Locator();
+
+  Syslog& Log() { return log_; }
+  NotificationService& Service() { return service_; }
+  DaemonProcess& Daemon() { return *daemon_; }
+
+private:
+  Syslog log_;
+  NotificationService service_;
+  std::unique_ptr<DaemonProcess> daemon_;
+  std::size_t logTaken_ = 0;
+  std::size_t outputTaken_ = 0;
+  int barriers_ = 0;
+};
+
+/// The merged database at a location ("/shares" or a volume's path), read as rows without ids.
+class MergedDatabase {
+public:
+  /// Throws std::runtime_error when there is no database.
+  explicit MergedDatabase(const std::string& location);
+
+  /// "name|parent's name|modified_date|volume", by name. The root's parent is "-1".
+  std::vector<std::string> Folders() const;
+  /// "folder's name and file's name|modified_date|created_date|volume", by name.
+  std::vector<std::string> Files() const;
+  /// "volume|photos_xcoded|photos_total|last_updated_time", by volume.
+  std::vector<std::string> Statistics() const;
+
+  const Database& Rows() const { return database_; }
+
+private:
+  Database database_;
+};
+
+/// The row of the root folder, which every merged database has.
+inline const std::string ROOT_FOLDER = "/shares/|-1|0|<DUMMY>";
+
+/// True when there is a merged database file at a location.
+bool HasMergedDatabase(const std::string& location);
+
+} // namespace orva::test

@@ -1,0 +1,76 @@
+#include "Catalog.h"
+
+#include "orvautil/Core.h"
+
+#include <sys/stat.h>
+
+namespace orva::test {
+
+namespace {
+
+std::string Place(const Volume& volume) {
+  mkdir(core::GetORVA_HOME(volume.Path()).c_str(), 0755);
+  return core::GetCatalogPath(volume.Path());
+}
+
+/// "Pictures/" of "Pictures/a.jpg", "" of "Pictures/".
+std::string FolderOf(const std::string& path) {
+  const std::size_t separator = path.rfind('/', path.size() - 2);
+  return separator == std::string::npos ? "" : path.substr(0, separator + 1);
+}
+
+std::string NameOf(const std::string& path) {
+  const std::string name = path.substr(FolderOf(path).size());
+  return name.back() == '/' ? name.substr(0, name.size() - 1) : name;
+}
+
+std::string Text(bool flag) { return flag ? "1" : "0"; }
+
+} // namespace
+
+Catalog::Catalog(const Volume& volume) : database_(Place(volume), true) {
+  database_.Run("CREATE TABLE Folders(id INTEGER PRIMARY KEY, folderId INTEGER, path TEXT, "
+                "name TEXT, category INTEGER, lastModifiedDate INTEGER, isBackup INTEGER, "
+                "isHidden INTEGER, isSystem INTEGER, isDeleted INTEGER, status INTEGER, "
+                "lastUpdatedDate INTEGER)");
+  database_.Run("CREATE TABLE Files(id INTEGER PRIMARY KEY, folderId INTEGER, path TEXT, "
+                "name TEXT, category INTEGER, lastModifiedDate INTEGER, isBackup INTEGER, "
+                "isHidden INTEGER, isSystem INTEGER, isDeleted INTEGER, status INTEGER, "
+                "lastUpdatedDate INTEGER, ext TEXT, size INTEGER)");
+  database_.Run("CREATE TABLE Transcodings(id INTEGER PRIMARY KEY, sourceId INTEGER, "
+                "profile TEXT, status INTEGER, lastUpdatedDate INTEGER)");
+}
+
+void Catalog::AddFolder(const std::string& path, long modified, Flags flags) {
+  database_.Run("INSERT INTO Folders(folderId, path, name, category, lastModifiedDate, isBackup, "
+                "isHidden, isSystem, isDeleted, status, lastUpdatedDate) "
+                "VALUES(coalesce((SELECT id FROM Folders WHERE path = ?), -1), ?, ?, 4, ?, ?, ?, "
+                "?, 0, 0, 0)",
+                {FolderOf(path), path, NameOf(path), std::to_string(modified), Text(flags.backup),
+                 Text(flags.hidden), Text(flags.system)});
+}
+
+void Catalog::AddPhoto(const std::string& path, long modified, long stamp, Flags flags) {
+  database_.Run("INSERT INTO Files(folderId, path, name, category, lastModifiedDate, isBackup, "
+                "isHidden, isSystem, isDeleted, status, lastUpdatedDate, ext, size) "
+                "VALUES(coalesce((SELECT id FROM Folders WHERE path = ?), -1), ?, ?, 3, ?, ?, ?, "
+                "?, 0, 3, 0, 'jpg', 10)",
+                {FolderOf(path), path, NameOf(path), std::to_string(modified), Text(flags.backup),
+                 Text(flags.hidden), Text(flags.system)});
+  database_.Run("INSERT INTO Transcodings(sourceId, profile, status, lastUpdatedDate) "
+                "SELECT id, 'cb62bbdd389b48898f2e5244977cb2c5', 1, ? FROM Files WHERE path = ?",
+                {std::to_string(stamp), path});
+}
+
+void Catalog::DeletePhoto(const std::string& path, long stamp) {
+  database_.Run("UPDATE Files SET isDeleted = 1 WHERE path = ?", {path});
+  database_.Run("UPDATE Transcodings SET status = 0, lastUpdatedDate = ? "
+                "WHERE sourceId = (SELECT id FROM Files WHERE path = ?)",
+                {std::to_string(stamp), path});
+}
+
+void Catalog::DeleteFolder(const std::string& path) {
+  database_.Run("UPDATE Folders SET isDeleted = 1 WHERE path = ?", {path});
+}
+
+} // namespace orva::test

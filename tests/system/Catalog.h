@@ -1,0 +1,40 @@
+#pragma once
+
+#include "Database.h"
+#include "Volume.h"
+
+#include <string>
+
+namespace orva::test {
+
+/// The media catalog of a volume, row by row as a test wants it. Paths are relative to the
+/// volume; a folder's ends in a separator. Folders come before what they hold.
+class Catalog {
+public:
+  /// Makes an empty catalog on the volume.
+  explicit Catalog(const Volume& volume);
+
+  struct Flags {
+    bool backup = false;
+    bool hidden = false;
+    bool system = false;
+  };
+
+  void AddFolder(const std::string& path, long modified, Flags flags = {});
+
+  /// A photo whose transcoding was finished at `stamp`.
+  void AddPhoto(const std::string& path, long modified, long stamp, Flags flags = {});
+
+  /// Marks a file as deleted and its transcoding as withdrawn at `stamp`.
+  void DeletePhoto(const std::string& path, long stamp);
+
+  void DeleteFolder(const std::string& path);
+
+  /// For what the above do not say.
+  const Database& Rows() const { return database_; }
+
+private:
+  Database database_;
+};
+
+} // namespace orva::test

@@ -1,0 +1,79 @@
+#include "NotificationService.h"
+
+#include "Deadline.h"
+
+#include "orvautil/Core.h"
+#include "orvautil/Socket.h"
+
+#include <poll.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <stdexcept>
+#include <system_error>
+
+namespace orva::test {
+
+NotificationService::NotificationService()
+    : listener_(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0)) {
+  const util::Socket::Address address(core::ORVA_NOTIFICATION_SOCKET);
+  if (listener_ == -1 || bind(listener_, address.Get(), address.Length()) != 0 ||
+      listen(listener_, SOMAXCONN) != 0) {
+    throw std::system_error(errno, std::generic_category(), core::ORVA_NOTIFICATION_SOCKET);
+  }
+}
+
+NotificationService::~NotificationService() { Stop(); }
+
+void NotificationService::AwaitClient() {
+  if (client_ != -1) {
+    return;
+  }
+  pollfd waiting{listener_, POLLIN, 0};
+  const auto deadline = std::chrono::milliseconds(DEADLINE).count();
+  if (poll(&waiting, 1, static_cast<int>(deadline)) != 1) {
+    throw std::runtime_error("no client has connected to the notification service");
+  }
+  client_ = accept4(listener_, nullptr, nullptr, SOCK_CLOEXEC);
+  if (client_ == -1) {
+    throw std::system_error(errno, std::generic_category(), "accept4");
+  }
+}
+
+void NotificationService::SendBytes(const std::string& bytes) {
+  AwaitClient();
+  std::size_t sent = 0;
+  while (sent < bytes.size()) {
+    const ssize_t count = send(client_, bytes.data() + sent, bytes.size() - sent, MSG_NOSIGNAL);
+    if (count == -1) {
+      throw std::system_error(errno, std::generic_category(), "send");
+    }
+    sent += static_cast<std::size_t>(count);
+  }
+}
+
+void NotificationService::Send(const std::string& message) {
+  SendBytes(message + std::string(4, '\0'));
+}
+
+void NotificationService::CloseClient() {
+  AwaitClient();
+  close(client_);
+  client_ = -1;
+}
+
+void NotificationService::Stop() {
+  // The listener first: a client that sees its connection closed must not reach it again.
+  if (listener_ != -1) {
+    close(listener_);
+    unlink(core::ORVA_NOTIFICATION_SOCKET.c_str());
+    listener_ = -1;
+  }
+  if (client_ != -1) {
+    close(client_);
+    client_ = -1;
+  }
+}
+
+} // namespace orva::test

@@ -1,0 +1,38 @@
+#pragma once
+
+#include <string>
+
+namespace orva::test {
+
+/// The appliance's notification service as a test plays it: listens on the notification socket
+/// and talks to one client at a time. The operations that talk take the next waiting client
+/// when there is none. Failures are thrown as std::runtime_error or std::system_error.
+class NotificationService {
+public:
+  /// Starts to listen.
+  NotificationService();
+  NotificationService(const NotificationService&) = delete;
+  NotificationService& operator=(const NotificationService&) = delete;
+  ~NotificationService();
+
+  /// Waits for a client to be there.
+  void AwaitClient();
+
+  /// Sends the bytes as they are.
+  void SendBytes(const std::string& bytes);
+
+  /// Sends one message, followed by the delimiter.
+  void Send(const std::string& message);
+
+  /// Waits for a client and closes its connection; goes on listening.
+  void CloseClient();
+
+  /// Ends the service: no further client can connect, the connection is closed.
+  void Stop();
+
+private:
+  int listener_; ///< owned; -1 when stopped
+  int client_ = -1; ///< owned; -1 while there is none
+};
+
+} // namespace orva::test

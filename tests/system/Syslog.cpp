@@ -1,0 +1,92 @@
+#include "Syslog.h"
+
+#include "Deadline.h"
+
+#include <sys/socket.h>
+#include <sys/un.h>
+#include <syslog.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <array>
+#include <cstring>
+#include <regex>
+#include <system_error>
+
+namespace orva::test {
+
+namespace {
+
+/// "<142>Nov 21 02:33:26 ident: text"
+LogLine Parse(const std::string& datagram) {
+  static const std::regex FORM(R"(<(\d+)>\w{3} [ \d]\d \d\d:\d\d:\d\d [^ :]+: ([^]*))");
+  std::smatch parts;
+  if (!std::regex_match(datagram, parts, FORM)) {
+    return {-1, datagram};
+  }
+  return {std::stoi(parts[1]), parts[2]};
+}
+
+} // namespace
+
+std::ostream& operator<<(std::ostream& stream, const LogLine& line) {
+  return stream << line.priority << " \"" << line.text << '"';
+}
+
+LogLine Info(const std::string& text) { return {LOG_LOCAL1 | LOG_INFO, text}; }
+LogLine Error(const std::string& text) { return {LOG_LOCAL1 | LOG_ERR, text}; }
+LogLine Plain(const std::string& text) { return {LOG_USER | LOG_INFO, text}; }
+
+Syslog::Syslog() : socket_(socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0)) {
+  sockaddr_un address{};
+  address.sun_family = AF_UNIX;
+  std::strcpy(address.sun_path, "/dev/log");
+  if (socket_ == -1 ||
+      bind(socket_, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
+    throw std::system_error(errno, std::generic_category(), "/dev/log");
+  }
+  collector_ = std::jthread([this] { Collect(); });
+}
+
+Syslog::~Syslog() {
+  shutdown(socket_, SHUT_RDWR); // ends the collector's recv
+  collector_.join();
+  close(socket_);
+  unlink("/dev/log");
+}
+
+std::vector<LogLine> Syslog::Lines() const {
+  const std::lock_guard lock(mutex_);
+  return lines_;
+}
+
+bool Syslog::Await(const Condition& condition) const {
+  std::unique_lock lock(mutex_);
+  return arrived_.wait_for(lock, DEADLINE, [&] { return condition(lines_); });
+}
+
+bool Syslog::Await(const LogLine& line) const {
+  return Await([&line](const std::vector<LogLine>& lines) {
+    return std::find(lines.begin(), lines.end(), line) != lines.end();
+  });
+}
+
+void Syslog::Collect() {
+  std::array<char, 65536> datagram;
+  for (;;) {
+    const ssize_t size = recv(socket_, datagram.data(), datagram.size(), 0);
+    if (size == -1 && errno == EINTR) {
+      continue;
+    }
+    if (size <= 0) {
+      return;
+    }
+    {
+      const std::lock_guard lock(mutex_);
+      lines_.push_back(Parse(std::string(datagram.data(), static_cast<std::size_t>(size))));
+    }
+    arrived_.notify_all();
+  }
+}
+
+} // namespace orva::test
