@@ -69,10 +69,10 @@ void DB::Open(const std::string& path, Access access, int busyTimeout, bool immu
   const int code = sqlite3_open_v2(name.c_str(), &handle_, flags, nullptr);
   path_ = path;
   if (code != SQLITE_OK) {
-    const std::string message =
+    std::string message =
         ErrorMessage(handle_, ("open '" + path_ + "'").c_str(), __FILE__, __LINE__);
     Close();
-    throw message;
+    throw std::string(std::move(message));
   }
   sqlite3_busy_timeout(handle_, busyTimeout);
   connection_ = std::make_unique<Connection>(handle_, busyTimeout);

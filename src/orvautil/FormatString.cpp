@@ -10,7 +10,7 @@ namespace orva::util {
 std::string FormatString(const char* format, ...) {
   std::va_list arguments;
   va_start(arguments, format);
-  const std::string text = FormatStringV(format, arguments);
+  std::string text = FormatStringV(format, arguments);
   va_end(arguments);
   return text;
 }

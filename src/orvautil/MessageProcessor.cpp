@@ -22,6 +22,9 @@ namespace orva::util {
 
 namespace {
 
+/// Bytes read at once.
+constexpr std::size_t CHUNK_SIZE = 16384;
+
 /// A message that is no XML document we take.
 class IllFormedMessage : public Exception {
   using Exception::Exception;
@@ -97,7 +100,7 @@ void MessageProcessor::ReadMessages(Stream& stream) {
   const ParserScope parser(parser_);
   const auto [delimiter, delimiterLength] = GetDelimiter();
 
-  std::array<unsigned char, 16 * 1024> chunk{};
+  std::array<unsigned char, CHUNK_SIZE> chunk{};
   buffer.clear();
   std::size_t searched = 0; // bytes of the buffer that hold no beginning of a delimiter
   bool skipping = false;    // inside a message that is too long

@@ -37,7 +37,7 @@ Socket::Address::Address(const std::string& text) {
 }
 
 const sockaddr* Socket::Address::Get() const noexcept {
-  return reinterpret_cast<const sockaddr*>(&address_); // NOLINT: what the socket calls take
+  return reinterpret_cast<const sockaddr*>(&address_);
 }
 
 Socket::~Socket() {

@@ -7,7 +7,12 @@
 namespace orva::util {
 
 Thread::~Thread() {
-  Thread::Wait();
+  try {
+    Thread::Wait();
+  } catch (...) {
+    // Whoever cares waits before. A thread that cannot be joined is left to itself.
+    thread_.detach();
+  }
 }
 
 void Thread::Create(int stackMebibytes, unsigned flags, bool detached) {

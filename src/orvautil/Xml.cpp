@@ -13,7 +13,6 @@ std::string XMLCh2string(const XMLCh* text) {
     return {};
   }
   const xercesc::TranscodeToStr utf8(text, "UTF-8");
-  // NOLINTNEXTLINE: the parser's bytes are unsigned
   return {reinterpret_cast<const char*>(utf8.str()), static_cast<std::size_t>(utf8.length())};
 }
 
@@ -21,7 +20,6 @@ std::string GetAttributeValue(const std::string& name, const xercesc::DOMNamedNo
   if (attributes == nullptr) {
     return {};
   }
-  // NOLINTNEXTLINE: the parser's bytes are unsigned
   const auto* const bytes = reinterpret_cast<const XMLByte*>(name.data());
   const xercesc::TranscodeFromStr wideName(bytes, name.size(), "UTF-8");
   const xercesc::DOMNode* const attribute = attributes->getNamedItem(wideName.str());

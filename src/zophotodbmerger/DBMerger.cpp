@@ -94,6 +94,47 @@ std::time_t ApplyFiles(const PhotoDB& photos, const std::string& volume,
   return newest;
 }
 
+/// What a merge has to remember of a catalog.
+struct Applied {
+  std::time_t newest = 0; ///< time of the newest file applied
+  PhotoCounts counts;
+};
+
+/// Reads what has changed in the catalog after `since` and applies it, folders before files.
+Applied ApplyCatalog(const PhotoDB& photos, const db::VolumeDB& catalog, const std::string& volume,
+                     std::time_t since, const std::atomic<bool>& stopRequested) {
+  // One view of the catalog for all three reads, let go before the writing begins, so that the
+  // indexer is not kept waiting.
+  db::Transaction snapshot(catalog, CATALOG_BUSY_TIMEOUT, __FILE__, __LINE__);
+
+  thread_timer timer;
+  const auto folders = ReadFolders(volume, catalog);
+  syslog(LOG_LOCAL1 | LOG_INFO, "Retrieved changed folders list for %s in %s\n", volume.c_str(),
+         Elapsed(timer).c_str());
+
+  timer.Start();
+  const auto files = ReadChangedFiles(volume, catalog, since);
+  syslog(LOG_LOCAL1 | LOG_INFO, "Retrieved %d changed files list for %s in %s\n",
+         static_cast<int>(files.size()), volume.c_str(), Elapsed(timer).c_str());
+
+  timer.Start();
+  const PhotoCounts counts = CountPhotos(volume, catalog);
+  syslog(LOG_LOCAL1 | LOG_INFO, "Retrieved counts from the orva db for mountPoint %s in %s\n",
+         volume.c_str(), Elapsed(timer).c_str());
+  snapshot.Commit(__FILE__, __LINE__);
+
+  timer.Start();
+  ApplyFolders(photos, volume, folders, stopRequested);
+  syslog(LOG_LOCAL1 | LOG_INFO, "Merged %d folders for %s in %s\n",
+         static_cast<int>(folders.size()), volume.c_str(), Elapsed(timer).c_str());
+
+  timer.Start();
+  const std::time_t newest = ApplyFiles(photos, volume, files, since, stopRequested);
+  syslog(LOG_LOCAL1 | LOG_INFO, "Merged %d files for %s in %s\n", static_cast<int>(files.size()),
+         volume.c_str(), Elapsed(timer).c_str());
+  return {.newest = newest, .counts = counts};
+}
+
 } // namespace
 
 DBMerger::DBMerger() {
@@ -126,46 +167,13 @@ void DBMerger::MergeDB(const std::string& masterMountPoint, const std::string& v
     photos.Init();
     db::Transaction transaction(photos, MERGE_BUSY_TIMEOUT, __FILE__, __LINE__);
     const auto statistics = ReadStatistics(photos, volumeMountPoint);
-    const std::time_t since = statistics->last_updated_time;
-
-    PhotoCounts counts;
-    std::time_t newest = since;
-    {
-      // One view of the catalog for all three reads, let go before the writing begins, so that
-      // the indexer is not kept waiting.
-      db::Transaction snapshot(catalog, CATALOG_BUSY_TIMEOUT, __FILE__, __LINE__);
-
-      thread_timer timer;
-      const auto folders = ReadFolders(volumeMountPoint, catalog);
-      syslog(LOG_LOCAL1 | LOG_INFO, "Retrieved changed folders list for %s in %s\n",
-             volumeMountPoint.c_str(), Elapsed(timer).c_str());
-
-      timer.Start();
-      const auto files = ReadChangedFiles(volumeMountPoint, catalog, since);
-      syslog(LOG_LOCAL1 | LOG_INFO, "Retrieved %d changed files list for %s in %s\n",
-             static_cast<int>(files.size()), volumeMountPoint.c_str(), Elapsed(timer).c_str());
-
-      timer.Start();
-      counts = CountPhotos(volumeMountPoint, catalog);
-      syslog(LOG_LOCAL1 | LOG_INFO, "Retrieved counts from the orva db for mountPoint %s in %s\n",
-             volumeMountPoint.c_str(), Elapsed(timer).c_str());
-      snapshot.Commit(__FILE__, __LINE__);
-
-      timer.Start();
-      ApplyFolders(photos, volumeMountPoint, folders, stopRequested);
-      syslog(LOG_LOCAL1 | LOG_INFO, "Merged %d folders for %s in %s\n",
-             static_cast<int>(folders.size()), volumeMountPoint.c_str(), Elapsed(timer).c_str());
-
-      timer.Start();
-      newest = ApplyFiles(photos, volumeMountPoint, files, since, stopRequested);
-      syslog(LOG_LOCAL1 | LOG_INFO, "Merged %d files for %s in %s\n",
-             static_cast<int>(files.size()), volumeMountPoint.c_str(), Elapsed(timer).c_str());
-    }
+    const Applied applied = ApplyCatalog(photos, catalog, volumeMountPoint,
+                                         statistics->last_updated_time, stopRequested);
 
     photos.UpdateStatus();
-    statistics->last_updated_time = newest;
-    statistics->photos_xcoded = counts.transcoded;
-    statistics->photos_total = counts.total;
+    statistics->last_updated_time = applied.newest;
+    statistics->photos_xcoded = applied.counts.transcoded;
+    statistics->photos_total = applied.counts.total;
     photos.UpdateStatistics(*statistics);
     transaction.Commit(__FILE__, __LINE__);
   } catch (const std::string& error) {

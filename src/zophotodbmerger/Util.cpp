@@ -5,13 +5,13 @@
 #include "Constants.h"
 
 #include <fcntl.h>
-#include <limits.h>
 #include <poll.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
+#include <climits>
 
 namespace orva::dbmerger {
 
