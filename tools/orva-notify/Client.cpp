@@ -1,0 +1,55 @@
+#include "orva-notify/Client.h"
+
+#include <array>
+#include <cerrno>
+
+namespace orva::notify {
+namespace {
+
+bool IsTemporary(int error) {
+  return error == EAGAIN || error == EINTR;
+}
+
+} // namespace
+
+void Client::Queue(const Message& message) {
+  if (!message->empty()) {
+    queue_.push_back(message);
+    queuedBytes_ += message->size();
+  }
+  SendQueued();
+}
+
+void Client::SendQueued() {
+  while (IsOpen() && !queue_.empty()) {
+    const std::string& first = *queue_.front();
+    const ssize_t count = send(Descriptor(), first.data() + takenOfFirst_,
+                               first.size() - takenOfFirst_, MSG_NOSIGNAL);
+    if (count >= 0) {
+      Taken(static_cast<std::size_t>(count));
+    } else if (IsTemporary(errno)) {
+      return;
+    } else {
+      Close();
+    }
+  }
+}
+
+void Client::Taken(std::size_t count) {
+  queuedBytes_ -= count;
+  takenOfFirst_ += count;
+  if (takenOfFirst_ == queue_.front()->size()) {
+    queue_.pop_front();
+    takenOfFirst_ = 0;
+  }
+}
+
+void Client::DiscardInput() {
+  std::array<char, 4096> input;
+  const ssize_t count = IsOpen() ? recv(Descriptor(), input.data(), input.size(), 0) : 0;
+  if (count == 0 || (count == -1 && !IsTemporary(errno))) {
+    Close();
+  }
+}
+
+} // namespace orva::notify

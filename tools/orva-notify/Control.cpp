@@ -1,0 +1,169 @@
+#include "orva-notify/Control.h"
+
+#include "orva-notify/Client.h"
+#include "orvautil/ClientSocket.h"
+#include "orvautil/Exception.h"
+#include "orvautil/FormatString.h"
+
+#include <poll.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstring>
+#include <sstream>
+#include <vector>
+
+namespace orva::notify {
+namespace {
+
+using Clock = std::chrono::steady_clock;
+
+constexpr std::size_t MAXIMUM_HEADER = 64;
+
+bool IsTemporary(int error) {
+  return error == EAGAIN || error == EINTR;
+}
+
+std::string Encode(const Request& request) {
+  return (request.kind == Request::Kind::Send ? "send " : "drop ") +
+         std::to_string(request.clients) + ' ' + std::to_string(request.message.size()) + '\n' +
+         request.message;
+}
+
+/// Waits for `events` until `deadline`; false when that has passed.
+bool WaitFor(const util::Socket& socket, short events, Clock::time_point deadline) {
+  for (;;) {
+    const auto left = std::chrono::ceil<std::chrono::milliseconds>(deadline - Clock::now());
+    pollfd ready{.fd = socket.Descriptor(), .events = events, .revents = 0};
+    const int result = poll(&ready, 1, static_cast<int>(std::max<long>(left.count(), 0)));
+    if (result >= 0 || errno != EINTR) {
+      return result > 0;
+    }
+  }
+}
+
+/// Sends `bytes`; false when the deadline has passed. A service that hangs up shows when its
+/// answer is read.
+bool SendAll(const util::Socket& socket, const std::string& bytes, Clock::time_point deadline) {
+  std::size_t sent = 0;
+  while (sent < bytes.size()) {
+    const ssize_t count =
+        send(socket.Descriptor(), bytes.data() + sent, bytes.size() - sent, MSG_NOSIGNAL);
+    if (count >= 0) {
+      sent += static_cast<std::size_t>(count);
+    } else if (!IsTemporary(errno)) {
+      return true;
+    } else if (!WaitFor(socket, POLLOUT, deadline)) {
+      return false;
+    }
+  }
+  return true;
+}
+
+/// The answer's line without its end; nothing when the deadline has passed. A service that hung
+/// up has answered with an empty line.
+std::optional<std::string> ReceiveLine(util::Socket& socket, Clock::time_point deadline) {
+  std::string line;
+  char next = 0;
+  while (WaitFor(socket, POLLIN, deadline)) {
+    if (socket.Read(&next, 1) == 0) {
+      return std::string();
+    }
+    if (next == '\n') {
+      return line;
+    }
+    line += next;
+  }
+  return std::nullopt;
+}
+
+[[noreturn]] void ThrowTooLate(const Request& request, std::chrono::seconds wait) {
+  throw util::Exception(
+      request.clients == 0
+          ? util::FormatString("No answer from the notification service within %lld s",
+                               static_cast<long long>(wait.count()))
+          : util::FormatString("Fewer than %zu clients connected within %lld s", request.clients,
+                               static_cast<long long>(wait.count())),
+      __FILE__, __LINE__);
+}
+
+} // namespace
+
+std::string ControlAddress(const std::string& address) {
+  return address + ".control";
+}
+
+std::size_t Ask(const std::string& address, const Request& request, std::chrono::seconds wait) {
+  if (request.message.size() > MAXIMUM_QUEUED_BYTES) {
+    throw util::Exception(util::FormatString("A message of %zu bytes is too long, %zu are allowed",
+                                             request.message.size(), MAXIMUM_QUEUED_BYTES),
+                          __FILE__, __LINE__);
+  }
+  const auto deadline = Clock::now() + wait;
+  util::ClientSocket socket(util::Socket::Address(ControlAddress(address)), true);
+  if (!socket.IsOpen()) {
+    throw util::Exception(util::FormatString("No notification service listens on %s: %s",
+                                             address.c_str(), strerror(errno)),
+                          __FILE__, __LINE__);
+  }
+  if (!SendAll(socket, Encode(request), deadline)) {
+    ThrowTooLate(request, wait);
+  }
+  const auto answer = ReceiveLine(socket, deadline);
+  if (!answer) {
+    ThrowTooLate(request, wait);
+  }
+  if (answer->empty()) {
+    throw util::Exception("The notification service hung up without an answer", __FILE__, __LINE__);
+  }
+  return std::stoul(*answer);
+}
+
+void ControlConnection::ReadAvailable() {
+  std::vector<char> chunk(std::size_t{64} * 1024);
+  const ssize_t count = IsOpen() ? recv(Descriptor(), chunk.data(), chunk.size(), 0) : 0;
+  if (count == -1 && IsTemporary(errno)) {
+    return;
+  }
+  if (count <= 0 || complete_) {
+    Close();
+    return;
+  }
+  input_.append(chunk.data(), static_cast<std::size_t>(count));
+  if (!arriving_ && !ReadHeader()) {
+    return;
+  }
+  if (input_.size() == length_) {
+    arriving_->message = std::move(input_);
+    complete_ = std::move(arriving_);
+  } else if (input_.size() > length_) {
+    Close();
+  }
+}
+
+bool ControlConnection::ReadHeader() {
+  const auto end = input_.find('\n');
+  if (end == std::string::npos && input_.size() < MAXIMUM_HEADER) {
+    return false;
+  }
+  std::istringstream header(input_.substr(0, end));
+  std::string kind;
+  Request request;
+  if (!(header >> kind >> request.clients >> length_) || (kind != "send" && kind != "drop") ||
+      length_ > MAXIMUM_QUEUED_BYTES) {
+    Close();
+    return false;
+  }
+  request.kind = kind == "send" ? Request::Kind::Send : Request::Kind::Drop;
+  arriving_ = request;
+  input_.erase(0, end + 1);
+  return true;
+}
+
+void ControlConnection::Answer(std::size_t count) {
+  const std::string answer = std::to_string(count) + '\n';
+  static_cast<void>(Write(answer.data(), static_cast<unsigned>(answer.size())));
+  Close();
+}
+
+} // namespace orva::notify

@@ -1,0 +1,70 @@
+#include "orva-notify/ListeningSocket.h"
+
+#include "orvautil/ClientSocket.h"
+#include "orvautil/Exception.h"
+#include "orvautil/FormatString.h"
+
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstring>
+#include <filesystem>
+
+namespace orva::notify {
+namespace {
+
+bool IsPath(const std::string& address) {
+  return address.starts_with("/");
+}
+
+bool IsSocket(const std::string& path) {
+  struct stat status {};
+  return lstat(path.c_str(), &status) == 0 && S_ISSOCK(status.st_mode);
+}
+
+// What a service that was killed left behind refuses connections.
+void RemoveStaleSocket(const std::string& path) {
+  const util::ClientSocket probe(util::Socket::Address(path), true);
+  if (!probe.IsOpen() && errno == ECONNREFUSED && IsSocket(path)) {
+    unlink(path.c_str());
+  }
+}
+
+} // namespace
+
+ListeningSocket::ListeningSocket(const std::string& address)
+    : Socket(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0)), address_(address) {
+  if (IsPath(address_)) {
+    std::filesystem::create_directories(std::filesystem::path(address_).parent_path());
+    RemoveStaleSocket(address_);
+  }
+  Bind();
+}
+
+ListeningSocket::~ListeningSocket() {
+  if (isBound_ && IsPath(address_)) {
+    unlink(address_.c_str());
+  }
+}
+
+void ListeningSocket::Bind() {
+  const Address address(address_);
+  isBound_ = bind(Descriptor(), address.Get(), address.Length()) == 0;
+  if (!isBound_ || listen(Descriptor(), SOMAXCONN) != 0) {
+    const char* const reason =
+        errno == EADDRINUSE ? "something else is there, perhaps another service" : strerror(errno);
+    throw util::Exception(util::FormatString("Cannot listen on %s: %s", address_.c_str(), reason),
+                          __FILE__, __LINE__);
+  }
+}
+
+OwnedDescriptor ListeningSocket::Accept() {
+  int descriptor = -1;
+  do {
+    descriptor = accept4(Descriptor(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK);
+  } while (descriptor == -1 && (errno == EINTR || errno == ECONNABORTED));
+  return OwnedDescriptor(descriptor);
+}
+
+} // namespace orva::notify

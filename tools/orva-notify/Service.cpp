@@ -1,0 +1,231 @@
+#include "orva-notify/Service.h"
+
+#include "orva-notify/Notification.h"
+#include "orvautil/Exception.h"
+#include "orvautil/FormatString.h"
+
+#include <fcntl.h>
+#include <poll.h>
+#include <sys/signalfd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <csignal>
+#include <cstring>
+#include <fstream>
+#include <iostream>
+
+namespace orva::notify {
+namespace {
+
+using util::FormatString;
+
+const char* const MOUNT_INFO = "/proc/self/mountinfo";
+
+void Print(const std::string& line) {
+  std::cout << line << std::endl;
+}
+
+/// `text` fit for one line of a terminal.
+std::string Printable(const std::string& text) {
+  constexpr std::size_t MAXIMUM = 300;
+  std::string line = text.substr(0, MAXIMUM);
+  std::replace_if(
+      line.begin(), line.end(), [](unsigned char c) { return c < 0x20 || c >= 0x7F; }, '.');
+  return text.size() > MAXIMUM ? line + "..." : line;
+}
+
+std::string CountOfClients(std::size_t count) {
+  return std::to_string(count) + (count == 1 ? " client" : " clients");
+}
+
+OwnedDescriptor CheckedDescriptor(int descriptor, const char* what) {
+  if (descriptor == -1) {
+    throw util::Exception(FormatString("Cannot open %s: %s", what, strerror(errno)), __FILE__,
+                          __LINE__);
+  }
+  return OwnedDescriptor(descriptor);
+}
+
+OwnedDescriptor CatchStopSignals() {
+  sigset_t signals;
+  sigemptyset(&signals);
+  sigaddset(&signals, SIGINT);
+  sigaddset(&signals, SIGTERM);
+  sigprocmask(SIG_BLOCK, &signals, nullptr);
+  return CheckedDescriptor(signalfd(-1, &signals, SFD_NONBLOCK | SFD_CLOEXEC), "signals");
+}
+
+OwnedDescriptor OpenMountInfo(bool watch) {
+  return watch ? CheckedDescriptor(open(MOUNT_INFO, O_RDONLY | O_CLOEXEC), MOUNT_INFO)
+               : OwnedDescriptor(-1);
+}
+
+template <typename Connection>
+std::size_t EraseClosed(std::vector<std::unique_ptr<Connection>>& connections) {
+  return std::erase_if(connections, [](const auto& connection) { return !connection->IsOpen(); });
+}
+
+} // namespace
+
+Service::Service(const std::string& address, bool watch)
+    : address_(address), signals_(CatchStopSignals()), control_(ControlAddress(address)),
+      notification_(address), mountInfo_(OpenMountInfo(watch)) {}
+
+// Each turn simply tries every descriptor. Requests are read first and done last, so that what
+// happened before a request, a client that connected or a volume that was mounted, is seen
+// before it.
+void Service::Run() {
+  Print("listening on " + address_);
+  while (!IsAskedToStop()) {
+    ReadRequests();
+    FollowMounts();
+    AcceptClients();
+    ServeClients();
+    PerformRequests();
+    Wait();
+  }
+  Print("stopped");
+}
+
+bool Service::IsAskedToStop() {
+  signalfd_siginfo signal{};
+  return read(signals_.Get(), &signal, sizeof signal) == sizeof signal;
+}
+
+void Service::Wait() {
+  std::vector<pollfd> descriptors{{signals_.Get(), POLLIN, 0}, {mountInfo_.Get(), POLLPRI, 0}};
+  if (!isFull_) {
+    descriptors.push_back({control_.Descriptor(), POLLIN, 0});
+    descriptors.push_back({notification_.Descriptor(), POLLIN, 0});
+  }
+  for (const auto& client : clients_) {
+    const int events = client->QueuedBytes() > 0 ? POLLIN | POLLOUT : POLLIN;
+    descriptors.push_back({client->Descriptor(), static_cast<short>(events), 0});
+  }
+  for (const auto& request : requests_) {
+    descriptors.push_back({request->Descriptor(), POLLIN, 0});
+  }
+  if (poll(descriptors.data(), descriptors.size(), -1) == -1 && errno != EINTR) {
+    throw util::Exception(FormatString("Cannot wait for clients: %s", strerror(errno)), __FILE__,
+                          __LINE__);
+  }
+}
+
+void Service::ReadRequests() {
+  for (auto connection = AcceptFrom(control_); connection.Get() != -1;
+       connection = AcceptFrom(control_)) {
+    requests_.push_back(std::make_unique<ControlConnection>(connection.Release()));
+  }
+  for (const auto& request : requests_) {
+    request->ReadAvailable();
+  }
+}
+
+void Service::FollowMounts() {
+  if (mountInfo_.Get() == -1) {
+    return;
+  }
+  std::ifstream table(MOUNT_INFO);
+  const Volumes now = ReadVolumes(table);
+  const VolumeChanges changes = Compare(volumes_, now);
+  for (const auto& mountPoint : changes.unplugged) {
+    Print("unplugged seen: " + Printable(mountPoint));
+    SendToAll(Compose(Event::Unplugged, mountPoint));
+  }
+  for (const auto& mountPoint : changes.plugged) {
+    Print("plugged seen: " + Printable(mountPoint));
+    SendToAll(Compose(Event::Plugged, mountPoint));
+  }
+  volumes_ = now;
+}
+
+void Service::AcceptClients() {
+  for (auto connection = AcceptFrom(notification_); connection.Get() != -1;
+       connection = AcceptFrom(notification_)) {
+    clients_.push_back(std::make_unique<Client>(connection.Release(), ++lastNumber_));
+    Client& client = *clients_.back();
+    Print(FormatString("client %u connected", client.Number()));
+    for (const auto& [mountPoint, id] : volumes_) {
+      const std::string message = Compose(Event::Plugged, mountPoint);
+      Queue(client, std::make_shared<const std::string>(Frame(message)));
+      Print(FormatString("sent to client %u: %s", client.Number(), message.c_str()));
+    }
+  }
+}
+
+void Service::ServeClients() {
+  for (const auto& client : clients_) {
+    client->SendQueued();
+    client->DiscardInput();
+  }
+  ForgetClosed();
+}
+
+void Service::PerformRequests() {
+  for (const auto& request : requests_) {
+    const auto& received = request->Received();
+    if (request->IsOpen() && received && clients_.size() >= received->clients) {
+      request->Answer(Perform(*received));
+    }
+  }
+  if (EraseClosed(requests_) > 0) {
+    isFull_ = false;
+  }
+}
+
+std::size_t Service::Perform(const Request& request) {
+  return request.kind == Request::Kind::Send ? SendToAll(request.message) : DropAll();
+}
+
+std::size_t Service::SendToAll(const std::string& message) {
+  const auto framed = std::make_shared<const std::string>(Frame(message));
+  for (const auto& client : clients_) {
+    Queue(*client, framed);
+  }
+  ForgetClosed();
+  Print("sent to " + CountOfClients(clients_.size()) + ": " + Printable(message));
+  return clients_.size();
+}
+
+std::size_t Service::DropAll() {
+  const std::size_t count = clients_.size();
+  for (const auto& client : clients_) {
+    client->Close();
+  }
+  Print("dropping " + CountOfClients(count));
+  ForgetClosed();
+  return count;
+}
+
+void Service::Queue(Client& client, const Message& framed) {
+  client.Queue(framed);
+  if (client.QueuedBytes() > MAXIMUM_QUEUED_BYTES) {
+    Print(FormatString("client %u does not read, %zu bytes wait for it: dropping it",
+                       client.Number(), client.QueuedBytes()));
+    client.Close();
+  }
+}
+
+void Service::ForgetClosed() {
+  for (const auto& client : clients_) {
+    if (!client->IsOpen()) {
+      Print(FormatString("client %u gone", client->Number()));
+    }
+  }
+  if (EraseClosed(clients_) > 0) {
+    isFull_ = false;
+  }
+}
+
+OwnedDescriptor Service::AcceptFrom(ListeningSocket& socket) {
+  OwnedDescriptor connection = socket.Accept();
+  const bool isFull = connection.Get() == -1 && errno != EAGAIN;
+  if (isFull && !isFull_) {
+    Print(FormatString("cannot take another connection until one ends: %s", strerror(errno)));
+  }
+  isFull_ = isFull_ || isFull;
+  return connection;
+}
+
+} // namespace orva::notify

@@ -1,0 +1,90 @@
+#include "orva-notify/CommandLine.h"
+#include "orva-notify/Control.h"
+#include "orva-notify/Service.h"
+#include "orvautil/Core.h"
+#include "orvautil/Exception.h"
+
+#include <csignal>
+#include <cstdlib>
+#include <fstream>
+#include <iostream>
+#include <iterator>
+
+namespace {
+
+using namespace orva::notify;
+using orva::core::ORVA_NOTIFICATION_SOCKET;
+
+constexpr int EXIT_USAGE = 2;
+
+std::string ReadAll(std::istream& stream) {
+  return {std::istreambuf_iterator<char>(stream), std::istreambuf_iterator<char>()};
+}
+
+std::string ReadFile(const std::string& name) {
+  if (name == "-") {
+    return ReadAll(std::cin);
+  }
+  std::ifstream file(name, std::ios::binary);
+  std::string content = ReadAll(file);
+  if (!file) {
+    throw orva::util::Exception("Cannot read '" + name + "'", __FILE__, __LINE__);
+  }
+  return content;
+}
+
+std::string MessageOf(const CommandLine& command) {
+  return command.event ? Compose(*command.event, command.mountPoint) : ReadFile(command.rawFile);
+}
+
+void Serve(const CommandLine& command) {
+  Service(ORVA_NOTIFICATION_SOCKET, command.watch).Run();
+}
+
+void PrintCount(const char* what, std::size_t count) {
+  std::cout << what << ' ' << count << (count == 1 ? " client\n" : " clients\n");
+}
+
+void Send(const CommandLine& command) {
+  const Request request{Request::Kind::Send, command.clients, MessageOf(command)};
+  PrintCount("sent to", Ask(ORVA_NOTIFICATION_SOCKET, request, command.wait));
+}
+
+void Drop(const CommandLine& command) {
+  const Request request{Request::Kind::Drop, command.clients, {}};
+  PrintCount("dropped", Ask(ORVA_NOTIFICATION_SOCKET, request, command.wait));
+}
+
+void Execute(const CommandLine& command) {
+  switch (command.action) {
+  case CommandLine::Action::Help:
+    std::cout << HELP;
+    break;
+  case CommandLine::Action::Serve:
+    Serve(command);
+    break;
+  case CommandLine::Action::Send:
+    Send(command);
+    break;
+  case CommandLine::Action::Drop:
+    Drop(command);
+    break;
+  }
+}
+
+} // namespace
+
+int main(int count, char* arguments[]) {
+  // A reader of our lines that goes away must not end the service.
+  std::signal(SIGPIPE, SIG_IGN);
+  try {
+    Execute(ParseCommandLine({arguments + 1, arguments + count}));
+    return EXIT_SUCCESS;
+  } catch (const UsageError& error) {
+    std::cerr << "orva-notify: " << error.what() << "; orva-notify --help says more\n";
+    return EXIT_USAGE;
+  } catch (const std::exception& error) {
+    std::cerr << "orva-notify: " << error.what() << '\n';
+    return EXIT_FAILURE;
+  }
+}
