@@ -1,8 +1,10 @@
 #include "CatalogSchema.h"
 
 #include "Sql.h"
+
 #include "orvadb/Transaction.h"
 #include "orvadb/VolumeDB.h"
+
 #include "orvautil/Core.h"
 #include "orvautil/Exception.h"
 
@@ -17,8 +19,9 @@ void MakeHome(const std::string& mountPoint) {
   const std::string home = core::GetORVA_HOME(mountPoint);
   std::error_code error;
   std::filesystem::create_directory(home, error);
-  if (error)
+  if (error) {
     throw util::Exception(home + ": " + error.message(), __FILE__, __LINE__);
+  }
 }
 
 } // namespace

@@ -1,6 +1,7 @@
 #include "CatalogWriter.h"
 
 #include "Sql.h"
+
 #include "orvadb/File.h"
 #include "orvadb/Folder.h"
 
@@ -29,9 +30,8 @@ void StoreFile(const db::DB& catalog, const db::File& file) {
 void StoreTranscoding(const db::DB& catalog, long long fileId, TranscodingStatus status,
                       std::time_t stamp) {
   Execute(catalog,
-          "INSERT INTO Transcodings(sourceId, profile, status, lastUpdatedDate) "
-          "VALUES(?, ?, ?, ?) ON CONFLICT(sourceId, profile) DO UPDATE "
-          "SET status = excluded.status, lastUpdatedDate = excluded.lastUpdatedDate",
+          "INSERT OR REPLACE INTO Transcodings(sourceId, profile, status, lastUpdatedDate) "
+          "VALUES(?, ?, ?, ?)",
           fileId, std::string(PROFILE), static_cast<int>(status), stamp);
 }
 

@@ -6,7 +6,7 @@
 namespace orva::catalog {
 namespace {
 
-using std::string_view_literals::operator""sv;
+using namespace std::string_view_literals;
 
 constexpr std::array PHOTO_EXTENSIONS = {"arw"sv,  "bmp"sv, "cr2"sv,  "dng"sv, "gif"sv,  "heic"sv,
                                          "heif"sv, "jpe"sv, "jpeg"sv, "jpg"sv, "nef"sv,  "orf"sv,
@@ -41,9 +41,11 @@ bool Contains(const auto& list, std::string_view name) {
 
 /// The length of the suffix that makes a backup of `name` (in lower case); 0 when there is none.
 std::size_t BackupSuffix(std::string_view name) {
-  for (const std::string_view suffix : BACKUP_SUFFIXES)
-    if (name.ends_with(suffix))
+  for (const std::string_view suffix : BACKUP_SUFFIXES) {
+    if (name.ends_with(suffix)) {
       return suffix.size();
+    }
+  }
   return 0;
 }
 
@@ -66,12 +68,15 @@ std::string ExtensionOf(std::string_view name) {
 }
 
 Category CategoryOf(std::string_view extension) {
-  if (Contains(PHOTO_EXTENSIONS, extension))
+  if (Contains(PHOTO_EXTENSIONS, extension)) {
     return PHOTO;
-  if (Contains(MUSIC_EXTENSIONS, extension))
+  }
+  if (Contains(MUSIC_EXTENSIONS, extension)) {
     return MUSIC;
-  if (Contains(VIDEO_EXTENSIONS, extension))
+  }
+  if (Contains(VIDEO_EXTENSIONS, extension)) {
     return VIDEO;
+  }
   return OTHER;
 }
 

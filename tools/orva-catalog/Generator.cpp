@@ -4,9 +4,11 @@
 #include "CatalogWriter.h"
 #include "Classification.h"
 #include "Sql.h"
+
 #include "orvadb/File.h"
 #include "orvadb/Folder.h"
 #include "orvadb/Transaction.h"
+
 #include "orvautil/FormatString.h"
 
 #include <algorithm>
@@ -35,8 +37,9 @@ public:
       AddFolder(number);
       const long long first = number * plan_.perFolder;
       const long long count = std::min(plan_.perFolder, plan_.files - first);
-      for (long long place = 0; place < count; ++place)
+      for (long long place = 0; place < count; ++place) {
         AddPhoto(number, first + place, place);
+      }
     }
     return folders;
   }
@@ -48,8 +51,9 @@ private:
     folder.id = number + 1;
     folder.folderId = parent < 0 ? -1 : parent + 1;
     folder.name = util::FormatString("Folder_%07lld", number + 1);
-    if (parent >= 0)
+    if (parent >= 0) {
       folder.path = paths_[static_cast<std::size_t>(parent)];
+    }
     folder.path += folder.name + '/';
     folder.category = FOLDER;
     folder.lastModifiedDate = FIRST_MODIFIED + number;

@@ -3,9 +3,11 @@
 #include "CatalogSchema.h"
 #include "CatalogWriter.h"
 #include "Sql.h"
+
 #include "orvadb/File.h"
 #include "orvadb/Folder.h"
 #include "orvadb/Transaction.h"
+
 #include "orvautil/Core.h"
 #include "orvautil/Exception.h"
 #include "orvautil/Path.h"
@@ -59,13 +61,15 @@ void Indexer::LoadRows() {
 
 void Indexer::Visit(const Place& place) {
   for (const Entry& entry : List(place)) {
-    if (entry.isFolder)
+    if (entry.isFolder) {
       Visit(UpdateFolder(place, entry));
-    else
+    } else {
       UpdateFile(place, entry);
+    }
   }
-  if (progress_)
+  if (progress_) {
     progress_(summary_);
+  }
 }
 
 std::vector<Indexer::Entry> Indexer::List(const Place& place) {
@@ -74,13 +78,15 @@ std::vector<Indexer::Entry> Indexer::List(const Place& place) {
   std::filesystem::directory_iterator iterator(util::MakePath(mountPoint_, place.path), error);
   while (!error && iterator != std::filesystem::directory_iterator()) {
     const std::string name = iterator->path().filename().native();
-    if (!IsProductData(place.path + name))
+    if (!IsProductData(place.path + name)) {
       Examine(place.path + name, name, entries);
+    }
     iterator.increment(error);
   }
   // A folder that went away meanwhile keeps its row until the next run.
-  if (error && error.value() != ENOENT)
+  if (error && error.value() != ENOENT) {
     LeaveAlone(place.path, error.message());
+  }
 
   std::sort(entries.begin(), entries.end(),
             [](const Entry& a, const Entry& b) { return a.name < b.name; });
@@ -91,8 +97,9 @@ void Indexer::Examine(const std::string& path, const std::string& name,
                       std::vector<Entry>& entries) {
   struct stat found = {};
   if (lstat(util::MakePath(mountPoint_, path).c_str(), &found) != 0) {
-    if (errno != ENOENT)
+    if (errno != ENOENT) {
       LeaveAlone(path, std::generic_category().message(errno));
+    }
   } else if (S_ISDIR(found.st_mode) || S_ISREG(found.st_mode)) {
     entries.push_back({name, S_ISDIR(found.st_mode), found.st_mtime, found.st_size});
   }
@@ -108,10 +115,11 @@ Indexer::Place Indexer::UpdateFolder(const Place& parent, const Entry& entry) {
   known.seen = true;
   place.id = known.id;
   place.revived = known.isDeleted;
-  if (isNew)
+  if (isNew) {
     ++nextFolderId_;
-  else if (!known.isDeleted && known.lastModifiedDate == entry.lastModifiedDate)
+  } else if (!known.isDeleted && known.lastModifiedDate == entry.lastModifiedDate) {
     return place;
+  }
 
   db::Folder folder;
   folder.id = place.id;
@@ -135,8 +143,9 @@ void Indexer::UpdateFile(const Place& folder, const Entry& entry) {
   file.ext = ExtensionOf(entry.name);
   file.category = CategoryOf(file.ext);
   ++summary_.files;
-  if (file.category == PHOTO)
+  if (file.category == PHOTO) {
     ++summary_.photos;
+  }
 
   const auto [position, isNew] = files_.try_emplace(
       file.path, KnownFile{nextFileId_, entry.lastModifiedDate, entry.size, false, false});
@@ -167,20 +176,23 @@ void Indexer::UpdateFile(const Place& folder, const Entry& entry) {
   file.lastUpdatedDate = stamp_;
   file.size = entry.size;
   StoreFile(catalog_, file);
-  if (file.category == PHOTO)
+  if (file.category == PHOTO) {
     StoreTranscoding(catalog_, file.id, FINISHED, stamp_);
+  }
 }
 
 void Indexer::DeleteVanished() {
   for (const auto& [path, folder] : folders_) {
-    if (folder.seen || folder.isDeleted || IsLeftAlone(path))
+    if (folder.seen || folder.isDeleted || IsLeftAlone(path)) {
       continue;
+    }
     Execute(catalog_, "UPDATE Folders SET isDeleted = 1, lastUpdatedDate = ? WHERE id = ?", stamp_,
             folder.id);
   }
   for (const auto& [path, file] : files_) {
-    if (file.seen || file.isDeleted || IsLeftAlone(path))
+    if (file.seen || file.isDeleted || IsLeftAlone(path)) {
       continue;
+    }
     Execute(catalog_,
             "UPDATE Files SET isDeleted = 1, status = ?, lastUpdatedDate = ? WHERE id = ?",
             static_cast<int>(INDEXED), stamp_, file.id);
@@ -192,8 +204,9 @@ void Indexer::DeleteVanished() {
 
 void Indexer::LeaveAlone(const std::string& path, const std::string& reason) {
   const std::string message = util::MakePath(mountPoint_, path) + ": " + reason;
-  if (path.empty())
+  if (path.empty()) {
     throw util::Exception(message, __FILE__, __LINE__);
+  }
   summary_.unreadable.push_back(message);
   leftAlone_.push_back(path.ends_with('/') ? path.substr(0, path.size() - 1) : path);
 }

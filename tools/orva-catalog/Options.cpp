@@ -14,35 +14,39 @@ long long ParseCount(const std::string& option, const std::string& text, long lo
   long long count = 0;
   const char* const end = text.data() + text.size();
   const auto [stop, error] = std::from_chars(text.data(), end, count);
-  if (error != std::errc() || stop != end || count < minimum || count > MAXIMUM_COUNT)
+  if (error != std::errc() || stop != end || count < minimum || count > MAXIMUM_COUNT) {
     throw UsageError(option + " takes a number from " + std::to_string(minimum) + " to " +
                      std::to_string(MAXIMUM_COUNT) + ", not \"" + text + "\"");
+  }
   return count;
 }
 
 template <typename Choice>
 Choice ParseChoice(const std::string& option, const std::string& text,
                    std::pair<const char*, Choice> first, std::pair<const char*, Choice> second) {
-  if (text == first.first)
+  if (text == first.first) {
     return first.second;
-  if (text == second.first)
+  }
+  if (text == second.first) {
     return second.second;
+  }
   throw UsageError(option + " takes " + first.first + " or " + second.first + ", not \"" + text +
                    "\"");
 }
 
 void SetGenerateOption(GeneratorPlan& plan, const std::string& option, const std::string& value) {
-  if (option == "--files")
+  if (option == "--files") {
     plan.files = ParseCount(option, value, 0);
-  else if (option == "--per-folder")
+  } else if (option == "--per-folder") {
     plan.perFolder = ParseCount(option, value, 1);
-  else if (option == "--names")
+  } else if (option == "--names") {
     plan.names =
         ParseChoice<Names>(option, value, {"unique", Names::Unique}, {"camera", Names::Camera});
-  else if (option == "--tree")
+  } else if (option == "--tree") {
     plan.tree = ParseChoice<Tree>(option, value, {"flat", Tree::Flat}, {"deep", Tree::Deep});
-  else
+  } else {
     throw UsageError("unknown option \"" + option + "\"");
+  }
 }
 
 /// Reads the options of generate, which follow the mount point.
@@ -54,15 +58,18 @@ void ParseGenerate(const std::vector<std::string>& arguments, Options& options) 
       options.command = Command::Restamp;
       continue;
     }
-    if (!option.starts_with("--"))
+    if (!option.starts_with("--")) {
       throw UsageError("unexpected argument \"" + option + "\"");
-    if (i + 1 == arguments.size())
+    }
+    if (i + 1 == arguments.size()) {
       throw UsageError(option + " needs a value");
+    }
     SetGenerateOption(options.plan, option, arguments[++i]);
     std::erase(missing, option);
   }
-  if (options.command == Command::Generate && !missing.empty())
+  if (options.command == Command::Generate && !missing.empty()) {
     throw UsageError("generate needs " + missing.front());
+  }
 }
 
 } // namespace
@@ -93,26 +100,31 @@ Exit status: 0 when done, 1 after a failure, which leaves the catalog's content 
 
 Options ParseOptions(const std::vector<std::string>& arguments) {
   Options options;
-  if (std::find(arguments.begin(), arguments.end(), "--help") != arguments.end())
+  if (std::find(arguments.begin(), arguments.end(), "--help") != arguments.end()) {
     return options;
-  if (arguments.empty())
+  }
+  if (arguments.empty()) {
     throw UsageError("index or generate?");
+  }
 
-  if (arguments[0] == "index")
+  if (arguments[0] == "index") {
     options.command = Command::Index;
-  else if (arguments[0] == "generate")
+  } else if (arguments[0] == "generate") {
     options.command = Command::Generate;
-  else
+  } else {
     throw UsageError("unknown command \"" + arguments[0] + "\"");
+  }
 
-  if (arguments.size() < 2 || arguments[1].empty() || arguments[1].starts_with("--"))
+  if (arguments.size() < 2 || arguments[1].empty() || arguments[1].starts_with("--")) {
     throw UsageError(arguments[0] + " needs the mount point of a volume");
+  }
   options.mountPoint = arguments[1];
 
-  if (options.command == Command::Generate)
+  if (options.command == Command::Generate) {
     ParseGenerate(arguments, options);
-  else if (arguments.size() > 2)
+  } else if (arguments.size() > 2) {
     throw UsageError("unexpected argument \"" + arguments[2] + "\"");
+  }
   return options;
 }
 

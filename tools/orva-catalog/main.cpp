@@ -2,7 +2,9 @@
 #include "Generator.h"
 #include "Indexer.h"
 #include "Options.h"
+
 #include "orvadb/VolumeDB.h"
+
 #include "orvautil/Core.h"
 #include "orvautil/Exception.h"
 #include "orvautil/Path.h"
@@ -23,9 +25,10 @@ using namespace orva;
 
 /// The volume's mount point without links; throws when it is no directory.
 std::string FindVolume(const std::string& mountPoint) {
-  const std::string volume = util::Path(mountPoint).Canonicalize();
-  if (volume.empty() || !std::filesystem::is_directory(volume))
+  std::string volume = util::Path(mountPoint).Canonicalize();
+  if (volume.empty() || !std::filesystem::is_directory(volume)) {
     throw util::Exception(mountPoint + " is not a directory", __FILE__, __LINE__);
+  }
   return volume;
 }
 
@@ -36,14 +39,16 @@ public:
   ProgressLine(const ProgressLine&) = delete;
   ProgressLine& operator=(const ProgressLine&) = delete;
   ~ProgressLine() {
-    if (isTerminal_)
+    if (isTerminal_) {
       std::cerr << "\r\033[K" << std::flush;
+    }
   }
 
   void Show(const catalog::IndexSummary& summary) {
     const auto now = std::chrono::steady_clock::now();
-    if (!isTerminal_ || now - shown_ < std::chrono::milliseconds(100))
+    if (!isTerminal_ || now - shown_ < std::chrono::milliseconds(100)) {
       return;
+    }
     shown_ = now;
     std::cerr << "\r\033[K" << summary.folders << " folders, " << summary.files << " files, "
               << summary.photos << " photos" << std::flush;
@@ -64,8 +69,9 @@ void Index(const std::string& volume) {
                   .Run();
   }
   catalog::Checkpoint(*database);
-  for (const std::string& message : summary.unreadable)
+  for (const std::string& message : summary.unreadable) {
     std::cerr << "orva-catalog: left as it was: " << message << '\n';
+  }
   std::cout << volume << ": " << summary.folders << " folders, " << summary.files << " files, "
             << summary.photos << " photos; files: " << summary.added << " added, "
             << summary.changed << " changed, " << summary.deleted << " deleted, " << summary.revived
@@ -80,8 +86,9 @@ void Generate(const std::string& volume, const catalog::GeneratorPlan& plan) {
 }
 
 void Restamp(const std::string& volume) {
-  if (!std::filesystem::exists(core::GetCatalogPath(volume)))
+  if (!std::filesystem::exists(core::GetCatalogPath(volume))) {
     throw util::Exception(volume + " has no catalog", __FILE__, __LINE__);
+  }
   const auto database = catalog::OpenCatalog(volume);
   const long long count = catalog::Restamp(*database, std::time(nullptr));
   catalog::Checkpoint(*database);
