@@ -1,0 +1,130 @@
+#include "CatalogSchema.h"
+#include "Generator.h"
+#include "Indexer.h"
+#include "Options.h"
+
+#include "orvadb/VolumeDB.h"
+
+#include "orvautil/Core.h"
+#include "orvautil/Exception.h"
+#include "orvautil/Path.h"
+
+#include <unistd.h>
+
+#include <chrono>
+#include <ctime>
+#include <exception>
+#include <filesystem>
+#include <iostream>
+#include <string>
+#include <vector>
+
+namespace {
+
+using namespace orva;
+
+/// The volume's mount point without links; throws when it is no directory.
+std::string FindVolume(const std::string& mountPoint) {
+  std::string volume = util::Path(mountPoint).Canonicalize();
+  if (volume.empty() || !std::filesystem::is_directory(volume)) {
+    throw util::Exception(mountPoint + " is not a directory", __FILE__, __LINE__);
+  }
+  return volume;
+}
+
+/// A line on the terminal that shows how far a run has come, gone again at its end.
+class ProgressLine {
+public:
+  ProgressLine() : isTerminal_(isatty(STDERR_FILENO) == 1) {}
+  ProgressLine(const ProgressLine&) = delete;
+  ProgressLine& operator=(const ProgressLine&) = delete;
+  ~ProgressLine() {
+    if (isTerminal_) {
+      std::cerr << "\r\033[K" << std::flush;
+    }
+  }
+
+  void Show(const catalog::IndexSummary& summary) {
+    const auto now = std::chrono::steady_clock::now();
+    if (!isTerminal_ || now - shown_ < std::chrono::milliseconds(100)) {
+      return;
+    }
+    shown_ = now;
+    std::cerr << "\r\033[K" << summary.folders << " folders, " << summary.files << " files, "
+              << summary.photos << " photos" << std::flush;
+  }
+
+private:
+  const bool isTerminal_;
+  std::chrono::steady_clock::time_point shown_;
+};
+
+void Index(const std::string& volume) {
+  const auto database = catalog::OpenCatalog(volume);
+  catalog::IndexSummary summary;
+  {
+    ProgressLine line;
+    summary = catalog::Indexer(*database, volume, std::time(nullptr),
+                               [&line](const catalog::IndexSummary& soFar) { line.Show(soFar); })
+                  .Run();
+  }
+  catalog::Checkpoint(*database);
+  for (const std::string& message : summary.unreadable) {
+    std::cerr << "orva-catalog: left as it was: " << message << '\n';
+  }
+  std::cout << volume << ": " << summary.folders << " folders, " << summary.files << " files, "
+            << summary.photos << " photos; files: " << summary.added << " added, "
+            << summary.changed << " changed, " << summary.deleted << " deleted, " << summary.revived
+            << " revived\n";
+}
+
+void Generate(const std::string& volume, const catalog::GeneratorPlan& plan) {
+  const auto database = catalog::OpenCatalog(volume);
+  const long long folders = catalog::Generate(*database, plan, std::time(nullptr));
+  catalog::Checkpoint(*database);
+  std::cout << volume << ": generated " << plan.files << " photos in " << folders << " folders\n";
+}
+
+void Restamp(const std::string& volume) {
+  if (!std::filesystem::exists(core::GetCatalogPath(volume))) {
+    throw util::Exception(volume + " has no catalog", __FILE__, __LINE__);
+  }
+  const auto database = catalog::OpenCatalog(volume);
+  const long long count = catalog::Restamp(*database, std::time(nullptr));
+  catalog::Checkpoint(*database);
+  std::cout << volume << ": stamped " << count << " transcodings anew\n";
+}
+
+void Run(const catalog::Options& options) {
+  switch (options.command) {
+  case catalog::Command::Help:
+    std::cout << catalog::HELP;
+    break;
+  case catalog::Command::Index:
+    Index(FindVolume(options.mountPoint));
+    break;
+  case catalog::Command::Generate:
+    Generate(FindVolume(options.mountPoint), options.plan);
+    break;
+  case catalog::Command::Restamp:
+    Restamp(FindVolume(options.mountPoint));
+    break;
+  }
+}
+
+} // namespace
+
+int main(int argc, char** argv) {
+  try {
+    Run(catalog::ParseOptions(std::vector<std::string>(argv + 1, argv + argc)));
+    return 0;
+  } catch (const catalog::UsageError& error) {
+    std::cerr << "orva-catalog: " << error.what() << "\nTry 'orva-catalog --help'.\n";
+    return 2;
+  } catch (const std::exception& error) {
+    std::cerr << "orva-catalog: " << error.what() << '\n';
+  } catch (const std::string& error) { // the database layer's
+    std::cerr << "orva-catalog: " << error << '\n';
+  }
+  return 1;
+}
