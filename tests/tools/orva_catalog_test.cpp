@@ -121,14 +121,13 @@ protected:
   /// Runs the program with both outputs in `output`; `arguments` go through the shell.
   static Outcome RunProgram(const std::string& arguments) {
     const std::string command = std::string(ORVA_CATALOG_PROGRAM) + ' ' + arguments + " 2>&1";
-    const std::unique_ptr<FILE, int (*)(FILE*)> pipe(popen(command.c_str(), "r"),
-                                                     [](FILE*) { return 0; });
+    std::unique_ptr<FILE, int (*)(FILE*)> pipe(popen(command.c_str(), "r"), pclose);
     Outcome outcome;
     std::array<char, 4096> buffer{};
     while (const std::size_t size = fread(buffer.data(), 1, buffer.size(), pipe.get())) {
       outcome.output.append(buffer.data(), size);
     }
-    outcome.status = WEXITSTATUS(pclose(pipe.get()));
+    outcome.status = WEXITSTATUS(pclose(pipe.release()));
     return outcome;
   }
 
