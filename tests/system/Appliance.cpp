@@ -16,10 +16,11 @@ namespace {
 
 const std::string REFUSAL = "ERROR ! Node name = ";
 const std::string BARRIER = "barrier";
+const std::string DIRECTORY = "/tmp/daemon";
+const std::string OUTPUT = "/tmp/daemon.out";
 
 std::string MaskTimes(const std::string& text) {
-  static const std::regex TIME(
-      R"(\d+\.\d{3} W   \d+\.\d{3} U   \d+\.\d{3} S   \d+\.\d%)");
+  static const std::regex TIME(R"(\d+\.\d{3} W   \d+\.\d{3} U   \d+\.\d{3} S   \d+\.\d%)");
   return std::regex_replace(text, TIME, "TIME");
 }
 
@@ -35,12 +36,17 @@ std::string DatabasePath(const std::string& location) {
 } // namespace
 
 void Appliance::Start(const std::vector<std::string>& environment) {
-  daemon_ = std::make_unique<DaemonProcess>("/tmp/daemon", environment);
+  daemon_ = std::make_unique<DaemonProcess>(DIRECTORY, OUTPUT, environment);
+  Barrier();
+}
+
+void Appliance::StartWithOutput(const std::string& output) {
+  daemon_ = std::make_unique<DaemonProcess>(DIRECTORY, output);
   Barrier();
 }
 
 DaemonProcess::End Appliance::Run(const std::vector<std::string>& environment) {
-  daemon_ = std::make_unique<DaemonProcess>("/tmp/daemon", environment);
+  daemon_ = std::make_unique<DaemonProcess>(DIRECTORY, OUTPUT, environment);
   return daemon_->AwaitEnd();
 }
 

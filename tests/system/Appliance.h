@@ -1,7 +1,7 @@
 #pragma once
 
-#include "Database.h"
 #include "DaemonProcess.h"
+#include "Database.h"
 #include "NotificationService.h"
 #include "Syslog.h"
 #include "Volume.h"
@@ -22,6 +22,9 @@ public:
 
   /// Starts the daemon and waits until it reads notifications. `environment` as DaemonProcess.
   void Start(const std::vector<std::string>& environment = {});
+
+  /// Start with another file for standard output than TakeOutput reads.
+  void StartWithOutput(const std::string& output);
 
   /// Starts the daemon where it is not expected to come so far, and waits for its end.
   DaemonProcess::End Run(const std::vector<std::string>& environment = {});

@@ -24,7 +24,9 @@ std::string NameOf(const std::string& path) {
   return name.back() == '/' ? name.substr(0, name.size() - 1) : name;
 }
 
-std::string Text(bool flag) { return flag ? "1" : "0"; }
+std::string Text(bool flag) {
+  return flag ? "1" : "0";
+}
 
 } // namespace
 
@@ -41,7 +43,7 @@ Catalog::Catalog(const Volume& volume) : database_(Place(volume), true) {
                 "profile TEXT, status INTEGER, lastUpdatedDate INTEGER)");
 }
 
-void Catalog::AddFolder(const std::string& path, long modified, Flags flags) {
+void Catalog::AddFolder(const std::string& path, long modified, CatalogFlags flags) {
   database_.Run("INSERT INTO Folders(folderId, path, name, category, lastModifiedDate, isBackup, "
                 "isHidden, isSystem, isDeleted, status, lastUpdatedDate) "
                 "VALUES(coalesce((SELECT id FROM Folders WHERE path = ?), -1), ?, ?, 4, ?, ?, ?, "
@@ -50,7 +52,7 @@ void Catalog::AddFolder(const std::string& path, long modified, Flags flags) {
                  Text(flags.hidden), Text(flags.system)});
 }
 
-void Catalog::AddPhoto(const std::string& path, long modified, long stamp, Flags flags) {
+void Catalog::AddPhoto(const std::string& path, long modified, long stamp, CatalogFlags flags) {
   database_.Run("INSERT INTO Files(folderId, path, name, category, lastModifiedDate, isBackup, "
                 "isHidden, isSystem, isDeleted, status, lastUpdatedDate, ext, size) "
                 "VALUES(coalesce((SELECT id FROM Folders WHERE path = ?), -1), ?, ?, 3, ?, ?, ?, "

@@ -7,6 +7,13 @@
 
 namespace orva::test {
 
+/// The flags of a catalog row.
+struct CatalogFlags {
+  bool backup = false;
+  bool hidden = false;
+  bool system = false;
+};
+
 /// The media catalog of a volume, row by row as a test wants it. Paths are relative to the
 /// volume; a folder's ends in a separator. Folders come before what they hold.
 class Catalog {
@@ -14,16 +21,10 @@ public:
   /// Makes an empty catalog on the volume.
   explicit Catalog(const Volume& volume);
 
-  struct Flags {
-    bool backup = false;
-    bool hidden = false;
-    bool system = false;
-  };
-
-  void AddFolder(const std::string& path, long modified, Flags flags = {});
+  void AddFolder(const std::string& path, long modified, CatalogFlags flags = {});
 
   /// A photo whose transcoding was finished at `stamp`.
-  void AddPhoto(const std::string& path, long modified, long stamp, Flags flags = {});
+  void AddPhoto(const std::string& path, long modified, long stamp, CatalogFlags flags = {});
 
   /// Marks a file as deleted and its transcoding as withdrawn at `stamp`.
   void DeletePhoto(const std::string& path, long stamp);

@@ -38,8 +38,9 @@ std::vector<char*> Pointers(std::vector<std::string>& texts) {
 
 } // namespace
 
-DaemonProcess::DaemonProcess(std::string directory, const std::vector<std::string>& environment)
-    : directory_(std::move(directory)), output_(directory_ + ".out") {
+DaemonProcess::DaemonProcess(std::string directory, std::string output,
+                             const std::vector<std::string>& environment)
+    : directory_(std::move(directory)), output_(std::move(output)) {
   mkdir(directory_.c_str(), 0755);
   // The caller's come first: of two values of one name the first counts.
   std::vector<std::string> variables = environment;

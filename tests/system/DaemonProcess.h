@@ -2,6 +2,7 @@
 
 #include <sys/types.h>
 
+#include <iosfwd>
 #include <string>
 #include <vector>
 
@@ -12,8 +13,9 @@ namespace orva::test {
 class DaemonProcess {
 public:
   /// Starts the daemon in `directory`, which is made; `environment` ("NAME=value") comes on top
-  /// of the test's own. Throws std::system_error.
-  explicit DaemonProcess(std::string directory, const std::vector<std::string>& environment = {});
+  /// of the test's own. `output` is the file for its standard output. Throws std::system_error.
+  DaemonProcess(std::string directory, std::string output,
+                const std::vector<std::string>& environment = {});
   DaemonProcess(const DaemonProcess&) = delete;
   DaemonProcess& operator=(const DaemonProcess&) = delete;
   ~DaemonProcess();
@@ -46,9 +48,13 @@ private:
 };
 
 /// An exit with `status`.
-constexpr DaemonProcess::End Exited(int status) { return {true, status}; }
+constexpr DaemonProcess::End Exited(int status) {
+  return {true, status};
+}
 /// An end by `signal`.
-constexpr DaemonProcess::End Killed(int signal) { return {false, signal}; }
+constexpr DaemonProcess::End Killed(int signal) {
+  return {false, signal};
+}
 std::ostream& operator<<(std::ostream& stream, const DaemonProcess::End& end);
 
 } // namespace orva::test

@@ -24,7 +24,9 @@ std::string Row(sqlite3_stmt* statement) {
 
 } // namespace
 
-void Database::Closer::operator()(sqlite3* handle) const { sqlite3_close(handle); }
+void Database::Closer::operator()(sqlite3* handle) const {
+  sqlite3_close(handle);
+}
 
 Database::Database(const std::string& path, bool create) {
   sqlite3* handle = nullptr;

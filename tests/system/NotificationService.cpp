@@ -2,6 +2,7 @@
 
 #include "Deadline.h"
 
+#include "orva-notify/Notification.h"
 #include "orvautil/Core.h"
 #include "orvautil/Socket.h"
 
@@ -24,7 +25,9 @@ NotificationService::NotificationService()
   }
 }
 
-NotificationService::~NotificationService() { Stop(); }
+NotificationService::~NotificationService() {
+  Stop();
+}
 
 void NotificationService::AwaitClient() {
   if (client_ != -1) {
@@ -54,7 +57,7 @@ void NotificationService::SendBytes(const std::string& bytes) {
 }
 
 void NotificationService::Send(const std::string& message) {
-  SendBytes(message + std::string(4, '\0'));
+  SendBytes(notify::Frame(message));
 }
 
 void NotificationService::CloseClient() {

@@ -31,7 +31,7 @@ public:
   void Stop();
 
 private:
-  int listener_; ///< owned; -1 when stopped
+  int listener_;    ///< owned; -1 when stopped
   int client_ = -1; ///< owned; -1 while there is none
 };
 

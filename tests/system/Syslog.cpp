@@ -33,9 +33,15 @@ std::ostream& operator<<(std::ostream& stream, const LogLine& line) {
   return stream << line.priority << " \"" << line.text << '"';
 }
 
-LogLine Info(const std::string& text) { return {LOG_LOCAL1 | LOG_INFO, text}; }
-LogLine Error(const std::string& text) { return {LOG_LOCAL1 | LOG_ERR, text}; }
-LogLine Plain(const std::string& text) { return {LOG_USER | LOG_INFO, text}; }
+LogLine Info(const std::string& text) {
+  return {LOG_LOCAL1 | LOG_INFO, text};
+}
+LogLine Error(const std::string& text) {
+  return {LOG_LOCAL1 | LOG_ERR, text};
+}
+LogLine Plain(const std::string& text) {
+  return {LOG_USER | LOG_INFO, text};
+}
 
 Syslog::Syslog() : socket_(socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0)) {
   sockaddr_un address{};

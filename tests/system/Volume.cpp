@@ -33,7 +33,9 @@ Volume::Volume(const std::string& name, const std::string& size) : path_("/share
   mounted_ = true;
 }
 
-Volume::~Volume() { Unmount(); }
+Volume::~Volume() {
+  Unmount();
+}
 
 void Volume::MakeReadOnly() {
   Check(mount(nullptr, path_.c_str(), nullptr, MS_REMOUNT | MS_BIND | MS_RDONLY, nullptr), path_);

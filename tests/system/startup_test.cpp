@@ -1,0 +1,201 @@
+#include "Catalog.h"
+#include "Expectations.h"
+#include "Messages.h"
+
+#include "orvautil/Core.h"
+
+#include <sys/mount.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <csignal>
+#include <ctime>
+#include <filesystem>
+#include <fstream>
+
+namespace orva::test {
+namespace {
+
+namespace fs = std::filesystem;
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
+
+const Log CONNECTED = {
+    Plain("src/zophotodbmerger/NotificationListener:130: Creating the notification socket "
+          "/run/orva/notification.sock"),
+    Plain("src/zophotodbmerger/NotificationListener:137: Calling ReadMessage()")};
+
+const Log REFUSED = {
+    Plain("src/zophotodbmerger/NotificationListener:130: Creating the notification socket "
+          "/run/orva/notification.sock"),
+    Error("Unable to open socket (/run/orva/notification.sock)"),
+    Info("src/zophotodbmerger/NotificationListener:154: NotificationListener exiting."),
+    Info("Returning from the wait")};
+
+/// A daemon that tells how often the XML platform was terminated.
+class StartUp : public SystemTest {
+protected:
+  DaemonProcess::End RunProbed() {
+    // The sanitizer's runtime otherwise insists on being the first library.
+    std::string asan = "ASAN_OPTIONS=verify_asan_link_order=0";
+    if (const char* options = std::getenv("ASAN_OPTIONS")) {
+      asan += std::string(":") + options;
+    }
+    return appliance.Run(
+        {"LD_PRELOAD=" TERMINATE_PROBE_LIBRARY, "TERMINATE_PROBE=/tmp/terminations", asan});
+  }
+
+  static int Terminations() {
+    std::ifstream file("/tmp/terminations");
+    int count = 0;
+    for (std::string line; std::getline(file, line);) {
+      ++count;
+    }
+    return count;
+  }
+
+  static void MakeFile(const std::string& path, const std::string& content) {
+    std::ofstream(path) << content;
+  }
+};
+
+TEST_F(StartUp, WithoutAServiceTheDaemonSaysSoAndEndsWell) {
+  appliance.Service().Stop();
+  EXPECT_EQ(Exited(0), RunProbed());
+  EXPECT_EQ(REFUSED, appliance.TakeLog());
+  EXPECT_THAT(appliance.TakeOutput(), IsEmpty());
+  // The listener's thread, then main.
+  EXPECT_EQ(2, Terminations());
+}
+
+TEST_F(StartUp, ConnectsToTheService) {
+  appliance.Start();
+  EXPECT_EQ(CONNECTED, appliance.TakeLog());
+}
+
+TEST_F(StartUp, PublishesAnEmptyDatabaseUnderTheSharesRoot) {
+  const std::time_t before = std::time(nullptr);
+  appliance.Start();
+  const std::time_t after = std::time(nullptr);
+
+  EXPECT_EQ(SHARES_LOCATOR, Appliance::Locator());
+  const MergedDatabase merged("/shares");
+  EXPECT_THAT(merged.Folders(), ElementsAre(ROOT_FOLDER));
+  EXPECT_THAT(merged.Files(), IsEmpty());
+  EXPECT_THAT(merged.Statistics(), IsEmpty());
+  EXPECT_THAT(merged.Rows().Run("SELECT id, mc_version, desc, etype, typeof(desc) FROM Status"),
+              ElementsAre("1|2.0||0|text"));
+  const std::time_t stamp = std::stol(merged.Rows().Run("SELECT mdate FROM Status").at(0));
+  EXPECT_LE(before, stamp);
+  EXPECT_GE(after, stamp);
+}
+
+TEST_F(StartUp, MakesTheDatabaseDirectoryWorldWritableWhateverTheUmask) {
+  umask(077);
+  appliance.Start();
+  EXPECT_EQ(fs::perms::all, fs::status("/shares/.zophotos").permissions());
+}
+
+TEST_F(StartUp, LeavesNothingInItsWorkingDirectory) {
+  appliance.Start();
+  EXPECT_TRUE(fs::is_empty(appliance.Daemon().Directory()));
+}
+
+TEST_F(StartUp, EmptiesTheDatabaseOfAnEarlierRun) {
+  appliance.Start();
+  {
+    const MergedDatabase merged("/shares");
+    merged.Rows().Run("INSERT INTO Folders(parent_folder_id, name, modified_date, volume) "
+                      "VALUES(1, '/shares/Old/', 5, '/shares/Old/')");
+    merged.Rows().Run("INSERT INTO Files(folder_id, name, modified_date, volume, created_date) "
+                      "VALUES(2, 'a.jpg', 5, '/shares/Old/', 5)");
+    merged.Rows().Run("INSERT INTO Statistics(volume, photos_xcoded, photos_total, "
+                      "last_updated_time) VALUES('/shares/Old/', 1, 1, 5)");
+    merged.Rows().Run("UPDATE Status SET mdate = 5, mc_version = '1.7', desc = 'kept'");
+  }
+  ASSERT_EQ(Exited(0), appliance.Shutdown());
+
+  ASSERT_EQ(Exited(0), appliance.Run());
+  const MergedDatabase merged("/shares");
+  EXPECT_THAT(merged.Folders(), ElementsAre(ROOT_FOLDER));
+  EXPECT_THAT(merged.Files(), IsEmpty());
+  EXPECT_THAT(merged.Statistics(), IsEmpty());
+  EXPECT_THAT(merged.Rows().Run("SELECT mc_version, desc, mdate > 5 FROM Status"),
+              ElementsAre("1.7|kept|1"));
+}
+
+TEST_F(StartUp, WithoutTheSharesRootTheDatabaseIsAScratchOne) {
+  fs::remove("/shares");
+  appliance.Start();
+  EXPECT_EQ(Log{Error("There is no filesystem location for the mountpoint /shares")} + CONNECTED,
+            appliance.TakeLog());
+  EXPECT_EQ(SHARES_LOCATOR, Appliance::Locator());
+  EXPECT_TRUE(HasMergedDatabase(appliance.Daemon().Directory()));
+  EXPECT_FALSE(fs::exists("/shares"));
+}
+
+TEST_F(StartUp, AnUnwritableSharesRootEndsItWithStatusOne) {
+  ASSERT_EQ(0, mount("shares", "/shares", "tmpfs", MS_RDONLY, "size=1m"));
+  EXPECT_EQ(Exited(1), RunProbed());
+  EXPECT_THAT(appliance.TakeLog(), IsEmpty());
+  // The platform stays up on this way out.
+  EXPECT_EQ(0, Terminations());
+  EXPECT_EQ("(absent)", Appliance::Locator());
+}
+
+TEST_F(StartUp, AnUnusableLocationTerminatesTheXmlPlatformAndEndsItAbnormally) {
+  MakeFile("/shares/.zophotos", "no directory");
+  EXPECT_EQ(Killed(SIGABRT), RunProbed());
+  EXPECT_EQ(1, Terminations());
+  EXPECT_THAT(appliance.TakeLog(), IsEmpty());
+}
+
+TEST_F(StartUp, ALinkForTheDatabaseDirectoryIsAnUnusableLocation) {
+  ASSERT_EQ(0, mkdir("/tmp/elsewhere", 0700));
+  fs::create_directory_symlink("/tmp/elsewhere", "/shares/.zophotos");
+  EXPECT_EQ(Killed(SIGABRT), RunProbed());
+  EXPECT_EQ(1, Terminations());
+  EXPECT_EQ(fs::perms::owner_all, fs::status("/tmp/elsewhere").permissions());
+  EXPECT_TRUE(fs::is_empty("/tmp/elsewhere"));
+}
+
+TEST_F(StartUp, ABrokenDatabaseTerminatesTheXmlPlatformAndEndsItAbnormally) {
+  ASSERT_EQ(0, mkdir("/shares/.zophotos", 0777));
+  MakeFile("/shares/.zophotos/zophotos.db", std::string(4096, 'x'));
+  EXPECT_EQ(Killed(SIGABRT), RunProbed());
+  EXPECT_EQ(1, Terminations());
+  EXPECT_THAT(appliance.TakeLog(), IsEmpty());
+}
+
+TEST_F(StartUp, ALinkForTheDatabaseFileIsNotFollowed) {
+  ASSERT_EQ(0, mkdir("/shares/.zophotos", 0777));
+  fs::create_symlink("/tmp/elsewhere.db", "/shares/.zophotos/zophotos.db");
+  EXPECT_EQ(Killed(SIGABRT), RunProbed());
+  EXPECT_FALSE(fs::exists("/tmp/elsewhere.db"));
+}
+
+TEST_F(StartUp, ALinkForTheLocatorIsNotFollowed) {
+  MakeFile("/tmp/precious", "precious");
+  fs::create_symlink("/tmp/precious", "/tmp/zophotodbmerger.conf");
+  appliance.Start();
+  EXPECT_EQ(CONNECTED, appliance.TakeLog());
+  std::ifstream file("/tmp/precious");
+  std::string content;
+  std::getline(file, content);
+  EXPECT_EQ("precious", content);
+}
+
+TEST_F(StartUp, APipeForTheLocatorDoesNotBlockIt) {
+  ASSERT_EQ(0, mkfifo("/tmp/zophotodbmerger.conf", 0666));
+  appliance.Start();
+  EXPECT_EQ(CONNECTED, appliance.TakeLog());
+}
+
+TEST_F(StartUp, TheLocatorOfAnEarlierRunIsReplacedWhole) {
+  MakeFile("/tmp/zophotodbmerger.conf", std::string(4096, 'x'));
+  appliance.Start();
+  EXPECT_EQ(SHARES_LOCATOR, Appliance::Locator());
+}
+
+} // namespace
+} // namespace orva::test
