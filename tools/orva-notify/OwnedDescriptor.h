@@ -20,6 +20,7 @@ public:
     }
   }
 
+  explicit operator bool() const noexcept { return descriptor_ != -1; }
   int Get() const noexcept { return descriptor_; }
 
   /// Hands the ownership to the caller.

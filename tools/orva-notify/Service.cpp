@@ -113,8 +113,7 @@ void Service::Wait() {
 }
 
 void Service::ReadRequests() {
-  for (auto connection = AcceptFrom(control_); connection.Get() != -1;
-       connection = AcceptFrom(control_)) {
+  while (OwnedDescriptor connection = AcceptFrom(control_)) {
     requests_.push_back(std::make_unique<ControlConnection>(connection.Release()));
   }
   for (const auto& request : requests_) {
@@ -141,8 +140,7 @@ void Service::FollowMounts() {
 }
 
 void Service::AcceptClients() {
-  for (auto connection = AcceptFrom(notification_); connection.Get() != -1;
-       connection = AcceptFrom(notification_)) {
+  while (OwnedDescriptor connection = AcceptFrom(notification_)) {
     clients_.push_back(std::make_unique<Client>(connection.Release(), ++lastNumber_));
     Client& client = *clients_.back();
     Print(FormatString("client %u connected", client.Number()));
