@@ -120,7 +120,9 @@ protected:
   };
   /// Runs the program with both outputs in `output`; `arguments` go through the shell.
   static Outcome RunProgram(const std::string& arguments) {
-    const std::string command = std::string(ORVA_CATALOG_PROGRAM) + ' ' + arguments + " 2>&1";
+    return RunShell(std::string(ORVA_CATALOG_PROGRAM) + ' ' + arguments + " 2>&1");
+  }
+  static Outcome RunShell(const std::string& command) {
     std::unique_ptr<FILE, int (*)(FILE*)> pipe(popen(command.c_str(), "r"), pclose);
     Outcome outcome;
     std::array<char, 4096> buffer{};
@@ -209,12 +211,16 @@ TEST_F(OrvaCatalog, ReadersSeeTheLastCompleteStateWhileARunWrites) {
   Write("a.jpg");
   Index();
   const auto writer = Open();
-  db::Transaction transaction(*writer, 1000, __FILE__, __LINE__);
+  db::Transaction writing(*writer, 0, __FILE__, __LINE__);
   catalog::Execute(*writer, "DELETE FROM Files");
 
   const db::VolumeDB reader(volume_.native(), false);
-  EXPECT_EQ(SelectNumber(reader, "SELECT count(*) FROM Files"), 1);
-  transaction.Commit(__FILE__, __LINE__);
+  {
+    const db::Transaction reading(reader, 0, __FILE__, __LINE__);
+    EXPECT_EQ(SelectNumber(reader, "SELECT count(*) FROM Files"), 1);
+    writing.Commit(__FILE__, __LINE__);
+    EXPECT_EQ(SelectNumber(reader, "SELECT count(*) FROM Files"), 1);
+  }
   EXPECT_EQ(SelectNumber(reader, "SELECT count(*) FROM Files"), 0);
 }
 
@@ -536,6 +542,12 @@ TEST_F(OrvaCatalog, WhatCannotBeReadIsNotTakenForDeleted) {
   EXPECT_NE(summary.unreadable[0].find("File name too long"), std::string::npos);
   EXPECT_EQ(summary.deleted, 1);
   EXPECT_EQ(Query("SELECT path FROM Files WHERE isDeleted = 1"), Lines{"gone.jpg"});
+
+  const Outcome outcome = RunProgram("index " + volume_.native());
+  EXPECT_EQ(outcome.status, 0);
+  EXPECT_TRUE(
+      outcome.output.starts_with("orva-catalog: left as it was: " + volume_.native() + "/ddd"))
+      << outcome.output;
 }
 
 TEST_F(OrvaCatalog, AFailedRunLeavesTheCatalogAsItWas) {
@@ -555,8 +567,10 @@ TEST_F(OrvaCatalog, AVolumeThatCannotBeReadIsAFailure) {
   Write("a.jpg");
   Index();
   const auto database = Open();
-  catalog::Indexer indexer(*database, (volume_ / std::string(4096, 'x')).native(), NOW + 10);
-  EXPECT_THROW(indexer.Run(), util::Exception);
+  for (const std::string& place : {std::string(4096, 'x'), std::string("absent")}) {
+    catalog::Indexer indexer(*database, (volume_ / place).native(), NOW + 10);
+    EXPECT_THROW(indexer.Run(), util::Exception);
+  }
   EXPECT_EQ(Number("SELECT isDeleted FROM Files"), 0);
 }
 
@@ -609,13 +623,14 @@ TEST_F(OrvaCatalog, AFolderMayHoldThemAll) {
 }
 
 TEST_F(OrvaCatalog, GeneratingReplacesTheContentAndIsRepeatable) {
-  Write("a.jpg");
-  Index();
+  catalog::Generate(*Open(), {.files = 100, .perFolder = 5}, NOW);
   const char* const content = "SELECT f.id, f.path, f.lastModifiedDate, f.size, t.status FROM "
                               "Files f, Transcodings t WHERE t.sourceId = f.id ORDER BY f.id";
   catalog::Generate(*Open(), SMALL, NOW + 10);
   const Lines first = Query(content, 5);
   EXPECT_EQ(first.size(), 25U);
+  EXPECT_EQ(Number("SELECT count(*) FROM Folders"), 3);
+  EXPECT_EQ(Number("SELECT count(*) FROM Transcodings"), 25);
   catalog::Generate(*Open(), SMALL, NOW + 10);
   EXPECT_EQ(Query(content, 5), first);
   EXPECT_EQ(Number("SELECT min(lastUpdatedDate) FROM Transcodings"), NOW + 11);
@@ -623,10 +638,11 @@ TEST_F(OrvaCatalog, GeneratingReplacesTheContentAndIsRepeatable) {
 
 TEST_F(OrvaCatalog, AGeneratedCatalogHasTheIndicesOfAnIndexedOne) {
   const char* const schema = "SELECT sql FROM sqlite_schema WHERE sql IS NOT NULL ORDER BY name";
-  const Lines indexed = Query(schema);
+  const auto database = Open();
+  const Lines indexed = Select(*database, schema, 1);
   EXPECT_EQ(indexed.size(), 9U);
-  catalog::Generate(*Open(), SMALL, NOW);
-  EXPECT_EQ(Query(schema), indexed);
+  catalog::Generate(*database, SMALL, NOW);
+  EXPECT_EQ(Select(*database, schema, 1), indexed);
 }
 
 TEST_F(OrvaCatalog, RestampingStampsEveryTranscodingAndNothingElse) {
@@ -691,6 +707,17 @@ TEST_F(OrvaCatalog, TheProgramIndexesAndTellsWhatItDid) {
   const Outcome second = RunProgram("index " + volume_.native() + "/");
   EXPECT_EQ(second.output, volume_.native() + ": 1 folders, 1 files, 1 photos; files: 0 added, "
                                               "0 changed, 1 deleted, 0 revived\n");
+}
+
+TEST_F(OrvaCatalog, ProgressIsShownOnATerminalAndWipedAway) {
+  Write("Pictures/a.jpg");
+  const Outcome outcome =
+      RunShell("script --quiet --return --command '" ORVA_CATALOG_PROGRAM " index " +
+               volume_.native() + "' /dev/null");
+  EXPECT_EQ(outcome.status, 0);
+  const std::string progress = "\r\033[K1 folders, 1 files, 1 photos\r\033[K";
+  EXPECT_EQ(outcome.output.substr(0, progress.size() + volume_.native().size()),
+            progress + volume_.native());
 }
 
 TEST_F(OrvaCatalog, TheProgramGeneratesAndRestamps) {

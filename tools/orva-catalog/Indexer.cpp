@@ -83,8 +83,8 @@ std::vector<Indexer::Entry> Indexer::List(const Place& place) {
     }
     iterator.increment(error);
   }
-  // A folder that went away meanwhile keeps its row until the next run.
-  if (error && error.value() != ENOENT) {
+  // A folder may go away meanwhile, and all that was in it; the volume itself must not.
+  if (error && (error.value() != ENOENT || place.path.empty())) {
     LeaveAlone(place.path, error.message());
   }
 
