@@ -11,26 +11,16 @@ void StatementFinalizer::operator()(sqlite3_stmt* statement) const noexcept {
 }
 
 void Connection::CheckIn::operator()(sqlite3_stmt* statement) const noexcept {
-  Compiled used(statement);
-  if (place != nullptr) {
-    // A failed step has been reported when it was made; reset only repeats its code.
-    sqlite3_reset(used.get());
-    sqlite3_clear_bindings(used.get());
-    *place = std::move(used);
-  }
+  // A failed step was reported when it was made; reset only repeats its code.
+  sqlite3_reset(statement);
+  sqlite3_clear_bindings(statement);
+  place->reset(statement);
 }
 
 Connection::CheckedOut Connection::CheckOut(const char* sql, const char* file, unsigned line) {
-  const auto kept = statements_.find(sql);
-  if (kept != statements_.end()) {
-    if (kept->second) {
-      return {kept->second.release(), CheckIn{&kept->second}};
-    }
-    return {Compile(sql, file, line).release(), CheckIn{}};
-  }
-  Compiled compiled = Compile(sql, file, line);
-  Compiled* const place = statements_.size() < MAXIMUM_STATEMENTS ? &statements_[sql] : nullptr;
-  return {compiled.release(), CheckIn{place}};
+  Compiled& place = statements_[sql];
+  Compiled compiled = place ? std::move(place) : Compile(sql, file, line);
+  return {compiled.release(), CheckIn{&place}};
 }
 
 Connection::Compiled Connection::Compile(const char* sql, const char* file, unsigned line) const {

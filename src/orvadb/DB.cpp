@@ -19,11 +19,16 @@ namespace {
 /// Milliseconds. A reader of the database must not make a change of it fail.
 constexpr int BUSY_TIMEOUT = 1000;
 
-/// SQLite would wait for the other end of a FIFO, or write into a device.
-void RefuseSpecialFile(const std::string& path) {
-  struct stat status {};
-  if (lstat(path.c_str(), &status) == 0 && !S_ISREG(status.st_mode)) {
-    throw util::FormatString("%s:%d: '%s' is not a regular file", __FILE__, __LINE__, path.c_str());
+/// SQLite would wait for the other end of a FIFO, or write into a device: neither the database
+/// nor what it keeps beside it may be one.
+void RefuseSpecialFiles(const std::string& path) {
+  for (const char* const suffix : {"", "-journal", "-wal", "-shm"}) {
+    const std::string name = path + suffix;
+    struct stat status {};
+    if (lstat(name.c_str(), &status) == 0 && !S_ISREG(status.st_mode)) {
+      throw util::FormatString("%s:%d: '%s' is not a regular file", __FILE__, __LINE__,
+                               name.c_str());
+    }
   }
 }
 
@@ -58,16 +63,16 @@ void DB::Open(const std::string& path) {
   Open(path, Access::ReadWrite, BUSY_TIMEOUT, false);
 }
 
-void DB::Open(const std::string& path, Access access, int busyTimeout, bool immutable) {
+void DB::Open(std::string path, Access access, int busyTimeout, bool immutable) {
   Close();
-  RefuseSpecialFile(path);
+  RefuseSpecialFiles(path);
   const int mode = access == Access::ReadWrite ? SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE
                                                : SQLITE_OPEN_READONLY;
   const int flags = mode | SQLITE_OPEN_NOFOLLOW | SQLITE_OPEN_PRIVATECACHE | SQLITE_OPEN_NOMUTEX |
                     (immutable ? SQLITE_OPEN_URI : 0);
   const std::string& name = immutable ? ImmutableUri(path) : path;
   const int code = sqlite3_open_v2(name.c_str(), &handle_, flags, nullptr);
-  path_ = path;
+  path_ = std::move(path);
   if (code != SQLITE_OK) {
     std::string message =
         ErrorMessage(handle_, ("open '" + path_ + "'").c_str(), __FILE__, __LINE__);

@@ -6,6 +6,8 @@
 
 #include <sqlite3.h>
 
+#include <new>
+
 namespace orva::db {
 
 static_assert(Statement::ROW == SQLITE_ROW && Statement::DONE == SQLITE_DONE);
@@ -80,6 +82,9 @@ long long Statement::GetInt64(int column) const {
 std::string Statement::GetText(int column) const {
   const unsigned char* const text = sqlite3_column_text(statement_.get(), column);
   if (text == nullptr) {
+    if (sqlite3_errcode(db_.handle_) == SQLITE_NOMEM) {
+      throw std::bad_alloc();
+    }
     return {};
   }
   const int size = sqlite3_column_bytes(statement_.get(), column);

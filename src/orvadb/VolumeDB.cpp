@@ -10,6 +10,7 @@
 #include <sys/statvfs.h>
 
 #include <array>
+#include <cerrno>
 
 namespace orva::db {
 
@@ -40,7 +41,7 @@ bool IsInWalMode(sqlite3* handle) {
 
 bool IsAbsentOrEmpty(const std::string& path) {
   struct stat status {};
-  return lstat(path.c_str(), &status) != 0 || status.st_size == 0;
+  return lstat(path.c_str(), &status) == 0 ? status.st_size == 0 : errno == ENOENT;
 }
 
 } // namespace

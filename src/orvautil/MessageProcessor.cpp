@@ -11,6 +11,7 @@
 #include <xercesc/parsers/XercesDOMParser.hpp>
 #include <xercesc/sax/ErrorHandler.hpp>
 #include <xercesc/sax/SAXParseException.hpp>
+#include <xercesc/util/OutOfMemoryException.hpp>
 #include <xercesc/util/XMLException.hpp>
 
 #include <syslog.h>
@@ -46,7 +47,6 @@ public:
   MessageParser() {
     setValidationScheme(Val_Never);
     setLoadExternalDTD(false);
-    setLoadSchema(false);
     setDisableDefaultEntityResolution(true);
     setErrorHandler(&errorHandler_);
   }
@@ -75,16 +75,9 @@ private:
   std::unique_ptr<xercesc::XercesDOMParser>& place_;
 };
 
-/// Gives the document's memory back when the message is done.
-class DocumentScope {
-public:
-  explicit DocumentScope(xercesc::XercesDOMParser& parser) : parser_(parser) {}
-  DocumentScope(const DocumentScope&) = delete;
-  DocumentScope& operator=(const DocumentScope&) = delete;
-  ~DocumentScope() { parser_.resetDocumentPool(); }
-
-private:
-  xercesc::XercesDOMParser& parser_;
+/// Ends a document's life.
+struct DocumentRelease {
+  void operator()(xercesc::DOMDocument* document) const noexcept { document->release(); }
 };
 
 } // namespace
@@ -115,6 +108,7 @@ void MessageProcessor::ReadMessages(Stream& stream) {
       // The bytes that may still turn out to begin a delimiter are no message yet.
       const bool ended = end != buffer.end();
       if (!skipping && length > MAXIMUM_MESSAGE_LENGTH + (ended ? 0 : delimiterLength - 1)) {
+        static_assert(MAXIMUM_MESSAGE_LENGTH == 65536);
         GiveUp(MESSAGE_TOO_LONG, "message of more than 65536 bytes skipped", stream, nullptr, 0);
         skipping = true;
       }
@@ -150,7 +144,6 @@ void MessageProcessor::ProcessMessage(Stream& stream, const unsigned char* data,
 
 void MessageProcessor::ParseMessage(Stream& stream, const unsigned char* data,
                                     unsigned long length) const {
-  const DocumentScope document(*parser_);
   try {
     parser_->parse(xercesc::MemBufInputSource(data, length, "message"));
   } catch (const xercesc::SAXException& exception) {
@@ -159,8 +152,13 @@ void MessageProcessor::ParseMessage(Stream& stream, const unsigned char* data,
     throw IllFormedMessage(XMLCh2string(exception.getMessage()), __FILE__, __LINE__);
   } catch (const xercesc::DOMException& exception) {
     throw IllFormedMessage(XMLCh2string(exception.getMessage()), __FILE__, __LINE__);
+  } catch (const xercesc::OutOfMemoryException&) {
+    // The parser believes that it is still parsing and would refuse every further message.
+    parser_ = std::make_unique<MessageParser>();
+    throw;
   }
-  HandleMessage(stream, data, length, *parser_->getDocument()->getDocumentElement());
+  const std::unique_ptr<xercesc::DOMDocument, DocumentRelease> document(parser_->adoptDocument());
+  HandleMessage(stream, data, length, *document->getDocumentElement());
 }
 
 std::string MessageProcessor::DescribeException(const std::exception_ptr& exception) const {

@@ -16,8 +16,9 @@ namespace orva::util {
 Socket::Address::Address(const std::string& text) {
   if (text.size() < 2 || (text.front() != '/' && text.front() != '@')) {
     throw Exception(
-        FormatString("Not a local socket address, neither an absolute path nor @name: '%s'",
-                     text.c_str()),
+        FormatString(
+            "Not a local socket address, which is the absolute path of a socket or @name: '%s'",
+            text.c_str()),
         __FILE__, __LINE__);
   }
   const bool abstract = text.front() == '@';

@@ -35,7 +35,7 @@ public:
   void RemoveVolume(const std::string& masterMountPoint, const std::string& volumeMountPoint);
 
   /// Ends Run and the walks of MergeDB early, once and for all; any thread. A merge cut short
-  /// still commits: what it has not reached waits for a ReMergeDB.
+  /// still commits: files that it has not reached may have to wait for a ReMergeDB.
   std::atomic<bool> stopRequested{false};
 
 private:

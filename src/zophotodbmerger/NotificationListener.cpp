@@ -2,7 +2,6 @@
 
 #include "NotificationListener.h"
 
-#include "Constants.h"
 #include "PhotoDB.h"
 #include "State.h"
 #include "StateMachine.h"

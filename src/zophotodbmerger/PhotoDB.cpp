@@ -2,7 +2,6 @@
 
 #include "PhotoDB.h"
 
-#include "Constants.h"
 #include "File.h"
 #include "Folder.h"
 #include "Statistics.h"
@@ -46,15 +45,9 @@ bool IsDirectory(const std::string& path) {
   return lstat(path.c_str(), &status) == 0 && S_ISDIR(status.st_mode);
 }
 
-/// chmod for a directory that was made just now: whatever has replaced it since is not touched.
+/// chmod that does not follow a link which has replaced the directory.
 bool ChangeDirectoryMode(const std::string& path, mode_t mode) {
-  const int descriptor = open(path.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC);
-  if (descriptor == -1) {
-    return false;
-  }
-  const bool changed = fchmod(descriptor, mode) == 0;
-  close(descriptor);
-  return changed;
+  return fchmodat(AT_FDCWD, path.c_str(), mode, AT_SYMLINK_NOFOLLOW) == 0;
 }
 
 /// The path of the folder that holds the folder at `path`, with its trailing separator.

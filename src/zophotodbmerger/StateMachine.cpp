@@ -2,7 +2,6 @@
 
 #include "StateMachine.h"
 
-#include "Constants.h"
 #include "DefaultState.h"
 #include "MasterVolumeScannedState.h"
 #include "PhotoDB.h"
@@ -74,11 +73,10 @@ void StateMachine::setCurrentState(State* newState) {
     util::OwnerVector<State> finished;
     finished.push_back(std::move(previousState));
   }
-  previousState = std::move(currentState);
+  previousState = std::exchange(currentState, std::move(next));
   WriteStateLine({"Setting the current to default state", "Setting the current to plugged state",
                   "Setting the current to scanned state"},
-                 *next);
-  currentState = std::move(next);
+                 *currentState);
 }
 
 void StateMachine::moveToScannedState() {

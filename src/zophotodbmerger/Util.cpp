@@ -2,16 +2,13 @@
 
 #include "Util.h"
 
-#include "Constants.h"
-
 #include <fcntl.h>
 #include <poll.h>
+#include <sys/socket.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <cerrno>
-#include <climits>
 
 namespace orva::dbmerger {
 
@@ -41,20 +38,63 @@ bool IsWritable(int descriptor, int timeout) {
   return result == 1;
 }
 
-/// Standard output as a pipe, a socket or a terminal: somebody may stop reading it.
-void WriteToReader(std::string_view text) {
-  static bool stalled = false;
-  while (!text.empty()) {
-    // As much as a writable pipe takes without waiting.
-    const std::string_view piece = text.substr(0, PIPE_BUF);
-    stalled = !IsWritable(STDOUT_FILENO, stalled ? 0 : STALLED_READER_TIMEOUT);
-    if (stalled) {
-      return;
+/// A pipe, a socket or a terminal as standard output, whose reader may stop reading. Written
+/// through a description of our own, since not to wait is a property of the description, and
+/// standard output's is shared with other processes.
+class ReaderOutput {
+public:
+  ReaderOutput() = default;
+  ReaderOutput(const ReaderOutput&) = delete;
+  ReaderOutput& operator=(const ReaderOutput&) = delete;
+  ~ReaderOutput() { Forget(); }
+
+  /// `status` is that of standard output, which may have become another file.
+  void Write(const struct stat& status, std::string_view text) {
+    if (status.st_dev != device_ || status.st_ino != inode_) {
+      Forget();
+      device_ = status.st_dev;
+      inode_ = status.st_ino;
+      isSocket_ = S_ISSOCK(status.st_mode);
+      if (!isSocket_) {
+        descriptor_ = open("/proc/self/fd/1", O_WRONLY | O_NONBLOCK | O_NOCTTY | O_CLOEXEC);
+      }
     }
-    WriteAll(STDOUT_FILENO, piece);
-    text.remove_prefix(piece.size());
+    while (!text.empty()) {
+      const ssize_t count = WriteSome(text);
+      if (count >= 0) {
+        text.remove_prefix(static_cast<std::size_t>(count));
+        stalled_ = false;
+      } else if (errno == EAGAIN && !stalled_ &&
+                 IsWritable(STDOUT_FILENO, STALLED_READER_TIMEOUT)) {
+        continue;
+      } else if (errno != EINTR) {
+        stalled_ = errno == EAGAIN;
+        return;
+      }
+    }
   }
-}
+
+private:
+  ssize_t WriteSome(std::string_view text) const {
+    if (isSocket_) {
+      return send(STDOUT_FILENO, text.data(), text.size(), MSG_DONTWAIT | MSG_NOSIGNAL);
+    }
+    return write(descriptor_ == -1 ? STDOUT_FILENO : descriptor_, text.data(), text.size());
+  }
+
+  void Forget() {
+    if (descriptor_ != -1) {
+      close(descriptor_);
+      descriptor_ = -1;
+    }
+  }
+
+  dev_t device_ = 0;
+  ino_t inode_ = 0;
+  bool isSocket_ = false;
+  bool stalled_ = false;
+  int descriptor_ = -1; ///< -1 where it cannot be opened again: then the reader is waited for
+};
 
 } // namespace
 
@@ -66,10 +106,11 @@ void writeLine(std::initializer_list<std::string_view> pieces) {
   line += '\n';
 
   struct stat status {};
-  if (fstat(STDOUT_FILENO, &status) == 0 && S_ISREG(status.st_mode)) {
+  if (fstat(STDOUT_FILENO, &status) != 0 || S_ISREG(status.st_mode)) {
     WriteAll(STDOUT_FILENO, line);
   } else {
-    WriteToReader(line);
+    static ReaderOutput reader;
+    reader.Write(status, line);
   }
 }
 
@@ -81,7 +122,8 @@ void updateLocatorFile(const std::string& mountPoint) {
     return;
   }
   struct stat status {};
-  if (fstat(descriptor, &status) == 0 && S_ISREG(status.st_mode) && ftruncate(descriptor, 0) == 0) {
+  if (fstat(descriptor, &status) == 0 && S_ISREG(status.st_mode) && status.st_nlink == 1 &&
+      ftruncate(descriptor, 0) == 0) {
     std::string line = ZOPHOTOS_DB_PATH + "=";
     if (!mountPoint.empty()) {
       // A mount point that ends in "/" gives two separators in a row; the programs that read the

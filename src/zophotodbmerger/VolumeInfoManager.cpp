@@ -2,8 +2,6 @@
 
 #include "VolumeInfoManager.h"
 
-#include "Constants.h"
-
 #include "orvautil/Path.h"
 
 #include <algorithm>

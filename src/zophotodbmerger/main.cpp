@@ -1,6 +1,5 @@
 #include "stdafx.h"
 
-#include "Constants.h"
 #include "NotificationListener.h"
 #include "StateMachine.h"
 

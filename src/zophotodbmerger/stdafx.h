@@ -1,6 +1,9 @@
 #pragma once
 
-// The system's own headers that most sources of the daemon use.
+// What nearly every source of the daemon uses: the constants, of which each source has its own
+// copies, and the system's own headers.
+
+#include "Constants.h"
 
 #include <syslog.h>
 

@@ -1,6 +1,5 @@
 #pragma once
 
-#include <cstddef>
 #include <memory>
 #include <string>
 #include <unordered_map>
@@ -24,15 +23,12 @@ class Connection {
 public:
   using Compiled = std::unique_ptr<sqlite3_stmt, StatementFinalizer>;
 
-  /// Ends a use: puts the statement back into its place, or finalises it when it has none.
+  /// Ends a use: puts the statement back into its place, instead of another that came first.
   struct CheckIn {
-    Compiled* place = nullptr; ///< the connection's; stays where it is as long as that lives
+    Compiled* place = nullptr; ///< belongs to the connection and lives as long
     void operator()(sqlite3_stmt* statement) const noexcept;
   };
   using CheckedOut = std::unique_ptr<sqlite3_stmt, CheckIn>;
-
-  /// Statements kept at the most; the daemon has about thirty texts.
-  static constexpr std::size_t MAXIMUM_STATEMENTS = 64;
 
   /// Belongs to `handle`, which it does not own.
   Connection(sqlite3* handle, int busyTimeout) noexcept
@@ -53,7 +49,8 @@ private:
 
   sqlite3* handle_;
   int busyTimeout_;
-  std::unordered_map<std::string, Compiled> statements_; ///< by text; null while in use
+  /// By text, which every caller writes in full, so that they are few; null while in use.
+  std::unordered_map<std::string, Compiled> statements_;
 };
 
 /// The message of the last failure on `handle`: "file:line: SQLite's message (extended code

@@ -45,7 +45,7 @@ protected:
 
   /// Open for derived classes: `busyTimeout` is in milliseconds; `immutable` promises that
   /// nobody writes the file, which then is neither locked nor watched. Only ReadWrite creates.
-  void Open(const std::string& path, Access access, int busyTimeout, bool immutable);
+  void Open(std::string path, Access access, int busyTimeout, bool immutable);
 
   /// The open connection, null while closed; still owned by this object.
   sqlite3* Handle() const noexcept { return handle_; }

@@ -21,8 +21,8 @@ public:
   static constexpr int ROW = 100;  ///< a row is ready
   static constexpr int DONE = 101; ///< the statement has finished
 
-  /// Prepares `sql` on `db`, which outlives the statement. The text is not copied and must stay
-  /// valid as long as the statement.
+  /// Prepares `sql` on `db`, which outlives the statement. The text must stay valid as long
+  /// as the statement.
   Statement(const DB& db, const char* sql, const char* file, unsigned int line);
   Statement(const Statement&) = delete;
   Statement& operator=(const Statement&) = delete;

@@ -76,7 +76,7 @@ private:
   void GiveUp(Error error, const std::string& reason, Stream& stream, const unsigned char* data,
               unsigned long length) const;
 
-  std::unique_ptr<xercesc::XercesDOMParser> parser_; ///< there only during ReadMessages
+  mutable std::unique_ptr<xercesc::XercesDOMParser> parser_; ///< there only during ReadMessages
 };
 
 } // namespace orva::util

@@ -32,7 +32,6 @@ public:
 
   using Base::back;
   using Base::begin;
-  using Base::capacity;
   using Base::empty;
   using Base::end;
   using Base::front;
