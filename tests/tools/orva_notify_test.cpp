@@ -41,7 +41,6 @@ using namespace orva::notify;
 using core::ORVA_NOTIFICATION_SOCKET;
 using testing::ElementsAre;
 using testing::HasSubstr;
-using testing::IsEmpty;
 using testing::Pair;
 using Arguments = std::vector<std::string>;
 using Clock = std::chrono::steady_clock;
@@ -91,7 +90,7 @@ public:
   }
 
   /// The next line that the program prints; "(end)" at the end, "(deadline)" when none comes.
-  std::string ReadLine() {
+  std::string ReadLine() const {
     const auto deadline = Clock::now() + DEADLINE;
     std::string line;
     char next = 0;
@@ -108,7 +107,7 @@ public:
   }
 
   /// Reads lines up to the first that contains `text`, which it returns, or the last one.
-  std::string ReadLineWith(const std::string& text) {
+  std::string ReadLineWith(const std::string& text) const {
     std::string line = ReadLine();
     while (line.find(text) == std::string::npos && line != "(end)" && line != "(deadline)") {
       line = ReadLine();
@@ -183,7 +182,7 @@ public:
     for (;;) {
       const auto end = input_.find(delimiter, searched);
       if (end != std::string::npos) {
-        const std::string message = input_.substr(0, end);
+        std::string message = input_.substr(0, end);
         input_.erase(0, end + delimiter.size());
         return message;
       }
@@ -225,7 +224,7 @@ protected:
   }
 
   std::string FileWith(const std::string& content) const {
-    const std::string name = folder_ + "/message";
+    std::string name = folder_ + "/message";
     std::ofstream(name, std::ios::binary) << content;
     return name;
   }
@@ -282,7 +281,7 @@ TEST(Notification, EveryByteOfAMountPointComesBackDecoded) {
     mountPoint += static_cast<char>(byte);
   }
   const std::string message = Compose(Event::Plugged, mountPoint);
-  const std::string start = "<ORVANotification Name=\"Plugged\" MountPoint=\"";
+  const std::string start = R"(<ORVANotification Name="Plugged" MountPoint=")";
   ASSERT_TRUE(message.starts_with(start));
   const auto end = message.find('"', start.size());
   EXPECT_EQ(util::Decodestring(message.substr(start.size(), end - start.size())), mountPoint);
