@@ -22,7 +22,7 @@ public:
     if (rest_.empty()) {
       throw UsageError("missing " + what);
     }
-    const std::string argument = rest_.front();
+    std::string argument = rest_.front();
     rest_.pop_front();
     return argument;
   }
@@ -94,18 +94,18 @@ bool IsHelp(const std::string& argument) {
 
 } // namespace
 
-CommandLine ParseCommandLine(const std::vector<std::string>& given) {
+CommandLine ParseCommandLine(const std::vector<std::string>& arguments) {
   CommandLine command;
-  if (std::any_of(given.begin(), given.end(), IsHelp)) {
+  if (std::any_of(arguments.begin(), arguments.end(), IsHelp)) {
     return command;
   }
-  Arguments arguments(given);
-  command.action = ActionFromWord(arguments.Take("command"));
+  Arguments rest(arguments);
+  command.action = ActionFromWord(rest.Take("command"));
   std::deque<std::string> operands;
-  while (!arguments.Empty()) {
-    const std::string argument = arguments.Take("argument");
+  while (!rest.Empty()) {
+    const std::string argument = rest.Take("argument");
     if (argument.starts_with("-")) {
-      ReadOption(command, argument, arguments);
+      ReadOption(command, argument, rest);
     } else {
       operands.push_back(argument);
     }

@@ -10,6 +10,7 @@
 #include <cerrno>
 #include <cstring>
 #include <filesystem>
+#include <utility>
 
 namespace orva::notify {
 namespace {
@@ -33,8 +34,9 @@ void RemoveStaleSocket(const std::string& path) {
 
 } // namespace
 
-ListeningSocket::ListeningSocket(const std::string& address)
-    : Socket(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0)), address_(address) {
+ListeningSocket::ListeningSocket(std::string address)
+    : Socket(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0)),
+      address_(std::move(address)) {
   if (IsPath(address_)) {
     std::filesystem::create_directories(std::filesystem::path(address_).parent_path());
     RemoveStaleSocket(address_);

@@ -13,7 +13,7 @@ public:
   /// Listens on `address`, a text for Socket::Address. Makes the directory of a path and takes
   /// the place of a socket on which nobody listens any more. Throws util::Exception, also when
   /// another process listens there, and std::filesystem::filesystem_error.
-  explicit ListeningSocket(const std::string& address);
+  explicit ListeningSocket(std::string address);
 
   /// Takes the socket's file away.
   ~ListeningSocket() override;

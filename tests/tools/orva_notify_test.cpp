@@ -1,0 +1,644 @@
+#include "orva-notify/Client.h"
+#include "orva-notify/CommandLine.h"
+#include "orva-notify/Control.h"
+#include "orva-notify/MountInfo.h"
+#include "orva-notify/Notification.h"
+
+#include "orvautil/ClientSocket.h"
+#include "orvautil/Core.h"
+#include "orvautil/Decodestring.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <fcntl.h>
+#include <poll.h>
+#include <sys/mount.h>
+#include <sys/prctl.h>
+#include <sys/syscall.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <chrono>
+#include <csignal>
+#include <cstdio>
+#include <cstring>
+#include <filesystem>
+#include <fstream>
+#include <memory>
+#include <sstream>
+#include <string>
+#include <system_error>
+#include <vector>
+
+namespace {
+
+using namespace orva;
+using namespace orva::notify;
+using core::ORVA_NOTIFICATION_SOCKET;
+using testing::ElementsAre;
+using testing::HasSubstr;
+using testing::Pair;
+using Arguments = std::vector<std::string>;
+using Clock = std::chrono::steady_clock;
+
+// Only a broken service makes a test wait this long.
+constexpr std::chrono::seconds DEADLINE{60};
+
+/// Waits for `descriptor` to be readable; false when the deadline has passed.
+bool IsReadable(int descriptor, Clock::time_point deadline) {
+  const auto left = std::chrono::ceil<std::chrono::milliseconds>(deadline - Clock::now());
+  pollfd ready{.fd = descriptor, .events = POLLIN, .revents = 0};
+  return poll(&ready, 1, static_cast<int>(std::max<long>(left.count(), 0))) == 1;
+}
+
+/// The real program, started with its two outputs in one pipe; killed at the end.
+class Program {
+public:
+  explicit Program(const Arguments& arguments, const std::string& input = "/dev/null") {
+    std::array<int, 2> ends{};
+    if (pipe2(ends.data(), O_CLOEXEC) != 0) {
+      throw std::system_error(errno, std::generic_category(), "pipe2");
+    }
+    pid_ = fork();
+    if (pid_ == 0) {
+      Execute(arguments, input, ends[1]);
+    }
+    close(ends[1]);
+    output_ = ends[0];
+  }
+  Program(const Program&) = delete;
+  Program& operator=(const Program&) = delete;
+  ~Program() {
+    CloseOutput();
+    if (pid_ != -1) {
+      kill(pid_, SIGKILL);
+      waitpid(pid_, nullptr, 0);
+    }
+  }
+
+  void Signal(int signal) const { kill(pid_, signal); }
+
+  void CloseOutput() {
+    if (output_ != -1) {
+      close(output_);
+      output_ = -1;
+    }
+  }
+
+  /// The next line that the program prints; "(end)" at the end, "(deadline)" when none comes.
+  std::string ReadLine() const {
+    const auto deadline = Clock::now() + DEADLINE;
+    std::string line;
+    char next = 0;
+    while (IsReadable(output_, deadline)) {
+      if (read(output_, &next, 1) != 1) {
+        return line.empty() ? "(end)" : line;
+      }
+      if (next == '\n') {
+        return line;
+      }
+      line += next;
+    }
+    return "(deadline)";
+  }
+
+  /// Reads lines up to the first that contains `text`, which it returns, or the last one.
+  std::string ReadLineWith(const std::string& text) const {
+    std::string line = ReadLine();
+    while (line.find(text) == std::string::npos && line != "(end)" && line != "(deadline)") {
+      line = ReadLine();
+    }
+    return line;
+  }
+
+  /// The exit status; -1 when it does not end by itself.
+  int WaitForEnd() {
+    const int handle = static_cast<int>(syscall(SYS_pidfd_open, pid_, 0));
+    const bool hasEnded = IsReadable(handle, Clock::now() + DEADLINE);
+    close(handle);
+    int status = -1;
+    if (!hasEnded || waitpid(pid_, &status, 0) != pid_) {
+      return -1;
+    }
+    pid_ = -1;
+    return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+  }
+
+private:
+  [[noreturn]] static void Execute(const Arguments& arguments, const std::string& input,
+                                   int output) {
+    prctl(PR_SET_PDEATHSIG, SIGKILL);
+    dup2(open(input.c_str(), O_RDONLY | O_CLOEXEC), STDIN_FILENO);
+    dup2(output, STDOUT_FILENO);
+    dup2(output, STDERR_FILENO);
+    std::vector<char*> pointers;
+    for (const auto& argument : arguments) {
+      pointers.push_back(const_cast<char*>(argument.c_str())); // NOLINT: what execv takes
+    }
+    pointers.push_back(nullptr);
+    execv(pointers.front(), pointers.data());
+    _exit(127);
+  }
+
+  pid_t pid_ = -1;
+  int output_ = -1;
+};
+
+Arguments Notify(Arguments arguments) {
+  arguments.insert(arguments.begin(), ORVA_NOTIFY_PROGRAM);
+  return arguments;
+}
+
+/// What a command came to.
+struct Outcome {
+  int status = 0;
+  std::string line; ///< the first that it printed
+};
+
+Outcome RunNotify(const Arguments& arguments, const std::string& input = "/dev/null") {
+  Program program(Notify(arguments), input);
+  const std::string line = program.ReadLine();
+  return {program.WaitForEnd(), line};
+}
+
+/// A client of the service, as the daemon is one.
+class Listener {
+public:
+  Listener() : socket_(util::Socket::Address(ORVA_NOTIFICATION_SOCKET), false) {}
+
+  bool IsConnected() const { return socket_.IsOpen(); }
+  void Close() { socket_.Close(); }
+
+  /// The next message without its delimiter; "(end)" or "(deadline)" when there is none.
+  std::string ReadMessage() {
+    const std::string delimiter(4, '\0');
+    const auto deadline = Clock::now() + DEADLINE;
+    std::vector<char> chunk(std::size_t{256} * 1024);
+    std::size_t searched = 0;
+    for (;;) {
+      const auto end = input_.find(delimiter, searched);
+      if (end != std::string::npos) {
+        std::string message = input_.substr(0, end);
+        input_.erase(0, end + delimiter.size());
+        return message;
+      }
+      searched = std::max<std::size_t>(input_.size(), 3) - 3;
+      if (!IsReadable(socket_.Descriptor(), deadline)) {
+        return "(deadline)";
+      }
+      const unsigned count = socket_.Read(chunk.data(), static_cast<unsigned>(chunk.size()));
+      if (count == 0) {
+        return input_.empty() ? "(end)" : "(end within a message)";
+      }
+      input_.append(chunk.data(), count);
+    }
+  }
+
+private:
+  util::ClientSocket socket_;
+  std::string input_;
+};
+
+class OrvaNotify : public testing::Test {
+protected:
+  void SetUp() override {
+    std::filesystem::create_directories(folder_);
+    std::filesystem::create_directories("/shares");
+  }
+
+  void TearDown() override {
+    service_.reset();
+    std::filesystem::remove_all(std::filesystem::path(ORVA_NOTIFICATION_SOCKET).parent_path());
+    std::filesystem::remove_all(folder_);
+  }
+
+  /// Starts the service and waits until it listens.
+  void Serve(Arguments options = {}) {
+    options.insert(options.begin(), "serve");
+    service_ = std::make_unique<Program>(Notify(options));
+    ASSERT_EQ(service_->ReadLine(), "listening on " + ORVA_NOTIFICATION_SOCKET);
+  }
+
+  std::string FileWith(const std::string& content) const {
+    std::string name = folder_ + "/message";
+    std::ofstream(name, std::ios::binary) << content;
+    return name;
+  }
+
+  const std::string folder_ = "/tmp/orva_notify_test";
+  std::unique_ptr<Program> service_;
+};
+
+/// A tmpfs below /shares while it lives.
+class Volume {
+public:
+  explicit Volume(std::string mountPoint) : mountPoint_(std::move(mountPoint)) {
+    std::filesystem::create_directories(mountPoint_);
+    if (mount("none", mountPoint_.c_str(), "tmpfs", 0, "size=64k") != 0) {
+      throw std::system_error(errno, std::generic_category(), "mount " + mountPoint_);
+    }
+  }
+  Volume(const Volume&) = delete;
+  Volume& operator=(const Volume&) = delete;
+  ~Volume() { umount2(mountPoint_.c_str(), MNT_DETACH); }
+
+private:
+  const std::string mountPoint_;
+};
+
+TEST(Notification, NamesTheEventAndTheMountPoint) {
+  EXPECT_EQ(Compose(Event::Plugged, "/shares/Photos"),
+            R"(<ORVANotification Name="Plugged" MountPoint="/shares/Photos"/>)");
+  EXPECT_EQ(Compose(Event::Unplugged, "/shares/Photos"),
+            R"(<ORVANotification Name="Unplugged" MountPoint="/shares/Photos"/>)");
+  EXPECT_EQ(Compose(Event::Scanned, "/shares/Photos"),
+            R"(<ORVANotification Name="Scanned" MountPoint="/shares/Photos"/>)");
+  EXPECT_EQ(Compose(Event::End, "/shares/Photos"),
+            R"(<ORVANotification Name="End" MountPoint="/shares/Photos"/>)");
+  EXPECT_EQ(Compose(Event::Purged, "/shares/Photos"),
+            R"(<ORVANotification Name="Purged" MountPoint="/shares/Photos"/>)");
+}
+
+TEST(Notification, GivesATranscodedBatchItsProfile) {
+  EXPECT_EQ(Compose(Event::TranscodedBatch, "/shares/Photos/"),
+            R"(<ORVANotification Name="TranscodedBatch" MountPoint="/shares/Photos/">)"
+            "<profile>cb62bbdd389b48898f2e5244977cb2c5</profile></ORVANotification>");
+}
+
+TEST(Notification, EncodesWhatXmlOrTheEncodingCouldMistake) {
+  EXPECT_EQ(Compose(Event::End, "/shares/a b%41&<\">'+\n\xC3\xA4"),
+            "<ORVANotification Name=\"End\" "
+            "MountPoint=\"/shares/a%20b%2541%26%3C%22%3E%27%2B%0A%C3%A4\"/>");
+}
+
+TEST(Notification, EveryByteOfAMountPointComesBackDecoded) {
+  std::string mountPoint = "/";
+  for (int byte = 1; byte < 256; ++byte) {
+    mountPoint += static_cast<char>(byte);
+  }
+  const std::string message = Compose(Event::Plugged, mountPoint);
+  const std::string start = R"(<ORVANotification Name="Plugged" MountPoint=")";
+  ASSERT_TRUE(message.starts_with(start));
+  const auto end = message.find('"', start.size());
+  EXPECT_EQ(util::Decodestring(message.substr(start.size(), end - start.size())), mountPoint);
+}
+
+TEST(Notification, IsFramedByFourZeroBytes) {
+  EXPECT_EQ(Frame("<a/>"), std::string("<a/>\0\0\0\0", 8));
+}
+
+TEST(CommandLine, KnowsEachEvent) {
+  const std::vector<std::pair<std::string, Event>> words = {
+      {"plugged", Event::Plugged}, {"unplugged", Event::Unplugged},
+      {"scanned", Event::Scanned}, {"transcoded", Event::TranscodedBatch},
+      {"end", Event::End},         {"purged", Event::Purged}};
+  for (const auto& [word, event] : words) {
+    const CommandLine command = ParseCommandLine({"send", word, "/shares/A"});
+    EXPECT_EQ(command.action, CommandLine::Action::Send);
+    EXPECT_EQ(command.event, event) << word;
+    EXPECT_EQ(command.mountPoint, "/shares/A");
+  }
+}
+
+TEST(CommandLine, TakesOptionsBeforeAndBehindTheOperands) {
+  const CommandLine command =
+      ParseCommandLine({"send", "--clients", "3", "scanned", "", "--wait", "7"});
+  EXPECT_EQ(command.event, Event::Scanned);
+  EXPECT_EQ(command.mountPoint, "");
+  EXPECT_EQ(command.clients, 3U);
+  EXPECT_EQ(command.wait, std::chrono::seconds(7));
+
+  const CommandLine raw = ParseCommandLine({"send", "--raw", "-"});
+  EXPECT_EQ(raw.event, std::nullopt);
+  EXPECT_EQ(raw.rawFile, "-");
+  EXPECT_EQ(raw.wait, std::chrono::seconds(10));
+
+  EXPECT_TRUE(ParseCommandLine({"serve", "--watch"}).watch);
+  EXPECT_FALSE(ParseCommandLine({"serve"}).watch);
+  EXPECT_EQ(ParseCommandLine({"drop"}).action, CommandLine::Action::Drop);
+  EXPECT_EQ(ParseCommandLine({"send", "--help"}).action, CommandLine::Action::Help);
+}
+
+TEST(CommandLine, SaysWhatIsWrong) {
+  const std::vector<std::pair<Arguments, std::string>> wrong = {
+      {{}, "missing command"},
+      {{"listen"}, "unknown command 'listen'"},
+      {{"send"}, "send takes an event and a mount point, or --raw FILE"},
+      {{"send", "plugged"}, "send takes an event and a mount point, or --raw FILE"},
+      {{"send", "Plugged", "/shares/A"}, "unknown event 'Plugged'"},
+      {{"send", "plugged", "/a", "/b"}, "unexpected argument '/b'"},
+      {{"send", "--raw"}, "missing file after --raw"},
+      {{"send", "--raw", "f", "plugged"}, "unexpected argument 'plugged'"},
+      {{"send", "--watch", "plugged", "/a"}, "unknown option '--watch'"},
+      {{"serve", "--clients", "1"}, "unknown option '--clients'"},
+      {{"serve", "all"}, "unexpected argument 'all'"},
+      {{"drop", "--clients", "2x"}, "--clients takes a number up to 100000, not '2x'"},
+      {{"drop", "--wait", "-1"}, "--wait takes a number up to 100000, not '-1'"},
+      {{"drop", "--wait", "100001"}, "--wait takes a number up to 100000, not '100001'"}};
+  for (const auto& [arguments, message] : wrong) {
+    try {
+      ParseCommandLine(arguments);
+      ADD_FAILURE() << "accepted instead of: " << message;
+    } catch (const UsageError& error) {
+      EXPECT_EQ(error.what(), message);
+    }
+  }
+}
+
+Volumes VolumesOf(const std::string& table) {
+  std::istringstream lines(table);
+  return ReadVolumes(lines);
+}
+
+TEST(MountInfo, HoldsOnlyWhatIsDirectlyBelowShares) {
+  EXPECT_THAT(VolumesOf("22 1 8:1 / / rw - ext4 /dev/root rw\n"
+                        "30 22 0:5 / /shares rw - tmpfs none rw\n"
+                        "31 30 0:6 / /shares/B rw shared:4 - tmpfs none rw\n"
+                        "32 31 0:7 / /shares/B/inner rw - tmpfs none rw\n"
+                        "33 22 0:8 / /sharesX/C rw - tmpfs none rw\n"
+                        "34 30 0:9 /sub /shares/A ro - ext4 /dev/sda rw\n"),
+              ElementsAre(Pair("/shares/A", 34), Pair("/shares/B", 31)));
+}
+
+TEST(MountInfo, DecodesTheKernelsEscapes) {
+  EXPECT_THAT(VolumesOf("31 1 0:6 /a\\040b /shares/My\\040Photos\\011\\012\\134040 rw - tmpfs x y\n"
+                        "32 1 0:6 / /shares/tail\\04 rw - tmpfs x y\n"
+                        "33 1 0:6 / /shares/form\ffeed rw - tmpfs x y\n"),
+              ElementsAre(Pair("/shares/My Photos\t\n\\040", 31), Pair("/shares/form\ffeed", 33),
+                          Pair("/shares/tail\\04", 32)));
+}
+
+TEST(MountInfo, SeesTheMountOnTopAndNothingHidden) {
+  EXPECT_THAT(VolumesOf("31 1 0:6 / /shares/A rw - tmpfs x y\n"
+                        "32 1 0:7 / /shares rw - tmpfs x y\n"
+                        "33 32 0:8 / /shares/B rw - tmpfs x y\n"
+                        "34 33 0:9 / /shares/B rw - tmpfs x y\n"),
+              ElementsAre(Pair("/shares/B", 34)));
+}
+
+TEST(MountInfo, PassesOverWhatItCannotRead) {
+  EXPECT_THAT(VolumesOf("\nnonsense\n31 1 0:6\n32 1 0:6 / /shares/A rw - tmpfs x y\n"),
+              ElementsAre(Pair("/shares/A", 32)));
+}
+
+TEST(MountInfo, AnotherMountAtTheSamePlaceIsUnpluggedAndPlugged) {
+  const VolumeChanges changes = Compare({{"/shares/A", 1}, {"/shares/B", 2}, {"/shares/C", 3}},
+                                        {{"/shares/B", 2}, {"/shares/C", 7}, {"/shares/D", 8}});
+  EXPECT_THAT(changes.unplugged, ElementsAre("/shares/A", "/shares/C"));
+  EXPECT_THAT(changes.plugged, ElementsAre("/shares/C", "/shares/D"));
+}
+
+TEST_F(OrvaNotify, SendsEachClientWhatItIsHanded) {
+  Serve();
+  Listener one;
+  Listener two;
+  const Outcome scanned = RunNotify({"send", "scanned", "/shares/My Photos"});
+  EXPECT_EQ(scanned.status, 0);
+  EXPECT_EQ(scanned.line, "sent to 2 clients");
+  EXPECT_EQ(RunNotify({"send", "purged", "/shares/B"}).line, "sent to 2 clients");
+  for (Listener* const client : {&one, &two}) {
+    EXPECT_EQ(client->ReadMessage(), Compose(Event::Scanned, "/shares/My Photos"));
+    EXPECT_EQ(client->ReadMessage(), Compose(Event::Purged, "/shares/B"));
+  }
+}
+
+TEST_F(OrvaNotify, PrintsALineForWhatHappens) {
+  Serve();
+  Listener client;
+  EXPECT_EQ(service_->ReadLine(), "client 1 connected");
+  RunNotify({"send", "end", "/shares/A"});
+  EXPECT_EQ(service_->ReadLine(), "sent to 1 client: " + Compose(Event::End, "/shares/A"));
+  client.Close();
+  EXPECT_EQ(service_->ReadLine(), "client 1 gone");
+  RunNotify({"send", "--raw", FileWith("a\nb\x1B")});
+  EXPECT_EQ(service_->ReadLine(), "sent to 0 clients: a.b.");
+  service_->Signal(SIGTERM);
+  EXPECT_EQ(service_->ReadLine(), "stopped");
+}
+
+TEST_F(OrvaNotify, SendsRawBytesFromAFileAndFromStandardInput) {
+  Serve();
+  Listener client;
+  const std::string bytes("\x01\0\0\0<a>\xFF\n", 9);
+  const std::string file = FileWith(bytes);
+  EXPECT_EQ(RunNotify({"send", "--raw", file}).status, 0);
+  EXPECT_EQ(client.ReadMessage(), bytes);
+  EXPECT_EQ(RunNotify({"send", "--raw", "-"}, file).status, 0);
+  EXPECT_EQ(client.ReadMessage(), bytes);
+  EXPECT_EQ(RunNotify({"send", "--raw", "/dev/null"}).status, 0);
+  EXPECT_EQ(client.ReadMessage(), "");
+}
+
+TEST_F(OrvaNotify, ARawFileThatCannotBeReadIsAnError) {
+  Serve();
+  const Outcome outcome = RunNotify({"send", "--raw", folder_ + "/absent"});
+  EXPECT_EQ(outcome.status, 1);
+  EXPECT_EQ(outcome.line, "orva-notify: Cannot read '" + folder_ + "/absent'");
+}
+
+TEST_F(OrvaNotify, SendFailsWhenNoServiceListens) {
+  const Outcome outcome = RunNotify({"send", "plugged", "/shares/A"});
+  EXPECT_EQ(outcome.status, 1);
+  EXPECT_EQ(outcome.line, "orva-notify: No notification service listens on " +
+                              ORVA_NOTIFICATION_SOCKET + ": No such file or directory");
+}
+
+TEST_F(OrvaNotify, WrongUsageIsToldFromFailure) {
+  const Outcome wrong = RunNotify({"send", "exploded", "/shares/A"});
+  EXPECT_EQ(wrong.status, 2);
+  EXPECT_EQ(wrong.line, "orva-notify: unknown event 'exploded'; orva-notify --help says more");
+  const Outcome help = RunNotify({"--help"});
+  EXPECT_EQ(help.status, 0);
+  EXPECT_THAT(help.line, HasSubstr("notification service"));
+}
+
+TEST_F(OrvaNotify, WaitsForTheClientsItIsToldOf) {
+  Serve();
+  Listener one;
+  const Outcome tooFew =
+      RunNotify({"send", "--clients", "2", "--wait", "0", "plugged", "/shares/TooEarly"});
+  EXPECT_EQ(tooFew.status, 1);
+  EXPECT_EQ(tooFew.line, "orva-notify: Fewer than 2 clients connected within 0 s");
+
+  Program waiting(Notify({"send", "--clients", "2", "plugged", "/shares/A"}));
+  EXPECT_EQ(RunNotify({"send", "scanned", "/shares/B"}).line, "sent to 1 client");
+  Listener two;
+  EXPECT_EQ(waiting.ReadLine(), "sent to 2 clients");
+  EXPECT_EQ(waiting.WaitForEnd(), 0);
+  EXPECT_EQ(one.ReadMessage(), Compose(Event::Scanned, "/shares/B"));
+  EXPECT_EQ(one.ReadMessage(), Compose(Event::Plugged, "/shares/A"));
+  EXPECT_EQ(two.ReadMessage(), Compose(Event::Plugged, "/shares/A"));
+}
+
+TEST_F(OrvaNotify, DropClosesTheClientsAndGoesOnListening) {
+  Serve();
+  Listener one;
+  Listener two;
+  const Outcome outcome = RunNotify({"drop"});
+  EXPECT_EQ(outcome.status, 0);
+  EXPECT_EQ(outcome.line, "dropped 2 clients");
+  EXPECT_EQ(one.ReadMessage(), "(end)");
+  EXPECT_EQ(two.ReadMessage(), "(end)");
+  Listener three;
+  EXPECT_EQ(RunNotify({"send", "end", "/shares/A"}).line, "sent to 1 client");
+  EXPECT_EQ(three.ReadMessage(), Compose(Event::End, "/shares/A"));
+}
+
+TEST_F(OrvaNotify, StopsCleanlyOnBothSignals) {
+  for (const int signal : {SIGTERM, SIGINT}) {
+    Serve();
+    Listener client;
+    service_->Signal(signal);
+    EXPECT_EQ(service_->WaitForEnd(), 0);
+    EXPECT_EQ(client.ReadMessage(), "(end)");
+    EXPECT_FALSE(std::filesystem::exists(ORVA_NOTIFICATION_SOCKET));
+    EXPECT_FALSE(std::filesystem::exists(ControlAddress(ORVA_NOTIFICATION_SOCKET)));
+  }
+}
+
+TEST_F(OrvaNotify, TakesThePlaceOfAServiceThatWasKilled) {
+  Serve();
+  service_->Signal(SIGKILL);
+  EXPECT_EQ(service_->WaitForEnd(), -1);
+  ASSERT_TRUE(std::filesystem::exists(ORVA_NOTIFICATION_SOCKET));
+  Serve();
+  EXPECT_TRUE(Listener().IsConnected());
+}
+
+TEST_F(OrvaNotify, RefusesToServeBesideAnother) {
+  Serve();
+  const Outcome second = RunNotify({"serve"});
+  EXPECT_EQ(second.status, 1);
+  EXPECT_THAT(second.line, HasSubstr("something else is there, perhaps another service"));
+  Listener client;
+  EXPECT_EQ(RunNotify({"send", "end", "/shares/A"}).line, "sent to 1 client");
+}
+
+TEST_F(OrvaNotify, LeavesAFileThatIsNoSocketAlone) {
+  std::filesystem::create_directories(
+      std::filesystem::path(ORVA_NOTIFICATION_SOCKET).parent_path());
+  std::ofstream(ORVA_NOTIFICATION_SOCKET) << "precious";
+  EXPECT_EQ(RunNotify({"serve"}).status, 1);
+  EXPECT_EQ(std::filesystem::file_size(ORVA_NOTIFICATION_SOCKET), 8U);
+}
+
+TEST_F(OrvaNotify, KeepsAMessageForAClientThatReadsLate) {
+  Serve();
+  Listener client;
+  const std::string large(MAXIMUM_QUEUED_BYTES / 2, 'x');
+  EXPECT_EQ(RunNotify({"send", "--raw", FileWith(large)}).line, "sent to 1 client");
+  EXPECT_EQ(RunNotify({"send", "end", "/shares/A"}).line, "sent to 1 client");
+  EXPECT_TRUE(client.ReadMessage() == large);
+  EXPECT_EQ(client.ReadMessage(), Compose(Event::End, "/shares/A"));
+}
+
+TEST_F(OrvaNotify, DropsAClientThatDoesNotRead) {
+  Serve();
+  Listener idle;
+  const std::string file = FileWith(std::string(MAXIMUM_QUEUED_BYTES / 4 * 3, 'x'));
+  EXPECT_EQ(RunNotify({"send", "--raw", file}).line, "sent to 1 client");
+  EXPECT_EQ(RunNotify({"send", "--raw", file}).line, "sent to 0 clients");
+  EXPECT_THAT(service_->ReadLineWith("does not read"), HasSubstr("client 1 does not read"));
+  EXPECT_EQ(idle.ReadMessage(), "(end within a message)");
+  Listener next;
+  EXPECT_EQ(RunNotify({"send", "end", "/shares/A"}).line, "sent to 1 client");
+}
+
+TEST_F(OrvaNotify, RefusesAMessageThatIsTooLong) {
+  Serve();
+  const std::string file = FileWith("");
+  std::filesystem::resize_file(file, MAXIMUM_QUEUED_BYTES + 1);
+  const Outcome outcome = RunNotify({"send", "--raw", file});
+  EXPECT_EQ(outcome.status, 1);
+  EXPECT_EQ(outcome.line,
+            "orva-notify: A message of 67108865 bytes is too long, 67108864 are allowed");
+}
+
+TEST_F(OrvaNotify, SurvivesARequestThatIsNone) {
+  Serve();
+  const std::vector<std::string> texts = {"hello\n", "send 0 99999999999\n", "send 0 1\nxy",
+                                          std::string(64, 'x')};
+  for (const auto& text : texts) {
+    util::ClientSocket socket(util::Socket::Address(ControlAddress(ORVA_NOTIFICATION_SOCKET)),
+                              false);
+    ASSERT_EQ(socket.Write(text.data(), static_cast<unsigned>(text.size())), text.size());
+    ASSERT_TRUE(IsReadable(socket.Descriptor(), Clock::now() + DEADLINE)) << text;
+    char answer = 0;
+    EXPECT_EQ(socket.Read(&answer, 1), 0U) << text;
+  }
+  EXPECT_EQ(RunNotify({"send", "end", "/shares/A"}).line, "sent to 0 clients");
+}
+
+TEST_F(OrvaNotify, GoesOnWhenNobodyReadsItsLines) {
+  Serve();
+  service_->CloseOutput();
+  Listener client;
+  EXPECT_EQ(RunNotify({"send", "end", "/shares/A"}).line, "sent to 1 client");
+  EXPECT_EQ(RunNotify({"send", "end", "/shares/B"}).line, "sent to 1 client");
+}
+
+TEST_F(OrvaNotify, GoesOnWhenDescriptorsRunOut) {
+#ifdef __SANITIZE_ADDRESS__
+  GTEST_SKIP() << "the sanitizer needs a descriptor itself to look at an object";
+#endif
+  service_ = std::make_unique<Program>(
+      Arguments{"/bin/sh", "-c", "ulimit -n 12; exec " ORVA_NOTIFY_PROGRAM " serve"});
+  ASSERT_EQ(service_->ReadLine(), "listening on " + ORVA_NOTIFICATION_SOCKET);
+  {
+    const std::array<Listener, 12> clients;
+    EXPECT_THAT(service_->ReadLineWith("cannot take"),
+                HasSubstr("cannot take another connection until one ends"));
+  }
+  EXPECT_EQ(RunNotify({"send", "end", "/shares/A"}).line, "sent to 0 clients");
+}
+
+TEST_F(OrvaNotify, AnnouncesMountsAndUnmountsBelowShares) {
+  Serve({"--watch"});
+  Listener client;
+  {
+    const Volume volume("/shares/My Photos");
+    EXPECT_EQ(client.ReadMessage(), Compose(Event::Plugged, "/shares/My Photos"));
+    EXPECT_EQ(service_->ReadLineWith("seen"), "plugged seen: /shares/My Photos");
+    const Volume inner("/shares/My Photos/inner");
+  }
+  EXPECT_EQ(client.ReadMessage(), Compose(Event::Unplugged, "/shares/My Photos"));
+  EXPECT_EQ(service_->ReadLineWith("seen"), "unplugged seen: /shares/My Photos");
+}
+
+TEST_F(OrvaNotify, TellsANewClientOfThePresentVolumesFirst) {
+  const Volume b("/shares/B");
+  Serve({"--watch"});
+  const Volume a("/shares/A");
+  Listener client;
+  EXPECT_EQ(RunNotify({"send", "scanned", "/shares/A"}).line, "sent to 1 client");
+  std::vector<std::string> messages{client.ReadMessage(), client.ReadMessage()};
+  std::sort(messages.begin(), messages.end());
+  EXPECT_THAT(messages, ElementsAre(Compose(Event::Plugged, "/shares/A"),
+                                    Compose(Event::Plugged, "/shares/B")));
+  EXPECT_EQ(client.ReadMessage(), Compose(Event::Scanned, "/shares/A"));
+}
+
+TEST_F(OrvaNotify, AnnouncesAMountInPlaceOfAnother) {
+  const Volume lower("/shares/A");
+  Serve({"--watch"});
+  Listener client;
+  EXPECT_EQ(client.ReadMessage(), Compose(Event::Plugged, "/shares/A"));
+  const Volume upper("/shares/A");
+  EXPECT_EQ(client.ReadMessage(), Compose(Event::Unplugged, "/shares/A"));
+  EXPECT_EQ(client.ReadMessage(), Compose(Event::Plugged, "/shares/A"));
+}
+
+TEST_F(OrvaNotify, SaysNothingOfMountsUnlessItWatches) {
+  const Volume before("/shares/A");
+  Serve();
+  Listener client;
+  const Volume after("/shares/B");
+  EXPECT_EQ(RunNotify({"send", "end", "/shares/C"}).line, "sent to 1 client");
+  EXPECT_EQ(client.ReadMessage(), Compose(Event::End, "/shares/C"));
+}
+
+} // namespace
