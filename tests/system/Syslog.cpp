@@ -11,11 +11,21 @@
 #include <array>
 #include <cstring>
 #include <regex>
+#include <stdexcept>
 #include <system_error>
 
 namespace orva::test {
 
 namespace {
+
+const std::string MARK = "mark"; ///< no message of syslog: it has no priority
+
+sockaddr_un Address() {
+  sockaddr_un address{};
+  address.sun_family = AF_UNIX;
+  std::strcpy(address.sun_path, "/dev/log");
+  return address;
+}
 
 /// "<142>Nov 21 02:33:26 ident: text"
 LogLine Parse(const std::string& datagram) {
@@ -44,9 +54,7 @@ LogLine Plain(const std::string& text) {
 }
 
 Syslog::Syslog() : socket_(socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0)) {
-  sockaddr_un address{};
-  address.sun_family = AF_UNIX;
-  std::strcpy(address.sun_path, "/dev/log");
+  const sockaddr_un address = Address();
   if (socket_ == -1 ||
       bind(socket_, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
     throw std::system_error(errno, std::generic_category(), "/dev/log");
@@ -62,8 +70,21 @@ Syslog::~Syslog() {
 }
 
 std::vector<LogLine> Syslog::Lines() const {
-  const std::lock_guard lock(mutex_);
+  const std::unique_lock lock = LockBehindAllSent();
   return lines_;
+}
+
+// A socket keeps the order of what is sent to it: when our mark has come, all before it has.
+std::unique_lock<std::mutex> Syslog::LockBehindAllSent() const {
+  const sockaddr_un address = Address();
+  sendto(socket_, MARK.data(), MARK.size(), MSG_NOSIGNAL,
+         reinterpret_cast<const sockaddr*>(&address), sizeof address);
+  ++marksSent_;
+  std::unique_lock lock(mutex_);
+  if (!arrived_.wait_for(lock, DEADLINE, [this] { return marksSeen_ == marksSent_; })) {
+    throw std::runtime_error("the system log does not collect");
+  }
+  return lock;
 }
 
 bool Syslog::Await(const Condition& condition) const {
@@ -88,8 +109,13 @@ void Syslog::Collect() {
       return;
     }
     {
+      const std::string text(datagram.data(), static_cast<std::size_t>(size));
       const std::lock_guard lock(mutex_);
-      lines_.push_back(Parse(std::string(datagram.data(), static_cast<std::size_t>(size))));
+      if (text == MARK) {
+        ++marksSeen_;
+      } else {
+        lines_.push_back(Parse(text));
+      }
     }
     arrived_.notify_all();
   }

@@ -40,7 +40,7 @@ public:
 
   using Condition = std::function<bool(const std::vector<LogLine>&)>;
 
-  /// All messages so far.
+  /// All messages that were sent before this call.
   std::vector<LogLine> Lines() const;
 
   /// Waits until `condition` holds for all messages so far; false after the deadline.
@@ -51,11 +51,14 @@ public:
 
 private:
   void Collect();
+  std::unique_lock<std::mutex> LockBehindAllSent() const;
 
   int socket_; ///< owned
   mutable std::mutex mutex_;
   mutable std::condition_variable arrived_;
   std::vector<LogLine> lines_; ///< guarded by mutex_
+  int marksSeen_ = 0;          ///< guarded by mutex_
+  mutable int marksSent_ = 0;  ///< the caller's thread only
   std::jthread collector_;
 };
 

@@ -2,11 +2,13 @@
 #include "Expectations.h"
 #include "Messages.h"
 
-#include <cstdlib>
+#include <filesystem>
+#include <fstream>
 
 namespace orva::test {
 namespace {
 
+namespace fs = std::filesystem;
 using ::testing::ElementsAre;
 using ::testing::HasSubstr;
 using ::testing::IsEmpty;
@@ -181,20 +183,28 @@ TEST_F(Intake, AFormatInAMountPointIsOnlyText) {
 }
 
 TEST_F(Intake, AHandlerThatFailsEndsOnlyItsMessage) {
-  // A directory that is none makes the location unusable, by an exception of its own kind.
-  ASSERT_EQ(0, system("rm -r /shares/.zophotos && touch /shares/.zophotos"));
-  Log log = appliance.Handle(End("/shares"));
-  EXPECT_EQ(Error("").priority, log.back().priority);
-  EXPECT_THAT(log.back().text, StartsWith("MessageProcessor:: "));
+  const auto fails = [this] { return appliance.Handle(End("/shares")).back(); };
+  const LogLine unusable = Error("MessageProcessor:: Invalid DB location : '/shares/.zophotos'");
+  const fs::path directory = "/shares/.zophotos";
+  fs::remove_all(directory);
+  std::ofstream(directory) << "no directory";
+  EXPECT_EQ(unusable, fails());
   ExpectGood();
 
-  // A broken database throws a text.
-  ASSERT_EQ(0, system("rm /shares/.zophotos && mkdir /shares/.zophotos && "
-                      "head -c 4096 /dev/zero | tr '\\0' x > /shares/.zophotos/zophotos.db"));
-  log = appliance.Handle(End("/shares"));
-  EXPECT_EQ(Error("").priority, log.back().priority);
-  EXPECT_THAT(log.back().text, StartsWith("MessageProcessor:: "));
-  EXPECT_THAT(log.back().text, HasSubstr("not a database"));
+  fs::remove(directory);
+  fs::create_directory("/tmp/elsewhere");
+  fs::create_directory_symlink("/tmp/elsewhere", directory);
+  EXPECT_EQ(unusable, fails());
+  ExpectGood();
+
+  // The database layer throws a text.
+  fs::remove(directory);
+  fs::create_directory(directory);
+  std::ofstream(directory / "zophotos.db") << std::string(4096, 'x');
+  const LogLine broken = fails();
+  EXPECT_EQ(unusable.priority, broken.priority);
+  EXPECT_THAT(broken.text, StartsWith("MessageProcessor:: "));
+  EXPECT_THAT(broken.text, HasSubstr("not a database"));
   ExpectGood();
 }
 
