@@ -1,0 +1,542 @@
+#include "DaemonLayerTest.h"
+
+#include "DBMerger.h"
+#include "Deadline.h"
+#include "PhotoDB.h"
+#include "TestCatalog.h"
+#include "VolumeInfoManager.h"
+
+#include <fstream>
+#include <stdexcept>
+#include <thread>
+
+namespace orva::test {
+namespace {
+
+using dbmerger::DBMerger;
+using dbmerger::PhotoDB;
+using dbmerger::VolumeInfo;
+using dbmerger::VolumeInfoManager;
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
+
+const std::string MASTER = "/shares/Master/";
+const std::string VOLUME = "/shares/Vol/";
+
+/// An expression whose evaluation fails.
+const std::string FAULT = "abs(-9223372036854775807 - 1)";
+
+class DBMergerTest : public DaemonLayerTest {
+protected:
+  DBMergerTest() {
+    MakeDirectory(MASTER);
+    std::filesystem::current_path(MakeDirectory("/tmp/work"));
+  }
+
+  ~DBMergerTest() override {
+    merger.stopRequested = true;
+    merger.Wait();
+  }
+
+  /// Merges the volume. Returns the standard output.
+  std::string Merge() {
+    return OutputOf([&] { merger.MergeDB(MASTER, VOLUME); });
+  }
+
+  std::string ReMerge() {
+    return OutputOf([&] { merger.ReMergeDB(MASTER, VOLUME); });
+  }
+
+  /// Two folders with three photos.
+  void AddPhotos() {
+    catalog.AddFolder(1, "a/", 11);
+    catalog.AddFolder(2, "a/b/", 12);
+    catalog.AddPhoto(1, "top.jpg", 21, 100);
+    catalog.AddPhoto(2, "a/one.jpg", 22, 300);
+    catalog.AddPhoto(3, "a/b/two.jpg", 23, 200);
+  }
+
+  /// The one line of a merge that was given up, without its beginning.
+  std::string FailureOfTheMerge() {
+    const std::string beginning = "Error that we will ignore ";
+    Log lines = Logged();
+    std::erase_if(lines, [](const LogLine& line) { return line.priority == Info("").priority; });
+    if (lines.size() != 1 || lines[0].priority != Error("").priority ||
+        !lines[0].text.starts_with(beginning) || !lines[0].text.ends_with('\n')) {
+      throw std::logic_error("not the one line of a failed merge: " +
+                             ::testing::PrintToString(lines));
+    }
+    return lines[0].text.substr(beginning.size());
+  }
+
+  TestCatalog catalog{VOLUME};
+  DBMerger merger;
+};
+
+std::string Processing(const std::string& path, bool isDeleted = false, int status = 3) {
+  return "Processing file " + path + " isdeleted=" + (isDeleted ? "1" : "0") +
+         " status = " + std::to_string(status) + "\n";
+}
+
+std::string Adding(const std::string& path) {
+  return Processing(path) + "Adding file " + path + " for mount " + VOLUME + "\n";
+}
+
+// The thread.
+
+TEST_F(DaemonLayerTest, MergerLogsTheRegisteredMountPoints) {
+  for (const char* const mountPoint : {"/shares/b/", "/shares/a/", "/shares/c/"}) {
+    VolumeInfo volume{.mountPoint = MakeDirectory(mountPoint)};
+    VolumeInfoManager::Instance().addVolumeInfo(volume);
+  }
+  DBMerger merger;
+  EXPECT_FALSE(merger.stopRequested);
+  merger.Wait();
+  EXPECT_THAT(LoggedByAllThreads(), ElementsAre(Info("Iterating over mount point /shares/b/\n"),
+                                                Info("Iterating over mount point /shares/a/\n"),
+                                                Info("Iterating over mount point /shares/c/\n")));
+}
+
+TEST_F(DaemonLayerTest, MergerWithoutVolumesEndsSilentlyAndMakesTheRegistry) {
+  DBMerger merger;
+  EXPECT_NE(nullptr, VolumeInfoManager::instance);
+  merger.Wait();
+  EXPECT_THAT(LoggedByAllThreads(), IsEmpty());
+}
+
+TEST_F(DaemonLayerTest, MergerHasItsCopyOfTheRegistryWhenItIsMade) {
+  VolumeInfo volume{.mountPoint = MakeDirectory("/shares/a/")};
+  VolumeInfoManager::Instance().addVolumeInfo(volume);
+  DBMerger merger;
+  VolumeInfoManager::Instance().removeVolumeInfo(volume);
+  merger.Wait();
+  EXPECT_THAT(LoggedByAllThreads(), ElementsAre(Info("Iterating over mount point /shares/a/\n")));
+}
+
+// Merges.
+
+TEST_F(DBMergerTest, FirstMergeBringsEverything) {
+  AddPhotos();
+  EXPECT_EQ(Adding("/shares/Vol/a/b/two.jpg") + Adding("/shares/Vol/a/one.jpg") +
+                Adding("/shares/Vol/top.jpg"),
+            Merge());
+  EXPECT_EQ(MergeLines(VOLUME, 3, 3), Logged());
+  EXPECT_THAT(MergedRows(MASTER, "SELECT * FROM Folders"),
+              ElementsAre("1|-1|/shares/|0|<DUMMY>", "2|1|/shares/Vol/|0|/shares/Vol/",
+                          "3|2|/shares/Vol/a/|11|/shares/Vol/",
+                          "4|3|/shares/Vol/a/b/|12|/shares/Vol/"));
+  EXPECT_THAT(MergedRows(MASTER, "SELECT * FROM Files"),
+              ElementsAre("1|4|two.jpg|23|/shares/Vol/|23", "2|3|one.jpg|22|/shares/Vol/|22",
+                          "3|2|top.jpg|21|/shares/Vol/|21"));
+  EXPECT_THAT(MergedStatistics(MASTER), ElementsAre("/shares/Vol/|3|3|300"));
+}
+
+TEST_F(DBMergerTest, TranscodingAtTheEpochIsNotNew) {
+  catalog.AddPhoto(1, "a.jpg", 0, 0);
+  EXPECT_EQ("", Merge());
+  EXPECT_THAT(MergedStatistics(MASTER), ElementsAre("/shares/Vol/|1|1|0"));
+}
+
+TEST_F(DBMergerTest, LaterMergeReadsOnlyWhatChangedSince) {
+  AddPhotos();
+  Merge();
+  Logged();
+  catalog.AddPhoto(4, "a/new.jpg", 24, 301);
+  catalog.AddPhoto(5, "a/same second.jpg", 25, 300);
+  EXPECT_EQ(Adding("/shares/Vol/a/new.jpg"), Merge());
+  EXPECT_EQ(MergeLines(VOLUME, 3, 1), Logged());
+  EXPECT_THAT(MergedFiles(MASTER), ElementsAre("/shares/Vol/a/b/two.jpg", "/shares/Vol/a/new.jpg",
+                                               "/shares/Vol/a/one.jpg", "/shares/Vol/top.jpg"));
+  EXPECT_THAT(MergedStatistics(MASTER), ElementsAre("/shares/Vol/|5|5|301"));
+}
+
+TEST_F(DBMergerTest, UnchangedMergeRefreshesTheCountsOnly) {
+  AddPhotos();
+  Merge();
+  Logged();
+  catalog.Add(FileRow{.id = 9, .path = "unfinished.jpg", .status = 1});
+  catalog.AddFolder(3, "new/");
+  EXPECT_EQ("", Merge());
+  EXPECT_EQ(MergeLines(VOLUME, 4, 0), Logged());
+  EXPECT_THAT(MergedStatistics(MASTER), ElementsAre("/shares/Vol/|3|4|300"));
+  EXPECT_THAT(MergedRows(MASTER, "SELECT count(*) FROM Folders WHERE name LIKE '%/new/'"),
+              ElementsAre("1"));
+}
+
+TEST_F(DBMergerTest, DeletedFileIsRemovedAndMovesTheTime) {
+  AddPhotos();
+  Merge();
+  catalog.DeletePhoto(2, 400);
+  const std::string path = "/shares/Vol/a/one.jpg";
+  EXPECT_EQ(Processing(path, true) + "Removing file " + path + " for mount /shares/Vol/\n" +
+                "Deleting " + path + "\nFound parent folder 3 for " + path + "\n",
+            Merge());
+  EXPECT_THAT(MergedFiles(MASTER), ElementsAre("/shares/Vol/a/b/two.jpg", "/shares/Vol/top.jpg"));
+  EXPECT_THAT(MergedStatistics(MASTER), ElementsAre("/shares/Vol/|2|2|400"));
+}
+
+TEST_F(DBMergerTest, DeletedFileThatWasNeverMergedMovesTheTimeAsWell) {
+  AddPhotos();
+  catalog.DeletePhoto(2, 400);
+  Merge();
+  EXPECT_THAT(MergedFiles(MASTER), ElementsAre("/shares/Vol/a/b/two.jpg", "/shares/Vol/top.jpg"));
+  EXPECT_THAT(MergedStatistics(MASTER), ElementsAre("/shares/Vol/|2|2|400"));
+}
+
+TEST_F(DBMergerTest, DeletedFolderGoesWithItsFiles) {
+  AddPhotos();
+  Merge();
+  catalog.Rows().Run("UPDATE Folders SET isDeleted = 1 WHERE path = 'a/b/'");
+  EXPECT_EQ("Deleting /shares/Vol/a/b/\nFound folder 4 for /shares/Vol/a/b/\n", Merge());
+  EXPECT_THAT(MergedFolders(MASTER),
+              ElementsAre("/shares/Vol/|/shares/Vol/", "/shares/Vol/a/|/shares/Vol/"));
+  EXPECT_THAT(MergedFiles(MASTER), ElementsAre("/shares/Vol/a/one.jpg", "/shares/Vol/top.jpg"));
+}
+
+TEST_F(DBMergerTest, SystemFilesAreSkippedAndReadAgain) {
+  catalog.Add(FileRow{.id = 1, .path = "system.jpg", .name = "system.jpg", .isSystem = true});
+  catalog.Add(TranscodingRow{.sourceId = 1, .lastUpdatedDate = 500});
+  const std::string line = Processing("/shares/Vol/system.jpg");
+  EXPECT_EQ(line, Merge());
+  EXPECT_THAT(MergedFiles(MASTER), IsEmpty());
+  EXPECT_THAT(MergedStatistics(MASTER), ElementsAre("/shares/Vol/|0|0|0"));
+  EXPECT_EQ(line, Merge());
+  EXPECT_EQ(Joined(MergeLines(VOLUME, 1, 1), MergeLines(VOLUME, 1, 1)), Logged());
+}
+
+TEST_F(DBMergerTest, HiddenAndBackupFilesAreMerged) {
+  catalog.Add(FileRow{.id = 1, .path = "backup.jpg", .name = "backup.jpg", .isBackup = true});
+  catalog.Add(FileRow{.id = 2, .path = "hidden.jpg", .name = "hidden.jpg", .isHidden = true});
+  catalog.Add(TranscodingRow{.sourceId = 1, .lastUpdatedDate = 10});
+  catalog.Add(TranscodingRow{.sourceId = 2, .lastUpdatedDate = 20});
+  Merge();
+  EXPECT_THAT(MergedFiles(MASTER), ElementsAre("/shares/Vol/backup.jpg", "/shares/Vol/hidden.jpg"));
+  EXPECT_THAT(MergedStatistics(MASTER), ElementsAre("/shares/Vol/|0|0|20"));
+}
+
+TEST_F(DBMergerTest, FilesOfInvisibleFoldersAreLeftOutButMoveTheTime) {
+  catalog.Add(FolderRow{.id = 1, .path = "hidden/", .name = "hidden", .isHidden = true});
+  catalog.AddPhoto(1, "hidden/a.jpg", 0, 10);
+  EXPECT_EQ(Adding("/shares/Vol/hidden/a.jpg"), Merge());
+  EXPECT_THAT(MergedFiles(MASTER), IsEmpty());
+  EXPECT_THAT(MergedStatistics(MASTER), ElementsAre("/shares/Vol/|1|1|10"));
+}
+
+TEST_F(DBMergerTest, FileWithTwoTranscodingsIsAddedOnce) {
+  catalog.AddPhoto(1, "a.jpg", 0, 10);
+  catalog.Add(TranscodingRow{.sourceId = 1, .lastUpdatedDate = 30});
+  EXPECT_EQ(Adding("/shares/Vol/a.jpg") + Adding("/shares/Vol/a.jpg"), Merge());
+  EXPECT_THAT(MergedFiles(MASTER), ElementsAre("/shares/Vol/a.jpg"));
+  EXPECT_THAT(MergedStatistics(MASTER), ElementsAre("/shares/Vol/|1|1|30"));
+}
+
+TEST_F(DBMergerTest, TimeNeverMovesBackwards) {
+  catalog.Rows().Run("INSERT INTO Files VALUES(1, -1, 'a.jpg', 'a.jpg', 3, 0, 0, 0, 0, 0, 3, 0, "
+                     "'jpg', 1)");
+  // Read as 32 bits, this is long before the epoch.
+  catalog.Add(TranscodingRow{.sourceId = 1, .lastUpdatedDate = 2147483648});
+  Merge();
+  EXPECT_THAT(MergedFiles(MASTER), ElementsAre("/shares/Vol/a.jpg"));
+  EXPECT_THAT(MergedStatistics(MASTER), ElementsAre("/shares/Vol/|1|1|0"));
+}
+
+TEST_F(DBMergerTest, MergeLeavesTheTimeOfTheStatusAsItWas) {
+  AddPhotos();
+  Merge();
+  MergedRows(MASTER, "UPDATE Status SET mdate = 4242, desc = 'text'");
+  catalog.AddPhoto(9, "new.jpg", 0, 900);
+  Merge();
+  EXPECT_THAT(MergedRows(MASTER, "SELECT * FROM Status"), ElementsAre("1|2.0|4242|text|0"));
+}
+
+TEST_F(DBMergerTest, VolumesAreMergedSideBySide) {
+  AddPhotos();
+  Merge();
+  TestCatalog other("/shares/Other/");
+  other.AddPhoto(1, "x.jpg", 0, 50);
+  OutputOf([&] { merger.MergeDB(MASTER, "/shares/Other/"); });
+  EXPECT_THAT(MergedFiles(MASTER), ElementsAre("/shares/Other/x.jpg", "/shares/Vol/a/b/two.jpg",
+                                               "/shares/Vol/a/one.jpg", "/shares/Vol/top.jpg"));
+  EXPECT_THAT(MergedStatistics(MASTER),
+              ElementsAre("/shares/Other/|1|1|50", "/shares/Vol/|3|3|300"));
+}
+
+TEST_F(DBMergerTest, CatalogIsLeftAsItIs) {
+  AddPhotos();
+  const auto before = catalog.Rows().Run("PRAGMA data_version");
+  Merge();
+  EXPECT_EQ(before, catalog.Rows().Run("PRAGMA data_version"));
+  EXPECT_FALSE(std::filesystem::exists("/shares/Vol/.zophotos"));
+}
+
+TEST_F(DBMergerTest, StoppedMergeCommitsTheCountsAndAnUnchangedTime) {
+  AddPhotos();
+  merger.stopRequested = true;
+  EXPECT_EQ("", Merge());
+  EXPECT_EQ(MergeLines(VOLUME, 3, 3), Logged());
+  EXPECT_THAT(MergedFolders(MASTER), IsEmpty());
+  EXPECT_THAT(MergedFiles(MASTER), IsEmpty());
+  EXPECT_THAT(MergedStatistics(MASTER), ElementsAre("/shares/Vol/|3|3|0"));
+  EXPECT_TRUE(merger.stopRequested) << "it is never cleared";
+}
+
+// Volumes anew and away.
+
+TEST_F(DBMergerTest, ReMergeStartsFromTheBeginning) {
+  AddPhotos();
+  Merge();
+  Logged();
+  catalog.Rows().Run("DELETE FROM Files WHERE id = 2");
+  catalog.Rows().Run("DELETE FROM Folders WHERE path = 'a/b/'");
+  EXPECT_EQ(Adding("/shares/Vol/a/b/two.jpg") + Adding("/shares/Vol/top.jpg"), ReMerge());
+  EXPECT_EQ(MergeLines(VOLUME, 2, 2), Logged());
+  EXPECT_THAT(MergedFolders(MASTER),
+              ElementsAre("/shares/Vol/|/shares/Vol/", "/shares/Vol/a/|/shares/Vol/"));
+  EXPECT_THAT(MergedFiles(MASTER), ElementsAre("/shares/Vol/top.jpg"));
+  EXPECT_THAT(MergedStatistics(MASTER), ElementsAre("/shares/Vol/|2|2|200"));
+}
+
+TEST_F(DBMergerTest, ReMergeOfAVolumeThatWasNeverMergedMergesIt) {
+  AddPhotos();
+  ReMerge();
+  EXPECT_THAT(MergedStatistics(MASTER), ElementsAre("/shares/Vol/|3|3|300"));
+  EXPECT_EQ(3U, MergedFiles(MASTER).size());
+}
+
+TEST_F(DBMergerTest, FailedReMergeLeavesTheVolumeEmptyAndItsTimeZero) {
+  AddPhotos();
+  Merge();
+  Logged();
+  catalog.Rows().Run("DROP TABLE Transcodings");
+  EXPECT_EQ("", ReMerge());
+  EXPECT_THAT(FailureOfTheMerge(), ::testing::HasSubstr("no such table: Transcodings"));
+  EXPECT_THAT(MergedFiles(MASTER), IsEmpty());
+  EXPECT_THAT(MergedStatistics(MASTER), ElementsAre("/shares/Vol/|3|3|0"));
+}
+
+TEST_F(DBMergerTest, FailedDeletionOfAReMergePasses) {
+  AddPhotos();
+  Merge();
+  MergedRows(MASTER, "DROP TABLE Statistics");
+  EXPECT_THROW(ReMerge(), std::string);
+}
+
+TEST_F(DBMergerTest, RemovedVolumeLeavesItsCounts) {
+  AddPhotos();
+  Merge();
+  Logged();
+  EXPECT_EQ("", OutputOf([&] { merger.RemoveVolume(MASTER, VOLUME); }));
+  EXPECT_THAT(MergedFolders(MASTER), IsEmpty());
+  EXPECT_THAT(MergedFiles(MASTER), IsEmpty());
+  EXPECT_THAT(MergedStatistics(MASTER), ElementsAre("/shares/Vol/|3|3|0"));
+  EXPECT_THAT(Logged(), IsEmpty());
+}
+
+TEST_F(DBMergerTest, RemovalFromTheEmptyVolumeTouchesNoVolume) {
+  AddPhotos();
+  Merge();
+  Logged();
+  const Lines before = MergedContent(MASTER);
+  merger.RemoveVolume("DUMMY_MOUNT_POINT", VOLUME);
+  EXPECT_EQ(before, MergedContent(MASTER));
+  EXPECT_TRUE(std::filesystem::exists("/tmp/work/.zophotos/zophotos.db"));
+  EXPECT_THAT(Logged(), IsEmpty());
+}
+
+TEST_F(DBMergerTest, FailedRemovalPasses) {
+  PhotoDB(MASTER).Init();
+  MergedRows(MASTER, "DROP TABLE Files");
+  EXPECT_THROW(merger.RemoveVolume(MASTER, VOLUME), std::string);
+}
+
+// Failures.
+
+/// A merge that the merged database refuses in the middle, in each of SQLite's ways.
+class RefusedMergeTest : public DBMergerTest, public ::testing::WithParamInterface<const char*> {};
+
+TEST_P(RefusedMergeTest, LeavesEverythingAsBefore) {
+  AddPhotos();
+  Merge();
+  Logged();
+  MergedRows(MASTER, std::string("CREATE TRIGGER refuse BEFORE INSERT ON Files WHEN NEW.name = "
+                                 "'m.jpg' BEGIN SELECT RAISE(") +
+                         GetParam() + ", 'refused by the test'); END");
+  const Lines before = MergedContent(MASTER);
+  catalog.AddFolder(3, "c/");
+  catalog.AddPhoto(4, "c/a.jpg", 0, 400);
+  catalog.AddPhoto(5, "c/m.jpg", 0, 401);
+  catalog.AddPhoto(6, "c/z.jpg", 0, 402);
+
+  EXPECT_EQ(Adding("/shares/Vol/c/a.jpg") + Adding("/shares/Vol/c/m.jpg"), Merge());
+
+  EXPECT_THAT(FailureOfTheMerge(),
+              ::testing::AllOf(::testing::StartsWith("src/zophotodbmerger/PhotoDB.cpp:"),
+                               ::testing::HasSubstr("refused by the test"),
+                               ::testing::HasSubstr("INSERT INTO Files")));
+  EXPECT_EQ(before, MergedContent(MASTER));
+
+  MergedRows(MASTER, "DROP TRIGGER refuse");
+  Merge();
+  EXPECT_EQ(6U, MergedFiles(MASTER).size());
+  EXPECT_THAT(MergedStatistics(MASTER), ElementsAre("/shares/Vol/|6|6|402"));
+}
+
+INSTANTIATE_TEST_SUITE_P(Ways, RefusedMergeTest, ::testing::Values("ABORT", "FAIL", "ROLLBACK"),
+                         [](const auto& way) { return std::string(way.param); });
+
+TEST_F(DBMergerTest, FailedStatisticsFailTheMerge) {
+  AddPhotos();
+  Merge();
+  Logged();
+  MergedRows(MASTER, "CREATE TRIGGER refuse BEFORE UPDATE ON Statistics BEGIN SELECT RAISE(ABORT, "
+                     "'refused by the test'); END");
+  const Lines before = MergedContent(MASTER);
+  catalog.AddPhoto(4, "new.jpg", 0, 400);
+  Merge();
+  Log errors = Logged();
+  std::erase_if(errors, [](const LogLine& line) { return line.priority == Info("").priority; });
+  ASSERT_EQ(2U, errors.size());
+  EXPECT_EQ(Error("Could not update stats for /shares/Vol/. Return code 19"), errors[0]);
+  EXPECT_THAT(errors[1].text, ::testing::StartsWith("Error that we will ignore "));
+  EXPECT_EQ(before, MergedContent(MASTER));
+}
+
+TEST_F(DBMergerTest, StatisticsThatCannotBeMadeFailTheMerge) {
+  AddPhotos();
+  PhotoDB(MASTER).Init();
+  MergedRows(MASTER, "CREATE TRIGGER forget AFTER INSERT ON Statistics BEGIN DELETE FROM "
+                     "Statistics; END");
+  const Lines before = MergedContent(MASTER);
+  EXPECT_EQ("", Merge());
+  EXPECT_NE("", FailureOfTheMerge());
+  EXPECT_EQ(before, MergedContent(MASTER));
+}
+
+TEST_F(DBMergerTest, VolumeWithoutACatalogFailsTheMergeBeforeItBegins) {
+  MakeDirectory("/shares/Other");
+  merger.MergeDB(MASTER, "/shares/Other/");
+  EXPECT_NE("", FailureOfTheMerge());
+  merger.MergeDB(MASTER, "/shares/Gone/");
+  EXPECT_NE("", FailureOfTheMerge());
+  EXPECT_FALSE(std::filesystem::exists(MASTER + ".zophotos"));
+}
+
+TEST_F(DBMergerTest, FaultInTheMiddleOfTheFoldersFailsTheMerge) {
+  AddPhotos();
+  catalog.Rows().Run("ALTER TABLE Folders RENAME TO Stored");
+  catalog.Rows().Run("CREATE VIEW Folders AS SELECT id, folderId, path, name, category, "
+                     "lastModifiedDate, isBackup, isHidden, isSystem, isDeleted, CASE id WHEN 2 "
+                     "THEN " +
+                     FAULT + " ELSE status END, lastUpdatedDate FROM Stored");
+  PhotoDB(MASTER).Init();
+  const Lines before = MergedContent(MASTER);
+  EXPECT_EQ("", Merge());
+  EXPECT_THAT(FailureOfTheMerge(), ::testing::HasSubstr("SELECT * FROM Folders"));
+  EXPECT_EQ(before, MergedContent(MASTER));
+}
+
+TEST_F(DBMergerTest, FaultInTheMiddleOfTheFilesFailsTheMerge) {
+  AddPhotos();
+  catalog.Rows().Run("ALTER TABLE Files RENAME TO Stored");
+  catalog.Rows().Run("CREATE VIEW Files AS SELECT id, folderId, path, name, category, "
+                     "lastModifiedDate, isBackup, isHidden, isSystem, isDeleted, status, "
+                     "lastUpdatedDate, ext, CASE id WHEN 2 THEN " +
+                     FAULT + " ELSE size END AS size FROM Stored");
+  PhotoDB(MASTER).Init();
+  const Lines before = MergedContent(MASTER);
+  EXPECT_EQ("", Merge());
+  EXPECT_THAT(FailureOfTheMerge(), ::testing::HasSubstr("from Files f, Transcodings t"));
+  EXPECT_EQ(before, MergedContent(MASTER));
+}
+
+TEST_F(DBMergerTest, FaultInTheCountsFailsTheMerge) {
+  AddPhotos();
+  catalog.Add(FileRow{.id = 9, .path = "without a transcoding"});
+  catalog.Rows().Run("ALTER TABLE Files RENAME TO Stored");
+  catalog.Rows().Run("CREATE VIEW Files AS SELECT id, folderId, path, name, category, "
+                     "lastModifiedDate, isBackup, isHidden, isSystem, isDeleted, CASE id WHEN 9 "
+                     "THEN " +
+                     FAULT + " ELSE status END AS status, lastUpdatedDate, ext, size FROM Stored");
+  PhotoDB(MASTER).Init();
+  const Lines before = MergedContent(MASTER);
+  EXPECT_EQ("", Merge());
+  EXPECT_THAT(FailureOfTheMerge(), ::testing::HasSubstr("SELECT count(*) FROM Files"));
+  EXPECT_EQ(before, MergedContent(MASTER));
+}
+
+TEST_F(DBMergerTest, CatalogThatStaysLockedFailsTheMerge) {
+  AddPhotos();
+  Merge();
+  Logged();
+  const Lines before = MergedContent(MASTER);
+  catalog.Rows().Run("BEGIN EXCLUSIVE");
+  EXPECT_EQ("", Merge());
+  catalog.Rows().Run("COMMIT");
+  EXPECT_THAT(FailureOfTheMerge(), ::testing::HasSubstr("database is locked"));
+  EXPECT_EQ(before, MergedContent(MASTER));
+}
+
+/// True when somebody is changing the merged database.
+bool IsBeingMerged(const Database& merged) {
+  try {
+    merged.Run("BEGIN IMMEDIATE");
+  } catch (const std::runtime_error&) {
+    return true;
+  }
+  merged.Run("COMMIT");
+  return false;
+}
+
+TEST_F(DBMergerTest, CatalogThatIsJustWrittenIsWaitedFor) {
+  AddPhotos();
+  PhotoDB(MASTER).Init();
+  catalog.Rows().Run("BEGIN EXCLUSIVE");
+  catalog.AddPhoto(4, "just.jpg", 0, 400);
+  std::thread indexer([this] {
+    const Database merged(MergedDatabasePath(MASTER));
+    merged.Run("PRAGMA busy_timeout = 0");
+    const auto deadline = std::chrono::steady_clock::now() + DEADLINE;
+    while (!IsBeingMerged(merged) && std::chrono::steady_clock::now() < deadline) {
+      std::this_thread::yield();
+    }
+    catalog.Rows().Run("COMMIT");
+  });
+  Merge();
+  indexer.join();
+  EXPECT_EQ(MergeLines(VOLUME, 3, 4), Logged());
+  EXPECT_EQ(4U, MergedFiles(MASTER).size());
+}
+
+TEST_F(DBMergerTest, ReaderOfTheMergedDatabaseIsNoObstacleToTheNextMerge) {
+  AddPhotos();
+  Merge();
+  Logged();
+  const Database reader(MergedDatabasePath(MASTER));
+  EXPECT_THAT(reader.Run("SELECT count(*) FROM Files"), ElementsAre("3"));
+  catalog.AddPhoto(4, "new.jpg", 0, 400);
+  Merge();
+  EXPECT_EQ(MergeLines(VOLUME, 3, 1), Logged());
+  EXPECT_THAT(reader.Run("SELECT count(*) FROM Files"), ElementsAre("4"));
+}
+
+TEST_F(DBMergerTest, UnusableMasterPasses) {
+  AddPhotos();
+  std::ofstream(MASTER + ".zophotos") << "in the way";
+  EXPECT_EQ("Invalid DB location : '/shares/Master/.zophotos'",
+            ThrownBy<PhotoDB::Error>([&] { Merge(); }).Message());
+  EXPECT_THROW(ReMerge(), PhotoDB::Error);
+  EXPECT_THROW(merger.RemoveVolume(MASTER, VOLUME), PhotoDB::Error);
+  EXPECT_THAT(Logged(), IsEmpty());
+}
+
+TEST_F(DBMergerTest, MergesGoOnAfterAFailure) {
+  AddPhotos();
+  std::ofstream(MASTER + ".zophotos") << "in the way";
+  EXPECT_THROW(Merge(), PhotoDB::Error);
+  std::filesystem::remove(MASTER + ".zophotos");
+  Merge();
+  EXPECT_EQ(3U, MergedFiles(MASTER).size());
+}
+
+} // namespace
+} // namespace orva::test

@@ -1,0 +1,418 @@
+#include "StatesTest.h"
+
+#include "Messages.h"
+#include "NotificationListener.h"
+#include "NotificationService.h"
+#include "PhotoDB.h"
+#include "TestCatalog.h"
+#include "Volume.h"
+
+#include "orvautil/ClientSocket.h"
+#include "orvautil/Core.h"
+#include "orvautil/Exception.h"
+#include "orvautil/FormatString.h"
+
+#include <xercesc/dom/DOMDocument.hpp>
+#include <xercesc/dom/DOMElement.hpp>
+#include <xercesc/framework/MemBufInputSource.hpp>
+#include <xercesc/parsers/XercesDOMParser.hpp>
+#include <xercesc/util/PlatformUtils.hpp>
+
+#include <fstream>
+#include <stdexcept>
+
+namespace orva::test {
+namespace {
+
+using dbmerger::NotificationListener;
+using dbmerger::State;
+using dbmerger::VolumeInfo;
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
+using ::testing::StartsWith;
+
+class XMLPlatform {
+public:
+  XMLPlatform() { xercesc::XMLPlatformUtils::Initialize(); }
+  XMLPlatform(const XMLPlatform&) = delete;
+  XMLPlatform& operator=(const XMLPlatform&) = delete;
+  ~XMLPlatform() { xercesc::XMLPlatformUtils::Terminate(); }
+};
+
+/// A state that tells what it is handed.
+class RecordingState final : public State {
+public:
+  void handleVolumePlugged(VolumeInfo volume) override { Note("plugged", std::move(volume)); }
+  void handleVolumeUnplugged(VolumeInfo volume) override { Note("unplugged", std::move(volume)); }
+  void handleVolumeScanned(VolumeInfo volume) override { Note("scanned", std::move(volume)); }
+  void handlePictureTranscoded(VolumeInfo volume) override {
+    Note("transcoded", std::move(volume));
+  }
+  void handleVolumePurged(VolumeInfo volume) override { Note("purged", std::move(volume)); }
+  int getStateType() override { return -1; }
+
+  Lines events; ///< "event mount point"
+  std::vector<VolumeInfo> volumes;
+
+private:
+  void Note(const std::string& event, VolumeInfo volume) {
+    events.push_back(event + " " + volume.mountPoint);
+    volumes.push_back(std::move(volume));
+  }
+};
+
+/// A listener that is handed parsed documents, before a state that records the events. The shares
+/// root is not registered.
+class NotificationTest : public StatesTest {
+protected:
+  NotificationTest() {
+    auto recording = std::make_unique<RecordingState>();
+    state = recording.get();
+    machine.setCurrentState(recording.release());
+    ForgetSharesRoot();
+    MakeDirectory("/shares/Vol");
+  }
+
+  /// Parses a message and hands its root element to the listener.
+  void Notify(const std::string& message) const {
+    const XMLPlatform platform;
+    xercesc::XercesDOMParser parser;
+    parser.parse(xercesc::MemBufInputSource(reinterpret_cast<const XMLByte*>(message.data()),
+                                            message.size(), "message"));
+    util::ClientSocket unused(util::Socket::Address("@nobody"), false);
+    listener.HandleMessage(unused, nullptr, 0, *parser.getDocument()->getDocumentElement());
+  }
+
+  void NotifyBatch(const std::string& children) const {
+    Notify(Notification("TranscodedBatch", "/shares/Vol", children));
+  }
+
+  Lines Registered() const {
+    Lines mountPoints;
+    for (const VolumeInfo& volume : Registry().getVolumes()) {
+      mountPoints.push_back(volume.mountPoint);
+    }
+    return mountPoints;
+  }
+
+  RecordingState* state;
+  NotificationListener listener;
+};
+
+const LogLine BATCH = Info(":: Transcodedbatch ");
+const LogLine ACCEPTED = Info("Profile ==> cb62bbdd389b48898f2e5244977cb2c5 ==> \n");
+
+TEST(NotificationListener, MessageThatMentionsTheRootElementIsValid) {
+  const NotificationListener listener;
+  EXPECT_TRUE(listener.IsValidMessage("ORVANotification"));
+  EXPECT_TRUE(listener.IsValidMessage("<a b=\"xORVANotificationx\"/>"));
+  EXPECT_FALSE(listener.IsValidMessage(""));
+  EXPECT_FALSE(listener.IsValidMessage("<orvanotification/>"));
+  EXPECT_FALSE(listener.IsValidMessage("<ORVANotificatio n/>"));
+}
+
+TEST(NotificationListener, DelimiterIsFourZeroBytes) {
+  const auto [bytes, count] = NotificationListener().GetDelimiter();
+  EXPECT_EQ(std::string(4, '\0'), std::string(bytes, bytes + count));
+}
+
+TEST_F(NotificationTest, OtherRootElementIsRefused) {
+  Notify("<Status about=\"ORVANotification\" Name=\"Plugged\" MountPoint=\"/shares/Vol\"/>");
+  EXPECT_THAT(Logged(), ElementsAre(Error("ERROR ! Node name = Status")));
+  EXPECT_THAT(state->events, IsEmpty());
+  EXPECT_THAT(Registered(), IsEmpty());
+}
+
+TEST_F(NotificationTest, RootElementIsComparedWhole) {
+  Notify("<ORVANotifications Name=\"Scanned\" MountPoint=\"/shares/Vol\"/>");
+  Notify("<x:ORVANotification Name=\"Scanned\" MountPoint=\"/shares/Vol\"/>");
+  EXPECT_THAT(Logged(), ElementsAre(Error("ERROR ! Node name = ORVANotifications"),
+                                    Error("ERROR ! Node name = x:ORVANotification")));
+  EXPECT_THAT(state->events, IsEmpty());
+}
+
+// Plugged.
+
+TEST_F(NotificationTest, PluggedVolumeIsMeasured) {
+  const Volume volume("Tmp", "300m");
+  std::ofstream(volume.Path() + "/content") << std::string(1 << 20, 'x');
+  const std::time_t before = std::time(nullptr);
+  Notify(test::Plugged("/shares/Tmp"));
+  EXPECT_THAT(state->events, ElementsAre("plugged /shares/Tmp/"));
+  ASSERT_EQ(1U, Registry().getVolumes().size());
+  const VolumeInfo& registered = Registry().getVolumes()[0];
+  EXPECT_EQ("/shares/Tmp/", registered.mountPoint);
+  EXPECT_EQ(314572800.0, registered.capacity);
+  EXPECT_EQ(1048576.0, registered.used);
+  EXPECT_EQ(1, registered.photoDbSize);
+  EXPECT_GE(registered.timestamp, before);
+  EXPECT_FALSE(registered.readOnly);
+  EXPECT_EQ(registered.ToString(), state->volumes[0].ToString());
+  EXPECT_THAT(Logged(),
+              ElementsAre(Info("The volume is plugged and capacity is 314572800.000000 and "
+                               "capacity_used is 1048576.000000 for mountPoint /shares/Tmp/")));
+}
+
+TEST_F(NotificationTest, PluggedReadOnlyVolumeIsTakenAsWritable) {
+  Volume volume("Tmp", "300m");
+  volume.MakeReadOnly();
+  Notify(test::Plugged("/shares/Tmp"));
+  ASSERT_EQ(1U, Registry().getVolumes().size());
+  EXPECT_FALSE(Registry().getVolumes()[0].readOnly);
+}
+
+TEST_F(NotificationTest, PluggedVolumeThatIsNotThereIsAnEventAllTheSame) {
+  Notify(test::Plugged("/shares/Gone"));
+  EXPECT_THAT(state->events, ElementsAre("plugged /shares/Gone/"));
+  EXPECT_EQ(1.0, state->volumes[0].capacity);
+  EXPECT_EQ(1.0, state->volumes[0].used);
+  EXPECT_THAT(Registered(), IsEmpty());
+  EXPECT_THAT(Logged(), ElementsAre(Error(
+                            "There is no filesystem location for the mountpoint /shares/Gone/")));
+}
+
+// The other events.
+
+TEST_F(NotificationTest, UnpluggedVolumeIsForgottenSilently) {
+  Register("/shares/Vol/", LARGE);
+  ASSERT_TRUE(Registry().reelectMasterVolume());
+  Notify(test::Unplugged("/shares/Vol"));
+  EXPECT_THAT(state->events, ElementsAre("unplugged /shares/Vol/"));
+  EXPECT_THAT(Registered(), IsEmpty());
+  EXPECT_EQ("DUMMY_MOUNT_POINT", Master());
+  EXPECT_THAT(Logged(), IsEmpty());
+}
+
+TEST_F(NotificationTest, ScannedVolumeIsRegisteredUnmeasured) {
+  Notify(test::Scanned("/shares/Vol"));
+  EXPECT_THAT(state->events, ElementsAre("scanned /shares/Vol/"));
+  ASSERT_EQ(1U, Registry().getVolumes().size());
+  EXPECT_EQ(1.0, Registry().getVolumes()[0].capacity);
+  EXPECT_EQ(1.0, Registry().getVolumes()[0].used);
+  EXPECT_EQ(1, Registry().getVolumes()[0].photoDbSize);
+  EXPECT_THAT(Logged(), ElementsAre(Info(":: Scanned")));
+}
+
+TEST_F(NotificationTest, PurgedVolumeIsRegisteredUnmeasured) {
+  Notify(test::Purged("/shares/Vol"));
+  EXPECT_THAT(state->events, ElementsAre("purged /shares/Vol/"));
+  ASSERT_EQ(1U, Registry().getVolumes().size());
+  EXPECT_EQ(1.0, Registry().getVolumes()[0].capacity);
+  EXPECT_THAT(Logged(), ElementsAre(Info(":: Purged ")));
+}
+
+TEST_F(NotificationTest, FirstEventFixesTheCapacity) {
+  const Volume volume("Tmp", "300m");
+  Notify(test::Scanned("/shares/Tmp"));
+  Notify(test::Plugged("/shares/Tmp"));
+  ASSERT_EQ(1U, Registry().getVolumes().size());
+  EXPECT_EQ(1.0, Registry().getVolumes()[0].capacity);
+  EXPECT_EQ(314572800.0, state->volumes[1].capacity) << "the state gets the event's own record";
+}
+
+TEST_F(NotificationTest, EndIsATranscodedBatchOfAnyProfile) {
+  Notify(End("/shares/Vol"));
+  Notify(Notification("End", "/shares/Vol", ProfileElement("other")));
+  EXPECT_THAT(state->events, ElementsAre("transcoded /shares/Vol/", "transcoded /shares/Vol/"));
+  EXPECT_THAT(Registered(), ElementsAre("/shares/Vol/"));
+  EXPECT_THAT(Logged(), ElementsAre(Info(":: End "), Info(":: End ")));
+}
+
+TEST_F(NotificationTest, UnknownNamesAreIgnoredSilently) {
+  for (const char* const name : {"plugged", "Plug", "PluggedX", "END", "Transcodedbatch", ""}) {
+    Notify(Notification(name, "/shares/Vol", ProfileElement(PROFILE)));
+  }
+  Notify("<ORVANotification MountPoint=\"/shares/Vol\"/>");
+  EXPECT_THAT(state->events, IsEmpty());
+  EXPECT_THAT(Registered(), IsEmpty());
+  EXPECT_THAT(Logged(), IsEmpty());
+}
+
+// Profiles.
+
+TEST_F(NotificationTest, BatchOfTheAcceptedProfileIsHandled) {
+  NotifyBatch(ProfileElement(PROFILE));
+  EXPECT_THAT(state->events, ElementsAre("transcoded /shares/Vol/"));
+  EXPECT_THAT(Registered(), ElementsAre("/shares/Vol/"));
+  EXPECT_THAT(Logged(), ElementsAre(BATCH, ACCEPTED));
+}
+
+TEST_F(NotificationTest, ProfileIsFoundAmongOtherChildren) {
+  NotifyBatch("\n  <!-- c --><count>3</count>\n  <profile>cb62bbdd389b4889<![CDATA["
+              "8f2e5244977cb2c5]]></profile>\n  <Profile>other</Profile>text");
+  EXPECT_THAT(state->events, ElementsAre("transcoded /shares/Vol/"));
+}
+
+TEST_F(NotificationTest, LastProfileDecides) {
+  NotifyBatch(ProfileElement("other") + ProfileElement(PROFILE));
+  EXPECT_THAT(Logged(), ElementsAre(BATCH, ACCEPTED));
+  EXPECT_THAT(state->events, ElementsAre("transcoded /shares/Vol/"));
+  NotifyBatch(ProfileElement(PROFILE) + ProfileElement("other"));
+  NotifyBatch(ProfileElement(PROFILE) + "<profile/>");
+  EXPECT_EQ(1U, state->events.size());
+  EXPECT_THAT(Logged(), ElementsAre(BATCH, BATCH));
+}
+
+TEST_F(NotificationTest, BatchesOfOtherProfilesAreIgnored) {
+  const Lines batches{"",
+                      "<count>1</count>",
+                      "<profile/>",
+                      ProfileElement("other"),
+                      ProfileElement("CB62BBDD389B48898F2E5244977CB2C5"),
+                      ProfileElement(PROFILE + " "),
+                      "<Profile>" + PROFILE + "</Profile>",
+                      "<batch>" + ProfileElement(PROFILE) + "</batch>"};
+  for (const std::string& children : batches) {
+    NotifyBatch(children);
+    EXPECT_THAT(Logged(), ElementsAre(BATCH)) << children;
+  }
+  EXPECT_THAT(state->events, IsEmpty());
+  EXPECT_THAT(Registered(), IsEmpty());
+}
+
+// Mount points.
+
+TEST_F(NotificationTest, TrailingSeparatorMakesNoDifference) {
+  Notify(test::Scanned("/shares/Vol"));
+  Notify(test::Scanned("/shares/Vol/"));
+  EXPECT_THAT(state->events, ElementsAre("scanned /shares/Vol/", "scanned /shares/Vol/"));
+  EXPECT_THAT(Registered(), ElementsAre("/shares/Vol/"));
+}
+
+TEST_F(NotificationTest, DoubledSeparatorIsAnotherVolume) {
+  Notify(test::Scanned("/shares/Vol/"));
+  Notify(test::Scanned("/shares/Vol//"));
+  EXPECT_THAT(Registered(), ElementsAre("/shares/Vol/", "/shares/Vol//"));
+}
+
+TEST_F(NotificationTest, MountPointIsPercentDecoded) {
+  MakeDirectory("/shares/Mine & \xC3\xA4+");
+  Notify(test::Scanned("/shares/Mine%20%26%20%C3%a4+"));
+  EXPECT_THAT(state->events, ElementsAre("scanned /shares/Mine & \xC3\xA4+/"));
+  EXPECT_THAT(Registered(), ElementsAre("/shares/Mine & \xC3\xA4+/"));
+}
+
+TEST_F(NotificationTest, EncodedSeparatorAtTheEndIsOne) {
+  Notify(test::Scanned("/shares/Vol%2F"));
+  EXPECT_THAT(state->events, ElementsAre("scanned /shares/Vol/"));
+}
+
+TEST_F(NotificationTest, MalformedEscapesStayAsTheyStand) {
+  Notify(test::Unplugged("/shares/100%"));
+  Notify(test::Unplugged("/shares/%zz%4"));
+  Notify(test::Unplugged("/shares/a%00b"));
+  EXPECT_THAT(state->events, ElementsAre("unplugged /shares/100%/", "unplugged /shares/%zz%4/",
+                                         "unplugged /shares/a%00b/"));
+}
+
+TEST_F(NotificationTest, CharactersOutsideAsciiComeAsUtf8) {
+  MakeDirectory("/shares/\xC3\xA4");
+  Notify(test::Scanned("/shares/&#228;"));
+  EXPECT_THAT(Registered(), ElementsAre("/shares/\xC3\xA4/"));
+}
+
+TEST_F(NotificationTest, OnlyTheMountPointIsDecoded) {
+  Notify(Notification("%53canned", "/shares/Vol"));
+  EXPECT_THAT(state->events, IsEmpty());
+}
+
+TEST_F(NotificationTest, EmptyMountPointIsOutOfRange) {
+  for (const char* const name : {"Plugged", "Unplugged", "unknown"}) {
+    EXPECT_THROW(Notify(Notification(name, "")), std::out_of_range) << name;
+  }
+  EXPECT_THROW(Notify("<ORVANotification Name=\"Plugged\"/>"), std::out_of_range);
+  EXPECT_THAT(state->events, IsEmpty());
+  EXPECT_THAT(Registered(), IsEmpty());
+  EXPECT_THAT(Logged(), IsEmpty());
+}
+
+// The machine.
+
+TEST_F(DaemonLayerTest, NotificationMakesTheMachineWhenThereIsNone) {
+  const XMLPlatform platform;
+  MakeDirectory("/shares/Vol");
+  xercesc::XercesDOMParser parser;
+  const std::string message = test::Unplugged("/shares/Vol");
+  parser.parse(xercesc::MemBufInputSource(reinterpret_cast<const XMLByte*>(message.data()),
+                                          message.size(), "message"));
+  util::ClientSocket unused(util::Socket::Address("@nobody"), false);
+  NotificationListener().HandleMessage(unused, nullptr, 0,
+                                       *parser.getDocument()->getDocumentElement());
+  EXPECT_NE(nullptr, dbmerger::StateMachine::instance);
+  EXPECT_EQ(SHARES_LOCATOR, Locator());
+  EXPECT_THAT(Logged(), ElementsAre(Info("Default:: Volumeunplugged, ignoring! ")));
+}
+
+// The thread.
+
+const LogLine CREATING = Plain("src/zophotodbmerger/NotificationListener:130: Creating the "
+                               "notification socket " +
+                               core::ORVA_NOTIFICATION_SOCKET);
+const LogLine READING = Plain("src/zophotodbmerger/NotificationListener:137: Calling "
+                              "ReadMessage()");
+const LogLine CANNOT_OPEN = Error("Unable to open socket (" + core::ORVA_NOTIFICATION_SOCKET + ")");
+const LogLine EXITING =
+    Info("src/zophotodbmerger/NotificationListener:154: NotificationListener exiting.");
+
+TEST_F(DaemonLayerTest, ListenerEndsWhenThereIsNoService) {
+  NotificationListener listener;
+  listener.Create(8, 0, false);
+  listener.Wait();
+  EXPECT_THAT(Logged(), ElementsAre(CREATING, CANNOT_OPEN, EXITING));
+}
+
+TEST_F(NotificationTest, ListenerHandlesMessagesInOrderAndReconnects) {
+  NotificationService service;
+  listener.Create(8, 0, false);
+  service.SendBytes(test::Scanned("/shares/Vol") + std::string(4, '\0') +
+                    test::Purged("/shares/Vol") + std::string(4, '\0') + "<noise/>" +
+                    std::string(4, '\0'));
+  service.CloseClient();
+  service.Send("<Other about=\"ORVANotification\"/>");
+  service.Send(End("/shares/Vol"));
+  service.CloseClient();
+  service.AwaitClient();
+  service.Stop();
+  listener.Wait();
+  EXPECT_THAT(state->events, ElementsAre("scanned /shares/Vol/", "purged /shares/Vol/",
+                                         "transcoded /shares/Vol/"));
+  EXPECT_THAT(Logged(),
+              ElementsAre(CREATING, READING, Info(":: Scanned"), Info(":: Purged "), CREATING,
+                          READING, Error("ERROR ! Node name = Other"), Info(":: End "), CREATING,
+                          READING, CREATING, CANNOT_OPEN, EXITING));
+}
+
+TEST_F(NotificationTest, MessageThatFailsEndsAloneWithItsLine) {
+  NotificationService service;
+  listener.Create(8, 0, false);
+  service.Send(Notification("Plugged", ""));
+  service.Send(test::Scanned("/shares/Vol"));
+  service.CloseClient();
+  service.Stop();
+  listener.Wait();
+  EXPECT_THAT(state->events, ElementsAre("scanned /shares/Vol/"));
+  const Log lines = Logged();
+  ASSERT_GE(lines.size(), 4U);
+  EXPECT_EQ(Error("").priority, lines[2].priority);
+  EXPECT_THAT(lines[2].text, StartsWith("MessageProcessor:: basic_string::at"));
+  EXPECT_EQ(Info(":: Scanned"), lines[3]);
+}
+
+TEST_F(StatesTest, UnusableMasterIsTheTextOfTheMessagesFailure) {
+  MakeDirectory("/shares/Vol");
+  std::filesystem::remove_all("/shares/.zophotos");
+  std::ofstream("/shares/.zophotos") << "in the way";
+  NotificationService service;
+  NotificationListener listener;
+  listener.Create(8, 0, false);
+  service.Send(test::Scanned("/shares/Vol"));
+  service.CloseClient();
+  service.Stop();
+  listener.Wait();
+  EXPECT_THAT(Logged(), ::testing::Contains(
+                            Error("MessageProcessor:: Invalid DB location : '/shares/.zophotos'")));
+  EXPECT_EQ(State::DEFAULT, CurrentType());
+}
+
+} // namespace
+} // namespace orva::test
