@@ -11,6 +11,7 @@
 #include <cerrno>
 #include <cstdio>
 #include <string_view>
+#include <utility>
 
 namespace orva::db {
 
@@ -59,15 +60,16 @@ void DB::Open(const std::string& path) {
 }
 
 void DB::Open(const std::string& path, Access access, int busyTimeout, bool immutable) {
+  std::string opened = path; // Close clears the path, which may be the one we are handed
   Close();
-  RefuseSpecialFile(path);
+  RefuseSpecialFile(opened);
   const int mode = access == Access::ReadWrite ? SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE
                                                : SQLITE_OPEN_READONLY;
   const int flags = mode | SQLITE_OPEN_NOFOLLOW | SQLITE_OPEN_PRIVATECACHE | SQLITE_OPEN_NOMUTEX |
                     (immutable ? SQLITE_OPEN_URI : 0);
-  const std::string& name = immutable ? ImmutableUri(path) : path;
+  const std::string& name = immutable ? ImmutableUri(opened) : opened;
   const int code = sqlite3_open_v2(name.c_str(), &handle_, flags, nullptr);
-  path_ = path;
+  path_ = std::move(opened);
   if (code != SQLITE_OK) {
     std::string message =
         ErrorMessage(handle_, ("open '" + path_ + "'").c_str(), __FILE__, __LINE__);
