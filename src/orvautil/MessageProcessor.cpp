@@ -174,6 +174,8 @@ std::string MessageProcessor::DescribeException(const std::exception_ptr& except
     return XMLCh2string(known.getMessage());
   } catch (const xercesc::DOMException& known) {
     return XMLCh2string(known.getMessage());
+  } catch (const xercesc::SAXException& known) {
+    return XMLCh2string(known.getMessage());
   } catch (...) {
     return "unknown exception";
   }

@@ -11,7 +11,7 @@ XERCES_CPP_NAMESPACE_END
 namespace orva::util {
 
 /// The parser's UTF-16 text as UTF-8; null gives the empty string. Throws
-/// xercesc::TranscodingException for a lone surrogate.
+/// xercesc::TranscodingException for text that ends inside a surrogate pair.
 std::string XMLCh2string(const XMLCh* text);
 
 /// Value of the attribute `name`; empty when it is absent or there are no attributes.

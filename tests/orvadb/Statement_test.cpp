@@ -1,0 +1,355 @@
+#include "Raw.h"
+
+#include "orvadb/Connection.h"
+#include "orvadb/Statement.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <cstdint>
+#include <filesystem>
+#include <limits>
+#include <string>
+#include <vector>
+
+namespace orva::db {
+namespace {
+
+namespace fs = std::filesystem;
+using test::Query;
+using test::Raw;
+
+using test::TestDB;
+using test::Thrown;
+using test::Try;
+using testing::ElementsAre;
+using testing::IsEmpty;
+using testing::SizeIs;
+
+/// A database with a table of one column.
+class StatementTest : public testing::Test {
+protected:
+  StatementTest() {
+    fs::remove_all("/tmp/statement");
+    fs::create_directory("/tmp/statement");
+    db.Open(path);
+    db.Rows("CREATE TABLE t(a)");
+  }
+
+  Statement Make(const char* sql) const { return {db, sql, __FILE__, __LINE__}; }
+
+  void Execute(const char* sql) const { Make(sql).Execute(__FILE__, __LINE__); }
+
+  /// Runs of each compiled statement of the connection.
+  std::vector<int> Runs() const {
+    std::vector<int> runs;
+    for (sqlite3_stmt* const each : db.Compiled()) {
+      runs.push_back(sqlite3_stmt_status(each, SQLITE_STMTSTATUS_RUN, 0));
+    }
+    return runs;
+  }
+
+  const std::string path = "/tmp/statement/test.db";
+  TestDB db;
+};
+
+TEST_F(StatementTest, StepGivesRowsAndThenDone) {
+  db.Rows("INSERT INTO t VALUES(1), (2)");
+  Statement select = Make("SELECT a FROM t ORDER BY a");
+  EXPECT_EQ(select.Step(__FILE__, __LINE__), 100);
+  EXPECT_EQ(select.GetInt(0), 1);
+  EXPECT_EQ(select.Step(__FILE__, __LINE__), 100);
+  EXPECT_EQ(select.GetInt(0), 2);
+  EXPECT_EQ(select.Step(__FILE__, __LINE__), 101);
+}
+
+TEST_F(StatementTest, StepReturnsTheCodeOfAFailureAndThrowsNothing) {
+  db.Rows("CREATE UNIQUE INDEX i ON t(a); INSERT INTO t VALUES(1)");
+  EXPECT_EQ(Make("INSERT INTO t VALUES(1)").Step(__FILE__, __LINE__), SQLITE_CONSTRAINT);
+}
+
+TEST_F(StatementTest, FetchTellsWhetherARowIsReady) {
+  db.Rows("INSERT INTO t VALUES(1)");
+  Statement select = Make("SELECT a FROM t");
+  EXPECT_TRUE(select.Fetch(__FILE__, __LINE__));
+  EXPECT_FALSE(select.Fetch(__FILE__, __LINE__));
+}
+
+TEST_F(StatementTest, ExecuteRunsToCompletion) {
+  db.Rows("CREATE TABLE u(a); INSERT INTO t VALUES(1), (2), (3)");
+  Execute("INSERT INTO u SELECT a FROM t RETURNING a");
+  EXPECT_THAT(Query(Raw(path), "SELECT a FROM u"), ElementsAre("1", "2", "3"));
+}
+
+// Errors.
+
+TEST_F(StatementTest, AnErrorCarriesPlaceMessageExtendedCodeAndSql) {
+  db.Rows("CREATE UNIQUE INDEX i ON t(a); INSERT INTO t VALUES(1)");
+  Statement insert(db, "INSERT INTO t VALUES(1)", "Prepared.cpp", 1);
+  const std::string expected = "Caller.cpp:34: UNIQUE constraint failed: t.a (extended code 2067) "
+                               "in \"INSERT INTO t VALUES(1)\"";
+  EXPECT_EQ(Thrown([&] { insert.Execute("Caller.cpp", 34); }), expected);
+  Statement again(db, "INSERT INTO t VALUES(1)", "Prepared.cpp", 2);
+  EXPECT_EQ(Thrown([&] { again.Fetch("Caller.cpp", 34); }), expected);
+}
+
+TEST_F(StatementTest, SqlThatCannotBePreparedIsThrown) {
+  EXPECT_EQ(Thrown([&] { Statement(db, "SELECT nonsense FROM t", "Caller.cpp", 5); }),
+            "Caller.cpp:5: no such column: nonsense (extended code 1) in "
+            "\"SELECT nonsense FROM t\"");
+  EXPECT_THROW(Make("SELEKT"), std::string);
+  EXPECT_THROW(Make("SELECT * FROM absent"), std::string);
+  EXPECT_THAT(db.Compiled(), IsEmpty());
+}
+
+TEST_F(StatementTest, BindingAParameterThatIsNotThereIsThrown) {
+  Statement select = Make("SELECT ?");
+  const std::string expected =
+      "Caller.cpp:9: column index out of range (extended code 25) in \"SELECT ?\"";
+  EXPECT_EQ(Thrown([&] { select.BindInt(0, 1, "Caller.cpp", 9); }), expected);
+  EXPECT_EQ(Thrown([&] { select.BindInt64(2, 1, "Caller.cpp", 9); }), expected);
+  EXPECT_EQ(Thrown([&] { select.BindText(2, "x", "Caller.cpp", 9); }), expected);
+  EXPECT_EQ(Thrown([&] { select.BindTime(2, 1, "Caller.cpp", 9); }), expected);
+}
+
+TEST_F(StatementTest, AFailedExecuteLeavesTheTextUsable) {
+  db.Rows("CREATE UNIQUE INDEX i ON t(a); INSERT INTO t VALUES(1)");
+  EXPECT_THROW(Execute("INSERT INTO t VALUES(1)"), std::string);
+  db.Rows("DELETE FROM t");
+  EXPECT_NO_THROW(Execute("INSERT INTO t VALUES(1)"));
+}
+
+// Values.
+
+TEST_F(StatementTest, ParametersCountFromOneAndColumnsFromZero) {
+  Statement select = Make("SELECT ?, ?, ?, ?");
+  select.BindInt(1, -5, __FILE__, __LINE__);
+  select.BindInt64(2, 1LL << 40, __FILE__, __LINE__);
+  select.BindText(3, "text", __FILE__, __LINE__);
+  select.BindTime(4, 1L << 33, __FILE__, __LINE__);
+  ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
+  EXPECT_EQ(select.GetInt(0), -5);
+  EXPECT_EQ(select.GetInt64(1), 1LL << 40);
+  EXPECT_EQ(select.GetText(2), "text");
+  EXPECT_EQ(select.GetTime(3), 1L << 33);
+}
+
+TEST_F(StatementTest, TheLimitsOfIntegersPass) {
+  Statement select = Make("SELECT ?, ?, ?, ?");
+  select.BindInt(1, std::numeric_limits<int>::min(), __FILE__, __LINE__);
+  select.BindInt64(2, std::numeric_limits<long long>::min(), __FILE__, __LINE__);
+  select.BindInt64(3, std::numeric_limits<long long>::max(), __FILE__, __LINE__);
+  select.BindTime(4, -1, __FILE__, __LINE__);
+  ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
+  EXPECT_EQ(select.GetInt(0), std::numeric_limits<int>::min());
+  EXPECT_EQ(select.GetInt64(1), std::numeric_limits<long long>::min());
+  EXPECT_EQ(select.GetInt64(2), std::numeric_limits<long long>::max());
+  EXPECT_EQ(select.GetTime(3), -1);
+}
+
+TEST_F(StatementTest, GetIntGivesTheLow32BitsWithTheirSign) {
+  Statement select = Make("SELECT 4294967297, 2147483648, -4294967298, 4294967296");
+  ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
+  EXPECT_EQ(select.GetInt(0), 1);
+  EXPECT_EQ(select.GetInt(1), std::numeric_limits<int>::min());
+  EXPECT_EQ(select.GetInt(2), -2);
+  EXPECT_EQ(select.GetInt(3), 0);
+}
+
+TEST_F(StatementTest, GetBoolIsTrueForAnyNonZeroInteger) {
+  Statement select = Make("SELECT 0, 1, -1, 4294967296, NULL");
+  ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
+  EXPECT_FALSE(select.GetBool(0));
+  EXPECT_TRUE(select.GetBool(1));
+  EXPECT_TRUE(select.GetBool(2));
+  EXPECT_TRUE(select.GetBool(3));
+  EXPECT_FALSE(select.GetBool(4));
+}
+
+TEST_F(StatementTest, TimesAndIntegersAreStoredAsIntegersAndTextsAsTexts) {
+  Statement select = Make("SELECT typeof(?), typeof(?), typeof(?), typeof(?)");
+  select.BindInt(1, 1, __FILE__, __LINE__);
+  select.BindInt64(2, 1, __FILE__, __LINE__);
+  select.BindTime(3, 1, __FILE__, __LINE__);
+  select.BindText(4, "1", __FILE__, __LINE__);
+  ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
+  EXPECT_EQ(select.GetText(0), "integer");
+  EXPECT_EQ(select.GetText(1), "integer");
+  EXPECT_EQ(select.GetText(2), "integer");
+  EXPECT_EQ(select.GetText(3), "text");
+}
+
+TEST_F(StatementTest, TextsAreBoundWhole) {
+  const std::string zeros("a\0b\0", 4);
+  {
+    Statement insert = Make("INSERT INTO t VALUES(?)");
+    insert.BindText(1, zeros, __FILE__, __LINE__);
+    insert.Execute(__FILE__, __LINE__);
+  }
+  Statement select = Make("SELECT a, hex(a) FROM t");
+  ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
+  EXPECT_EQ(select.GetText(0), zeros);
+  EXPECT_EQ(select.GetText(1), "61006200");
+}
+
+TEST_F(StatementTest, BindTextCopiesTheText) {
+  Statement select = Make("SELECT ?");
+  std::string text(1000, 'x');
+  select.BindText(1, text, __FILE__, __LINE__);
+  text.assign(1000, 'y');
+  ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
+  EXPECT_EQ(select.GetText(0), std::string(1000, 'x'));
+}
+
+TEST_F(StatementTest, AnEmptyTextIsATextAndNullReadsAsEmpty) {
+  Statement select = Make("SELECT typeof(?), ?, NULL");
+  select.BindText(1, "", __FILE__, __LINE__);
+  select.BindText(2, "", __FILE__, __LINE__);
+  ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
+  EXPECT_EQ(select.GetText(0), "text");
+  EXPECT_EQ(select.GetText(1), "");
+  EXPECT_EQ(select.GetText(2), "");
+  EXPECT_EQ(select.GetInt(2), 0);
+  EXPECT_EQ(select.GetTime(2), 0);
+}
+
+TEST_F(StatementTest, BytesThatAreNoUtf8PassAsTheyAre) {
+  Statement select = Make("SELECT ?");
+  select.BindText(1, "\xff\xc3/\x80", __FILE__, __LINE__);
+  ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
+  EXPECT_EQ(select.GetText(0), "\xff\xc3/\x80");
+}
+
+TEST_F(StatementTest, NumbersReadAsTexts) {
+  Statement select = Make("SELECT 42");
+  ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
+  EXPECT_EQ(select.GetText(0), "42");
+}
+
+// Kept statements.
+
+TEST_F(StatementTest, TheSameTextIsCompiledOnce) {
+  for (int i = 0; i < 5; ++i) {
+    // Each time at another place.
+    const std::string sql = std::string("INSERT INTO t ") + "VALUES(1)";
+    Execute(sql.c_str());
+  }
+  EXPECT_THAT(Runs(), ElementsAre(5));
+  EXPECT_THAT(db.Rows("SELECT count(*) FROM t"), ElementsAre("5"));
+}
+
+TEST_F(StatementTest, ATextInUseIsCompiledAnew) {
+  db.Rows("INSERT INTO t VALUES(1), (2)");
+  {
+    Statement outer = Make("SELECT a FROM t ORDER BY a");
+    ASSERT_TRUE(outer.Fetch(__FILE__, __LINE__));
+    {
+      Statement inner = Make("SELECT a FROM t ORDER BY a");
+      ASSERT_TRUE(inner.Fetch(__FILE__, __LINE__));
+      EXPECT_THAT(db.Compiled(), SizeIs(2));
+      EXPECT_EQ(inner.GetInt(0), 1);
+      ASSERT_TRUE(outer.Fetch(__FILE__, __LINE__));
+      EXPECT_EQ(outer.GetInt(0), 2);
+      EXPECT_EQ(inner.GetInt(0), 1);
+    }
+    EXPECT_THAT(db.Compiled(), SizeIs(1));
+    EXPECT_FALSE(outer.Fetch(__FILE__, __LINE__));
+  }
+  EXPECT_THAT(db.Compiled(), SizeIs(1));
+  Execute("SELECT a FROM t ORDER BY a");
+  EXPECT_THAT(db.Compiled(), SizeIs(1));
+}
+
+TEST_F(StatementTest, TheOuterUseOfATextMayEndBeforeTheInner) {
+  auto outer = std::make_unique<Statement>(db, "SELECT 1", __FILE__, __LINE__);
+  auto inner = std::make_unique<Statement>(db, "SELECT 1", __FILE__, __LINE__);
+  outer.reset();
+  EXPECT_TRUE(inner->Fetch(__FILE__, __LINE__));
+  const Statement third = Make("SELECT 1");
+  EXPECT_THAT(db.Compiled(), SizeIs(2));
+  inner.reset();
+  EXPECT_THAT(db.Compiled(), SizeIs(1));
+}
+
+TEST_F(StatementTest, AUsedStatementKeepsNoBindings) {
+  {
+    Statement select = Make("SELECT typeof(?)");
+    select.BindText(1, "bound", __FILE__, __LINE__);
+    ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
+  }
+  Statement select = Make("SELECT typeof(?)");
+  ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
+  EXPECT_EQ(select.GetText(0), "null");
+  EXPECT_THAT(db.Compiled(), SizeIs(1));
+}
+
+TEST_F(StatementTest, AUsedStatementHoldsNoLock) {
+  db.Rows("INSERT INTO t VALUES(1), (2)");
+  const Raw other(path);
+  {
+    Statement select = Make("SELECT a FROM t");
+    ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
+    EXPECT_EQ(Try(other, "INSERT INTO t VALUES(3)"), SQLITE_BUSY) << "a reader keeps writers out";
+  }
+  EXPECT_EQ(Try(other, "INSERT INTO t VALUES(3)"), SQLITE_OK);
+}
+
+TEST_F(StatementTest, AUsedStatementStartsAgainFromTheBeginning) {
+  db.Rows("INSERT INTO t VALUES(1), (2)");
+  for (int i = 0; i < 2; ++i) {
+    Statement select = Make("SELECT a FROM t ORDER BY a");
+    ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
+    EXPECT_EQ(select.GetInt(0), 1);
+  }
+}
+
+TEST_F(StatementTest, KeptStatementsFollowTheSchema) {
+  Execute("SELECT * FROM t");
+  Execute("ALTER TABLE t ADD COLUMN b DEFAULT 7");
+  db.Rows("INSERT INTO t(a) VALUES(1)");
+  Statement select = Make("SELECT * FROM t");
+  ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
+  EXPECT_EQ(select.GetInt(1), 7);
+}
+
+TEST_F(StatementTest, KeptStatementsDoNotHinderDroppingTheirTable) {
+  Execute("SELECT * FROM t");
+  Execute("DROP TABLE t");
+  // Compiled again for the new schema, which has no such table: the step fails.
+  Statement select = Make("SELECT * FROM t");
+  EXPECT_EQ(select.Step(__FILE__, __LINE__), SQLITE_ERROR);
+}
+
+TEST_F(StatementTest, KeptStatementsDoNotHinderVacuum) {
+  db.Rows("INSERT INTO t VALUES(1), (2)");
+  {
+    Statement select = Make("SELECT a FROM t");
+    ASSERT_TRUE(select.Fetch(__FILE__, __LINE__)); // and left unfinished
+  }
+  Execute("INSERT INTO t VALUES(3)");
+  EXPECT_NO_THROW(Execute("VACUUM"));
+  EXPECT_NO_THROW(Execute("VACUUM"));
+  Execute("INSERT INTO t VALUES(3)");
+  EXPECT_THAT(db.Rows("SELECT count(*) FROM t"), ElementsAre("4"));
+}
+
+TEST_F(StatementTest, KeptStatementsFollowTheSchemaOfAnotherProgram) {
+  Execute("SELECT * FROM t");
+  Query(Raw(path), "DROP TABLE t; CREATE TABLE t(x, y); INSERT INTO t VALUES(8, 9)");
+  Statement select = Make("SELECT * FROM t");
+  ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
+  EXPECT_EQ(select.GetInt(1), 9);
+}
+
+TEST_F(StatementTest, ABoundedNumberOfStatementsIsKept) {
+  for (std::size_t i = 0; i < 3 * Connection::MAXIMUM_STATEMENTS; ++i) {
+    const std::string sql = "SELECT " + std::to_string(i);
+    Statement select = Make(sql.c_str());
+    ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
+    EXPECT_EQ(select.GetInt64(0), static_cast<long long>(i));
+  }
+  EXPECT_THAT(db.Compiled(), SizeIs(Connection::MAXIMUM_STATEMENTS));
+}
+
+} // namespace
+} // namespace orva::db

@@ -1,0 +1,285 @@
+#include "Raw.h"
+
+#include "orvadb/Statement.h"
+#include "orvadb/VolumeDB.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <sys/mount.h>
+#include <sys/stat.h>
+
+#include <cerrno>
+#include <filesystem>
+#include <fstream>
+#include <string>
+#include <system_error>
+#include <vector>
+
+namespace orva::db {
+namespace {
+
+namespace fs = std::filesystem;
+using test::Query;
+using test::Raw;
+
+using test::Thrown;
+using testing::AllOf;
+using testing::ElementsAre;
+using testing::HasSubstr;
+using testing::IsEmpty;
+
+/// A catalog whose connection a test may look at.
+class Catalog : public VolumeDB {
+public:
+  using VolumeDB::Handle;
+  using VolumeDB::VolumeDB;
+
+  std::vector<std::string> Rows(const char* sql) const {
+    std::vector<std::string> rows;
+    Statement select(*this, sql, __FILE__, __LINE__);
+    while (select.Fetch(__FILE__, __LINE__)) {
+      rows.push_back(select.GetText(0));
+    }
+    return rows;
+  }
+};
+
+/// A file system of its own below /shares, mounted for as long as the object lives.
+class Mount {
+public:
+  explicit Mount(const std::string& point) : point_(point) {
+    fs::create_directories(point_);
+    Check(mount("tmpfs", point_.c_str(), "tmpfs", 0, "size=4m"));
+    fs::create_directory(point_ + "/.orva");
+  }
+  Mount(const Mount&) = delete;
+  Mount& operator=(const Mount&) = delete;
+  ~Mount() { umount2(point_.c_str(), MNT_DETACH); }
+
+  void MakeReadOnly() const {
+    Check(mount(nullptr, point_.c_str(), nullptr, MS_REMOUNT | MS_RDONLY, nullptr));
+  }
+
+private:
+  static void Check(int result) {
+    if (result != 0) {
+      throw std::system_error(errno, std::generic_category(), "mount");
+    }
+  }
+
+  std::string point_;
+};
+
+/// Files in the folder of the catalog.
+std::vector<std::string> FilesIn(const std::string& folder) {
+  std::vector<std::string> names;
+  for (const auto& entry : fs::directory_iterator(folder)) {
+    names.push_back(entry.path().filename());
+  }
+  return names;
+}
+
+/// A volume with the product's folder and no catalog yet.
+class VolumeDBTest : public testing::Test {
+protected:
+  VolumeDBTest() {
+    fs::remove_all(volume);
+    fs::create_directories(home);
+  }
+
+  /// Writes a catalog that holds the text `kept`.
+  static void WriteCatalog(const std::string& path) {
+    Query(Raw(path), "CREATE TABLE t(a); INSERT INTO t VALUES('kept')");
+  }
+
+  const std::string volume = "/shares/Vol";
+  const std::string home = volume + "/.orva";
+  const std::string catalog = home + "/orva.db";
+};
+
+TEST_F(VolumeDBTest, FindsTheCatalogOfTheVolume) {
+  WriteCatalog(catalog);
+  const Catalog db(volume, false);
+  EXPECT_EQ(db.GetPath(), catalog);
+  EXPECT_THAT(db.Rows("SELECT a FROM t"), ElementsAre("kept"));
+}
+
+TEST_F(VolumeDBTest, ThePrefixIsTheMountPointAsItWasGiven) {
+  WriteCatalog(catalog);
+  EXPECT_EQ(Catalog("/shares/Vol", false).GetPrefix(), "/shares/Vol");
+  EXPECT_EQ(Catalog("/shares/Vol/", false).GetPrefix(), "/shares/Vol/");
+  const Catalog db("/shares//./Vol//", false);
+  EXPECT_EQ(db.GetPrefix(), "/shares//./Vol//");
+  EXPECT_EQ(static_cast<const DB&>(db).GetPrefix(), "/shares//./Vol//");
+  EXPECT_EQ(db.GetPath(), catalog);
+}
+
+TEST_F(VolumeDBTest, ForReadingItNeverCreates) {
+  EXPECT_THAT(Thrown([&] { Catalog(volume, false); }),
+              AllOf(HasSubstr("unable to open database file"), HasSubstr(catalog)));
+  EXPECT_TRUE(fs::is_empty(home));
+}
+
+TEST_F(VolumeDBTest, ForReadingItNeverWrites) {
+  WriteCatalog(catalog);
+  const Catalog db(volume, false);
+  EXPECT_THAT(Thrown([&] { db.Rows("DELETE FROM t"); }),
+              HasSubstr("attempt to write a readonly database"));
+  EXPECT_THAT(FilesIn(home), ElementsAre("orva.db"));
+}
+
+TEST_F(VolumeDBTest, ForWritingItCreatesTheFileButNotItsFolder) {
+  {
+    const Catalog db(volume, true);
+    db.Rows("CREATE TABLE t(a)");
+  }
+  EXPECT_THAT(Query(Raw(catalog), "SELECT name FROM sqlite_master"), ElementsAre("t"));
+  fs::remove_all(home);
+  EXPECT_THROW(Catalog(volume, true), std::string);
+  EXPECT_FALSE(fs::exists(home));
+}
+
+TEST_F(VolumeDBTest, ACatalogThatIsBeingWrittenIsWaitedFor) {
+  WriteCatalog(catalog);
+  EXPECT_THAT(Catalog(volume, false).Rows("PRAGMA busy_timeout"), ElementsAre("5000"));
+  EXPECT_THAT(Catalog(volume, true).Rows("PRAGMA busy_timeout"), ElementsAre("5000"));
+}
+
+TEST_F(VolumeDBTest, AVolumeThatIsNotThereIsAnError) {
+  EXPECT_THAT(Thrown([] { Catalog("/shares/None/", false); }), HasSubstr("'/shares/None/'"));
+  EXPECT_THROW(Catalog("/shares/None", true), std::string);
+  EXPECT_THROW(Catalog("", false), std::string);
+  EXPECT_THROW(Catalog("DUMMY_MOUNT_POINT", false), std::string);
+  EXPECT_FALSE(fs::exists("/shares/None"));
+}
+
+TEST_F(VolumeDBTest, AMountPointMayBeALink) {
+  WriteCatalog(catalog);
+  fs::remove("/shares/Link");
+  fs::create_symlink("Vol", "/shares/Link");
+  const Catalog db("/shares/Link/", false);
+  EXPECT_THAT(db.Rows("SELECT a FROM t"), ElementsAre("kept"));
+  EXPECT_EQ(db.GetPrefix(), "/shares/Link/");
+}
+
+TEST_F(VolumeDBTest, BelowTheMountPointNoLinkIsFollowed) {
+  WriteCatalog("/tmp/elsewhere.db");
+  fs::create_symlink("/tmp/elsewhere.db", catalog);
+  EXPECT_THROW(Catalog(volume, false), std::string);
+  EXPECT_THROW(Catalog(volume, true), std::string);
+
+  fs::remove_all(home);
+  fs::create_directories("/tmp/elsewhere");
+  fs::copy("/tmp/elsewhere.db", "/tmp/elsewhere/orva.db", fs::copy_options::overwrite_existing);
+  fs::create_symlink("/tmp/elsewhere", home);
+  EXPECT_THROW(Catalog(volume, false), std::string);
+}
+
+TEST_F(VolumeDBTest, WhatIsNoRegularFileIsRefusedWithoutWaiting) {
+  ASSERT_EQ(mkfifo(catalog.c_str(), 0666), 0);
+  EXPECT_THROW(Catalog(volume, false), std::string);
+  EXPECT_THROW(Catalog(volume, true), std::string);
+  fs::remove(catalog);
+  fs::create_directory(catalog);
+  EXPECT_THROW(Catalog(volume, false), std::string);
+}
+
+TEST_F(VolumeDBTest, AnEmptyFileIsACatalogWithoutTables) {
+  std::ofstream{catalog};
+  const Catalog db(volume, false);
+  EXPECT_THAT(db.Rows("SELECT name FROM sqlite_master"), IsEmpty());
+  EXPECT_EQ(fs::file_size(catalog), 0U);
+}
+
+TEST_F(VolumeDBTest, ALogOfARunningWriterIsReadWithTheCatalog) {
+  WriteCatalog(catalog);
+  const Raw indexer(catalog);
+  Query(indexer, "PRAGMA journal_mode = WAL; INSERT INTO t VALUES('logged')");
+  EXPECT_THAT(Catalog(volume, false).Rows("SELECT a FROM t"), ElementsAre("kept", "logged"));
+  Query(indexer, "INSERT INTO t VALUES('later')");
+  EXPECT_THAT(Catalog(volume, false).Rows("SELECT a FROM t"),
+              ElementsAre("kept", "logged", "later"));
+}
+
+// Read-only file systems, by the name of the volume.
+
+class ReadOnlyVolumeTest : public testing::TestWithParam<std::string> {
+protected:
+  /// Writes a catalog that holds the text `kept`, with the journal `mode`.
+  void WriteCatalog(const std::string& mode) const {
+    const Raw indexer(catalog);
+    Query(indexer, "PRAGMA journal_mode = " + mode);
+    Query(indexer, "CREATE TABLE t(a); INSERT INTO t VALUES('kept')");
+  }
+
+  const std::string point = "/shares/" + GetParam();
+  const std::string home = point + "/.orva";
+  const std::string catalog = home + "/orva.db";
+  const Mount volume{point};
+};
+
+TEST_P(ReadOnlyVolumeTest, ACatalogWithARollbackJournalIsRead) {
+  WriteCatalog("DELETE");
+  volume.MakeReadOnly();
+  const Catalog db(point, false);
+  EXPECT_EQ(db.GetPath(), catalog);
+  EXPECT_THAT(db.Rows("SELECT a FROM t"), ElementsAre("kept"));
+}
+
+TEST_P(ReadOnlyVolumeTest, ACatalogWhoseLogIsAbsentIsRead) {
+  WriteCatalog("WAL");
+  ASSERT_THAT(FilesIn(home), ElementsAre("orva.db"));
+  volume.MakeReadOnly();
+  const Catalog db(point, false);
+  EXPECT_EQ(db.GetPath(), catalog);
+  EXPECT_EQ(db.GetPrefix(), point);
+  EXPECT_THAT(db.Rows("SELECT a FROM t"), ElementsAre("kept"));
+  EXPECT_THAT(db.Rows("PRAGMA busy_timeout"), ElementsAre("5000"));
+}
+
+TEST_P(ReadOnlyVolumeTest, ACatalogWhoseLogIsEmptyIsRead) {
+  WriteCatalog("WAL");
+  std::ofstream{catalog + "-wal"};
+  volume.MakeReadOnly();
+  EXPECT_THAT(Catalog(point, false).Rows("SELECT a FROM t"), ElementsAre("kept"));
+}
+
+TEST_P(ReadOnlyVolumeTest, ACatalogWithALogToReadIsAnError) {
+  {
+    const Raw indexer(catalog);
+    sqlite3_db_config(indexer, SQLITE_DBCONFIG_NO_CKPT_ON_CLOSE, 1, nullptr);
+    Query(indexer, "PRAGMA journal_mode = WAL; CREATE TABLE t(a); INSERT INTO t VALUES('kept')");
+  }
+  ASSERT_GT(fs::file_size(catalog + "-wal"), 0U);
+  volume.MakeReadOnly();
+  EXPECT_THAT(Thrown([&] { Catalog(point, false); }),
+              AllOf(HasSubstr(catalog), HasSubstr("write-ahead log")));
+}
+
+TEST_P(ReadOnlyVolumeTest, AnAbsentCatalogIsAnError) {
+  volume.MakeReadOnly();
+  EXPECT_THROW(Catalog(point, false), std::string);
+  EXPECT_THROW(Catalog(point, true), std::string);
+}
+
+TEST_P(ReadOnlyVolumeTest, AWritableVolumeOfThatNameIsReadAndWritten) {
+  WriteCatalog("WAL");
+  EXPECT_THAT(Catalog(point, false).Rows("SELECT a FROM t"), ElementsAre("kept"));
+  Catalog(point, true).Rows("INSERT INTO t VALUES('more')");
+  EXPECT_THAT(Catalog(point, false).Rows("SELECT a FROM t"), ElementsAre("kept", "more"));
+}
+
+std::string TestName(const testing::TestParamInfo<std::string>& info) {
+  static const std::vector<std::string> names = {"Plain",   "QuestionMark", "NumberSign",
+                                                 "Percent", "Ampersand",    "NonAscii"};
+  return names.at(info.index);
+}
+
+INSTANTIATE_TEST_SUITE_P(Volume, ReadOnlyVolumeTest,
+                         testing::Values("Plain", "Que?mode=rwc", "Ha#sh", "Per%41cent", "A b&c=d",
+                                         "Caf\xc3\xa9"),
+                         TestName);
+
+} // namespace
+} // namespace orva::db

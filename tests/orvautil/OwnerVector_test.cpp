@@ -1,0 +1,106 @@
+#include "Element.h"
+
+#include "orvautil/OwnerVector.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <memory>
+#include <stdexcept>
+#include <string>
+#include <type_traits>
+#include <utility>
+#include <vector>
+
+namespace orva::util {
+namespace {
+
+using test::Element;
+using test::Named;
+using test::Throwing;
+using testing::ElementsAre;
+using testing::IsEmpty;
+
+static_assert(!std::is_copy_constructible_v<OwnerVector<Element>>);
+static_assert(!std::is_copy_assignable_v<OwnerVector<Element>>);
+
+TEST(OwnerVector, DeletesItsElementsFirstToLastThroughTheirBase) {
+  std::vector<std::string> deleted;
+  {
+    OwnerVector<Element> owner;
+    owner.push_back(std::make_unique<Named>(deleted, "first"));
+    owner.push_back(std::make_unique<Named>(deleted, "second"));
+    owner.push_back(std::make_unique<Named>(deleted, "third"));
+    EXPECT_EQ(owner.size(), 3U);
+    EXPECT_THAT(deleted, IsEmpty());
+  }
+  EXPECT_THAT(deleted, ElementsAre("first", "second", "third"));
+}
+
+TEST(OwnerVector, NullElementsArePassedOver) {
+  std::vector<std::string> deleted;
+  {
+    OwnerVector<Element> owner;
+    owner.push_back(nullptr);
+    owner.push_back(std::make_unique<Named>(deleted, "only"));
+    owner.push_back(nullptr);
+    EXPECT_EQ(owner.size(), 3U);
+    EXPECT_EQ(owner.front(), nullptr);
+  }
+  EXPECT_THAT(deleted, ElementsAre("only"));
+}
+
+TEST(OwnerVector, AThrowingElementDoesNotKeepTheOthersAndTheFirstExceptionContinues) {
+  std::vector<std::string> deleted;
+  const auto useOwner = [&deleted] {
+    OwnerVector<Element> owner;
+    owner.push_back(std::make_unique<Named>(deleted, "a"));
+    owner.push_back(std::make_unique<Throwing>(deleted, "b"));
+    owner.push_back(std::make_unique<Throwing>(deleted, "c"));
+    owner.push_back(std::make_unique<Named>(deleted, "d"));
+  };
+  try {
+    useOwner();
+    FAIL() << "the exception was swallowed";
+  } catch (const std::runtime_error& exception) {
+    EXPECT_STREQ(exception.what(), "b");
+  }
+  EXPECT_THAT(deleted, ElementsAre("a", "b", "c", "d"));
+}
+
+TEST(OwnerVector, AnEmptyOneIsHarmless) {
+  const OwnerVector<Element> owner;
+  EXPECT_TRUE(owner.empty());
+  EXPECT_EQ(owner.begin(), owner.end());
+}
+
+TEST(OwnerVector, MovingHandsTheElementsOver) {
+  std::vector<std::string> deleted;
+  OwnerVector<Element> source;
+  source.push_back(std::make_unique<Named>(deleted, "only"));
+  Element* const element = source.front();
+  {
+    const OwnerVector<Element> target(std::move(source));
+    EXPECT_THAT(target.Elements(), ElementsAre(element));
+    EXPECT_TRUE(source.empty()); // NOLINT: what is left behind is the point
+    EXPECT_THAT(deleted, IsEmpty());
+  }
+  EXPECT_THAT(deleted, ElementsAre("only"));
+}
+
+TEST(OwnerVector, ElementsMayBeReorderedInPlace) {
+  std::vector<std::string> deleted;
+  {
+    OwnerVector<Named> owner;
+    owner.push_back(std::make_unique<Named>(deleted, "b"));
+    owner.push_back(std::make_unique<Named>(deleted, "c"));
+    owner.push_back(std::make_unique<Named>(deleted, "a"));
+    std::sort(owner.begin(), owner.end(),
+              [](const Named* left, const Named* right) { return left->name < right->name; });
+  }
+  EXPECT_THAT(deleted, ElementsAre("a", "b", "c"));
+}
+
+} // namespace
+} // namespace orva::util
