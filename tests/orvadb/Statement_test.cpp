@@ -341,15 +341,5 @@ TEST_F(StatementTest, KeptStatementsFollowTheSchemaOfAnotherProgram) {
   EXPECT_EQ(select.GetInt(1), 9);
 }
 
-TEST_F(StatementTest, ABoundedNumberOfStatementsIsKept) {
-  for (std::size_t i = 0; i < 3 * Connection::MAXIMUM_STATEMENTS; ++i) {
-    const std::string sql = "SELECT " + std::to_string(i);
-    Statement select = Make(sql.c_str());
-    ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
-    EXPECT_EQ(select.GetInt64(0), static_cast<long long>(i));
-  }
-  EXPECT_THAT(db.Compiled(), SizeIs(Connection::MAXIMUM_STATEMENTS));
-}
-
 } // namespace
 } // namespace orva::db
