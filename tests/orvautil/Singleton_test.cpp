@@ -12,7 +12,12 @@ namespace orva::util {
 namespace {
 
 struct Counted {
-  Counted() { ++made; }
+  Counted() {
+    for (int i = 0; i < 1000; ++i) {
+      std::this_thread::yield(); // lets the others come, who must wait
+    }
+    ++made;
+  }
   ~Counted() { ++deleted; }
   inline static std::atomic<int> made = 0;
   inline static std::atomic<int> deleted = 0;
