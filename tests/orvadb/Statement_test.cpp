@@ -252,7 +252,6 @@ TEST_F(StatementTest, ATextInUseIsCompiledAnew) {
       EXPECT_EQ(outer.GetInt(0), 2);
       EXPECT_EQ(inner.GetInt(0), 1);
     }
-    EXPECT_THAT(db.Compiled(), SizeIs(1));
     EXPECT_FALSE(outer.Fetch(__FILE__, __LINE__));
   }
   EXPECT_THAT(db.Compiled(), SizeIs(1));
@@ -265,9 +264,11 @@ TEST_F(StatementTest, TheOuterUseOfATextMayEndBeforeTheInner) {
   auto inner = std::make_unique<Statement>(db, "SELECT 1", __FILE__, __LINE__);
   outer.reset();
   EXPECT_TRUE(inner->Fetch(__FILE__, __LINE__));
-  const Statement third = Make("SELECT 1");
-  EXPECT_THAT(db.Compiled(), SizeIs(2));
-  inner.reset();
+  {
+    const Statement third = Make("SELECT 1");
+    EXPECT_THAT(db.Compiled(), SizeIs(2));
+    inner.reset();
+  }
   EXPECT_THAT(db.Compiled(), SizeIs(1));
 }
 

@@ -220,7 +220,7 @@ TEST_F(NotificationTest, EndIsATranscodedBatchOfAnyProfile) {
 
 TEST_F(NotificationTest, UnknownNamesAreIgnoredSilently) {
   for (const char* const name : {"plugged", "Plug", "PluggedX", "END", "Transcodedbatch", ""}) {
-    Notify(Notification(name, "/shares/Vol", ProfileElement(PROFILE)));
+    Notify(Notification(name, "/shares/Vol", ProfileElement(notify::TRANSCODING_PROFILE)));
   }
   Notify("<ORVANotification MountPoint=\"/shares/Vol\"/>");
   EXPECT_THAT(state->events, IsEmpty());
@@ -231,7 +231,7 @@ TEST_F(NotificationTest, UnknownNamesAreIgnoredSilently) {
 // Profiles.
 
 TEST_F(NotificationTest, BatchOfTheAcceptedProfileIsHandled) {
-  NotifyBatch(ProfileElement(PROFILE));
+  NotifyBatch(ProfileElement(notify::TRANSCODING_PROFILE));
   EXPECT_THAT(state->events, ElementsAre("transcoded /shares/Vol/"));
   EXPECT_THAT(Registered(), ElementsAre("/shares/Vol/"));
   EXPECT_THAT(Logged(), ElementsAre(BATCH, ACCEPTED));
@@ -244,11 +244,11 @@ TEST_F(NotificationTest, ProfileIsFoundAmongOtherChildren) {
 }
 
 TEST_F(NotificationTest, LastProfileDecides) {
-  NotifyBatch(ProfileElement("other") + ProfileElement(PROFILE));
+  NotifyBatch(ProfileElement("other") + ProfileElement(notify::TRANSCODING_PROFILE));
   EXPECT_THAT(Logged(), ElementsAre(BATCH, ACCEPTED));
   EXPECT_THAT(state->events, ElementsAre("transcoded /shares/Vol/"));
-  NotifyBatch(ProfileElement(PROFILE) + ProfileElement("other"));
-  NotifyBatch(ProfileElement(PROFILE) + "<profile/>");
+  NotifyBatch(ProfileElement(notify::TRANSCODING_PROFILE) + ProfileElement("other"));
+  NotifyBatch(ProfileElement(notify::TRANSCODING_PROFILE) + "<profile/>");
   EXPECT_EQ(1U, state->events.size());
   EXPECT_THAT(Logged(), ElementsAre(BATCH, BATCH));
 }
@@ -259,9 +259,9 @@ TEST_F(NotificationTest, BatchesOfOtherProfilesAreIgnored) {
                       "<profile/>",
                       ProfileElement("other"),
                       ProfileElement("CB62BBDD389B48898F2E5244977CB2C5"),
-                      ProfileElement(PROFILE + " "),
-                      "<Profile>" + PROFILE + "</Profile>",
-                      "<batch>" + ProfileElement(PROFILE) + "</batch>"};
+                      ProfileElement(notify::TRANSCODING_PROFILE + " "),
+                      "<Profile>" + notify::TRANSCODING_PROFILE + "</Profile>",
+                      "<batch>" + ProfileElement(notify::TRANSCODING_PROFILE) + "</batch>"};
   for (const std::string& children : batches) {
     NotifyBatch(children);
     EXPECT_THAT(Logged(), ElementsAre(BATCH)) << children;

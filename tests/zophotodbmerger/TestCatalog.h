@@ -47,7 +47,7 @@ struct TranscodingRow {
   long sourceId = 0;
   long lastUpdatedDate = 0;
   long status = 1;
-  std::string profile = PROFILE;
+  std::string profile = notify::TRANSCODING_PROFILE;
 };
 
 /// The media catalog of a volume, column by column as a test wants it.
