@@ -24,6 +24,9 @@ const std::string DELIMITER(4, '\0');
 const std::string GOOD = Notification("Unplugged", "/shares/A");
 const Log HANDLED = {Info("Default:: Volumeunplugged, ignoring! ")};
 
+/// Bytes of the largest message that is taken.
+constexpr std::size_t LARGEST = 65536;
+
 /// A padded good notification of exactly `size` bytes.
 std::string Padded(std::size_t size) {
   const std::string tail = "-->" + GOOD.substr(GOOD.find("<ORVANotification"));
@@ -89,12 +92,12 @@ TEST_F(Intake, ADocumentTypeIsRefused) {
 }
 
 TEST_F(Intake, AMessageOfTheLargestSizeIsHandled) {
-  EXPECT_EQ(HANDLED, appliance.Handle(Padded(64 * 1024)));
+  EXPECT_EQ(HANDLED, appliance.Handle(Padded(LARGEST)));
 }
 
 TEST_F(Intake, AMessageOverTheLargestSizeIsRefused) {
-  RefusedByTheProcessor(Padded(64 * 1024 + 1));
-  RefusedByTheProcessor(Padded(10 * 1024 * 1024));
+  RefusedByTheProcessor(Padded(LARGEST + 1));
+  RefusedByTheProcessor(Padded(160 * LARGEST));
 }
 
 TEST_F(Intake, AnEmptyOrAbsentMountPointIsRefused) {
@@ -247,7 +250,7 @@ TEST_F(Intake, ACompleteMessageWithoutItsDelimiterIsNotHandled) {
 }
 
 TEST_F(Intake, AnOversizedMessageIsForgottenWithItsConnection) {
-  appliance.Service().SendBytes(std::string(100 * 1024, 'x'));
+  appliance.Service().SendBytes(std::string(2 * LARGEST, 'x'));
   appliance.Service().CloseClient();
   EXPECT_EQ(HANDLED.back(), appliance.Handle(GOOD).back());
 }
