@@ -38,63 +38,48 @@ bool IsWritable(int descriptor, int timeout) {
   return result == 1;
 }
 
-/// A pipe, a socket or a terminal as standard output, whose reader may stop reading. Written
-/// through a description of our own, since not to wait is a property of the description, and
-/// standard output's is shared with other processes.
-class ReaderOutput {
+/// Writes to a pipe or a terminal through a description of our own: not to wait is a property of
+/// the description, and standard output's is shared with other processes. Where it cannot be had
+/// the reader is waited for.
+class NonBlockingOutput {
 public:
-  ReaderOutput() = default;
-  ReaderOutput(const ReaderOutput&) = delete;
-  ReaderOutput& operator=(const ReaderOutput&) = delete;
-  ~ReaderOutput() { Forget(); }
+  NonBlockingOutput() = default;
+  NonBlockingOutput(const NonBlockingOutput&) = delete;
+  NonBlockingOutput& operator=(const NonBlockingOutput&) = delete;
+  ~NonBlockingOutput() {
+    if (descriptor_ != -1) {
+      close(descriptor_);
+    }
+  }
 
-  /// `status` is that of standard output, which may have become another file.
-  void Write(const struct stat& status, std::string_view text) {
-    if (status.st_dev != device_ || status.st_ino != inode_) {
-      Forget();
-      device_ = status.st_dev;
-      inode_ = status.st_ino;
-      isSocket_ = S_ISSOCK(status.st_mode);
-      if (!isSocket_) {
-        descriptor_ = open("/proc/self/fd/1", O_WRONLY | O_NONBLOCK | O_NOCTTY | O_CLOEXEC);
-      }
-    }
-    while (!text.empty()) {
-      const ssize_t count = WriteSome(text);
-      if (count >= 0) {
-        text.remove_prefix(static_cast<std::size_t>(count));
-        stalled_ = false;
-      } else if (errno == EAGAIN && !stalled_ &&
-                 IsWritable(STDOUT_FILENO, STALLED_READER_TIMEOUT)) {
-        continue;
-      } else if (errno != EINTR) {
-        stalled_ = errno == EAGAIN;
-        return;
-      }
-    }
+  ssize_t Write(std::string_view text) const {
+    return write(descriptor_ != -1 ? descriptor_ : STDOUT_FILENO, text.data(), text.size());
   }
 
 private:
-  ssize_t WriteSome(std::string_view text) const {
-    if (isSocket_) {
-      return send(STDOUT_FILENO, text.data(), text.size(), MSG_DONTWAIT | MSG_NOSIGNAL);
-    }
-    return write(descriptor_ == -1 ? STDOUT_FILENO : descriptor_, text.data(), text.size());
-  }
-
-  void Forget() {
-    if (descriptor_ != -1) {
-      close(descriptor_);
-      descriptor_ = -1;
-    }
-  }
-
-  dev_t device_ = 0;
-  ino_t inode_ = 0;
-  bool isSocket_ = false;
-  bool stalled_ = false;
-  int descriptor_ = -1; ///< -1 where it cannot be opened again: then the reader is waited for
+  int descriptor_ = open("/proc/self/fd/1", O_WRONLY | O_NONBLOCK | O_NOCTTY | O_CLOEXEC);
 };
+
+/// Writes `text` by `writeSome`, which does not wait. A reader that pauses for too long loses the
+/// rest, and every line after it until it reads again.
+template <typename WriteSome>
+void WriteToReader(std::string_view text, WriteSome writeSome) {
+  static bool stalled = false;
+  while (!text.empty()) {
+    const ssize_t count = writeSome(text);
+    if (count >= 0) {
+      text.remove_prefix(static_cast<std::size_t>(count));
+      stalled = false;
+    } else if (errno == EAGAIN) {
+      stalled = stalled || !IsWritable(STDOUT_FILENO, STALLED_READER_TIMEOUT);
+      if (stalled) {
+        return;
+      }
+    } else if (errno != EINTR) {
+      return;
+    }
+  }
+}
 
 } // namespace
 
@@ -108,9 +93,13 @@ void writeLine(std::initializer_list<std::string_view> pieces) {
   struct stat status {};
   if (fstat(STDOUT_FILENO, &status) != 0 || S_ISREG(status.st_mode)) {
     WriteAll(STDOUT_FILENO, line);
+  } else if (S_ISSOCK(status.st_mode)) {
+    WriteToReader(line, [](std::string_view text) {
+      return send(STDOUT_FILENO, text.data(), text.size(), MSG_DONTWAIT | MSG_NOSIGNAL);
+    });
   } else {
-    static ReaderOutput reader;
-    reader.Write(status, line);
+    const NonBlockingOutput output;
+    WriteToReader(line, [&](std::string_view text) { return output.Write(text); });
   }
 }
 

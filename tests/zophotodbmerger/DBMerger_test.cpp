@@ -483,7 +483,7 @@ bool IsBeingMerged(const Database& merged) {
   } catch (const std::runtime_error&) {
     return true;
   }
-  merged.Run("COMMIT");
+  merged.Run("ROLLBACK");
   return false;
 }
 

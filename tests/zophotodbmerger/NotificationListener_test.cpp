@@ -287,27 +287,27 @@ TEST_F(NotificationTest, DoubledSeparatorIsAnotherVolume) {
 
 TEST_F(NotificationTest, MountPointIsPercentDecoded) {
   MakeDirectory("/shares/Mine & \xC3\xA4+");
-  Notify(test::Scanned("/shares/Mine%20%26%20%C3%a4+"));
+  Notify(Notification("Scanned", "/shares/Mine%20%26%20%C3%a4+"));
   EXPECT_THAT(state->events, ElementsAre("scanned /shares/Mine & \xC3\xA4+/"));
   EXPECT_THAT(Registered(), ElementsAre("/shares/Mine & \xC3\xA4+/"));
 }
 
 TEST_F(NotificationTest, EncodedSeparatorAtTheEndIsOne) {
-  Notify(test::Scanned("/shares/Vol%2F"));
+  Notify(Notification("Scanned", "/shares/Vol%2F"));
   EXPECT_THAT(state->events, ElementsAre("scanned /shares/Vol/"));
 }
 
 TEST_F(NotificationTest, MalformedEscapesStayAsTheyStand) {
-  Notify(test::Unplugged("/shares/100%"));
-  Notify(test::Unplugged("/shares/%zz%4"));
-  Notify(test::Unplugged("/shares/a%00b"));
+  Notify(Notification("Unplugged", "/shares/100%"));
+  Notify(Notification("Unplugged", "/shares/%zz%4"));
+  Notify(Notification("Unplugged", "/shares/a%00b"));
   EXPECT_THAT(state->events, ElementsAre("unplugged /shares/100%/", "unplugged /shares/%zz%4/",
                                          "unplugged /shares/a%00b/"));
 }
 
 TEST_F(NotificationTest, CharactersOutsideAsciiComeAsUtf8) {
   MakeDirectory("/shares/\xC3\xA4");
-  Notify(test::Scanned("/shares/&#228;"));
+  Notify(Notification("Scanned", "/shares/&#228;"));
   EXPECT_THAT(Registered(), ElementsAre("/shares/\xC3\xA4/"));
 }
 
