@@ -30,7 +30,7 @@ class DBMergerTest : public DaemonLayerTest {
 protected:
   DBMergerTest() {
     MakeDirectory(MASTER);
-    std::filesystem::current_path(MakeDirectory("/tmp/work"));
+    std::filesystem::current_path(MakeDirectory("/tmp/scratch"));
   }
 
   ~DBMergerTest() override {
@@ -339,7 +339,7 @@ TEST_F(DBMergerTest, RemovalFromTheEmptyVolumeTouchesNoVolume) {
   const Lines before = MergedContent(MASTER);
   merger.RemoveVolume("DUMMY_MOUNT_POINT", VOLUME);
   EXPECT_EQ(before, MergedContent(MASTER));
-  EXPECT_TRUE(std::filesystem::exists("/tmp/work/.zophotos/zophotos.db"));
+  EXPECT_TRUE(std::filesystem::exists("/tmp/scratch/.zophotos/zophotos.db"));
   EXPECT_THAT(Logged(), IsEmpty());
 }
 

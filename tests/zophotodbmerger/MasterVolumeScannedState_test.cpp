@@ -21,7 +21,7 @@ const LogLine MOVING = Info("Moving to the scanned state since we can safely do 
 class MasterVolumeScannedStateTest : public StatesTest {
 protected:
   MasterVolumeScannedStateTest() {
-    std::filesystem::current_path(MakeDirectory("/tmp/work"));
+    std::filesystem::current_path(MakeDirectory("/tmp/scratch"));
     Register("/shares/Vol/", LARGE);
     StatesTest::Scanned("/shares/Vol/");
     Logged();
@@ -50,10 +50,10 @@ TEST_F(MasterVolumeScannedStateTest, HasCreatedTheDatabaseAndPublishedIt) {
 }
 
 TEST_F(StatesTest, ScannedStateWithoutAMasterNamesTheEmptyVolume) {
-  std::filesystem::current_path(MakeDirectory("/tmp/work"));
+  std::filesystem::current_path(MakeDirectory("/tmp/scratch"));
   const dbmerger::MasterVolumeScannedState state;
   EXPECT_EQ("zophotos_db_path=DUMMY_MOUNT_POINT/.zophotos/zophotos.db\n", Locator());
-  EXPECT_TRUE(std::filesystem::exists("/tmp/work/.zophotos/zophotos.db"));
+  EXPECT_TRUE(std::filesystem::exists("/tmp/scratch/.zophotos/zophotos.db"));
 }
 
 TEST_F(StatesTest, ScannedStateThatCannotBeMadeJoinsItsMerger) {
@@ -165,7 +165,7 @@ TEST_F(MasterVolumeScannedStateTest, UnpluggedMasterIsFollowedByAnother) {
   EXPECT_THAT(MergedFolders("/shares/Next"), IsEmpty());
   EXPECT_THAT(MergedFiles("/shares/Vol"), ElementsAre("/shares/Vol/a.jpg"))
       << "the rows are removed from the database of the empty volume";
-  EXPECT_TRUE(std::filesystem::exists("/tmp/work/.zophotos/zophotos.db"));
+  EXPECT_TRUE(std::filesystem::exists("/tmp/scratch/.zophotos/zophotos.db"));
   EXPECT_THAT(Logged(), ElementsAre(UNPLUGGED, MOVING,
                                     Info("We now have a master volume " +
                                          MasterText("/shares/Next/", "1.2e+11") + " ")));

@@ -120,11 +120,11 @@ TEST_F(PhotoDBLocationTest, FormsOfTheSameDirectoryAreOneLocation) {
 }
 
 TEST_F(PhotoDBLocationTest, MissingLocationKeepsAScratchDatabaseInTheWorkingDirectory) {
-  std::filesystem::current_path(MakeDirectory("/tmp/work"));
+  std::filesystem::current_path(MakeDirectory("/tmp/scratch"));
   PhotoDB photos("DUMMY_MOUNT_POINT");
   photos.Init();
-  EXPECT_TRUE(std::filesystem::exists("/tmp/work/.zophotos/zophotos.db"));
-  EXPECT_EQ(0777U, ModeOf("/tmp/work/.zophotos"));
+  EXPECT_TRUE(std::filesystem::exists("/tmp/scratch/.zophotos/zophotos.db"));
+  EXPECT_EQ(0777U, ModeOf("/tmp/scratch/.zophotos"));
 }
 
 TEST_F(PhotoDBLocationTest, FileInTheDirectorysPlaceIsAnUnusableLocation) {

@@ -113,13 +113,13 @@ TEST_F(StateMachineTest, StartKeepsNothingOfAnEarlierRun) {
 
 TEST_F(StateMachineTest, StartWithoutTheSharesRootGoesOnWithAnEmptyRegistry) {
   std::filesystem::remove("/shares");
-  std::filesystem::current_path(MakeDirectory("/tmp/work"));
+  std::filesystem::current_path(MakeDirectory("/tmp/scratch"));
   const StateMachine machine;
   EXPECT_THAT(Logged(),
               ElementsAre(Error("There is no filesystem location for the mountpoint /shares")));
   EXPECT_THAT(VolumeInfoManager::Instance().getVolumes(), IsEmpty());
   EXPECT_EQ(SHARES_LOCATOR, Locator());
-  EXPECT_TRUE(std::filesystem::exists("/tmp/work/.zophotos/zophotos.db"));
+  EXPECT_TRUE(std::filesystem::exists("/tmp/scratch/.zophotos/zophotos.db"));
   EXPECT_FALSE(std::filesystem::exists("/shares"));
 }
 
