@@ -26,7 +26,6 @@ using testing::AllOf;
 using testing::ElementsAre;
 using testing::HasSubstr;
 using testing::IsEmpty;
-using testing::SizeIs;
 using testing::StartsWith;
 
 static_assert(std::has_virtual_destructor_v<DB>);

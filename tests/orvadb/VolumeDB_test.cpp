@@ -48,7 +48,7 @@ public:
 /// A file system of its own below /shares, mounted for as long as the object lives.
 class Mount {
 public:
-  explicit Mount(const std::string& point) : point_(point) {
+  explicit Mount(std::string point) : point_(std::move(point)) {
     fs::create_directories(point_);
     Check(mount("tmpfs", point_.c_str(), "tmpfs", 0, "size=4m"));
     fs::create_directory(point_ + "/.orva");
