@@ -23,7 +23,6 @@ namespace orva::test {
 namespace {
 
 using dbmerger::PhotoDB;
-using dbmerger::Statistics;
 using ::testing::ElementsAre;
 using ::testing::HasSubstr;
 using ::testing::IsEmpty;
