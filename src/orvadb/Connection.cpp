@@ -18,7 +18,8 @@ void Connection::CheckIn::operator()(sqlite3_stmt* statement) const noexcept {
 }
 
 Connection::CheckedOut Connection::CheckOut(const char* sql, const char* file, unsigned line) {
-  Compiled& place = statements_[sql];
+  const auto kept = statements_.find(std::string_view(sql));
+  Compiled& place = kept != statements_.end() ? kept->second : statements_[sql];
   Compiled compiled = place ? std::move(place) : Compile(sql, file, line);
   return {compiled.release(), CheckIn{&place}};
 }

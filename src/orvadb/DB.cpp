@@ -1,6 +1,7 @@
 #include "orvadb/DB.h"
 
 #include "orvadb/Connection.h"
+#include "orvadb/Statement.h"
 
 #include "orvautil/FormatString.h"
 
@@ -30,6 +31,11 @@ void RefuseSpecialFiles(const std::string& path) {
                                name.c_str());
     }
   }
+}
+
+/// Lets a merge keep its changes in memory until it commits, so that readers wait only then.
+void SetCacheSize(sqlite3* handle) {
+  sqlite3_exec(handle, "PRAGMA cache_size = -65536", nullptr, nullptr, nullptr);
 }
 
 /// `path` as a URI that promises that nobody writes the file.
@@ -80,6 +86,9 @@ void DB::Open(std::string path, Access access, int busyTimeout, bool immutable) 
     throw std::string(std::move(message));
   }
   sqlite3_busy_timeout(handle_, busyTimeout);
+  if (access == Access::ReadWrite) {
+    SetCacheSize(handle_);
+  }
   connection_ = std::make_unique<Connection>(handle_, busyTimeout);
 }
 
@@ -89,6 +98,20 @@ void DB::Close() {
   sqlite3_close_v2(handle_);
   handle_ = nullptr;
   path_.clear();
+}
+
+unsigned long long DB::RunningTransaction() const noexcept {
+  return connection_ ? connection_->transaction : 0;
+}
+
+void DB::CreateTransientIndex(const char* create, const char* drop, const char* file,
+                              unsigned int line) const {
+  Statement(*this, create, file, line).Execute(file, line);
+  connection_->beforeCommit.push_back(drop);
+}
+
+long long DB::LastInsertId() const noexcept {
+  return sqlite3_last_insert_rowid(handle_);
 }
 
 } // namespace orva::db

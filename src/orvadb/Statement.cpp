@@ -67,6 +67,17 @@ void Statement::BindText(int index, const std::string& value, const char* file, 
             file, line);
 }
 
+void Statement::BindTextView(int index, std::string_view value, const char* file,
+                             unsigned int line) {
+  CheckBind(sqlite3_bind_text64(statement_.get(), index, value.data(), value.size(), SQLITE_STATIC,
+                                SQLITE_UTF8),
+            file, line);
+}
+
+int Statement::TakeCost() const {
+  return sqlite3_stmt_status(statement_.get(), SQLITE_STMTSTATUS_VM_STEP, 1);
+}
+
 void Statement::BindTime(int index, long value, const char* file, unsigned int line) {
   BindInt64(index, value, file, line);
 }

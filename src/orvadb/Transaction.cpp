@@ -17,8 +17,10 @@ Transaction::Transaction(const DB& db, unsigned int busyTimeout, const char* fil
   Statement begin(db, readOnly ? "BEGIN" : "BEGIN IMMEDIATE", file, line);
   sqlite3_busy_timeout(db.handle_, static_cast<int>(busyTimeout));
   db.connection_->failedStep.clear();
+  db.connection_->beforeCommit.clear();
   try {
     begin.Execute(file, line);
+    db.connection_->transaction = db.connection_->NextTransaction();
   } catch (...) {
     sqlite3_busy_timeout(db.handle_, db.connection_->BusyTimeout());
     throw;
@@ -41,12 +43,16 @@ void Transaction::Commit(const char* file, unsigned int line) {
     throw util::FormatString("%s:%u: not committed after a failed step: %s", file, line,
                              failedStep.c_str());
   }
+  for (const char* const sql : db_.connection_->beforeCommit) {
+    Statement(db_, sql, file, line).Execute(file, line);
+  }
   Statement(db_, "COMMIT", file, line).Execute(file, line);
   End();
 }
 
 void Transaction::End() noexcept {
   sqlite3_busy_timeout(db_.handle_, db_.connection_->BusyTimeout());
+  db_.connection_->transaction = 0;
   open_ = false;
 }
 

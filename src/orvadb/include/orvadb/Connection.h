@@ -1,8 +1,12 @@
 #pragma once
 
+#include <cstddef>
+#include <functional>
 #include <memory>
 #include <string>
+#include <string_view>
 #include <unordered_map>
+#include <vector>
 
 struct sqlite3;
 struct sqlite3_stmt;
@@ -44,13 +48,32 @@ public:
   /// First failed step since the running transaction began, as a message; empty when none.
   std::string failedStep;
 
+  /// Number of the running transaction; 0 while there is none. A number stands for one
+  /// transaction only.
+  unsigned long long transaction = 0;
+
+  /// Statements that the running transaction executes before it commits.
+  std::vector<const char*> beforeCommit;
+
+  /// The number for a transaction that begins.
+  unsigned long long NextTransaction() noexcept { return ++transactions_; }
+
 private:
+  /// Lets a text be looked up without making a string of it.
+  struct TextHash {
+    using is_transparent = void;
+    std::size_t operator()(std::string_view text) const noexcept {
+      return std::hash<std::string_view>{}(text);
+    }
+  };
+
   Compiled Compile(const char* sql, const char* file, unsigned line) const;
 
   sqlite3* handle_;
   int busyTimeout_;
+  unsigned long long transactions_ = 0;
   /// By text, which every caller writes in full, so that they are few; null while in use.
-  std::unordered_map<std::string, Compiled> statements_;
+  std::unordered_map<std::string, Compiled, TextHash, std::equal_to<>> statements_;
 };
 
 /// The message of the last failure on `handle`: "file:line: SQLite's message (extended code

@@ -47,6 +47,19 @@ protected:
   /// nobody writes the file, which then is neither locked nor watched. Only ReadWrite creates.
   void Open(std::string path, Access access, int busyTimeout, bool immutable);
 
+  /// Number of the transaction that runs on the open connection, for what is known only as long
+  /// as it lasts; 0 while there is none, and never the same for two.
+  unsigned long long RunningTransaction() const noexcept;
+
+  /// Makes an index in the running transaction, by `create`, and has it removed before the commit,
+  /// by `drop`, so that no other connection ever sees it. Both texts are literals. Throws
+  /// std::string with the caller's `file` and `line`.
+  void CreateTransientIndex(const char* create, const char* drop, const char* file,
+                            unsigned int line) const;
+
+  /// Row id of the last row inserted.
+  long long LastInsertId() const noexcept;
+
   /// The open connection, null while closed; still owned by this object.
   sqlite3* Handle() const noexcept { return handle_; }
 

@@ -4,6 +4,7 @@
 
 #include <ctime>
 #include <string>
+#include <string_view>
 
 namespace orva::db {
 
@@ -45,6 +46,12 @@ public:
   void BindText(int index, const std::string& value, const char* file, unsigned int line);
   /// Seconds since the epoch, stored as an integer.
   void BindTime(int index, long value, const char* file, unsigned int line);
+
+  /// BindText without the copy: the text must stay as it is for as long as the statement.
+  void BindTextView(int index, std::string_view value, const char* file, unsigned int line);
+
+  /// What the statement has cost since this was last asked, in steps of SQLite's machine.
+  int TakeCost() const;
 
   /// The low 32 bits of an integer column, with their sign.
   int GetInt(int column) const;
