@@ -19,6 +19,8 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
+
 namespace orva::dbmerger {
 
 namespace {
@@ -51,12 +53,12 @@ bool ChangeDirectoryMode(const std::string& path, mode_t mode) {
 }
 
 /// The path of the folder that holds the folder at `path`, with its trailing separator.
-std::string ParentPath(const std::string& path) {
+std::string_view ParentPath(std::string_view path) {
   return path.substr(0, path.rfind(NATIVE_PATH_SEPARATOR, path.size() - 2) + 1);
 }
 
 /// The path of the folder that holds the file at `path`, with its trailing separator.
-std::string FolderPath(const std::string& path) {
+std::string_view FolderPath(std::string_view path) {
   return path.substr(0, path.rfind(NATIVE_PATH_SEPARATOR) + 1);
 }
 
@@ -108,8 +110,9 @@ void HandOver(std::unique_ptr<Record> record, std::vector<Record*>& records) {
 
 } // namespace
 
-PhotoDB::PhotoDB(const std::string& location)
-    : dbLocation(util::MakePath(util::Path(location).Canonicalize(), ".zophotos")) {
+PhotoDB::PhotoDB(const std::string& location, Asking asking)
+    : dbLocation(util::MakePath(util::Path(location).Canonicalize(), ".zophotos")),
+      asking_(asking) {
   if (!IsPresent(dbLocation)) {
     util::Path(dbLocation).Create(DIRECTORY_PERMISSIONS);
     if (!ChangeDirectoryMode(dbLocation, EVERYBODY)) {
@@ -240,23 +243,47 @@ std::unique_ptr<Folder> PhotoDB::GetFolder(const std::string& name,
   return query.Fetch(__FILE__, __LINE__) ? ReadFolder(query) : nullptr;
 }
 
-long long PhotoDB::FindFolder(const std::string& path) const {
+void PhotoDB::Knowledge::Forget() {
+  firstOwnFolder = NONE;
+  folderId = NONE;
+  names.reset();
+}
+
+void PhotoDB::Knowledge::EnterFolder(long long id, std::string_view path,
+                                     const std::string& volume) {
+  folderId = id;
+  folderPath = path;
+  folderVolume = volume;
+  folderCost = 0;
+  triedCost = 0;
+  names.reset();
+}
+
+PhotoDB::Knowledge& PhotoDB::Known() const {
+  if (known_.transaction != RunningTransaction()) {
+    known_ = Knowledge();
+    known_.transaction = RunningTransaction();
+  }
+  return known_;
+}
+
+long long PhotoDB::FindFolder(std::string_view path) const {
   Statement query(*this, "select * FROM Folders where name = ?", __FILE__, __LINE__);
-  query.BindText(1, path, __FILE__, __LINE__);
+  query.BindTextView(1, path, __FILE__, __LINE__);
   return query.Fetch(__FILE__, __LINE__) ? query.GetInt64(0) : NO_FOLDER;
 }
 
-long long PhotoDB::FindFolder(const std::string& path, const std::string& volume) const {
+long long PhotoDB::FindFolder(std::string_view path, const std::string& volume) const {
   Statement query(*this, "select * FROM Folders where name = ? and volume = ?", __FILE__, __LINE__);
-  query.BindText(1, path, __FILE__, __LINE__);
-  query.BindText(2, volume, __FILE__, __LINE__);
+  query.BindTextView(1, path, __FILE__, __LINE__);
+  query.BindTextView(2, volume, __FILE__, __LINE__);
   return query.Fetch(__FILE__, __LINE__) ? query.GetInt64(0) : NO_FOLDER;
 }
 
 void PhotoDB::AddFolder(std::string volume, db::Folder& folder) const {
   {
     Statement query(*this, "SELECT * FROM Folders where name = ?", __FILE__, __LINE__);
-    query.BindText(1, folder.path, __FILE__, __LINE__);
+    query.BindTextView(1, folder.path, __FILE__, __LINE__);
     if (query.Fetch(__FILE__, __LINE__)) {
       return;
     }
@@ -270,13 +297,21 @@ void PhotoDB::AddFolder(std::string volume, db::Folder& folder) const {
       "INSERT INTO Folders(parent_folder_id, name, modified_date, volume) VALUES(?, ?, ?, ?)",
       __FILE__, __LINE__);
   insert.BindInt64(1, parentId, __FILE__, __LINE__);
-  insert.BindText(2, folder.path, __FILE__, __LINE__);
+  insert.BindTextView(2, folder.path, __FILE__, __LINE__);
   insert.BindTime(3, folder.lastModifiedDate, __FILE__, __LINE__);
-  insert.BindText(4, volume, __FILE__, __LINE__);
+  insert.BindTextView(4, volume, __FILE__, __LINE__);
   insert.Execute(__FILE__, __LINE__);
+
+  Knowledge& known = Known();
+  if (known.transaction != 0 && known.firstOwnFolder == Knowledge::NONE) {
+    // Ids only grow, so this one and all that follow are ours.
+    known.firstOwnFolder = LastInsertId();
+    known.greatestPath.clear();
+  }
 }
 
 void PhotoDB::DeleteVolumes() const {
+  Known().Forget();
   for (const char* const sql : {"DELETE FROM Folders WHERE folder_id != 1", "DELETE FROM Files ",
                                 "DELETE FROM Statistics", "VACUUM"}) {
     Statement(*this, sql, __FILE__, __LINE__).Execute(__FILE__, __LINE__);
@@ -284,6 +319,7 @@ void PhotoDB::DeleteVolumes() const {
 }
 
 void PhotoDB::DeleteVolume(const std::string& volume) const {
+  Known().Forget();
   for (const char* const sql :
        {"DELETE FROM Folders WHERE volume = ?", "DELETE FROM Files WHERE volume = ?",
         "UPDATE Statistics SET last_updated_time = 0 WHERE volume = ?"}) {
@@ -299,39 +335,106 @@ std::unique_ptr<File> PhotoDB::GetFile(long long fileId) const {
   return query.Fetch(__FILE__, __LINE__) ? ReadFile(query) : nullptr;
 }
 
-void PhotoDB::AddFile(const std::string& volume, db::File& file) const {
-  const std::string folderPath = FolderPath(file.path);
+bool PhotoDB::IsFilePresent(const std::string& volume, const db::File& file,
+                            std::string_view folderPath) const {
+  Knowledge& known = Known();
+  if (known.names) {
+    return known.names->contains(file.name);
+  }
+  bool present = false;
+  int cost = 0;
   {
     Statement query(*this,
                     "SELECT * FROM Files f, Folders o where f.folder_id = o.folder_id and f.name = "
                     "? and o.name = ? and f.volume = ?",
                     __FILE__, __LINE__);
-    query.BindText(1, file.name, __FILE__, __LINE__);
-    query.BindText(2, folderPath, __FILE__, __LINE__);
-    query.BindText(3, volume, __FILE__, __LINE__);
-    if (query.Fetch(__FILE__, __LINE__)) {
-      return;
-    }
+    query.BindTextView(1, file.name, __FILE__, __LINE__);
+    query.BindTextView(2, folderPath, __FILE__, __LINE__);
+    query.BindTextView(3, volume, __FILE__, __LINE__);
+    present = query.Fetch(__FILE__, __LINE__);
+    cost = query.TakeCost();
   }
-  const long long folderId = FindFolder(folderPath, volume);
-  if (folderId == NO_FOLDER) {
+  LearnNames(volume, cost);
+  return present;
+}
+
+// SQLite looks for a file by its name alone, through all folders that have one of that name. Where
+// that is dear, knowing all the names of a folder is cheaper, unless the folder is large.
+void PhotoDB::LearnNames(const std::string& volume, int cost) const {
+  constexpr int dearCost = 500;
+  constexpr int costPerName = 8;
+  constexpr std::size_t mostNames = 200'000;
+
+  Knowledge& known = Known();
+  known.folderCost += cost;
+  if (asking_ == Asking::Always || known.transaction == 0 || cost < dearCost ||
+      known.folderCost < known.triedCost * 2) {
     return;
   }
+  known.triedCost = known.folderCost;
+  const auto limit = std::min(mostNames, static_cast<std::size_t>(known.folderCost / costPerName));
+  Knowledge::Names names;
+  Statement query(*this, "SELECT * FROM Files WHERE folder_id = ? ", __FILE__, __LINE__);
+  query.BindInt64(1, known.folderId, __FILE__, __LINE__);
+  while (query.Fetch(__FILE__, __LINE__)) {
+    if (names.size() == limit) {
+      return;
+    }
+    if (query.GetText(4) == volume) {
+      names.insert(query.GetText(2));
+    }
+  }
+  known.names = std::move(names);
+}
+
+void PhotoDB::AddFile(const std::string& volume, db::File& file) const {
+  const std::string_view folderPath = FolderPath(file.path);
+  Knowledge& known = Known();
+  const bool asksAll = asking_ == Asking::Always || known.transaction == 0;
+  if (asksAll || known.folderId == Knowledge::NONE || known.folderPath != folderPath ||
+      known.folderVolume != volume) {
+    const long long found = FindFolder(folderPath, volume);
+    if (found == NO_FOLDER) {
+      return;
+    }
+    known.EnterFolder(found, folderPath, volume);
+  }
+  const long long folderId = known.folderId;
+
+  // In a folder of our own there are only files that we added. When they came in the order of
+  // their paths, and are named as these say, a file that comes behind them all is new.
+  const bool isNamedByPath = std::string_view(file.path).substr(folderPath.size()) == file.name;
+  const bool isNew =
+      folderId >= known.firstOwnFolder && isNamedByPath && file.path > known.greatestPath;
+  if ((asksAll || !isNew) && IsFilePresent(volume, file, folderPath)) {
+    return;
+  }
+
   Statement insert(*this,
                    "INSERT INTO Files(folder_id, name, modified_date, volume, created_date) "
                    "VALUES(?, ?, ?, ?, ?)",
                    __FILE__, __LINE__);
   insert.BindInt64(1, folderId, __FILE__, __LINE__);
-  insert.BindText(2, file.name, __FILE__, __LINE__);
+  insert.BindTextView(2, file.name, __FILE__, __LINE__);
   insert.BindTime(3, file.lastModifiedDate, __FILE__, __LINE__);
-  insert.BindText(4, volume, __FILE__, __LINE__);
+  insert.BindTextView(4, volume, __FILE__, __LINE__);
   // To readers a photo was created when it was last modified.
   insert.BindTime(5, file.lastModifiedDate, __FILE__, __LINE__);
   insert.Execute(__FILE__, __LINE__);
+
+  if (known.names) {
+    known.names->insert(file.name);
+  }
+  if (!isNamedByPath) {
+    known.Forget();
+  } else if (file.path > known.greatestPath) {
+    known.greatestPath = file.path;
+  }
 }
 
 void PhotoDB::DeleteFolder(const std::string& volume, db::Folder& folder) const {
   writeLine({"Deleting ", folder.path});
+  Known().Forget();
   const long long folderId = FindFolder(folder.path, volume);
   if (folderId != NO_FOLDER) {
     writeLine({"Found folder ", std::to_string(folderId), " for ", folder.path});
@@ -346,14 +449,44 @@ void PhotoDB::DeleteFolder(const std::string& volume, db::Folder& folder) const 
 
 void PhotoDB::DeleteFile(const std::string& /*volume*/, db::File& file) const {
   writeLine({"Deleting ", file.path});
+  Known().Forget();
   const long long folderId = FindFolder(FolderPath(file.path));
   if (folderId != NO_FOLDER) {
     writeLine({"Found parent folder ", std::to_string(folderId), " for ", file.path});
   }
-  Statement change(*this, "DELETE FROM Files WHERE name = ? and folder_id = ?", __FILE__, __LINE__);
-  change.BindText(1, file.name, __FILE__, __LINE__);
-  change.BindInt64(2, folderId, __FILE__, __LINE__);
-  change.Execute(__FILE__, __LINE__);
+  int cost = 0;
+  {
+    Statement change(*this, "DELETE FROM Files WHERE name = ? and folder_id = ?", __FILE__,
+                     __LINE__);
+    change.BindTextView(1, file.name, __FILE__, __LINE__);
+    change.BindInt64(2, folderId, __FILE__, __LINE__);
+    change.Execute(__FILE__, __LINE__);
+    cost = change.TakeCost();
+  }
+  IndexForRemovals(cost);
+}
+
+// SQLite removes a file by walking its folder. An index by folder and name pays for itself when
+// such walks have cost as much as it does.
+void PhotoDB::IndexForRemovals(int cost) const {
+  constexpr long long negligibleCost = 100'000;
+  constexpr long long indexCostPerFile = 10;
+
+  Knowledge& known = Known();
+  known.removalCost += cost;
+  if (asking_ == Asking::Always || known.transaction == 0 || known.indexed ||
+      known.removalCost < negligibleCost) {
+    return;
+  }
+  if (known.indexCost == 0) {
+    Statement query(*this, "SELECT max(file_id) FROM Files", __FILE__, __LINE__);
+    known.indexCost = query.Fetch(__FILE__, __LINE__) ? query.GetInt64(0) * indexCostPerFile : 0;
+  }
+  if (known.removalCost >= known.indexCost) {
+    CreateTransientIndex("CREATE INDEX Files_merge ON Files(folder_id, name)",
+                         "DROP INDEX Files_merge", __FILE__, __LINE__);
+    known.indexed = true;
+  }
 }
 
 void PhotoDB::GetFolderFiles(long long folderId, std::vector<File*>& files) const {

@@ -4,8 +4,12 @@
 
 #include "orvadb/DB.h"
 
+#include <limits>
 #include <memory>
+#include <optional>
 #include <string>
+#include <string_view>
+#include <unordered_set>
 #include <vector>
 
 namespace orva::db {
@@ -38,10 +42,13 @@ public:
     std::string message_;
   };
 
+  /// Whether a statement whose answer is known is asked all the same: for tests, which compare.
+  enum class Asking { WhenUnknown, Always };
+
   /// Makes sure that the directory for the database exists at `location`; opens nothing. Throws
   /// Error when there can be none, and util::Exception when a new one cannot be made accessible
   /// to everybody.
-  explicit PhotoDB(const std::string& location);
+  explicit PhotoDB(const std::string& location, Asking asking = Asking::WhenUnknown);
 
   /// Opens the database; creates it when there is none, else loads `status` from it.
   void Init();
@@ -110,16 +117,60 @@ public:
   void UpdateStatus() const;
 
 private:
+  /// What this object knows of the content in the running transaction, in which nobody else
+  /// writes. Every removal makes it forget.
+  struct Knowledge {
+    static constexpr long long NONE = std::numeric_limits<long long>::max();
+
+    unsigned long long transaction = 0; ///< the one that all this is about
+
+    /// Folders with this id and above were inserted by this object since it last forgot, and hold
+    /// only files that it has added since.
+    long long firstOwnFolder = NONE;
+    /// The greatest path of those files.
+    std::string greatestPath;
+
+    /// The folder of the last file added.
+    std::string folderPath;
+    std::string folderVolume;
+    long long folderId = NONE;
+
+    /// What looking for files in it has cost, and had when its names were last wanted.
+    long long folderCost = 0;
+    long long triedCost = 0;
+    /// The names of all its files, once they are known.
+    using Names = std::unordered_set<std::string>;
+    std::optional<Names> names;
+
+    /// What removing files has cost, and what an index for that would; 0 when not known yet.
+    long long removalCost = 0;
+    long long indexCost = 0;
+    bool indexed = false;
+
+    /// Something was removed: only what it has cost stays known.
+    void Forget();
+    void EnterFolder(long long id, std::string_view path, const std::string& volume);
+  };
+
   std::string FilePath() const;
   void LoadStatus();
-  long long FindFolder(const std::string& path) const;
-  long long FindFolder(const std::string& path, const std::string& volume) const;
+  long long FindFolder(std::string_view path) const;
+  long long FindFolder(std::string_view path, const std::string& volume) const;
+  bool IsFilePresent(const std::string& volume, const db::File& file,
+                     std::string_view folderPath) const;
+  void LearnNames(const std::string& volume, int cost) const;
+  void IndexForRemovals(int cost) const;
+  Knowledge& Known() const;
 
   std::string dbLocation; ///< the directory of the database file
 
 public:
   /// Memory copy of the status row; who changes the content sets `mdate` before UpdateStatus.
   Status status;
+
+private:
+  Asking asking_;
+  mutable Knowledge known_; ///< changes no answer, only what is asked for it
 };
 
 } // namespace orva::dbmerger

@@ -57,7 +57,8 @@ public:
   }
 
 private:
-  int descriptor_ = open("/proc/self/fd/1", O_WRONLY | O_NONBLOCK | O_NOCTTY | O_CLOEXEC);
+  int descriptor_ =
+      open("/proc/self/fd/1", O_WRONLY | O_APPEND | O_NONBLOCK | O_NOCTTY | O_CLOEXEC);
 };
 
 /// Writes `text` by `writeSome`, which does not wait. A reader that pauses for too long loses the
@@ -84,16 +85,20 @@ void WriteToReader(std::string_view text, WriteSome writeSome) {
 } // namespace
 
 void writeLine(std::initializer_list<std::string_view> pieces) {
-  std::string line;
+  static std::string line; // keeps its memory for the next one
+  line.clear();
   for (const std::string_view piece : pieces) {
     line += piece;
   }
   line += '\n';
 
-  struct stat status {};
-  if (fstat(STDOUT_FILENO, &status) != 0 || S_ISREG(status.st_mode)) {
+  static const mode_t kind = [] {
+    struct stat status {};
+    return fstat(STDOUT_FILENO, &status) == 0 ? status.st_mode : S_IFREG;
+  }();
+  if (S_ISREG(kind)) {
     WriteAll(STDOUT_FILENO, line);
-  } else if (S_ISSOCK(status.st_mode)) {
+  } else if (S_ISSOCK(kind)) {
     WriteToReader(line, [](std::string_view text) {
       return send(STDOUT_FILENO, text.data(), text.size(), MSG_DONTWAIT | MSG_NOSIGNAL);
     });
