@@ -8,7 +8,6 @@ set format x "10^{%T}"
 set key top left
 set grid
 set style data linespoints
-stats "performance.dat" nooutput
 shapes = system("sed -n 's/^# //p' performance.dat")
 set multiplot layout 2, 3
 do for [shape in shapes] {

@@ -49,10 +49,8 @@ catalog::GeneratorPlan PlanOf(const std::string& shape, long long files) {
 /// One catalog, from the first merge of its files to their deletion.
 class Case {
 public:
-  Case(const Options& options, const Yardsticks& yardsticks, Results& results, std::string shape,
-       long long files)
-      : options_(options), yardsticks_(yardsticks), results_(results), shape_(std::move(shape)),
-        files_(files) {}
+  Case(const Options& options, Results& results, std::string shape, long long files)
+      : options_(options), results_(results), shape_(std::move(shape)), files_(files) {}
 
   void Run() {
     Generate();
@@ -122,9 +120,8 @@ private:
   }
 
   void MeasureYardsticks(Measurement& merge) const {
-    merge.floor.push_back(yardsticks_.Floor(CatalogPath(), FLOOR_DATABASE, library_.MountPoint()));
-    merge.horizon.push_back(
-        yardsticks_.Horizon(CatalogPath(), HORIZON_DATABASE, library_.MountPoint()));
+    merge.floor.push_back(MergeByFloor(CatalogPath(), FLOOR_DATABASE, library_.MountPoint()));
+    merge.horizon.push_back(MergeByHorizon(CatalogPath(), HORIZON_DATABASE, library_.MountPoint()));
     if (merge.floor.size() > 1) {
       return;
     }
@@ -142,7 +139,7 @@ private:
       if (!Time(merge, daemon)) {
         return false;
       }
-      merge.floor.push_back(yardsticks_.ReaderStatements(CatalogPath(), newest));
+      merge.floor.push_back(StepReaderStatements(CatalogPath(), newest));
       return true;
     });
   }
@@ -155,7 +152,7 @@ private:
       if (!Time(merge, daemon)) {
         return false;
       }
-      merge.floor.push_back(yardsticks_.ReaderStatements(CatalogPath(), before));
+      merge.floor.push_back(StepReaderStatements(CatalogPath(), before));
       RequireFiles(files_ + static_cast<long long>(merge.daemon.size()) * BATCH_SIZE);
       return true;
     });
@@ -232,7 +229,6 @@ private:
   static inline const std::string HORIZON_DATABASE = "/tmp/horizon.db";
 
   const Options& options_;
-  const Yardsticks& yardsticks_;
   Results& results_;
   const std::string shape_;
   const long long files_;
@@ -244,14 +240,11 @@ private:
 } // namespace
 
 Results Measure(const Options& options) {
-  const Yardsticks yardsticks;
   Results results;
-  results.floorStart = yardsticks.FloorStart();
-  results.shellStart = yardsticks.ShellStart();
   for (const std::string& shape : options.shapes) {
     for (const long long files :
          shape == "folders" ? std::vector<long long>{MANY_FOLDERS} : options.sizes) {
-      Case(options, yardsticks, results, shape, files).Run();
+      Case(options, results, shape, files).Run();
     }
   }
   return results;

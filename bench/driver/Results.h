@@ -25,7 +25,7 @@ inline const std::string BATCH_OF_100 = "batch of 100";
 inline const std::string DELETE_ALL = "deletion of every file";
 inline const std::string PEAK_MEMORY = "peak memory";
 
-/// The two sides of a micro-benchmark, in nanoseconds.
+/// The two sides of a micro-benchmark, in nanoseconds of processor time.
 struct MicroResult {
   std::string what;
   double ours = 0;
@@ -35,8 +35,6 @@ struct MicroResult {
 struct Results {
   std::vector<Measurement> measurements;
   std::vector<MicroResult> micro;
-  double floorStart = 0; ///< seconds that starting a process takes, which are not in the above
-  double shellStart = 0;
 };
 
 } // namespace orva::bench

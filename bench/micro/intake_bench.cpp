@@ -21,6 +21,7 @@
 #include <unistd.h>
 
 #include <array>
+#include <memory>
 #include <string>
 #include <thread>
 
@@ -60,15 +61,21 @@ private:
   std::jthread reader_;
 };
 
-/// Lets a listener read `bytes` from a connection that then ends.
-void Handle(dbmerger::NotificationListener& listener, const std::string& bytes) {
-  test::SocketPair connection;
-  const int room = static_cast<int>(bytes.size()) * 2;
-  setsockopt(connection.far.Descriptor(), SOL_SOCKET, SO_SNDBUF, &room, sizeof room);
-  connection.far.Write(bytes.data(), static_cast<unsigned>(bytes.size()));
-  connection.far.Close();
-  listener.ReadMessages(connection.near);
-}
+/// A connection with `bytes` on their way, behind which it ends.
+class Sent {
+public:
+  explicit Sent(const std::string& bytes) {
+    const int room = static_cast<int>(bytes.size()) * 2;
+    setsockopt(connection_.far.Descriptor(), SOL_SOCKET, SO_SNDBUF, &room, sizeof room);
+    connection_.far.Write(bytes.data(), static_cast<unsigned>(bytes.size()));
+    connection_.far.Close();
+  }
+
+  util::Stream& Stream() { return connection_.near; }
+
+private:
+  test::SocketPair connection_;
+};
 
 /// The daemon's insides in the scanned state, and a log.
 struct Scanned {
@@ -77,8 +84,9 @@ struct Scanned {
   dbmerger::NotificationListener listener;
 
   Scanned() {
-    Handle(listener, notify::Frame(test::Plugged(master.Path())) +
-                         notify::Frame(test::Scanned(master.Path())));
+    Sent sent(notify::Frame(test::Plugged(master.Path())) +
+              notify::Frame(test::Scanned(master.Path())));
+    listener.ReadMessages(sent.Stream());
     if (dbmerger::StateMachine::Instance().getCurrentState()->getStateType() !=
         dbmerger::State::MASTER_VOLUME_SCANNED) {
       throw std::runtime_error("not in the scanned state");
@@ -101,7 +109,13 @@ void Intake(benchmark::State& state, const std::string& message) {
     bytes += notify::Frame(message);
   }
   for (auto _ : state) {
-    Handle(daemon.listener, bytes);
+    state.PauseTiming();
+    auto sent = std::make_unique<Sent>(bytes);
+    state.ResumeTiming();
+    daemon.listener.ReadMessages(sent->Stream());
+    state.PauseTiming();
+    sent.reset();
+    state.ResumeTiming();
   }
   state.SetItemsProcessed(state.iterations() * MESSAGES);
 }
