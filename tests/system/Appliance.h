@@ -58,6 +58,7 @@ public:
   Syslog& Log() { return log_; }
   NotificationService& Service() { return service_; }
   DaemonProcess& Daemon() { return *daemon_; }
+  const DaemonProcess& Daemon() const { return *daemon_; }
 
 private:
   Syslog log_;

@@ -31,6 +31,9 @@ public:
   /// Waits for the daemon's end. Throws std::runtime_error after the deadline.
   End AwaitEnd();
 
+  /// The process, while it runs; -1 after its end.
+  pid_t Pid() const { return pid_; }
+
   /// False once AwaitEnd has returned.
   bool IsRunning() const { return pid_ != -1; }
 

@@ -1,0 +1,18 @@
+#pragma once
+
+#include <algorithm>
+#include <cstddef>
+#include <vector>
+
+namespace orva::bench {
+
+using Times = std::vector<double>;
+
+/// The median; `values` is not empty.
+inline double Median(Times values) {
+  const std::size_t middle = values.size() / 2;
+  std::sort(values.begin(), values.end());
+  return values.size() % 2 == 1 ? values[middle] : (values[middle - 1] + values[middle]) / 2;
+}
+
+} // namespace orva::bench

@@ -1,0 +1,12 @@
+#pragma once
+
+#include <string>
+#include <vector>
+
+namespace orva::bench {
+
+/// Runs a program to its end, its standard output in the file `output`. Returns the seconds from
+/// before its start to after its end. Throws std::runtime_error unless it ends with status 0.
+double RunProcess(const std::vector<std::string>& command, const std::string& output);
+
+} // namespace orva::bench

@@ -1,0 +1,40 @@
+#pragma once
+
+#include "Median.h"
+
+#include <string>
+#include <vector>
+
+namespace orva::bench {
+
+/// One thing measured on one catalog: values of the daemon and of what it is measured against,
+/// pair by pair. Seconds, but bytes for the memory.
+struct Measurement {
+  std::string what; ///< one of the names below
+  std::string shape;
+  long long files = 0;
+  Times daemon{};
+  Times floor{};       ///< or the shell with the reader's statements; empty where there is nothing
+  Times horizon{};     ///< empty where there is nothing
+  bool gaveUp = false; ///< the daemon has not come to an end within the limit
+};
+
+inline const std::string FIRST_MERGE = "first merge";
+inline const std::string UNCHANGED_MERGE = "unchanged merge";
+inline const std::string BATCH_OF_100 = "batch of 100";
+inline const std::string DELETE_ALL = "deletion of every file";
+inline const std::string PEAK_MEMORY = "peak memory";
+
+/// The two sides of a micro-benchmark, in nanoseconds of processor time.
+struct MicroResult {
+  std::string what;
+  double ours = 0;
+  double theirs = 0;
+};
+
+struct Results {
+  std::vector<Measurement> measurements;
+  std::vector<MicroResult> micro;
+};
+
+} // namespace orva::bench

@@ -1,0 +1,81 @@
+#include "Yardsticks.h"
+
+#include "Median.h"
+#include "Process.h"
+#include "ReaderStatements.h"
+
+#include <algorithm>
+#include <filesystem>
+#include <fstream>
+#include <vector>
+
+namespace orva::bench {
+
+namespace {
+
+const std::string SHELL = "sqlite3";
+const std::vector<std::string> SHELL_START{SHELL, ":memory:", ".read /dev/null"};
+const std::string SCHEMA = "bench/schema.sql";
+const std::string HORIZON_SCRIPT = "bench/horizon/merge.sql";
+const std::string READER_SCRIPT = "/tmp/reader.sql";
+
+/// Where the floor's lines go: a file in memory, as the daemon's.
+const std::string LINES = "/tmp/floor.out";
+const std::string NOWHERE = "/dev/null";
+
+/// What `command` takes beyond `start`, which starts the same program for nothing.
+double Beyond(const std::vector<std::string>& start, const std::vector<std::string>& command,
+              const std::string& output) {
+  constexpr int STARTS = 5;
+  /// What is so short as this cannot be told from the start.
+  constexpr double SHORTEST = 0.0001;
+  Times starts;
+  for (int i = 0; i < STARTS; ++i) {
+    starts.push_back(RunProcess(start, NOWHERE));
+  }
+  return std::max(RunProcess(command, output) - Median(starts), SHORTEST);
+}
+
+/// A value for the shell's parameters, as SQL.
+std::string Parameter(const std::string& name, const std::string& value) {
+  return ".parameter set " + name + " " + value;
+}
+
+std::string Quoted(const std::string& text) {
+  return "\"'" + text + "'\"";
+}
+
+void RemoveDatabase(const std::string& path) {
+  std::filesystem::remove(path);
+  std::filesystem::remove(path + "-journal");
+}
+
+} // namespace
+
+double MergeByFloor(const std::string& catalog, const std::string& merged,
+                    const std::string& volume) {
+  RemoveDatabase(merged);
+  return Beyond({FLOOR}, {FLOOR, SCHEMA, catalog, merged, volume}, LINES);
+}
+
+double MergeByHorizon(const std::string& catalog, const std::string& merged,
+                      const std::string& volume) {
+  RemoveDatabase(merged);
+  return Beyond(SHELL_START,
+                {SHELL, "-bail", "-cmd", Parameter(":catalog", Quoted(catalog)), "-cmd",
+                 Parameter(":volume", Quoted(volume)), merged, ".read " + HORIZON_SCRIPT},
+                NOWHERE);
+}
+
+double StepReaderStatements(const std::string& catalog, std::time_t since) {
+  std::ofstream(READER_SCRIPT) << SELECT_FOLDERS << ";\n"
+                               << Parameter("?1", std::to_string(since)) << '\n'
+                               << SELECT_CHANGED_FILES << ";\n"
+                               << Parameter("?1", std::to_string(RENDERED_STATUS)) << '\n'
+                               << COUNT_RENDERED << ";\n"
+                               << COUNT_PHOTOS << ";\n";
+  return Beyond(SHELL_START, {SHELL, "-bail", "-readonly", catalog, ".read " + READER_SCRIPT},
+                NOWHERE);
+}
+
+} // namespace orva::bench

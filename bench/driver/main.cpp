@@ -1,0 +1,51 @@
+// Measures the daemon beside what SQLite needs for the same work. Runs in a private root, started
+// by scripts/bench in the checkout.
+
+#include "Measurements.h"
+#include "MicroResults.h"
+#include "Options.h"
+#include "Report.h"
+
+#include <exception>
+#include <fstream>
+#include <iostream>
+
+namespace {
+
+using namespace orva::bench;
+
+void Run(const Options& options) {
+  Results results = Measure(options);
+  results.micro = ReadMicroResults(options.output + "/micro.csv");
+  const std::vector<Figure> figures = ComputeFigures(results);
+
+  std::ofstream table(options.output + "/results.txt");
+  WriteTable(table, figures, results);
+  WriteTable(std::cout, figures, results);
+  std::ofstream json(options.output + "/results.json");
+  WriteJson(json, figures, results);
+  std::ofstream plot(options.output + "/performance.dat");
+  WritePlotData(plot, results);
+}
+
+} // namespace
+
+int main(int argc, char** argv) {
+  try {
+    const Options options = ParseOptions(std::vector<std::string>(argv + 1, argv + argc));
+    if (options.help) {
+      std::cout << HELP;
+    } else {
+      Run(options);
+    }
+    return 0;
+  } catch (const std::invalid_argument& error) {
+    std::cerr << "bench: " << error.what() << "\nTry 'bench --help'.\n";
+    return 2;
+  } catch (const std::exception& error) {
+    std::cerr << "bench: " << error.what() << '\n';
+  } catch (const std::string& error) { // the database layer's
+    std::cerr << "bench: " << error << '\n';
+  }
+  return 1;
+}

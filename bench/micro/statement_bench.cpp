@@ -1,0 +1,68 @@
+// A statement by the database layer, which compiles a text once, and by SQLite's own interface,
+// compiled each time it is used.
+
+#include "orvadb/DB.h"
+#include "orvadb/Statement.h"
+
+#include <benchmark/benchmark.h>
+
+#include <sqlite3.h>
+
+#include <string>
+
+namespace orva::bench {
+namespace {
+
+const char* const TABLE = "CREATE TABLE Folders(folder_id INTEGER PRIMARY KEY AUTOINCREMENT, "
+                          "parent_folder_id INTEGER NOT NULL, name TEXT NOT NULL, modified_date "
+                          "INTEGER NOT NULL, volume TEXT NOT NULL)";
+const char* const INDEX = "CREATE INDEX Folders_path ON Folders(name)";
+const char* const ROW = "INSERT INTO Folders(parent_folder_id, name, modified_date, volume) "
+                        "VALUES(1, '/shares/A/Pictures/', 0, '/shares/A/')";
+const char* const QUERY = "select * FROM Folders where name = ?";
+const std::string PATH = "/shares/A/Pictures/";
+
+/// A database in a file of its own, /tmp being in memory.
+class OneFolder : public db::DB {
+public:
+  OneFolder() {
+    Open("/tmp/micro.db");
+    for (const char* const sql : {"DROP TABLE IF EXISTS Folders", TABLE, INDEX, ROW}) {
+      db::Statement(*this, sql, __FILE__, __LINE__).Execute(__FILE__, __LINE__);
+    }
+  }
+
+  using db::DB::Handle;
+};
+
+void KeptStatement(benchmark::State& state) {
+  const OneFolder database;
+  for (auto _ : state) {
+    db::Statement query(database, QUERY, __FILE__, __LINE__);
+    query.BindText(1, PATH, __FILE__, __LINE__);
+    if (!query.Fetch(__FILE__, __LINE__)) {
+      state.SkipWithError("no row");
+    }
+    benchmark::DoNotOptimize(query.GetInt64(0));
+  }
+}
+
+void CompiledStatement(benchmark::State& state) {
+  const OneFolder database;
+  for (auto _ : state) {
+    sqlite3_stmt* query = nullptr;
+    sqlite3_prepare_v2(database.Handle(), QUERY, -1, &query, nullptr);
+    sqlite3_bind_text(query, 1, PATH.data(), static_cast<int>(PATH.size()), SQLITE_STATIC);
+    if (sqlite3_step(query) != SQLITE_ROW) {
+      state.SkipWithError("no row");
+    }
+    benchmark::DoNotOptimize(sqlite3_column_int64(query, 0));
+    sqlite3_finalize(query);
+  }
+}
+
+BENCHMARK(KeptStatement)->Name("statement kept, or compiled each time/ours");
+BENCHMARK(CompiledStatement)->Name("statement kept, or compiled each time/theirs");
+
+} // namespace
+} // namespace orva::bench
