@@ -6,6 +6,7 @@
 
 #include <sqlite3.h>
 
+#include <cstddef>
 #include <new>
 
 namespace orva::db {
@@ -91,6 +92,10 @@ long long Statement::GetInt64(int column) const {
 }
 
 std::string Statement::GetText(int column) const {
+  return std::string(GetTextView(column));
+}
+
+std::string_view Statement::GetTextView(int column) const {
   const unsigned char* const text = sqlite3_column_text(statement_.get(), column);
   if (text == nullptr) {
     if (sqlite3_errcode(db_.handle_) == SQLITE_NOMEM) {
@@ -98,8 +103,8 @@ std::string Statement::GetText(int column) const {
     }
     return {};
   }
-  const int size = sqlite3_column_bytes(statement_.get(), column);
-  return {text, text + size};
+  return {reinterpret_cast<const char*>(text),
+          static_cast<std::size_t>(sqlite3_column_bytes(statement_.get(), column))};
 }
 
 std::time_t Statement::GetTime(int column) const {

@@ -38,15 +38,15 @@ std::string Path::Basic() const {
   return path_.substr(0, last + 1);
 }
 
-std::string MakePath(const std::string& directory, const std::string& name) {
+std::string MakePath(std::string_view directory, std::string_view name) {
   if (directory.empty()) {
-    return name;
+    return std::string(name);
   }
   const std::size_t directoryEnd = directory.find_last_not_of(SEPARATOR) + 1;
   const std::size_t nameBegin = std::min(name.find_first_not_of(SEPARATOR), name.size());
   std::string path;
   path.reserve(directoryEnd + 1 + name.size() - nameBegin);
-  path.append(directory, 0, directoryEnd).append(1, SEPARATOR).append(name, nameBegin);
+  path.append(directory, 0, directoryEnd).append(1, SEPARATOR).append(name.substr(nameBegin));
   return path;
 }
 

@@ -22,6 +22,9 @@ using db::Statement;
 constexpr int ROOT_FOLDER_CATEGORY = 4;
 constexpr long long TRANSCODED = 3;
 
+/// What a list has room for from the beginning: nobody knows how long it gets before it is read.
+constexpr std::size_t EXPECTED_ITEMS = 4096;
+
 /// The row that stands for the volume itself, which has none in its catalog.
 std::unique_ptr<db::Folder> RootFolder(const std::string& volumeMountPoint) {
   auto folder = std::make_unique<db::Folder>();
@@ -38,8 +41,8 @@ std::unique_ptr<Item> ReadItem(const Statement& row, const std::string& base) {
   auto item = std::make_unique<Item>();
   item->id = row.GetInt64(0);
   item->folderId = row.GetInt64(1);
-  item->path = util::MakePath(base, row.GetText(2));
-  item->name = row.GetText(3);
+  item->path = util::MakePath(base, row.GetTextView(2));
+  item->name = row.GetTextView(3);
   item->category = row.GetInt(4);
   item->lastModifiedDate = row.GetInt(5);
   item->isBackup = row.GetBool(6);
@@ -56,6 +59,7 @@ std::unique_ptr<Item> ReadItem(const Statement& row, const std::string& base) {
 util::OwnerVector<db::Folder> ReadFolders(const std::string& volumeMountPoint,
                                           const db::VolumeDB& catalog) {
   util::OwnerVector<db::Folder> folders;
+  folders.reserve(EXPECTED_ITEMS);
   folders.push_back(RootFolder(volumeMountPoint));
 
   // The unary plus here and below keeps SQLite from an index on a flag.
@@ -73,6 +77,7 @@ util::OwnerVector<db::Folder> ReadFolders(const std::string& volumeMountPoint,
 util::OwnerVector<db::File> ReadChangedFiles(const std::string& volumeMountPoint,
                                              const db::VolumeDB& catalog, std::time_t since) {
   util::OwnerVector<db::File> files;
+  files.reserve(EXPECTED_ITEMS);
   const std::string base = util::Path(volumeMountPoint).Basic();
   Statement query(catalog,
                   "SELECT f.id,f.folderId,f.path,f.name,f.category,f.lastModifiedDate,f.isBackup,"
@@ -84,7 +89,7 @@ util::OwnerVector<db::File> ReadChangedFiles(const std::string& volumeMountPoint
   query.BindTime(1, since, __FILE__, __LINE__);
   while (query.Step(__FILE__, __LINE__) == Statement::ROW) {
     auto file = ReadItem<db::File>(query, base);
-    file->ext = query.GetText(12);
+    file->ext = query.GetTextView(12);
     file->size = query.GetInt64(13);
     files.push_back(std::move(file));
   }

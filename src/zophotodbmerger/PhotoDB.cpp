@@ -380,8 +380,8 @@ void PhotoDB::LearnNames(const std::string& volume, int cost) const {
     if (names.size() == limit) {
       return;
     }
-    if (query.GetText(4) == volume) {
-      names.insert(query.GetText(2));
+    if (query.GetTextView(4) == volume) {
+      names.emplace(query.GetTextView(2));
     }
   }
   known.names = std::move(names);

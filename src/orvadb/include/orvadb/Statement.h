@@ -58,6 +58,8 @@ public:
   long long GetInt64(int column) const;
   /// The text with its NUL bytes; NULL gives the empty string.
   std::string GetText(int column) const;
+  /// The same where it lies: valid until the next step or getter of the column.
+  std::string_view GetTextView(int column) const;
   std::time_t GetTime(int column) const;
   /// True for a non-zero integer.
   bool GetBool(int column) const;

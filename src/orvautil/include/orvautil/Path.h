@@ -1,6 +1,7 @@
 #pragma once
 
 #include <string>
+#include <string_view>
 
 namespace orva::util {
 
@@ -33,6 +34,6 @@ private:
 /// `directory` and `name` joined by exactly one separator, whether or not the one ends in some
 /// or the other begins with some. An empty directory gives the name alone, an empty name the
 /// directory with a separator behind it.
-std::string MakePath(const std::string& directory, const std::string& name);
+std::string MakePath(std::string_view directory, std::string_view name);
 
 } // namespace orva::util
