@@ -80,7 +80,7 @@ void AddFigures(std::vector<Figure>& figures, const Measurement& measured) {
                                      Ratio(measured.daemon, measured.floor)),
                               measured.files >= LARGEST, Bound::AtMost, 1.5));
   } else if (measured.what == PEAK_MEMORY) {
-    const double files = static_cast<double>(measured.files);
+    const auto files = static_cast<double>(measured.files);
     const auto peak = MedianOf(measured.daemon);
     figures.push_back(Bounded(
         figure("peak memory over idle, MiB", peak ? std::optional(*peak / MEBIBYTE) : std::nullopt),

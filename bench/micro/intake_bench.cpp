@@ -108,7 +108,7 @@ void Intake(benchmark::State& state, const std::string& message) {
   for (int i = 0; i < MESSAGES; ++i) {
     bytes += notify::Frame(message);
   }
-  for (auto _ : state) {
+  while (state.KeepRunning()) {
     state.PauseTiming();
     auto sent = std::make_unique<Sent>(bytes);
     state.ResumeTiming();
@@ -124,7 +124,7 @@ void BareParser(benchmark::State& state, const std::string& message, bool isLogg
   Daemon();
   xercesc::XercesDOMParser parser;
   const auto* const bytes = reinterpret_cast<const XMLByte*>(message.data());
-  for (auto _ : state) {
+  while (state.KeepRunning()) {
     for (int i = 0; i < MESSAGES; ++i) {
       parser.parse(xercesc::MemBufInputSource(bytes, message.size(), "message"));
       benchmark::DoNotOptimize(parser.getDocument()->getDocumentElement());

@@ -37,7 +37,7 @@ public:
 
 void KeptStatement(benchmark::State& state) {
   const OneFolder database;
-  for (auto _ : state) {
+  while (state.KeepRunning()) {
     db::Statement query(database, QUERY, __FILE__, __LINE__);
     query.BindText(1, PATH, __FILE__, __LINE__);
     if (!query.Fetch(__FILE__, __LINE__)) {
@@ -49,7 +49,7 @@ void KeptStatement(benchmark::State& state) {
 
 void CompiledStatement(benchmark::State& state) {
   const OneFolder database;
-  for (auto _ : state) {
+  while (state.KeepRunning()) {
     sqlite3_stmt* query = nullptr;
     sqlite3_prepare_v2(database.Handle(), QUERY, -1, &query, nullptr);
     sqlite3_bind_text(query, 1, PATH.data(), static_cast<int>(PATH.size()), SQLITE_STATIC);
