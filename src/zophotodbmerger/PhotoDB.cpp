@@ -363,6 +363,7 @@ bool PhotoDB::IsFilePresent(const std::string& volume, const db::File& file,
 void PhotoDB::LearnNames(const std::string& volume, int cost) const {
   constexpr int dearCost = 500;
   constexpr int costPerName = 8;
+  constexpr std::size_t fewNames = 2'000;
   constexpr std::size_t mostNames = 200'000;
 
   Knowledge& known = Known();
@@ -372,7 +373,8 @@ void PhotoDB::LearnNames(const std::string& volume, int cost) const {
     return;
   }
   known.triedCost = known.folderCost;
-  const auto limit = std::min(mostNames, static_cast<std::size_t>(known.folderCost / costPerName));
+  const auto limit =
+      std::clamp(static_cast<std::size_t>(known.folderCost / costPerName), fewNames, mostNames);
   Knowledge::Names names;
   Statement query(*this, "SELECT * FROM Files WHERE folder_id = ? ", __FILE__, __LINE__);
   query.BindInt64(1, known.folderId, __FILE__, __LINE__);
