@@ -361,7 +361,8 @@ bool PhotoDB::IsFilePresent(const std::string& volume, const db::File& file,
 // SQLite looks for a file by its name alone, through all folders that have one of that name. Where
 // that is dear, knowing all the names of a folder is cheaper, unless the folder is large.
 void PhotoDB::LearnNames(const std::string& volume, int cost) const {
-  constexpr int dearCost = 500;
+  constexpr int dearCost = 40;
+  constexpr long long enoughCost = 4'000;
   constexpr int costPerName = 8;
   constexpr std::size_t fewNames = 2'000;
   constexpr std::size_t mostNames = 200'000;
@@ -369,7 +370,7 @@ void PhotoDB::LearnNames(const std::string& volume, int cost) const {
   Knowledge& known = Known();
   known.folderCost += cost;
   if (asking_ == Asking::Always || known.transaction == 0 || cost < dearCost ||
-      known.folderCost < known.triedCost * 2) {
+      known.folderCost < std::max(enoughCost, known.triedCost * 2)) {
     return;
   }
   known.triedCost = known.folderCost;
