@@ -83,7 +83,7 @@ TEST(OwnerVector, MovingHandsTheElementsOver) {
   {
     const OwnerVector<Element> target(std::move(source));
     EXPECT_THAT(target.Elements(), ElementsAre(element));
-    EXPECT_TRUE(source.empty()); // NOLINT: what is left behind is the point
+    EXPECT_TRUE(source.empty()); // NOLINT(bugprone-use-after-move): the point
     EXPECT_THAT(deleted, IsEmpty());
   }
   EXPECT_THAT(deleted, ElementsAre("only"));

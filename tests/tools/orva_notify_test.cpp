@@ -137,7 +137,7 @@ private:
     dup2(output, STDERR_FILENO);
     std::vector<char*> pointers;
     for (const auto& argument : arguments) {
-      pointers.push_back(const_cast<char*>(argument.c_str())); // NOLINT: what execv takes
+      pointers.push_back(const_cast<char*>(argument.c_str())); // execv writes nothing
     }
     pointers.push_back(nullptr);
     execv(pointers.front(), pointers.data());
