@@ -48,6 +48,7 @@ void AddPhoto(TestCatalog& catalog, int folder, int photo, long stamp) {
 }
 
 TestCatalog MakeCatalog(const std::string& volume) {
+  std::filesystem::remove_all(volume);
   TestCatalog catalog(volume);
   // The smallest pages, so that there are more to be read.
   catalog.Rows().Run("PRAGMA page_size = 512");

@@ -12,7 +12,34 @@ namespace {
 const std::string MERGED = "/.zophotos";
 const std::string CATALOG = "/shares/Vol/";
 
-using FileFaultTest = FaultTest;
+class FileFaultTest : public FaultTest {
+protected:
+  /// A first creation where the database of before is gone, but neither its journal nor what an
+  /// earlier creation has left.
+  Scenario CreationAmongLeftovers() {
+    const Scenario merge = LaterMerge();
+    const Fault stop = Stops(MERGED).front();
+    const auto run = [&](int nth) {
+      int chances = 0;
+      OutputOf([&] { chances = stop.run(nth, merge.operation).chances; });
+      return chances;
+    };
+    const int end = run(0);
+    LayFiles(merge.files);
+    run(end);
+    Files files = TakeFiles();
+    const std::string journal = files->at("zophotos.db-journal");
+    (*files)["zophotos.db.new"] = files->at("zophotos.db");
+    (*files)["zophotos.db.new-journal"] = journal;
+    files->erase("zophotos.db");
+
+    LayFiles(std::nullopt);
+    Scenario scenario = Creation();
+    scenario.name = "a first creation among leftovers";
+    scenario.files = files;
+    return scenario;
+  }
+};
 
 TEST_F(FileFaultTest, FirstMergeIsAllOrNothing) {
   ExpectToSurvive(FirstMerge(), FileErrors(MERGED, "merged database"));
@@ -38,6 +65,10 @@ TEST_F(FileFaultTest, NewDatabaseIsCompleteOrNotThere) {
   ExpectToSurvive(Creation(), FileErrors(MERGED, "merged database"));
 }
 
+TEST_F(FileFaultTest, NewDatabaseAmongLeftoversIsCompleteOrNotThere) {
+  ExpectToSurvive(CreationAmongLeftovers(), FileErrors(MERGED, "merged database"));
+}
+
 TEST_F(FileFaultTest, FailedOpeningChangesNothing) {
   ExpectToSurvive(Opening(), FileErrors(MERGED, "merged database"));
 }
@@ -48,7 +79,7 @@ TEST_F(FileFaultTest, RemovalOfAllVolumesCanBeRepeated) {
 
 // The process is stopped, or the appliance loses its power.
 
-using StopTest = FaultTest;
+using StopTest = FileFaultTest;
 
 TEST_F(StopTest, FirstMergeIsAllOrNothing) {
   ExpectToSurvive(FirstMerge(), Stops(MERGED));
@@ -72,6 +103,10 @@ TEST_F(StopTest, RemovalLeavesNothingBehindForEver) {
 
 TEST_F(StopTest, NewDatabaseIsCompleteOrNotThere) {
   ExpectToSurvive(Creation(), Stops(MERGED));
+}
+
+TEST_F(StopTest, NewDatabaseAmongLeftoversIsCompleteOrNotThere) {
+  ExpectToSurvive(CreationAmongLeftovers(), Stops(MERGED));
 }
 
 TEST_F(StopTest, RemovalOfAllVolumesCanBeRepeated) {
