@@ -50,7 +50,8 @@ void AddPhoto(TestCatalog& catalog, int folder, int photo, long stamp) {
 TestCatalog MakeCatalog(const std::string& volume) {
   std::filesystem::remove_all(volume);
   TestCatalog catalog(volume);
-  // The smallest pages, so that there are more to be read.
+  // The smallest pages, and every statement reads its own, so that there are more to be read.
+  catalog.Rows().Run("PRAGMA default_cache_size = 1");
   catalog.Rows().Run("PRAGMA page_size = 512");
   catalog.Rows().Run("VACUUM");
   for (int folder = 1; folder <= FOLDERS; ++folder) {
