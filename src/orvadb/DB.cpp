@@ -149,7 +149,7 @@ void DB::RefuseComputedValues(const std::string& table) const {
   const bool written = sqlite3_db_readonly(handle_, "main") == 0;
   const auto refuse = [&](bool computed, const char* what) {
     if (computed) {
-      throw util::FormatString("%s:%d: %s in table %s of '%s'", __FILE__, __LINE__, what,
+      throw util::FormatString("%s:%d: %s in table %.500s of '%s'", __FILE__, __LINE__, what,
                                table.c_str(), path_.c_str());
     }
   };
