@@ -6,6 +6,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <array>
 #include <cerrno>
 #include <cstdio>
@@ -36,8 +37,13 @@ private:
   int descriptor_;
 };
 
-/// Bytes of the regular file at `path`, 0 when there is none.
+/// Bytes of the regular file at `path`, 0 when there is none. A hole takes no room and counts for
+/// little: what bounds the work on a file is not to be had for nothing. A file system that
+/// compresses, or has not yet placed what was just written, has few holes by this measure.
 long long RegularSize(const std::string& path) {
+  constexpr long long blockSize = 512;
+  constexpr long long mostFree = 4 << 20;
+  constexpr long long mostPerPlaced = 16;
   struct stat status {};
   if (lstat(path.c_str(), &status) != 0) {
     return 0;
@@ -45,7 +51,13 @@ long long RegularSize(const std::string& path) {
   if (!S_ISREG(status.st_mode)) {
     throw util::FormatString("%s:%d: '%s' is not a regular file", __FILE__, __LINE__, path.c_str());
   }
-  return status.st_size;
+  // SQLite writes into these and gives them the owner of the database: another name may be that of
+  // somebody else's file.
+  if (status.st_nlink > 1) {
+    throw util::FormatString("%s:%d: '%s' has another name", __FILE__, __LINE__, path.c_str());
+  }
+  return std::min<long long>(status.st_size,
+                             mostFree + mostPerPlaced * blockSize * status.st_blocks);
 }
 
 void Synchronise(const std::string& path, int flags, bool mayBeUnsupported) {
