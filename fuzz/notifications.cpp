@@ -1,5 +1,7 @@
 // The bytes of a connection, up to the call of the state's handler: framing, validation, parsing,
-// the registry. The input's first byte decides in what pieces the others arrive.
+// the registry. The input's first byte decides in what pieces the others arrive; a byte of value 31
+// stands for many blanks, so that short inputs make messages of the greatest length and longer
+// ones.
 
 #include "Fuzzing.h"
 
@@ -29,6 +31,22 @@ using fuzz::Require;
 
 const std::string DELIMITER(4, '\0');
 const std::string GOOD = R"(<ORVANotification Name="End" MountPoint="/shares/Good"/>)";
+
+/// The bytes that an input stands for.
+std::string Expand(std::string_view input) {
+  constexpr char blanks = 31;
+  constexpr std::size_t count = 4096;
+  constexpr std::size_t most = 262144;
+  std::string bytes;
+  for (const char byte : input) {
+    if (byte == blanks && bytes.size() < most) {
+      bytes.append(count, ' ');
+    } else {
+      bytes += byte;
+    }
+  }
+  return bytes;
+}
 
 struct Event {
   const char* kind;
@@ -158,8 +176,9 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
   if (size == 0) {
     return 0;
   }
+  const std::string_view input(reinterpret_cast<const char*>(data), size);
   // The "x" ends a run of zeros, which could have begun a delimiter.
-  const std::string bytes = std::string(data + 1, data + size) + "x" + DELIMITER + GOOD + DELIMITER;
+  const std::string bytes = Expand(input.substr(1)) + "x" + DELIMITER + GOOD + DELIMITER;
 
   const Outcome inPieces = Receive(bytes, data[0]);
   Examine(inPieces, CountMessages(bytes));
