@@ -15,11 +15,19 @@ namespace orva::fuzz {
 namespace {
 
 std::vector<LogLine> log;
+std::vector<LogLine> taken; ///< by the last TakeLog, for the report of a finding
+
+void Print(const std::vector<LogLine>& lines) {
+  for (const LogLine& line : lines) {
+    std::cerr << "logged: " << line.text << '\n';
+  }
+}
 
 } // namespace
 
 std::vector<LogLine> TakeLog() {
-  return std::exchange(log, {});
+  taken = std::exchange(log, {});
+  return taken;
 }
 
 void ResetStandardOutput() {
@@ -30,6 +38,8 @@ void ResetStandardOutput() {
 
 void Require(bool holds, const char* what) {
   if (!holds) {
+    Print(taken);
+    Print(log);
     std::cerr << "It does not hold that " << what << std::endl;
     std::abort();
   }

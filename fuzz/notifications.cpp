@@ -48,6 +48,9 @@ std::string Expand(std::string_view input) {
   return bytes;
 }
 
+const fuzz::LogLine SKIPPED{LOG_LOCAL1 | LOG_ERR,
+                            "MessageProcessor:: message of more than 65536 bytes skipped"};
+
 struct Event {
   const char* kind;
   std::string mountPoint;
@@ -127,23 +130,25 @@ Outcome Receive(std::string_view bytes, std::uint8_t firstPiece) {
   return outcome;
 }
 
-std::size_t CountMessages(std::string_view bytes) {
-  std::size_t count = 0;
-  for (std::size_t end = 0; (end = bytes.find(DELIMITER, end)) != std::string_view::npos;
-       end += DELIMITER.size()) {
-    ++count;
+/// The lengths of the messages in a stream.
+std::vector<std::size_t> Cut(std::string_view bytes) {
+  std::vector<std::size_t> lengths;
+  std::size_t begin = 0;
+  for (std::size_t end = 0; (end = bytes.find(DELIMITER, begin)) != std::string_view::npos;) {
+    lengths.push_back(end - begin);
+    begin = end + DELIMITER.size();
   }
-  return count;
+  return lengths;
 }
 
 bool IsMountPoint(const std::string& text) {
   return text.ends_with('/') && text.find('\0') == std::string::npos;
 }
 
-void Examine(const Outcome& outcome, std::size_t messages) {
+void Examine(const Outcome& outcome, const std::vector<std::size_t>& lengths) {
   Require(!outcome.events.empty() && outcome.events.back() == Event{"Transcoded", "/shares/Good/"},
           "a good message behind anything is handled");
-  Require(outcome.events.size() <= messages, "a message is one event at most");
+  Require(outcome.events.size() <= lengths.size(), "a message is one event at most");
   Require(std::all_of(outcome.events.begin(), outcome.events.end(),
                       [](const Event& event) { return IsMountPoint(event.mountPoint); }),
           "an event names a mount point that ends in a separator");
@@ -151,8 +156,14 @@ void Examine(const Outcome& outcome, std::size_t messages) {
     return line.priority == (LOG_LOCAL1 | LOG_ERR);
   };
   Require(std::count_if(outcome.log.begin(), outcome.log.end(), isError) <=
-              static_cast<std::ptrdiff_t>(messages),
+              static_cast<std::ptrdiff_t>(lengths.size()),
           "a message is one line about an error at most");
+  const auto isTooLong = [](std::size_t length) {
+    return length > util::MessageProcessor::MAXIMUM_MESSAGE_LENGTH;
+  };
+  Require(std::count(outcome.log.begin(), outcome.log.end(), SKIPPED) ==
+              std::count_if(lengths.begin(), lengths.end(), isTooLong),
+          "every message that is too long is told of");
   for (auto volume = outcome.volumes.begin(); volume != outcome.volumes.end(); ++volume) {
     Require(IsMountPoint(*volume) && util::Path(*volume).Exists(), "a registered volume exists");
     Require(std::find(outcome.volumes.begin(), volume, *volume) == volume,
@@ -181,7 +192,7 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
   const std::string bytes = Expand(input.substr(1)) + "x" + DELIMITER + GOOD + DELIMITER;
 
   const Outcome inPieces = Receive(bytes, data[0]);
-  Examine(inPieces, CountMessages(bytes));
+  Examine(inPieces, Cut(bytes));
   if (data[0] != 0) {
     Require(inPieces == Receive(bytes, 0), "the pieces that a message comes in do not matter");
   }
