@@ -7,7 +7,6 @@
 #include <sqlite3.h>
 
 #include <cstddef>
-#include <new>
 
 namespace orva::db {
 
@@ -91,6 +90,10 @@ long long Statement::GetInt64(int column) const {
   return sqlite3_column_int64(statement_.get(), column);
 }
 
+bool Statement::IsNull(int column) const {
+  return sqlite3_column_type(statement_.get(), column) == SQLITE_NULL;
+}
+
 std::string Statement::GetText(int column) const {
   return std::string(GetTextView(column));
 }
@@ -99,7 +102,7 @@ std::string_view Statement::GetTextView(int column) const {
   const unsigned char* const text = sqlite3_column_text(statement_.get(), column);
   if (text == nullptr) {
     if (sqlite3_errcode(db_.handle_) == SQLITE_NOMEM) {
-      throw std::bad_alloc();
+      throw ErrorMessage(db_.handle_, sqlite3_sql(statement_.get()), __FILE__, __LINE__);
     }
     return {};
   }
