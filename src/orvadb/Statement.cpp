@@ -14,10 +14,16 @@ static_assert(Statement::ROW == SQLITE_ROW && Statement::DONE == SQLITE_DONE);
 
 namespace {
 
-Connection& OpenConnection(Connection* connection, const char* sql, const char* file,
-                           unsigned int line) {
+Connection& OpenConnection(Connection* connection, sqlite3* handle, const char* sql,
+                           const char* file, unsigned int line) {
   if (connection == nullptr) {
     throw util::FormatString("%s:%u: database not open in \"%s\"", file, line, sql);
+  }
+  // SQLite rolls back by itself after some failures. What the transaction's owner still does would
+  // then be written at once, statement by statement.
+  if (connection->transaction != 0 && sqlite3_get_autocommit(handle) != 0) {
+    throw util::FormatString("%s:%u: \"%s\" in a transaction that was rolled back: %s", file, line,
+                             sql, connection->failedStep.c_str());
   }
   return *connection;
 }
@@ -25,8 +31,8 @@ Connection& OpenConnection(Connection* connection, const char* sql, const char* 
 } // namespace
 
 Statement::Statement(const DB& db, const char* sql, const char* file, unsigned int line)
-    : db_(db),
-      statement_(OpenConnection(db.connection_.get(), sql, file, line).CheckOut(sql, file, line)) {}
+    : db_(db), statement_(OpenConnection(db.connection_.get(), db.handle_, sql, file, line)
+                              .CheckOut(sql, file, line)) {}
 
 int Statement::Step(const char* file, unsigned int line) {
   const int code = sqlite3_step(statement_.get());
