@@ -145,6 +145,8 @@ void MessageProcessor::ProcessMessage(Stream& stream, const unsigned char* data,
 void MessageProcessor::ParseMessage(Stream& stream, const unsigned char* data,
                                     unsigned long length) const {
   try {
+    // The parser keeps what it made of an ill-formed message, one document for each.
+    parser_->resetDocumentPool();
     parser_->parse(xercesc::MemBufInputSource(data, length, "message"));
   } catch (const xercesc::SAXException& exception) {
     throw IllFormedMessage(XMLCh2string(exception.getMessage()), __FILE__, __LINE__);
