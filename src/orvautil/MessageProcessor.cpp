@@ -30,6 +30,9 @@ constexpr std::size_t CHUNK_SIZE = 16384;
 /// goes deeper is no document, and the parser would need as much memory again to find that out.
 constexpr std::size_t DEEPEST_NESTING = MessageProcessor::MAXIMUM_MESSAGE_LENGTH / 7;
 
+/// Bytes of a message that leaves the parser with no more memory than is good to keep.
+constexpr unsigned long ORDINARY_LENGTH = 4096;
+
 /// A message that is no XML document we take.
 class IllFormedMessage : public Exception {
   using Exception::Exception;
@@ -173,9 +176,13 @@ void MessageProcessor::ProcessMessage(Stream& stream, const unsigned char* data,
 
 void MessageProcessor::ParseMessage(Stream& stream, const unsigned char* data,
                                     unsigned long length) const {
+  if (spent_) {
+    parser_ = std::make_unique<MessageParser>();
+  }
+  spent_ = length > ORDINARY_LENGTH;
+  // It keeps what it made of an ill-formed message, one document for each.
+  parser_->resetDocumentPool();
   try {
-    // The parser keeps what it made of an ill-formed message, one document for each.
-    parser_->resetDocumentPool();
     parser_->parse(xercesc::MemBufInputSource(data, length, "message"));
   } catch (const xercesc::SAXException& exception) {
     throw IllFormedMessage(XMLCh2string(exception.getMessage()), __FILE__, __LINE__);
@@ -185,7 +192,7 @@ void MessageProcessor::ParseMessage(Stream& stream, const unsigned char* data,
     throw IllFormedMessage(XMLCh2string(exception.getMessage()), __FILE__, __LINE__);
   } catch (const xercesc::OutOfMemoryException&) {
     // The parser believes that it is still parsing and would refuse every further message.
-    parser_ = std::make_unique<MessageParser>();
+    spent_ = true;
     throw;
   }
   const std::unique_ptr<xercesc::DOMDocument, DocumentRelease> document(parser_->adoptDocument());
