@@ -13,6 +13,7 @@
 #include <regex>
 #include <stdexcept>
 #include <system_error>
+#include <utility>
 
 namespace orva::test {
 
@@ -69,9 +70,10 @@ Syslog::~Syslog() {
   unlink("/dev/log");
 }
 
-std::vector<LogLine> Syslog::Lines() const {
+std::vector<LogLine> Syslog::Lines(std::size_t first) const {
   const std::unique_lock lock = LockBehindAllSent();
-  return lines_;
+  return {lines_.begin() + static_cast<std::ptrdiff_t>(std::min(first, lines_.size())),
+          lines_.end()};
 }
 
 // A socket keeps the order of what is sent to it: when our mark has come, all before it has.
@@ -93,8 +95,11 @@ bool Syslog::Await(const Condition& condition) const {
 }
 
 bool Syslog::Await(const LogLine& line) const {
-  return Await([&line](const std::vector<LogLine>& lines) {
-    return std::find(lines.begin(), lines.end(), line) != lines.end();
+  std::size_t seen = 0;
+  return Await([&](const std::vector<LogLine>& lines) {
+    const auto unseen =
+        lines.begin() + static_cast<std::ptrdiff_t>(std::exchange(seen, lines.size()));
+    return std::find(unseen, lines.end(), line) != lines.end();
   });
 }
 
