@@ -1,5 +1,7 @@
 #include "orvadb/Connection.h"
 
+#include "WorkLimit.h"
+
 #include "orvautil/FormatString.h"
 
 #include <sqlite3.h>
@@ -17,7 +19,14 @@ void Connection::CheckIn::operator()(sqlite3_stmt* statement) const noexcept {
   place->reset(statement);
 }
 
+Connection::Connection(sqlite3* handle, int busyTimeout, long long bytes)
+    : handle_(handle), busyTimeout_(busyTimeout),
+      workLimit_(std::make_unique<WorkLimit>(handle, bytes)) {}
+
+Connection::~Connection() = default;
+
 Connection::CheckedOut Connection::CheckOut(const char* sql, const char* file, unsigned line) {
+  workLimit_->Restart();
   const auto kept = statements_.find(std::string_view(sql));
   Compiled& place = kept != statements_.end() ? kept->second : statements_[sql];
   Compiled compiled = place ? std::move(place) : Compile(sql, file, line);
@@ -26,8 +35,9 @@ Connection::CheckedOut Connection::CheckOut(const char* sql, const char* file, u
 
 Connection::Compiled Connection::Compile(const char* sql, const char* file, unsigned line) const {
   sqlite3_stmt* statement = nullptr;
-  const int code =
-      sqlite3_prepare_v3(handle_, sql, -1, SQLITE_PREPARE_PERSISTENT, &statement, nullptr);
+  // A virtual table would run a module's code on a stranger's data.
+  const int code = sqlite3_prepare_v3(
+      handle_, sql, -1, SQLITE_PREPARE_PERSISTENT | SQLITE_PREPARE_NO_VTAB, &statement, nullptr);
   Compiled compiled(statement);
   if (code != SQLITE_OK) {
     throw ErrorMessage(handle_, sql, file, line);
@@ -36,8 +46,13 @@ Connection::Compiled Connection::Compile(const char* sql, const char* file, unsi
 }
 
 std::string ErrorMessage(sqlite3* handle, const char* sql, const char* file, unsigned line) {
-  return util::FormatString("%s:%u: %s (extended code %d) in \"%s\"", file, line,
-                            sqlite3_errmsg(handle), sqlite3_extended_errcode(handle), sql);
+  const int code = sqlite3_extended_errcode(handle);
+  // Nobody else interrupts.
+  const char* const reason = code == SQLITE_INTERRUPT
+                                 ? "more work than a database of this size can need"
+                                 : sqlite3_errmsg(handle);
+  return util::FormatString("%s:%u: %s (extended code %d) in \"%s\"", file, line, reason, code,
+                            sql);
 }
 
 } // namespace orva::db

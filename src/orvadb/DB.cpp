@@ -1,5 +1,7 @@
 #include "orvadb/DB.h"
 
+#include "DatabaseFile.h"
+
 #include "orvadb/Connection.h"
 #include "orvadb/Statement.h"
 
@@ -7,11 +9,9 @@
 
 #include <sqlite3.h>
 
-#include <sys/stat.h>
-
-#include <cerrno>
-#include <cstdio>
 #include <string_view>
+#include <utility>
+#include <vector>
 
 namespace orva::db {
 
@@ -20,19 +20,6 @@ namespace {
 /// Milliseconds. A reader of the database must not make a change of it fail.
 constexpr int BUSY_TIMEOUT = 1000;
 
-/// SQLite would wait for the other end of a FIFO, or write into a device: neither the database
-/// nor what it keeps beside it may be one.
-void RefuseSpecialFiles(const std::string& path) {
-  for (const char* const suffix : {"", "-journal", "-wal", "-shm"}) {
-    const std::string name = path + suffix;
-    struct stat status {};
-    if (lstat(name.c_str(), &status) == 0 && !S_ISREG(status.st_mode)) {
-      throw util::FormatString("%s:%d: '%s' is not a regular file", __FILE__, __LINE__,
-                               name.c_str());
-    }
-  }
-}
-
 /// Keeps SQLite from counting every allocation under a lock; nobody reads the counts. Only before
 /// it is first used in the process.
 void ConfigureOnce() {
@@ -40,9 +27,26 @@ void ConfigureOnce() {
   static_cast<void>(configured);
 }
 
-/// Lets a merge keep its changes in memory until it commits, so that readers wait only then.
-void SetCacheSize(sqlite3* handle) {
-  sqlite3_exec(handle, "PRAGMA cache_size = -65536", nullptr, nullptr, nullptr);
+/// Texts and rows of more bytes are read by nobody.
+constexpr int LONGEST_VALUE = 16 << 20;
+
+/// Runs one statement that has no result. Throws std::string.
+void Run(sqlite3* handle, const char* sql) {
+  if (sqlite3_exec(handle, sql, nullptr, nullptr, nullptr) != SQLITE_OK) {
+    throw ErrorMessage(handle, sql, __FILE__, __LINE__);
+  }
+}
+
+/// A volume is whoever's plugged it in: nothing that its database brings along is run.
+void Distrust(sqlite3* handle) {
+  for (const auto& [option, value] :
+       {std::pair(SQLITE_DBCONFIG_ENABLE_TRIGGER, 0), std::pair(SQLITE_DBCONFIG_ENABLE_VIEW, 0),
+        std::pair(SQLITE_DBCONFIG_TRUSTED_SCHEMA, 0), std::pair(SQLITE_DBCONFIG_DEFENSIVE, 1)}) {
+    sqlite3_db_config(handle, option, value, nullptr);
+  }
+  sqlite3_limit(handle, SQLITE_LIMIT_LENGTH, LONGEST_VALUE);
+  Run(handle, "PRAGMA cell_size_check = ON");
+  Run(handle, "PRAGMA ignore_check_constraints = ON");
 }
 
 /// `path` as a URI that promises that nobody writes the file.
@@ -78,7 +82,10 @@ void DB::Open(const std::string& path) {
 
 void DB::Open(std::string path, Access access, int busyTimeout, bool immutable) {
   Close();
-  RefuseSpecialFiles(path);
+  fileSize_ = CheckDatabaseFiles(path);
+  if (access == Access::ReadWrite) {
+    CheckJournal(path);
+  }
   ConfigureOnce();
   const int mode = access == Access::ReadWrite ? SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE
                                                : SQLITE_OPEN_READONLY;
@@ -87,17 +94,36 @@ void DB::Open(std::string path, Access access, int busyTimeout, bool immutable) 
   const std::string& name = immutable ? ImmutableUri(path) : path;
   const int code = sqlite3_open_v2(name.c_str(), &handle_, flags, nullptr);
   path_ = std::move(path);
-  if (code != SQLITE_OK) {
-    std::string message =
-        ErrorMessage(handle_, ("open '" + path_ + "'").c_str(), __FILE__, __LINE__);
+  try {
+    if (code != SQLITE_OK) {
+      throw ErrorMessage(handle_, ("open '" + path_ + "'").c_str(), __FILE__, __LINE__);
+    }
+    connection_ = std::make_unique<Connection>(handle_, busyTimeout, fileSize_);
+    sqlite3_busy_timeout(handle_, busyTimeout);
+    Distrust(handle_);
+    if (access == Access::ReadWrite) {
+      // A merge keeps its changes in memory until it commits, so that readers wait only then.
+      Run(handle_, "PRAGMA cache_size = -65536");
+    }
+  } catch (...) {
     Close();
-    throw std::string(std::move(message));
+    throw;
   }
-  sqlite3_busy_timeout(handle_, busyTimeout);
-  if (access == Access::ReadWrite) {
-    SetCacheSize(handle_);
+}
+
+void DB::Create(const std::string& path, const std::function<void()>& build) {
+  const std::string unfinished = path + ".new";
+  RemoveDatabase(unfinished);
+  try {
+    Open(unfinished);
+    build();
+    Close();
+    PublishDatabase(unfinished, path);
+  } catch (...) {
+    Close();
+    RemoveDatabase(unfinished);
+    throw;
   }
-  connection_ = std::make_unique<Connection>(handle_, busyTimeout);
 }
 
 void DB::Close() {
@@ -105,7 +131,48 @@ void DB::Close() {
   // The connection has no statements left, so that this cannot be refused.
   sqlite3_close_v2(handle_);
   handle_ = nullptr;
+  fileSize_ = 0;
   path_.clear();
+}
+
+void DB::RefuseComputedValues(const char* table) const {
+  const bool written = sqlite3_db_readonly(handle_, "main") == 0;
+  const auto refuse = [&](bool computed, const char* what) {
+    if (computed) {
+      throw util::FormatString("%s:%d: %s in table %s of '%s'", __FILE__, __LINE__, what, table,
+                               path_.c_str());
+    }
+  };
+  constexpr int virtualColumn = 2; // and above: stored ones
+  constexpr int expression = -2;   // in the place of a column's number
+
+  const std::string listColumns = util::FormatString("PRAGMA table_xinfo(%s)", table);
+  Statement column(*this, listColumns.c_str(), __FILE__, __LINE__);
+  while (column.Fetch(__FILE__, __LINE__)) {
+    refuse(column.GetInt(6) >= virtualColumn, "generated column");
+    refuse(written && !column.IsNull(4), "default value");
+  }
+  if (!written) {
+    return;
+  }
+  std::vector<std::string> indices;
+  const std::string listIndices = util::FormatString("PRAGMA index_list(%s)", table);
+  Statement index(*this, listIndices.c_str(), __FILE__, __LINE__);
+  while (index.Fetch(__FILE__, __LINE__)) {
+    refuse(index.GetBool(4), "partial index");
+    indices.push_back(index.GetText(1));
+  }
+  for (const std::string& name : indices) {
+    const std::unique_ptr<char, decltype(&sqlite3_free)> listKeys(
+        sqlite3_mprintf("PRAGMA index_xinfo(%Q)", name.c_str()), &sqlite3_free);
+    if (!listKeys) {
+      throw util::FormatString("%s:%d: out of memory", __FILE__, __LINE__);
+    }
+    Statement key(*this, listKeys.get(), __FILE__, __LINE__);
+    while (key.Fetch(__FILE__, __LINE__)) {
+      refuse(key.GetInt(1) == expression, "index on an expression");
+    }
+  }
 }
 
 unsigned long long DB::RunningTransaction() const noexcept {

@@ -7,7 +7,6 @@
 #include <sqlite3.h>
 
 #include <cstddef>
-#include <new>
 
 namespace orva::db {
 
@@ -15,10 +14,16 @@ static_assert(Statement::ROW == SQLITE_ROW && Statement::DONE == SQLITE_DONE);
 
 namespace {
 
-Connection& OpenConnection(Connection* connection, const char* sql, const char* file,
-                           unsigned int line) {
+Connection& OpenConnection(Connection* connection, sqlite3* handle, const char* sql,
+                           const char* file, unsigned int line) {
   if (connection == nullptr) {
     throw util::FormatString("%s:%u: database not open in \"%s\"", file, line, sql);
+  }
+  // SQLite rolls back by itself after some failures. What the transaction's owner still does would
+  // then be written at once, statement by statement.
+  if (connection->transaction != 0 && sqlite3_get_autocommit(handle) != 0) {
+    throw util::FormatString("%s:%u: \"%s\" in a transaction that was rolled back: %s", file, line,
+                             sql, connection->failedStep.c_str());
   }
   return *connection;
 }
@@ -26,8 +31,8 @@ Connection& OpenConnection(Connection* connection, const char* sql, const char* 
 } // namespace
 
 Statement::Statement(const DB& db, const char* sql, const char* file, unsigned int line)
-    : db_(db),
-      statement_(OpenConnection(db.connection_.get(), sql, file, line).CheckOut(sql, file, line)) {}
+    : db_(db), statement_(OpenConnection(db.connection_.get(), db.handle_, sql, file, line)
+                              .CheckOut(sql, file, line)) {}
 
 int Statement::Step(const char* file, unsigned int line) {
   const int code = sqlite3_step(statement_.get());
@@ -91,6 +96,10 @@ long long Statement::GetInt64(int column) const {
   return sqlite3_column_int64(statement_.get(), column);
 }
 
+bool Statement::IsNull(int column) const {
+  return sqlite3_column_type(statement_.get(), column) == SQLITE_NULL;
+}
+
 std::string Statement::GetText(int column) const {
   return std::string(GetTextView(column));
 }
@@ -99,7 +108,7 @@ std::string_view Statement::GetTextView(int column) const {
   const unsigned char* const text = sqlite3_column_text(statement_.get(), column);
   if (text == nullptr) {
     if (sqlite3_errcode(db_.handle_) == SQLITE_NOMEM) {
-      throw std::bad_alloc();
+      throw ErrorMessage(db_.handle_, sqlite3_sql(statement_.get()), __FILE__, __LINE__);
     }
     return {};
   }

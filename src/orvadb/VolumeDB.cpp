@@ -1,16 +1,16 @@
 #include "orvadb/VolumeDB.h"
 
+#include "DatabaseFile.h"
+
 #include "orvautil/Core.h"
 #include "orvautil/FormatString.h"
 #include "orvautil/Path.h"
 
 #include <sqlite3.h>
 
-#include <sys/stat.h>
 #include <sys/statvfs.h>
 
 #include <array>
-#include <cerrno>
 
 namespace orva::db {
 
@@ -37,11 +37,6 @@ bool IsInWalMode(sqlite3* handle) {
          file->pMethods->xRead(file, readVersion.data(), readVersion.size(), readVersionOffset) ==
              SQLITE_OK &&
          readVersion.front() == walVersion;
-}
-
-bool IsAbsentOrEmpty(const std::string& path) {
-  struct stat status {};
-  return lstat(path.c_str(), &status) == 0 ? status.st_size == 0 : errno == ENOENT;
 }
 
 } // namespace

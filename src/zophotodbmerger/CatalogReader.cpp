@@ -9,6 +9,7 @@
 #include "orvadb/Statement.h"
 #include "orvadb/VolumeDB.h"
 
+#include "orvautil/FormatString.h"
 #include "orvautil/Path.h"
 
 #include <algorithm>
@@ -24,6 +25,31 @@ constexpr long long TRANSCODED = 3;
 
 /// What a list has room for from the beginning: nobody knows how long it gets before it is read.
 constexpr std::size_t EXPECTED_ITEMS = 4096;
+
+/// The memory that the list read from a catalog may take: in a catalog that was crafted, a few
+/// pages may make up any number of rows.
+class ListMemory {
+public:
+  explicit ListMemory(const db::VolumeDB& catalog)
+      : catalog_(catalog), left_(LEAST + PER_BYTE * catalog.GetFileSize()) {}
+
+  /// Takes what one more item needs. Throws std::string when there is not enough left.
+  void Take(const db::FolderItem& item, std::size_t more) {
+    left_ -= static_cast<long long>(item.path.size() + item.name.size() + more);
+    if (left_ < 0) {
+      throw util::FormatString("%s:%d: '%s' has more rows than a file of its size can hold",
+                               __FILE__, __LINE__, catalog_.GetPath().c_str());
+    }
+  }
+
+private:
+  // The smallest row takes a tenth of it.
+  static constexpr long long PER_BYTE = 100;
+  static constexpr long long LEAST = 1 << 20;
+
+  const db::VolumeDB& catalog_;
+  long long left_;
+};
 
 /// The row that stands for the volume itself, which has none in its catalog.
 std::unique_ptr<db::Folder> RootFolder(const std::string& volumeMountPoint) {
@@ -58,6 +84,8 @@ std::unique_ptr<Item> ReadItem(const Statement& row, const std::string& base) {
 
 util::OwnerVector<db::Folder> ReadFolders(const std::string& volumeMountPoint,
                                           const db::VolumeDB& catalog) {
+  catalog.RefuseComputedValues("Folders");
+  ListMemory memory(catalog);
   util::OwnerVector<db::Folder> folders;
   folders.reserve(EXPECTED_ITEMS);
   folders.push_back(RootFolder(volumeMountPoint));
@@ -69,6 +97,7 @@ util::OwnerVector<db::Folder> ReadFolders(const std::string& volumeMountPoint,
                   __FILE__, __LINE__);
   while (query.Step(__FILE__, __LINE__) == Statement::ROW) {
     folders.push_back(ReadItem<db::Folder>(query, base));
+    memory.Take(*folders.back(), sizeof(db::Folder));
   }
   std::sort(folders.begin(), folders.end(), FolderItemCmp<db::FolderItem>());
   return folders;
@@ -76,6 +105,9 @@ util::OwnerVector<db::Folder> ReadFolders(const std::string& volumeMountPoint,
 
 util::OwnerVector<db::File> ReadChangedFiles(const std::string& volumeMountPoint,
                                              const db::VolumeDB& catalog, std::time_t since) {
+  catalog.RefuseComputedValues("Files");
+  catalog.RefuseComputedValues("Transcodings");
+  ListMemory memory(catalog);
   util::OwnerVector<db::File> files;
   files.reserve(EXPECTED_ITEMS);
   const std::string base = util::Path(volumeMountPoint).Basic();
@@ -91,6 +123,7 @@ util::OwnerVector<db::File> ReadChangedFiles(const std::string& volumeMountPoint
     auto file = ReadItem<db::File>(query, base);
     file->ext = query.GetTextView(12);
     file->size = query.GetInt64(13);
+    memory.Take(*file, sizeof(db::File) + file->ext.size());
     files.push_back(std::move(file));
   }
   std::sort(files.begin(), files.end(), FolderItemCmp<db::FolderItem>());
@@ -98,6 +131,7 @@ util::OwnerVector<db::File> ReadChangedFiles(const std::string& volumeMountPoint
 }
 
 PhotoCounts CountPhotos(const std::string& /*volumeMountPoint*/, const db::VolumeDB& catalog) {
+  catalog.RefuseComputedValues("Files");
   PhotoCounts counts;
   {
     Statement query(catalog,

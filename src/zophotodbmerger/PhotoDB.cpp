@@ -132,13 +132,19 @@ std::string PhotoDB::FilePath() const {
 
 void PhotoDB::Init() {
   const std::string path = FilePath();
-  const bool existed = util::Path(path).Exists();
+  const bool existed = IsPresent(path);
+  if (!existed) {
+    Create(path, [this] {
+      CreateTables();
+      CreateIndices();
+    });
+  }
   Open(path);
   if (existed) {
+    for (const char* const table : {"Status", "Statistics", "Folders", "Files"}) {
+      RefuseComputedValues(table);
+    }
     LoadStatus();
-  } else {
-    CreateTables();
-    CreateIndices();
   }
 }
 
@@ -320,13 +326,18 @@ void PhotoDB::DeleteVolumes() const {
 
 void PhotoDB::DeleteVolume(const std::string& volume) const {
   Known().Forget();
-  for (const char* const sql :
-       {"DELETE FROM Folders WHERE volume = ?", "DELETE FROM Files WHERE volume = ?",
-        "UPDATE Statistics SET last_updated_time = 0 WHERE volume = ?"}) {
+  // Nothing holds these together: whatever stops between them must leave what the next merge of
+  // the volume makes good. So its time goes back before the first row goes, and folders take
+  // their files along, which would belong to none and never be found again.
+  Statement(*this, "PRAGMA foreign_keys = ON", __FILE__, __LINE__).Execute(__FILE__, __LINE__);
+  constexpr const char* restart = "UPDATE Statistics SET last_updated_time = 0 WHERE volume = ?";
+  for (const char* const sql : {restart, "DELETE FROM Folders WHERE volume = ?",
+                                "DELETE FROM Files WHERE volume = ?", restart}) {
     Statement change(*this, sql, __FILE__, __LINE__);
     change.BindText(1, volume, __FILE__, __LINE__);
     change.Execute(__FILE__, __LINE__);
   }
+  Statement(*this, "PRAGMA foreign_keys = OFF", __FILE__, __LINE__).Execute(__FILE__, __LINE__);
 }
 
 std::unique_ptr<File> PhotoDB::GetFile(long long fileId) const {
@@ -366,6 +377,7 @@ void PhotoDB::LearnNames(const std::string& volume, int cost) const {
   constexpr int costPerName = 8;
   constexpr std::size_t fewNames = 2'000;
   constexpr std::size_t mostNames = 200'000;
+  constexpr std::size_t mostBytes = 64 << 20;
 
   Knowledge& known = Known();
   known.folderCost += cost;
@@ -377,10 +389,12 @@ void PhotoDB::LearnNames(const std::string& volume, int cost) const {
   const auto limit =
       std::clamp(static_cast<std::size_t>(known.folderCost / costPerName), fewNames, mostNames);
   Knowledge::Names names;
+  std::size_t bytes = 0;
   Statement query(*this, "SELECT * FROM Files WHERE folder_id = ? ", __FILE__, __LINE__);
   query.BindInt64(1, known.folderId, __FILE__, __LINE__);
   while (query.Fetch(__FILE__, __LINE__)) {
-    if (names.size() == limit) {
+    bytes += query.GetTextView(2).size();
+    if (names.size() == limit || bytes > mostBytes) {
       return;
     }
     if (query.GetTextView(4) == volume) {

@@ -182,10 +182,9 @@ TEST_F(DBTest, OpenRefusesWhatIsNoRegularFileWithoutWaiting) {
   EXPECT_THROW(TestDB("/dev/null"), std::string);
 }
 
-TEST_F(DBTest, AFileThatIsNoDatabaseFailsAtTheFirstStatement) {
+TEST_F(DBTest, AFileThatIsNoDatabaseIsNotOpened) {
   std::ofstream(path) << std::string(4096, 'x');
-  const TestDB db(path);
-  EXPECT_THAT(Thrown([&] { Statement(db, "SELECT * FROM t", __FILE__, __LINE__); }),
+  EXPECT_THAT(Thrown([&] { const TestDB db(path); }),
               HasSubstr("file is not a database (extended code 26)"));
 }
 

@@ -59,6 +59,7 @@ public:
   explicit TestDB(const std::string& path) { Open(path); }
 
   using DB::Access;
+  using DB::Create;
   using DB::Handle;
   using DB::Open;
 

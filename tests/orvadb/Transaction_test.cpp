@@ -271,6 +271,22 @@ TEST_F(TransactionTest, ACommitThatReadersHinderFailsAndChangesNothing) {
   EXPECT_THAT(Saved(), ElementsAre("1"));
 }
 
+TEST_F(TransactionTest, NothingIsWrittenAfterSqliteHasRolledBackByItself) {
+  Execute("INSERT INTO t VALUES(1)");
+  {
+    const Transaction transaction(db, 0, __FILE__, __LINE__);
+    EXPECT_EQ(Step("INSERT OR ROLLBACK INTO t VALUES(1)"), SQLITE_CONSTRAINT);
+    EXPECT_THAT(
+        Thrown([&] { Statement(db, "INSERT INTO t VALUES(2)", "Caller.cpp", 22); }),
+        AllOf(StartsWith("Caller.cpp:22: \"INSERT INTO t VALUES(2)\" in a transaction that was "
+                         "rolled back: "),
+              HasSubstr("UNIQUE constraint failed: t.a")));
+  }
+  EXPECT_THAT(Saved(), ElementsAre("1"));
+  Execute("INSERT INTO t VALUES(3)");
+  EXPECT_THAT(Saved(), ElementsAre("1", "3"));
+}
+
 TEST_F(TransactionTest, WhereSqliteHasRolledBackByItselfTheEndIsHarmless) {
   Execute("INSERT INTO t VALUES(1)");
   {

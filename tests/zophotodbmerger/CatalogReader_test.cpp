@@ -316,11 +316,7 @@ TEST_F(CatalogReaderTest, BrokenRowEndsTheListAndItsTransaction) {
   catalog.AddFolder(1, "a/");
   catalog.AddFolder(2, "b/");
   catalog.AddFolder(3, "c/");
-  catalog.Rows().Run("ALTER TABLE Folders RENAME TO Stored");
-  catalog.Rows().Run("CREATE VIEW Folders AS SELECT id, folderId, path, name, category, "
-                     "lastModifiedDate, isBackup, isHidden, isSystem, isDeleted, CASE id WHEN 3 "
-                     "THEN abs(-9223372036854775807 - 1) ELSE status END, lastUpdatedDate FROM "
-                     "Stored");
+  catalog.Rows().Run("UPDATE Folders SET name = zeroblob(20000000) WHERE id = 3");
   const db::VolumeDB connection(MOUNT_POINT, false);
   db::Transaction transaction(connection, 1000, __FILE__, __LINE__);
   EXPECT_THAT(Paths(dbmerger::ReadFolders(MOUNT_POINT, connection)),

@@ -80,11 +80,9 @@ protected:
     });
   }
 
-  /// Makes every change of this kind ("INSERT ON Files") fail.
-  void Refuse(const std::string& change) const {
-    Database(MergedDatabasePath(LOCATION))
-        .Run("CREATE TRIGGER refuse BEFORE " + change +
-             " BEGIN SELECT RAISE(ABORT, 'refused by the test'); END");
+  /// Makes every change fail that would give a second row of `table` the same value there.
+  void RefuseTwice(const std::string& table, const std::string& column) const {
+    Rows("CREATE UNIQUE INDEX refuse ON " + table + "(" + column + ")");
   }
 
   PhotoDB photos;
@@ -607,29 +605,51 @@ TEST_F(PhotoDBTest, DeletionOfAllVolumesCompactsTheFile) {
 
 TEST_F(PhotoDBTest, FailedDeletionsPassOn) {
   AddFolder("/shares/Vol/");
-  AddFile("/shares/Vol/", "a.jpg");
-  Refuse("DELETE ON Files");
+  Rows("DROP TABLE Files");
   EXPECT_THROW(DeleteFile("/shares/Vol/", "a.jpg"), std::string);
   EXPECT_THROW(DeleteFolder("/shares/Vol/"), std::string);
   EXPECT_THAT(ThrownBy<std::string>([&] { photos.DeleteVolumes(); }),
-              HasSubstr("refused by the test"));
+              HasSubstr("no such table: Files"));
 }
 
 TEST_F(PhotoDBTest, FailureInTheMiddleLeavesWhatWasDoneBefore) {
   AddFolder("/shares/Vol/");
   AddFile("/shares/Vol/", "a.jpg");
-  Refuse("DELETE ON Files");
+  Rows("INSERT INTO Files VALUES(99, 99, 'without folder', 0, '/shares/Vol/', 0)");
+  Rows("CREATE TABLE Kept(file_id REFERENCES Files(file_id))");
+  Rows("INSERT INTO Kept VALUES(99)");
   EXPECT_THAT(ThrownBy<std::string>([&] { photos.DeleteVolume(VOLUME); }),
-              HasSubstr("refused by the test"));
+              HasSubstr("FOREIGN KEY constraint failed"));
   EXPECT_THAT(MergedFolders(LOCATION), IsEmpty());
-  EXPECT_THAT(Rows("SELECT name FROM Files"), ElementsAre("a.jpg"));
+  EXPECT_THAT(Rows("SELECT name FROM Files"), ElementsAre("without folder"));
+}
+
+TEST_F(PhotoDBTest, VolumeWhoseDeletionFailsAtOnceStartsFromTheBeginningAllTheSame) {
+  AddFolder("/shares/Vol/");
+  AddFile("/shares/Vol/", "a.jpg");
+  photos.InsertStatistics(VOLUME);
+  photos.UpdateStatistics({VOLUME, 3, 4, 500});
+  Rows("CREATE TABLE Kept(folder_id REFERENCES Folders(folder_id))");
+  Rows("INSERT INTO Kept SELECT folder_id FROM Folders");
+  EXPECT_THROW(photos.DeleteVolume(VOLUME), std::string);
+  EXPECT_THAT(MergedFiles(LOCATION), ElementsAre("/shares/Vol/a.jpg"));
+  EXPECT_THAT(MergedStatistics(LOCATION), ElementsAre("/shares/Vol/|3|4|0"));
+}
+
+TEST_F(PhotoDBTest, FoldersOfADeletedVolumeTakeTheirFilesAlong) {
+  AddFolder("/shares/Vol/");
+  AddFile("/shares/Vol/", "a.jpg");
+  Rows("UPDATE Files SET volume = 'Files is not asked for this one'");
+  photos.DeleteVolume(VOLUME);
+  EXPECT_THAT(Rows("SELECT name FROM Files"), IsEmpty());
 }
 
 TEST_F(PhotoDBTest, FailedAddsPassOn) {
   AddFolder("/shares/Vol/");
-  Refuse("INSERT ON Files");
-  EXPECT_THAT(ThrownBy<std::string>([&] { AddFile("/shares/Vol/", "a.jpg"); }),
-              HasSubstr("refused by the test"));
+  AddFile("/shares/Vol/", "a.jpg");
+  RefuseTwice("Files", "volume");
+  EXPECT_THAT(ThrownBy<std::string>([&] { AddFile("/shares/Vol/", "b.jpg"); }),
+              HasSubstr("UNIQUE constraint failed"));
 }
 
 TEST_F(PhotoDBTest, FailedReadsPassOn) {
@@ -706,19 +726,23 @@ TEST_F(PhotoDBTest, UpdateWithoutARowChangesAndLogsNothing) {
 }
 
 TEST_F(PhotoDBTest, FailedInsertOfStatisticsIsLoggedOnly) {
-  Refuse("INSERT ON Statistics");
+  photos.InsertStatistics("/shares/Other/");
+  RefuseTwice("Statistics", "photos_total");
   photos.InsertStatistics(VOLUME);
   EXPECT_THAT(Logged(), ElementsAre(Error("Could not insert stats for /shares/Vol/ ")));
-  EXPECT_THAT(Rows("SELECT * FROM Statistics"), IsEmpty());
+  EXPECT_THAT(MergedStatistics(LOCATION), ElementsAre("/shares/Other/|0|0|0"));
 }
 
 TEST_F(PhotoDBTest, FailedUpdateOfStatisticsIsLoggedOnly) {
   photos.InsertStatistics(VOLUME);
-  Refuse("UPDATE ON Statistics");
+  photos.InsertStatistics("/shares/Other/");
+  photos.UpdateStatistics({"/shares/Other/", 1, 2, 3});
+  RefuseTwice("Statistics", "last_updated_time");
   photos.UpdateStatistics({VOLUME, 1, 2, 3});
   EXPECT_THAT(Logged(),
               ElementsAre(Error("Could not update stats for /shares/Vol/. Return code 19")));
-  EXPECT_THAT(MergedStatistics(LOCATION), ElementsAre("/shares/Vol/|0|0|0"));
+  EXPECT_THAT(MergedStatistics(LOCATION),
+              ElementsAre("/shares/Other/|1|2|3", "/shares/Vol/|0|0|0"));
 }
 
 TEST_F(PhotoDBTest, StatisticsWithoutATableAreThrown) {
@@ -742,16 +766,13 @@ TEST_F(PhotoDBTest, StatusIsWrittenToTheFirstRowWhateverItsId) {
               ElementsAre("1|2.0|5000000000|text|-3", "2|old|1|second|2"));
 }
 
-TEST_F(PhotoDBTest, FailedUpdateOfTheStatusIsThrown) {
-  Refuse("UPDATE ON Status");
+TEST_F(PhotoDBTest, FailedUpdateOfTheStatusIsThrownAndNamesThePlaceInThisLayer) {
+  Rows("INSERT INTO Status(mc_version, mdate) VALUES('other', 1)");
+  RefuseTwice("Status", "mc_version");
+  photos.status.mc_version = "other";
   EXPECT_THAT(ThrownBy<std::string>([&] { photos.UpdateStatus(); }),
-              HasSubstr("refused by the test"));
-}
-
-TEST_F(PhotoDBTest, ErrorsOfTheDatabaseNameThePlaceInThisLayer) {
-  Refuse("UPDATE ON Status");
-  EXPECT_THAT(ThrownBy<std::string>([&] { photos.UpdateStatus(); }),
-              StartsWith("src/zophotodbmerger/PhotoDB.cpp:"));
+              ::testing::AllOf(StartsWith("src/zophotodbmerger/PhotoDB.cpp:"),
+                               HasSubstr("UNIQUE constraint failed")));
 }
 
 } // namespace

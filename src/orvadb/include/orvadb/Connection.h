@@ -13,6 +13,8 @@ struct sqlite3_stmt;
 
 namespace orva::db {
 
+class WorkLimit;
+
 /// Finalises a compiled statement.
 struct StatementFinalizer {
   void operator()(sqlite3_stmt* statement) const noexcept;
@@ -34,9 +36,11 @@ public:
   };
   using CheckedOut = std::unique_ptr<sqlite3_stmt, CheckIn>;
 
-  /// Belongs to `handle`, which it does not own.
-  Connection(sqlite3* handle, int busyTimeout) noexcept
-      : handle_(handle), busyTimeout_(busyTimeout) {}
+  /// Belongs to `handle`, which it does not own, on a database of `bytes` bytes.
+  Connection(sqlite3* handle, int busyTimeout, long long bytes);
+  Connection(const Connection&) = delete;
+  Connection& operator=(const Connection&) = delete;
+  ~Connection();
 
   /// Hands out the compiled form of `sql`; compiles it when none is kept or it is in use. Throws
   /// std::string with `file` and `line`.
@@ -71,6 +75,7 @@ private:
 
   sqlite3* handle_;
   int busyTimeout_;
+  std::unique_ptr<WorkLimit> workLimit_;
   unsigned long long transactions_ = 0;
   /// By text, which every caller writes in full, so that they are few; null while in use.
   std::unordered_map<std::string, Compiled, TextHash, std::equal_to<>> statements_;

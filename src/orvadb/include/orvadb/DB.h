@@ -1,5 +1,6 @@
 #pragma once
 
+#include <functional>
 #include <memory>
 #include <string>
 
@@ -29,8 +30,10 @@ public:
   virtual void UpdateStatus(const std::string& key, const std::string& value) const;
 
   /// Opens the file at `path` for reading and writing and creates it when there is none. A
-  /// connection that is already open is closed first. Links are not followed, and anything
-  /// other than a regular file is refused. Throws std::string.
+  /// connection that is already open is closed first. The file may be a stranger's: links are
+  /// not followed, anything other than a regular file is refused, its triggers, views and checks
+  /// do not run, and a statement that works out of proportion to its size fails. Throws
+  /// std::string.
   void Open(const std::string& path);
 
   /// Closes the connection; harmless when closed.
@@ -39,9 +42,23 @@ public:
   /// Path of the open file; empty while closed.
   const std::string& GetPath() const noexcept { return path_; }
 
+  /// Bytes of the database, with its log, when it was opened; 0 while closed.
+  long long GetFileSize() const noexcept { return fileSize_; }
+
+  /// Makes sure that the values in `table`, whose name is a plain word, are those that were
+  /// stored there: refuses generated columns and, where the connection can write, defaults and
+  /// indices on expressions, which a stranger may have made so dear that a row takes minutes.
+  /// A table that is not there has none. Throws std::string.
+  void RefuseComputedValues(const char* table) const;
+
 protected:
   /// What a connection may do with its file.
   enum class Access { ReadWrite, ReadOnly };
+
+  /// Makes the database file at `path`, where there is none: `build` fills it through this
+  /// object, which is open meanwhile and closed afterwards. At every instant, whatever stops,
+  /// there is either nothing at `path` or all of it. Throws std::string, or what `build` throws.
+  void Create(const std::string& path, const std::function<void()>& build);
 
   /// Open for derived classes: `busyTimeout` is in milliseconds; `immutable` promises that
   /// nobody writes the file, which then is neither locked nor watched. Only ReadWrite creates.
@@ -69,6 +86,7 @@ private:
 
   sqlite3* handle_ = nullptr; ///< owned; released by Close
   std::string path_;
+  long long fileSize_ = 0;                 ///< bytes, when it was opened
   std::unique_ptr<Connection> connection_; ///< what belongs to the open handle; null while closed
 };
 

@@ -56,6 +56,7 @@ public:
   /// The low 32 bits of an integer column, with their sign.
   int GetInt(int column) const;
   long long GetInt64(int column) const;
+  bool IsNull(int column) const;
   /// The text with its NUL bytes; NULL gives the empty string.
   std::string GetText(int column) const;
   /// The same where it lies: valid until the next step or getter of the column.

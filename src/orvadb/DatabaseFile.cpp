@@ -1,0 +1,113 @@
+#include "DatabaseFile.h"
+
+#include "orvautil/FormatString.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <array>
+#include <cerrno>
+#include <cstdio>
+#include <cstring>
+
+namespace orva::db {
+
+namespace {
+
+constexpr std::array<const char*, 3> LOG_SUFFIXES{"-journal", "-wal", "-shm"};
+
+/// A descriptor for as long as the scope lives; -1 when the file could not be opened.
+class Descriptor {
+public:
+  Descriptor(const std::string& path, int flags)
+      : descriptor_(open(path.c_str(), flags | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC)) {}
+  Descriptor(const Descriptor&) = delete;
+  Descriptor& operator=(const Descriptor&) = delete;
+  ~Descriptor() {
+    if (descriptor_ != -1) {
+      close(descriptor_);
+    }
+  }
+
+  int Get() const noexcept { return descriptor_; }
+
+private:
+  int descriptor_;
+};
+
+/// Bytes of the regular file at `path`, 0 when there is none.
+long long RegularSize(const std::string& path) {
+  struct stat status {};
+  if (lstat(path.c_str(), &status) != 0) {
+    return 0;
+  }
+  if (!S_ISREG(status.st_mode)) {
+    throw util::FormatString("%s:%d: '%s' is not a regular file", __FILE__, __LINE__, path.c_str());
+  }
+  return status.st_size;
+}
+
+void Synchronise(const std::string& path, int flags, bool mayBeUnsupported) {
+  const Descriptor file(path, O_RDONLY | flags);
+  if (file.Get() == -1 || (fsync(file.Get()) != 0 && !(mayBeUnsupported && errno == EINVAL))) {
+    throw util::FormatString("%s:%d: cannot synchronise '%s': %s", __FILE__, __LINE__, path.c_str(),
+                             std::strerror(errno));
+  }
+}
+
+void RemoveLogs(const std::string& path) {
+  for (const char* const suffix : LOG_SUFFIXES) {
+    unlink((path + suffix).c_str());
+  }
+}
+
+} // namespace
+
+long long CheckDatabaseFiles(const std::string& path) {
+  long long size = RegularSize(path);
+  for (const char* const suffix : LOG_SUFFIXES) {
+    size += RegularSize(path + suffix);
+  }
+  return size;
+}
+
+void CheckJournal(const std::string& path) {
+  // What ends in this belongs to a transaction over several databases, which we never make; when
+  // it has been undone, SQLite deletes the file whose name stands before.
+  constexpr std::array<unsigned char, 8> superJournalMark{0xd9, 0xd5, 0x05, 0xf9,
+                                                          0x20, 0xa1, 0x63, 0xd7};
+  const std::string name = path + LOG_SUFFIXES.front();
+  const Descriptor journal(name, O_RDONLY);
+  std::array<unsigned char, superJournalMark.size()> end{};
+  constexpr auto length = static_cast<off_t>(superJournalMark.size());
+  const off_t begin = journal.Get() == -1 ? -1 : lseek(journal.Get(), -length, SEEK_END);
+  if (begin != -1 && pread(journal.Get(), end.data(), end.size(), begin) == length &&
+      end == superJournalMark) {
+    throw util::FormatString("%s:%d: '%s' names another file", __FILE__, __LINE__, name.c_str());
+  }
+}
+
+void RemoveDatabase(const std::string& path) {
+  unlink(path.c_str());
+  RemoveLogs(path);
+}
+
+void PublishDatabase(const std::string& from, const std::string& to) {
+  Synchronise(from, 0, false);
+  CheckDatabaseFiles(to);
+  RemoveLogs(to);
+  if (std::rename(from.c_str(), to.c_str()) != 0) {
+    throw util::FormatString("%s:%d: cannot rename '%s' to '%s': %s", __FILE__, __LINE__,
+                             from.c_str(), to.c_str(), std::strerror(errno));
+  }
+  // Some file systems cannot synchronise a directory, and need not.
+  Synchronise(to.substr(0, to.rfind('/') + 1), O_DIRECTORY, true);
+}
+
+bool IsAbsentOrEmpty(const std::string& path) {
+  struct stat status {};
+  return lstat(path.c_str(), &status) == 0 ? status.st_size == 0 : errno == ENOENT;
+}
+
+} // namespace orva::db
