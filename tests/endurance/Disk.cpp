@@ -98,7 +98,7 @@ std::string Disk::Change(Random& random) {
     }
     return "an empty catalog";
   }
-  switch (random.Below(8)) {
+  switch (random.Below(10)) {
   case 0:
   case 1:
     return AddFolder(random);
@@ -108,6 +108,7 @@ std::string Disk::Change(Random& random) {
     return AddPhotos(random);
   case 5:
   case 6:
+  case 7:
     return ChangePhoto(random);
   default:
     return ChangeFolder(random);
@@ -250,7 +251,7 @@ std::string Disk::Stamp(Random& random) {
 }
 
 bool Disk::IsFull() const {
-  constexpr std::size_t enough = 250;
+  constexpr std::size_t enough = 400;
   return Rows().Run("SELECT id FROM Files").size() + Rows().Run("SELECT id FROM Folders").size() >
          enough;
 }

@@ -118,15 +118,17 @@ protected:
              {"Tiny", "64m"},
          }) {
       auto disk = std::make_unique<Disk>(name, size);
+      Change(*disk, 60);
       disks_[disk->MountPoint()] = std::move(disk);
     }
   }
 
   void TearDown() override {
     if (HasFailure()) {
+      constexpr std::size_t shown = 40;
       std::cout << "The last events of the run with ORVA_TEST_SEED=" << seed_ << ":\n";
-      for (std::size_t i = history_.size() < 20 ? 0 : history_.size() - 20; i < history_.size();
-           ++i) {
+      for (std::size_t i = history_.size() < shown ? 0 : history_.size() - shown;
+           i < history_.size(); ++i) {
         std::cout << history_[i] << "\n";
       }
       std::cout << std::flush;
@@ -172,18 +174,21 @@ protected:
 
   // The events.
 
-  void ChangeCatalogs() {
-    for (std::size_t i = 0; i <= random_.Below(3); ++i) {
-      Disk& disk = AnyDisk();
+  void Change(Disk& disk, std::size_t times) {
+    for (std::size_t i = 0; i < times; ++i) {
       Note("catalog of " + disk.Path() + ": " + disk.Change(random_));
+    }
+  }
+
+  void ChangeCatalogs() {
+    for (const auto& [mountPoint, disk] : disks_) {
+      Change(*disk, random_.Below(5));
     }
   }
 
   void ChangeAndMerge() {
     Disk& disk = MostlyMounted();
-    for (std::size_t i = 0; i <= random_.Below(4); ++i) {
-      Note("catalog of " + disk.Path() + ": " + disk.Change(random_));
-    }
+    Change(disk, 1 + random_.Below(10));
     Notify(random_.Chance(70) ? Event::TranscodedBatch : Event::Purged, disk.Path());
   }
 
@@ -269,7 +274,7 @@ protected:
     if (!disk.IsMounted() || model_.CurrentState() != Model::State::Scanned) {
       return Unplug(disk);
     }
-    disk.Change(random_);
+    Change(disk, 5);
     const bool isMaster = disk.MountPoint() == model_.Master();
     Notify(random_.Chance(50) ? Event::TranscodedBatch : Event::Purged, disk.Path(),
            {.kind = isMaster ? Disturbance::PullOfTheMaster : Disturbance::Pull,
@@ -682,6 +687,8 @@ TEST_F(Endurance, TheDaemonHoldsOut) {
     }
   }
   ASSERT_FALSE(HasFailure());
+
+  EXPECT_GT(merges_ * 10, static_cast<int>(events)); // something did happen
 
   const Lines merged = PurgeAll();
   const Vitals late = Measure();
