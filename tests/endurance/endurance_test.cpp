@@ -189,7 +189,7 @@ protected:
   void ChangeAndMerge() {
     Disk& disk = MostlyMounted();
     Change(disk, 1 + random_.Below(10));
-    Notify(random_.Chance(70) ? Event::TranscodedBatch : Event::Purged, disk.Path());
+    Notify(random_.Chance(85) ? Event::TranscodedBatch : Event::Purged, disk.Path());
   }
 
   void NotifyOfWork() {
@@ -305,6 +305,8 @@ protected:
     std::optional<MergedDatabase> reader(model_.MasterLocation());
     reader->Rows().Run("BEGIN");
     reader->Rows().Run("SELECT count(*) FROM Folders");
+    Disk& disk = MostlyMounted();
+    Change(disk, 3);
     const std::size_t seen = appliance_->Log().Lines().size();
     const auto isAnnounced = [seen](const Log& lines) {
       return std::any_of(lines.begin() + static_cast<std::ptrdiff_t>(seen), lines.end(),
@@ -318,7 +320,7 @@ protected:
         reader.reset();
       }
     };
-    Notify(random_.Chance(50) ? Event::TranscodedBatch : Event::Purged, MostlyMounted().Path(),
+    Notify(random_.Chance(70) ? Event::TranscodedBatch : Event::Purged, disk.Path(),
            {.kind = Disturbance::Lock, .during = letGo});
   }
 
@@ -656,24 +658,24 @@ protected:
 };
 
 const std::vector<Endurance::Kind> Endurance::KINDS{
-    {10, &Endurance::ChangeCatalogs},
-    {20, &Endurance::ChangeAndMerge},
-    {12, &Endurance::NotifyOfWork},
-    {4, &Endurance::NotifyOfTheUnknown},
-    {16, &Endurance::Plug},
-    {10, &Endurance::Unplug},
+    {6, &Endurance::ChangeCatalogs},
+    {45, &Endurance::ChangeAndMerge},
+    {8, &Endurance::NotifyOfWork},
+    {3, &Endurance::NotifyOfTheUnknown},
+    {14, &Endurance::Plug},
+    {8, &Endurance::Unplug},
     {1, &Endurance::UnplugEverything},
-    {4, &Endurance::PullDuringAMerge},
-    {2, &Endurance::PullTheMasterDuringAMerge},
+    {3, &Endurance::PullDuringAMerge},
+    {1, &Endurance::PullTheMasterDuringAMerge},
     {3, &Endurance::ReadForAMoment},
-    {1, &Endurance::ReadForLong},
-    {3, &Endurance::DropTheConnection},
+    {2, &Endurance::ReadForLong},
+    {2, &Endurance::DropTheConnection},
     {2, &Endurance::SayAndDrop},
-    {8, &Endurance::SendNonsense},
+    {6, &Endurance::SendNonsense},
     {2, &Endurance::ToggleReadOnly},
-    {2, &Endurance::MakeWritable},
+    {3, &Endurance::MakeWritable},
     {2, &Endurance::BreakCatalog},
-    {3, &Endurance::MendCatalogs},
+    {4, &Endurance::MendCatalogs},
 };
 
 TEST_F(Endurance, TheDaemonHoldsOut) {
