@@ -56,7 +56,7 @@ long Stacks(pid_t process) {
     unsigned long begin = 0;
     unsigned long end = 0;
     const char* const last = line.data() + line.size();
-    const auto separator = std::from_chars(line.data(), last, begin, 16).ptr;
+    const auto* const separator = std::from_chars(line.data(), last, begin, 16).ptr;
     std::from_chars(separator + 1, last, end, 16);
     count += end - begin == stackSize && line.find(" rw-p ") != std::string::npos ? 1 : 0;
   }
