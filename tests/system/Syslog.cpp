@@ -70,9 +70,10 @@ Syslog::~Syslog() {
   unlink("/dev/log");
 }
 
-std::vector<LogLine> Syslog::Lines() const {
+std::vector<LogLine> Syslog::Lines(std::size_t first) const {
   const std::unique_lock lock = LockBehindAllSent();
-  return lines_;
+  return {lines_.begin() + static_cast<std::ptrdiff_t>(std::min(first, lines_.size())),
+          lines_.end()};
 }
 
 // A socket keeps the order of what is sent to it: when our mark has come, all before it has.
