@@ -104,8 +104,9 @@ std::vector<std::string> Appliance::TakeOutput() {
 }
 
 std::string Appliance::Locator() {
-  std::ifstream file("/tmp/zophotodbmerger.conf", std::ios::binary);
-  if (!file) {
+  const std::string path = "/tmp/zophotodbmerger.conf";
+  std::ifstream file(path, std::ios::binary);
+  if (!file || std::filesystem::is_directory(path)) {
     return "(absent)";
   }
   return {std::istreambuf_iterator<char>(file), {}};

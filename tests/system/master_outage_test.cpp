@@ -17,6 +17,7 @@ namespace orva::test {
 namespace {
 
 using ::testing::AllOf;
+using ::testing::AnyOf;
 using ::testing::Contains;
 using ::testing::ElementsAre;
 using ::testing::EndsWith;
@@ -162,7 +163,7 @@ std::vector<Lines> FullDiskErrors() {
 }
 
 TEST_F(MasterOutage, AFullDiskFailsTheMergeUntilThereIsRoom) {
-  const int photos = Extent(300, 20'000);
+  const int photos = Extent(300, 5'000);
   onB.AddPhotos("New/", photos - 300, 2000, 300);
   const std::vector<Lines> possible = FullDiskErrors();
   const double used = a.Used();
@@ -204,6 +205,56 @@ TEST_F(MasterOutage, AFullDiskFailsTheFirstMergeOfAVolume) {
   ExpectMendedByTheNextMerge();
   EXPECT_THAT(Errors(appliance.Handle(TranscodedBatch(c.Path()))), IsEmpty());
   EXPECT_THAT(MergedDatabase(a.Path()).Files(), Contains("/shares/C/c.jpg|1000|1000|/shares/C/"));
+}
+
+/// Removals are no transaction: one that fails may have set the volume back to be merged whole.
+TEST_F(MasterOutage, AFullDiskFailsTheRemovalUntilThereIsRoom) {
+  const double used = a.Used();
+  int pages = 0;
+  for (;; ++pages) {
+    SCOPED_TRACE(std::to_string(pages) + " pages are free");
+    a.Resize(used + pages * PAGE);
+    const Lines errors = Errors(appliance.Handle(Unplugged(b.Path())));
+    if (errors.empty()) {
+      break;
+    }
+    EXPECT_THAT(errors, ElementsAre(AllOf(StartsWith("MessageProcessor:: PLACE: " + FULL),
+                                          EndsWith(" WHERE volume = ?\""))));
+    const MergedDatabase merged(a.Path());
+    EXPECT_THAT(merged.Faults(), IsEmpty());
+    EXPECT_THAT(merged.Files(), SizeIs(200));
+    EXPECT_THAT(merged.Statistics().at(1), StartsWith("/shares/B/" + Counts(100)));
+    ASSERT_EQ(used, a.Used()) << "something was left behind";
+  }
+  EXPECT_GT(pages, 1);
+  EXPECT_THAT(MergedDatabase(a.Path()).Files(), SizeIs(100));
+  a.Resize(1e9);
+  appliance.Handle(Plugged(b.Path()));
+  appliance.Handle(TranscodedBatch(b.Path()));
+  ExpectMerged();
+}
+
+TEST_F(MasterOutage, AFullDiskFailsTheReMergeUntilThereIsRoom) {
+  const double used = a.Used();
+  int pages = 0;
+  for (;; ++pages) {
+    SCOPED_TRACE(std::to_string(pages) + " pages are free");
+    a.Resize(used + pages * PAGE);
+    const Lines errors = Errors(appliance.Handle(Purged(b.Path())));
+    if (errors.empty()) {
+      break;
+    }
+    // Either its removal has failed, or its merge.
+    EXPECT_THAT(errors.back(), AllOf(AnyOf(StartsWith("MessageProcessor:: PLACE: "),
+                                           StartsWith(IGNORED + "PLACE: ")),
+                                     HasSubstr(FULL)));
+    const MergedDatabase merged(a.Path());
+    EXPECT_THAT(merged.Faults(), IsEmpty());
+    EXPECT_THAT(merged.Files(), AnyOf(SizeIs(200), SizeIs(100)));
+    ASSERT_EQ(used, a.Used()) << "something was left behind";
+  }
+  EXPECT_GT(pages, 1);
+  ExpectMerged();
 }
 
 TEST_F(MasterOutage, AReadOnlyMasterFailsWhatWouldChangeIt) {
