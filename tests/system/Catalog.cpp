@@ -64,6 +64,21 @@ void Catalog::AddPhoto(const std::string& path, long modified, long stamp, Catal
                 {std::to_string(stamp), path});
 }
 
+void Catalog::AddPhotos(const std::string& folder, int count, long stamp, int first) {
+  database_.Run(
+      "INSERT INTO Files(folderId, path, name, category, lastModifiedDate, isBackup, "
+      "isHidden, isSystem, isDeleted, status, lastUpdatedDate, ext, size) "
+      "WITH RECURSIVE n(i) AS (SELECT CAST(?1 AS INTEGER) WHERE ?1 <> ?2 UNION ALL SELECT i + 1 FROM n "
+      "WHERE i + 1 < CAST(?2 AS INTEGER)) "
+      "SELECT (SELECT id FROM Folders WHERE path = ?3), ?3 || i || '.jpg', i || '.jpg', "
+      "3, ?4, 0, 0, 0, 0, 3, 0, 'jpg', 10 FROM n",
+      {std::to_string(first), std::to_string(first + count), folder, std::to_string(stamp)});
+  database_.Run("INSERT INTO Transcodings(sourceId, profile, status, lastUpdatedDate) "
+                "SELECT id, 'cb62bbdd389b48898f2e5244977cb2c5', 1, ?1 FROM Files "
+                "WHERE id > last_insert_rowid() - CAST(?2 AS INTEGER)",
+                {std::to_string(stamp), std::to_string(count)});
+}
+
 void Catalog::DeletePhoto(const std::string& path, long stamp) {
   database_.Run("UPDATE Files SET isDeleted = 1 WHERE path = ?", {path});
   database_.Run("UPDATE Transcodings SET status = 0, lastUpdatedDate = ? "

@@ -29,6 +29,10 @@ public:
   /// A photo whose transcoding was finished at `stamp`.
   void AddPhoto(const std::string& path, long modified, long stamp, CatalogFlags flags = {});
 
+  /// `count` photos in a folder that is there, named "0.jpg" and on, or from `first` on; modified
+  /// when their transcoding was finished, at `stamp`.
+  void AddPhotos(const std::string& folder, int count, long stamp, int first = 0);
+
   /// Marks a file as deleted and its transcoding as withdrawn at `stamp`.
   void DeletePhoto(const std::string& path, long stamp);
 
