@@ -123,7 +123,10 @@ void DB::Open(std::string path, Access access, int busyTimeout, bool immutable) 
 
 void DB::Create(const std::string& path, const std::function<void()>& build) {
   const std::string unfinished = path + ".new";
-  RemoveDatabase(unfinished);
+  if (!RemoveDatabase(unfinished)) {
+    // It would be taken for what is built now.
+    throw util::FormatString("%s:%d: cannot remove '%s'", __FILE__, __LINE__, unfinished.c_str());
+  }
   try {
     Open(unfinished);
     build();

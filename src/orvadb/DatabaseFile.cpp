@@ -68,10 +68,17 @@ void Synchronise(const std::string& path, int flags, bool mayBeUnsupported) {
   }
 }
 
-void RemoveLogs(const std::string& path) {
+/// Returns whether nothing is there afterwards.
+bool Remove(const std::string& path) {
+  return unlink(path.c_str()) == 0 || errno == ENOENT;
+}
+
+bool RemoveLogs(const std::string& path) {
+  bool gone = true;
   for (const char* const suffix : LOG_SUFFIXES) {
-    unlink((path + suffix).c_str());
+    gone = Remove(path + suffix) && gone;
   }
+  return gone;
 }
 
 } // namespace
@@ -100,15 +107,18 @@ void CheckJournal(const std::string& path) {
   }
 }
 
-void RemoveDatabase(const std::string& path) {
-  unlink(path.c_str());
-  RemoveLogs(path);
+bool RemoveDatabase(const std::string& path) {
+  const bool gone = Remove(path);
+  return RemoveLogs(path) && gone;
 }
 
 void PublishDatabase(const std::string& from, const std::string& to) {
   Synchronise(from, 0, false);
   CheckDatabaseFiles(to);
-  RemoveLogs(to);
+  if (!RemoveLogs(to)) {
+    throw util::FormatString("%s:%d: cannot remove what is left of '%s'", __FILE__, __LINE__,
+                             to.c_str());
+  }
   if (std::rename(from.c_str(), to.c_str()) != 0) {
     throw util::FormatString("%s:%d: cannot rename '%s' to '%s': %s", __FILE__, __LINE__,
                              from.c_str(), to.c_str(), std::strerror(errno));

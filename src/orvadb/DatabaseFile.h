@@ -16,8 +16,9 @@ long long CheckDatabaseFiles(const std::string& path);
 /// file: refuses a journal that names one.
 void CheckJournal(const std::string& path);
 
-/// Removes a database with all its files, as far as they are there. Links are not followed.
-void RemoveDatabase(const std::string& path);
+/// Removes a database with all its files, as far as they are there. Links are not followed. Returns
+/// whether none is left.
+bool RemoveDatabase(const std::string& path);
 
 /// Gives the closed database at `from` the name `to`, in the same directory, where there is
 /// none; what is left there of a former database goes, which would spoil this one. At every

@@ -37,11 +37,18 @@ std::string DatabasePath(const std::string& location) {
 
 void Appliance::Start(const std::vector<std::string>& environment) {
   daemon_ = std::make_unique<DaemonProcess>(DIRECTORY, OUTPUT, environment);
+  outputTaken_ = 0;
   Barrier();
+}
+
+void Appliance::Launch() {
+  daemon_ = std::make_unique<DaemonProcess>(DIRECTORY, OUTPUT);
+  outputTaken_ = 0;
 }
 
 void Appliance::StartWithOutput(const std::string& output) {
   daemon_ = std::make_unique<DaemonProcess>(DIRECTORY, output);
+  outputTaken_ = 0;
   Barrier();
 }
 
@@ -62,18 +69,23 @@ std::vector<LogLine> Appliance::Handle(const std::string& message) {
 }
 
 void Appliance::Barrier() {
-  const std::string name = BARRIER + std::to_string(++barriers_);
-  service_.Send("<" + name + " about=\"ORVANotification\"/>");
-  if (!log_.Await(Error(REFUSAL + name))) {
-    throw std::runtime_error("the daemon has not come to " + name);
+  const std::string refusal = SendBarrier();
+  if (!log_.Await(Error(refusal))) {
+    throw std::runtime_error("not logged: " + refusal);
   }
 }
 
+std::string Appliance::SendBarrier() {
+  const std::string name = BARRIER + std::to_string(++barriers_);
+  service_.Send("<" + name + " about=\"ORVANotification\"/>");
+  return REFUSAL + name;
+}
+
 std::vector<LogLine> Appliance::TakeLog() {
-  const std::vector<LogLine> all = log_.Lines();
+  const std::vector<LogLine> fresh = log_.Lines(logTaken_);
+  logTaken_ += fresh.size();
   std::vector<LogLine> taken;
-  for (; logTaken_ < all.size(); ++logTaken_) {
-    const LogLine& line = all[logTaken_];
+  for (const LogLine& line : fresh) {
     if (!line.text.starts_with(REFUSAL + BARRIER) &&
         !line.text.starts_with("Iterating over mount point ")) {
       taken.push_back({line.priority, MaskTimes(line.text)});
@@ -92,8 +104,9 @@ std::vector<std::string> Appliance::TakeOutput() {
 }
 
 std::string Appliance::Locator() {
-  std::ifstream file("/tmp/zophotodbmerger.conf", std::ios::binary);
-  if (!file) {
+  const std::string path = "/tmp/zophotodbmerger.conf";
+  std::ifstream file(path, std::ios::binary);
+  if (!file || std::filesystem::is_directory(path)) {
     return "(absent)";
   }
   return {std::istreambuf_iterator<char>(file), {}};
@@ -116,6 +129,33 @@ std::vector<std::string> MergedDatabase::Files() const {
 std::vector<std::string> MergedDatabase::Statistics() const {
   return database_.Run("SELECT volume, photos_xcoded, photos_total, last_updated_time "
                        "FROM Statistics ORDER BY volume");
+}
+
+std::vector<std::string> MergedDatabase::Content() const {
+  std::vector<std::string> content = Folders();
+  for (const std::vector<std::string>& rows :
+       {Files(), Statistics(), database_.Run("SELECT id, mc_version, desc, etype FROM Status"),
+        database_.Run("SELECT type, name, tbl_name, sql FROM sqlite_master ORDER BY name")}) {
+    content.insert(content.end(), rows.begin(), rows.end());
+  }
+  return content;
+}
+
+std::vector<std::string> MergedDatabase::Faults() const {
+  std::vector<std::string> faults = database_.Run("PRAGMA integrity_check");
+  std::erase(faults, "ok");
+  const std::vector<std::string> orphans = database_.Run("PRAGMA foreign_key_check");
+  faults.insert(faults.end(), orphans.begin(), orphans.end());
+  return faults;
+}
+
+std::vector<std::string> PathsBelow(const std::string& directory) {
+  std::vector<std::string> paths;
+  for (const auto& entry : std::filesystem::recursive_directory_iterator(directory)) {
+    paths.push_back(entry.path());
+  }
+  std::sort(paths.begin(), paths.end());
+  return paths;
 }
 
 bool HasMergedDatabase(const std::string& location) {

@@ -23,6 +23,9 @@ public:
   /// Starts the daemon and waits until it reads notifications. `environment` as DaemonProcess.
   void Start(const std::vector<std::string>& environment = {});
 
+  /// Starts the daemon and does not wait for it.
+  void Launch();
+
   /// Start with another file for standard output than TakeOutput reads.
   void StartWithOutput(const std::string& output);
 
@@ -42,6 +45,9 @@ public:
   /// Waits until the daemon has handled everything that was sent: queues a message with another
   /// root element behind it and waits for the line that refuses it.
   void Barrier();
+
+  /// Queues what Barrier waits for, and returns the text of the line that tells of it.
+  std::string SendBarrier();
 
   /// What was logged since the last call, without the refusals of Barrier and without the
   /// merger thread's "Iterating over mount point" lines, which come at any time. Elapsed times
@@ -82,6 +88,13 @@ public:
   /// "volume|photos_xcoded|photos_total|last_updated_time", by volume.
   std::vector<std::string> Statistics() const;
 
+  /// All of this, the schema and the status row without its time: what two databases with the same
+  /// content have in common.
+  std::vector<std::string> Content() const;
+
+  /// What SQLite finds wrong with the file.
+  std::vector<std::string> Faults() const;
+
   const Database& Rows() const { return database_; }
 
 private:
@@ -90,6 +103,9 @@ private:
 
 /// The row of the root folder, which every merged database has.
 inline const std::string ROOT_FOLDER = "/shares/|-1|0|<DUMMY>";
+
+/// All files and directories below a directory, by path.
+std::vector<std::string> PathsBelow(const std::string& directory);
 
 /// True when there is a merged database file at a location.
 bool HasMergedDatabase(const std::string& location);

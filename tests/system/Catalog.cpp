@@ -8,9 +8,9 @@ namespace orva::test {
 
 namespace {
 
-std::string Place(const Volume& volume) {
-  mkdir(core::GetORVA_HOME(volume.Path()).c_str(), 0755);
-  return core::GetCatalogPath(volume.Path());
+std::string Place(const std::string& root) {
+  mkdir(core::GetORVA_HOME(root).c_str(), 0755);
+  return core::GetCatalogPath(root);
 }
 
 /// "Pictures/" of "Pictures/a.jpg", "" of "Pictures/".
@@ -30,7 +30,7 @@ std::string Text(bool flag) {
 
 } // namespace
 
-Catalog::Catalog(const Volume& volume) : database_(Place(volume), true) {
+Catalog::Catalog(const std::string& root) : database_(Place(root), true) {
   database_.Run("CREATE TABLE Folders(id INTEGER PRIMARY KEY, folderId INTEGER, path TEXT, "
                 "name TEXT, category INTEGER, lastModifiedDate INTEGER, isBackup INTEGER, "
                 "isHidden INTEGER, isSystem INTEGER, isDeleted INTEGER, status INTEGER, "
@@ -62,6 +62,21 @@ void Catalog::AddPhoto(const std::string& path, long modified, long stamp, Catal
   database_.Run("INSERT INTO Transcodings(sourceId, profile, status, lastUpdatedDate) "
                 "SELECT id, 'cb62bbdd389b48898f2e5244977cb2c5', 1, ? FROM Files WHERE path = ?",
                 {std::to_string(stamp), path});
+}
+
+void Catalog::AddPhotos(const std::string& folder, int count, long stamp, int first) {
+  database_.Run(
+      "INSERT INTO Files(folderId, path, name, category, lastModifiedDate, isBackup, "
+      "isHidden, isSystem, isDeleted, status, lastUpdatedDate, ext, size) "
+      "WITH RECURSIVE n(i) AS (SELECT CAST(?1 AS INTEGER) WHERE ?1 <> ?2 UNION ALL SELECT i + 1 FROM n "
+      "WHERE i + 1 < CAST(?2 AS INTEGER)) "
+      "SELECT (SELECT id FROM Folders WHERE path = ?3), ?3 || i || '.jpg', i || '.jpg', "
+      "3, ?4, 0, 0, 0, 0, 3, 0, 'jpg', 10 FROM n",
+      {std::to_string(first), std::to_string(first + count), folder, std::to_string(stamp)});
+  database_.Run("INSERT INTO Transcodings(sourceId, profile, status, lastUpdatedDate) "
+                "SELECT id, 'cb62bbdd389b48898f2e5244977cb2c5', 1, ?1 FROM Files "
+                "WHERE id > last_insert_rowid() - CAST(?2 AS INTEGER)",
+                {std::to_string(stamp), std::to_string(count)});
 }
 
 void Catalog::DeletePhoto(const std::string& path, long stamp) {

@@ -19,12 +19,19 @@ struct CatalogFlags {
 class Catalog {
 public:
   /// Makes an empty catalog on the volume.
-  explicit Catalog(const Volume& volume);
+  explicit Catalog(const Volume& volume) : Catalog(volume.Path()) {}
+
+  /// Makes an empty catalog on the volume whose files are found at `root`.
+  explicit Catalog(const std::string& root);
 
   void AddFolder(const std::string& path, long modified, CatalogFlags flags = {});
 
   /// A photo whose transcoding was finished at `stamp`.
   void AddPhoto(const std::string& path, long modified, long stamp, CatalogFlags flags = {});
+
+  /// `count` photos in a folder that is there, named "0.jpg" and on, or from `first` on; modified
+  /// when their transcoding was finished, at `stamp`.
+  void AddPhotos(const std::string& folder, int count, long stamp, int first = 0);
 
   /// Marks a file as deleted and its transcoding as withdrawn at `stamp`.
   void DeletePhoto(const std::string& path, long stamp);

@@ -11,10 +11,12 @@
 #include <unistd.h>
 
 #include <csignal>
+#include <filesystem>
 #include <fstream>
 #include <ostream>
 #include <stdexcept>
 #include <system_error>
+#include <thread>
 #include <utility>
 
 namespace orva::test {
@@ -82,6 +84,22 @@ DaemonProcess::End DaemonProcess::AwaitEnd() {
   }
   pid_ = -1;
   return WIFEXITED(status) ? Exited(WEXITSTATUS(status)) : Killed(WTERMSIG(status));
+}
+
+void DaemonProcess::AwaitSystemCall(long number) const {
+  const std::filesystem::path tasks = "/proc/" + std::to_string(pid_) + "/task";
+  const auto end = std::chrono::steady_clock::now() + DEADLINE;
+  while (std::chrono::steady_clock::now() < end) {
+    for (const auto& task : std::filesystem::directory_iterator(tasks)) {
+      // "number arguments...", or "running"
+      long current = -1;
+      if (std::ifstream(task.path() / "syscall") >> current && current == number) {
+        return;
+      }
+    }
+    std::this_thread::yield();
+  }
+  throw std::runtime_error("the daemon has not come to system call " + std::to_string(number));
 }
 
 std::vector<std::string> DaemonProcess::StandardOutput() const {

@@ -41,6 +41,15 @@ void Volume::MakeReadOnly() {
   Check(mount(nullptr, path_.c_str(), nullptr, MS_REMOUNT | MS_BIND | MS_RDONLY, nullptr), path_);
 }
 
+void Volume::MakeWritable() {
+  Check(mount(nullptr, path_.c_str(), nullptr, MS_REMOUNT | MS_BIND, nullptr), path_);
+}
+
+void Volume::Resize(double bytes) {
+  const std::string size = "size=" + std::to_string(static_cast<long long>(bytes));
+  Check(mount(nullptr, path_.c_str(), nullptr, MS_REMOUNT, size.c_str()), path_);
+}
+
 void Volume::Unmount() {
   if (mounted_) {
     umount2(path_.c_str(), MNT_DETACH);

@@ -23,6 +23,12 @@ public:
   /// Makes everything on the volume unwritable. Throws std::system_error.
   void MakeReadOnly();
 
+  /// Takes MakeReadOnly back. Throws std::system_error.
+  void MakeWritable();
+
+  /// Changes the size of the file system to no less than what is used. Throws std::system_error.
+  void Resize(double bytes);
+
   /// Pulls the volume: unmounts it and removes the mount point. Harmless when done before.
   void Unmount();
 

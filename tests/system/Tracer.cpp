@@ -1,0 +1,172 @@
+#include "Tracer.h"
+
+#include <fcntl.h>
+#include <sys/ptrace.h>
+#include <sys/syscall.h>
+#include <sys/uio.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <csignal>
+#include <filesystem>
+#include <stdexcept>
+#include <system_error>
+
+namespace orva::test {
+
+namespace {
+
+constexpr int SYSTEM_CALL_STOP = SIGTRAP | 0x80;
+
+long Trace(__ptrace_request request, pid_t thread, long data = 0) {
+  return ptrace(request, thread, nullptr, data);
+}
+
+/// Waits for a stop of `thread`, of any thread when it is 0, and returns what stopped it.
+siginfo_t AwaitStop(pid_t thread) {
+  siginfo_t stop{};
+  while (waitid(thread == 0 ? P_ALL : P_PID, static_cast<id_t>(thread), &stop, WSTOPPED | __WALL) !=
+         0) {
+    if (errno != EINTR) {
+      throw std::system_error(errno, std::generic_category(), "waitid");
+    }
+  }
+  return stop;
+}
+
+/// The signal that a stopped thread is to get when it goes on; 0 when tracing stopped it.
+int SignalOf(const siginfo_t& stop) {
+  return stop.si_status == SYSTEM_CALL_STOP || (stop.si_status >> 8) != 0 ? 0 : stop.si_status;
+}
+
+/// Whether the stopped thread is about to make a call, and which.
+bool IsEntry(pid_t thread, SystemCall& call) {
+  struct __ptrace_syscall_info info {};
+  if (ptrace(PTRACE_GET_SYSCALL_INFO, thread, sizeof info, &info) <= 0 ||
+      info.op != PTRACE_SYSCALL_INFO_ENTRY) {
+    return false;
+  }
+  call.thread = thread;
+  call.number = info.entry.nr;
+  std::copy(std::begin(info.entry.args), std::end(info.entry.args), call.arguments.begin());
+  return true;
+}
+
+} // namespace
+
+bool IsEffect(const SystemCall& call) {
+  switch (call.number) {
+  case SYS_write:
+  case SYS_pwrite64:
+  case SYS_sendto:
+  case SYS_ftruncate:
+  case SYS_fsync:
+  case SYS_fdatasync:
+  case SYS_unlink:
+  case SYS_unlinkat:
+  case SYS_rename:
+  case SYS_renameat:
+  case SYS_renameat2:
+  case SYS_mkdir:
+  case SYS_mkdirat:
+  case SYS_fchmod:
+  case SYS_fchmodat:
+    return true;
+  case SYS_openat:
+    return (call.arguments[2] & O_CREAT) != 0;
+  default:
+    return false;
+  }
+}
+
+Tracer::Tracer(pid_t process) : process_(process) {
+  std::size_t before = 0;
+  do {
+    before = held_.size();
+    SeizeNewThreads();
+  } while (held_.size() != before);
+}
+
+void Tracer::SeizeNewThreads() {
+  constexpr long options = PTRACE_O_TRACESYSGOOD | PTRACE_O_TRACECLONE | PTRACE_O_TRACEEXIT;
+  const std::filesystem::path tasks = "/proc/" + std::to_string(process_) + "/task";
+  for (const auto& entry : std::filesystem::directory_iterator(tasks)) {
+    const pid_t thread = std::stoi(entry.path().filename());
+    if (held_.contains(thread) || Trace(PTRACE_SEIZE, thread, options) != 0) {
+      if (!held_.contains(thread) && errno != ESRCH) {
+        throw std::system_error(errno, std::generic_category(), "PTRACE_SEIZE");
+      }
+      continue;
+    }
+    Trace(PTRACE_INTERRUPT, thread);
+    AwaitStop(thread);
+    held_[thread] = true;
+  }
+}
+
+Tracer::~Tracer() {
+  // The first thread last: its end is told only when the others are gone.
+  for (const auto& [thread, held] : held_) {
+    if (thread != process_) {
+      Release(thread);
+    }
+  }
+  Release(process_);
+}
+
+void Tracer::Release(pid_t thread) {
+  if (held_[thread] && Trace(PTRACE_DETACH, thread) == 0) {
+    return;
+  }
+  Trace(PTRACE_INTERRUPT, thread);
+  siginfo_t state{};
+  if (waitid(P_PID, static_cast<id_t>(thread), &state, WSTOPPED | WEXITED | WNOWAIT | __WALL) !=
+      0) {
+    return;
+  }
+  if (state.si_code == CLD_TRAPPED) {
+    Trace(PTRACE_DETACH, thread, SignalOf(state));
+  } else if (thread != process_) {
+    waitpid(thread, nullptr, __WALL);
+  }
+}
+
+void Tracer::RunUntil(const Condition& holds) {
+  for (auto& [thread, held] : held_) {
+    if (held) {
+      Trace(PTRACE_SYSCALL, thread);
+      held = false;
+    }
+  }
+  for (;;) {
+    const siginfo_t stop = AwaitStop(0);
+    const pid_t thread = stop.si_pid;
+    held_[thread] = false; // also of a thread that has just been made
+    if (stop.si_status >> 8 == PTRACE_EVENT_EXIT && thread == process_) {
+      held_[thread] = true;
+      throw std::runtime_error("the traced process has come to its end");
+    }
+    SystemCall call{};
+    if (stop.si_status == SYSTEM_CALL_STOP && IsEntry(thread, call) && holds(call)) {
+      held_[thread] = true;
+      return;
+    }
+    Trace(PTRACE_SYSCALL, thread, SignalOf(stop));
+  }
+}
+
+std::string Tracer::Data(const SystemCall& call) const {
+  if (call.number != SYS_write && call.number != SYS_pwrite64 && call.number != SYS_sendto) {
+    return {};
+  }
+  std::string data(std::min<std::size_t>(call.arguments[2], 65536), '\0');
+  const iovec here{data.data(), data.size()};
+  const iovec there{reinterpret_cast<void*>(call.arguments[1]), data.size()};
+  const ssize_t size = process_vm_readv(process_, &here, 1, &there, 1, 0);
+  data.resize(static_cast<std::size_t>(std::max<ssize_t>(size, 0)));
+  return data;
+}
+
+} // namespace orva::test

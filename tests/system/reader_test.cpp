@@ -1,0 +1,265 @@
+#include "Catalog.h"
+#include "Deadline.h"
+#include "Expectations.h"
+#include "Messages.h"
+#include "Tracer.h"
+
+#include "support/Extent.h"
+
+#include <fcntl.h>
+#include <poll.h>
+#include <spawn.h>
+#include <sys/syscall.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <array>
+#include <set>
+#include <stdexcept>
+
+namespace orva::test {
+namespace {
+
+/// Another program, which reads the rows of B in the merged database on A all the time.
+class Reader {
+public:
+  Reader() {
+    std::array<int, 2> input{};
+    std::array<int, 2> output{};
+    if (pipe2(input.data(), O_CLOEXEC) != 0 || pipe2(output.data(), O_CLOEXEC) != 0) {
+      throw std::runtime_error("pipe2");
+    }
+    posix_spawn_file_actions_t actions;
+    posix_spawn_file_actions_init(&actions);
+    posix_spawn_file_actions_adddup2(&actions, input[0], STDIN_FILENO);
+    posix_spawn_file_actions_adddup2(&actions, output[1], STDOUT_FILENO);
+    std::array<std::string, 3> texts{READER, "/shares/A", "/shares/B/"};
+    std::array<char*, 4> arguments{texts[0].data(), texts[1].data(), texts[2].data(), nullptr};
+    const int code = posix_spawn(&pid_, READER, &actions, nullptr, arguments.data(), environ);
+    posix_spawn_file_actions_destroy(&actions);
+    close(input[0]);
+    close(output[1]);
+    input_ = input[1];
+    output_ = output[0];
+    if (code != 0) {
+      throw std::runtime_error(READER);
+    }
+  }
+  Reader(const Reader&) = delete;
+  Reader& operator=(const Reader&) = delete;
+  ~Reader() {
+    Stop();
+    close(output_);
+  }
+
+  /// Takes reads until one has seen `sight`.
+  void Await(const std::string& sight) {
+    while (sights_.empty() || sights_.back() != sight) {
+      TakeSome();
+    }
+  }
+
+  /// Ends the program and takes its last reads. True when it has ended well.
+  bool Stop() {
+    if (pid_ == -1) {
+      return true;
+    }
+    close(input_);
+    while (TakeSome()) {
+    }
+    int status = 0;
+    waitpid(pid_, &status, 0);
+    pid_ = -1;
+    return WIFEXITED(status) && WEXITSTATUS(status) == 0;
+  }
+
+  /// What the reads saw, in their order.
+  const Lines& Sights() const { return sights_; }
+  /// Microseconds that a read has waited at most.
+  long LongestWait() const { return longestWait_; }
+
+private:
+  bool TakeSome() {
+    pollfd ready{output_, POLLIN, 0};
+    const auto deadline = std::chrono::milliseconds(DEADLINE).count();
+    if (poll(&ready, 1, static_cast<int>(deadline)) != 1) {
+      throw std::runtime_error("the reader does not read");
+    }
+    std::array<char, 65536> bytes{};
+    const ssize_t size = read(output_, bytes.data(), bytes.size());
+    if (size <= 0) {
+      return false;
+    }
+    rest_.append(bytes.data(), static_cast<std::size_t>(size));
+    for (auto end = rest_.find('\n'); end != std::string::npos; end = rest_.find('\n')) {
+      const auto bar = rest_.find('|');
+      longestWait_ = std::max(longestWait_, std::stol(rest_.substr(0, bar)));
+      sights_.push_back(rest_.substr(bar + 1, end - bar - 1));
+      rest_.erase(0, end + 1);
+    }
+    return true;
+  }
+
+  pid_t pid_ = -1;
+  int input_ = -1;  ///< owned until Stop
+  int output_ = -1; ///< owned
+  std::string rest_;
+  Lines sights_;
+  long longestWait_ = 0;
+};
+
+/// Merges of B into A that are watched. B grows by folders of 500 photos, each with a stamp of its
+/// own.
+class Readers : public SystemTest {
+protected:
+  void SetUp() override {
+    appliance.Start();
+    for (const Volume* volume : {&a, &b}) {
+      appliance.Handle(Plugged(volume->Path()));
+    }
+    appliance.Handle(Scanned(a.Path()));
+  }
+
+  void Grow(int photos) {
+    catalog.Rows().Run("BEGIN");
+    for (int added = 0; added < photos; added += PER_FOLDER) {
+      const std::string folder = "Folder" + std::to_string(++folders) + "/";
+      catalog.AddFolder(folder, 500);
+      catalog.AddPhotos(folder, PER_FOLDER, folders);
+    }
+    catalog.Rows().Run("COMMIT");
+  }
+
+  void Merge() { appliance.Handle(TranscodedBatch(b.Path())); }
+
+  /// What a reader sees when all that there is in the catalog has been merged.
+  std::string Whole() const {
+    const std::string photos = std::to_string(folders * PER_FOLDER);
+    return photos + "|0|" + std::to_string(folders + 1) + "|" + photos + "|" + photos + "|" +
+           std::to_string(folders);
+  }
+
+  /// What a reader may see before a re-merge begins to add: the time set back, and then no rows.
+  std::set<std::string> SetBack() const {
+    const std::string photos = std::to_string(folders * PER_FOLDER);
+    const std::string statistics = "|" + photos + "|" + photos + "|0";
+    return {photos + "|0|" + std::to_string(folders + 1) + statistics, "0|0|0" + statistics};
+  }
+
+  static constexpr int PER_FOLDER = 500;
+  const Volume a{"A", "150g"};
+  const Volume b{"B", "1g"};
+  Catalog catalog{b};
+  int folders = 0;
+};
+
+TEST_F(Readers, SeeOnlyWhatWasCommitted) {
+  Grow(Extent(10'000, 50'000));
+  Merge();
+  std::set<std::string> committed{Whole()};
+  std::array<Reader, 2> readers;
+  for (int i = 0; i < Extent(10, 100); ++i) {
+    const std::set<std::string> between = SetBack();
+    Grow(1000);
+    if (i % 5 == 4) {
+      committed.insert(between.begin(), between.end());
+      appliance.Handle(Purged(b.Path()));
+    } else {
+      Merge();
+    }
+    committed.insert(Whole());
+    for (Reader& reader : readers) {
+      reader.Await(Whole());
+    }
+  }
+  std::size_t reads = 0;
+  for (Reader& reader : readers) {
+    EXPECT_TRUE(reader.Stop());
+    for (const std::string& sight : reader.Sights()) {
+      ASSERT_TRUE(committed.contains(sight)) << sight;
+    }
+    reads += reader.Sights().size();
+  }
+  ReportFigure("reads by other programs during merges, none of half a merge",
+               std::to_string(reads));
+}
+
+/// The daemon is held before each of its effects, and somebody reads who does not wait.
+TEST_F(Readers, WaitOnlyForTheCommit) {
+  Grow(1000);
+  Merge();
+  const std::string before = Whole();
+  Grow(1000);
+  const MergedDatabase reader(a.Path());
+  reader.Rows().Run("PRAGMA busy_timeout = 0");
+  const auto read = [&]() -> std::string {
+    try {
+      return reader.Rows().Run("SELECT (SELECT count(*) FROM Files) || '|0|' || (SELECT count(*) "
+                               "FROM Folders WHERE volume = '/shares/B/'), photos_xcoded, "
+                               "photos_total, last_updated_time FROM Statistics")[0];
+    } catch (const std::runtime_error&) {
+      return "locked";
+    }
+  };
+
+  // What is read, with the number of effects at which it is, one behind the other.
+  std::vector<std::pair<std::string, int>> phases;
+  int added = 0;
+  int readsBetweenAdds = 0;
+  bool merged = false;
+  int lockedBeforeCommit = 0;
+  {
+    Tracer tracer(appliance.Daemon().Pid());
+    appliance.Service().Send(TranscodedBatch(b.Path()));
+    const std::string last = appliance.SendBarrier();
+    std::string data;
+    do {
+      tracer.RunUntil([&](const SystemCall& call) {
+        data = IsEffect(call) ? tracer.Data(call) : "";
+        return IsEffect(call);
+      });
+      const std::string seen = read();
+      if (phases.empty() || phases.back().first != seen) {
+        phases.emplace_back(seen, 0);
+      }
+      ++phases.back().second;
+      added += data.starts_with("Adding file ") ? 1 : 0;
+      readsBetweenAdds += added > 0 && added < 1000 && seen == before ? 1 : 0;
+      lockedBeforeCommit += !merged && seen == "locked" ? 1 : 0;
+      merged = merged || data.find(" files for /shares/B/ in ") != std::string::npos;
+    } while (data.find(last) == std::string::npos);
+  }
+  appliance.Barrier();
+  EXPECT_EQ(1000, added);
+  EXPECT_GT(readsBetweenAdds, 1900);
+  EXPECT_EQ(0, lockedBeforeCommit);
+  ASSERT_EQ(3U, phases.size());
+  EXPECT_EQ(before, phases[0].first);
+  EXPECT_EQ("locked", phases[1].first);
+  EXPECT_EQ(Whole(), phases[2].first);
+}
+
+TEST_F(Readers, TellHowLongTheyWaited) {
+  Grow(1'000);
+  for (const int photos : {1'000, 50'000}) {
+    long longest = 0;
+    for (int i = 0; i < Extent(2, 10); ++i) {
+      Merge();
+      const std::string before = Whole();
+      Grow(photos);
+      Reader reader;
+      reader.Await(before);
+      Merge();
+      reader.Await(Whole());
+      EXPECT_TRUE(reader.Stop());
+      longest = std::max(longest, reader.LongestWait());
+    }
+    ReportFigure("longest wait of a reader in merges of " + std::to_string(photos) +
+                     " files, microseconds",
+                 std::to_string(longest));
+  }
+}
+
+} // namespace
+} // namespace orva::test
