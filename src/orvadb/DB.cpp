@@ -92,7 +92,7 @@ void DB::Open(const std::string& path) {
 
 void DB::Open(std::string path, Access access, int busyTimeout, bool immutable) {
   Close();
-  fileSize_ = CheckDatabaseFiles(path);
+  fileSize_ = CheckDatabaseFiles(path, access == Access::ReadWrite);
   if (access == Access::ReadWrite) {
     CheckJournal(path);
   }

@@ -39,8 +39,9 @@ private:
 
 /// Bytes of the regular file at `path`, 0 when there is none. A hole takes no room and counts for
 /// little: what bounds the work on a file is not to be had for nothing. A file system that
-/// compresses, or has not yet placed what was just written, has few holes by this measure.
-long long RegularSize(const std::string& path) {
+/// compresses has few holes by this measure, and one that does not tell has none. A file that is
+/// written must have no other name, which may be that of somebody else's.
+long long RegularSize(const std::string& path, bool written) {
   constexpr long long blockSize = 512;
   constexpr long long mostFree = 4 << 20;
   constexpr long long mostPerPlaced = 16;
@@ -51,13 +52,13 @@ long long RegularSize(const std::string& path) {
   if (!S_ISREG(status.st_mode)) {
     throw util::FormatString("%s:%d: '%s' is not a regular file", __FILE__, __LINE__, path.c_str());
   }
-  // SQLite writes into these and gives them the owner of the database: another name may be that of
-  // somebody else's file.
-  if (status.st_nlink > 1) {
+  if (written && status.st_nlink > 1) {
     throw util::FormatString("%s:%d: '%s' has another name", __FILE__, __LINE__, path.c_str());
   }
-  return std::min<long long>(status.st_size,
-                             mostFree + mostPerPlaced * blockSize * status.st_blocks);
+  return status.st_blocks == 0
+             ? status.st_size
+             : std::min<long long>(status.st_size,
+                                   mostFree + mostPerPlaced * blockSize * status.st_blocks);
 }
 
 void Synchronise(const std::string& path, int flags, bool mayBeUnsupported) {
@@ -83,10 +84,12 @@ bool RemoveLogs(const std::string& path) {
 
 } // namespace
 
-long long CheckDatabaseFiles(const std::string& path) {
-  long long size = RegularSize(path);
+long long CheckDatabaseFiles(const std::string& path, bool written) {
+  long long size = RegularSize(path, written);
   for (const char* const suffix : LOG_SUFFIXES) {
-    size += RegularSize(path + suffix);
+    // SQLite writes into some of these, and gives others the owner of the database, also where it
+    // only reads.
+    size += RegularSize(path + suffix, true);
   }
   return size;
 }
@@ -114,7 +117,7 @@ bool RemoveDatabase(const std::string& path) {
 
 void PublishDatabase(const std::string& from, const std::string& to) {
   Synchronise(from, 0, false);
-  CheckDatabaseFiles(to);
+  CheckDatabaseFiles(to, true);
   if (!RemoveLogs(to)) {
     throw util::FormatString("%s:%d: cannot remove what is left of '%s'", __FILE__, __LINE__,
                              to.c_str());

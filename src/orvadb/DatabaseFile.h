@@ -7,10 +7,11 @@
 
 namespace orva::db {
 
-/// Makes sure that SQLite may open the database at `path`, which need not exist: that none of
-/// its files is anything other than a regular one, which might be waited on or written to
-/// elsewhere. Returns their size in bytes.
-long long CheckDatabaseFiles(const std::string& path);
+/// Makes sure that SQLite may open the database at `path`, which need not exist, to read or also to
+/// write it: that none of its files is anything other than a regular one, which might be waited on,
+/// nor written under a second name that somebody else relies on. Returns their size in bytes; holes
+/// count for little.
+long long CheckDatabaseFiles(const std::string& path, bool written);
 
 /// Makes sure that undoing an interrupted transaction of the database at `path` touches no other
 /// file: refuses a journal that names one.

@@ -25,9 +25,8 @@ void TellHeap() {
 
 } // namespace
 
-extern "C" ssize_t recv(int descriptor, void* data, size_t size, int flags) {
+extern "C" ssize_t recv(int fd, void* buf, size_t n, int flags) {
   TellHeap();
   static void* const next = dlsym(RTLD_NEXT, "recv");
-  return reinterpret_cast<ssize_t (*)(int, void*, size_t, int)>(next)(descriptor, data, size,
-                                                                      flags);
+  return reinterpret_cast<ssize_t (*)(int, void*, size_t, int)>(next)(fd, buf, n, flags);
 }

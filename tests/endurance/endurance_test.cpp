@@ -41,10 +41,11 @@ constexpr std::size_t THREADS = 2; ///< the main thread and the listener
 constexpr std::size_t SETTLED = 100;
 /// Stacks of ended threads that the C library keeps for the next ones.
 constexpr long CACHED_STACKS = 5;
-/// Bytes for what differs between two moments: which volumes are registered, which state was last.
-constexpr long HEAP_SLACK = 4096;
+/// Bytes for what differs between two moments: which volumes are registered, which state was last,
+/// how long the longest line was that was printed.
+constexpr long HEAP_SLACK = 8192;
 /// Bytes for what the allocator has not given back.
-constexpr long RESIDENT_SLACK = 4 * 1024 * 1024;
+constexpr long RESIDENT_SLACK = 4L * 1024 * 1024;
 constexpr std::size_t LONGEST_MESSAGE = 65536;
 
 constexpr std::uint64_t DEFAULT_SEED = 2;
@@ -92,7 +93,8 @@ Outcome Observe(const Log& lines) {
     if (master != std::string::npos) {
       outcome.mergedInto = line.text.substr(master + at.size());
     }
-    merged += line.text.starts_with("Merged ") && line.text.find(" files for ") != line.text.npos;
+    merged +=
+        line.text.starts_with("Merged ") && line.text.find(" files for ") != std::string::npos;
     outcome.gaveUp = outcome.gaveUp || line.text.starts_with("Error that we will ignore ");
     outcome.refused = outcome.refused || line.text.starts_with("MessageProcessor:: ");
   }
