@@ -51,8 +51,9 @@ std::string ErrorMessage(sqlite3* handle, const char* sql, const char* file, uns
   const char* const reason = code == SQLITE_INTERRUPT
                                  ? "more work than a database of this size can need"
                                  : sqlite3_errmsg(handle);
-  return util::FormatString("%s:%u: %s (extended code %d) in \"%s\"", file, line, reason, code,
-                            sql);
+  // A name in a stranger's schema may be of any length, but no line of the system log may be.
+  return util::FormatString("%s:%u: %.500s (extended code %d) in \"%.500s\"", file, line, reason,
+                            code, sql);
 }
 
 } // namespace orva::db

@@ -49,6 +49,16 @@ void Distrust(sqlite3* handle) {
   Run(handle, "PRAGMA ignore_check_constraints = ON");
 }
 
+/// The pragma with a name, which may be any text, as its argument.
+std::string Pragma(const char* pragma, const std::string& name) {
+  const std::unique_ptr<char, decltype(&sqlite3_free)> sql(
+      sqlite3_mprintf("PRAGMA %s(%Q)", pragma, name.c_str()), &sqlite3_free);
+  if (!sql) {
+    throw util::FormatString("%s:%d: out of memory", __FILE__, __LINE__);
+  }
+  return sql.get();
+}
+
 /// `path` as a URI that promises that nobody writes the file.
 std::string ImmutableUri(const std::string& path) {
   std::string uri = "file:";
@@ -82,7 +92,7 @@ void DB::Open(const std::string& path) {
 
 void DB::Open(std::string path, Access access, int busyTimeout, bool immutable) {
   Close();
-  fileSize_ = CheckDatabaseFiles(path);
+  fileSize_ = CheckDatabaseFiles(path, access == Access::ReadWrite);
   if (access == Access::ReadWrite) {
     CheckJournal(path);
   }
@@ -113,7 +123,10 @@ void DB::Open(std::string path, Access access, int busyTimeout, bool immutable) 
 
 void DB::Create(const std::string& path, const std::function<void()>& build) {
   const std::string unfinished = path + ".new";
-  RemoveDatabase(unfinished);
+  if (!RemoveDatabase(unfinished)) {
+    // It would be taken for what is built now.
+    throw util::FormatString("%s:%d: cannot remove '%s'", __FILE__, __LINE__, unfinished.c_str());
+  }
   try {
     Open(unfinished);
     build();
@@ -135,18 +148,18 @@ void DB::Close() {
   path_.clear();
 }
 
-void DB::RefuseComputedValues(const char* table) const {
+void DB::RefuseComputedValues(const std::string& table) const {
   const bool written = sqlite3_db_readonly(handle_, "main") == 0;
   const auto refuse = [&](bool computed, const char* what) {
     if (computed) {
-      throw util::FormatString("%s:%d: %s in table %s of '%s'", __FILE__, __LINE__, what, table,
-                               path_.c_str());
+      throw util::FormatString("%s:%d: %s in table %.500s of '%s'", __FILE__, __LINE__, what,
+                               table.c_str(), path_.c_str());
     }
   };
   constexpr int virtualColumn = 2; // and above: stored ones
   constexpr int expression = -2;   // in the place of a column's number
 
-  const std::string listColumns = util::FormatString("PRAGMA table_xinfo(%s)", table);
+  const std::string listColumns = Pragma("table_xinfo", table);
   Statement column(*this, listColumns.c_str(), __FILE__, __LINE__);
   while (column.Fetch(__FILE__, __LINE__)) {
     refuse(column.GetInt(6) >= virtualColumn, "generated column");
@@ -156,19 +169,15 @@ void DB::RefuseComputedValues(const char* table) const {
     return;
   }
   std::vector<std::string> indices;
-  const std::string listIndices = util::FormatString("PRAGMA index_list(%s)", table);
+  const std::string listIndices = Pragma("index_list", table);
   Statement index(*this, listIndices.c_str(), __FILE__, __LINE__);
   while (index.Fetch(__FILE__, __LINE__)) {
     refuse(index.GetBool(4), "partial index");
     indices.push_back(index.GetText(1));
   }
   for (const std::string& name : indices) {
-    const std::unique_ptr<char, decltype(&sqlite3_free)> listKeys(
-        sqlite3_mprintf("PRAGMA index_xinfo(%Q)", name.c_str()), &sqlite3_free);
-    if (!listKeys) {
-      throw util::FormatString("%s:%d: out of memory", __FILE__, __LINE__);
-    }
-    Statement key(*this, listKeys.get(), __FILE__, __LINE__);
+    const std::string listKeys = Pragma("index_xinfo", name);
+    Statement key(*this, listKeys.c_str(), __FILE__, __LINE__);
     while (key.Fetch(__FILE__, __LINE__)) {
       refuse(key.GetInt(1) == expression, "index on an expression");
     }

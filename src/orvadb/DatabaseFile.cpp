@@ -6,6 +6,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <array>
 #include <cerrno>
 #include <cstdio>
@@ -36,8 +37,14 @@ private:
   int descriptor_;
 };
 
-/// Bytes of the regular file at `path`, 0 when there is none.
-long long RegularSize(const std::string& path) {
+/// Bytes of the regular file at `path`, 0 when there is none. A hole takes no room and counts for
+/// little: what bounds the work on a file is not to be had for nothing. A file system that
+/// compresses has few holes by this measure, and one that does not tell has none. A file that is
+/// written must have no other name, which may be that of somebody else's.
+long long RegularSize(const std::string& path, bool written) {
+  constexpr long long blockSize = 512;
+  constexpr long long mostFree = 4 << 20;
+  constexpr long long mostPerPlaced = 16;
   struct stat status {};
   if (lstat(path.c_str(), &status) != 0) {
     return 0;
@@ -45,7 +52,13 @@ long long RegularSize(const std::string& path) {
   if (!S_ISREG(status.st_mode)) {
     throw util::FormatString("%s:%d: '%s' is not a regular file", __FILE__, __LINE__, path.c_str());
   }
-  return status.st_size;
+  if (written && status.st_nlink > 1) {
+    throw util::FormatString("%s:%d: '%s' has another name", __FILE__, __LINE__, path.c_str());
+  }
+  return status.st_blocks == 0
+             ? status.st_size
+             : std::min<long long>(status.st_size,
+                                   mostFree + mostPerPlaced * blockSize * status.st_blocks);
 }
 
 void Synchronise(const std::string& path, int flags, bool mayBeUnsupported) {
@@ -56,18 +69,27 @@ void Synchronise(const std::string& path, int flags, bool mayBeUnsupported) {
   }
 }
 
-void RemoveLogs(const std::string& path) {
+/// Returns whether nothing is there afterwards.
+bool Remove(const std::string& path) {
+  return unlink(path.c_str()) == 0 || errno == ENOENT;
+}
+
+bool RemoveLogs(const std::string& path) {
+  bool gone = true;
   for (const char* const suffix : LOG_SUFFIXES) {
-    unlink((path + suffix).c_str());
+    gone = Remove(path + suffix) && gone;
   }
+  return gone;
 }
 
 } // namespace
 
-long long CheckDatabaseFiles(const std::string& path) {
-  long long size = RegularSize(path);
+long long CheckDatabaseFiles(const std::string& path, bool written) {
+  long long size = RegularSize(path, written);
   for (const char* const suffix : LOG_SUFFIXES) {
-    size += RegularSize(path + suffix);
+    // SQLite writes into some of these, and gives others the owner of the database, also where it
+    // only reads.
+    size += RegularSize(path + suffix, true);
   }
   return size;
 }
@@ -88,15 +110,18 @@ void CheckJournal(const std::string& path) {
   }
 }
 
-void RemoveDatabase(const std::string& path) {
-  unlink(path.c_str());
-  RemoveLogs(path);
+bool RemoveDatabase(const std::string& path) {
+  const bool gone = Remove(path);
+  return RemoveLogs(path) && gone;
 }
 
 void PublishDatabase(const std::string& from, const std::string& to) {
   Synchronise(from, 0, false);
-  CheckDatabaseFiles(to);
-  RemoveLogs(to);
+  CheckDatabaseFiles(to, true);
+  if (!RemoveLogs(to)) {
+    throw util::FormatString("%s:%d: cannot remove what is left of '%s'", __FILE__, __LINE__,
+                             to.c_str());
+  }
   if (std::rename(from.c_str(), to.c_str()) != 0) {
     throw util::FormatString("%s:%d: cannot rename '%s' to '%s': %s", __FILE__, __LINE__,
                              from.c_str(), to.c_str(), std::strerror(errno));

@@ -26,6 +26,13 @@ namespace {
 /// Bytes read at once.
 constexpr std::size_t CHUNK_SIZE = 16384;
 
+/// Elements inside each other in the longest message, each of which takes at least "<a></a>". What
+/// goes deeper is no document, and the parser would need as much memory again to find that out.
+constexpr std::size_t DEEPEST_NESTING = MessageProcessor::MAXIMUM_MESSAGE_LENGTH / 7;
+
+/// Bytes of a message that leaves the parser with no more memory than is good to keep.
+constexpr unsigned long ORDINARY_LENGTH = 4096;
+
 /// A message that is no XML document we take.
 class IllFormedMessage : public Exception {
   using Exception::Exception;
@@ -57,8 +64,33 @@ public:
     throw IllFormedMessage("document type declaration refused", __FILE__, __LINE__);
   }
 
+  void startDocument() override {
+    depth_ = 0;
+    XercesDOMParser::startDocument();
+  }
+
+  void startElement(const xercesc::XMLElementDecl& elementDecl, const unsigned int uriId,
+                    const XMLCh* const prefix,
+                    const xercesc::RefVectorOf<xercesc::XMLAttr>& attributes,
+                    const XMLSize_t attributeCount, const bool isEmpty,
+                    const bool isRoot) override {
+    if (depth_ == DEEPEST_NESTING) {
+      throw IllFormedMessage("more elements inside each other than can end", __FILE__, __LINE__);
+    }
+    ++depth_; // an empty element ends as well
+    XercesDOMParser::startElement(elementDecl, uriId, prefix, attributes, attributeCount, isEmpty,
+                                  isRoot);
+  }
+
+  void endElement(const xercesc::XMLElementDecl& elementDecl, const unsigned int uriId,
+                  const bool isRoot, const XMLCh* const prefix) override {
+    --depth_;
+    XercesDOMParser::endElement(elementDecl, uriId, isRoot, prefix);
+  }
+
 private:
   StrictErrorHandler errorHandler_;
+  std::size_t depth_ = 0; ///< elements that have not ended
 };
 
 /// Keeps a parser in its place for as long as the scope lives.
@@ -144,6 +176,12 @@ void MessageProcessor::ProcessMessage(Stream& stream, const unsigned char* data,
 
 void MessageProcessor::ParseMessage(Stream& stream, const unsigned char* data,
                                     unsigned long length) const {
+  if (spent_) {
+    parser_ = std::make_unique<MessageParser>();
+  }
+  spent_ = length > ORDINARY_LENGTH;
+  // It keeps what it made of an ill-formed message, one document for each.
+  parser_->resetDocumentPool();
   try {
     parser_->parse(xercesc::MemBufInputSource(data, length, "message"));
   } catch (const xercesc::SAXException& exception) {
@@ -154,7 +192,7 @@ void MessageProcessor::ParseMessage(Stream& stream, const unsigned char* data,
     throw IllFormedMessage(XMLCh2string(exception.getMessage()), __FILE__, __LINE__);
   } catch (const xercesc::OutOfMemoryException&) {
     // The parser believes that it is still parsing and would refuse every further message.
-    parser_ = std::make_unique<MessageParser>();
+    spent_ = true;
     throw;
   }
   const std::unique_ptr<xercesc::DOMDocument, DocumentRelease> document(parser_->adoptDocument());

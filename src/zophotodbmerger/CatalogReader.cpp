@@ -43,8 +43,8 @@ public:
   }
 
 private:
-  // The smallest row takes a tenth of it.
-  static constexpr long long PER_BYTE = 100;
+  // The smallest row takes half of it.
+  static constexpr long long PER_BYTE = 20;
   static constexpr long long LEAST = 1 << 20;
 
   const db::VolumeDB& catalog_;

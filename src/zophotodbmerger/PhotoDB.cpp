@@ -324,8 +324,23 @@ void PhotoDB::DeleteVolumes() const {
   }
 }
 
+// When our rows go, SQLite computes the defaults and the indices of tables that refer to them.
+void PhotoDB::RefuseDearReferences() const {
+  std::vector<std::string> tables;
+  Statement query(*this,
+                  "SELECT name FROM sqlite_schema WHERE type = 'table' AND sql LIKE '%REFERENCES%'",
+                  __FILE__, __LINE__);
+  while (query.Fetch(__FILE__, __LINE__)) {
+    tables.push_back(query.GetText(0));
+  }
+  for (const std::string& table : tables) {
+    RefuseComputedValues(table);
+  }
+}
+
 void PhotoDB::DeleteVolume(const std::string& volume) const {
   Known().Forget();
+  RefuseDearReferences();
   // Nothing holds these together: whatever stops between them must leave what the next merge of
   // the volume makes good. So its time goes back before the first row goes, and folders take
   // their files along, which would belong to none and never be found again.

@@ -13,6 +13,10 @@ namespace {
 /// Bytes that a master must have more of to hold the merged database: 200 MiB.
 constexpr double MINIMUM_FREE_SPACE = 209715200.0;
 
+/// More than any appliance has. Every spelling of a path is a volume of its own, and nothing but
+/// the service's messages says how many there are.
+constexpr std::size_t MOST_VOLUMES = 1000;
+
 } // namespace
 
 VolumeInfoManager* VolumeInfoManager::instance = nullptr;
@@ -30,9 +34,15 @@ void VolumeInfoManager::addVolumeInfo(VolumeInfo& volume) {
            volume.mountPoint.c_str());
     return;
   }
-  if (std::find(volumes.begin(), volumes.end(), volume) == volumes.end()) {
-    volumes.push_back(volume);
+  if (std::find(volumes.begin(), volumes.end(), volume) != volumes.end()) {
+    return;
   }
+  if (volumes.size() == MOST_VOLUMES) {
+    syslog(LOG_LOCAL1 | LOG_ERR, "There are too many volumes to register the mountpoint %s",
+           volume.mountPoint.c_str());
+    return;
+  }
+  volumes.push_back(volume);
 }
 
 void VolumeInfoManager::removeVolumeInfo(VolumeInfo& volume) {

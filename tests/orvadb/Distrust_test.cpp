@@ -180,6 +180,24 @@ TEST_F(DistrustTest, JournalWithTheMarkElsewhereIsAnyJournal) {
   }
 }
 
+TEST_F(DistrustTest, FileWithAnotherNameIsReadButNotWritten) {
+  fs::create_hard_link(path, "/tmp/db/snapshot");
+  TestDB db;
+  EXPECT_THAT(Thrown([&] { db.Open(path); }), HasSubstr("'/tmp/db/test.db' has another name"));
+  EXPECT_NO_THROW(db.Open(path, TestDB::Access::ReadOnly, 7, false));
+
+  std::ofstream("/tmp/db/dear") << "somebody's";
+  fs::create_hard_link("/tmp/db/dear", path + "-shm");
+  EXPECT_THAT(Thrown([&] { db.Open(path, TestDB::Access::ReadOnly, 7, false); }),
+              HasSubstr("'/tmp/db/test.db-shm' has another name"));
+}
+
+TEST_F(DistrustTest, HolesCountForLittle) {
+  fs::resize_file(path, 1LL << 40);
+  const TestDB db(path);
+  EXPECT_LT(db.GetFileSize(), 5 << 20);
+}
+
 TEST_F(DistrustTest, SizeCountsTheLogToo) {
   const Raw writer(path);
   Query(writer, "PRAGMA journal_mode = WAL; CREATE TABLE more(a)");

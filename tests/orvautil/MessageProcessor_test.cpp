@@ -455,6 +455,18 @@ TEST_F(MessageProcessorTest, TheDeepestNestingThatFitsIsHandled) {
   EXPECT_THAT(processor.handled, ElementsAre("a", "b"));
 }
 
+TEST_F(MessageProcessorTest, NestingThatCannotEndIsRefusedBeforeItsEnd) {
+  std::string message;
+  while (message.size() < LIMIT / 2) {
+    message += "<a>";
+  }
+  Read(message + END + "<b/>" + END);
+  EXPECT_THAT(processor.handled, ElementsAre("b"));
+  EXPECT_THAT(Logged(), ElementsAre(LogLine{
+                            LOG_LOCAL1 | LOG_ERR,
+                            "MessageProcessor:: more elements inside each other than can end"}));
+}
+
 TEST_F(MessageProcessorTest, ManyAttributesAreHandled) {
   std::string message = "<a";
   for (int i = 0; message.size() < LIMIT - 100; ++i) {

@@ -82,10 +82,10 @@ std::string Appliance::SendBarrier() {
 }
 
 std::vector<LogLine> Appliance::TakeLog() {
-  const std::vector<LogLine> all = log_.Lines();
+  const std::vector<LogLine> fresh = log_.Lines(logTaken_);
+  logTaken_ += fresh.size();
   std::vector<LogLine> taken;
-  for (; logTaken_ < all.size(); ++logTaken_) {
-    const LogLine& line = all[logTaken_];
+  for (const LogLine& line : fresh) {
     if (!line.text.starts_with(REFUSAL + BARRIER) &&
         !line.text.starts_with("Iterating over mount point ")) {
       taken.push_back({line.priority, MaskTimes(line.text)});

@@ -8,9 +8,9 @@ namespace orva::test {
 
 namespace {
 
-std::string Place(const Volume& volume) {
-  mkdir(core::GetORVA_HOME(volume.Path()).c_str(), 0755);
-  return core::GetCatalogPath(volume.Path());
+std::string Place(const std::string& root) {
+  mkdir(core::GetORVA_HOME(root).c_str(), 0755);
+  return core::GetCatalogPath(root);
 }
 
 /// "Pictures/" of "Pictures/a.jpg", "" of "Pictures/".
@@ -30,7 +30,7 @@ std::string Text(bool flag) {
 
 } // namespace
 
-Catalog::Catalog(const Volume& volume) : database_(Place(volume), true) {
+Catalog::Catalog(const std::string& root) : database_(Place(root), true) {
   database_.Run("CREATE TABLE Folders(id INTEGER PRIMARY KEY, folderId INTEGER, path TEXT, "
                 "name TEXT, category INTEGER, lastModifiedDate INTEGER, isBackup INTEGER, "
                 "isHidden INTEGER, isSystem INTEGER, isDeleted INTEGER, status INTEGER, "

@@ -19,7 +19,10 @@ struct CatalogFlags {
 class Catalog {
 public:
   /// Makes an empty catalog on the volume.
-  explicit Catalog(const Volume& volume);
+  explicit Catalog(const Volume& volume) : Catalog(volume.Path()) {}
+
+  /// Makes an empty catalog on the volume whose files are found at `root`.
+  explicit Catalog(const std::string& root);
 
   void AddFolder(const std::string& path, long modified, CatalogFlags flags = {});
 

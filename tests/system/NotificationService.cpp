@@ -6,8 +6,12 @@
 #include "orvautil/Core.h"
 #include "orvautil/Socket.h"
 
+#include <linux/sockios.h>
 #include <poll.h>
+#include <sched.h>
+#include <sys/ioctl.h>
 #include <sys/socket.h>
+#include <sys/time.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -42,6 +46,8 @@ void NotificationService::AwaitClient() {
   if (client_ == -1) {
     throw std::system_error(errno, std::generic_category(), "accept4");
   }
+  const timeval patience{.tv_sec = DEADLINE.count(), .tv_usec = 0};
+  setsockopt(client_, SOL_SOCKET, SO_SNDTIMEO, &patience, sizeof patience);
 }
 
 void NotificationService::SendBytes(const std::string& bytes) {
@@ -58,6 +64,33 @@ void NotificationService::SendBytes(const std::string& bytes) {
 
 void NotificationService::Send(const std::string& message) {
   SendBytes(notify::Frame(message));
+}
+
+// Nothing tells that a queue has become empty, and a sleep would make a byte cost a time slice.
+void NotificationService::AwaitConsumed() {
+  const auto deadline = std::chrono::steady_clock::now() + DEADLINE;
+  int unread = 0;
+  while (ioctl(client_, SIOCOUTQ, &unread) == 0 && unread != 0) {
+    if (std::chrono::steady_clock::now() > deadline) {
+      throw std::runtime_error("the client of the notification service does not read");
+    }
+    sched_yield();
+  }
+}
+
+void NotificationService::StopReading() {
+  AwaitClient();
+  const int smallest = 1;
+  setsockopt(client_, SOL_SOCKET, SO_RCVBUF, &smallest, sizeof smallest);
+}
+
+int NotificationService::Received() {
+  AwaitClient();
+  int bytes = 0;
+  if (ioctl(client_, FIONREAD, &bytes) != 0) {
+    throw std::system_error(errno, std::generic_category(), "FIONREAD");
+  }
+  return bytes;
 }
 
 void NotificationService::CloseClient() {

@@ -6,7 +6,8 @@ namespace orva::test {
 
 /// The appliance's notification service as a test plays it: listens on the notification socket
 /// and talks to one client at a time. The operations that talk take the next waiting client
-/// when there is none. Failures are thrown as std::runtime_error or std::system_error.
+/// when there is none, and give up one that stops reading. Failures are thrown as
+/// std::runtime_error or std::system_error.
 class NotificationService {
 public:
   /// Starts to listen.
@@ -23,6 +24,15 @@ public:
 
   /// Sends one message, followed by the delimiter.
   void Send(const std::string& message);
+
+  /// Waits until the client has read all that was sent to it.
+  void AwaitConsumed();
+
+  /// Reads nothing that the client writes, and lets it not be sent either.
+  void StopReading();
+
+  /// How many bytes the client has written and nobody has read.
+  int Received();
 
   /// Waits for a client and closes its connection; goes on listening.
   void CloseClient();

@@ -10,6 +10,7 @@
 #include <algorithm>
 #include <array>
 #include <cstring>
+#include <iterator>
 #include <regex>
 #include <stdexcept>
 #include <system_error>
@@ -29,12 +30,12 @@ sockaddr_un Address() {
 
 /// "<142>Nov 21 02:33:26 ident: text"
 LogLine Parse(const std::string& datagram) {
-  static const std::regex FORM(R"(<(\d+)>\w{3} [ \d]\d \d\d:\d\d:\d\d [^ :]+: ([^]*))");
+  static const std::regex HEAD(R"(<(\d+)>\w{3} [ \d]\d \d\d:\d\d:\d\d [^ :]+: )");
   std::smatch parts;
-  if (!std::regex_match(datagram, parts, FORM)) {
+  if (!std::regex_search(datagram, parts, HEAD, std::regex_constants::match_continuous)) {
     return {-1, datagram};
   }
-  return {std::stoi(parts[1]), parts[2]};
+  return {std::stoi(parts[1]), parts.suffix()};
 }
 
 } // namespace
@@ -69,9 +70,10 @@ Syslog::~Syslog() {
   unlink("/dev/log");
 }
 
-std::vector<LogLine> Syslog::Lines() const {
+std::vector<LogLine> Syslog::Lines(std::size_t first) const {
   const std::unique_lock lock = LockBehindAllSent();
-  return lines_;
+  return {lines_.begin() + static_cast<std::ptrdiff_t>(std::min(first, lines_.size())),
+          lines_.end()};
 }
 
 // A socket keeps the order of what is sent to it: when our mark has come, all before it has.
@@ -93,13 +95,15 @@ bool Syslog::Await(const Condition& condition) const {
 }
 
 bool Syslog::Await(const LogLine& line) const {
-  return Await([&line](const std::vector<LogLine>& lines) {
-    return std::find(lines.begin(), lines.end(), line) != lines.end();
+  return Await([&line, searched = std::ptrdiff_t{0}](const std::vector<LogLine>& lines) mutable {
+    const bool found = std::find(lines.begin() + searched, lines.end(), line) != lines.end();
+    searched = std::ssize(lines);
+    return found;
   });
 }
 
 void Syslog::Collect() {
-  std::array<char, 65536> datagram;
+  std::array<char, 131072> datagram;
   for (;;) {
     const ssize_t size = recv(socket_, datagram.data(), datagram.size(), 0);
     if (size == -1 && errno == EINTR) {

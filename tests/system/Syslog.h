@@ -1,6 +1,7 @@
 #pragma once
 
 #include <condition_variable>
+#include <cstddef>
 #include <functional>
 #include <mutex>
 #include <ostream>
@@ -40,8 +41,8 @@ public:
 
   using Condition = std::function<bool(const std::vector<LogLine>&)>;
 
-  /// All messages that were sent before this call.
-  std::vector<LogLine> Lines() const;
+  /// All messages that were sent before this call, but for the `first` ones.
+  std::vector<LogLine> Lines(std::size_t first = 0) const;
 
   /// Waits until `condition` holds for all messages so far; false after the deadline.
   bool Await(const Condition& condition) const;

@@ -52,6 +52,25 @@ TEST_F(VolumeInfoManagerTest, InstanceIsMadeOnFirstUseAndStays) {
   EXPECT_EQ("DUMMY_MOUNT_POINT", made->getMasterVolume().mountPoint);
 }
 
+TEST_F(VolumeInfoManagerTest, MoreVolumesThanAnybodyHasAreRefused) {
+  std::string mountPoint = "/shares/";
+  for (int i = 0; i < 1000; ++i) {
+    Add(Record(mountPoint, GIB, GIB));
+    mountPoint += "/";
+  }
+  EXPECT_THAT(Logged(), IsEmpty());
+  Add(Record(mountPoint, GIB, GIB));
+  EXPECT_EQ(1000U, registry.getVolumes().size());
+  EXPECT_THAT(Logged(), ElementsAre(Error("There are too many volumes to register the mountpoint " +
+                                          mountPoint)));
+  // One that is registered is no further one, and one that goes makes room.
+  Add(Record("/shares/", GIB, GIB));
+  EXPECT_THAT(Logged(), IsEmpty());
+  Remove("/shares/");
+  Add(Record(mountPoint, GIB, GIB));
+  EXPECT_EQ(mountPoint, MountPoints().back());
+}
+
 TEST_F(VolumeInfoManagerTest, VolumesAreKeptInTheOrderOfTheirAdding) {
   Add(Record("/shares/b/", GIB, GIB));
   Add(Record("/shares/c/", 3 * GIB, GIB));

@@ -45,11 +45,11 @@ public:
   /// Bytes of the database, with its log, when it was opened; 0 while closed.
   long long GetFileSize() const noexcept { return fileSize_; }
 
-  /// Makes sure that the values in `table`, whose name is a plain word, are those that were
+  /// Makes sure that the values in `table` are those that were
   /// stored there: refuses generated columns and, where the connection can write, defaults and
   /// indices on expressions, which a stranger may have made so dear that a row takes minutes.
   /// A table that is not there has none. Throws std::string.
-  void RefuseComputedValues(const char* table) const;
+  void RefuseComputedValues(const std::string& table) const;
 
 protected:
   /// What a connection may do with its file.

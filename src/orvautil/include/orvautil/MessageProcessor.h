@@ -77,6 +77,7 @@ private:
               unsigned long length) const;
 
   mutable std::unique_ptr<xercesc::XercesDOMParser> parser_; ///< there only during ReadMessages
+  mutable bool spent_ = false; ///< the next message needs a new parser
 };
 
 } // namespace orva::util

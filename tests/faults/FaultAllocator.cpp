@@ -1,0 +1,62 @@
+#include "FaultAllocator.h"
+
+#include <sqlite3.h>
+
+#include <stdexcept>
+
+namespace orva::test {
+
+namespace {
+
+FaultAllocator* current = nullptr;
+sqlite3_mem_methods real;
+
+bool Fails() {
+  return current != nullptr && current->Fails();
+}
+
+void* Allocate(int bytes) {
+  return Fails() ? nullptr : real.xMalloc(bytes);
+}
+
+void* Reallocate(void* memory, int bytes) {
+  return Fails() ? nullptr : real.xRealloc(memory, bytes);
+}
+
+void Check(int code) {
+  if (code != SQLITE_OK) {
+    throw std::logic_error("SQLite is in use already");
+  }
+}
+
+} // namespace
+
+void FaultAllocator::Install() {
+  Check(sqlite3_config(SQLITE_CONFIG_GETMALLOC, &real));
+  sqlite3_mem_methods methods = real;
+  methods.xMalloc = Allocate;
+  methods.xRealloc = Reallocate;
+  Check(sqlite3_config(SQLITE_CONFIG_MALLOC, &methods));
+  // No memory that a connection takes in one piece and then hands out itself.
+  Check(sqlite3_config(SQLITE_CONFIG_LOOKASIDE, 0, 0));
+}
+
+FaultAllocator::FaultAllocator(int nth, bool forGood) : nth_(nth), forGood_(forGood) {
+  if (current != nullptr) {
+    throw std::logic_error("two faulty allocators");
+  }
+  current = this;
+}
+
+FaultAllocator::~FaultAllocator() {
+  current = nullptr;
+}
+
+bool FaultAllocator::Fails() noexcept {
+  ++seen_;
+  const bool fails = seen_ == nth_ || (forGood_ && nth_ != 0 && seen_ > nth_);
+  failed_ += fails ? 1 : 0;
+  return fails;
+}
+
+} // namespace orva::test

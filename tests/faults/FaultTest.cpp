@@ -1,0 +1,399 @@
+#include "FaultTest.h"
+
+#include "Database.h"
+#include "PhotoDB.h"
+#include "TestCatalog.h"
+
+#include "support/Extent.h"
+
+#include <algorithm>
+#include <filesystem>
+#include <fstream>
+#include <iterator>
+#include <stdexcept>
+
+namespace orva::test {
+
+using dbmerger::PhotoDB;
+using ::testing::Contains;
+using ::testing::IsEmpty;
+
+const std::string FaultTest::MASTER = "/shares/Master/";
+const std::string FaultTest::VOLUME = "/shares/Vol/";
+
+namespace {
+
+const std::string OTHER = "/shares/Other/";
+const std::string DIRECTORY = "/shares/Master/.zophotos";
+const std::string DATABASE = DIRECTORY + "/zophotos.db";
+
+const Lines NO_DATABASE = {"no database"};
+
+constexpr int FOLDERS = 6;
+constexpr int PHOTOS = 8; ///< in each
+
+std::string FolderPath(int folder) {
+  return "2020-" + std::to_string(folder) + "/";
+}
+
+/// A photo's id in the catalog.
+int PhotoId(int folder, int photo) {
+  return folder * 100 + photo;
+}
+
+void AddPhoto(TestCatalog& catalog, int folder, int photo, long stamp) {
+  catalog.AddPhoto(PhotoId(folder, photo),
+                   FolderPath(folder) + "IMG_" + std::to_string(photo) + ".jpg", 1'000 + photo,
+                   stamp);
+}
+
+TestCatalog MakeCatalog(const std::string& volume) {
+  std::filesystem::remove_all(volume);
+  TestCatalog catalog(volume);
+  // The smallest pages, and every statement reads its own, so that there are more to be read.
+  catalog.Rows().Run("PRAGMA default_cache_size = 1");
+  catalog.Rows().Run("PRAGMA page_size = 512");
+  catalog.Rows().Run("VACUUM");
+  for (int folder = 1; folder <= FOLDERS; ++folder) {
+    catalog.AddFolder(folder, FolderPath(folder), 100 + folder);
+    for (int photo = 1; photo <= PHOTOS; ++photo) {
+      AddPhoto(catalog, folder, photo, 10'000 + PhotoId(folder, photo));
+    }
+  }
+  return catalog;
+}
+
+/// What an indexer does between two merges: new photos, a new folder, photos and a folder gone.
+void Change(TestCatalog& catalog) {
+  catalog.AddFolder(FOLDERS + 1, FolderPath(FOLDERS + 1), 200);
+  for (int photo = 1; photo <= PHOTOS; ++photo) {
+    AddPhoto(catalog, FOLDERS + 1, photo, 20'000 + photo);
+    catalog.DeletePhoto(PhotoId(1, photo), 20'100 + photo);
+  }
+  AddPhoto(catalog, 2, PHOTOS + 1, 20'200);
+  catalog.DeletePhoto(PhotoId(3, 1), 20'201);
+  catalog.Rows().Run("UPDATE Folders SET isDeleted = 1 WHERE id = 1");
+}
+
+std::string ReadFile(const std::filesystem::path& path) {
+  std::ifstream file(path, std::ios::binary);
+  return {std::istreambuf_iterator<char>(file), {}};
+}
+
+/// Lengthens `lines` by the rows of a query, or by its failure.
+void Append(Lines& lines, const Database& database, const std::string& sql) {
+  try {
+    for (const std::string& row : database.Run(sql)) {
+      lines.push_back(row);
+    }
+  } catch (const std::runtime_error& error) {
+    lines.emplace_back(error.what());
+  }
+}
+
+/// The lines that only one of two contents has: "- " of the first, "+ " of the second.
+Lines Difference(Lines first, Lines second) {
+  std::ranges::sort(first);
+  std::ranges::sort(second);
+  Lines less;
+  Lines more;
+  std::ranges::set_difference(first, second, std::back_inserter(less));
+  std::ranges::set_difference(second, first, std::back_inserter(more));
+  Lines difference;
+  for (const std::string& line : less) {
+    difference.push_back("- " + line);
+  }
+  for (const std::string& line : more) {
+    difference.push_back("+ " + line);
+  }
+  return difference;
+}
+
+Lines Integrity() {
+  return std::filesystem::exists(DATABASE) ? Database(DATABASE).Run("PRAGMA integrity_check")
+                                           : Lines{"ok"};
+}
+
+} // namespace
+
+FaultTest::FaultTest() {
+  MakeDirectory(MASTER);
+  // Its thread is at its end before a test forks.
+  merger.Wait();
+}
+
+FaultTest::~FaultTest() {
+  merger.stopRequested = true;
+  merger.Wait();
+}
+
+Lines FaultTest::Content() {
+  if (!std::filesystem::exists(DATABASE)) {
+    return NO_DATABASE;
+  }
+  Lines content;
+  const Database database(DATABASE);
+  for (const char* const sql :
+       {"SELECT type, name, sql FROM sqlite_master ORDER BY name", "SELECT * FROM Status",
+        "SELECT volume, photos_xcoded, photos_total, last_updated_time FROM Statistics ORDER BY 1",
+        "SELECT f.name, coalesce(p.name, f.parent_folder_id), f.modified_date, f.volume FROM "
+        "Folders f LEFT JOIN Folders p ON p.folder_id = f.parent_folder_id ORDER BY 1, 4",
+        "SELECT coalesce(o.name, 'no folder: ') || f.name, f.modified_date, f.created_date, "
+        "f.volume FROM Files f LEFT JOIN Folders o ON o.folder_id = f.folder_id ORDER BY 1, 4"}) {
+    Append(content, database, sql);
+  }
+  return content;
+}
+
+FaultTest::Files FaultTest::TakeFiles() {
+  if (!std::filesystem::exists(DIRECTORY)) {
+    return std::nullopt;
+  }
+  std::map<std::string, std::string> files;
+  for (const auto& entry : std::filesystem::directory_iterator(DIRECTORY)) {
+    files[entry.path().filename()] = ReadFile(entry.path());
+  }
+  return files;
+}
+
+void FaultTest::LayFiles(const Files& files) {
+  std::filesystem::remove_all(DIRECTORY);
+  if (files) {
+    MakeDirectory(DIRECTORY);
+    for (const auto& [name, content] : *files) {
+      std::ofstream(DIRECTORY + "/" + name, std::ios::binary) << content;
+    }
+  }
+}
+
+// The scenarios.
+
+Action FaultTest::Merging(const std::string& volume) {
+  return [this, volume] { merger.MergeDB(MASTER, volume); };
+}
+
+/// Looks up what the scenario leads to, from the files that are laid now. `volumes` are what a
+/// whole database holds afterwards; none when that is of no interest.
+FaultTest::Scenario FaultTest::Finish(Scenario scenario, const Lines& volumes) {
+  scenario.files = TakeFiles();
+  scenario.before = Content();
+  OutputOf(scenario.operation);
+  scenario.after = Content();
+  if (!volumes.empty()) {
+    LayFiles(std::nullopt);
+    for (const std::string& volume : volumes) {
+      OutputOf(Merging(volume));
+    }
+    scenario.merged = Content();
+  }
+  LayFiles(scenario.files);
+  return scenario;
+}
+
+FaultTest::Scenario FaultTest::FirstMerge() {
+  MakeCatalog(VOLUME);
+  PhotoDB(MASTER).Init();
+  return Finish({.name = "a first merge", .operation = Merging(VOLUME), .throws = false}, {VOLUME});
+}
+
+FaultTest::Scenario FaultTest::FirstMergeWithoutADatabase() {
+  Scenario scenario = FirstMerge();
+  scenario.name = "a first merge without a database";
+  scenario.between = {scenario.before};
+  scenario.files = std::nullopt;
+  scenario.before = NO_DATABASE;
+  return scenario;
+}
+
+/// Merges both volumes, and then has the indexer change the catalog of the one.
+void FaultTest::LayMergedVolumes() {
+  MakeCatalog(OTHER);
+  TestCatalog catalog = MakeCatalog(VOLUME);
+  OutputOf(Merging(OTHER));
+  OutputOf(Merging(VOLUME));
+  Change(catalog);
+}
+
+FaultTest::Scenario FaultTest::LaterMerge() {
+  LayMergedVolumes();
+  return Finish({.name = "a later merge", .operation = Merging(VOLUME), .throws = false},
+                {OTHER, VOLUME});
+}
+
+/// What the deletion of the volume may leave when only its first statements succeed.
+std::vector<Lines> FaultTest::PartsOfADeletion() {
+  std::vector<Lines> parts;
+  const Files files = TakeFiles();
+  for (const char* const sql :
+       {"UPDATE Statistics SET last_updated_time = 0 WHERE volume = ?",
+        "DELETE FROM Files WHERE volume = ?", "DELETE FROM Folders WHERE volume = ?"}) {
+    Database(DATABASE).Run(sql, {VOLUME});
+    parts.push_back(Content());
+  }
+  LayFiles(files);
+  // Folders go together with their files.
+  parts.erase(parts.begin() + 1);
+  return parts;
+}
+
+FaultTest::Scenario FaultTest::ReMerge() {
+  LayMergedVolumes();
+  return Finish({.name = "a re-merge",
+                 .operation = [this] { merger.ReMergeDB(MASTER, VOLUME); },
+                 .between = PartsOfADeletion()},
+                {OTHER, VOLUME});
+}
+
+FaultTest::Scenario FaultTest::Removal() {
+  LayMergedVolumes();
+  return Finish({.name = "a removal of a volume",
+                 .operation = [this] { merger.RemoveVolume(MASTER, VOLUME); },
+                 .between = PartsOfADeletion()},
+                {OTHER, VOLUME});
+}
+
+FaultTest::Scenario FaultTest::Creation() {
+  MakeCatalog(VOLUME);
+  return Finish({.name = "a first creation", .operation = [] { PhotoDB(MASTER).Init(); }},
+                {VOLUME});
+}
+
+FaultTest::Scenario FaultTest::Opening() {
+  LayMergedVolumes();
+  return Finish({.name = "an opening",
+                 .operation =
+                     [] {
+                       PhotoDB photos(MASTER);
+                       photos.Init();
+                       EXPECT_EQ("2.0", photos.status.mc_version);
+                       EXPECT_EQ(1000, photos.status.mdate);
+                     }},
+                {});
+}
+
+FaultTest::Scenario FaultTest::Clearing() {
+  LayMergedVolumes();
+  const Files files = TakeFiles();
+  std::vector<Lines> parts;
+  for (const char* const sql : {"DELETE FROM Folders WHERE folder_id != 1", "DELETE FROM Files"}) {
+    Database(DATABASE).Run(sql);
+    parts.push_back(Content());
+  }
+  LayFiles(files);
+  return Finish({.name = "a removal of all volumes",
+                 .operation =
+                     [] {
+                       PhotoDB photos(MASTER);
+                       photos.Init();
+                       photos.DeleteVolumes();
+                     },
+                 .between = parts},
+                {});
+}
+
+// The runs.
+
+void FaultTest::ExpectToSurvive(const Scenario& scenario, const std::vector<Fault>& faults) {
+  ASSERT_THAT(scenario.between, ::testing::Not(Contains(scenario.before)));
+  int runs = 0;
+  for (const Fault& fault : faults) {
+    SCOPED_TRACE(scenario.name + ", " + fault.name);
+    const int made = Disturb(scenario, fault);
+    if (HasFailure()) {
+      return;
+    }
+    if (made != 0) {
+      ReportFigure("faults injected into " + scenario.name + ", " + fault.name,
+                   std::to_string(made));
+    }
+    runs += made;
+  }
+  EXPECT_NE(0, runs);
+}
+
+/// Returns how many times the operation was run with the fault.
+int FaultTest::Disturb(const Scenario& scenario, const Fault& fault) {
+  constexpr int briefRuns = 10;
+  LayFiles(scenario.files);
+  const int chances = Try(fault, 0, scenario.operation).tally.chances;
+  EXPECT_EQ(scenario.after, Content());
+  const int step = Extent(std::max(1, chances / briefRuns), 1);
+  int runs = 0;
+  for (int nth = 1; nth <= chances && !HasFailure(); nth += step) {
+    SCOPED_TRACE("at opportunity " + std::to_string(nth) + " of " + std::to_string(chances));
+    LayFiles(scenario.files);
+    const Outcome outcome = Try(fault, nth, scenario.operation);
+    EXPECT_NE(0, outcome.tally.faults);
+    CheckOutcome(scenario, fault, outcome);
+    ++runs;
+  }
+  return runs;
+}
+
+FaultTest::Outcome FaultTest::Try(const Fault& fault, int nth, const Action& action) {
+  Outcome outcome;
+  const Action catching = [&] {
+    try {
+      action();
+    } catch (const std::string& error) {
+      outcome.thrown.push_back(error);
+    }
+  };
+  OutputOf([&] { outcome.tally = fault.run(nth, catching); });
+  for (const LogLine& line : Logged()) {
+    if (line.text.starts_with("Error that we will ignore ")) {
+      outcome.logged.push_back(line.text);
+    }
+  }
+  return outcome;
+}
+
+void FaultTest::CheckOutcome(const Scenario& scenario, const Fault& fault, const Outcome& outcome) {
+  const Files left = TakeFiles();
+  const Lines content = Content();
+  EXPECT_EQ(Lines{"ok"}, Integrity());
+
+  std::vector<Lines> possible = scenario.between;
+  possible.push_back(scenario.before);
+  possible.push_back(scenario.after);
+  EXPECT_TRUE(std::ranges::find(possible, content) != possible.end())
+      << "from before: " << ::testing::PrintToString(Difference(scenario.before, content))
+      << "\nfrom after: " << ::testing::PrintToString(Difference(scenario.after, content));
+
+  if (!fault.stopsProcess) {
+    Lines complaints = outcome.thrown;
+    complaints.insert(complaints.end(), outcome.logged.begin(), outcome.logged.end());
+    EXPECT_LE(complaints.size(), 1U) << ::testing::PrintToString(complaints);
+    if (content != scenario.after) {
+      EXPECT_FALSE(complaints.empty());
+    }
+    if (!scenario.throws) {
+      EXPECT_THAT(outcome.thrown, IsEmpty());
+    }
+  }
+
+  LayFiles(left);
+  ExpectUndisturbed(scenario.operation, scenario.after);
+  if (content != scenario.before && !scenario.merged.empty()) {
+    LayFiles(left);
+    ExpectUndisturbed(Merging(VOLUME), scenario.merged);
+  }
+}
+
+/// Runs an operation without a fault where there has been one.
+void FaultTest::ExpectUndisturbed(const Action& action, const Lines& content) {
+  const Fault none{.name = "none", .run = [](int /*nth*/, const Action& undisturbed) {
+                     undisturbed();
+                     return Fault::Tally();
+                   }};
+  const Outcome outcome = Try(none, 0, action);
+  EXPECT_THAT(outcome.thrown, IsEmpty());
+  EXPECT_THAT(outcome.logged, IsEmpty());
+  EXPECT_THAT(Difference(content, Content()), IsEmpty());
+  EXPECT_EQ(Lines{"ok"}, Integrity());
+  for (const auto& [name, bytes] : TakeFiles().value_or(std::map<std::string, std::string>{})) {
+    EXPECT_EQ("zophotos.db", name);
+  }
+}
+
+} // namespace orva::test

@@ -1,0 +1,289 @@
+#include "FaultVfs.h"
+
+#include <sqlite3.h>
+
+#include <unistd.h>
+
+#include <algorithm>
+#include <filesystem>
+#include <fstream>
+#include <iterator>
+#include <stdexcept>
+#include <utility>
+
+namespace orva::test {
+
+namespace {
+
+FaultVfs* current = nullptr;
+
+std::string ContentOf(const std::string& path) {
+  std::ifstream file(path, std::ios::binary);
+  return {std::istreambuf_iterator<char>(file), {}};
+}
+
+/// A file of ours: SQLite gives room for this and, behind it, for the real file.
+struct FaultFile : sqlite3_file {
+  const char* path; ///< SQLite keeps it until the file is closed; null for a temporary file
+};
+
+const char* PathOf(sqlite3_file* file) {
+  return static_cast<FaultFile*>(file)->path;
+}
+
+sqlite3_file* Real(sqlite3_file* file) {
+  return reinterpret_cast<sqlite3_file*>(static_cast<FaultFile*>(file) + 1);
+}
+
+sqlite3_vfs* Real(sqlite3_vfs* vfs) {
+  return static_cast<sqlite3_vfs*>(vfs->pAppData);
+}
+
+bool Fails(Request request, const char* path, const std::function<void()>& partly = {}) {
+  return current->Fails(request, path, partly);
+}
+
+// Requests on an open file.
+
+int Close(sqlite3_file* file) {
+  return Real(file)->pMethods->xClose(Real(file));
+}
+
+int Read(sqlite3_file* file, void* bytes, int count, sqlite3_int64 offset) {
+  if (Fails(Request::Read, PathOf(file))) {
+    return current->Code();
+  }
+  return Real(file)->pMethods->xRead(Real(file), bytes, count, offset);
+}
+
+int Write(sqlite3_file* file, const void* bytes, int count, sqlite3_int64 offset) {
+  const auto half = [&] { Real(file)->pMethods->xWrite(Real(file), bytes, count / 2, offset); };
+  if (Fails(Request::Write, PathOf(file), half)) {
+    return current->Code();
+  }
+  return Real(file)->pMethods->xWrite(Real(file), bytes, count, offset);
+}
+
+int Truncate(sqlite3_file* file, sqlite3_int64 size) {
+  if (Fails(Request::Truncate, PathOf(file))) {
+    return current->Code();
+  }
+  return Real(file)->pMethods->xTruncate(Real(file), size);
+}
+
+int Sync(sqlite3_file* file, int flags) {
+  if (Fails(Request::Sync, PathOf(file))) {
+    return current->Code();
+  }
+  const int code = Real(file)->pMethods->xSync(Real(file), flags);
+  current->Synced(PathOf(file));
+  return code;
+}
+
+int FileSize(sqlite3_file* file, sqlite3_int64* size) {
+  if (Fails(Request::Size, PathOf(file))) {
+    return current->Code();
+  }
+  return Real(file)->pMethods->xFileSize(Real(file), size);
+}
+
+int Lock(sqlite3_file* file, int lock) {
+  if (Fails(Request::Lock, PathOf(file))) {
+    return current->Code();
+  }
+  return Real(file)->pMethods->xLock(Real(file), lock);
+}
+
+int Unlock(sqlite3_file* file, int lock) {
+  return Real(file)->pMethods->xUnlock(Real(file), lock);
+}
+
+int CheckReservedLock(sqlite3_file* file, int* reserved) {
+  return Real(file)->pMethods->xCheckReservedLock(Real(file), reserved);
+}
+
+int FileControl(sqlite3_file* file, int operation, void* argument) {
+  return Real(file)->pMethods->xFileControl(Real(file), operation, argument);
+}
+
+int SectorSize(sqlite3_file* file) {
+  return Real(file)->pMethods->xSectorSize(Real(file));
+}
+
+int DeviceCharacteristics(sqlite3_file* file) {
+  return Real(file)->pMethods->xDeviceCharacteristics(Real(file));
+}
+
+int ShmMap(sqlite3_file* file, int region, int size, int extend, void volatile** memory) {
+  return Real(file)->pMethods->xShmMap(Real(file), region, size, extend, memory);
+}
+
+int ShmLock(sqlite3_file* file, int offset, int count, int flags) {
+  if ((flags & SQLITE_SHM_LOCK) != 0 && Fails(Request::Lock, PathOf(file))) {
+    return current->Code();
+  }
+  return Real(file)->pMethods->xShmLock(Real(file), offset, count, flags);
+}
+
+void ShmBarrier(sqlite3_file* file) {
+  Real(file)->pMethods->xShmBarrier(Real(file));
+}
+
+int ShmUnmap(sqlite3_file* file, int remove) {
+  return Real(file)->pMethods->xShmUnmap(Real(file), remove);
+}
+
+/// Without memory mapping, which reads and writes past us.
+constexpr sqlite3_io_methods METHODS = {2,
+                                        Close,
+                                        Read,
+                                        Write,
+                                        Truncate,
+                                        Sync,
+                                        FileSize,
+                                        Lock,
+                                        Unlock,
+                                        CheckReservedLock,
+                                        FileControl,
+                                        SectorSize,
+                                        DeviceCharacteristics,
+                                        ShmMap,
+                                        ShmLock,
+                                        ShmBarrier,
+                                        ShmUnmap,
+                                        nullptr,
+                                        nullptr};
+
+// Requests on names.
+
+int Open(sqlite3_vfs* vfs, const char* path, sqlite3_file* file, int flags, int* outFlags) {
+  file->pMethods = nullptr;
+  if (Fails(Request::Open, path)) {
+    return current->Code();
+  }
+  current->Opening(path);
+  static_cast<FaultFile*>(file)->path = path;
+  const int code = Real(vfs)->xOpen(Real(vfs), path, Real(file), flags, outFlags);
+  if (Real(file)->pMethods != nullptr) {
+    file->pMethods = &METHODS;
+  }
+  return code;
+}
+
+int Delete(sqlite3_vfs* vfs, const char* path, int syncDirectory) {
+  if (Fails(Request::Delete, path)) {
+    return current->Code();
+  }
+  const int code = Real(vfs)->xDelete(Real(vfs), path, syncDirectory);
+  current->Deleted(path);
+  return code;
+}
+
+int Access(sqlite3_vfs* vfs, const char* path, int flags, int* result) {
+  if (Fails(Request::Access, path)) {
+    return current->Code();
+  }
+  return Real(vfs)->xAccess(Real(vfs), path, flags, result);
+}
+
+int Sleep(sqlite3_vfs* /*vfs*/, int microseconds) {
+  return microseconds;
+}
+
+} // namespace
+
+/// The file system as SQLite knows it: the real one where nothing is said here.
+struct FaultVfs::Registration {
+  Registration() : real(sqlite3_vfs_find(nullptr)), vfs(*real) {
+    vfs.zName = "faults";
+    vfs.pAppData = real;
+    vfs.szOsFile = static_cast<int>(sizeof(FaultFile)) + real->szOsFile;
+    vfs.xOpen = Open;
+    vfs.xDelete = Delete;
+    vfs.xAccess = Access;
+    vfs.xSleep = Sleep;
+    sqlite3_vfs_register(&vfs, 1);
+  }
+  Registration(const Registration&) = delete;
+  Registration& operator=(const Registration&) = delete;
+  ~Registration() {
+    sqlite3_vfs_unregister(&vfs);
+    sqlite3_vfs_register(real, 1);
+  }
+
+  sqlite3_vfs* real; ///< SQLite's
+  sqlite3_vfs vfs;
+};
+
+FaultVfs::FaultVfs(FaultPlan plan) : plan_(std::move(plan)) {
+  if (current != nullptr) {
+    throw std::logic_error("two faulty file systems");
+  }
+  registration_ = std::make_unique<Registration>();
+  current = this;
+}
+
+FaultVfs::~FaultVfs() {
+  current = nullptr;
+}
+
+FaultVfs* FaultVfs::Current() noexcept {
+  return current;
+}
+
+bool FaultVfs::Concerns(const char* path) const {
+  return path != nullptr && std::string(path).find(plan_.files) != std::string::npos;
+}
+
+bool FaultVfs::Fails(Request request, const char* path, const std::function<void()>& partly) {
+  if (!Concerns(path) || std::ranges::find(plan_.requests, request) == plan_.requests.end()) {
+    return false;
+  }
+  ++seen_;
+  const bool fails = seen_ == plan_.nth || (plan_.forGood && plan_.nth != 0 && seen_ > plan_.nth);
+  if (fails && partly) {
+    partly();
+  }
+  if (fails && plan_.effect != FaultPlan::Effect::Error) {
+    Stop();
+  }
+  failed_ += fails ? 1 : 0;
+  return fails;
+}
+
+void FaultVfs::Opening(const char* path) {
+  if (plan_.effect == FaultPlan::Effect::PowerLoss && Concerns(path)) {
+    durable_.try_emplace(path, ContentOf(path));
+  }
+}
+
+void FaultVfs::Synced(const char* path) {
+  if (plan_.effect == FaultPlan::Effect::PowerLoss && Concerns(path) &&
+      std::filesystem::is_regular_file(path)) {
+    durable_[path] = ContentOf(path);
+  }
+}
+
+void FaultVfs::Deleted(const char* path) {
+  durable_.erase(path);
+}
+
+void FaultVfs::Renamed(const char* from, const char* to) {
+  auto file = durable_.extract(from);
+  durable_.erase(to);
+  if (!file.empty()) {
+    file.key() = to;
+    durable_.insert(std::move(file));
+  }
+}
+
+void FaultVfs::Stop() const {
+  for (const auto& [path, content] : durable_) {
+    if (path.find(plan_.lost) != std::string::npos && std::filesystem::exists(path)) {
+      std::ofstream(path, std::ios::binary | std::ios::trunc) << content;
+    }
+  }
+  _exit(STOPPED);
+}
+
+} // namespace orva::test

@@ -1,0 +1,110 @@
+#include "FileFaults.h"
+
+#include "FaultVfs.h"
+
+#include <sqlite3.h>
+
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <stdexcept>
+
+namespace orva::test {
+
+namespace {
+
+struct Kind {
+  const char* name;
+  Request request;
+  int code;
+};
+
+constexpr Kind KINDS[] = {
+    {"failed open", Request::Open, SQLITE_CANTOPEN},
+    {"failed read", Request::Read, SQLITE_IOERR_READ},
+    {"failed write", Request::Write, SQLITE_IOERR_WRITE},
+    {"full disk", Request::Write, SQLITE_FULL},
+    {"failed sync", Request::Sync, SQLITE_IOERR_FSYNC},
+    {"failed truncation", Request::Truncate, SQLITE_IOERR_TRUNCATE},
+    {"failed look at the size", Request::Size, SQLITE_IOERR_FSTAT},
+    {"failed lock", Request::Lock, SQLITE_IOERR_LOCK},
+    {"lock held by another", Request::Lock, SQLITE_BUSY},
+    {"failed deletion", Request::Delete, SQLITE_IOERR_DELETE},
+    {"failed look at a name", Request::Access, SQLITE_IOERR_ACCESS},
+    {"failed renaming", Request::Rename, SQLITE_IOERR},
+};
+
+/// What changes something on disk, so that it makes a difference whether the process has come past
+/// it.
+const std::vector<Request> CHANGES = {Request::Open,   Request::Write,    Request::Sync,
+                                      Request::Delete, Request::Truncate, Request::Rename};
+
+Fault::Tally Run(const FaultPlan& plan, const Action& action) {
+  const FaultVfs faults(plan);
+  action();
+  return {.chances = faults.Seen(), .faults = faults.Failed()};
+}
+
+/// Runs the action in a process of its own. The fault is that this was stopped.
+Fault::Tally RunApart(const FaultPlan& plan, const Action& action) {
+  const pid_t child = fork();
+  if (child == 0) {
+    try {
+      Run(plan, action);
+      _exit(0);
+    } catch (...) {
+      _exit(1);
+    }
+  }
+  int status = 0;
+  if (child < 0 || waitpid(child, &status, 0) != child || !WIFEXITED(status) ||
+      (WEXITSTATUS(status) != 0 && WEXITSTATUS(status) != FaultVfs::STOPPED)) {
+    throw std::runtime_error("the process has ended with status " + std::to_string(status));
+  }
+  return {.chances = 0, .faults = WEXITSTATUS(status) == FaultVfs::STOPPED ? 1 : 0};
+}
+
+Fault Error(const Kind& kind, const std::string& files, const std::string& place, bool forGood) {
+  return {.name = place + ": " + kind.name + (forGood ? ", for good" : ", once"),
+          .run = [=](int nth, const Action& action) {
+            return Run({.files = files,
+                        .requests = {kind.request},
+                        .nth = nth,
+                        .code = kind.code,
+                        .forGood = forGood},
+                       action);
+          }};
+}
+
+Fault Stop(const char* name, FaultPlan plan) {
+  plan.requests = CHANGES;
+  return {.name = name,
+          .run =
+              [=](int nth, const Action& action) {
+                FaultPlan now = plan;
+                now.nth = nth;
+                return nth == 0 ? Run(now, action) : RunApart(now, action);
+              },
+          .stopsProcess = true};
+}
+
+} // namespace
+
+std::vector<Fault> FileErrors(const std::string& files, const std::string& place) {
+  std::vector<Fault> faults;
+  for (const Kind& kind : KINDS) {
+    faults.push_back(Error(kind, files, place, false));
+    faults.push_back(Error(kind, files, place, true));
+  }
+  return faults;
+}
+
+std::vector<Fault> Stops(const std::string& files) {
+  using Effect = FaultPlan::Effect;
+  return {Stop("stopped process", {.files = files, .effect = Effect::Stop}),
+          Stop("lost power", {.files = files, .effect = Effect::PowerLoss}),
+          Stop("lost power that spared the database",
+               {.files = files, .effect = Effect::PowerLoss, .lost = "-journal"})};
+}
+
+} // namespace orva::test

@@ -1,0 +1,142 @@
+// The merged database where the file system under it, or under a volume's catalog, fails.
+
+#include "FileFaults.h"
+
+#include "Database.h"
+
+#include "orvautil/Core.h"
+
+namespace orva::test {
+namespace {
+
+const std::string MERGED = "/.zophotos";
+const std::string CATALOG = "/shares/Vol/";
+
+class FileFaultTest : public FaultTest {
+protected:
+  /// A first creation where the database of before is gone, but neither its journal nor what an
+  /// earlier creation has left.
+  Scenario CreationAmongLeftovers() {
+    const Scenario merge = LaterMerge();
+    const Fault stop = Stops(MERGED).front();
+    const auto run = [&](int nth) {
+      int chances = 0;
+      OutputOf([&] { chances = stop.run(nth, merge.operation).chances; });
+      return chances;
+    };
+    const int end = run(0);
+    LayFiles(merge.files);
+    run(end);
+    Files files = TakeFiles();
+    const std::string journal = files->at("zophotos.db-journal");
+    (*files)["zophotos.db.new"] = files->at("zophotos.db");
+    (*files)["zophotos.db.new-journal"] = journal;
+    files->erase("zophotos.db");
+
+    LayFiles(std::nullopt);
+    Scenario scenario = Creation();
+    scenario.name = "a first creation among leftovers";
+    scenario.files = files;
+    return scenario;
+  }
+};
+
+TEST_F(FileFaultTest, FirstMergeIsAllOrNothing) {
+  ExpectToSurvive(FirstMerge(), FileErrors(MERGED, "merged database"));
+}
+
+TEST_F(FileFaultTest, FirstMergeWithoutADatabaseIsAllOrNothing) {
+  ExpectToSurvive(FirstMergeWithoutADatabase(), FileErrors(MERGED, "merged database"));
+}
+
+TEST_F(FileFaultTest, LaterMergeIsAllOrNothing) {
+  ExpectToSurvive(LaterMerge(), FileErrors(MERGED, "merged database"));
+}
+
+TEST_F(FileFaultTest, ReMergeCanBeRepeatedByTheNextMerge) {
+  ExpectToSurvive(ReMerge(), FileErrors(MERGED, "merged database"));
+}
+
+TEST_F(FileFaultTest, RemovalLeavesNothingBehindForEver) {
+  ExpectToSurvive(Removal(), FileErrors(MERGED, "merged database"));
+}
+
+TEST_F(FileFaultTest, NewDatabaseIsCompleteOrNotThere) {
+  ExpectToSurvive(Creation(), FileErrors(MERGED, "merged database"));
+}
+
+TEST_F(FileFaultTest, NewDatabaseAmongLeftoversIsCompleteOrNotThere) {
+  ExpectToSurvive(CreationAmongLeftovers(), FileErrors(MERGED, "merged database"));
+}
+
+TEST_F(FileFaultTest, FailedOpeningChangesNothing) {
+  ExpectToSurvive(Opening(), FileErrors(MERGED, "merged database"));
+}
+
+TEST_F(FileFaultTest, RemovalOfAllVolumesCanBeRepeated) {
+  ExpectToSurvive(Clearing(), FileErrors(MERGED, "merged database"));
+}
+
+// The process is stopped, or the appliance loses its power.
+
+using StopTest = FileFaultTest;
+
+TEST_F(StopTest, FirstMergeIsAllOrNothing) {
+  ExpectToSurvive(FirstMerge(), Stops(MERGED));
+}
+
+TEST_F(StopTest, FirstMergeWithoutADatabaseIsAllOrNothing) {
+  ExpectToSurvive(FirstMergeWithoutADatabase(), Stops(MERGED));
+}
+
+TEST_F(StopTest, LaterMergeIsAllOrNothing) {
+  ExpectToSurvive(LaterMerge(), Stops(MERGED));
+}
+
+TEST_F(StopTest, ReMergeIsFinishedByTheNextMerge) {
+  ExpectToSurvive(ReMerge(), Stops(MERGED));
+}
+
+TEST_F(StopTest, RemovalLeavesNothingBehindForEver) {
+  ExpectToSurvive(Removal(), Stops(MERGED));
+}
+
+TEST_F(StopTest, NewDatabaseIsCompleteOrNotThere) {
+  ExpectToSurvive(Creation(), Stops(MERGED));
+}
+
+TEST_F(StopTest, NewDatabaseAmongLeftoversIsCompleteOrNotThere) {
+  ExpectToSurvive(CreationAmongLeftovers(), Stops(MERGED));
+}
+
+TEST_F(StopTest, RemovalOfAllVolumesCanBeRepeated) {
+  ExpectToSurvive(Clearing(), Stops(MERGED));
+}
+
+// The volume's catalog cannot be read, or only half.
+
+using CatalogFaultTest = FaultTest;
+
+TEST_F(CatalogFaultTest, FirstMergeTakesNoFailureForAnEmptyList) {
+  ExpectToSurvive(FirstMerge(), FileErrors(CATALOG, "catalog"));
+}
+
+TEST_F(CatalogFaultTest, FirstMergeBesideALogTakesNoFailureForAnEmptyList) {
+  Scenario scenario = FirstMerge();
+  scenario.name = "a first merge beside a write-ahead log";
+  const Database indexer(core::GetCatalogPath(VOLUME));
+  indexer.Run("PRAGMA journal_mode = WAL");
+  indexer.Run("UPDATE Files SET size = size + 1");
+  ExpectToSurvive(scenario, FileErrors(CATALOG, "catalog"));
+}
+
+TEST_F(CatalogFaultTest, LaterMergeTakesNoFailureForAnEmptyList) {
+  ExpectToSurvive(LaterMerge(), FileErrors(CATALOG, "catalog"));
+}
+
+TEST_F(CatalogFaultTest, ReMergeTakesNoFailureForAnEmptyList) {
+  ExpectToSurvive(ReMerge(), FileErrors(CATALOG, "catalog"));
+}
+
+} // namespace
+} // namespace orva::test

@@ -1,0 +1,90 @@
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <string>
+#include <vector>
+
+namespace orva::test {
+
+/// Bytes of a file as a test changes them, with SQLite's big-endian numbers.
+class Bytes {
+public:
+  Bytes() = default;
+  explicit Bytes(std::vector<std::uint8_t> bytes) : bytes_(std::move(bytes)) {}
+
+  /// The content of a file. Throws std::runtime_error when it cannot be read.
+  static Bytes Of(const std::string& path);
+  /// Makes or overwrites a file with this content.
+  void Save(const std::string& path) const;
+
+  std::size_t Size() const { return bytes_.size(); }
+  void Resize(std::size_t size) { bytes_.resize(size); }
+  std::uint8_t& operator[](std::size_t offset) { return bytes_.at(offset); }
+
+  std::uint32_t Read(std::size_t offset, std::size_t width) const;
+  void Write(std::size_t offset, std::size_t width, std::uint32_t value);
+
+  void Append(std::uint32_t value);
+  void Append(const std::string& text);
+  void Append(const Bytes& other);
+  Bytes Part(std::size_t offset, std::size_t size) const;
+
+private:
+  std::vector<std::uint8_t> bytes_;
+};
+
+/// An SQLite file whose pages are patched behind SQLite's back. Pages count from 1.
+class CraftedDatabase {
+public:
+  /// Loads the file, which nobody has open and which has no log beside it.
+  explicit CraftedDatabase(const std::string& path);
+
+  std::uint32_t PageSize() const { return pageSize_; }
+  std::uint32_t Pages() const { return static_cast<std::uint32_t>(file_.Size() / pageSize_); }
+
+  /// The leftmost leaf of the b-tree at `root`.
+  std::uint32_t FirstLeaf(std::uint32_t root) const;
+
+  /// The number of cells on a b-tree page.
+  std::uint32_t Cells(std::uint32_t page) const;
+
+  /// Makes a leaf show its cell `index` as often as a page can have cells, instead of all others.
+  void RepeatCell(std::uint32_t page, std::uint32_t index);
+
+  /// Moves the content of the root page into new pages and puts `levels` levels of interior pages
+  /// above it, all cells of which point to the same child. The last child of the topmost level is
+  /// the original, so that the tree holds what it held, and all else over and over.
+  void Multiply(std::uint32_t root, unsigned levels);
+
+  /// The same with the root's content first: `repeated`, a leaf page, comes over and over behind
+  /// it.
+  void MultiplyBehind(std::uint32_t root, std::uint32_t repeated, unsigned levels);
+
+  /// A new page with a copy of another page's content, which on the first page begins behind the
+  /// file's header.
+  std::uint32_t CopyOf(std::uint32_t page);
+
+  /// The page that the rightmost or `cell`th pointer of an interior page leads to.
+  void SetRightChild(std::uint32_t page, std::uint32_t child);
+
+  Bytes& File() { return file_; }
+  /// Offset of a page, and of its b-tree header, in the file.
+  std::size_t Offset(std::uint32_t page) const { return std::size_t{page - 1} * pageSize_; }
+  std::size_t Header(std::uint32_t page) const;
+
+  /// Writes the file back, with the header's page count set right.
+  void Save();
+
+private:
+  std::uint32_t NewPage();
+  void MakeInterior(std::uint32_t page, std::uint32_t first, std::uint32_t repeated,
+                    std::uint32_t last);
+  std::uint32_t MostCells() const { return (pageSize_ - 8) / 6; }
+
+  std::string path_;
+  Bytes file_;
+  std::uint32_t pageSize_;
+};
+
+} // namespace orva::test

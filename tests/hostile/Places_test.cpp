@@ -1,0 +1,85 @@
+// What stands at the names that the daemon writes to, and is no file of its own.
+
+#include "HostileTest.h"
+#include "SpecialFile.h"
+
+#include <filesystem>
+#include <fstream>
+
+namespace orva::test {
+namespace {
+
+namespace fs = std::filesystem;
+using ::testing::Each;
+using ::testing::SizeIs;
+using ::testing::StartsWith;
+
+class PlacesTest : public HostileTest, public ::testing::WithParamInterface<SpecialKind> {};
+
+TEST_P(PlacesTest, MergedDatabase) {
+  fs::copy_file(MERGED, DECOY + "other.db");
+  const SpecialFile special(GetParam(), MERGED, DECOY + "other.db");
+  const auto results = UseHostileMaster();
+  ASSERT_THAT(results, SizeIs(7));
+  EXPECT_THAT(results[0], StartsWith("Error that we will ignore "));
+}
+
+TEST_P(PlacesTest, BesideTheMergedDatabase) {
+  for (const char* const suffix : {"-journal", "-wal", "-shm"}) {
+    SCOPED_TRACE(suffix);
+    const SpecialFile special(GetParam(), MERGED + suffix, VICTIM);
+    const auto results = UseHostileMaster();
+    ASSERT_THAT(results, SizeIs(7));
+    EXPECT_THAT(results[0], StartsWith("Error that we will ignore "));
+  }
+}
+
+TEST_P(PlacesTest, BesideAMergedDatabaseThatIsToBeMade) {
+  for (const char* const suffix :
+       {"-journal", "-wal", "-shm", ".new", ".new-journal", ".new-wal", ".new-shm"}) {
+    SCOPED_TRACE(suffix);
+    fs::remove(MERGED);
+    const SpecialFile special(GetParam(), MERGED + suffix, VICTIM);
+    UseHostileMaster();
+  }
+}
+
+TEST_P(PlacesTest, FolderOfTheMergedDatabase) {
+  const std::string folder = MASTER + ".zophotos";
+  fs::rename(folder, DECOY + "folder");
+  const SpecialFile special(GetParam(), folder, DECOY + "folder");
+  const auto results = UseHostileMaster();
+  if (GetParam() == SpecialKind::Directory) {
+    EXPECT_THAT(results, Each(""));
+  } else {
+    ASSERT_THAT(results, SizeIs(6));
+    EXPECT_THAT(results[1], StartsWith("PhotoDB::Error: Invalid DB location"));
+  }
+}
+
+TEST_P(PlacesTest, Locator) {
+  const SpecialFile special(GetParam(), LOCATOR_PATH, VICTIM);
+  EXPECT_THAT(UseHostileMaster(), Each(""));
+}
+
+INSTANTIATE_TEST_SUITE_P(Kinds, PlacesTest, ::testing::ValuesIn(SPECIAL_KINDS),
+                         [](const auto& tested) { return NameOf(tested.param); });
+
+TEST_F(HostileTest, LocatorIsAnotherNameOfADearFile) {
+  fs::create_hard_link("/tmp/victim", LOCATOR_PATH);
+  EXPECT_THAT(UseHostileMaster(), Each(""));
+}
+
+TEST_F(HostileTest, NewMergedDatabaseIsAnotherNameOfADearFile) {
+  for (const char* const suffix :
+       {".new", ".new-journal", ".new-wal", ".new-shm", "-journal", "-wal", "-shm"}) {
+    SCOPED_TRACE(suffix);
+    fs::remove(MERGED);
+    fs::create_hard_link(VICTIM, MERGED + suffix);
+    UseHostileMaster();
+    fs::remove(MERGED + suffix);
+  }
+}
+
+} // namespace
+} // namespace orva::test

@@ -1,0 +1,81 @@
+// Does what it is told on its command line, in threes (operation, master, volume), with the
+// daemon's own classes, and reports what left each on the descriptor that it has for standard
+// input: a line each, then its peak of memory.
+
+#include "DBMerger.h"
+#include "PhotoDB.h"
+#include "Util.h"
+
+#include <unistd.h>
+
+#include <cstring>
+#include <fstream>
+#include <functional>
+#include <map>
+
+namespace {
+
+using namespace orva;
+using Action = std::function<void(const std::string& master, const std::string& volume)>;
+
+/// Of a message, what tells it from others, on one line.
+std::string Beginning(std::string message) {
+  constexpr std::size_t enough = 400;
+  message.resize(std::min(message.size(), enough));
+  for (char& byte : message) {
+    byte = byte == '\n' ? ' ' : byte;
+  }
+  return message;
+}
+
+std::string Thrown(const Action& action, const char* master, const char* volume) {
+  try {
+    action(master, volume);
+    return {};
+  } catch (const std::string& error) {
+    return "std::string: " + Beginning(error);
+  } catch (const dbmerger::PhotoDB::Error& error) {
+    return "PhotoDB::Error: " + Beginning(error.Message());
+  } catch (const std::exception& error) {
+    return std::string("std::exception: ") + Beginning(error.what());
+  }
+}
+
+void Report(const std::string& line) {
+  const std::string whole = line + "\n";
+  if (write(STDIN_FILENO, whole.data(), whole.size()) != static_cast<ssize_t>(whole.size())) {
+    _exit(2);
+  }
+}
+
+long long PeakMemory() {
+  std::ifstream status("/proc/self/status");
+  long long kilobytes = 0;
+  for (std::string word; status >> word;) {
+    if (word == "VmHWM:") {
+      status >> kilobytes;
+    }
+  }
+  return kilobytes * 1024;
+}
+
+} // namespace
+
+int main(int count, char** arguments) {
+  dbmerger::DBMerger merger;
+  const std::map<std::string, Action> actions = {
+      {"merge", [&](const auto& master, const auto& volume) { merger.MergeDB(master, volume); }},
+      {"remerge",
+       [&](const auto& master, const auto& volume) { merger.ReMergeDB(master, volume); }},
+      {"remove",
+       [&](const auto& master, const auto& volume) { merger.RemoveVolume(master, volume); }},
+      {"init", [](const auto& master, const auto&) { dbmerger::PhotoDB(master).Init(); }},
+      {"locate", [](const auto& master, const auto&) { dbmerger::updateLocatorFile(master); }},
+  };
+  for (int i = 1; i + 2 < count; i += 3) {
+    Report(Thrown(actions.at(arguments[i]), arguments[i + 1], arguments[i + 2]));
+  }
+  merger.stopRequested = true;
+  merger.Wait();
+  Report("peak " + std::to_string(PeakMemory()));
+}

@@ -1,0 +1,186 @@
+// How much arrives, and how it arrives.
+
+#include "Flood.h"
+
+#include "support/Extent.h"
+
+#include <algorithm>
+
+namespace orva::test {
+namespace {
+
+using ::testing::IsEmpty;
+
+const LogLine SKIPPED = Error("MessageProcessor:: message of more than 65536 bytes skipped");
+
+std::string Repeated(const std::string& text, std::size_t count) {
+  std::string repeated;
+  repeated.reserve(text.size() * count);
+  for (std::size_t i = 0; i < count; ++i) {
+    repeated += text;
+  }
+  return repeated;
+}
+
+/// The same log line `count` times.
+Log Times(std::size_t count, const LogLine& line) {
+  return Log(count, line);
+}
+
+TEST_F(Flood, ABillionBytesWithoutADelimiterAreOneMessage) {
+  const std::string mebibyte(1U << 20U, 'x');
+  const int mebibytes = Extent(64, 1024);
+  for (int i = 0; i < mebibytes; ++i) {
+    appliance.Service().SendBytes(mebibyte);
+  }
+  appliance.Service().SendBytes(DELIMITER);
+  appliance.Barrier();
+  EXPECT_EQ(Log{SKIPPED}, appliance.TakeLog());
+  ExpectUnharmed("bytes without a delimiter");
+}
+
+TEST_F(Flood, MessagesThatAreTooLongAreSkippedOneByOne) {
+  const std::size_t count = Extent(200, 4000);
+  const std::string message = std::string(LONGEST + 1, 'x') + DELIMITER;
+  for (std::size_t i = 0; i < count; ++i) {
+    appliance.Service().SendBytes(message);
+  }
+  appliance.Barrier();
+  EXPECT_EQ(Times(count, SKIPPED), appliance.TakeLog());
+  ExpectUnharmed("messages that are too long");
+}
+
+TEST_F(Flood, AMessageMayComeByteByByte) {
+  const std::size_t size = Extent<std::size_t>(4096, LONGEST);
+  const std::string end = GOOD.substr(GOOD.find("?>") + 2);
+  const std::string begin = GOOD.substr(0, GOOD.size() - end.size());
+  const std::string message = begin + std::string(size - GOOD.size(), ' ') + end + DELIMITER;
+  for (const char byte : message) {
+    appliance.Service().SendBytes(std::string(1, byte));
+    appliance.Service().AwaitConsumed();
+  }
+  appliance.Barrier();
+  EXPECT_EQ(HANDLED, appliance.TakeLog());
+  ExpectUnharmed("a message that comes byte by byte");
+}
+
+TEST_F(Flood, ManyMessagesAtOnceAreHandledInOrder) {
+  const std::string missing = "There is no filesystem location for the mountpoint /shares/B/";
+  const std::vector<std::pair<std::string, Log>> kinds = {
+      {GOOD, HANDLED},
+      {Notification("Purged", "/shares/B"),
+       {Info(":: Purged "), Error(missing), Info("Default:: Volume purged - ignored! ")}},
+      {Notification("Rescanned", "/shares/B"), {}},
+      {TranscodedBatch("/shares/B").replace(0, 0, "<!-- no profile -->").erase(90), {}},
+      {R"(<Other about="ORVANotification"/>)", {Error("ERROR ! Node name = Other")}},
+      {"<Other/>", {}},
+  };
+  const int messages = Extent(5'000, 100'000);
+  std::string bytes;
+  Log expected;
+  for (int i = 0; i < messages; ++i) {
+    const auto& [message, lines] = kinds[static_cast<std::size_t>(i) % kinds.size()];
+    bytes += message + DELIMITER;
+    expected.insert(expected.end(), lines.begin(), lines.end());
+  }
+  appliance.Service().SendBytes(bytes);
+  appliance.Barrier();
+  // The message that was cut short is refused in words of the parser.
+  Log log = appliance.TakeLog();
+  std::erase_if(log, [](const LogLine& line) { return line.text.starts_with("MessageProcessor"); });
+  EXPECT_TRUE(expected == log) << log.size() << " lines instead of " << expected.size();
+  ExpectUnharmed(std::to_string(messages) + " messages at once");
+}
+
+TEST_F(Flood, APeerThatNeverReadsHasNothingToRead) {
+  const int rounds = Extent(50, 5'000);
+  std::string bytes;
+  for (int i = 0; i < rounds; ++i) {
+    for (const std::string& message :
+         {GOOD, Notification("Purged", "/shares"), std::string("<ORVANotification"),
+          Notification("Unknown", "/shares"), std::string(R"(<Other a="ORVANotification"/>)"),
+          Notification("End", "")}) {
+      bytes += message + DELIMITER;
+    }
+  }
+  appliance.Service().StopReading();
+  appliance.Service().SendBytes(bytes);
+  appliance.Barrier();
+  EXPECT_EQ(5U * static_cast<std::size_t>(rounds) + static_cast<std::size_t>(rounds),
+            appliance.TakeLog().size());
+  ExpectUnharmed("messages of a peer that never reads");
+}
+
+TEST_F(Flood, DelimitersInARowAreEmptyMessages) {
+  const std::size_t count = 1'000'000;
+  appliance.Service().SendBytes(Repeated(DELIMITER, count));
+  appliance.Barrier();
+  EXPECT_THAT(appliance.TakeLog(), IsEmpty());
+  ExpectUnharmed("delimiters in a row");
+}
+
+TEST_F(Flood, ZerosThatAreNoDelimiterSpoilOnlyTheNextMessage) {
+  for (std::size_t zeros = 0; zeros <= Extent<std::size_t>(9, 1'000); ++zeros) {
+    appliance.Service().SendBytes(std::string(zeros, '\0') + GOOD + DELIMITER);
+    appliance.Barrier();
+    const Log log = appliance.TakeLog();
+    EXPECT_EQ(1U, log.size()) << zeros << ::testing::PrintToString(log);
+    EXPECT_EQ(zeros % 4 == 0, log == HANDLED) << zeros;
+    Handled(GOOD);
+  }
+  appliance.Service().SendBytes(std::string(4'000'003, '\0') + "x" + DELIMITER);
+  appliance.Barrier();
+  EXPECT_THAT(appliance.TakeLog(), IsEmpty());
+  ExpectUnharmed("zeros that are no delimiter");
+}
+
+TEST_F(Flood, EveryPrefixOfAGoodMessageIsRefused) {
+  const std::string comment = "<!-- " + std::string(Extent(0, 4'000), 'c') + " -->";
+  const std::string message =
+      Notification("TranscodedBatch", "/shares/A", comment + ProfileElement("0123"));
+  const std::size_t named =
+      message.find("ORVANotification") + std::string("ORVANotification").size();
+  for (std::size_t size = 0; size < message.size(); ++size) {
+    EXPECT_EQ(size < named, Refused(message.substr(0, size)).empty()) << size;
+  }
+  EXPECT_EQ(Log{Info(":: Transcodedbatch ")}, appliance.Handle(message));
+  ExpectUnharmed("prefixes of a message");
+}
+
+TEST_F(Flood, EverySuffixOfAGoodMessageIsRefused) {
+  const std::string message = GOOD;
+  for (std::size_t begin = message.find("<ORVA") + 1; begin < message.size(); ++begin) {
+    Refused(message.substr(begin));
+  }
+  ExpectUnharmed("suffixes of a message");
+}
+
+TEST_F(Flood, ConnectionsThatEndInsideAMessageLeaveNothingBehind) {
+  const int connections = Extent(50, 2'000);
+  for (int i = 0; i < connections; ++i) {
+    appliance.Service().SendBytes(std::string(LONGEST, 'x'));
+    appliance.Service().CloseClient();
+  }
+  appliance.Barrier();
+  // Two lines for each new connection, and none for what was cut off.
+  EXPECT_EQ(2U * static_cast<std::size_t>(connections), appliance.TakeLog().size());
+  ExpectUnharmed("connections that end inside a message");
+}
+
+TEST_F(Flood, SpellingsOfAMountPointAreABoundedNumberOfVolumes) {
+  const int spellings = Extent(5'000, 100'000);
+  for (int i = 0; i < spellings; ++i) {
+    std::string path = "/shares";
+    for (int bits = i; bits > 0; bits /= 2) {
+      path += bits % 2 == 0 ? "/." : "//.";
+    }
+    path += Repeated("/.", 1'000);
+    appliance.Service().Send(Notification("Purged", path));
+  }
+  appliance.Barrier();
+  appliance.TakeLog();
+  ExpectUnharmed("spellings of a mount point");
+}
+
+} // namespace
+} // namespace orva::test
