@@ -171,6 +171,7 @@ TEST_F(MasterOutage, AFullDiskFailsTheMergeUntilThereIsRoom) {
   int pages = 0;
   for (;; ++pages) {
     SCOPED_TRACE(std::to_string(pages) + " pages are free");
+    ASSERT_LT(pages, 1000);
     a.Resize(used + pages * PAGE);
     const Log log = HandleMasked(TranscodedBatch(b.Path()));
     if (Errors(log).empty()) {
@@ -213,6 +214,7 @@ TEST_F(MasterOutage, AFullDiskFailsTheRemovalUntilThereIsRoom) {
   int pages = 0;
   for (;; ++pages) {
     SCOPED_TRACE(std::to_string(pages) + " pages are free");
+    ASSERT_LT(pages, 1000);
     a.Resize(used + pages * PAGE);
     const Lines errors = Errors(appliance.Handle(Unplugged(b.Path())));
     if (errors.empty()) {
@@ -239,6 +241,7 @@ TEST_F(MasterOutage, AFullDiskFailsTheReMergeUntilThereIsRoom) {
   int pages = 0;
   for (;; ++pages) {
     SCOPED_TRACE(std::to_string(pages) + " pages are free");
+    ASSERT_LT(pages, 1000);
     a.Resize(used + pages * PAGE);
     const Lines errors = Errors(appliance.Handle(Purged(b.Path())));
     if (errors.empty()) {
@@ -337,6 +340,7 @@ TEST_F(SystemTest, AFullDiskKeepsTheDatabaseFromBeingMadeUntilThereIsRoom) {
   int pages = 0;
   for (;; ++pages) {
     SCOPED_TRACE(std::to_string(pages) + " pages are free");
+    ASSERT_LT(pages, 1000);
     a.Resize(used + pages * PAGE);
     const Lines errors = Errors(appliance.Handle(Scanned(a.Path())));
     if (errors.empty()) {

@@ -15,6 +15,7 @@
 
 #include <algorithm>
 #include <array>
+#include <chrono>
 #include <set>
 #include <stdexcept>
 
@@ -53,10 +54,13 @@ public:
     close(output_);
   }
 
-  /// Takes reads until one has seen `sight`.
+  /// Takes reads until one has seen `sight`. Throws std::runtime_error after the deadline.
   void Await(const std::string& sight) {
+    const auto end = std::chrono::steady_clock::now() + DEADLINE;
     while (sights_.empty() || sights_.back() != sight) {
-      TakeSome();
+      if (!TakeSome() || std::chrono::steady_clock::now() > end) {
+        throw std::runtime_error("the reader has not seen " + sight);
+      }
     }
   }
 
