@@ -11,6 +11,7 @@
 #include <cerrno>
 #include <cstdio>
 #include <cstring>
+#include <string_view>
 
 namespace orva::db {
 
@@ -37,17 +38,18 @@ private:
   int descriptor_;
 };
 
-/// Bytes of the regular file at `path`, 0 when there is none. A hole takes no room and counts for
-/// little: what bounds the work on a file is not to be had for nothing. A file system that
-/// compresses has few holes by this measure, and one that does not tell has none. A file that is
-/// written must have no other name, which may be that of somebody else's.
-long long RegularSize(const std::string& path, bool written) {
-  constexpr long long blockSize = 512;
-  constexpr long long mostFree = 4 << 20;
-  constexpr long long mostPerPlaced = 16;
+/// Bytes and 512-byte blocks of a file, none when it is not there.
+struct Extent {
+  long long size = 0;
+  long long blocks = 0;
+};
+
+/// What the regular file at `path` takes. One that is `written` must have no other name, which may
+/// be that of somebody else's.
+Extent RegularExtent(const std::string& path, bool written) {
   struct stat status {};
   if (lstat(path.c_str(), &status) != 0) {
-    return 0;
+    return {};
   }
   if (!S_ISREG(status.st_mode)) {
     throw util::FormatString("%s:%d: '%s' is not a regular file", __FILE__, __LINE__, path.c_str());
@@ -55,10 +57,16 @@ long long RegularSize(const std::string& path, bool written) {
   if (written && status.st_nlink > 1) {
     throw util::FormatString("%s:%d: '%s' has another name", __FILE__, __LINE__, path.c_str());
   }
-  return status.st_blocks == 0
-             ? status.st_size
-             : std::min<long long>(status.st_size,
-                                   mostFree + mostPerPlaced * blockSize * status.st_blocks);
+  return {.size = status.st_size, .blocks = status.st_blocks};
+}
+
+/// The size of a file, of which holes count for little: what bounds the work on a file is not to be
+/// had for nothing. A file system that compresses has few holes by this measure.
+long long SizeWithoutHoles(const Extent& extent) {
+  constexpr long long blockSize = 512;
+  constexpr long long mostFree = 4 << 20;
+  constexpr long long mostPerPlaced = 16;
+  return std::min(extent.size, mostFree + mostPerPlaced * blockSize * extent.blocks);
 }
 
 void Synchronise(const std::string& path, int flags, bool mayBeUnsupported) {
@@ -85,13 +93,18 @@ bool RemoveLogs(const std::string& path) {
 } // namespace
 
 long long CheckDatabaseFiles(const std::string& path, bool written) {
-  long long size = RegularSize(path, written);
+  const Extent database = RegularExtent(path, written);
+  Extent log;
   for (const char* const suffix : LOG_SUFFIXES) {
     // SQLite writes into some of these, and gives others the owner of the database, also where it
-    // only reads.
-    size += RegularSize(path + suffix, true);
+    // only reads. Only the write-ahead log is part of what is read.
+    const Extent beside = RegularExtent(path + suffix, true);
+    log = suffix == std::string_view("-wal") ? beside : log;
   }
-  return size;
+  // Where neither takes any room, the file system does not tell.
+  return database.blocks == 0 && log.blocks == 0
+             ? database.size + log.size
+             : SizeWithoutHoles(database) + SizeWithoutHoles(log);
 }
 
 void CheckJournal(const std::string& path) {

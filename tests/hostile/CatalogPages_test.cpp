@@ -4,6 +4,7 @@
 #include "HostileTest.h"
 
 #include <filesystem>
+#include <fstream>
 
 namespace orva::test {
 namespace {
@@ -92,6 +93,35 @@ TEST_F(CatalogPagesTest, FoldersWithoutEndInAFileFullOfHoles) {
 TEST_F(CatalogPagesTest, HiddenFoldersWithoutEndInAFileFullOfHoles) {
   Run("UPDATE Folders SET isHidden = 1");
   Multiply("Folders", 12);
+  std::filesystem::resize_file(CATALOG, 1ULL << 40U);
+  EXPECT_EQ(Outcome::Refused, MergeHostileVolume());
+}
+
+TEST_F(CatalogPagesTest, HiddenFoldersWithoutEndBesideALogFullOfHoles) {
+  Run("UPDATE Folders SET isHidden = 1");
+  Multiply("Folders", 12);
+  for (const char* const suffix : {"-journal", "-wal", "-shm"}) {
+    SCOPED_TRACE(suffix);
+    std::ofstream(CATALOG + suffix).flush();
+    std::filesystem::resize_file(CATALOG + suffix, 1ULL << 40U);
+    catalogHasWal = true; // a log is one where the catalog does not say so, too
+    EXPECT_EQ(Outcome::Refused, MergeHostileVolume());
+    std::filesystem::remove(CATALOG + suffix);
+  }
+}
+
+TEST_F(CatalogPagesTest, HiddenFoldersWithoutEndInALogAboveAHole) {
+  Run("UPDATE Folders SET isHidden = 1");
+  Run("PRAGMA journal_mode = WAL");
+  Multiply("Folders", 12);
+  catalogHasWal = true;
+  CraftedDatabase catalog(CATALOG);
+  std::map<std::uint32_t, Bytes> pages;
+  for (std::uint32_t page = 1; page <= catalog.Pages(); ++page) {
+    pages[page] = catalog.File().Part(catalog.Offset(page), catalog.PageSize());
+  }
+  CraftedWal(4096, catalog.Pages(), pages).Save(CATALOG + "-wal");
+  std::ofstream(CATALOG, std::ios::trunc).flush();
   std::filesystem::resize_file(CATALOG, 1ULL << 40U);
   EXPECT_EQ(Outcome::Refused, MergeHostileVolume());
 }
