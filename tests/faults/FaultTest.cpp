@@ -168,8 +168,8 @@ void FaultTest::LayFiles(const Files& files) {
 
 // The scenarios.
 
-Action FaultTest::Merging(const std::string& volume) {
-  return [this, volume] { merger.MergeDB(MASTER, volume); };
+void FaultTest::Merge(const std::string& volume) {
+  merger.MergeDB(MASTER, volume);
 }
 
 /// Looks up what the scenario leads to, from the files that are laid now. `volumes` are what a
@@ -182,7 +182,7 @@ FaultTest::Scenario FaultTest::Finish(Scenario scenario, const Lines& volumes) {
   if (!volumes.empty()) {
     LayFiles(std::nullopt);
     for (const std::string& volume : volumes) {
-      OutputOf(Merging(volume));
+      OutputOf([&] { Merge(volume); });
     }
     scenario.merged = Content();
   }
@@ -193,7 +193,8 @@ FaultTest::Scenario FaultTest::Finish(Scenario scenario, const Lines& volumes) {
 FaultTest::Scenario FaultTest::FirstMerge() {
   MakeCatalog(VOLUME);
   PhotoDB(MASTER).Init();
-  return Finish({.name = "a first merge", .operation = Merging(VOLUME), .throws = false}, {VOLUME});
+  return Finish({.name = "a first merge", .operation = [this] { Merge(VOLUME); }, .throws = false},
+                {VOLUME});
 }
 
 FaultTest::Scenario FaultTest::FirstMergeWithoutADatabase() {
@@ -209,14 +210,14 @@ FaultTest::Scenario FaultTest::FirstMergeWithoutADatabase() {
 void FaultTest::LayMergedVolumes() {
   MakeCatalog(OTHER);
   TestCatalog catalog = MakeCatalog(VOLUME);
-  OutputOf(Merging(OTHER));
-  OutputOf(Merging(VOLUME));
+  OutputOf([this] { Merge(OTHER); });
+  OutputOf([this] { Merge(VOLUME); });
   Change(catalog);
 }
 
 FaultTest::Scenario FaultTest::LaterMerge() {
   LayMergedVolumes();
-  return Finish({.name = "a later merge", .operation = Merging(VOLUME), .throws = false},
+  return Finish({.name = "a later merge", .operation = [this] { Merge(VOLUME); }, .throws = false},
                 {OTHER, VOLUME});
 }
 
@@ -376,7 +377,7 @@ void FaultTest::CheckOutcome(const Scenario& scenario, const Fault& fault, const
   ExpectUndisturbed(scenario.operation, scenario.after);
   if (content != scenario.before && !scenario.merged.empty()) {
     LayFiles(left);
-    ExpectUndisturbed(Merging(VOLUME), scenario.merged);
+    ExpectUndisturbed([this] { Merge(VOLUME); }, scenario.merged);
   }
 }
 

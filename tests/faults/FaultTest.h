@@ -67,7 +67,7 @@ protected:
   /// Runs the scenario with the faults, and looks at what comes of each.
   void ExpectToSurvive(const Scenario& scenario, const std::vector<Fault>& faults);
 
-  /// Everything in the merged database but row ids and the time of the status row.
+  /// Everything in the merged database but the ids of folders, files and statistics.
   static Lines Content();
 
   static Files TakeFiles();
@@ -85,7 +85,7 @@ private:
     Lines logged; ///< lines of failed merges
   };
 
-  Action Merging(const std::string& volume);
+  void Merge(const std::string& volume);
   void LayMergedVolumes();
   static std::vector<Lines> PartsOfADeletion();
   Scenario Finish(Scenario scenario, const Lines& volumes);

@@ -229,8 +229,7 @@ const std::vector<Case> CASES = {
     {"ProductThatNeverMatches",
      {"DROP TABLE Files", "CREATE TABLE Files(" + Replaced(FILE_COLUMNS, " PRIMARY KEY", "") + ")",
       "CREATE INDEX Files_id ON Files(id)",
-      "CREATE INDEX Transcodings_id ON "
-      "Transcodings(sourceId)",
+      "CREATE INDEX Transcodings_source ON Transcodings(sourceId)",
       "INSERT INTO Files " + Replaced(HUGE_ROWS, "1000000000", "30000") +
           "SELECT 1, -1, 'a.jpg', 'a.jpg', 3, 0, 0, 0, 0, 0, 3, 0, 'jpg', 0 FROM n",
       "INSERT INTO Transcodings " + Replaced(HUGE_ROWS, "1000000000", "30000") +

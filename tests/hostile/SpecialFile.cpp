@@ -10,6 +10,7 @@
 #include <cstring>
 #include <filesystem>
 #include <fstream>
+#include <ostream>
 #include <system_error>
 
 namespace orva::test {
@@ -42,6 +43,10 @@ std::string NameOf(SpecialKind kind) {
   return std::vector<std::string>{"Fifo", "Socket",       "Directory",   "Device",
                                   "Link", "LinkToDevice", "DanglingLink"}
       .at(static_cast<std::size_t>(kind));
+}
+
+void PrintTo(SpecialKind kind, std::ostream* stream) {
+  *stream << NameOf(kind);
 }
 
 SpecialFile::SpecialFile(SpecialKind kind, std::string path, const std::string& target)

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <iosfwd>
 #include <string>
 #include <vector>
 
@@ -15,6 +16,8 @@ const std::vector<SpecialKind> SPECIAL_KINDS = {
 
 /// A word for the kind.
 std::string NameOf(SpecialKind kind);
+/// The same for the names of tests.
+void PrintTo(SpecialKind kind, std::ostream* stream);
 
 /// Something of that kind at a path, for as long as the object lives. A device is one that the
 /// private root has, mounted there, since its own file system allows none.

@@ -67,7 +67,7 @@ void NotificationService::Send(const std::string& message) {
 }
 
 // Nothing tells that a queue has become empty, and a sleep would make a byte cost a time slice.
-void NotificationService::AwaitConsumed() {
+void NotificationService::AwaitConsumed() const {
   const auto deadline = std::chrono::steady_clock::now() + DEADLINE;
   int unread = 0;
   while (ioctl(client_, SIOCOUTQ, &unread) == 0 && unread != 0) {

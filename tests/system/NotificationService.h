@@ -26,7 +26,7 @@ public:
   void Send(const std::string& message);
 
   /// Waits until the client has read all that was sent to it.
-  void AwaitConsumed();
+  void AwaitConsumed() const;
 
   /// Reads nothing that the client writes, and lets it not be sent either.
   void StopReading();

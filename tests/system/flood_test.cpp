@@ -12,6 +12,7 @@ namespace {
 using ::testing::IsEmpty;
 
 const LogLine SKIPPED = Error("MessageProcessor:: message of more than 65536 bytes skipped");
+const LogLine ILL_FORMED = Error("MessageProcessor:: ");
 
 std::string Repeated(const std::string& text, std::size_t count) {
   std::string repeated;
@@ -20,11 +21,6 @@ std::string Repeated(const std::string& text, std::size_t count) {
     repeated += text;
   }
   return repeated;
-}
-
-/// The same log line `count` times.
-Log Times(std::size_t count, const LogLine& line) {
-  return Log(count, line);
 }
 
 TEST_F(Flood, ABillionBytesWithoutADelimiterAreOneMessage) {
@@ -46,12 +42,12 @@ TEST_F(Flood, MessagesThatAreTooLongAreSkippedOneByOne) {
     appliance.Service().SendBytes(message);
   }
   appliance.Barrier();
-  EXPECT_EQ(Times(count, SKIPPED), appliance.TakeLog());
+  EXPECT_EQ(Log(count, SKIPPED), appliance.TakeLog());
   ExpectUnharmed("messages that are too long");
 }
 
 TEST_F(Flood, AMessageMayComeByteByByte) {
-  const std::size_t size = Extent<std::size_t>(4096, LONGEST);
+  const auto size = Extent<std::size_t>(4096, LONGEST);
   const std::string end = GOOD.substr(GOOD.find("?>") + 2);
   const std::string begin = GOOD.substr(0, GOOD.size() - end.size());
   const std::string message = begin + std::string(size - GOOD.size(), ' ') + end + DELIMITER;
@@ -71,7 +67,7 @@ TEST_F(Flood, ManyMessagesAtOnceAreHandledInOrder) {
       {Notification("Purged", "/shares/B"),
        {Info(":: Purged "), Error(missing), Info("Default:: Volume purged - ignored! ")}},
       {Notification("Rescanned", "/shares/B"), {}},
-      {TranscodedBatch("/shares/B").replace(0, 0, "<!-- no profile -->").erase(90), {}},
+      {"<ORVANotification", {ILL_FORMED}},
       {R"(<Other about="ORVANotification"/>)", {Error("ERROR ! Node name = Other")}},
       {"<Other/>", {}},
   };
@@ -85,9 +81,12 @@ TEST_F(Flood, ManyMessagesAtOnceAreHandledInOrder) {
   }
   appliance.Service().SendBytes(bytes);
   appliance.Barrier();
-  // The message that was cut short is refused in words of the parser.
   Log log = appliance.TakeLog();
-  std::erase_if(log, [](const LogLine& line) { return line.text.starts_with("MessageProcessor"); });
+  for (LogLine& line : log) {
+    if (line.text.starts_with(ILL_FORMED.text)) {
+      line = ILL_FORMED; // the rest is the parser's
+    }
+  }
   EXPECT_TRUE(expected == log) << log.size() << " lines instead of " << expected.size();
   ExpectUnharmed(std::to_string(messages) + " messages at once");
 }
@@ -106,8 +105,7 @@ TEST_F(Flood, APeerThatNeverReadsHasNothingToRead) {
   appliance.Service().StopReading();
   appliance.Service().SendBytes(bytes);
   appliance.Barrier();
-  EXPECT_EQ(5U * static_cast<std::size_t>(rounds) + static_cast<std::size_t>(rounds),
-            appliance.TakeLog().size());
+  EXPECT_EQ(6U * static_cast<std::size_t>(rounds), appliance.TakeLog().size());
   ExpectUnharmed("messages of a peer that never reads");
 }
 

@@ -19,8 +19,6 @@ namespace orva::test {
 namespace {
 
 using ::testing::AnyOf;
-using ::testing::Eq;
-using ::testing::HasSubstr;
 using ::testing::IsEmpty;
 using ::testing::Ne;
 using ::testing::StartsWith;
