@@ -41,8 +41,8 @@ void Appliance::Start(const std::vector<std::string>& environment) {
   Barrier();
 }
 
-void Appliance::Launch() {
-  daemon_ = std::make_unique<DaemonProcess>(DIRECTORY, OUTPUT);
+void Appliance::Prepare() {
+  daemon_ = std::make_unique<DaemonProcess>(DIRECTORY, OUTPUT, std::vector<std::string>(), true);
   outputTaken_ = 0;
 }
 

@@ -23,8 +23,8 @@ public:
   /// Starts the daemon and waits until it reads notifications. `environment` as DaemonProcess.
   void Start(const std::vector<std::string>& environment = {});
 
-  /// Starts the daemon and does not wait for it.
-  void Launch();
+  /// Prepares the daemon, which starts when it gets SIGCONT, and does not wait for it.
+  void Prepare();
 
   /// Start with another file for standard output than TakeOutput reads.
   void StartWithOutput(const std::string& output);

@@ -42,7 +42,7 @@ std::vector<char*> Pointers(std::vector<std::string>& texts) {
 } // namespace
 
 DaemonProcess::DaemonProcess(std::string directory, std::string output,
-                             const std::vector<std::string>& environment)
+                             const std::vector<std::string>& environment, bool held)
     : directory_(std::move(directory)), output_(std::move(output)) {
   mkdir(directory_.c_str(), 0755);
   // The caller's come first: of two values of one name the first counts.
@@ -51,16 +51,22 @@ DaemonProcess::DaemonProcess(std::string directory, std::string output,
     variables.emplace_back(*variable);
   }
   std::vector<std::string> arguments{DAEMON};
+  if (held) {
+    arguments = {"/bin/sh", "-c", "kill -STOP $$; exec \"$0\"", DAEMON};
+  }
 
   posix_spawn_file_actions_t actions;
   Check(posix_spawn_file_actions_init(&actions), "posix_spawn_file_actions_init");
   posix_spawn_file_actions_addopen(&actions, STDOUT_FILENO, output_.c_str(),
                                    O_WRONLY | O_CREAT | O_TRUNC, 0644);
   posix_spawn_file_actions_addchdir_np(&actions, directory_.c_str());
-  const int code = posix_spawn(&pid_, DAEMON, &actions, nullptr, Pointers(arguments).data(),
-                               Pointers(variables).data());
+  const int code = posix_spawn(&pid_, arguments[0].c_str(), &actions, nullptr,
+                               Pointers(arguments).data(), Pointers(variables).data());
   posix_spawn_file_actions_destroy(&actions);
   Check(code, DAEMON);
+  if (held) {
+    waitpid(pid_, nullptr, WUNTRACED);
+  }
   pidfd_ = static_cast<int>(syscall(SYS_pidfd_open, pid_, 0));
 }
 

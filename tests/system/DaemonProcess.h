@@ -13,9 +13,10 @@ namespace orva::test {
 class DaemonProcess {
 public:
   /// Starts the daemon in `directory`, which is made; `environment` ("NAME=value") comes on top
-  /// of the test's own. `output` is the file for its standard output. Throws std::system_error.
+  /// of the test's own. `output` is the file for its standard output. With `held` the process
+  /// waits for SIGCONT before it becomes the daemon. Throws std::system_error.
   DaemonProcess(std::string directory, std::string output,
-                const std::vector<std::string>& environment = {});
+                const std::vector<std::string>& environment = {}, bool held = false);
   DaemonProcess(const DaemonProcess&) = delete;
   DaemonProcess& operator=(const DaemonProcess&) = delete;
   ~DaemonProcess();

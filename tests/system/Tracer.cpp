@@ -120,16 +120,23 @@ void Tracer::Release(pid_t thread) {
   if (held_[thread] && Trace(PTRACE_DETACH, thread) == 0) {
     return;
   }
-  Trace(PTRACE_INTERRUPT, thread);
-  siginfo_t state{};
-  if (waitid(P_PID, static_cast<id_t>(thread), &state, WSTOPPED | WEXITED | WNOWAIT | __WALL) !=
-      0) {
-    return;
-  }
-  if (state.si_code == CLD_TRAPPED) {
-    Trace(PTRACE_DETACH, thread, SignalOf(state));
-  } else if (thread != process_) {
-    waitpid(thread, nullptr, __WALL);
+  // One that is killed in the meantime is no longer where it was stopped.
+  for (;;) {
+    Trace(PTRACE_INTERRUPT, thread);
+    siginfo_t state{};
+    constexpr int events = WSTOPPED | WEXITED | WNOWAIT | __WALL;
+    if (waitid(P_PID, static_cast<id_t>(thread), &state, events) != 0) {
+      return;
+    }
+    if (state.si_code != CLD_TRAPPED) {
+      if (thread != process_) {
+        waitpid(thread, nullptr, __WALL);
+      }
+      return;
+    }
+    if (Trace(PTRACE_DETACH, thread, SignalOf(state)) == 0) {
+      return;
+    }
   }
 }
 

@@ -172,10 +172,12 @@ protected:
     }
     std::string last = "Calling ReadMessage()";
     if (step.message.empty()) {
-      appliance.Launch();
+      appliance.Prepare();
     }
     Tracer tracer(appliance.Daemon().Pid());
-    if (!step.message.empty()) {
+    if (step.message.empty()) {
+      kill(appliance.Daemon().Pid(), SIGCONT);
+    } else {
       appliance.Service().Send(step.message);
       last = appliance.SendBarrier();
     }
