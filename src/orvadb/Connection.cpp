@@ -25,6 +25,10 @@ Connection::Connection(sqlite3* handle, int busyTimeout, long long bytes)
 
 Connection::~Connection() = default;
 
+void Connection::SetFileSize(long long bytes) noexcept {
+  workLimit_->SetFileSize(bytes);
+}
+
 Connection::CheckedOut Connection::CheckOut(const char* sql, const char* file, unsigned line) {
   workLimit_->Restart();
   const auto kept = statements_.find(std::string_view(sql));

@@ -30,6 +30,9 @@ void ConfigureOnce() {
 /// Texts and rows of more bytes are read by nobody.
 constexpr int LONGEST_VALUE = 16 << 20;
 
+/// Indices on one table, all of which each of its rows has to be entered in.
+constexpr std::size_t MOST_INDICES = 32;
+
 /// Runs one statement that has no result. Throws std::string.
 void Run(sqlite3* handle, const char* sql) {
   if (sqlite3_exec(handle, sql, nullptr, nullptr, nullptr) != SQLITE_OK) {
@@ -57,6 +60,12 @@ std::string Pragma(const char* pragma, const std::string& name) {
     throw util::FormatString("%s:%d: out of memory", __FILE__, __LINE__);
   }
   return sql.get();
+}
+
+/// Whether the text of a column's default is that of a number, a plain text or nothing.
+bool IsLiteral(const std::string& text) {
+  return text.find_first_not_of("+-.0123456789") == std::string::npos || text == "NULL" ||
+         (text.size() >= 2 && text.front() == '\'' && text.find('\'', 1) == text.size() - 1);
 }
 
 /// `path` as a URI that promises that nobody writes the file.
@@ -92,7 +101,7 @@ void DB::Open(const std::string& path) {
 
 void DB::Open(std::string path, Access access, int busyTimeout, bool immutable) {
   Close();
-  fileSize_ = CheckDatabaseFiles(path, access == Access::ReadWrite);
+  const long long size = CheckDatabaseFiles(path, access == Access::ReadWrite);
   if (access == Access::ReadWrite) {
     CheckJournal(path);
   }
@@ -108,7 +117,7 @@ void DB::Open(std::string path, Access access, int busyTimeout, bool immutable) 
     if (code != SQLITE_OK) {
       throw ErrorMessage(handle_, ("open '" + path_ + "'").c_str(), __FILE__, __LINE__);
     }
-    connection_ = std::make_unique<Connection>(handle_, busyTimeout, fileSize_);
+    connection_ = std::make_unique<Connection>(handle_, busyTimeout, size);
     sqlite3_busy_timeout(handle_, busyTimeout);
     Distrust(handle_);
     if (access == Access::ReadWrite) {
@@ -144,8 +153,14 @@ void DB::Close() {
   // The connection has no statements left, so that this cannot be refused.
   sqlite3_close_v2(handle_);
   handle_ = nullptr;
-  fileSize_ = 0;
   path_.clear();
+}
+
+long long DB::MeasureFile() const {
+  const bool written = sqlite3_db_readonly(handle_, "main") == 0;
+  const long long size = CheckDatabaseFiles(path_, written);
+  connection_->SetFileSize(size);
+  return size;
 }
 
 void DB::RefuseComputedValues(const std::string& table) const {
@@ -163,7 +178,7 @@ void DB::RefuseComputedValues(const std::string& table) const {
   Statement column(*this, listColumns.c_str(), __FILE__, __LINE__);
   while (column.Fetch(__FILE__, __LINE__)) {
     refuse(column.GetInt(6) >= virtualColumn, "generated column");
-    refuse(written && !column.IsNull(4), "default value");
+    refuse(written && !IsLiteral(column.GetText(4)), "default value that is no literal");
   }
   if (!written) {
     return;
@@ -174,6 +189,7 @@ void DB::RefuseComputedValues(const std::string& table) const {
   while (index.Fetch(__FILE__, __LINE__)) {
     refuse(index.GetBool(4), "partial index");
     indices.push_back(index.GetText(1));
+    refuse(indices.size() > MOST_INDICES, "more indices than a row is worth");
   }
   for (const std::string& name : indices) {
     const std::string listKeys = Pragma("index_xinfo", name);

@@ -15,6 +15,8 @@ public:
   WorkLimit& operator=(const WorkLimit&) = delete;
   ~WorkLimit();
 
+  void SetFileSize(long long bytes) noexcept { bytes_ = bytes; }
+
   /// A statement begins.
   void Restart() noexcept;
 

@@ -27,11 +27,12 @@ constexpr long long TRANSCODED = 3;
 constexpr std::size_t EXPECTED_ITEMS = 4096;
 
 /// The memory that the list read from a catalog may take: in a catalog that was crafted, a few
-/// pages may make up any number of rows.
+/// pages may make up any number of rows. Made behind the first read of a transaction, when the
+/// catalog no longer grows under it.
 class ListMemory {
 public:
   explicit ListMemory(const db::VolumeDB& catalog)
-      : catalog_(catalog), left_(LEAST + PER_BYTE * catalog.GetFileSize()) {}
+      : catalog_(catalog), left_(LEAST + PER_BYTE * catalog.MeasureFile()) {}
 
   /// Takes what one more item needs. Throws std::string when there is not enough left.
   void Take(const db::FolderItem& item, std::size_t more) {

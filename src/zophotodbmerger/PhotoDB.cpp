@@ -324,35 +324,18 @@ void PhotoDB::DeleteVolumes() const {
   }
 }
 
-// When our rows go, SQLite computes the defaults and the indices of tables that refer to them.
-void PhotoDB::RefuseDearReferences() const {
-  std::vector<std::string> tables;
-  Statement query(*this,
-                  "SELECT name FROM sqlite_schema WHERE type = 'table' AND sql LIKE '%REFERENCES%'",
-                  __FILE__, __LINE__);
-  while (query.Fetch(__FILE__, __LINE__)) {
-    tables.push_back(query.GetText(0));
-  }
-  for (const std::string& table : tables) {
-    RefuseComputedValues(table);
-  }
-}
-
 void PhotoDB::DeleteVolume(const std::string& volume) const {
   Known().Forget();
-  RefuseDearReferences();
-  // Nothing holds these together: whatever stops between them must leave what the next merge of
-  // the volume makes good. So its time goes back before the first row goes, and folders take
-  // their files along, which would belong to none and never be found again.
-  Statement(*this, "PRAGMA foreign_keys = ON", __FILE__, __LINE__).Execute(__FILE__, __LINE__);
-  constexpr const char* restart = "UPDATE Statistics SET last_updated_time = 0 WHERE volume = ?";
-  for (const char* const sql : {restart, "DELETE FROM Folders WHERE volume = ?",
-                                "DELETE FROM Files WHERE volume = ?", restart}) {
+  // Nothing holds these together, so their order does: whatever stops between them leaves no file
+  // without a folder, which would never be found again, and a volume whose next merge begins anew
+  // and restores what is gone.
+  for (const char* const sql :
+       {"UPDATE Statistics SET last_updated_time = 0 WHERE volume = ?",
+        "DELETE FROM Files WHERE volume = ?", "DELETE FROM Folders WHERE volume = ?"}) {
     Statement change(*this, sql, __FILE__, __LINE__);
     change.BindText(1, volume, __FILE__, __LINE__);
     change.Execute(__FILE__, __LINE__);
   }
-  Statement(*this, "PRAGMA foreign_keys = OFF", __FILE__, __LINE__).Execute(__FILE__, __LINE__);
 }
 
 std::unique_ptr<File> PhotoDB::GetFile(long long fileId) const {

@@ -154,7 +154,6 @@ private:
 
   std::string FilePath() const;
   void LoadStatus();
-  void RefuseDearReferences() const;
   long long FindFolder(std::string_view path) const;
   long long FindFolder(std::string_view path, const std::string& volume) const;
   bool IsFilePresent(const std::string& volume, const db::File& file,

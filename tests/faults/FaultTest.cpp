@@ -232,8 +232,6 @@ std::vector<Lines> FaultTest::PartsOfADeletion() {
     parts.push_back(Content());
   }
   LayFiles(files);
-  // Folders go together with their files.
-  parts.erase(parts.begin() + 1);
   return parts;
 }
 

@@ -261,7 +261,9 @@ TEST_F(MergedDatabaseTest, RowsWithoutEndAndNoIndices) {
     CraftedDatabase merged(MERGED);
     merged.Multiply(root, 12);
     merged.Save();
-    EXPECT_THAT(UseHostileMaster(), Contains(HasSubstr("more work")));
+    // Rows that go twice show that the file is broken before they are too many.
+    EXPECT_THAT(UseHostileMaster(),
+                Contains(::testing::AnyOf(HasSubstr("more work"), HasSubstr("malformed"))));
   }
 }
 

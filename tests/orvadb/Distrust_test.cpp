@@ -136,6 +136,10 @@ TEST_F(DistrustTest, EachStatementHasItsOwnLimit) {
 
 TEST_F(DistrustTest, StoredValuesAreTaken) {
   Made("CREATE INDEX plain ON t(a, b)");
+  int column = 0;
+  for (const char* const value : {"0", "-1.5", "'plain text'", "NULL"}) {
+    Made("ALTER TABLE t ADD COLUMN c" + std::to_string(column++) + " DEFAULT " + value);
+  }
   EXPECT_EQ(Refusal(), "");
   Made("DROP TABLE t");
   EXPECT_EQ(Refusal(), "") << "a table that is not there computes nothing";
@@ -151,7 +155,7 @@ TEST_F(DistrustTest, GeneratedColumnsAreRefused) {
 
 TEST_F(DistrustTest, WhatIsComputedOnWritingIsRefusedOnlyWhereRowsAreWritten) {
   for (const char* const sql :
-       {"ALTER TABLE t ADD COLUMN c DEFAULT 'value'", "CREATE INDEX i ON t(a || b)",
+       {"ALTER TABLE t ADD COLUMN c DEFAULT ('a' || 'b')", "CREATE INDEX i ON t(a || b)",
         "CREATE INDEX i ON t(a) WHERE b LIKE '%'",
         "CREATE INDEX \"it's \"\"dear\"\"\" ON t(abs(a))"}) {
     Made("DROP TABLE t; CREATE TABLE t(a, b)");
@@ -159,6 +163,26 @@ TEST_F(DistrustTest, WhatIsComputedOnWritingIsRefusedOnlyWhereRowsAreWritten) {
     EXPECT_NE(Refusal(), "") << sql;
     EXPECT_EQ(Refusal(false), "") << sql;
   }
+}
+
+TEST_F(DistrustTest, MoreIndicesThanARowIsWorthAreRefused) {
+  for (int i = 0; i < 33; ++i) {
+    EXPECT_EQ(Refusal(), "") << i;
+    Made("CREATE INDEX i" + std::to_string(i) + " ON t(a)");
+  }
+  EXPECT_THAT(Refusal(), HasSubstr("more indices than a row is worth"));
+}
+
+TEST_F(DistrustTest, FileThatHasGrownMayTakeMoreWork) {
+  Made(THREE_THOUSAND);
+  const TestDB db(path);
+  Made("CREATE TABLE large(a); INSERT INTO large VALUES(zeroblob(10000000))");
+  const auto count = [&] {
+    Statement(db, DEAR.c_str(), __FILE__, __LINE__).Execute(__FILE__, __LINE__);
+  };
+  EXPECT_THROW(count(), std::string);
+  db.MeasureFile();
+  EXPECT_NO_THROW(count());
 }
 
 /// What ends a journal after whose use SQLite deletes the file whose name stands before.
@@ -195,14 +219,14 @@ TEST_F(DistrustTest, FileWithAnotherNameIsReadButNotWritten) {
 TEST_F(DistrustTest, HolesCountForLittle) {
   fs::resize_file(path, 1LL << 40);
   const TestDB db(path);
-  EXPECT_LT(db.GetFileSize(), 5 << 20);
+  EXPECT_LT(db.MeasureFile(), 5 << 20);
 }
 
 TEST_F(DistrustTest, SizeCountsTheLogToo) {
   const Raw writer(path);
   Query(writer, "PRAGMA journal_mode = WAL; CREATE TABLE more(a)");
   const TestDB db(path);
-  EXPECT_EQ(db.GetFileSize(),
+  EXPECT_EQ(db.MeasureFile(),
             static_cast<long long>(fs::file_size(path) + fs::file_size(path + "-wal")));
 }
 

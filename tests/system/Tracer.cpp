@@ -170,7 +170,9 @@ std::string Tracer::Data(const SystemCall& call) const {
   }
   std::string data(std::min<std::size_t>(call.arguments[2], 65536), '\0');
   const iovec here{data.data(), data.size()};
-  const iovec there{reinterpret_cast<void*>(call.arguments[1]), data.size()};
+  // An address of the other process, which is not ours to look at.
+  const iovec there{reinterpret_cast<void*>(call.arguments[1]), // NOLINT(performance-no-int-to-ptr)
+                    data.size()};
   const ssize_t size = process_vm_readv(process_, &here, 1, &there, 1, 0);
   data.resize(static_cast<std::size_t>(std::max<ssize_t>(size, 0)));
   return data;

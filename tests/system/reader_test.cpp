@@ -144,11 +144,12 @@ protected:
            std::to_string(folders);
   }
 
-  /// What a reader may see before a re-merge begins to add: the time set back, and then no rows.
+  /// What a reader may see before a re-merge begins to add: the time set back, then no files, then
+  /// no folders either.
   std::set<std::string> SetBack() const {
     const std::string photos = std::to_string(folders * PER_FOLDER);
-    const std::string statistics = "|" + photos + "|" + photos + "|0";
-    return {photos + "|0|" + std::to_string(folders + 1) + statistics, "0|0|0" + statistics};
+    const std::string rest = std::to_string(folders + 1) + "|" + photos + "|" + photos + "|0";
+    return {photos + "|0|" + rest, "0|0|" + rest, "0|0|0|" + photos + "|" + photos + "|0"};
   }
 
   static constexpr int PER_FOLDER = 500;

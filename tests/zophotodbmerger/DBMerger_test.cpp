@@ -480,12 +480,9 @@ bool IsBeingMerged(const Database& merged) {
   return false;
 }
 
-TEST_F(DBMergerTest, CatalogThatIsJustWrittenIsWaitedFor) {
-  AddPhotos();
-  PhotoDB(MASTER).Init();
-  catalog.Rows().Run("BEGIN EXCLUSIVE");
-  catalog.AddPhoto(4, "just.jpg", 0, 400);
-  std::thread indexer([this] {
+/// Commits the catalog once the merge has begun.
+std::thread CommitDuringTheMerge(const TestCatalog& catalog) {
+  return std::thread([&catalog] {
     const Database merged(MergedDatabasePath(MASTER));
     merged.Run("PRAGMA busy_timeout = 0");
     const auto deadline = std::chrono::steady_clock::now() + DEADLINE;
@@ -494,10 +491,32 @@ TEST_F(DBMergerTest, CatalogThatIsJustWrittenIsWaitedFor) {
     }
     catalog.Rows().Run("COMMIT");
   });
+}
+
+TEST_F(DBMergerTest, CatalogThatIsJustWrittenIsWaitedFor) {
+  AddPhotos();
+  PhotoDB(MASTER).Init();
+  catalog.Rows().Run("BEGIN EXCLUSIVE");
+  catalog.AddPhoto(4, "just.jpg", 0, 400);
+  std::thread indexer = CommitDuringTheMerge(catalog);
   Merge();
   indexer.join();
   EXPECT_EQ(MergeLines(VOLUME, 3, 4), Logged());
   EXPECT_EQ(4U, MergedFiles(MASTER).size());
+}
+
+TEST_F(DBMergerTest, CatalogThatGrowsWhileItIsWaitedForIsReadWhole) {
+  AddPhotos();
+  PhotoDB(MASTER).Init();
+  catalog.Rows().Run("BEGIN EXCLUSIVE");
+  for (int i = 10; i < 10'010; ++i) {
+    catalog.AddPhoto(i, "photo" + std::to_string(i), 0, 400);
+  }
+  std::thread indexer = CommitDuringTheMerge(catalog);
+  Merge();
+  indexer.join();
+  EXPECT_EQ(MergeLines(VOLUME, 3, 10'003), Logged());
+  EXPECT_EQ(10'003U, MergedFiles(MASTER).size());
 }
 
 TEST_F(DBMergerTest, ReaderOfTheMergedDatabaseIsNoObstacleToTheNextMerge) {

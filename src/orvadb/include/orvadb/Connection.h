@@ -49,6 +49,9 @@ public:
   /// Busy time-out of the connection in milliseconds, while no transaction has its own.
   int BusyTimeout() const noexcept { return busyTimeout_; }
 
+  /// The database turned out to have `bytes` bytes.
+  void SetFileSize(long long bytes) noexcept;
+
   /// First failed step since the running transaction began, as a message; empty when none.
   std::string failedStep;
 

@@ -42,13 +42,15 @@ public:
   /// Path of the open file; empty while closed.
   const std::string& GetPath() const noexcept { return path_; }
 
-  /// Bytes of the database, with its log, when it was opened; 0 while closed.
-  long long GetFileSize() const noexcept { return fileSize_; }
+  /// Bytes of the open database with its log; its holes count for little. Statements may work as
+  /// much as that is worth from now on: a file that was waited for may have grown since it was
+  /// opened. Throws std::string.
+  long long MeasureFile() const;
 
   /// Makes sure that the values in `table` are those that were
-  /// stored there: refuses generated columns and, where the connection can write, defaults and
-  /// indices on expressions, which a stranger may have made so dear that a row takes minutes.
-  /// A table that is not there has none. Throws std::string.
+  /// stored there: refuses generated columns and, where the connection can write, computed
+  /// defaults, indices on expressions and any number of them, which a stranger may have made so
+  /// dear that a row takes minutes. A table that is not there has none. Throws std::string.
   void RefuseComputedValues(const std::string& table) const;
 
 protected:
