@@ -1,0 +1,167 @@
+#include "Commands.h"
+#include "Json.h"
+#include "MergedDatabase.h"
+
+#include <SQLiteCpp/Exception.h>
+#include <SQLiteCpp/Statement.h>
+
+#include <vector>
+
+namespace orva::zophotos {
+
+namespace {
+
+constexpr std::size_t MOST_EXAMPLES = 20;
+
+/// One kind of thing that was found, and the first ones of it.
+struct Finding {
+  std::string kind;  ///< for programs
+  std::string title; ///< for people
+  std::int64_t count = 0;
+  std::vector<std::string> examples{};
+
+  void Add(const std::string& example) {
+    ++count;
+    if (examples.size() < MOST_EXAMPLES) {
+      examples.push_back(example);
+    }
+  }
+};
+
+/// What to look for: each row of `sql` has one text, which describes one of what it finds.
+struct Question {
+  const char* kind;
+  const char* title;
+  const char* sql;
+};
+
+constexpr Question DAMAGE[] = {
+    {"integrity", "faults in the file", "PRAGMA integrity_check(1000)"},
+    {"no_status", "no status row 1",
+     "SELECT 'Status' WHERE NOT EXISTS (SELECT 1 FROM Status WHERE id = 1)"},
+    {"no_root", "no root folder 1",
+     "SELECT 'Folders' WHERE NOT EXISTS (SELECT 1 FROM Folders WHERE folder_id = 1 AND name = "
+     "'/shares/')"},
+    {"file_without_folder", "files without a folder",
+     "SELECT 'file ' || f.file_id || ', ' || f.name || ', of ' || f.volume || ': no folder ' || "
+     "f.folder_id FROM Files f WHERE NOT EXISTS (SELECT 1 FROM Folders o WHERE o.folder_id = "
+     "f.folder_id)"},
+    {"file_of_other_volume", "files of another volume than their folder",
+     "SELECT o.name || f.name || ', of ' || f.volume || ' in a folder of ' || o.volume FROM Files f "
+     "JOIN Folders o ON o.folder_id = f.folder_id WHERE f.volume != o.volume"},
+    {"duplicate_folder", "folders that are there more than once",
+     "SELECT name || ', ' || count(*) || ' times' FROM Folders GROUP BY name HAVING count(*) > 1"},
+    {"duplicate_file", "files that are there more than once",
+     "SELECT o.name || f.name || ', ' || count(*) || ' times' FROM Files f JOIN Folders o ON "
+     "o.folder_id = f.folder_id GROUP BY f.folder_id, f.name, f.volume HAVING count(*) > 1"},
+    {"duplicate_statistics", "volumes with more than one row of statistics",
+     "SELECT volume || ', ' || count(*) || ' times' FROM Statistics GROUP BY volume HAVING count(*) "
+     "> 1"},
+};
+
+/// What the daemon's rules leave behind; doc/operations.md says when it goes.
+constexpr Question LEFTOVERS[] = {
+    {"statistics_without_content", "statistics of volumes that have nothing merged",
+     "SELECT volume FROM Statistics s WHERE NOT EXISTS (SELECT 1 FROM Folders o WHERE o.volume = "
+     "s.volume) ORDER BY volume"},
+    {"folder_without_parent", "folders whose parent folder was removed",
+     "SELECT name FROM Folders o WHERE parent_folder_id != -1 AND NOT EXISTS (SELECT 1 FROM Folders "
+     "p WHERE p.folder_id = o.parent_folder_id) ORDER BY name"},
+};
+
+/// Asks one question. What SQLite cannot read for it is a finding of its own.
+void Ask(SQLite::Database& database, const Question& question, std::vector<Finding>& findings) {
+  Finding finding{.kind = question.kind, .title = question.title};
+  try {
+    SQLite::Statement query(database, question.sql);
+    while (query.executeStep()) {
+      const std::string text = query.getColumn(0).getString();
+      if (text != "ok" || finding.kind != "integrity") {
+        finding.Add(text);
+      }
+    }
+  } catch (const SQLite::Exception& error) {
+    if (!IsDamage(error)) {
+      throw;
+    }
+    finding.Add(error.what());
+  }
+  if (finding.count > 0) {
+    findings.push_back(std::move(finding));
+  }
+}
+
+struct Report {
+  std::vector<Finding> damage;
+  std::vector<Finding> leftovers;
+};
+
+Report Examine(const std::string& path) {
+  Report report;
+  try {
+    SQLite::Database database = CopyDatabase(path);
+    for (const Question& question : DAMAGE) {
+      Ask(database, question, report.damage);
+    }
+    for (const Question& question : LEFTOVERS) {
+      Ask(database, question, report.leftovers);
+    }
+  } catch (const SQLite::Exception& error) {
+    if (!IsDamage(error)) {
+      throw;
+    }
+    report.damage.push_back({.kind = DAMAGE[0].kind, .title = DAMAGE[0].title});
+    report.damage.back().Add(error.what());
+  }
+  return report;
+}
+
+void PrintFindings(const std::string& heading, const std::vector<Finding>& findings) {
+  if (findings.empty()) {
+    return;
+  }
+  std::cout << heading << '\n';
+  for (const Finding& finding : findings) {
+    std::cout << "  " << finding.count << ' ' << finding.title << '\n';
+    for (const std::string& example : finding.examples) {
+      std::cout << "    " << Printable(example) << '\n';
+    }
+    const auto listed = static_cast<std::int64_t>(finding.examples.size());
+    if (listed < finding.count) {
+      std::cout << "    and " << finding.count - listed << " more\n";
+    }
+  }
+}
+
+Json ToJson(const std::vector<Finding>& findings) {
+  Json list = Json::array();
+  for (const Finding& finding : findings) {
+    Json examples = Json::array();
+    for (const std::string& example : finding.examples) {
+      examples.push_back(ToUtf8(example));
+    }
+    list.push_back(
+        {{"kind", finding.kind}, {"count", finding.count}, {"examples", std::move(examples)}});
+  }
+  return list;
+}
+
+} // namespace
+
+ExitStatus CheckDatabase(const std::string& path, Form form) {
+  const Report report = Examine(path);
+  const bool isSound = report.damage.empty();
+  if (form == Form::Json) {
+    PrintLine({{"database", ToUtf8(path)},
+               {"sound", isSound},
+               {"damage", ToJson(report.damage)},
+               {"leftovers", ToJson(report.leftovers)}});
+  } else {
+    std::cout << Printable(path) << (isSound ? " is sound\n" : " is damaged\n");
+    PrintFindings("Damage:", report.damage);
+    PrintFindings("Expected leftovers, no damage:", report.leftovers);
+  }
+  return isSound ? ExitStatus::Success : ExitStatus::Negative;
+}
+
+} // namespace orva::zophotos

@@ -1,0 +1,49 @@
+#include "Commands.h"
+#include "Json.h"
+#include "MergedDatabase.h"
+
+namespace orva::zophotos {
+
+namespace {
+
+/// A text as a CSV field. Always quoted, so that no name means anything to who reads it.
+std::string Quoted(const std::string& text) {
+  std::string field = "\"";
+  for (const char byte : ToUtf8(text)) {
+    field += byte;
+    if (byte == '"') {
+      field += byte;
+    }
+  }
+  return field + '"';
+}
+
+void PrintCsv(const Item& item, const std::string& path) {
+  std::cout << Quoted(path) << ',' << Quoted(item.volume) << ','
+            << IsoTime(item.modified).value_or("") << ',' << IsoTime(item.created).value_or("")
+            << '\n';
+}
+
+void PrintJson(const Item& item, const std::string& path) {
+  PrintLine({{"path", ToUtf8(path)},
+             {"volume", ToUtf8(item.volume)},
+             {"modified", JsonTime(item.modified)},
+             {"created", JsonTime(item.created)}});
+}
+
+} // namespace
+
+ExitStatus ExportFiles(const std::string& path, ExportFormat format) {
+  SQLite::Database database = CopyDatabase(path);
+  if (format == ExportFormat::Csv) {
+    std::cout << "path,volume,modified,created\n";
+  }
+  Walk(database, [format](const Item& item) {
+    if (item.file) {
+      (format == ExportFormat::Csv ? PrintCsv : PrintJson)(item, item.folder + *item.file);
+    }
+  });
+  return ExitStatus::Success;
+}
+
+} // namespace orva::zophotos

@@ -1,0 +1,134 @@
+#include "Commands.h"
+#include "Json.h"
+#include "MergedDatabase.h"
+#include "Table.h"
+
+#include <SQLiteCpp/Statement.h>
+#include <SQLiteCpp/Transaction.h>
+
+#include <vector>
+
+namespace orva::zophotos {
+
+namespace {
+
+struct Entry {
+  bool isFolder = false;
+  bool isStored = false; ///< false for a folder that is only part of other folders' paths
+  std::string path{};
+  std::string name{}; ///< last component; a folder's with its separator
+  std::int64_t files = 0;
+  std::int64_t modified = 0;
+  std::string volume{};
+};
+
+/// The folders right below `folder`, by the paths of all below it: a removed folder may have left
+/// some. Goes from one to the next by the index, past what is in them.
+std::vector<Entry> ReadFolders(SQLite::Database& database, const std::string& folder) {
+  SQLite::Statement query(database,
+                          "SELECT name, modified_date, volume, (SELECT count(*) FROM Files f WHERE "
+                          "f.folder_id = o.folder_id) FROM Folders o WHERE name > ? AND name < ? "
+                          "ORDER BY name LIMIT 1");
+  std::vector<Entry> entries;
+  std::string from = folder;
+  for (;;) {
+    query.bind(1, from);
+    query.bind(2, EndOfFolder(folder));
+    if (!query.executeStep()) {
+      return entries;
+    }
+    const std::string found = query.getColumn(0).getString();
+    Entry entry{.isFolder = true};
+    const std::size_t end = found.find('/', folder.size());
+    entry.path = found.substr(0, end == std::string::npos ? end : end + 1);
+    entry.name = entry.path.substr(folder.size());
+    if (entry.path == found) {
+      entry.isStored = true;
+      entry.modified = query.getColumn(1).getInt64();
+      entry.volume = query.getColumn(2).getString();
+      entry.files = query.getColumn(3).getInt64();
+    }
+    from = end == std::string::npos ? found : EndOfFolder(entry.path);
+    entries.push_back(std::move(entry));
+    query.reset();
+  }
+}
+
+void ReadFiles(SQLite::Database& database, const std::string& folder, std::vector<Entry>& entries) {
+  SQLite::Statement query(database,
+                          "SELECT f.name, f.modified_date, f.volume FROM Folders o JOIN Files f ON "
+                          "f.folder_id = o.folder_id WHERE o.name = ? ORDER BY f.name");
+  query.bind(1, folder);
+  while (query.executeStep()) {
+    const std::string name = query.getColumn(0).getString();
+    entries.push_back({.isFolder = false,
+                       .isStored = true,
+                       .path = folder + name,
+                       .name = name,
+                       .modified = query.getColumn(1).getInt64(),
+                       .volume = query.getColumn(2).getString()});
+  }
+}
+
+bool IsStored(SQLite::Database& database, const std::string& folder) {
+  SQLite::Statement query(database, "SELECT 1 FROM Folders WHERE name = ?");
+  query.bind(1, folder);
+  return query.executeStep();
+}
+
+void PrintJson(const Entry& entry) {
+  Json line{{"type", entry.isFolder ? "folder" : "file"},
+            {"path", ToUtf8(entry.path)},
+            {"volume", entry.isStored ? Json(ToUtf8(entry.volume)) : Json()},
+            {"modified", entry.isStored ? JsonTime(entry.modified) : Json()}};
+  if (entry.isFolder) {
+    line["files"] = entry.files;
+    line["stored"] = entry.isStored;
+  }
+  PrintLine(line);
+}
+
+void PrintLong(const std::vector<Entry>& entries) {
+  Table table({{.heading = "MODIFIED"},
+               {.heading = "FILES", .right = true},
+               {.heading = "VOLUME", .elastic = true},
+               {.heading = "NAME", .elastic = true}});
+  for (const Entry& entry : entries) {
+    table.AddRow({entry.isStored ? LocalTime(entry.modified) : "-",
+                  entry.isFolder ? std::to_string(entry.files) : "", Printable(entry.volume),
+                  Printable(entry.name)});
+  }
+  table.Print(std::cout, TerminalWidth());
+}
+
+void PrintNames(const std::vector<Entry>& entries) {
+  for (const Entry& entry : entries) {
+    std::cout << Printable(entry.name) << '\n';
+  }
+}
+
+} // namespace
+
+ExitStatus ListFolder(const std::string& path, const std::string& folder, bool isLong, Form form) {
+  const std::string folderPath = FolderPath(folder);
+  std::vector<Entry> entries;
+  {
+    SQLite::Database database = OpenDatabase(path);
+    const SQLite::Transaction oneState(database);
+    entries = ReadFolders(database, folderPath);
+    ReadFiles(database, folderPath, entries);
+    if (entries.empty() && !IsStored(database, folderPath)) {
+      throw Failure(ExitStatus::Negative, "there is no folder " + Printable(folderPath));
+    }
+  }
+  if (form == Form::Json) {
+    for (const Entry& entry : entries) {
+      PrintJson(entry);
+    }
+  } else {
+    (isLong ? PrintLong : PrintNames)(entries);
+  }
+  return ExitStatus::Success;
+}
+
+} // namespace orva::zophotos

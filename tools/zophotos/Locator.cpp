@@ -1,0 +1,46 @@
+#include "Locator.h"
+
+#include "Failure.h"
+
+#include <filesystem>
+#include <fstream>
+#include <string_view>
+#include <system_error>
+
+namespace orva::zophotos {
+
+namespace {
+
+constexpr const char* LOCATOR = "/tmp/zophotodbmerger.conf";
+constexpr std::string_view KEY = "zophotos_db_path=";
+
+[[noreturn]] void ThrowNoDatabase(const std::string& reason) {
+  throw Failure(ExitStatus::NoDatabase, "no merged database: " + reason);
+}
+
+} // namespace
+
+std::string FindDatabase() {
+  // Anybody can make something there, and a FIFO would be waited for.
+  std::error_code error;
+  if (!std::filesystem::is_regular_file(LOCATOR, error)) {
+    ThrowNoDatabase(std::string("there is no file ") + LOCATOR +
+                    ", which the daemon writes when it starts");
+  }
+  std::ifstream file(LOCATOR);
+  if (!file) {
+    ThrowNoDatabase(std::string(LOCATOR) + " cannot be read");
+  }
+  std::string line;
+  std::getline(file, line);
+  if (!line.starts_with(KEY)) {
+    ThrowNoDatabase(std::string(LOCATOR) + " has no " + std::string(KEY) + " in its first line");
+  }
+  line.erase(0, KEY.size());
+  if (line.empty()) {
+    ThrowNoDatabase(std::string(LOCATOR) + " names none at this moment");
+  }
+  return line;
+}
+
+} // namespace orva::zophotos

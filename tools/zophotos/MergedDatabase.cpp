@@ -1,0 +1,136 @@
+#include "MergedDatabase.h"
+
+#include "Failure.h"
+
+#include <SQLiteCpp/Backup.h>
+#include <SQLiteCpp/Exception.h>
+#include <SQLiteCpp/Statement.h>
+#include <sqlite3.h>
+
+#include <filesystem>
+#include <system_error>
+#include <utility>
+
+namespace orva::zophotos {
+
+namespace {
+
+/// Milliseconds that a lock is waited for: longer than a usual merge takes to commit.
+constexpr int BUSY_TIMEOUT = 5000;
+
+/// The database may have come with a volume from elsewhere: nothing that it brings along is run.
+void Distrust(SQLite::Database& database) {
+  for (const auto& [option, value] :
+       {std::pair(SQLITE_DBCONFIG_ENABLE_VIEW, 0), std::pair(SQLITE_DBCONFIG_TRUSTED_SCHEMA, 0),
+        std::pair(SQLITE_DBCONFIG_DEFENSIVE, 1)}) {
+    sqlite3_db_config(database.getHandle(), option, value, nullptr);
+  }
+}
+
+void RequireTables(const SQLite::Database& database, const std::string& path) {
+  for (const char* const table : {"Status", "Statistics", "Folders", "Files"}) {
+    if (!database.tableExists(table)) {
+      throw Failure(ExitStatus::Failed,
+                    path + " is no merged photo database: it has no table " + table);
+    }
+  }
+}
+
+/// Opens the file without a look at what is in it.
+SQLite::Database OpenFile(const std::string& path) {
+  std::error_code error;
+  const auto type = std::filesystem::status(path, error).type();
+  if (type == std::filesystem::file_type::not_found) {
+    throw Failure(ExitStatus::NoDatabase, "no merged database: " + path + " does not exist");
+  }
+  if (type != std::filesystem::file_type::regular) {
+    throw Failure(ExitStatus::Failed,
+                  path + (error ? ": " + error.message() : " is not a regular file"));
+  }
+  SQLite::Database database(path, SQLite::OPEN_READONLY, BUSY_TIMEOUT);
+  Distrust(database);
+  return database;
+}
+
+/// Copies some MiB at a time, so that a merge can commit in between; the copying then begins anew.
+/// Where that happens too often it is done in one go.
+void CopyPages(SQLite::Database& from, SQLite::Database& to) {
+  constexpr int pages = 2048;
+  constexpr int mostTries = 5;
+  SQLite::Backup backup(to, from);
+  for (long long copied = 0;; copied += pages) {
+    const bool patient = copied <= static_cast<long long>(backup.getTotalPageCount()) * mostTries;
+    const int code = backup.executeStep(patient ? pages : -1);
+    if (code == SQLITE_DONE) {
+      return;
+    }
+    if (code != SQLITE_OK) {
+      throw SQLite::Exception(sqlite3_errstr(code), code);
+    }
+  }
+}
+
+} // namespace
+
+SQLite::Database OpenDatabase(const std::string& path) {
+  SQLite::Database database = OpenFile(path);
+  RequireTables(database, path);
+  return database;
+}
+
+SQLite::Database CopyDatabase(const std::string& path) {
+  SQLite::Database copy("", SQLite::OPEN_READWRITE | SQLite::OPEN_CREATE);
+  Distrust(copy);
+  {
+    SQLite::Database database = OpenFile(path);
+    CopyPages(database, copy);
+  }
+  RequireTables(copy, path);
+  return copy;
+}
+
+void Walk(SQLite::Database& copy, const std::function<void(const Item&)>& visit) {
+  // By the index on Folders.name; only the files of one folder are sorted at a time.
+  SQLite::Statement query(copy,
+                          "SELECT o.folder_id, o.name, f.name, o.volume, o.modified_date, "
+                          "f.modified_date, f.created_date FROM Folders o LEFT JOIN Files f "
+                          "ON f.folder_id = o.folder_id ORDER BY o.name, o.folder_id, f.name");
+  while (query.executeStep()) {
+    Item item{.folderId = query.getColumn(0).getInt64(),
+              .folder = query.getColumn(1).getString(),
+              .file = std::nullopt,
+              .volume = query.getColumn(3).getString(),
+              .folderModified = query.getColumn(4).getInt64(),
+              .modified = query.getColumn(5).getInt64(),
+              .created = query.getColumn(6).getInt64()};
+    if (!query.getColumn(2).isNull()) {
+      item.file = query.getColumn(2).getString();
+    }
+    visit(item);
+  }
+}
+
+bool IsDamage(const SQLite::Exception& error) {
+  const int code = error.getErrorCode() & 0xFF;
+  return code == SQLITE_CORRUPT || code == SQLITE_NOTADB;
+}
+
+bool IsLocked(const SQLite::Exception& error) {
+  const int code = error.getErrorCode() & 0xFF;
+  return code == SQLITE_BUSY || code == SQLITE_LOCKED ||
+         error.getExtendedErrorCode() == SQLITE_READONLY_ROLLBACK;
+}
+
+std::string Explain(const SQLite::Exception& error, const std::string& path) {
+  if (error.getExtendedErrorCode() == SQLITE_READONLY_ROLLBACK) {
+    return path +
+           " has a merge to take back that was interrupted; the daemon does so when it opens "
+           "the database, and this program only reads";
+  }
+  if (IsLocked(error)) {
+    return path + " is locked, as it is while a large merge is written; try again";
+  }
+  return path + ": " + error.what();
+}
+
+} // namespace orva::zophotos

@@ -1,0 +1,133 @@
+#include "Commands.h"
+#include "Json.h"
+#include "MergedDatabase.h"
+#include "Table.h"
+
+#include <SQLiteCpp/Statement.h>
+
+#include <algorithm>
+#include <map>
+
+namespace orva::zophotos {
+
+namespace {
+
+struct Volume {
+  bool isMerged = false; ///< has a row of statistics
+  std::int64_t transcoded = 0;
+  std::int64_t total = 0;
+  std::int64_t mergedUpTo = 0;
+  std::int64_t folders = 0;
+  std::int64_t files = 0;
+};
+
+using Volumes = std::map<std::string, Volume>;
+
+/// The daemon, too, reads only a volume's first row.
+void ReadStatistics(SQLite::Database& database, Volumes& volumes) {
+  SQLite::Statement query(database, "SELECT volume, photos_xcoded, photos_total, last_updated_time "
+                                    "FROM Statistics ORDER BY id");
+  while (query.executeStep()) {
+    Volume& volume = volumes[query.getColumn(0).getString()];
+    if (!volume.isMerged) {
+      volume.isMerged = true;
+      volume.transcoded = query.getColumn(1).getInt64();
+      volume.total = query.getColumn(2).getInt64();
+      volume.mergedUpTo = query.getColumn(3).getInt64();
+    }
+  }
+}
+
+Volumes ReadVolumes(SQLite::Database& database) {
+  Volumes volumes;
+  ReadStatistics(database, volumes);
+  // Folder 1 is the root, which belongs to none.
+  SQLite::Statement folders(
+      database, "SELECT volume, count(*) FROM Folders WHERE folder_id != 1 GROUP BY volume");
+  while (folders.executeStep()) {
+    volumes[folders.getColumn(0).getString()].folders = folders.getColumn(1).getInt64();
+  }
+  SQLite::Statement files(database, "SELECT volume, count(*) FROM Files GROUP BY volume");
+  while (files.executeStep()) {
+    volumes[files.getColumn(0).getString()].files = files.getColumn(1).getInt64();
+  }
+  return volumes;
+}
+
+/// "█████░░░░░  50 %"; a dash where there are no photos.
+std::string Progress(const Volume& volume) {
+  constexpr std::int64_t width = 10;
+  if (volume.total <= 0) {
+    return "-";
+  }
+  const double part = std::clamp(
+      static_cast<double>(volume.transcoded) / static_cast<double>(volume.total), 0.0, 1.0);
+  const auto filled = static_cast<std::int64_t>(part * width);
+  std::string bar;
+  for (std::int64_t i = 0; i < width; ++i) {
+    bar += i < filled ? "█" : "░";
+  }
+  // Rounded down: all is 100 %, and nothing else.
+  const std::string percent = std::to_string(static_cast<int>(part * 100));
+  return bar + std::string(4 - percent.size(), ' ') + percent + " %";
+}
+
+std::string MergedUpTo(const Volume& volume) {
+  return volume.isMerged && volume.mergedUpTo != 0 ? LocalTime(volume.mergedUpTo) : "-";
+}
+
+void PrintText(const std::string& path, const std::string& version, std::int64_t stamp,
+               const Volumes& volumes) {
+  std::cout << "Database  " << Printable(path) << "\nVersion   " << Printable(version)
+            << "\nStamped   " << LocalTime(stamp) << "\n\n";
+  Table table({{.heading = "VOLUME", .elastic = true},
+               {.heading = "TRANSCODED"},
+               {.heading = "PHOTOS", .right = true},
+               {.heading = "FOLDERS", .right = true},
+               {.heading = "FILES", .right = true},
+               {.heading = "MERGED UP TO"}});
+  for (const auto& [name, volume] : volumes) {
+    table.AddRow({Printable(name), Progress(volume),
+                  std::to_string(volume.transcoded) + "/" + std::to_string(volume.total),
+                  std::to_string(volume.folders), std::to_string(volume.files),
+                  MergedUpTo(volume)});
+  }
+  table.Print(std::cout, TerminalWidth());
+}
+
+void PrintJson(const std::string& path, const std::string& version, std::int64_t stamp,
+               const Volumes& volumes) {
+  Json list = Json::array();
+  for (const auto& [name, volume] : volumes) {
+    list.push_back(
+        {{"volume", ToUtf8(name)},
+         {"transcoded", volume.transcoded},
+         {"total", volume.total},
+         {"folders", volume.folders},
+         {"files", volume.files},
+         {"merged_up_to", volume.mergedUpTo == 0 ? Json() : JsonTime(volume.mergedUpTo)}});
+  }
+  PrintLine({{"database", ToUtf8(path)},
+             {"version", ToUtf8(version)},
+             {"stamped", JsonTime(stamp)},
+             {"volumes", std::move(list)}});
+}
+
+} // namespace
+
+ExitStatus ShowStatus(const std::string& path, Form form) {
+  // Counting reads every row.
+  SQLite::Database database = CopyDatabase(path);
+  std::string version;
+  std::int64_t stamp = 0;
+  SQLite::Statement status(database, "SELECT mc_version, mdate FROM Status WHERE id = 1");
+  if (status.executeStep()) {
+    version = status.getColumn(0).getString();
+    stamp = status.getColumn(1).getInt64();
+  }
+  const Volumes volumes = ReadVolumes(database);
+  (form == Form::Json ? PrintJson : PrintText)(path, version, stamp, volumes);
+  return ExitStatus::Success;
+}
+
+} // namespace orva::zophotos

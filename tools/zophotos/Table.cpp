@@ -1,0 +1,67 @@
+#include "Table.h"
+
+#include "Text.h"
+
+#include <algorithm>
+#include <numeric>
+#include <ostream>
+#include <utility>
+
+namespace orva::zophotos {
+
+namespace {
+
+constexpr std::size_t GAP = 2;
+/// What is left of an elastic column at least.
+constexpr std::size_t NARROWEST = 12;
+
+} // namespace
+
+Table::Table(std::vector<Column> columns) : columns_(std::move(columns)) {
+  std::vector<std::string> headings;
+  for (const Column& column : columns_) {
+    headings.push_back(column.heading);
+  }
+  AddRow(std::move(headings));
+}
+
+void Table::AddRow(std::vector<std::string> cells) {
+  rows_.push_back(std::move(cells));
+}
+
+std::vector<std::size_t> Table::Widths(std::optional<std::size_t> limit) const {
+  std::vector<std::size_t> widths(columns_.size());
+  for (const auto& row : rows_) {
+    for (std::size_t i = 0; i < widths.size(); ++i) {
+      widths[i] = std::max(widths[i], Width(row[i]));
+    }
+  }
+  const std::size_t total =
+      std::accumulate(widths.begin(), widths.end(), GAP * (widths.size() - 1));
+  std::size_t excess = limit && total > *limit ? total - *limit : 0;
+  for (std::size_t i = 0; i < widths.size(); ++i) {
+    if (columns_[i].elastic && widths[i] > NARROWEST) {
+      const std::size_t given = std::min(excess, widths[i] - NARROWEST);
+      widths[i] -= given;
+      excess -= given;
+    }
+  }
+  return widths;
+}
+
+void Table::Print(std::ostream& stream, std::optional<std::size_t> width) const {
+  const std::vector<std::size_t> widths = Widths(width);
+  for (const auto& row : rows_) {
+    std::string line;
+    for (std::size_t i = 0; i < widths.size(); ++i) {
+      const std::string cell = Shorten(row[i], widths[i]);
+      const std::string padding(widths[i] - Width(cell), ' ');
+      line += columns_[i].right ? padding + cell : cell + padding;
+      line.append(GAP, ' ');
+    }
+    line.erase(line.find_last_not_of(' ') + 1);
+    stream << line << '\n';
+  }
+}
+
+} // namespace orva::zophotos

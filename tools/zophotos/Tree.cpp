@@ -1,0 +1,128 @@
+#include "Commands.h"
+#include "Json.h"
+#include "MergedDatabase.h"
+
+#include <SQLiteCpp/Statement.h>
+
+#include <algorithm>
+#include <string_view>
+#include <vector>
+
+namespace orva::zophotos {
+
+namespace {
+
+struct StoredFolder {
+  std::string path;
+  std::int64_t files;
+};
+
+/// A line of the tree, by a path that belongs to the list of folders. Folders that are only part of
+/// other folders' paths have one, too.
+struct Node {
+  std::string_view path; ///< of the folder, or the beginning of another one
+  std::size_t depth;
+  std::int64_t files = 0;
+  bool isStored = false;
+  bool isLast = false; ///< of its siblings
+};
+
+/// Whether `a` comes before `b` in a tree, where all that is in a folder follows it.
+bool ComesBefore(const StoredFolder& a, const StoredFolder& b) {
+  const auto rank = [](char byte) { return byte == '/' ? -1 : static_cast<unsigned char>(byte); };
+  return std::lexicographical_compare(
+      a.path.begin(), a.path.end(), b.path.begin(), b.path.end(),
+      [&rank](char left, char right) { return rank(left) < rank(right); });
+}
+
+std::vector<StoredFolder> ReadFolders(const std::string& path, const std::string& top) {
+  SQLite::Database database = OpenDatabase(path);
+  SQLite::Statement query(database,
+                          "SELECT name, (SELECT count(*) FROM Files f WHERE f.folder_id = "
+                          "o.folder_id) FROM Folders o WHERE name >= ? AND name < ?");
+  query.bind(1, top);
+  query.bind(2, EndOfFolder(top));
+  std::vector<StoredFolder> folders;
+  while (query.executeStep()) {
+    folders.push_back({query.getColumn(0).getString(), query.getColumn(1).getInt64()});
+  }
+  std::sort(folders.begin(), folders.end(), ComesBefore);
+  return folders;
+}
+
+/// Adds the nodes for what `path` does not share with the open ones, and returns its own.
+Node& AddPath(std::vector<Node>& nodes, std::vector<std::string_view>& open, std::string_view path,
+              std::size_t topLength) {
+  while (!open.empty() && !path.starts_with(open.back())) {
+    open.pop_back();
+  }
+  while (open.empty() || open.back() != path) {
+    const std::size_t begin = open.empty() ? topLength - 1 : open.back().size();
+    const std::size_t end = path.find('/', begin);
+    open.push_back(path.substr(0, end == std::string_view::npos ? end : end + 1));
+    nodes.push_back({.path = open.back(), .depth = open.size() - 1});
+  }
+  return nodes.back();
+}
+
+std::vector<Node> MakeTree(const std::vector<StoredFolder>& folders, const std::string& top) {
+  std::vector<Node> nodes;
+  std::vector<std::string_view> open;
+  for (const StoredFolder& folder : folders) {
+    Node& node = AddPath(nodes, open, folder.path, top.size());
+    node.isStored = true;
+    node.files += folder.files;
+  }
+  // From the end, the first node of each depth that is met below a parent is its last child.
+  std::vector<bool> hasLast;
+  for (auto node = nodes.rbegin(); node != nodes.rend(); ++node) {
+    const bool known = node->depth < hasLast.size() && hasLast[node->depth];
+    node->isLast = !known;
+    hasLast.resize(node->depth + 1, false);
+    hasLast[node->depth] = true;
+  }
+  return nodes;
+}
+
+void PrintText(const std::vector<Node>& nodes) {
+  std::vector<std::string> indents; // of what is below the open nodes
+  for (const Node& node : nodes) {
+    indents.resize(node.depth);
+    if (node.depth == 0) {
+      std::cout << Printable(node.path);
+      indents.emplace_back();
+    } else {
+      const std::size_t parentLength = node.path.rfind('/', node.path.size() - 2) + 1;
+      for (const std::string& indent : indents) {
+        std::cout << indent;
+      }
+      std::cout << (node.isLast ? "└── " : "├── ") << Printable(node.path.substr(parentLength));
+      indents.emplace_back(node.isLast ? "    " : "│   ");
+    }
+    std::cout << (node.isStored ? "  " + Count(node.files, "file") : "  (not stored)") << '\n';
+  }
+}
+
+void PrintJson(const std::vector<Node>& nodes) {
+  for (const Node& node : nodes) {
+    PrintLine({{"path", ToUtf8(node.path)},
+               {"depth", node.depth},
+               {"files", node.files},
+               {"stored", node.isStored}});
+  }
+}
+
+} // namespace
+
+ExitStatus ShowTree(const std::string& path, const std::string& folder, Form form) {
+  const std::string top = FolderPath(folder);
+  const std::vector<StoredFolder> folders = ReadFolders(path, top);
+  const std::vector<Node> nodes = MakeTree(folders, top);
+  if (nodes.empty()) {
+    throw Failure(ExitStatus::Negative, "there is no folder " + Printable(top));
+  }
+  (form == Form::Json ? PrintJson : PrintText)(nodes);
+  return ExitStatus::Success;
+}
+
+} // namespace orva::zophotos

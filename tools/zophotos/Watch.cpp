@@ -1,0 +1,236 @@
+#include "Commands.h"
+#include "Json.h"
+#include "MergedDatabase.h"
+
+#include <SQLiteCpp/Exception.h>
+#include <SQLiteCpp/Statement.h>
+#include <SQLiteCpp/Transaction.h>
+
+#include <sys/stat.h>
+
+#include <chrono>
+#include <ctime>
+#include <map>
+#include <optional>
+#include <set>
+#include <thread>
+#include <tuple>
+#include <utility>
+
+namespace orva::zophotos {
+
+namespace {
+
+/// How long a change may go unseen.
+constexpr std::chrono::milliseconds INTERVAL(250);
+
+struct Progress {
+  std::int64_t transcoded = 0;
+  std::int64_t total = 0;
+  std::int64_t mergedUpTo = 0;
+
+  bool operator==(const Progress&) const = default;
+};
+
+/// Rows of one table. Ids only grow, so that those above an earlier greatest one are new.
+struct Rows {
+  std::int64_t count = 0;
+  std::int64_t greatestId = 0;
+};
+
+/// What two states of a database are compared by.
+struct State {
+  Rows folders;
+  Rows files;
+  std::map<std::string, Progress> volumes;
+};
+
+struct Difference {
+  std::int64_t added = 0;
+  std::int64_t removed = 0;
+};
+
+/// A file on disk, whatever its name.
+using FileIdentity = std::tuple<dev_t, ino_t>;
+
+std::int64_t Ask(SQLite::Database& database, const char* sql) {
+  return database.execAndGet(sql).getInt64();
+}
+
+State ReadState(SQLite::Database& database) {
+  State state;
+  state.folders = {Ask(database, "SELECT count(*) FROM Folders"),
+                   Ask(database, "SELECT ifnull(max(folder_id), 0) FROM Folders")};
+  state.files = {Ask(database, "SELECT count(*) FROM Files"),
+                 Ask(database, "SELECT ifnull(max(file_id), 0) FROM Files")};
+  SQLite::Statement query(database, "SELECT volume, photos_xcoded, photos_total, last_updated_time "
+                                    "FROM Statistics ORDER BY id DESC");
+  while (query.executeStep()) {
+    state.volumes[query.getColumn(0).getString()] = {query.getColumn(1).getInt64(),
+                                                     query.getColumn(2).getInt64(),
+                                                     query.getColumn(3).getInt64()};
+  }
+  return state;
+}
+
+/// Counts what `newRowsSql` says of the rows above `before`'s greatest id, by volume; the volumes
+/// go into `volumes`.
+Difference Compare(SQLite::Database& database, const char* newRowsSql, const Rows& before,
+                   const Rows& now, std::set<std::string>& volumes) {
+  Difference difference;
+  SQLite::Statement query(database, newRowsSql);
+  query.bind(1, before.greatestId);
+  while (query.executeStep()) {
+    volumes.insert(query.getColumn(0).getString());
+    difference.added += query.getColumn(1).getInt64();
+  }
+  difference.removed = before.count + difference.added - now.count;
+  return difference;
+}
+
+std::string Sign(const Difference& difference, const std::string& noun) {
+  std::string text;
+  if (difference.added != 0) {
+    text += " +" + Count(difference.added, noun);
+  }
+  if (difference.removed != 0) {
+    text += " -" + Count(difference.removed, noun);
+  }
+  return text;
+}
+
+class Watch {
+public:
+  Watch(const FindPath& findPath, Form form) : findPath_(findPath), form_(form) {}
+
+  /// Looks once, and prints what has changed since the last time.
+  void Look() {
+    try {
+      const std::string path = findPath_();
+      if (!database_ || path != path_ || Identify(path) != identity_) {
+        Open(path);
+      } else if (Version() != version_) {
+        PrintChange();
+      }
+    } catch (const Failure& failure) {
+      Lose(failure.what());
+    } catch (const SQLite::Exception& error) {
+      // A lock is no news: the next look will see what it was held for.
+      if (!IsLocked(error)) {
+        Lose(Explain(error, path_));
+      }
+    }
+    std::cout << std::flush;
+  }
+
+private:
+  static std::optional<FileIdentity> Identify(const std::string& path) {
+    struct stat status {};
+    if (stat(path.c_str(), &status) != 0) {
+      return std::nullopt;
+    }
+    return FileIdentity(status.st_dev, status.st_ino);
+  }
+
+  std::int64_t Version() { return Ask(*database_, "PRAGMA data_version"); }
+
+  void Open(const std::string& path) {
+    path_ = path;
+    database_.reset();
+    identity_ = Identify(path);
+    database_.emplace(OpenDatabase(path));
+    {
+      const SQLite::Transaction oneState(*database_);
+      state_ = ReadState(*database_);
+      version_ = Version();
+    }
+    loss_.clear();
+    Print("opened",
+          "watching " + Printable(path) + ": " + Count(state_.folders.count, "folder") + ", " +
+              Count(state_.files.count, "file"),
+          {{"database", ToUtf8(path)},
+           {"folders", state_.folders.count},
+           {"files", state_.files.count}});
+  }
+
+  /// Tells once why nothing can be seen.
+  void Lose(const std::string& reason) {
+    database_.reset();
+    if (reason != loss_) {
+      loss_ = reason;
+      Print("lost", Printable(reason), {{"reason", ToUtf8(reason)}});
+    }
+  }
+
+  void PrintChange() {
+    std::set<std::string> changed;
+    Difference folders;
+    Difference files;
+    {
+      const SQLite::Transaction oneState(*database_);
+      State now = ReadState(*database_);
+      version_ = Version();
+      folders = Compare(*database_,
+                        "SELECT volume, count(*) FROM Folders WHERE folder_id > ? GROUP BY volume",
+                        state_.folders, now.folders, changed);
+      files = Compare(*database_,
+                      "SELECT volume, count(*) FROM Files WHERE file_id > ? GROUP BY volume",
+                      state_.files, now.files, changed);
+      for (const auto& [volume, progress] : now.volumes) {
+        const auto before = state_.volumes.find(volume);
+        if (before == state_.volumes.end() || before->second != progress) {
+          changed.insert(volume);
+        }
+      }
+      state_ = std::move(now);
+    }
+    std::string text = Sign(folders, "folder") + Sign(files, "file");
+    Json volumes = Json::array();
+    for (const std::string& volume : changed) {
+      const Progress progress = state_.volumes[volume];
+      text += "; " + Printable(volume) + " " + std::to_string(progress.transcoded) + " of " +
+              Count(progress.total, "photo") + " transcoded";
+      volumes.push_back({{"volume", ToUtf8(volume)},
+                         {"transcoded", progress.transcoded},
+                         {"total", progress.total}});
+    }
+    Print("changed",
+          text.empty() ? "written, nothing added or removed" : text.substr(text[0] == ' ' ? 1 : 2),
+          {{"folders_added", folders.added},
+           {"folders_removed", folders.removed},
+           {"files_added", files.added},
+           {"files_removed", files.removed},
+           {"volumes", std::move(volumes)}});
+  }
+
+  void Print(const char* event, const std::string& text, const Json& details) const {
+    const std::time_t now = std::time(nullptr);
+    if (form_ == Form::Json) {
+      Json line{{"time", JsonTime(now)}, {"event", event}};
+      line.update(details);
+      PrintLine(line);
+    } else {
+      std::cout << LocalTime(now) << "  " << text << '\n';
+    }
+  }
+
+  const FindPath& findPath_;
+  Form form_;
+  std::string path_;
+  std::optional<FileIdentity> identity_;
+  std::optional<SQLite::Database> database_; ///< nothing while there is none
+  std::int64_t version_ = 0;
+  State state_;
+  std::string loss_; ///< the reason that was printed last, until there is a database again
+};
+
+} // namespace
+
+void WatchDatabase(const FindPath& findPath, Form form) {
+  for (Watch watch(findPath, form);;) {
+    watch.Look();
+    std::this_thread::sleep_for(INTERVAL);
+  }
+}
+
+} // namespace orva::zophotos
