@@ -54,17 +54,16 @@ Volumes ReadVolumes(SQLite::Database& database) {
   return volumes;
 }
 
-/// "█████░░░░░  50 %"; a dash where there are no photos.
-std::string Progress(const Volume& volume) {
-  constexpr std::int64_t width = 10;
+/// "█████░░░░░  50 %" with a bar of `width` columns; a dash where there are no photos.
+std::string Progress(const Volume& volume, int width) {
   if (volume.total <= 0) {
     return "-";
   }
   const double part = std::clamp(
       static_cast<double>(volume.transcoded) / static_cast<double>(volume.total), 0.0, 1.0);
-  const auto filled = static_cast<std::int64_t>(part * width);
+  const auto filled = static_cast<int>(part * width);
   std::string bar;
-  for (std::int64_t i = 0; i < width; ++i) {
+  for (int i = 0; i < width; ++i) {
     bar += i < filled ? "█" : "░";
   }
   // Rounded down: all is 100 %, and nothing else.
@@ -76,10 +75,7 @@ std::string MergedUpTo(const Volume& volume) {
   return volume.isMerged && volume.mergedUpTo != 0 ? LocalTime(volume.mergedUpTo) : "-";
 }
 
-void PrintText(const std::string& path, const std::string& version, std::int64_t stamp,
-               const Volumes& volumes) {
-  std::cout << "Database  " << Printable(path) << "\nVersion   " << Printable(version)
-            << "\nStamped   " << LocalTime(stamp) << "\n\n";
+Table MakeTable(const Volumes& volumes, int barWidth) {
   Table table({{.heading = "VOLUME", .elastic = true},
                {.heading = "TRANSCODED"},
                {.heading = "PHOTOS", .right = true},
@@ -87,12 +83,27 @@ void PrintText(const std::string& path, const std::string& version, std::int64_t
                {.heading = "FILES", .right = true},
                {.heading = "MERGED UP TO"}});
   for (const auto& [name, volume] : volumes) {
-    table.AddRow({Printable(name), Progress(volume),
+    table.AddRow({Printable(name), Progress(volume, barWidth),
                   std::to_string(volume.transcoded) + "/" + std::to_string(volume.total),
                   std::to_string(volume.folders), std::to_string(volume.files),
                   MergedUpTo(volume)});
   }
-  table.Print(std::cout, TerminalWidth());
+  return table;
+}
+
+void PrintText(const std::string& path, const std::string& version, std::int64_t stamp,
+               const Volumes& volumes) {
+  std::cout << "Database  " << Printable(path) << "\nVersion   " << Printable(version)
+            << "\nStamped   " << LocalTime(stamp) << "\n\n";
+  if (volumes.empty()) {
+    std::cout << "No volume has been merged yet.\n";
+    return;
+  }
+  const auto width = TerminalWidth();
+  // Where the terminal is narrow, the figures are worth more than the bars.
+  const Table table = MakeTable(volumes, 10);
+  const bool fits = !width || table.NarrowestWidth() <= *width;
+  (fits ? table : MakeTable(volumes, 0)).Print(std::cout, width);
 }
 
 void PrintJson(const std::string& path, const std::string& version, std::int64_t stamp,

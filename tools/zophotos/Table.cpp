@@ -15,6 +15,10 @@ constexpr std::size_t GAP = 2;
 /// What is left of an elastic column at least.
 constexpr std::size_t NARROWEST = 12;
 
+std::size_t Total(const std::vector<std::size_t>& widths) {
+  return std::accumulate(widths.begin(), widths.end(), GAP * (widths.size() - 1));
+}
+
 } // namespace
 
 Table::Table(std::vector<Column> columns) : columns_(std::move(columns)) {
@@ -29,16 +33,15 @@ void Table::AddRow(std::vector<std::string> cells) {
   rows_.push_back(std::move(cells));
 }
 
-std::vector<std::size_t> Table::Widths(std::optional<std::size_t> limit) const {
+std::vector<std::size_t> Table::Widths(std::size_t limit) const {
   std::vector<std::size_t> widths(columns_.size());
   for (const auto& row : rows_) {
     for (std::size_t i = 0; i < widths.size(); ++i) {
       widths[i] = std::max(widths[i], Width(row[i]));
     }
   }
-  const std::size_t total =
-      std::accumulate(widths.begin(), widths.end(), GAP * (widths.size() - 1));
-  std::size_t excess = limit && total > *limit ? total - *limit : 0;
+  const std::size_t total = Total(widths);
+  std::size_t excess = total - std::min(total, limit);
   for (std::size_t i = 0; i < widths.size(); ++i) {
     if (columns_[i].elastic && widths[i] > NARROWEST) {
       const std::size_t given = std::min(excess, widths[i] - NARROWEST);
@@ -49,8 +52,13 @@ std::vector<std::size_t> Table::Widths(std::optional<std::size_t> limit) const {
   return widths;
 }
 
+std::size_t Table::NarrowestWidth() const {
+  return Total(Widths(0));
+}
+
 void Table::Print(std::ostream& stream, std::optional<std::size_t> width) const {
-  const std::vector<std::size_t> widths = Widths(width);
+  const std::size_t limit = width.value_or(std::string::npos);
+  const std::vector<std::size_t> widths = Widths(limit);
   for (const auto& row : rows_) {
     std::string line;
     for (std::size_t i = 0; i < widths.size(); ++i) {
@@ -60,7 +68,7 @@ void Table::Print(std::ostream& stream, std::optional<std::size_t> width) const 
       line.append(GAP, ' ');
     }
     line.erase(line.find_last_not_of(' ') + 1);
-    stream << line << '\n';
+    stream << Head(line, limit) << '\n';
   }
 }
 

@@ -49,23 +49,7 @@ std::size_t CharacterWidth(utf::code_point point) {
   return width < 0 ? 0 : static_cast<std::size_t>(width);
 }
 
-/// The first characters of `printable` that fit into `width` columns.
-std::string_view Head(std::string_view printable, std::size_t width) {
-  std::size_t columns = 0;
-  std::size_t length = 0;
-  bool full = false;
-  ForEachCharacter(
-      printable,
-      [&](utf::code_point point, std::string_view bytes) {
-        columns += CharacterWidth(point);
-        full = full || columns > width;
-        length += full ? 0 : bytes.size();
-      },
-      [](char) {});
-  return printable.substr(0, length);
-}
-
-/// The last ones that do.
+/// The last characters that fit into `width` columns.
 std::string_view Tail(std::string_view printable, std::size_t width) {
   std::size_t excess = Width(printable);
   std::size_t begin = 0;
@@ -131,6 +115,21 @@ std::size_t Width(std::string_view printable) {
       printable, [&](utf::code_point point, std::string_view) { columns += CharacterWidth(point); },
       [](char) {});
   return columns;
+}
+
+std::string_view Head(std::string_view printable, std::size_t width) {
+  std::size_t columns = 0;
+  std::size_t length = 0;
+  bool full = false;
+  ForEachCharacter(
+      printable,
+      [&](utf::code_point point, std::string_view bytes) {
+        columns += CharacterWidth(point);
+        full = full || columns > width;
+        length += full ? 0 : bytes.size();
+      },
+      [](char) {});
+  return printable.substr(0, length);
 }
 
 std::string Shorten(const std::string& printable, std::size_t width) {

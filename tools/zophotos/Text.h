@@ -18,6 +18,9 @@ std::string Printable(std::string_view bytes);
 /// Columns that a printable text takes on a terminal.
 std::size_t Width(std::string_view printable);
 
+/// The first characters of a printable text that fit into `width` columns.
+std::string_view Head(std::string_view printable, std::size_t width);
+
 /// A printable text in no more than `width` columns, its middle left out where it is longer.
 std::string Shorten(const std::string& printable, std::size_t width);
 

@@ -91,9 +91,13 @@ private:
                      "wildcards, a part of it")
         ->required();
     find_->add_flag("-i,--ignore-case", search_.ignoreCase, "Take A for a");
-    CLI::Option* const null = find_->add_flag("-0,--null", search_.nullTerminated,
-                                              "Print paths as they are, each with a NUL behind it");
-    null->excludes(app_.get_option("--json"));
+    find_->add_flag("-0,--null", search_.nullTerminated,
+                    "Print paths as they are, each with a NUL behind it");
+    find_->callback([this] {
+      if (search_.nullTerminated && json_) {
+        throw CLI::ValidationError("find", "takes one of --null and --json");
+      }
+    });
     check_ = app_.add_subcommand("check", "What is wrong with the database");
     watch_ = app_.add_subcommand("watch", "A line for each change, until interrupted");
     AddExport();
