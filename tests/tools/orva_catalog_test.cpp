@@ -14,12 +14,13 @@
 #include "orvautil/Core.h"
 #include "orvautil/Exception.h"
 
+#include "support/Program.h"
+
 #include <gtest/gtest.h>
 
 #include <fcntl.h>
 #include <sys/mount.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <array>
@@ -37,6 +38,7 @@ namespace {
 using namespace orva;
 using catalog::ForEachRow;
 using catalog::SelectNumber;
+using test::Outcome;
 using Lines = std::vector<std::string>;
 namespace fs = std::filesystem;
 
@@ -114,23 +116,12 @@ protected:
     return lines;
   }
 
-  struct Outcome {
-    int status;
-    std::string output;
-  };
   /// Runs the program with both outputs in `output`; `arguments` go through the shell.
   static Outcome RunProgram(const std::string& arguments) {
     return RunShell(std::string(ORVA_CATALOG_PROGRAM) + ' ' + arguments + " 2>&1");
   }
   static Outcome RunShell(const std::string& command) {
-    std::unique_ptr<FILE, int (*)(FILE*)> pipe(popen(command.c_str(), "r"), pclose);
-    Outcome outcome;
-    std::array<char, 4096> buffer{};
-    while (const std::size_t size = fread(buffer.data(), 1, buffer.size(), pipe.get())) {
-      outcome.output.append(buffer.data(), size);
-    }
-    outcome.status = WEXITSTATUS(pclose(pipe.release()));
-    return outcome;
+    return test::Run({"/bin/sh", "-c", command});
   }
 
   fs::path base_;

@@ -8,15 +8,14 @@
 #include "orvautil/Core.h"
 #include "orvautil/Decodestring.h"
 
+#include "support/Program.h"
+#include "system/Deadline.h"
+
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include <fcntl.h>
 #include <poll.h>
 #include <sys/mount.h>
-#include <sys/prctl.h>
-#include <sys/syscall.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -39,14 +38,13 @@ namespace {
 using namespace orva;
 using namespace orva::notify;
 using core::ORVA_NOTIFICATION_SOCKET;
+using test::DEADLINE;
+using test::Program;
 using testing::ElementsAre;
 using testing::HasSubstr;
 using testing::Pair;
 using Arguments = std::vector<std::string>;
 using Clock = std::chrono::steady_clock;
-
-// Only a broken service makes a test wait this long.
-constexpr std::chrono::seconds DEADLINE{60};
 
 /// Waits for `descriptor` to be readable; false when the deadline has passed.
 bool IsReadable(int descriptor, Clock::time_point deadline) {
@@ -54,99 +52,6 @@ bool IsReadable(int descriptor, Clock::time_point deadline) {
   pollfd ready{.fd = descriptor, .events = POLLIN, .revents = 0};
   return poll(&ready, 1, static_cast<int>(std::max<long>(left.count(), 0))) == 1;
 }
-
-/// The real program, started with its two outputs in one pipe; killed at the end.
-class Program {
-public:
-  explicit Program(const Arguments& arguments, const std::string& input = "/dev/null") {
-    std::array<int, 2> ends{};
-    if (pipe2(ends.data(), O_CLOEXEC) != 0) {
-      throw std::system_error(errno, std::generic_category(), "pipe2");
-    }
-    pid_ = fork();
-    if (pid_ == 0) {
-      Execute(arguments, input, ends[1]);
-    }
-    close(ends[1]);
-    output_ = ends[0];
-  }
-  Program(const Program&) = delete;
-  Program& operator=(const Program&) = delete;
-  ~Program() {
-    CloseOutput();
-    if (pid_ != -1) {
-      kill(pid_, SIGKILL);
-      waitpid(pid_, nullptr, 0);
-    }
-  }
-
-  void Signal(int signal) const { kill(pid_, signal); }
-
-  void CloseOutput() {
-    if (output_ != -1) {
-      close(output_);
-      output_ = -1;
-    }
-  }
-
-  /// The next line that the program prints; "(end)" at the end, "(deadline)" when none comes.
-  std::string ReadLine() const {
-    const auto deadline = Clock::now() + DEADLINE;
-    std::string line;
-    char next = 0;
-    while (IsReadable(output_, deadline)) {
-      if (read(output_, &next, 1) != 1) {
-        return line.empty() ? "(end)" : line;
-      }
-      if (next == '\n') {
-        return line;
-      }
-      line += next;
-    }
-    return "(deadline)";
-  }
-
-  /// Reads lines up to the first that contains `text`, which it returns, or the last one.
-  std::string ReadLineWith(const std::string& text) const {
-    std::string line = ReadLine();
-    while (line.find(text) == std::string::npos && line != "(end)" && line != "(deadline)") {
-      line = ReadLine();
-    }
-    return line;
-  }
-
-  /// The exit status; -1 when it does not end by itself.
-  int WaitForEnd() {
-    const int handle = static_cast<int>(syscall(SYS_pidfd_open, pid_, 0));
-    const bool hasEnded = IsReadable(handle, Clock::now() + DEADLINE);
-    close(handle);
-    int status = -1;
-    if (!hasEnded || waitpid(pid_, &status, 0) != pid_) {
-      return -1;
-    }
-    pid_ = -1;
-    return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
-  }
-
-private:
-  [[noreturn]] static void Execute(const Arguments& arguments, const std::string& input,
-                                   int output) {
-    prctl(PR_SET_PDEATHSIG, SIGKILL);
-    dup2(open(input.c_str(), O_RDONLY | O_CLOEXEC), STDIN_FILENO);
-    dup2(output, STDOUT_FILENO);
-    dup2(output, STDERR_FILENO);
-    std::vector<char*> pointers;
-    for (const auto& argument : arguments) {
-      pointers.push_back(const_cast<char*>(argument.c_str())); // execv writes nothing
-    }
-    pointers.push_back(nullptr);
-    execv(pointers.front(), pointers.data());
-    _exit(127);
-  }
-
-  pid_t pid_ = -1;
-  int output_ = -1;
-};
 
 Arguments Notify(Arguments arguments) {
   arguments.insert(arguments.begin(), ORVA_NOTIFY_PROGRAM);
@@ -160,7 +65,7 @@ struct Outcome {
 };
 
 Outcome RunNotify(const Arguments& arguments, const std::string& input = "/dev/null") {
-  Program program(Notify(arguments), input);
+  Program program(Notify(arguments), {.input = input});
   const std::string line = program.ReadLine();
   return {program.WaitForEnd(), line};
 }
@@ -503,7 +408,7 @@ TEST_F(OrvaNotify, StopsCleanlyOnBothSignals) {
 TEST_F(OrvaNotify, TakesThePlaceOfAServiceThatWasKilled) {
   Serve();
   service_->Signal(SIGKILL);
-  EXPECT_EQ(service_->WaitForEnd(), -1);
+  EXPECT_EQ(service_->WaitForEnd(), 128 + SIGKILL);
   ASSERT_TRUE(std::filesystem::exists(ORVA_NOTIFICATION_SOCKET));
   Serve();
   EXPECT_TRUE(Listener().IsConnected());
