@@ -59,15 +59,19 @@ std::string Progress(const Volume& volume, int width) {
   if (volume.total <= 0) {
     return "-";
   }
-  const double part = std::clamp(
-      static_cast<double>(volume.transcoded) / static_cast<double>(volume.total), 0.0, 1.0);
-  const auto filled = static_cast<int>(part * width);
+  const auto done =
+      static_cast<double>(std::clamp<std::int64_t>(volume.transcoded, 0, volume.total));
+  // Multiplied first: 29 of 100 as a fraction is a little less than 0.29.
+  const auto part = [&](int whole) {
+    return static_cast<int>(done * whole / static_cast<double>(volume.total));
+  };
+  const int filled = part(width);
   std::string bar;
   for (int i = 0; i < width; ++i) {
     bar += i < filled ? "█" : "░";
   }
   // Rounded down: all is 100 %, and nothing else.
-  const std::string percent = std::to_string(static_cast<int>(part * 100));
+  const std::string percent = std::to_string(part(100));
   return bar + std::string(4 - percent.size(), ' ') + percent + " %";
 }
 
