@@ -18,7 +18,7 @@ public:
       : pattern_(pattern.find_first_of("*?[\\") == std::string::npos ? "*" + pattern + "*"
                                                                      : pattern),
         wholePath_(pattern.find('/') != std::string::npos), flags_(ignoreCase ? FNM_CASEFOLD : 0) {
-    static_cast<void>(Width("")); // lets fnmatch know UTF-8
+    UseUtf8(); // for fnmatch
   }
 
   /// `path` is that of a file, or of a folder without its last separator.

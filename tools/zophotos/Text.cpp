@@ -20,12 +20,6 @@ namespace {
 
 namespace utf = boost::locale::utf;
 
-/// Knows all characters, whatever the user's locale does.
-void UseUtf8() {
-  static const char* const locale = std::setlocale(LC_CTYPE, "C.UTF-8");
-  static_cast<void>(locale);
-}
-
 /// Calls `onCharacter` with each code point and its bytes, and `onByte` with each byte that is part
 /// of none.
 void ForEachCharacter(std::string_view bytes,
@@ -71,6 +65,11 @@ std::string Format(const char* format, const std::tm& time) {
 }
 
 } // namespace
+
+void UseUtf8() {
+  static const char* const locale = std::setlocale(LC_CTYPE, "C.UTF-8");
+  static_cast<void>(locale);
+}
 
 std::string ToUtf8(std::string_view bytes) {
   constexpr const char* replacement = "\uFFFD";

@@ -8,6 +8,9 @@
 
 namespace orva::zophotos {
 
+/// Lets the C library know all characters, whatever the locale of the user does.
+void UseUtf8();
+
 /// `bytes` for programs: what is not UTF-8, and NUL, becomes U+FFFD.
 std::string ToUtf8(std::string_view bytes);
 
