@@ -1,0 +1,11 @@
+# Tests of tools/zophotos: the real program on databases that the real daemon made.
+add_private_root_test(zophotos_test
+  SOURCES
+    ${CMAKE_SOURCE_DIR}/tests/hostile/CraftedDatabase.cpp
+    ${CMAKE_SOURCE_DIR}/tests/hostile/CraftedLog.cpp
+    ${CMAKE_CURRENT_LIST_DIR}/ZophotosTest.cpp
+    ${CMAKE_CURRENT_LIST_DIR}/zophotos_test.cpp
+  LIBS appliance test_program
+  LABELS system)
+target_compile_definitions(zophotos_test PRIVATE ZOPHOTOS="$<TARGET_FILE:zophotos>")
+add_dependencies(zophotos_test zophotos)

@@ -1,0 +1,410 @@
+// What the inspector prints of a sound database.
+
+#include "ZophotosTest.h"
+
+#include <filesystem>
+#include <fstream>
+
+namespace orva::test {
+namespace {
+
+using ::testing::AllOf;
+using ::testing::HasSubstr;
+using ::testing::Not;
+using ::testing::StartsWith;
+
+class ZophotosStatus : public ZophotosTest {};
+class ZophotosList : public ZophotosTest {};
+class ZophotosTree : public ZophotosTest {};
+class ZophotosFind : public ZophotosTest {};
+class ZophotosExport : public ZophotosTest {};
+
+/// The command went well and printed this.
+void ExpectOutput(const Outcome& outcome, const std::string& output) {
+  EXPECT_EQ(0, outcome.status);
+  EXPECT_EQ(output, outcome.output);
+  EXPECT_EQ("", outcome.error);
+}
+
+/// The command found nothing, and said so.
+void ExpectNothing(const Outcome& outcome, const std::string& error) {
+  EXPECT_EQ(1, outcome.status);
+  EXPECT_EQ("", outcome.output);
+  EXPECT_EQ(error, outcome.error);
+}
+
+/// Adds a folder to a copy of the merged database, and a file into it unless that is empty. The
+/// texts are SQL expressions.
+void AddRows(const Database& copy, const std::string& folder, const std::string& file = "") {
+  copy.Run("INSERT INTO Folders(parent_folder_id, name, modified_date, volume) VALUES(1, " +
+           folder + ", 0, '/shares/A/')");
+  if (!file.empty()) {
+    copy.Run("INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT "
+             "max(folder_id), " +
+             file + ", 5, '/shares/A/', 6 FROM Folders");
+  }
+}
+
+TEST_F(ZophotosStatus, ShowsHowFarEachVolumeIs) {
+  ExpectOutput(Zophotos({"status"}),
+               "Database  /shares/A//.zophotos/zophotos.db\n"
+               "Version   2.0\n"
+               "Stamped   1970-01-01 00:16:40\n"
+               "\n"
+               "VOLUME      TRANSCODED        PHOTOS  FOLDERS  FILES  MERGED UP TO\n"
+               "/shares/A/  ██████████ 100 %     3/3        3      3  1970-01-01 00:33:22\n"
+               "/shares/B/  ███░░░░░░░  33 %     1/3        2      1  1970-01-01 00:33:23\n"
+               "/shares/C/  -                    0/0        1      0  -\n"
+               "/shares/D/  ░░░░░░░░░░   0 %     0/1        1      0  -\n");
+}
+
+TEST_F(ZophotosStatus, IsOneObjectInJson) {
+  ExpectOutput(
+      Zophotos({"status", "--json"}),
+      R"({"database":"/shares/A//.zophotos/zophotos.db","version":"2.0",)"
+      R"("stamped":"1970-01-01T00:16:40Z","volumes":[)"
+      R"({"volume":"/shares/A/","transcoded":3,"total":3,"folders":3,"files":3,"merged_up_to":"1970-01-01T00:33:22Z"},)"
+      R"({"volume":"/shares/B/","transcoded":1,"total":3,"folders":2,"files":1,"merged_up_to":"1970-01-01T00:33:23Z"},)"
+      R"({"volume":"/shares/C/","transcoded":0,"total":0,"folders":1,"files":0,"merged_up_to":null},)"
+      R"({"volume":"/shares/D/","transcoded":0,"total":1,"folders":1,"files":0,"merged_up_to":null}]})"
+      "\n");
+}
+
+TEST_F(ZophotosStatus, SaysWhenNoVolumeHasBeenMerged) {
+  const Database copy = Copy();
+  copy.Run("DELETE FROM Statistics");
+  copy.Run("DELETE FROM Files");
+  copy.Run("DELETE FROM Folders WHERE folder_id != 1");
+  ExpectOutput(OnCopy({"status"}), "Database  " + COPY +
+                                       "\nVersion   2.0\nStamped   1970-01-01 00:16:40\n\n"
+                                       "No volume has been merged yet.\n");
+  EXPECT_THAT(OnCopy({"--json", "status"}).output, HasSubstr(R"("volumes":[])"));
+}
+
+TEST_F(ZophotosStatus, RoundsPercentagesDownAndNoFurther) {
+  const Database copy = Copy();
+  for (const auto& [transcoded, total, percent] :
+       std::vector<std::tuple<std::string, std::string, std::string>>{
+           {"29", "100", "██░░░░░░░░  29 %"},
+           {"57", "100", "█████░░░░░  57 %"},
+           {"7", "10", "███████░░░  70 %"},
+           {"9999999", "10000000", "█████████░  99 %"},
+           {"1", "10000000", "░░░░░░░░░░   0 %"},
+           {"12", "10", "██████████ 100 %"}}) {
+    copy.Run("UPDATE Statistics SET photos_xcoded = ?, photos_total = ?", {transcoded, total});
+    EXPECT_THAT(OnCopy({"status"}).output, HasSubstr("/shares/A/  " + percent + "  "))
+        << transcoded << " of " << total;
+  }
+}
+
+TEST_F(ZophotosStatus, ShowsWhatAnUnpluggedVolumeLeaves) {
+  appliance.Handle(Unplugged(b.Path()));
+  EXPECT_THAT(Zophotos({"status"}).output,
+              HasSubstr("/shares/B/  ███░░░░░░░  33 %     1/3        0      0  -\n"));
+}
+
+TEST_F(ZophotosStatus, TimesInTextAreLocal) {
+  setenv("TZ", "UTC-9", 1);
+  EXPECT_THAT(Zophotos({"status"}).output, HasSubstr("Stamped   1970-01-01 09:16:40\n"));
+  EXPECT_THAT(Zophotos({"status", "--json"}).output,
+              HasSubstr(R"("stamped":"1970-01-01T00:16:40Z")"));
+}
+
+TEST_F(ZophotosStatus, ReadsTheDatabaseThatItIsGiven) {
+  const Database copy = Copy();
+  copy.Run("UPDATE Status SET mc_version = '7.5'");
+  std::filesystem::remove("/tmp/zophotodbmerger.conf");
+  for (const Arguments& arguments :
+       {Arguments{"--database", COPY, "status"}, Arguments{"status", "--database=" + COPY}}) {
+    const Outcome outcome = Zophotos(arguments);
+    EXPECT_EQ(0, outcome.status);
+    EXPECT_THAT(outcome.output, StartsWith("Database  " + COPY + "\nVersion   7.5\n"));
+  }
+  std::ofstream("/tmp/zophotodbmerger.conf") << "zophotos_db_path=" << MERGED << '\n';
+}
+
+TEST_F(ZophotosList, BeginsAtTheSharesRoot) {
+  ExpectOutput(Zophotos({"ls"}), "A/\nB/\nC/\nD/\n");
+}
+
+TEST_F(ZophotosList, ShowsFoldersBeforeFiles) {
+  ExpectOutput(Zophotos({"ls", "A"}), "Pictures/\ntop.jpg\n");
+}
+
+TEST_F(ZophotosList, TakesAFolderInAnyForm) {
+  for (const char* const folder :
+       {"A/Pictures", "A/Pictures/", "/shares/A/Pictures", "/shares/A/Pictures/"}) {
+    ExpectOutput(Zophotos({"ls", folder}), "Summer/\nb.jpg\n");
+  }
+}
+
+TEST_F(ZophotosList, AddsTimesNumbersAndVolumesToALongList) {
+  ExpectOutput(Zophotos({"ls", "-l", "A/Pictures"}),
+               "MODIFIED             FILES  VOLUME      NAME\n"
+               "1970-01-01 00:10:00      1  /shares/A/  Summer/\n"
+               "1970-01-01 00:16:41         /shares/A/  b.jpg\n");
+  EXPECT_THAT(Zophotos({"ls", "--long"}).output,
+              HasSubstr("1970-01-01 00:00:00      0  /shares/B/  B/\n"));
+}
+
+TEST_F(ZophotosList, IsAnObjectALineInJson) {
+  const std::string lines =
+      R"({"type":"folder","path":"/shares/A/Pictures/Summer/","volume":"/shares/A/","modified":"1970-01-01T00:10:00Z","files":1,"stored":true})"
+      "\n"
+      R"({"type":"file","path":"/shares/A/Pictures/b.jpg","volume":"/shares/A/","modified":"1970-01-01T00:16:41Z"})"
+      "\n";
+  ExpectOutput(Zophotos({"ls", "A/Pictures", "--json"}), lines);
+  ExpectOutput(Zophotos({"ls", "-l", "A/Pictures", "--json"}), lines);
+}
+
+TEST_F(ZophotosList, SaysThatAFolderIsNotThere) {
+  ExpectNothing(Zophotos({"ls", "A/Pict"}), "zophotos: there is no folder /shares/A/Pict/\n");
+  ExpectNothing(Zophotos({"ls", "/elsewhere"}), "zophotos: there is no folder /elsewhere/\n");
+}
+
+TEST_F(ZophotosList, ShowsAnEmptyFolderAsEmpty) {
+  ExpectOutput(Zophotos({"ls", "C"}), "");
+  ExpectOutput(Zophotos({"ls", "C", "--json"}), "");
+}
+
+/// The daemon removes a folder whose subfolder stays.
+class ZophotosRemovedFolder : public ZophotosTest {
+protected:
+  void SetUp() override {
+    ZophotosTest::SetUp();
+    onA.DeletePhoto("Pictures/b.jpg", 2005);
+    onA.DeleteFolder("Pictures/");
+    Merge(a);
+  }
+};
+
+TEST_F(ZophotosRemovedFolder, IsListedAsNotStored) {
+  ExpectOutput(
+      Zophotos({"ls", "A", "--json"}),
+      R"({"type":"folder","path":"/shares/A/Pictures/","volume":null,"modified":null,"files":0,"stored":false})"
+      "\n"
+      R"({"type":"file","path":"/shares/A/top.jpg","volume":"/shares/A/","modified":"1970-01-01T00:16:40Z"})"
+      "\n");
+  EXPECT_THAT(Zophotos({"ls", "-l", "A"}).output,
+              HasSubstr("-                        0              Pictures/\n"));
+}
+
+TEST_F(ZophotosRemovedFolder, CanBeLookedInto) {
+  ExpectOutput(Zophotos({"ls", "A/Pictures"}), "Summer/\n");
+}
+
+TEST_F(ZophotosRemovedFolder, StandsInTheTree) {
+  ExpectOutput(Zophotos({"tree", "A"}), "/shares/A/  1 file\n"
+                                        "└── Pictures/  (not stored)\n"
+                                        "    └── Summer/  1 file\n");
+  ExpectOutput(Zophotos({"tree", "A/Pictures"}), "/shares/A/Pictures/  (not stored)\n"
+                                                 "└── Summer/  1 file\n");
+}
+
+TEST_F(ZophotosRemovedFolder, LeavesNoDamage) {
+  ExpectOutput(Zophotos({"check"}), MERGED + " is sound\n"
+                                             "Expected leftovers, no damage:\n"
+                                             "  1 folders whose parent folder was removed\n"
+                                             "    /shares/A/Pictures/Summer/\n");
+}
+
+TEST_F(ZophotosTree, ShowsAllFoldersWithTheirFiles) {
+  ExpectOutput(Zophotos({"tree"}), "/shares/  0 files\n"
+                                   "├── A/  1 file\n"
+                                   "│   └── Pictures/  1 file\n"
+                                   "│       └── Summer/  1 file\n"
+                                   "├── B/  0 files\n"
+                                   "│   └── Old/  1 file\n"
+                                   "├── C/  0 files\n"
+                                   "└── D/  0 files\n");
+}
+
+TEST_F(ZophotosTree, IsAnObjectALineInJson) {
+  ExpectOutput(Zophotos({"--json", "tree", "/shares/A"}),
+               R"({"path":"/shares/A/","depth":0,"files":1,"stored":true})"
+               "\n"
+               R"({"path":"/shares/A/Pictures/","depth":1,"files":1,"stored":true})"
+               "\n"
+               R"({"path":"/shares/A/Pictures/Summer/","depth":2,"files":1,"stored":true})"
+               "\n");
+}
+
+TEST_F(ZophotosTree, KeepsWhatIsInAFolderBelowIt) {
+  onA.AddFolder("a/", 1);
+  onA.AddFolder("a b/", 1);
+  onA.AddFolder("a b/y/", 1);
+  onA.AddFolder("a/x/", 1);
+  onA.AddFolder("a!/", 1);
+  Merge(a);
+  ExpectOutput(Zophotos({"tree", "A"}), "/shares/A/  1 file\n"
+                                        "├── Pictures/  1 file\n"
+                                        "│   └── Summer/  1 file\n"
+                                        "├── a/  0 files\n"
+                                        "│   └── x/  0 files\n"
+                                        "├── a b/  0 files\n"
+                                        "│   └── y/  0 files\n"
+                                        "└── a!/  0 files\n");
+}
+
+TEST_F(ZophotosTree, GoesByPathsAndNotByParents) {
+  Copy().Run("UPDATE Folders SET parent_folder_id = 999 - folder_id");
+  EXPECT_EQ(Zophotos({"tree"}).output, OnCopy({"tree"}).output);
+  EXPECT_EQ(Zophotos({"ls", "A"}).output, OnCopy({"ls", "A"}).output);
+}
+
+TEST_F(ZophotosTree, SaysThatAFolderIsNotThere) {
+  ExpectNothing(Zophotos({"tree", "A/Pict"}), "zophotos: there is no folder /shares/A/Pict/\n");
+}
+
+TEST_F(ZophotosFind, LooksForAPatternWithoutWildcardsAnywhereInNames) {
+  ExpectOutput(Zophotos({"find", "umm"}), "/shares/A/Pictures/Summer/\n");
+  ExpectOutput(Zophotos({"find", ".jpg"}), "/shares/A/top.jpg\n"
+                                           "/shares/A/Pictures/b.jpg\n"
+                                           "/shares/A/Pictures/Summer/a.jpg\n"
+                                           "/shares/B/Old/1.jpg\n");
+}
+
+TEST_F(ZophotosFind, ComparesWildcardsWithTheWholeName) {
+  ExpectOutput(Zophotos({"find", "[a-c].jp?"}), "/shares/A/Pictures/b.jpg\n"
+                                                "/shares/A/Pictures/Summer/a.jpg\n");
+  ExpectOutput(Zophotos({"find", "S*r"}), "/shares/A/Pictures/Summer/\n");
+}
+
+TEST_F(ZophotosFind, ComparesAPatternWithASeparatorWithTheWholePath) {
+  ExpectOutput(Zophotos({"find", "/shares/*/Old/*"}), "/shares/B/Old/1.jpg\n");
+  ExpectOutput(Zophotos({"find", "Pictures/S"}), "/shares/A/Pictures/Summer/\n"
+                                                 "/shares/A/Pictures/Summer/a.jpg\n");
+  EXPECT_EQ(1, Zophotos({"find", "Old/*"}).status);
+}
+
+TEST_F(ZophotosFind, IgnoresTheCaseOnlyWhenAsked) {
+  AddRows(Copy(), "'/shares/A/ÄÖ/'");
+  EXPECT_EQ(1, OnCopy({"find", "TOP*"}).status);
+  ExpectOutput(OnCopy({"find", "-i", "TOP*"}), "/shares/A/top.jpg\n");
+  ExpectOutput(OnCopy({"find", "--ignore-case", "äö"}), "/shares/A/ÄÖ/\n");
+}
+
+TEST_F(ZophotosFind, MayBeginAPatternWithADash) {
+  AddRows(Copy(), "'/shares/A/-x/'");
+  ExpectOutput(OnCopy({"find", "--", "-x"}), "/shares/A/-x/\n");
+}
+
+TEST_F(ZophotosFind, SaysNothingWhereNothingMatches) {
+  ExpectNothing(Zophotos({"find", "absent"}), "");
+  ExpectNothing(Zophotos({"find", "--json", "absent"}), "");
+  ExpectNothing(Zophotos({"find", "-0", "absent"}), "");
+}
+
+TEST_F(ZophotosFind, IsAnObjectALineInJson) {
+  ExpectOutput(
+      Zophotos({"find", "--json", "*r*"}),
+      R"({"type":"folder","path":"/shares/","volume":"<DUMMY>","modified":"1970-01-01T00:00:00Z"})"
+      "\n"
+      R"({"type":"folder","path":"/shares/A/Pictures/","volume":"/shares/A/","modified":"1970-01-01T00:08:20Z"})"
+      "\n"
+      R"({"type":"folder","path":"/shares/A/Pictures/Summer/","volume":"/shares/A/","modified":"1970-01-01T00:10:00Z"})"
+      "\n");
+  EXPECT_THAT(
+      Zophotos({"find", "--json", "1.jpg"}).output,
+      R"({"type":"file","path":"/shares/B/Old/1.jpg","volume":"/shares/B/","modified":"1970-01-02T00:00:00Z"})"
+      "\n");
+}
+
+/// Bytes that a file's name may have, in SQL and as they are.
+const std::string ODD_NAME_SQL = "CAST(x'780a1b5bff5c2e6a7067' AS TEXT)";
+const std::string ODD_NAME = "x\n\x1b[\xff\\.jpg";
+
+TEST_F(ZophotosFind, EscapesWhatATerminalOrALineCannotTake) {
+  AddRows(Copy(), "'/shares/A/odd/'", ODD_NAME_SQL);
+  ExpectOutput(OnCopy({"find", "x*"}), R"(/shares/A/odd/x\x0a\x1b[\xff\\.jpg)"
+                                       "\n");
+}
+
+TEST_F(ZophotosFind, PrintsPathsAsTheyAreWithANullBehind) {
+  AddRows(Copy(), "'/shares/A/odd/'", ODD_NAME_SQL);
+  ExpectOutput(OnCopy({"find", "-0", "x*"}), "/shares/A/odd/" + ODD_NAME + '\0');
+  ExpectOutput(OnCopy({"find", "--null", "odd"}), std::string("/shares/A/odd/") + '\0');
+}
+
+TEST_F(ZophotosFind, GoesInTheOrderOfPaths) {
+  const Database copy = Copy();
+  AddRows(copy, "'/shares/A/z/'", "'2'");
+  AddRows(copy, "'/shares/A/m/'", "'3'");
+  copy.Run("UPDATE Files SET name = '1' WHERE name = 'b.jpg'");
+  ExpectOutput(OnCopy({"find", "[0-9]"}), "/shares/A/Pictures/1\n/shares/A/m/3\n/shares/A/z/2\n");
+}
+
+TEST_F(ZophotosExport, WritesCsvWithAHeading) {
+  ExpectOutput(
+      Zophotos({"export", "--csv"}),
+      "path,volume,modified,created\n"
+      R"("/shares/A/top.jpg","/shares/A/",1970-01-01T00:16:40Z,1970-01-01T00:16:40Z)"
+      "\n"
+      R"("/shares/A/Pictures/b.jpg","/shares/A/",1970-01-01T00:16:41Z,1970-01-01T00:16:41Z)"
+      "\n"
+      R"("/shares/A/Pictures/Summer/a.jpg","/shares/A/",1970-01-01T00:16:42Z,1970-01-01T00:16:42Z)"
+      "\n"
+      R"("/shares/B/Old/1.jpg","/shares/B/",1970-01-02T00:00:00Z,1970-01-02T00:00:00Z)"
+      "\n");
+}
+
+TEST_F(ZophotosExport, WritesAnObjectALine) {
+  const Outcome outcome = Zophotos({"export", "--jsonl"});
+  EXPECT_EQ(0, outcome.status);
+  EXPECT_THAT(
+      outcome.output,
+      AllOf(
+          StartsWith(
+              R"({"path":"/shares/A/top.jpg","volume":"/shares/A/","modified":"1970-01-01T00:16:40Z","created":"1970-01-01T00:16:40Z"})"
+              "\n"),
+          Not(HasSubstr("Summer/\""))));
+  EXPECT_EQ(outcome.output, Zophotos({"export", "--json"}).output);
+}
+
+TEST_F(ZophotosExport, QuotesWhatMeansSomethingInCsv) {
+  const Database copy = Copy();
+  copy.Run("DELETE FROM Files");
+  AddRows(copy, "'/shares/A/1,\"/'", "'say \"hi\", you'");
+  AddRows(copy, "'/shares/A/2/'", R"('\.')");
+  AddRows(copy, "'/shares/A/3/'", ODD_NAME_SQL);
+  AddRows(copy, "'/shares/A/4/'", "CAST(x'6e000d6c' AS TEXT)");
+  const std::string rest = "\",\"/shares/A/\",1970-01-01T00:00:05Z,1970-01-01T00:00:06Z\n";
+  ExpectOutput(OnCopy({"export", "--csv"}), "path,volume,modified,created\n"
+                                            "\"/shares/A/1,\"\"/say \"\"hi\"\", you" +
+                                                rest + "\"/shares/A/2/\\." + rest +
+                                                "\"/shares/A/3/x\n\x1b[\uFFFD\\.jpg" + rest +
+                                                "\"/shares/A/4/n\uFFFD\rl" + rest);
+}
+
+TEST_F(ZophotosExport, EscapesWhatMeansSomethingInJson) {
+  const Database copy = Copy();
+  copy.Run("DELETE FROM Files");
+  AddRows(copy, "'/shares/A/1/'", ODD_NAME_SQL);
+  AddRows(copy, "'/shares/A/2/'", "CAST(x'6e00226cf09f9880' AS TEXT)");
+  const std::string rest = R"(","volume":"/shares/A/","modified":"1970-01-01T00:00:05Z",)"
+                           R"("created":"1970-01-01T00:00:06Z"})"
+                           "\n";
+  ExpectOutput(OnCopy({"export", "--jsonl"}), R"({"path":"/shares/A/1/x\n\u001b[)"
+                                              "\uFFFD"
+                                              R"(\\.jpg)" +
+                                                  rest + R"({"path":"/shares/A/2/n)" + "\uFFFD" +
+                                                  R"(\"l😀)" + rest);
+}
+
+TEST_F(ZophotosExport, LeavesOutTimesThatNoCalendarHas) {
+  const Database copy = Copy();
+  copy.Run("UPDATE Files SET modified_date = -62135596800, created_date = 253402300799 WHERE name "
+           "= 'top.jpg'");
+  copy.Run("UPDATE Files SET modified_date = -62135596801, created_date = 253402300800 WHERE name "
+           "= 'b.jpg'");
+  copy.Run("DELETE FROM Files WHERE name NOT IN ('top.jpg', 'b.jpg')");
+  ExpectOutput(OnCopy({"export", "--csv"}),
+               "path,volume,modified,created\n"
+               "\"/shares/A/top.jpg\",\"/shares/A/\",0001-01-01T00:00:00Z,9999-12-31T23:59:59Z\n"
+               "\"/shares/A/Pictures/b.jpg\",\"/shares/A/\",,\n");
+  EXPECT_THAT(OnCopy({"export", "--jsonl"}).output,
+              HasSubstr(R"("modified":null,"created":null})"));
+}
+
+} // namespace
+} // namespace orva::test
