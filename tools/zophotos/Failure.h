@@ -15,7 +15,8 @@ enum class ExitStatus : int {
   Failed = 5,     ///< anything else
 };
 
-/// Ends the command with a message for the user and an exit status.
+/// Ends the command with a message for the user and an exit status. Who prints the message
+/// escapes it.
 class Failure : public std::runtime_error {
 public:
   Failure(ExitStatus status, const std::string& message)

@@ -118,7 +118,7 @@ ExitStatus ListFolder(const std::string& path, const std::string& folder, bool i
     entries = ReadFolders(database, folderPath);
     ReadFiles(database, folderPath, entries);
     if (entries.empty() && !IsStored(database, folderPath)) {
-      throw Failure(ExitStatus::Negative, "there is no folder " + Printable(folderPath));
+      throw Failure(ExitStatus::Negative, "there is no folder " + folderPath);
     }
   }
   if (form == Form::Json) {

@@ -119,7 +119,7 @@ ExitStatus ShowTree(const std::string& path, const std::string& folder, Form for
   const std::vector<StoredFolder> folders = ReadFolders(path, top);
   const std::vector<Node> nodes = MakeTree(folders, top);
   if (nodes.empty()) {
-    throw Failure(ExitStatus::Negative, "there is no folder " + Printable(top));
+    throw Failure(ExitStatus::Negative, "there is no folder " + top);
   }
   (form == Form::Json ? PrintJson : PrintText)(nodes);
   return ExitStatus::Success;

@@ -1,6 +1,7 @@
 #include "Commands.h"
 #include "Locator.h"
 #include "MergedDatabase.h"
+#include "Text.h"
 
 #include <CLI/CLI.hpp>
 #include <SQLiteCpp/Exception.h>
@@ -147,7 +148,7 @@ ExitStatus Run(int argc, char** argv) {
   } catch (const CLI::ParseError& error) {
     return options.Explain(error);
   } catch (const Failure& failure) {
-    std::cerr << "zophotos: " << failure.what() << '\n';
+    std::cerr << "zophotos: " << Printable(failure.what()) << '\n';
     return failure.Status();
   }
 }
@@ -159,7 +160,7 @@ int main(int argc, char** argv) {
   try {
     return Finish(Run(argc, argv));
   } catch (const std::exception& error) {
-    std::cerr << "zophotos: " << error.what() << '\n';
+    std::cerr << "zophotos: " << Printable(error.what()) << '\n';
     return static_cast<int>(ExitStatus::Failed);
   }
 }
