@@ -43,9 +43,9 @@ enum class ExportFormat { Csv, JsonLines };
 /// Every file, with its full path.
 ExitStatus ExportFiles(const std::string& path, ExportFormat format);
 
-/// A line for each change, until the program is ended. What is thrown by `findPath` is a change,
-/// too.
-[[noreturn]] void WatchDatabase(const FindPath& findPath, Form form);
+/// A line for each change, until the program is ended or nobody takes its lines. What is thrown by
+/// `findPath` is a change, too.
+ExitStatus WatchDatabase(const FindPath& findPath, Form form);
 
 /// `folder` as the database has it: from the shares root, with a separator at its end.
 std::string FolderPath(const std::string& folder);

@@ -103,8 +103,9 @@ class Watch {
 public:
   Watch(const FindPath& findPath, Form form) : findPath_(findPath), form_(form) {}
 
-  /// Looks once, and prints what has changed since the last time.
-  void Look() {
+  /// Looks once, and prints what has changed since the last time. False when that cannot be
+  /// printed.
+  bool Look() {
     try {
       const std::string path = findPath_();
       if (!database_ || path != path_ || Identify(path) != identity_) {
@@ -120,7 +121,7 @@ public:
         Lose(Explain(error, path_));
       }
     }
-    std::cout << std::flush;
+    return static_cast<bool>(std::cout.flush());
   }
 
 private:
@@ -226,11 +227,12 @@ private:
 
 } // namespace
 
-void WatchDatabase(const FindPath& findPath, Form form) {
-  for (Watch watch(findPath, form);;) {
-    watch.Look();
+ExitStatus WatchDatabase(const FindPath& findPath, Form form) {
+  Watch watch(findPath, form);
+  while (watch.Look()) {
     std::this_thread::sleep_for(INTERVAL);
   }
+  return ExitStatus::Failed;
 }
 
 } // namespace orva::zophotos

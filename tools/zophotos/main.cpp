@@ -41,7 +41,7 @@ public:
   /// Runs the command. Throws what it throws.
   ExitStatus Run() const {
     if (watch_->parsed()) {
-      WatchDatabase([this] { return FindPath(); }, OutputForm());
+      return WatchDatabase([this] { return FindPath(); }, OutputForm());
     }
     const std::string path = FindPath();
     try {
