@@ -110,7 +110,7 @@ public:
       const std::string path = findPath_();
       if (!database_ || path != path_ || Identify(path) != identity_) {
         Open(path);
-      } else if (Version() != version_) {
+      } else if (Version(*database_) != version_) {
         PrintChange();
       }
     } catch (const Failure& failure) {
@@ -133,18 +133,21 @@ private:
     return FileIdentity(status.st_dev, status.st_ino);
   }
 
-  std::int64_t Version() { return Ask(*database_, "PRAGMA data_version"); }
+  static std::int64_t Version(SQLite::Database& database) {
+    return Ask(database, "PRAGMA data_version");
+  }
 
   void Open(const std::string& path) {
     path_ = path;
     database_.reset();
     identity_ = Identify(path);
-    database_.emplace(OpenDatabase(path));
+    SQLite::Database database = OpenDatabase(path);
     {
-      const SQLite::Transaction oneState(*database_);
-      state_ = ReadState(*database_);
-      version_ = Version();
+      const SQLite::Transaction oneState(database);
+      state_ = ReadState(database);
+      version_ = Version(database);
     }
+    database_ = std::move(database);
     loss_.clear();
     Print("opened",
           "watching " + Printable(path) + ": " + Count(state_.folders.count, "folder") + ", " +
@@ -170,7 +173,7 @@ private:
     {
       const SQLite::Transaction oneState(*database_);
       State now = ReadState(*database_);
-      version_ = Version();
+      version_ = Version(*database_);
       folders = Compare(*database_,
                         "SELECT volume, count(*) FROM Folders WHERE folder_id > ? GROUP BY volume",
                         state_.folders, now.folders, changed);
