@@ -70,6 +70,13 @@ void CopyPages(SQLite::Database& from, SQLite::Database& to) {
   }
 }
 
+/// Whether a journal waits to be played back. The exception of a copy has the extended code in
+/// place of the other.
+bool IsInterruptedMerge(const SQLite::Exception& error) {
+  return error.getExtendedErrorCode() == SQLITE_READONLY_ROLLBACK ||
+         error.getErrorCode() == SQLITE_READONLY_ROLLBACK;
+}
+
 } // namespace
 
 SQLite::Database OpenDatabase(const std::string& path) {
@@ -117,12 +124,11 @@ bool IsDamage(const SQLite::Exception& error) {
 
 bool IsLocked(const SQLite::Exception& error) {
   const int code = error.getErrorCode() & 0xFF;
-  return code == SQLITE_BUSY || code == SQLITE_LOCKED ||
-         error.getExtendedErrorCode() == SQLITE_READONLY_ROLLBACK;
+  return code == SQLITE_BUSY || code == SQLITE_LOCKED || IsInterruptedMerge(error);
 }
 
 std::string Explain(const SQLite::Exception& error, const std::string& path) {
-  if (error.getExtendedErrorCode() == SQLITE_READONLY_ROLLBACK) {
+  if (IsInterruptedMerge(error)) {
     return path +
            " has a merge to take back that was interrupted; the daemon does so when it opens "
            "the database, and this program only reads";
