@@ -136,6 +136,9 @@ std::string Explain(const SQLite::Exception& error, const std::string& path) {
   if (IsLocked(error)) {
     return path + " is locked, as it is while a large merge is written; try again";
   }
+  if ((error.getErrorCode() & 0xFF) == SQLITE_FULL) {
+    return "no space for a private copy of " + path + "; SQLITE_TMPDIR names another folder for it";
+  }
   return path + ": " + error.what();
 }
 
