@@ -4,8 +4,12 @@ add_private_root_test(zophotos_test
     ${CMAKE_SOURCE_DIR}/tests/hostile/CraftedDatabase.cpp
     ${CMAKE_SOURCE_DIR}/tests/hostile/CraftedLog.cpp
     ${CMAKE_CURRENT_LIST_DIR}/ZophotosTest.cpp
+    ${CMAKE_CURRENT_LIST_DIR}/zophotos_check_test.cpp
+    ${CMAKE_CURRENT_LIST_DIR}/zophotos_failure_test.cpp
     ${CMAKE_CURRENT_LIST_DIR}/zophotos_test.cpp
   LIBS appliance test_program
   LABELS system)
-target_compile_definitions(zophotos_test PRIVATE ZOPHOTOS="$<TARGET_FILE:zophotos>")
+target_compile_definitions(zophotos_test PRIVATE
+  ZOPHOTOS="$<TARGET_FILE:zophotos>"
+  ZOPHOTOS_VERSION="${PROJECT_VERSION}")
 add_dependencies(zophotos_test zophotos)

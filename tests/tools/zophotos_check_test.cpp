@@ -1,0 +1,218 @@
+// What the inspector finds wrong with a database, and what it takes for no damage.
+
+#include "ZophotosTest.h"
+
+#include <algorithm>
+#include <filesystem>
+#include <fstream>
+
+namespace orva::test {
+namespace {
+
+using ::testing::AllOf;
+using ::testing::HasSubstr;
+using ::testing::Not;
+using ::testing::StartsWith;
+
+class ZophotosCheck : public ZophotosTest {
+protected:
+  /// Checks the copy after these statements, and expects this damage: a line in text below its
+  /// heading, and a finding in JSON.
+  static void ExpectDamage(const std::vector<std::string>& statements, const std::string& text,
+                           const std::string& json) {
+    SCOPED_TRACE(statements[0]);
+    {
+      const Database copy = Copy();
+      for (const std::string& sql : statements) {
+        copy.Run(sql);
+      }
+    }
+    const Outcome inText = OnCopy({"check"});
+    EXPECT_EQ(1, inText.status);
+    EXPECT_EQ(COPY + " is damaged\nDamage:\n" + text, inText.output);
+    const Outcome inJson = OnCopy({"check", "--json"});
+    EXPECT_EQ(1, inJson.status);
+    EXPECT_EQ(R"({"database":")" + COPY + R"(","sound":false,"damage":[)" + json +
+                  R"(],"leftovers":[]})" + "\n",
+              inJson.output);
+    EXPECT_EQ("", inText.error + inJson.error);
+  }
+
+  /// Overwrites the copy from an offset on.
+  static void Overwrite(std::size_t offset, const std::string& bytes) {
+    std::fstream file(COPY, std::ios::in | std::ios::out | std::ios::binary);
+    file.seekp(static_cast<std::streamoff>(offset));
+    file << bytes;
+  }
+
+  static std::size_t RootOffset(const std::string& table) {
+    const Database copy = Copy();
+    const auto number = [&](const std::string& sql) { return std::stoul(copy.Run(sql).at(0)); };
+    return (number("SELECT rootpage FROM sqlite_master WHERE name = '" + table + "'") - 1) *
+           number("PRAGMA page_size");
+  }
+};
+
+TEST_F(ZophotosCheck, FindsTheDaemonsDatabaseSound) {
+  const Outcome inText = Zophotos({"check"});
+  EXPECT_EQ(0, inText.status);
+  EXPECT_EQ(MERGED + " is sound\n", inText.output);
+  const Outcome inJson = Zophotos({"check", "--json"});
+  EXPECT_EQ(0, inJson.status);
+  EXPECT_EQ(
+      R"({"database":"/shares/A//.zophotos/zophotos.db","sound":true,"damage":[],"leftovers":[]})"
+      "\n",
+      inJson.output);
+}
+
+TEST_F(ZophotosCheck, FindsAMissingStatusRow) {
+  ExpectDamage({"DELETE FROM Status"}, "  1 no status row 1\n    Status\n",
+               R"({"kind":"no_status","count":1,"examples":["Status"]})");
+}
+
+TEST_F(ZophotosCheck, FindsAMissingRootFolder) {
+  const std::string text = "  1 no root folder 1\n    Folders\n";
+  const std::string json = R"({"kind":"no_root","count":1,"examples":["Folders"]})";
+  ExpectDamage({"UPDATE Folders SET name = '/share/' WHERE folder_id = 1"}, text, json);
+  ExpectDamage(
+      {"UPDATE Folders SET parent_folder_id = -1", "DELETE FROM Folders WHERE folder_id = 1"}, text,
+      json);
+}
+
+TEST_F(ZophotosCheck, FindsFilesWithoutAFolder) {
+  ExpectDamage(
+      {"UPDATE Files SET folder_id = 999, file_id = 77 WHERE name = 'top.jpg'"},
+      "  1 files without a folder\n    file 77, top.jpg, of /shares/A/: no folder 999\n",
+      R"({"kind":"file_without_folder","count":1,"examples":["file 77, top.jpg, of /shares/A/: no folder 999"]})");
+}
+
+TEST_F(ZophotosCheck, FindsFilesOfAnotherVolumeThanTheirFolder) {
+  ExpectDamage(
+      {"UPDATE Files SET volume = '/shares/B/' WHERE name = 'top.jpg'"},
+      "  1 files of another volume than their folder\n"
+      "    /shares/A/top.jpg, of /shares/B/ in a folder of /shares/A/\n",
+      R"({"kind":"file_of_other_volume","count":1,"examples":["/shares/A/top.jpg, of /shares/B/ in a folder of /shares/A/"]})");
+}
+
+TEST_F(ZophotosCheck, FindsFoldersThatAreThereMoreThanOnce) {
+  ExpectDamage({"INSERT INTO Folders(parent_folder_id, name, modified_date, volume) SELECT "
+                "parent_folder_id, name, 7, volume FROM Folders WHERE name = '/shares/B/Old/'"},
+               "  1 folders that are there more than once\n    /shares/B/Old/, 2 times\n",
+               R"({"kind":"duplicate_folder","count":1,"examples":["/shares/B/Old/, 2 times"]})");
+}
+
+TEST_F(ZophotosCheck, FindsFilesThatAreThereMoreThanOnce) {
+  const std::string insert =
+      "INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT folder_id, "
+      "name, 7, volume, 8 FROM Files WHERE name = '1.jpg' LIMIT 1";
+  ExpectDamage(
+      {insert, insert},
+      "  1 files that are there more than once\n    /shares/B/Old/1.jpg, 3 times\n",
+      R"({"kind":"duplicate_file","count":1,"examples":["/shares/B/Old/1.jpg, 3 times"]})");
+}
+
+TEST_F(ZophotosCheck, FindsVolumesWithMoreThanOneRowOfStatistics) {
+  ExpectDamage({"INSERT INTO Statistics(volume, photos_xcoded, photos_total, last_updated_time) "
+                "VALUES('/shares/B/', 0, 0, 0)"},
+               "  1 volumes with more than one row of statistics\n    /shares/B/, 2 times\n",
+               R"({"kind":"duplicate_statistics","count":1,"examples":["/shares/B/, 2 times"]})");
+}
+
+TEST_F(ZophotosCheck, TellsOfEachKindThatItFinds) {
+  const Database copy = Copy();
+  copy.Run("DELETE FROM Status");
+  copy.Run("UPDATE Files SET folder_id = 999 WHERE name = 'top.jpg'");
+  const Outcome outcome = OnCopy({"check"});
+  EXPECT_EQ(1, outcome.status);
+  EXPECT_THAT(outcome.output,
+              AllOf(HasSubstr("  1 no status row 1\n"), HasSubstr("  1 files without a folder\n")));
+}
+
+TEST_F(ZophotosCheck, ListsTwentyExamplesAndCountsTheRest) {
+  const Database copy = Copy();
+  copy.Run("DELETE FROM Files");
+  copy.Run(
+      "WITH RECURSIVE n(i) AS (SELECT 10 UNION ALL SELECT i + 1 FROM n WHERE i < 34) INSERT "
+      "INTO Files(folder_id, name, modified_date, volume, created_date) SELECT 99, i || '.jpg', "
+      "1, '/shares/A/', 1 FROM n");
+  const Outcome inText = OnCopy({"check"});
+  EXPECT_THAT(inText.output, HasSubstr("  25 files without a folder\n"));
+  EXPECT_THAT(inText.output, HasSubstr(", 29.jpg, of /shares/A/: no folder 99\n    and 5 more\n"));
+  EXPECT_THAT(inText.output, Not(HasSubstr("30.jpg")));
+  const Outcome inJson = OnCopy({"check", "--json"});
+  EXPECT_THAT(inJson.output, HasSubstr(R"("kind":"file_without_folder","count":25,"examples":[)"));
+  EXPECT_EQ(20, std::count(inJson.output.begin(), inJson.output.end(), '.') - 1);
+}
+
+TEST_F(ZophotosCheck, AnUnpluggedVolumesStatisticsAreNoDamage) {
+  appliance.Handle(Unplugged(b.Path()));
+  const Outcome inText = Zophotos({"check"});
+  EXPECT_EQ(0, inText.status);
+  EXPECT_EQ(MERGED + " is sound\n"
+                     "Expected leftovers, no damage:\n"
+                     "  1 statistics of volumes that have nothing merged\n"
+                     "    /shares/B/\n",
+            inText.output);
+  const Outcome inJson = Zophotos({"check", "--json"});
+  EXPECT_EQ(0, inJson.status);
+  EXPECT_THAT(
+      inJson.output,
+      HasSubstr(
+          R"("sound":true,"damage":[],"leftovers":[{"kind":"statistics_without_content","count":1,"examples":["/shares/B/"]}])"));
+}
+
+TEST_F(ZophotosCheck, NamesInExamplesAreEscaped) {
+  Copy().Run("UPDATE Files SET folder_id = 999, name = CAST(x'1b5bff' AS TEXT) WHERE name = "
+             "'top.jpg'");
+  EXPECT_THAT(OnCopy({"check"}).output, HasSubstr(R"(, \x1b[\xff, of)"));
+  EXPECT_THAT(OnCopy({"check", "--json"}).output, HasSubstr("\\u001b[\uFFFD, of"));
+}
+
+TEST_F(ZophotosCheck, FindsOverwrittenPages) {
+  for (const char* const table : {"Files", "Folders", "Statistics", "Folders_path", "Files_name"}) {
+    Overwrite(RootOffset(table), std::string(2000, '\x5a'));
+    const Outcome outcome = OnCopy({"check"});
+    EXPECT_EQ(1, outcome.status) << table;
+    EXPECT_THAT(outcome.output, StartsWith(COPY + " is damaged\nDamage:\n")) << table;
+    EXPECT_THAT(outcome.output, HasSubstr(" faults in the file\n")) << table;
+    EXPECT_EQ("", outcome.error) << table;
+    EXPECT_THAT(OnCopy({"check", "--json"}).output, HasSubstr(R"({"kind":"integrity","count":)"));
+  }
+}
+
+TEST_F(ZophotosCheck, FindsAnOverwrittenSchema) {
+  Copy();
+  Overwrite(100, std::string(2000, '\x5a'));
+  EXPECT_EQ(1, OnCopy({"check"}).status);
+}
+
+TEST_F(ZophotosCheck, FindsAFileThatWasCutShort) {
+  Copy();
+  std::filesystem::resize_file(COPY, std::filesystem::file_size(COPY) - 5000);
+  const Outcome outcome = OnCopy({"check"});
+  EXPECT_EQ(1, outcome.status);
+  EXPECT_THAT(outcome.output, HasSubstr(" faults in the file\n"));
+}
+
+TEST_F(ZophotosCheck, FindsAFileThatIsNoDatabase) {
+  Copy();
+  Overwrite(0, "This is a letter and no data");
+  const Outcome outcome = OnCopy({"check"});
+  EXPECT_EQ(1, outcome.status);
+  EXPECT_EQ(COPY + " is damaged\nDamage:\n  1 faults in the file\n    file is not a database\n",
+            outcome.output);
+}
+
+TEST_F(ZophotosCheck, FindsPagesThatNobodyUses) {
+  {
+    const Database copy = Copy();
+    copy.Run("PRAGMA writable_schema = ON");
+    copy.Run("DELETE FROM sqlite_master WHERE name = 'Files_name'");
+  }
+  const Outcome outcome = OnCopy({"check"});
+  EXPECT_EQ(1, outcome.status);
+  EXPECT_THAT(outcome.output, HasSubstr(" faults in the file\n"));
+}
+
+} // namespace
+} // namespace orva::test

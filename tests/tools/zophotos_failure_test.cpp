@@ -1,0 +1,311 @@
+// When the inspector cannot do its work: its exit statuses and messages, and that it leaves all as
+// it was.
+
+#include "ZophotosTest.h"
+
+#include "hostile/CraftedLog.h"
+
+#include <sys/stat.h>
+
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <map>
+#include <memory>
+#include <tuple>
+
+namespace orva::test {
+namespace {
+
+namespace fs = std::filesystem;
+using ::testing::HasSubstr;
+using ::testing::IsEmpty;
+using ::testing::Not;
+
+const std::string LOCATOR = "/tmp/zophotodbmerger.conf";
+
+/// All commands that end by themselves.
+const std::vector<Arguments> COMMANDS{{"status"},
+                                      {"ls"},
+                                      {"ls", "-l", "A"},
+                                      {"tree"},
+                                      {"find", "*"},
+                                      {"find", "-0", ""},
+                                      {"check"},
+                                      {"export", "--csv"},
+                                      {"export", "--jsonl"},
+                                      {"status", "--json"},
+                                      {"ls", "--json"},
+                                      {"tree", "--json"},
+                                      {"check", "--json"}};
+
+std::string Text(const Arguments& arguments) {
+  return ::testing::PrintToString(arguments);
+}
+
+void ExpectFailure(const Outcome& outcome, int status, const std::string& message) {
+  EXPECT_EQ(status, outcome.status);
+  EXPECT_EQ("", outcome.output);
+  EXPECT_EQ("zophotos: " + message + "\n", outcome.error);
+}
+
+/// The locator file of a daemon that does not run.
+class ZophotosLocator : public ::testing::Test {
+protected:
+  void TearDown() override { fs::remove_all(LOCATOR); }
+
+  static void Write(const std::string& text) { std::ofstream(LOCATOR) << text; }
+
+  static void ExpectNoDatabase(const std::string& reason) {
+    for (const Arguments& command : COMMANDS) {
+      SCOPED_TRACE(Text(command));
+      ExpectFailure(Zophotos(command), 3, "no merged database: " + reason);
+    }
+  }
+};
+
+const std::string NO_FILE =
+    "there is no file /tmp/zophotodbmerger.conf, which the daemon writes when it starts";
+
+TEST_F(ZophotosLocator, MayBeMissing) {
+  ExpectNoDatabase(NO_FILE);
+}
+
+TEST_F(ZophotosLocator, MayNameNone) {
+  Write("zophotos_db_path=\n");
+  ExpectNoDatabase("/tmp/zophotodbmerger.conf names none at this moment");
+}
+
+TEST_F(ZophotosLocator, MayBeMalformed) {
+  for (const char* const text : {"", "\n", "nonsense\n", " zophotos_db_path=/x\n", "ZOPHOTOS"}) {
+    Write(text);
+    ExpectNoDatabase("/tmp/zophotodbmerger.conf has no zophotos_db_path= in its first line");
+  }
+}
+
+TEST_F(ZophotosLocator, MayBeNoFile) {
+  fs::create_directory(LOCATOR);
+  ExpectNoDatabase(NO_FILE);
+  fs::remove(LOCATOR);
+  ASSERT_EQ(0, mkfifo(LOCATOR.c_str(), 0666));
+  ExpectNoDatabase(NO_FILE);
+}
+
+TEST_F(ZophotosLocator, MayNameWhatIsNotThere) {
+  Write("zophotos_db_path=/shares/Gone//.zophotos/zophotos.db\n");
+  ExpectNoDatabase("/shares/Gone//.zophotos/zophotos.db does not exist");
+}
+
+TEST_F(ZophotosLocator, MayNameWhatIsNoFile) {
+  for (const char* const path : {"/shares", "/dev/null"}) {
+    Write("zophotos_db_path=" + std::string(path));
+    ExpectFailure(Zophotos({"status"}), 5, std::string(path) + " is not a regular file");
+    ExpectFailure(Zophotos({"ls"}), 5, std::string(path) + " is not a regular file");
+  }
+}
+
+TEST_F(ZophotosLocator, CannotSayAnythingToTheTerminal) {
+  Write("zophotos_db_path=/x\x1b[2J\xff\r\n");
+  ExpectNoDatabase(R"(/x\x1b[2J\xff\x0d does not exist)");
+}
+
+/// How the inspector is called wrongly, and what it says.
+TEST(ZophotosUsage, IsToldFromFailure) {
+  const std::vector<std::pair<Arguments, std::string>> wrong{
+      {{}, "A subcommand is required"},
+      {{"destroy"}, "subcommand"},
+      {{"ls", "--nonsense"}, "--nonsense"},
+      {{"ls", "A", "B"}, "B"},
+      {{"status", "A"}, "A"},
+      {{"find"}, "PATTERN is required"},
+      {{"find", "a", "b"}, "b"},
+      {{"export"}, "takes one of --csv and --jsonl"},
+      {{"export", "--csv", "--jsonl"}, "takes one of --csv and --jsonl"},
+      {{"export", "--csv", "--json"}, "takes one of --csv and --jsonl"},
+      {{"find", "-0", "--json", "x"}, "takes one of --null and --json"},
+      {{"--json", "find", "--null", "x"}, "takes one of --null and --json"},
+      {{"--database"}, "--database"},
+      {{"status", "check"}, ""}};
+  for (const auto& [arguments, message] : wrong) {
+    SCOPED_TRACE(Text(arguments));
+    const Outcome outcome = Zophotos(arguments);
+    EXPECT_EQ(2, outcome.status);
+    EXPECT_EQ("", outcome.output);
+    EXPECT_THAT(outcome.error, HasSubstr(message));
+  }
+}
+
+TEST(ZophotosUsage, IsExplained) {
+  for (const Arguments& arguments : {Arguments{"--help"}, Arguments{"-h"}}) {
+    const Outcome help = Zophotos(arguments);
+    EXPECT_EQ(0, help.status);
+    for (const char* const command : {"status", "ls", "tree", "find", "check", "watch", "export"}) {
+      EXPECT_THAT(help.output, HasSubstr("\n  " + std::string(command) + " "));
+      const Outcome more = Zophotos({command, "--help"});
+      EXPECT_EQ(0, more.status);
+      EXPECT_THAT(more.output, HasSubstr(command));
+    }
+  }
+}
+
+TEST(ZophotosUsage, VersionIsTheProjects) {
+  const Outcome outcome = Zophotos({"--version"});
+  EXPECT_EQ(0, outcome.status);
+  EXPECT_EQ("zophotos " ZOPHOTOS_VERSION "\n", outcome.output);
+}
+
+class ZophotosFailure : public ZophotosTest {
+protected:
+  /// Expects of the commands that print rows that they fail on the copy, which `check` may find
+  /// damaged.
+  static void ExpectRefused(const std::string& message) {
+    for (const Arguments& command : COMMANDS) {
+      if (command[0] != "check") {
+        SCOPED_TRACE(Text(command));
+        ExpectFailure(OnCopy(command), 5, COPY + message);
+      }
+    }
+  }
+};
+
+TEST_F(ZophotosFailure, OfATableThatIsMissing) {
+  for (const char* const table : {"Status", "Statistics", "Folders", "Files"}) {
+    Copy().Run("ALTER TABLE " + std::string(table) + " RENAME TO Other");
+    const std::string message =
+        " is no merged photo database: it has no table " + std::string(table);
+    ExpectRefused(message);
+    ExpectFailure(OnCopy({"check"}), 5, COPY + message);
+  }
+}
+
+TEST_F(ZophotosFailure, OfAViewInPlaceOfATable) {
+  {
+    const Database copy = Copy();
+    copy.Run("ALTER TABLE Statistics RENAME TO Other");
+    copy.Run("CREATE VIEW Statistics AS SELECT * FROM Other");
+  }
+  ExpectRefused(" is no merged photo database: it has no table Statistics");
+}
+
+TEST_F(ZophotosFailure, OfAFileThatIsEmpty) {
+  fs::create_directory("/tmp/copy");
+  std::ofstream file(COPY);
+  ExpectRefused(" is no merged photo database: it has no table Status");
+}
+
+TEST_F(ZophotosFailure, OfAFileThatIsNoDatabase) {
+  fs::create_directory("/tmp/copy");
+  std::ofstream(COPY) << std::string(5000, 'x');
+  ExpectRefused(": file is not a database");
+}
+
+TEST_F(ZophotosFailure, OfAColumnThatIsMissing) {
+  Copy().Run("ALTER TABLE Files RENAME COLUMN name TO other");
+  for (const Arguments& command : {Arguments{"find", "*"}, Arguments{"export", "--csv"},
+                                   Arguments{"ls"}, Arguments{"check"}}) {
+    const Outcome outcome = OnCopy(command);
+    EXPECT_EQ(5, outcome.status) << Text(command);
+    EXPECT_THAT(outcome.error, HasSubstr("no such column: f.name"));
+  }
+}
+
+TEST_F(ZophotosFailure, OfALockThatStays) {
+  const Database locked = Copy();
+  locked.Run("BEGIN EXCLUSIVE");
+  std::vector<std::unique_ptr<Program>> programs;
+  for (Arguments command : COMMANDS) { // all at once, since each of them waits
+    command.insert(command.begin(), {"--database", COPY});
+    programs.push_back(std::make_unique<Program>(ZophotosCommand(command)));
+  }
+  for (std::size_t i = 0; i < programs.size(); ++i) {
+    EXPECT_EQ("zophotos: " + COPY +
+                  " is locked, as it is while a large merge is written; try again",
+              programs[i]->ReadLine());
+    EXPECT_EQ("(end)", programs[i]->ReadLine());
+    EXPECT_EQ(4, programs[i]->WaitForEnd()) << Text(COMMANDS[i]);
+  }
+}
+
+TEST_F(ZophotosFailure, OfAMergeThatWasInterrupted) {
+  constexpr std::uint32_t pageSize = 4096;
+  Copy();
+  Bytes file = Bytes::Of(COPY);
+  ASSERT_EQ(pageSize, file.Read(16, 2));
+  CraftedJournal(pageSize, static_cast<std::uint32_t>(file.Size()) / pageSize,
+                 {{1, file.Part(0, pageSize)}})
+      .Save(COPY + "-journal");
+  for (const Arguments& command : COMMANDS) {
+    SCOPED_TRACE(Text(command));
+    ExpectFailure(OnCopy(command), 4,
+                  COPY + " has a merge to take back that was interrupted; the daemon does so when "
+                         "it opens the database, and this program only reads");
+  }
+  EXPECT_TRUE(fs::exists(COPY + "-journal"));
+  EXPECT_EQ(std::vector<std::string>{"4"}, Database(COPY).Run("SELECT count(*) FROM Files"));
+  EXPECT_EQ(0, OnCopy({"status"}).status);
+}
+
+TEST_F(ZophotosFailure, OfAnOutputThatCannotBeWritten) {
+  std::vector<Arguments> commands = COMMANDS;
+  commands.push_back({"watch"});
+  commands.push_back({"--help"});
+  for (const Arguments& command : commands) {
+    SCOPED_TRACE(Text(command));
+    ExpectFailure(Zophotos(command, "/dev/full"), 5, "cannot write to standard output");
+  }
+}
+
+TEST_F(ZophotosFailure, OfSpaceForAPrivateCopy) {
+  Copy().Run(
+      "WITH RECURSIVE n(i) AS (SELECT 1 UNION ALL SELECT i + 1 FROM n WHERE i < 100000) INSERT "
+      "INTO Files(folder_id, name, modified_date, volume, created_date) SELECT 1, i, 1, 'x', 1 "
+      "FROM n");
+  const Volume small("Small", "64k");
+  setenv("SQLITE_TMPDIR", small.Path().c_str(), 1);
+  const Outcome outcome = OnCopy({"status"});
+  unsetenv("SQLITE_TMPDIR");
+  ExpectFailure(outcome, 5,
+                "no space for a private copy of " + COPY +
+                    "; SQLITE_TMPDIR names another folder for it");
+}
+
+/// All that is in the folder of a database: the bytes of its files and the times of their last
+/// changes.
+std::map<std::string, std::tuple<std::string, long, long, long, long>>
+Snapshot(const std::string& folder) {
+  std::map<std::string, std::tuple<std::string, long, long, long, long>> snapshot;
+  std::vector<std::string> paths = PathsBelow(folder);
+  paths.push_back(folder);
+  for (const std::string& path : paths) {
+    struct stat status {};
+    stat(path.c_str(), &status);
+    std::ifstream file(path, std::ios::binary);
+    snapshot[path] = {
+        S_ISDIR(status.st_mode) ? "" : std::string(std::istreambuf_iterator<char>(file), {}),
+        status.st_mtim.tv_sec, status.st_mtim.tv_nsec, status.st_ctim.tv_sec,
+        status.st_ctim.tv_nsec};
+  }
+  return snapshot;
+}
+
+TEST_F(ZophotosFailure, OrNotLeavesTheDatabaseAsItWas) {
+  const auto before = Snapshot("/shares/A/.zophotos");
+  for (const Arguments& command : COMMANDS) {
+    EXPECT_EQ(0, Zophotos(command).status);
+    EXPECT_EQ(before, Snapshot("/shares/A/.zophotos")) << Text(command);
+  }
+  Program watch(ZophotosCommand({"watch"}));
+  EXPECT_THAT(watch.ReadLine(), HasSubstr("watching"));
+  EXPECT_EQ(before, Snapshot("/shares/A/.zophotos"));
+}
+
+TEST_F(ZophotosFailure, LeavesNothingInTheTemporaryFolder) {
+  const auto before = PathsBelow("/tmp");
+  for (const Arguments& command : COMMANDS) {
+    Zophotos(command);
+  }
+  EXPECT_EQ(before, PathsBelow("/tmp"));
+}
+
+} // namespace
+} // namespace orva::test
