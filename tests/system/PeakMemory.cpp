@@ -34,4 +34,8 @@ long PeakMemory::Growth() const {
   return std::max(0L, ReadKibibytes(directory_ + "status", "VmHWM") - begin_);
 }
 
+long PeakOf(pid_t pid) {
+  return ReadKibibytes("/proc/" + std::to_string(pid) + "/status", "VmHWM");
+}
+
 } // namespace orva::test

@@ -21,6 +21,9 @@ private:
   long begin_;
 };
 
+/// KiB that the process `pid` has used at the most. Throws std::runtime_error.
+long PeakOf(pid_t pid);
+
 /// Whether the tests and the daemon are built with a sanitizer, which keeps freed memory.
 constexpr bool isSanitized =
 #if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)

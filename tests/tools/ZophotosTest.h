@@ -17,6 +17,9 @@ using Arguments = std::vector<std::string>;
 /// Runs the inspector. `output` as in Program::Streams.
 Outcome Zophotos(Arguments arguments, const std::string& output = "");
 
+/// Where ZophotosTest::Copy puts a copy of the merged database.
+inline const std::string COPY = "/tmp/copy/zophotos.db";
+
 /// The command line of the inspector, for Program.
 Arguments ZophotosCommand(Arguments arguments);
 
@@ -34,7 +37,6 @@ protected:
 
   /// A copy of the merged database for a test to spoil, at COPY.
   static Database Copy();
-  static inline const std::string COPY = "/tmp/copy/zophotos.db";
 
   /// Runs the inspector on the copy.
   static Outcome OnCopy(Arguments arguments, const std::string& output = "");

@@ -1,0 +1,352 @@
+// The inspector beside the daemon at work: what a watch sees, and that nobody waits for a reader.
+
+#include "PeakMemory.h"
+#include "ZophotosTest.h"
+
+#include "system/Deadline.h"
+
+#include <nlohmann/json.hpp>
+
+#include <algorithm>
+#include <chrono>
+#include <csignal>
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <memory>
+#include <stdexcept>
+#include <thread>
+
+namespace orva::test {
+namespace {
+
+namespace fs = std::filesystem;
+using nlohmann::json;
+using ::testing::AllOf;
+using ::testing::ContainsRegex;
+using ::testing::EndsWith;
+using ::testing::HasSubstr;
+using ::testing::MatchesRegex;
+
+const std::string LOCATOR = "/tmp/zophotodbmerger.conf";
+
+/// How many times a process has read from a file or a pipe.
+long Reads(pid_t pid) {
+  std::ifstream file("/proc/" + std::to_string(pid) + "/io");
+  for (std::string name, value; file >> name >> value;) {
+    if (name == "syscr:") {
+      return std::stol(value);
+    }
+  }
+  throw std::runtime_error("no syscr of " + std::to_string(pid));
+}
+
+class ZophotosWatch : public ZophotosTest {
+protected:
+  /// Starts a watch, and waits until it has seen the database.
+  void Start(const Arguments& options = {"--json"}) {
+    Arguments arguments{"watch"};
+    arguments.insert(arguments.end(), options.begin(), options.end());
+    watch = std::make_unique<Program>(ZophotosCommand(arguments));
+    first = watch->ReadLine();
+  }
+
+  /// Waits until the watch has looked several times.
+  void AwaitLooks() const {
+    // A look reads at least the locator file, twice up to its end.
+    const long enough = Reads(watch->Pid()) + 10;
+    const auto end = std::chrono::steady_clock::now() + DEADLINE;
+    while (Reads(watch->Pid()) < enough) {
+      ASSERT_LT(std::chrono::steady_clock::now(), end) << "the watch does not look";
+      std::this_thread::yield();
+    }
+  }
+
+  /// The next line without its time.
+  std::string Next() {
+    const std::string line = watch->ReadLine();
+    const json object = json::parse(line, nullptr, false);
+    EXPECT_THAT(object.value("time", ""),
+                MatchesRegex("20[0-9]{2}-[0-9]{2}-[0-9]{2}T[0-9]{2}:[0-9]{2}:[0-9]{2}Z"))
+        << line;
+    const std::size_t event = line.find(R"("event")");
+    return event == std::string::npos ? line : line.substr(event);
+  }
+
+  /// Reads "changed" lines until as many files and folders were removed; true when nothing else
+  /// has come.
+  bool AwaitRemoval(int folders, int files) {
+    while (folders > 0 || files > 0) {
+      const json line = json::parse(watch->ReadLine(), nullptr, false);
+      if (line.value("event", "") != "changed" || line.value("files_added", -1) != 0 ||
+          line.value("folders_added", -1) != 0) {
+        return false;
+      }
+      folders -= line.value("folders_removed", 0);
+      files -= line.value("files_removed", 0);
+    }
+    return folders == 0 && files == 0;
+  }
+
+  std::unique_ptr<Program> watch;
+  std::string first;
+};
+
+const std::string OPENED_A =
+    R"("event":"opened","database":"/shares/A//.zophotos/zophotos.db","folders":8,"files":4})";
+
+TEST_F(ZophotosWatch, BeginsWithTheDatabase) {
+  Start({});
+  EXPECT_THAT(first,
+              MatchesRegex("20[0-9-]+ [0-9:]+  watching " + MERGED + ": 8 folders, 4 files"));
+  Start();
+  EXPECT_THAT(first, EndsWith("Z\"," + OPENED_A));
+}
+
+TEST_F(ZophotosWatch, TellsOfAMerge) {
+  Start();
+  onB.AddFolder("New/", 5);
+  onB.AddPhoto("New/1.jpg", 7, 3001);
+  onB.AddPhoto("Old/4.jpg", 7, 3002);
+  Merge(b);
+  EXPECT_EQ(
+      Next(),
+      R"("event":"changed","folders_added":1,"folders_removed":0,"files_added":2,"files_removed":0,"volumes":[{"volume":"/shares/B/","transcoded":3,"total":5}]})");
+}
+
+TEST_F(ZophotosWatch, TellsOfAMergeInText) {
+  Start({});
+  onB.AddFolder("New/", 5);
+  onB.AddPhoto("Old/4.jpg", 7, 3002);
+  Merge(b);
+  EXPECT_THAT(watch->ReadLine(),
+              MatchesRegex("20[0-9-]+ [0-9:]+  \\+1 folder \\+1 file; /shares/B/ 2 of 4 photos "
+                           "transcoded"));
+  onB.DeletePhoto("Old/4.jpg", 3003);
+  onB.DeletePhoto("Old/1.jpg", 3004);
+  Merge(b);
+  EXPECT_THAT(watch->ReadLine(), MatchesRegex(".*  -2 files; /shares/B/ 0 of 2 photos transcoded"));
+}
+
+TEST_F(ZophotosWatch, TellsOfWhatWentAndCameInOne) {
+  Start();
+  onB.AddPhoto("Old/4.jpg", 7, 3002);
+  onB.DeletePhoto("Old/1.jpg", 3003);
+  Merge(b);
+  EXPECT_THAT(Next(), HasSubstr(R"("files_added":1,"files_removed":1,)"));
+}
+
+TEST_F(ZophotosWatch, TellsOfAWriteThatChangesNothing) {
+  Start({});
+  Database(MERGED).Run("UPDATE Status SET mdate = 1001");
+  EXPECT_THAT(watch->ReadLine(), EndsWith("  written, nothing added or removed"));
+}
+
+TEST_F(ZophotosWatch, TellsOfAnUnplug) {
+  Start();
+  appliance.Handle(Unplugged(b.Path()));
+  EXPECT_TRUE(AwaitRemoval(2, 1));
+}
+
+TEST_F(ZophotosWatch, SaysNothingWhileNothingChanges) {
+  Start();
+  MergedDatabase(a.Path()).Files();
+  Zophotos({"check"});
+  appliance.Barrier();
+  const std::string locator = Appliance::Locator();
+  std::ofstream(LOCATOR) << locator;
+  AwaitLooks();
+  onB.AddPhoto("Old/4.jpg", 7, 3002);
+  Merge(b);
+  EXPECT_THAT(Next(), HasSubstr(R"("event":"changed","folders_added":0)"));
+  AwaitLooks();
+  onB.AddPhoto("Old/5.jpg", 7, 3003);
+  Merge(b);
+  EXPECT_THAT(
+      Next(),
+      HasSubstr(
+          R"("files_added":1,"files_removed":0,"volumes":[{"volume":"/shares/B/","transcoded":3,)"));
+}
+
+TEST_F(ZophotosWatch, FollowsTheDatabaseToAnotherMaster) {
+  Start();
+  appliance.Handle(Unplugged(a.Path()));
+  EXPECT_THAT(
+      watch->ReadLineWith("/shares/B"),
+      EndsWith(
+          R"("event":"opened","database":"/shares/B//.zophotos/zophotos.db","folders":1,"files":0})"));
+  Merge(b);
+  EXPECT_THAT(Next(), HasSubstr(R"("folders_added":2,"folders_removed":0,"files_added":1,)"));
+}
+
+TEST_F(ZophotosWatch, TellsOnceThatTheDatabaseIsLost) {
+  Start();
+  const std::string locator = Appliance::Locator();
+  std::ofstream(LOCATOR) << "zophotos_db_path=\n";
+  EXPECT_EQ(
+      Next(),
+      R"("event":"lost","reason":"no merged database: /tmp/zophotodbmerger.conf names none at this moment"})");
+  AwaitLooks();
+  std::ofstream(LOCATOR) << locator;
+  EXPECT_EQ(Next(), OPENED_A);
+}
+
+TEST_F(ZophotosWatch, WaitsForADatabase) {
+  const std::string locator = Appliance::Locator();
+  fs::remove(LOCATOR);
+  Start({});
+  EXPECT_THAT(first, EndsWith("  no merged database: there is no file /tmp/zophotodbmerger.conf, "
+                              "which the daemon writes when it starts"));
+  std::ofstream(LOCATOR) << locator;
+  EXPECT_THAT(watch->ReadLine(), EndsWith("8 folders, 4 files"));
+}
+
+TEST_F(ZophotosWatch, SeesAnotherFileInTheDatabasesPlace) {
+  Copy();
+  Start({"--json", "--database", COPY});
+  fs::rename(COPY, COPY + ".old");
+  EXPECT_EQ(Next(),
+            R"("event":"lost","reason":"no merged database: )" + COPY + R"( does not exist"})");
+  fs::copy_file(MERGED, COPY + ".new");
+  Database(COPY + ".new").Run("DELETE FROM Files");
+  fs::rename(COPY + ".new", COPY);
+  EXPECT_EQ(Next(), R"("event":"opened","database":")" + COPY + R"(","folders":8,"files":0})");
+}
+
+TEST_F(ZophotosWatch, TakesALockForNoNews) {
+  const Database copy = Copy();
+  Start({"--json", "--database", COPY});
+  copy.Run("BEGIN EXCLUSIVE");
+  copy.Run("DELETE FROM Files WHERE name = '1.jpg'");
+  copy.Run("COMMIT");
+  EXPECT_THAT(Next(), HasSubstr(R"("files_removed":1)"));
+}
+
+TEST_F(ZophotosWatch, EndsBySignals) {
+  for (const int signal : {SIGINT, SIGTERM}) {
+    Start();
+    watch->Signal(signal);
+    EXPECT_EQ(128 + signal, watch->WaitForEnd());
+  }
+}
+
+TEST_F(ZophotosWatch, EndsWhenNobodyReadsItsLines) {
+  Start();
+  watch->CloseOutput();
+  onB.AddPhoto("Old/4.jpg", 7, 3002);
+  Merge(b);
+  EXPECT_EQ(128 + SIGPIPE, watch->WaitForEnd());
+}
+
+TEST_F(ZophotosWatch, MakesNoMergeFail) {
+  std::vector<std::unique_ptr<Program>> others;
+  for (int i = 0; i < 4; ++i) {
+    others.push_back(std::make_unique<Program>(ZophotosCommand({"watch"})));
+    others.back()->ReadLine();
+  }
+  Start();
+  appliance.TakeLog();
+  for (int i = 0; i < 20; ++i) {
+    onB.AddPhotos("Old/", 50, 3000 + i, i * 50 + 100);
+    for (const LogLine& line : appliance.Handle(TranscodedBatch(b.Path()))) {
+      EXPECT_NE(Error("").priority, line.priority) << line.text;
+    }
+  }
+  EXPECT_THAT(watch->ReadLineWith(R"("transcoded":1001,)"), HasSubstr(R"("total":1003)"));
+}
+
+/// A merged database with more than what goes into a pipe.
+class ZophotosSlowReader : public ZophotosTest {
+protected:
+  void SetUp() override {
+    ZophotosTest::SetUp();
+    onB.AddFolder("Many/", 1);
+    onB.AddPhotos("Many/", PHOTOS, 3000);
+    Merge(b);
+  }
+
+  static constexpr int PHOTOS = 4000;
+};
+
+TEST_F(ZophotosSlowReader, KeepsNoMergeFromCommitting) {
+  Program slowCsv(ZophotosCommand({"export", "--csv"}));
+  Program slowLines(ZophotosCommand({"export", "--jsonl"}));
+  Program slowFind(ZophotosCommand({"find", "*"}));
+  Program slowList(ZophotosCommand({"ls", "B/Many", "--json"}));
+  const std::vector<Program*> slow{&slowCsv, &slowLines, &slowFind, &slowList};
+  for (Program* const program : slow) {
+    EXPECT_NE("(end)", program->ReadLine());
+  }
+  onB.AddPhoto("Old/late.jpg", 7, 4000);
+  onB.AddPhoto("Many/late.jpg", 7, 4000);
+  Merge(b);
+  EXPECT_THAT(MergedDatabase(a.Path()).Files(),
+              ::testing::Contains("/shares/B/Old/late.jpg|7|7|/shares/B/"));
+  // They were all held up, and end with the state that they began with.
+  for (const auto& [program, rest] :
+       std::vector<std::pair<Program*, int>>{{&slowCsv, PHOTOS + 4},
+                                             {&slowLines, PHOTOS + 3},
+                                             {&slowFind, PHOTOS + 12},
+                                             {&slowList, PHOTOS - 1}}) {
+    std::string output;
+    program->ReadToEnd(output, output);
+    EXPECT_EQ(rest, std::count(output.begin(), output.end(), '\n'));
+    EXPECT_EQ(std::string::npos, output.find("late"));
+    EXPECT_EQ(0, program->WaitForEnd());
+  }
+}
+
+TEST_F(ZophotosSlowReader, HasItsPrivateCopyWhereItIsTold) {
+  Copy().Run("WITH RECURSIVE n(i) AS (SELECT 1 UNION ALL SELECT i + 1 FROM n WHERE i < 50000) "
+             "INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT 1, i, "
+             "1, 'x', 1 FROM n");
+  fs::create_directory("/tmp/space");
+  setenv("SQLITE_TMPDIR", "/tmp/space", 1);
+  Program program(ZophotosCommand({"--database", COPY, "export", "--csv"}));
+  unsetenv("SQLITE_TMPDIR");
+  program.ReadLine();
+  std::string links;
+  for (const auto& file :
+       fs::directory_iterator("/proc/" + std::to_string(program.Pid()) + "/fd")) {
+    links += fs::read_symlink(file).string() + '\n';
+  }
+  EXPECT_THAT(links, ContainsRegex("\n/tmp/space/[^\n]* \\(deleted\\)\n"));
+  EXPECT_THAT(links, ::testing::Not(HasSubstr(COPY)));
+}
+
+/// The peak of an export of the copy in KiB, while the last `rest` rows of it are not yet taken.
+long PeakOfExport(const Database& copy, int rows, int rest) {
+  copy.Run("DELETE FROM Files");
+  copy.Run("DELETE FROM Folders WHERE folder_id != 1");
+  copy.Run("WITH RECURSIVE n(i) AS (SELECT 2 UNION ALL SELECT i + 1 FROM n WHERE i < 101) INSERT "
+           "INTO Folders(folder_id, parent_folder_id, name, modified_date, volume) SELECT i, 1, "
+           "'/shares/A/' || i || '/', 1, '/shares/A/' FROM n");
+  copy.Run("WITH RECURSIVE n(i) AS (SELECT 1 UNION ALL SELECT i + 1 FROM n WHERE i < "
+           "CAST(? AS INTEGER)) INSERT INTO Files(folder_id, name, modified_date, volume, "
+           "created_date) SELECT 2 + i % 100, hex(i) || '.jpg', 1, '/shares/A/', 1 FROM n",
+           {std::to_string(rows)});
+  Program program(ZophotosCommand({"--database", COPY, "export", "--csv"}));
+  for (int i = 0; i < rows - rest; ++i) {
+    program.ReadLine();
+  }
+  const long peak = PeakOf(program.Pid());
+  std::string output;
+  program.ReadToEnd(output, output);
+  EXPECT_EQ(rest + 1, std::count(output.begin(), output.end(), '\n'));
+  EXPECT_EQ(0, program.WaitForEnd());
+  return peak;
+}
+
+TEST_F(ZophotosSlowReader, HoldsUpAnExportOfConstantMemory) {
+  if (isSanitized) {
+    GTEST_SKIP() << "a sanitizer keeps freed memory";
+  }
+  const Database copy = Copy();
+  const long few = PeakOfExport(copy, 3000, 2500);
+  const long many = PeakOfExport(copy, 200'000, 2500);
+  // The caches of SQLite take four.
+  EXPECT_LT(many - few, 6 * 1024) << few << " KiB, " << many << " KiB";
+}
+
+} // namespace
+} // namespace orva::test

@@ -1,0 +1,305 @@
+// What names and numbers of a merged database from elsewhere can do to the inspector and to the
+// terminal behind it.
+
+#include "ZophotosTest.h"
+
+#include "system/Deadline.h"
+
+#include <nlohmann/json.hpp>
+
+#include <fcntl.h>
+#include <poll.h>
+#include <sys/ioctl.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <array>
+#include <chrono>
+#include <clocale>
+#include <cstdlib>
+#include <cwchar>
+#include <sstream>
+#include <stdexcept>
+
+namespace orva::test {
+namespace {
+
+using nlohmann::json;
+using ::testing::AllOf;
+using ::testing::Each;
+using ::testing::HasSubstr;
+using ::testing::IsEmpty;
+using ::testing::Le;
+using ::testing::Not;
+
+/// A pseudo terminal of a width.
+class Terminal {
+public:
+  explicit Terminal(int columns) : master_(posix_openpt(O_RDWR | O_NOCTTY | O_CLOEXEC)) {
+    const winsize size{.ws_row = 24,
+                       .ws_col = static_cast<unsigned short>(columns),
+                       .ws_xpixel = 0,
+                       .ws_ypixel = 0};
+    if (master_ == -1 || grantpt(master_) != 0 || unlockpt(master_) != 0 ||
+        ioctl(master_, TIOCSWINSZ, &size) != 0) {
+      throw std::runtime_error("no pseudo terminal");
+    }
+  }
+  Terminal(const Terminal&) = delete;
+  Terminal& operator=(const Terminal&) = delete;
+  ~Terminal() { close(master_); }
+
+  /// Runs the inspector with its output and its messages on the terminal, and returns the lines.
+  Lines Run(const Arguments& arguments) const {
+    Program program(ZophotosCommand(arguments), {.output = ptsname(master_)});
+    std::string text;
+    std::array<char, 4096> chunk{};
+    pollfd ready{master_, POLLIN, 0};
+    const auto deadline = std::chrono::milliseconds(DEADLINE).count();
+    while (poll(&ready, 1, static_cast<int>(deadline)) == 1) {
+      const ssize_t size = read(master_, chunk.data(), chunk.size());
+      if (size <= 0) { // the program has closed it
+        break;
+      }
+      text.append(chunk.data(), static_cast<std::size_t>(size));
+    }
+    program.WaitForEnd();
+    std::erase(text, '\r');
+    Lines lines;
+    std::istringstream stream(text);
+    for (std::string line; std::getline(stream, line);) {
+      lines.push_back(line);
+    }
+    return lines;
+  }
+
+private:
+  int master_; ///< owned
+};
+
+/// Columns that a text takes; -1 when it has what is not printable.
+int Columns(const std::string& text) {
+  std::wstring wide(text.size() + 1, L'\0');
+  const std::size_t length = std::mbstowcs(wide.data(), text.c_str(), wide.size());
+  return length == std::string::npos ? -1 : wcswidth(wide.c_str(), length);
+}
+
+class ZophotosTerminal : public ZophotosTest {
+protected:
+  void SetUp() override {
+    ZophotosTest::SetUp();
+    ASSERT_NE(nullptr, std::setlocale(LC_CTYPE, "C.UTF-8"));
+    const Database copy = Copy();
+    const auto add = [&copy](const std::string& name) {
+      copy.Run("INSERT INTO Folders(parent_folder_id, name, modified_date, volume) VALUES(2, "
+               "'/shares/A/' || ? || '/', 1, '/shares/' || ? || '/')",
+               {name, name});
+      copy.Run("INSERT INTO Statistics(volume, photos_xcoded, photos_total, last_updated_time) "
+               "VALUES('/shares/' || ? || '/', 12345, 99999, 1700000000)",
+               {name});
+    };
+    std::string combining;
+    std::string wide;
+    for (int i = 0; i < 60; ++i) {
+      combining += "e\u0301";
+      wide += "写";
+    }
+    for (const std::string& name :
+         {combining, wide, wide + "x", "a" + combining + "b" + wide, std::string(100, 'l')}) {
+      add(name);
+    }
+  }
+
+  static Lines OnCopy(int columns, Arguments arguments) {
+    arguments.insert(arguments.begin(), {"--database", COPY});
+    return Terminal(columns).Run(arguments);
+  }
+
+  /// The widths of the lines.
+  static std::vector<int> Widths(const Lines& lines) {
+    std::vector<int> widths(lines.size());
+    std::transform(lines.begin(), lines.end(), widths.begin(), Columns);
+    return widths;
+  }
+};
+
+TEST_F(ZophotosTerminal, TablesFitIt) {
+  for (const int columns : {20, 40, 60, 80, 120, 200}) {
+    SCOPED_TRACE(columns);
+    const Lines list = OnCopy(columns, {"ls", "-l", "A"});
+    EXPECT_EQ(8U, list.size());
+    EXPECT_THAT(Widths(list), Each(AllOf(Le(columns), testing::Gt(0))));
+    Lines status = OnCopy(columns, {"status"});
+    EXPECT_EQ(14U, status.size());
+    status.erase(status.begin(), status.begin() + 4);
+    EXPECT_THAT(Widths(status), Each(AllOf(Le(columns), testing::Gt(0))));
+  }
+}
+
+TEST_F(ZophotosTerminal, TakesShortenedNamesBeforeFiguresAreLeftOut) {
+  const Lines status = OnCopy(80, {"status"});
+  ASSERT_EQ(14U, status.size());
+  EXPECT_THAT(status[4], AllOf(HasSubstr("VOLUME"), HasSubstr("MERGED UP TO")));
+  EXPECT_THAT(status[13],
+              AllOf(HasSubstr("…"), HasSubstr("12345/99999"), HasSubstr("2023-11-14 22:13:20")));
+  EXPECT_THAT(status[5], HasSubstr("/shares/A/ "));
+}
+
+TEST_F(ZophotosTerminal, ShowsBarsWhereThereIsRoomForThem) {
+  EXPECT_THAT(OnCopy(120, {"status"}).at(5), HasSubstr("██████████ 100 %"));
+  EXPECT_THAT(OnCopy(70, {"status"}).at(5), AllOf(Not(HasSubstr("█")), HasSubstr("100 %")));
+}
+
+TEST_F(ZophotosTerminal, TablesAreWholeWhereThereIsNone) {
+  EXPECT_THAT(ZophotosTest::OnCopy({"ls", "-l", "A"}).output,
+              AllOf(HasSubstr("  " + std::string(100, 'l') + "/\n"), Not(HasSubstr("…"))));
+}
+
+TEST_F(ZophotosTerminal, ColumnsStandBelowEachOther) {
+  const Lines list = OnCopy(80, {"ls", "-l", "A"});
+  const auto name = Columns(list.at(0).substr(0, list[0].find("NAME")));
+  for (const std::string& line : {list.at(1), list.at(2), list.at(3), list.at(6)}) {
+    // The name is the last column; what precedes it ends in the gap.
+    const std::size_t begin = line.rfind("  ") + 2;
+    EXPECT_EQ(name, Columns(line.substr(0, begin))) << line;
+  }
+}
+
+TEST_F(ZophotosTerminal, GetsNoControlCharactersFromNames) {
+  const Database copy(COPY);
+  // Escape sequences in 7 and 8 bits, line ends, deletions, a line separator and half a character.
+  for (const char* const bytes :
+       {"1b5d303b781b5c", "c29b326a", "0d0a0908", "7f", "e280a8", "e58699c3"}) {
+    copy.Run("INSERT INTO Folders(parent_folder_id, name, modified_date, volume) SELECT 2, "
+             "'/shares/A/' || CAST(x'" +
+             std::string(bytes) + "' AS TEXT) || '/', 1, CAST(x'" + bytes + "' AS TEXT)");
+    copy.Run("INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT "
+             "999, CAST(x'" +
+             std::string(bytes) + "' AS TEXT), 1, CAST(x'" + bytes + "' AS TEXT), 1");
+    copy.Run("INSERT INTO Statistics(volume, photos_xcoded, photos_total, last_updated_time) "
+             "VALUES(CAST(x'" +
+             std::string(bytes) + "' AS TEXT), 1, 1, 1)");
+    copy.Run("UPDATE Status SET mc_version = CAST(x'" + std::string(bytes) + "' AS TEXT)");
+  }
+  for (const Arguments& arguments :
+       {Arguments{"status"}, Arguments{"ls", "A"}, Arguments{"ls", "-l", "A"}, Arguments{"tree"},
+        Arguments{"find", "*"}, Arguments{"check"}, Arguments{"ls", "\x1b[2J\xff"},
+        Arguments{"tree", "\u009b2J"}}) {
+    const Lines lines = OnCopy(200, arguments);
+    EXPECT_THAT(lines, Not(IsEmpty()));
+    for (const std::string& line : lines) {
+      EXPECT_NE(-1, Columns(line)) << arguments[0] << ": " << ::testing::PrintToString(line);
+    }
+  }
+}
+
+class ZophotosHostile : public ZophotosTest {
+protected:
+  static void AddFolder(const std::string& path, const std::string& file) {
+    const Database copy(COPY);
+    copy.Run("INSERT INTO Folders(parent_folder_id, name, modified_date, volume) VALUES(-1, ?, 1, "
+             "'/shares/A/')",
+             {path});
+    copy.Run("INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT "
+             "max(folder_id), ?, 1, '/shares/A/', 1 FROM Folders",
+             {file});
+  }
+
+  /// Every command ends by itself, well or as `check` says, and JSON is JSON.
+  static void ExpectNoHarm() {
+    for (const Arguments& arguments :
+         {Arguments{"status"}, Arguments{"ls"}, Arguments{"ls", "-l"}, Arguments{"ls", "A"},
+          Arguments{"ls", "/"}, Arguments{"tree"}, Arguments{"tree", "/"}, Arguments{"find", "*"},
+          Arguments{"find", "-i", "*/*a*"}, Arguments{"find", "-0", "a"}, Arguments{"check"},
+          Arguments{"export", "--csv"}}) {
+      const Outcome outcome = ZophotosTest::OnCopy(arguments);
+      EXPECT_THAT(outcome.status, testing::AnyOf(0, 1)) << ::testing::PrintToString(arguments);
+      EXPECT_EQ("", outcome.error) << ::testing::PrintToString(arguments);
+      if (arguments[0] != "find" || arguments[1] != "-0") {
+        EXPECT_NE("", outcome.output) << ::testing::PrintToString(arguments);
+      }
+    }
+    for (const Arguments& arguments :
+         {Arguments{"status"}, Arguments{"ls", "A"}, Arguments{"tree"}, Arguments{"find", "*"},
+          Arguments{"check"}, Arguments{"export"}}) {
+      Arguments inJson{"--json"};
+      inJson.insert(inJson.end(), arguments.begin(), arguments.end());
+      std::istringstream lines(ZophotosTest::OnCopy(inJson).output);
+      int count = 0;
+      for (std::string line; std::getline(lines, line); ++count) {
+        ASSERT_TRUE(json::accept(line)) << arguments[0];
+      }
+      EXPECT_GT(count, 0) << arguments[0];
+    }
+    Program watch(ZophotosCommand({"watch", "--json", "--database", COPY}));
+    EXPECT_THAT(watch.ReadLine(), HasSubstr(R"("event":"opened")"));
+  }
+};
+
+TEST_F(ZophotosHostile, PathsWithoutASeparatorAtTheirEndDoNoHarm) {
+  Copy();
+  for (const char* const path : {"", "/", "//", "x", "/shares", "/shares/A", "/shares/A/Pictures",
+                                 "/shares/A//", "/shares/A//x", "/shares/A/Pictures/Summerhouse"}) {
+    AddFolder(path, "a");
+  }
+  AddFolder("/shares/A/empty/", "");
+  ExpectNoHarm();
+}
+
+TEST_F(ZophotosHostile, APathOfAMillionBytesDoesNoHarm) {
+  Copy();
+  AddFolder("/shares/A/" + std::string(1'000'000, 'a') + "/", std::string(1'000'000, 'b'));
+  AddFolder("/shares/A/" + std::string(1'000'000, '\xff') + "/", std::string(1'000'000, '*'));
+  ExpectNoHarm();
+}
+
+TEST_F(ZophotosHostile, APathOfThousandsOfFoldersDoesNoHarm) {
+  Copy();
+  std::string path = "/shares/A/";
+  for (int i = 0; i < 3000; ++i) {
+    path += "a/";
+  }
+  AddFolder(path, "a");
+  ExpectNoHarm();
+  const std::string tree = OnCopy({"tree", "--json"}).output;
+  EXPECT_EQ(3008, std::count(tree.begin(), tree.end(), '\n'));
+}
+
+TEST_F(ZophotosHostile, NumbersOutOfRangeDoNoHarm) {
+  for (const char* const number :
+       {"9223372036854775807", "-9223372036854775808", "-1", "253402300800", "-62135596801",
+        "67768036191676800", "1e300", "x"}) {
+    SCOPED_TRACE(number);
+    const Database copy = Copy();
+    for (const char* const sql :
+         {"UPDATE Files SET modified_date = ?1, created_date = ?1",
+          "UPDATE Folders SET modified_date = ?1", "UPDATE Status SET mdate = ?1, etype = ?1",
+          "UPDATE Statistics SET photos_xcoded = ?1, photos_total = ?1, last_updated_time = ?1"}) {
+      copy.Run(sql, {number});
+    }
+    ExpectNoHarm();
+    copy.Run("UPDATE Statistics SET photos_xcoded = 1, photos_total = ?", {number});
+    ExpectNoHarm();
+    copy.Run("UPDATE Statistics SET photos_xcoded = ?, photos_total = 1", {number});
+    ExpectNoHarm();
+  }
+}
+
+TEST_F(ZophotosHostile, IdsAtTheirEndDoNoHarm) {
+  const Database copy = Copy();
+  copy.Run("UPDATE Files SET folder_id = 9223372036854775807, file_id = 9223372036854775807 WHERE "
+           "name = 'top.jpg'");
+  copy.Run("UPDATE Folders SET folder_id = -9223372036854775808 WHERE name = '/shares/B/'");
+  ExpectNoHarm();
+}
+
+TEST_F(ZophotosHostile, NamesOfOtherTypesDoNoHarm) {
+  const Database copy = Copy();
+  copy.Run("UPDATE Folders SET name = zeroblob(100), volume = x'ff00' WHERE name = '/shares/B/'");
+  copy.Run("UPDATE Files SET name = zeroblob(3), volume = x'' WHERE name = 'top.jpg'");
+  copy.Run("UPDATE Statistics SET volume = zeroblob(5) WHERE volume = '/shares/B/'");
+  ExpectNoHarm();
+}
+
+} // namespace
+} // namespace orva::test
