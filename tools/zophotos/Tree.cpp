@@ -36,7 +36,8 @@ bool ComesBefore(const StoredFolder& a, const StoredFolder& b) {
 }
 
 std::vector<StoredFolder> ReadFolders(const std::string& path, const std::string& top) {
-  SQLite::Database database = OpenDatabase(path);
+  // Counting reads every file of a large library.
+  SQLite::Database database = CopyDatabase(path);
   SQLite::Statement query(database,
                           "SELECT name, (SELECT count(*) FROM Files f WHERE f.folder_id = "
                           "o.folder_id) FROM Folders o WHERE name >= ? AND name < ?");
