@@ -2,6 +2,8 @@
 
 #include "Deadline.h"
 
+#include "support/ThreadState.h"
+
 #include <fcntl.h>
 #include <poll.h>
 #include <spawn.h>
@@ -11,12 +13,10 @@
 #include <unistd.h>
 
 #include <csignal>
-#include <filesystem>
 #include <fstream>
 #include <ostream>
 #include <stdexcept>
 #include <system_error>
-#include <thread>
 #include <utility>
 
 namespace orva::test {
@@ -93,19 +93,9 @@ DaemonProcess::End DaemonProcess::AwaitEnd() {
 }
 
 void DaemonProcess::AwaitSystemCall(long number) const {
-  const std::filesystem::path tasks = "/proc/" + std::to_string(pid_) + "/task";
-  const auto end = std::chrono::steady_clock::now() + DEADLINE;
-  while (std::chrono::steady_clock::now() < end) {
-    for (const auto& task : std::filesystem::directory_iterator(tasks)) {
-      // "number arguments...", or "running"
-      long current = -1;
-      if (std::ifstream(task.path() / "syscall") >> current && current == number) {
-        return;
-      }
-    }
-    std::this_thread::yield();
+  if (!test::AwaitSystemCall(pid_, number)) {
+    throw std::runtime_error("the daemon has not come to system call " + std::to_string(number));
   }
-  throw std::runtime_error("the daemon has not come to system call " + std::to_string(number));
 }
 
 std::vector<std::string> DaemonProcess::StandardOutput() const {

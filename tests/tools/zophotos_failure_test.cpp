@@ -4,8 +4,10 @@
 #include "ZophotosTest.h"
 
 #include "hostile/CraftedLog.h"
+#include "support/ThreadState.h"
 
 #include <sys/stat.h>
+#include <sys/syscall.h>
 
 #include <cstdlib>
 #include <filesystem>
@@ -226,6 +228,18 @@ TEST_F(ZophotosFailure, OfALockThatStays) {
   }
 }
 
+TEST_F(ZophotosFailure, IsNotALockThatGoes) {
+  const Database locked = Copy();
+  for (const char* const command : {"status", "ls"}) {
+    locked.Run("BEGIN EXCLUSIVE");
+    Program program(ZophotosCommand({"--database", COPY, command}));
+    EXPECT_TRUE(AwaitSystemCall(program.Pid(), SYS_clock_nanosleep));
+    locked.Run("COMMIT");
+    EXPECT_THAT(program.ReadLineWith("A/"), Not(HasSubstr("(end)")));
+    EXPECT_EQ(0, program.WaitForEnd());
+  }
+}
+
 TEST_F(ZophotosFailure, OfAMergeThatWasInterrupted) {
   constexpr std::uint32_t pageSize = 4096;
   Copy();
@@ -262,11 +276,14 @@ TEST_F(ZophotosFailure, OfSpaceForAPrivateCopy) {
       "FROM n");
   const Volume small("Small", "64k");
   setenv("SQLITE_TMPDIR", small.Path().c_str(), 1);
-  const Outcome outcome = OnCopy({"status"});
+  for (const Arguments& command : {Arguments{"status"}, Arguments{"tree"}, Arguments{"find", "*"},
+                                   Arguments{"check"}, Arguments{"export", "--csv"}}) {
+    SCOPED_TRACE(Text(command));
+    ExpectFailure(OnCopy(command), 5,
+                  "no space for a private copy of " + COPY +
+                      "; SQLITE_TMPDIR names another folder for it");
+  }
   unsetenv("SQLITE_TMPDIR");
-  ExpectFailure(outcome, 5,
-                "no space for a private copy of " + COPY +
-                    "; SQLITE_TMPDIR names another folder for it");
 }
 
 /// All that is in the folder of a database: the bytes of its files and the times of their last

@@ -284,6 +284,12 @@ TEST_F(ZophotosFind, IgnoresTheCaseOnlyWhenAsked) {
   ExpectOutput(OnCopy({"find", "--ignore-case", "äö"}), "/shares/A/ÄÖ/\n");
 }
 
+TEST_F(ZophotosFind, AQuestionMarkIsACharacter) {
+  AddRows(Copy(), "'/shares/A/ÄÖ/'");
+  ExpectOutput(OnCopy({"find", "?Ö"}), "/shares/A/ÄÖ/\n");
+  ExpectOutput(OnCopy({"find", "[Ä]?"}), "/shares/A/ÄÖ/\n");
+}
+
 TEST_F(ZophotosFind, MayBeginAPatternWithADash) {
   AddRows(Copy(), "'/shares/A/-x/'");
   ExpectOutput(OnCopy({"find", "--", "-x"}), "/shares/A/-x/\n");
