@@ -7,6 +7,7 @@
 #include <sys/stat.h>
 
 #include <cerrno>
+#include <cstdint>
 #include <cstring>
 #include <fcntl.h>
 #include <fstream>
@@ -67,8 +68,10 @@ std::set<std::string> AllowedCalls(const Unit& unit, const Groups& groups) {
     for (std::string word; words >> word;) {
       std::set<std::string> calls;
       Expand(groups, word, calls);
-      for (const std::string& call : calls) {
-        takes ? static_cast<void>(allowed.erase(call)) : static_cast<void>(allowed.insert(call));
+      if (takes) {
+        std::erase_if(allowed, [&calls](const auto& call) { return calls.contains(call); });
+      } else {
+        allowed.merge(calls);
       }
     }
   }

@@ -43,6 +43,7 @@ bool Unit::Is(const std::string& name) const {
 
 std::vector<std::string> Unit::Names() const {
   std::vector<std::string> names;
+  names.reserve(settings_.size());
   for (const auto& [name, values] : settings_) {
     names.push_back(name);
   }
