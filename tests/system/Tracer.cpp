@@ -3,7 +3,6 @@
 #include <fcntl.h>
 #include <sys/ptrace.h>
 #include <sys/syscall.h>
-#include <sys/uio.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -11,6 +10,7 @@
 #include <cerrno>
 #include <csignal>
 #include <filesystem>
+#include <fstream>
 #include <stdexcept>
 #include <system_error>
 
@@ -168,13 +168,12 @@ std::string Tracer::Data(const SystemCall& call) const {
   if (call.number != SYS_write && call.number != SYS_pwrite64 && call.number != SYS_sendto) {
     return {};
   }
+  // An address of the other process, which its memory as a file has as an offset.
+  std::ifstream memory("/proc/" + std::to_string(process_) + "/mem", std::ios::binary);
   std::string data(std::min<std::size_t>(call.arguments[2], 65536), '\0');
-  const iovec here{data.data(), data.size()};
-  // An address of the other process, which is not ours to look at.
-  const iovec there{reinterpret_cast<void*>(call.arguments[1]), // NOLINT(performance-no-int-to-ptr)
-                    data.size()};
-  const ssize_t size = process_vm_readv(process_, &here, 1, &there, 1, 0);
-  data.resize(static_cast<std::size_t>(std::max<ssize_t>(size, 0)));
+  memory.seekg(static_cast<std::streamoff>(call.arguments[1]));
+  memory.read(data.data(), static_cast<std::streamsize>(data.size()));
+  data.resize(static_cast<std::size_t>(memory.gcount()));
   return data;
 }
 
