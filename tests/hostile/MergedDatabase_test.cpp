@@ -33,13 +33,6 @@ const auto EITHER = Case::Expected::Either;
 const std::string DEAR_VALUE =
     "instr(hex(zeroblob(500000)), hex(zeroblob(200000)) || 'x' || hex(zeroblob(200000)))";
 
-const std::string ENDLESS = "WITH RECURSIVE n(x) AS (SELECT 1 UNION ALL SELECT x + 1 FROM n) ";
-
-std::string Rows(int count) {
-  return "WITH RECURSIVE n(x) AS (SELECT 1 UNION ALL SELECT x + 1 FROM n WHERE x < " +
-         std::to_string(count) + ") ";
-}
-
 std::vector<std::string> TriggersOn(const std::string& table, const std::string& action) {
   std::vector<std::string> triggers;
   for (const char* const event : {"INSERT", "UPDATE", "DELETE"}) {
