@@ -88,7 +88,6 @@ private:
 
   sqlite3* handle_ = nullptr; ///< owned; released by Close
   std::string path_;
-  long long fileSize_ = 0;                 ///< bytes, when it was opened
   std::unique_ptr<Connection> connection_; ///< what belongs to the open handle; null while closed
 };
 
