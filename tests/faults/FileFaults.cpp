@@ -104,7 +104,16 @@ std::vector<Fault> Stops(const std::string& files) {
   return {Stop("stopped process", {.files = files, .effect = Effect::Stop}),
           Stop("lost power", {.files = files, .effect = Effect::PowerLoss}),
           Stop("lost power that spared the database",
-               {.files = files, .effect = Effect::PowerLoss, .lost = "-journal"})};
+               {.files = files, .effect = Effect::PowerLoss, .lost = "-journal"}),
+          Stop("lost power that took names",
+               {.files = files, .effect = Effect::PowerLoss, .takesNames = true})};
+}
+
+void LosePowerBehind(const Action& action, const std::string& files) {
+  RunApart({.files = files, .effect = FaultPlan::Effect::PowerLoss, .takesNames = true}, [&] {
+    action();
+    FaultVfs::Current()->Stop();
+  });
 }
 
 } // namespace orva::test

@@ -34,6 +34,13 @@ bool Fails(Request request, const std::string& path) {
   return true;
 }
 
+/// Tells the faults what is about to change.
+void Touching(const char* path) {
+  if (FaultVfs::Current() != nullptr) {
+    FaultVfs::Current()->Touching(path);
+  }
+}
+
 std::string PathOf(int descriptor) {
   std::error_code error;
   return std::filesystem::read_symlink("/proc/self/fd/" + std::to_string(descriptor), error);
@@ -45,6 +52,8 @@ int WrapRename(const char* from, const char* to) {
   if (Fails(Request::Rename, from)) {
     return -1;
   }
+  Touching(from);
+  Touching(to);
   const int result = RealRename(from, to);
   if (result == 0 && FaultVfs::Current() != nullptr) {
     FaultVfs::Current()->Renamed(from, to);
@@ -68,6 +77,7 @@ int WrapUnlink(const char* path) {
   if (Fails(Request::Delete, path)) {
     return -1;
   }
+  Touching(path);
   const int result = RealUnlink(path);
   if (result == 0 && FaultVfs::Current() != nullptr) {
     FaultVfs::Current()->Deleted(path);

@@ -109,6 +109,12 @@ TEST_F(StopTest, NewDatabaseAmongLeftoversIsCompleteOrNotThere) {
   ExpectToSurvive(CreationAmongLeftovers(), Stops(MERGED));
 }
 
+TEST_F(StopTest, NewDatabaseLastsFromTheEndOfItsCreation) {
+  const Scenario creation = Creation();
+  LosePowerBehind(creation.operation, MERGED);
+  EXPECT_EQ(creation.after, Content());
+}
+
 TEST_F(StopTest, RemovalOfAllVolumesCanBeRepeated) {
   ExpectToSurvive(Clearing(), Stops(MERGED));
 }
