@@ -1,5 +1,6 @@
 #pragma once
 
+#include <cerrno>
 #include <functional>
 #include <map>
 #include <memory>
@@ -23,9 +24,10 @@ struct FaultPlan {
   std::vector<Request> requests{}; ///< the kinds concerned
   int nth = 0;                     ///< the one that goes wrong, counted from 1; 0 for none
   Effect effect = Effect::Error;
-  int code = 0;         ///< SQLite's result code for an Error
-  bool forGood = false; ///< an Error of all that follow as well
-  std::string lost{};   ///< a part of the paths of the files whose content a PowerLoss takes
+  int code = 0;          ///< SQLite's result code for an Error
+  bool forGood = false;  ///< an Error of all that follow as well
+  int systemError = EIO; ///< errno of an Error, where the daemon asks past SQLite
+  std::string lost{};    ///< a part of the paths of the files whose content a PowerLoss takes
   /// A PowerLoss undoes every creation, renaming and deletion since the directory was last synced.
   bool takesNames = false;
 };
@@ -59,8 +61,9 @@ public:
   /// Counts a request. Returns whether it has to fail; ends the process where the plan says so.
   /// `partly` is what is done of it all the same in either case.
   bool Fails(Request request, const char* path, const std::function<void()>& partly = {});
-  /// The result code of the failure.
+  /// The failure as a result code of SQLite's, and as an errno.
   int Code() const noexcept { return plan_.code; }
+  int SystemError() const noexcept { return plan_.systemError; }
 
   // Keep up what a power loss leaves of the files. Directories last at once.
   void Touching(const char* path); ///< before the name may go to another file, or to none

@@ -3,8 +3,6 @@
 
 #include "FaultVfs.h"
 
-#include <sqlite3.h>
-
 #include <unistd.h>
 
 #include <cerrno>
@@ -30,7 +28,7 @@ bool Fails(Request request, const std::string& path) {
   if (faults == nullptr || !faults->Fails(request, path.c_str())) {
     return false;
   }
-  errno = faults->Code() == SQLITE_FULL ? ENOSPC : EIO;
+  errno = faults->SystemError();
   return true;
 }
 
