@@ -9,6 +9,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <csignal>
+#include <ctime>
 #include <filesystem>
 #include <fstream>
 #include <stdexcept>
@@ -168,13 +169,24 @@ std::string Tracer::Data(const SystemCall& call) const {
   if (call.number != SYS_write && call.number != SYS_pwrite64 && call.number != SYS_sendto) {
     return {};
   }
-  // An address of the other process, which its memory as a file has as an offset.
+  return Memory(call.arguments[1], std::min<std::uint64_t>(call.arguments[2], 65536));
+}
+
+std::chrono::nanoseconds Tracer::Sleep(const SystemCall& call) const {
+  timespec time{};
+  if (call.number == SYS_clock_nanosleep) {
+    Memory(call.arguments[2], sizeof time).copy(reinterpret_cast<char*>(&time), sizeof time);
+  }
+  return std::chrono::seconds(time.tv_sec) + std::chrono::nanoseconds(time.tv_nsec);
+}
+
+std::string Tracer::Memory(std::uint64_t address, std::size_t size) const {
   std::ifstream memory("/proc/" + std::to_string(process_) + "/mem", std::ios::binary);
-  std::string data(std::min<std::size_t>(call.arguments[2], 65536), '\0');
-  memory.seekg(static_cast<std::streamoff>(call.arguments[1]));
-  memory.read(data.data(), static_cast<std::streamsize>(data.size()));
-  data.resize(static_cast<std::size_t>(memory.gcount()));
-  return data;
+  std::string bytes(size, '\0');
+  memory.seekg(static_cast<std::streamoff>(address));
+  memory.read(bytes.data(), static_cast<std::streamsize>(size));
+  bytes.resize(static_cast<std::size_t>(memory.gcount()));
+  return bytes;
 }
 
 } // namespace orva::test
