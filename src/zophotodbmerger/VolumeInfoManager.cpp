@@ -17,6 +17,17 @@ constexpr double MINIMUM_FREE_SPACE = 209715200.0;
 /// the service's messages says how many there are.
 constexpr std::size_t MOST_VOLUMES = 1000;
 
+/// Bytes of all mount points together, each of which may be as long as a path. Mergers copy them.
+constexpr std::size_t MOST_BYTES = 1 << 20;
+
+bool HasRoomFor(const VolumeInfo& added, const std::vector<VolumeInfo>& volumes) {
+  std::size_t bytes = added.mountPoint.size();
+  for (const VolumeInfo& volume : volumes) {
+    bytes += volume.mountPoint.size();
+  }
+  return volumes.size() < MOST_VOLUMES && bytes <= MOST_BYTES;
+}
+
 } // namespace
 
 VolumeInfoManager* VolumeInfoManager::instance = nullptr;
@@ -37,7 +48,7 @@ void VolumeInfoManager::addVolumeInfo(VolumeInfo& volume) {
   if (std::find(volumes.begin(), volumes.end(), volume) != volumes.end()) {
     return;
   }
-  if (volumes.size() == MOST_VOLUMES) {
+  if (!HasRoomFor(volume, volumes)) {
     syslog(LOG_LOCAL1 | LOG_ERR, "There are too many volumes to register the mountpoint %s",
            volume.mountPoint.c_str());
     return;

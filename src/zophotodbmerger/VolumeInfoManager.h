@@ -17,8 +17,8 @@ public:
   static VolumeInfoManager& Instance();
 
   /// Registers a copy of `volume` when something exists at its mount point. A record that is
-  /// there already stays as it is, so the first event that names a volume fixes its capacity. Of
-  /// more than 1000 volumes the further ones are refused, with a line in the log.
+  /// there already stays as it is, so the first event that names a volume fixes its capacity. More
+  /// than 1000 volumes, or than a mebibyte of mount points, are refused with a line in the log.
   void addVolumeInfo(VolumeInfo& volume);
 
   /// Forgets `volume`, also as the master.

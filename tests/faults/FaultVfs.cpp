@@ -25,10 +25,16 @@ std::string ContentOf(const std::string& path) {
 /// A file of ours: SQLite gives room for this and, behind it, for the real file.
 struct FaultFile : sqlite3_file {
   const char* path; ///< SQLite keeps it until the file is closed; null for a temporary file
+  /// The name of a new journal lasts with its content: SQLite synchronises its directory as well.
+  bool lastsWithItsName;
 };
 
 const char* PathOf(sqlite3_file* file) {
   return static_cast<FaultFile*>(file)->path;
+}
+
+std::string DirectoryOf(const char* path) {
+  return std::filesystem::path(path).parent_path();
 }
 
 sqlite3_file* Real(sqlite3_file* file) {
@@ -77,6 +83,9 @@ int Sync(sqlite3_file* file, int flags) {
   }
   const int code = Real(file)->pMethods->xSync(Real(file), flags);
   current->Synced(PathOf(file));
+  if (static_cast<FaultFile*>(file)->lastsWithItsName) {
+    current->Synced(DirectoryOf(PathOf(file)).c_str());
+  }
   return code;
 }
 
@@ -161,10 +170,14 @@ int Open(sqlite3_vfs* vfs, const char* path, sqlite3_file* file, int flags, int*
   if (Fails(Request::Open, path)) {
     return current->Code();
   }
-  current->Opening(path);
+  current->Touching(path);
   static_cast<FaultFile*>(file)->path = path;
+  static_cast<FaultFile*>(file)->lastsWithItsName =
+      (flags & SQLITE_OPEN_CREATE) != 0 &&
+      (flags & (SQLITE_OPEN_MAIN_JOURNAL | SQLITE_OPEN_WAL)) != 0;
   const int code = Real(vfs)->xOpen(Real(vfs), path, Real(file), flags, outFlags);
   if (Real(file)->pMethods != nullptr) {
+    current->Opened(path);
     file->pMethods = &METHODS;
   }
   return code;
@@ -174,8 +187,12 @@ int Delete(sqlite3_vfs* vfs, const char* path, int syncDirectory) {
   if (Fails(Request::Delete, path)) {
     return current->Code();
   }
+  current->Touching(path);
   const int code = Real(vfs)->xDelete(Real(vfs), path, syncDirectory);
   current->Deleted(path);
+  if (syncDirectory != 0) {
+    current->Synced(DirectoryOf(path).c_str());
+  }
   return code;
 }
 
@@ -251,37 +268,62 @@ bool FaultVfs::Fails(Request request, const char* path, const std::function<void
   return fails;
 }
 
-void FaultVfs::Opening(const char* path) {
-  if (plan_.effect == FaultPlan::Effect::PowerLoss && Concerns(path)) {
-    durable_.try_emplace(path, ContentOf(path));
+bool FaultVfs::Follows(const char* path) const {
+  return plan_.effect == FaultPlan::Effect::PowerLoss && Concerns(path);
+}
+
+void FaultVfs::Touching(const char* path) {
+  if (Follows(path) && !files_.contains(path) && std::filesystem::exists(path)) {
+    files_[path] = std::make_shared<std::string>(ContentOf(path));
+    lasting_[path] = files_[path];
+  }
+}
+
+void FaultVfs::Opened(const char* path) {
+  if (Follows(path)) {
+    files_.try_emplace(path, std::make_shared<std::string>());
   }
 }
 
 void FaultVfs::Synced(const char* path) {
-  if (plan_.effect == FaultPlan::Effect::PowerLoss && Concerns(path) &&
-      std::filesystem::is_regular_file(path)) {
-    durable_[path] = ContentOf(path);
+  if (plan_.effect != FaultPlan::Effect::PowerLoss || path == nullptr) {
+    return;
+  }
+  if (std::filesystem::is_directory(path)) {
+    DirectorySynced(path);
+  } else if (const auto file = files_.find(path); file != files_.end()) {
+    *file->second = ContentOf(path);
   }
 }
 
+void FaultVfs::DirectorySynced(const std::string& path) {
+  const auto isThere = [&](const auto& file) { return DirectoryOf(file.first.c_str()) == path; };
+  std::erase_if(lasting_, isThere);
+  std::ranges::copy_if(files_, std::inserter(lasting_, lasting_.end()), isThere);
+}
+
 void FaultVfs::Deleted(const char* path) {
-  durable_.erase(path);
+  files_.erase(path);
 }
 
 void FaultVfs::Renamed(const char* from, const char* to) {
-  auto file = durable_.extract(from);
-  durable_.erase(to);
+  auto file = files_.extract(from);
+  files_.erase(to);
   if (!file.empty()) {
     file.key() = to;
-    durable_.insert(std::move(file));
+    files_.insert(std::move(file));
   }
 }
 
 void FaultVfs::Stop() const {
-  for (const auto& [path, content] : durable_) {
-    if (path.find(plan_.lost) != std::string::npos && std::filesystem::exists(path)) {
-      std::ofstream(path, std::ios::binary | std::ios::trunc) << content;
+  for (const auto& [path, content] : files_) {
+    if (path.find(plan_.lost) == std::string::npos) {
+      *content = ContentOf(path);
     }
+    std::filesystem::remove(path);
+  }
+  for (const auto& [path, content] : plan_.takesNames ? lasting_ : files_) {
+    std::ofstream(path, std::ios::binary) << *content;
   }
   _exit(STOPPED);
 }

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <cerrno>
 #include <functional>
 #include <map>
 #include <memory>
@@ -23,9 +24,12 @@ struct FaultPlan {
   std::vector<Request> requests{}; ///< the kinds concerned
   int nth = 0;                     ///< the one that goes wrong, counted from 1; 0 for none
   Effect effect = Effect::Error;
-  int code = 0;         ///< SQLite's result code for an Error
-  bool forGood = false; ///< an Error of all that follow as well
-  std::string lost{};   ///< a part of the paths of the files that a PowerLoss concerns
+  int code = 0;          ///< SQLite's result code for an Error
+  bool forGood = false;  ///< an Error of all that follow as well
+  int systemError = EIO; ///< errno of an Error, where the daemon asks past SQLite
+  std::string lost{};    ///< a part of the paths of the files whose content a PowerLoss takes
+  /// A PowerLoss undoes every creation, renaming and deletion since the directory was last synced.
+  bool takesNames = false;
 };
 
 /// SQLite's file system with a fault in it, for as long as the object lives: the default one of
@@ -46,6 +50,9 @@ public:
   int Seen() const noexcept { return seen_; }
   int Failed() const noexcept { return failed_; }
 
+  /// Ends the process now, as the plan says how.
+  [[noreturn]] void Stop() const;
+
   // For the file system's side.
 
   /// The one that lives; null when there is none.
@@ -54,25 +61,32 @@ public:
   /// Counts a request. Returns whether it has to fail; ends the process where the plan says so.
   /// `partly` is what is done of it all the same in either case.
   bool Fails(Request request, const char* path, const std::function<void()>& partly = {});
-  /// The result code of the failure.
+  /// The failure as a result code of SQLite's, and as an errno.
   int Code() const noexcept { return plan_.code; }
+  int SystemError() const noexcept { return plan_.systemError; }
 
-  // Keep up what a power loss leaves of the files.
-  void Opening(const char* path);
-  void Synced(const char* path);
+  // Keep up what a power loss leaves of the files. Directories last at once.
+  void Touching(const char* path); ///< before the name may go to another file, or to none
+  void Opened(const char* path);
+  void Synced(const char* path); ///< a file or a directory
   void Deleted(const char* path);
   void Renamed(const char* from, const char* to);
 
 private:
+  /// What a power loss leaves of the content of files.
+  using Files = std::map<std::string, std::shared_ptr<std::string>>;
+
   struct Registration;
 
   bool Concerns(const char* path) const;
-  [[noreturn]] void Stop() const;
+  bool Follows(const char* path) const;
+  void DirectorySynced(const std::string& path);
 
   FaultPlan plan_;
   int seen_ = 0;
   int failed_ = 0;
-  std::map<std::string, std::string> durable_; ///< content by path, as of the last sync
+  Files files_;   ///< by the path that they have
+  Files lasting_; ///< by the path that they had when their directory was last synced
   std::unique_ptr<Registration> registration_;
 };
 

@@ -36,14 +36,17 @@ protected:
 
   static std::vector<std::string> Rows() { return Database(PATH).Run("SELECT a FROM t"); }
 
-  /// Inserts a row in a process of its own, which ends at the first request of a kind. Returns its
-  /// exit status.
+  /// Inserts a row in a process of its own, which ends at a request of a kind, or behind all of
+  /// them where the plan names none. Returns its exit status.
   static int InsertApart(const FaultPlan& plan,
                          const std::string& pragma = "PRAGMA synchronous = FULL") {
     const pid_t child = fork();
     if (child == 0) {
       const FaultVfs faults(plan);
       Insert(pragma);
+      if (plan.nth == 0) {
+        faults.Stop();
+      }
       _exit(0);
     }
     int status = 0;
@@ -61,6 +64,8 @@ protected:
   }
 
   static constexpr const char* PATH = "/tmp/test.db";
+  inline static const FaultPlan LOSS_OF_NAMES = {
+      .files = PATH, .effect = Effect::PowerLoss, .takesNames = true};
 };
 
 TEST_F(FaultVfsTest, WithoutAnErrorItOnlyCounts) {
@@ -119,6 +124,32 @@ TEST_F(FaultVfsTest, APowerLossSparesWhatWasSynced) {
 TEST_F(FaultVfsTest, APowerLossTakesWhatWasNotSynced) {
   EXPECT_EQ(FaultVfs::STOPPED, InsertApart(LossOf("-journal"), "PRAGMA synchronous = OFF"));
   EXPECT_THAT(Rows(), ElementsAre("1")); // no journal that says otherwise
+}
+
+// Where it ends behind its last request, the journal is deleted, and the directory synced at the
+// most when the journal was made.
+
+TEST_F(FaultVfsTest, APowerLossTakesADeletionWhoseDirectoryWasNotSynced) {
+  EXPECT_EQ(FaultVfs::STOPPED, InsertApart(LOSS_OF_NAMES));
+  EXPECT_THAT(Rows(), IsEmpty()); // by the journal
+}
+
+TEST_F(FaultVfsTest, APowerLossSparesADeletionWhoseDirectoryWasSynced) {
+  EXPECT_EQ(FaultVfs::STOPPED, InsertApart(LOSS_OF_NAMES, "PRAGMA synchronous = EXTRA"));
+  EXPECT_THAT(Rows(), ElementsAre("1"));
+}
+
+TEST_F(FaultVfsTest, APowerLossTakesACreationWhoseDirectoryWasNotSynced) {
+  for (const bool takesNames : {false, true}) {
+    const std::string journal = std::string(PATH) + "-journal";
+    std::filesystem::remove(journal);
+    FaultPlan plan = LOSS_OF_NAMES;
+    plan.takesNames = takesNames;
+    plan.requests = {Request::Sync};
+    plan.nth = 1; // the journal's, whose first also is the directory's
+    EXPECT_EQ(FaultVfs::STOPPED, InsertApart(plan));
+    EXPECT_EQ(!takesNames, std::filesystem::exists(journal));
+  }
 }
 
 } // namespace

@@ -39,6 +39,10 @@ constexpr Kind KINDS[] = {
 const std::vector<Request> CHANGES = {Request::Open,   Request::Write,    Request::Sync,
                                       Request::Delete, Request::Truncate, Request::Rename};
 
+/// What comes between two changes: a stop there leaves none of the change that follows, of a write
+/// not even its half.
+const std::vector<Request> LOOKS = {Request::Read, Request::Size, Request::Lock, Request::Access};
+
 Fault::Tally Run(const FaultPlan& plan, const Action& action) {
   const FaultVfs faults(plan);
   action();
@@ -76,8 +80,7 @@ Fault Error(const Kind& kind, const std::string& files, const std::string& place
           }};
 }
 
-Fault Stop(const char* name, FaultPlan plan) {
-  plan.requests = CHANGES;
+Fault Stop(const char* name, const FaultPlan& plan) {
   return {.name = name,
           .run =
               [=](int nth, const Action& action) {
@@ -101,10 +104,22 @@ std::vector<Fault> FileErrors(const std::string& files, const std::string& place
 
 std::vector<Fault> Stops(const std::string& files) {
   using Effect = FaultPlan::Effect;
-  return {Stop("stopped process", {.files = files, .effect = Effect::Stop}),
-          Stop("lost power", {.files = files, .effect = Effect::PowerLoss}),
-          Stop("lost power that spared the database",
-               {.files = files, .effect = Effect::PowerLoss, .lost = "-journal"})};
+  return {
+      Stop("stopped process", {.files = files, .requests = CHANGES, .effect = Effect::Stop}),
+      Stop("stopped process, between changes",
+           {.files = files, .requests = LOOKS, .effect = Effect::Stop}),
+      Stop("lost power", {.files = files, .requests = CHANGES, .effect = Effect::PowerLoss}),
+      Stop("lost power that spared the database",
+           {.files = files, .requests = CHANGES, .effect = Effect::PowerLoss, .lost = "-journal"}),
+      Stop("lost power that took names",
+           {.files = files, .requests = CHANGES, .effect = Effect::PowerLoss, .takesNames = true})};
+}
+
+void LosePowerBehind(const Action& action, const std::string& files) {
+  RunApart({.files = files, .effect = FaultPlan::Effect::PowerLoss, .takesNames = true}, [&] {
+    action();
+    FaultVfs::Current()->Stop();
+  });
 }
 
 } // namespace orva::test

@@ -3,8 +3,6 @@
 
 #include "FaultVfs.h"
 
-#include <sqlite3.h>
-
 #include <unistd.h>
 
 #include <cerrno>
@@ -13,6 +11,15 @@
 #include <string>
 
 namespace orva::test {
+
+// By the names that the linker gives the real ones, and looks for.
+int RealRename(const char* from, const char* to) __asm__("__real_rename");
+int RealFsync(int descriptor) __asm__("__real_fsync");
+int RealUnlink(const char* path) __asm__("__real_unlink");
+int WrapRename(const char* from, const char* to) __asm__("__wrap_rename");
+int WrapFsync(int descriptor) __asm__("__wrap_fsync");
+int WrapUnlink(const char* path) __asm__("__wrap_unlink");
+
 namespace {
 
 /// Whether the call has to fail; errno says why.
@@ -21,8 +28,15 @@ bool Fails(Request request, const std::string& path) {
   if (faults == nullptr || !faults->Fails(request, path.c_str())) {
     return false;
   }
-  errno = faults->Code() == SQLITE_FULL ? ENOSPC : EIO;
+  errno = faults->SystemError();
   return true;
+}
+
+/// Tells the faults what is about to change.
+void Touching(const char* path) {
+  if (FaultVfs::Current() != nullptr) {
+    FaultVfs::Current()->Touching(path);
+  }
 }
 
 std::string PathOf(int descriptor) {
@@ -31,55 +45,42 @@ std::string PathOf(int descriptor) {
 }
 
 } // namespace
-} // namespace orva::test
 
-// The linker's names.
-// NOLINTBEGIN(bugprone-reserved-identifier)
-extern "C" {
-
-int __real_rename(const char* from, const char* to);
-int __real_fsync(int descriptor);
-int __real_unlink(const char* path);
-int __wrap_rename(const char* from, const char* to);
-int __wrap_fsync(int descriptor);
-int __wrap_unlink(const char* path);
-
-int __wrap_rename(const char* from, const char* to) {
-  using namespace orva::test;
+int WrapRename(const char* from, const char* to) {
   if (Fails(Request::Rename, from)) {
     return -1;
   }
-  const int result = __real_rename(from, to);
+  Touching(from);
+  Touching(to);
+  const int result = RealRename(from, to);
   if (result == 0 && FaultVfs::Current() != nullptr) {
     FaultVfs::Current()->Renamed(from, to);
   }
   return result;
 }
 
-int __wrap_fsync(int descriptor) {
-  using namespace orva::test;
+int WrapFsync(int descriptor) {
   const std::string path = PathOf(descriptor);
   if (Fails(Request::Sync, path)) {
     return -1;
   }
-  const int result = __real_fsync(descriptor);
+  const int result = RealFsync(descriptor);
   if (result == 0 && FaultVfs::Current() != nullptr) {
     FaultVfs::Current()->Synced(path.c_str());
   }
   return result;
 }
 
-int __wrap_unlink(const char* path) {
-  using namespace orva::test;
+int WrapUnlink(const char* path) {
   if (Fails(Request::Delete, path)) {
     return -1;
   }
-  const int result = __real_unlink(path);
+  Touching(path);
+  const int result = RealUnlink(path);
   if (result == 0 && FaultVfs::Current() != nullptr) {
     FaultVfs::Current()->Deleted(path);
   }
   return result;
 }
 
-} // extern "C"
-// NOLINTEND(bugprone-reserved-identifier)
+} // namespace orva::test

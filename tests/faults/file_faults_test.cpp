@@ -1,10 +1,14 @@
 // The merged database where the file system under it, or under a volume's catalog, fails.
 
+#include "FaultVfs.h"
 #include "FileFaults.h"
 
 #include "Database.h"
 
 #include "orvautil/Core.h"
+
+#include <cerrno>
+#include <string>
 
 namespace orva::test {
 namespace {
@@ -38,6 +42,20 @@ protected:
     scenario.name = "a first creation among leftovers";
     scenario.files = files;
     return scenario;
+  }
+
+  /// Runs the scenario with a sync that its file system does not support: the last one, or one so
+  /// many before it.
+  static void FailUnsupported(const Scenario& scenario, int beforeLast) {
+    FaultPlan plan{.files = MERGED, .requests = {Request::Sync}, .systemError = EINVAL};
+    {
+      const FaultVfs counting(plan);
+      scenario.operation();
+      plan.nth = counting.Seen() - beforeLast;
+    }
+    LayFiles(scenario.files);
+    const FaultVfs faults(plan);
+    scenario.operation();
   }
 };
 
@@ -77,6 +95,20 @@ TEST_F(FileFaultTest, RemovalOfAllVolumesCanBeRepeated) {
   ExpectToSurvive(Clearing(), FileErrors(MERGED, "merged database"));
 }
 
+// The last syncs of a creation are those of the new file and of its directory.
+
+TEST_F(FileFaultTest, DirectoryThatCannotBeSyncedIsNoFailure) {
+  const Scenario creation = Creation();
+  FailUnsupported(creation, 0);
+  EXPECT_EQ(creation.after, Content());
+}
+
+TEST_F(FileFaultTest, DatabaseThatCannotBeSyncedIsAFailure) {
+  const Scenario creation = Creation();
+  EXPECT_THROW(FailUnsupported(creation, 1), std::string);
+  EXPECT_EQ(creation.before, Content());
+}
+
 // The process is stopped, or the appliance loses its power.
 
 using StopTest = FileFaultTest;
@@ -107,6 +139,12 @@ TEST_F(StopTest, NewDatabaseIsCompleteOrNotThere) {
 
 TEST_F(StopTest, NewDatabaseAmongLeftoversIsCompleteOrNotThere) {
   ExpectToSurvive(CreationAmongLeftovers(), Stops(MERGED));
+}
+
+TEST_F(StopTest, NewDatabaseLastsFromTheEndOfItsCreation) {
+  const Scenario creation = Creation();
+  LosePowerBehind(creation.operation, MERGED);
+  EXPECT_EQ(creation.after, Content());
 }
 
 TEST_F(StopTest, RemovalOfAllVolumesCanBeRepeated) {

@@ -22,10 +22,6 @@ const auto EITHER = Case::Expected::Either;
 /// The values of a folder.
 const std::string FOLDER_VALUES = "x, -1, 'p' || x || '/', 'n', 4, 0, 0, 0, 0, 0, 0, 0";
 
-const std::string ENDLESS = "WITH RECURSIVE n(x) AS (SELECT 1 UNION ALL SELECT x + 1 FROM n) ";
-const std::string HUGE_ROWS = "WITH RECURSIVE n(x) AS (SELECT 1 UNION ALL SELECT x + 1 FROM n "
-                              "WHERE x < 1000000000) ";
-
 const std::string FOLDER_COLUMNS =
     "id INTEGER PRIMARY KEY, folderId INTEGER, path TEXT, name TEXT, category INTEGER, "
     "lastModifiedDate INTEGER, isBackup INTEGER, isHidden INTEGER, isSystem INTEGER, isDeleted "
@@ -57,7 +53,27 @@ std::vector<std::string> Redeclared(const std::string& table, const std::string&
 const std::string FOLDER_ROWS_BUT_PATH =
     "INSERT INTO Folders(id, folderId, name, category, lastModifiedDate, isBackup, isHidden, "
     "isSystem, isDeleted, status, lastUpdatedDate) " +
-    Replaced(HUGE_ROWS, "1000000000", "100") + "SELECT x, -1, 'n', 4, 0, 0, 0, 0, 0, 0, 0 FROM n";
+    Rows(100) + "SELECT x, -1, 'n', 4, 0, 0, 0, 0, 0, 0, 0 FROM n";
+
+/// Very many folders of one path, which are `deleted` or not.
+std::vector<std::string> FoldersOfOnePath(const std::string& deleted) {
+  return {"INSERT INTO Folders " + Rows(Extent(50'000, 1'000'000)) +
+          "SELECT x + 10, -1, 'a/', 'a', 4, 0, 0, 0, 0, " + deleted + ", 0, 0 FROM n"};
+}
+
+/// Many rows of one file, and many transcodings of it with that `status`, beside some indices.
+std::vector<std::string> FilesTimesTranscodings(const std::string& status,
+                                                const std::vector<std::string>& indices = {}) {
+  std::vector<std::string> statements{
+      "DROP TABLE Files", "CREATE TABLE Files(" + Replaced(FILE_COLUMNS, " PRIMARY KEY", "") + ")"};
+  statements.insert(statements.end(), indices.begin(), indices.end());
+  statements.push_back("INSERT INTO Files " + Rows(30'000) +
+                       "SELECT 1, -1, 'a.jpg', 'a.jpg', 3, 0, 0, 0, 0, 0, 3, 0, 'jpg', 0 FROM n");
+  statements.push_back("INSERT INTO Transcodings " + Rows(30'000) +
+                       "SELECT x + 10, 1, 'cb62bbdd389b48898f2e5244977cb2c5', " + status +
+                       ", x FROM n");
+  return statements;
+}
 
 const std::string MEGABYTE = "hex(zeroblob(500000))";
 /// A second or two for the value of each row, in one call.
@@ -74,8 +90,8 @@ const std::vector<Case> CASES = {
                                 FOLDER_VALUES + " FROM n"},
      REFUSED},
     {"FoldersAreAHugeView",
-     {"DROP TABLE Folders", "CREATE VIEW Folders" + FOLDER_NAMES + " AS " + HUGE_ROWS + "SELECT " +
-                                FOLDER_VALUES + " FROM n"},
+     {"DROP TABLE Folders", "CREATE VIEW Folders" + FOLDER_NAMES + " AS " + Rows(1'000'000'000) +
+                                "SELECT " + FOLDER_VALUES + " FROM n"},
      REFUSED},
     {"FilesAreAnEndlessView",
      {"DROP TABLE Files",
@@ -208,32 +224,13 @@ const std::vector<Case> CASES = {
      MERGED_WELL},
 
     // Far too much of it.
-    {"ManyFoldersOfOnePath",
-     {"INSERT INTO Folders " +
-      Replaced(HUGE_ROWS, "1000000000", std::to_string(Extent(50'000, 1'000'000))) +
-      "SELECT x + 10, -1, 'a/', 'a', 4, 0, 0, 0, 0, 0, 0, 0 FROM n"},
-     EITHER},
-    {"ManyDeletedFoldersOfOnePath",
-     {"INSERT INTO Folders " +
-      Replaced(HUGE_ROWS, "1000000000", std::to_string(Extent(50'000, 1'000'000))) +
-      "SELECT x + 10, -1, 'a/', 'a', 4, 0, 0, 0, 0, 1, 0, 0 FROM n"},
-     EITHER},
-    {"ProductOfFilesAndTranscodings",
-     {"DROP TABLE Files", "CREATE TABLE Files(" + Replaced(FILE_COLUMNS, " PRIMARY KEY", "") + ")",
-      "INSERT INTO Files " + Replaced(HUGE_ROWS, "1000000000", "30000") +
-          "SELECT 1, -1, 'a.jpg', 'a.jpg', 3, 0, 0, 0, 0, 0, 3, 0, 'jpg', 0 FROM n",
-      "INSERT INTO Transcodings " + Replaced(HUGE_ROWS, "1000000000", "30000") +
-          "SELECT x + 10, 1, 'cb62bbdd389b48898f2e5244977cb2c5', 1, x FROM n"},
-     REFUSED},
+    {"ManyFoldersOfOnePath", FoldersOfOnePath("0"), EITHER},
+    {"ManyDeletedFoldersOfOnePath", FoldersOfOnePath("1"), EITHER},
+    {"ProductOfFilesAndTranscodings", FilesTimesTranscodings("1"), REFUSED},
     // Where the texts are compared before the ids are, and differ only at their ends.
     {"ProductThatNeverMatches",
-     {"DROP TABLE Files", "CREATE TABLE Files(" + Replaced(FILE_COLUMNS, " PRIMARY KEY", "") + ")",
-      "CREATE INDEX Files_id ON Files(id)",
-      "CREATE INDEX Transcodings_source ON Transcodings(sourceId)",
-      "INSERT INTO Files " + Replaced(HUGE_ROWS, "1000000000", "30000") +
-          "SELECT 1, -1, 'a.jpg', 'a.jpg', 3, 0, 0, 0, 0, 0, 3, 0, 'jpg', 0 FROM n",
-      "INSERT INTO Transcodings " + Replaced(HUGE_ROWS, "1000000000", "30000") +
-          "SELECT x + 10, 1, 'cb62bbdd389b48898f2e5244977cb2c5', 0, x FROM n"},
+     FilesTimesTranscodings("0", {"CREATE INDEX Files_id ON Files(id)",
+                                  "CREATE INDEX Transcodings_source ON Transcodings(sourceId)"}),
      REFUSED},
     {"TwoMebibytesOfText",
      {"UPDATE Folders SET path = printf('%.*c/', 2097152, 'x') WHERE id = 1"},
@@ -253,7 +250,7 @@ const std::vector<Case> CASES = {
     // is in the file once.
     {"LongDefaultInManyRows",
      {"DROP TABLE Folders", "CREATE TABLE Folders(id INTEGER PRIMARY KEY, folderId)",
-      "INSERT INTO Folders " + Replaced(HUGE_ROWS, "1000000000", "100000") + "SELECT x, -1 FROM n",
+      "INSERT INTO Folders " + Rows(100'000) + "SELECT x, -1 FROM n",
       "ALTER TABLE Folders ADD COLUMN path DEFAULT '" + std::string(900'000, 'x') + "'",
       "ALTER TABLE Folders ADD COLUMN name", "ALTER TABLE Folders ADD COLUMN category",
       "ALTER TABLE Folders ADD COLUMN lastModifiedDate",

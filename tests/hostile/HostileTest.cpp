@@ -224,4 +224,9 @@ long long BytesOnMedium(const std::string& path) {
   return bytes;
 }
 
+std::string Rows(int count) {
+  return "WITH RECURSIVE n(x) AS (SELECT 1 UNION ALL SELECT x + 1 FROM n WHERE x < " +
+         std::to_string(count) + ") ";
+}
+
 } // namespace orva::test

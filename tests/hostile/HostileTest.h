@@ -83,4 +83,8 @@ void MakeCatalogFolder();
 /// The bytes that a file or everything in a folder takes on its medium.
 long long BytesOnMedium(const std::string& path);
 
+// The beginnings of statements that read numbers x from n: all from 1 on, or the first `count`.
+const std::string ENDLESS = "WITH RECURSIVE n(x) AS (SELECT 1 UNION ALL SELECT x + 1 FROM n) ";
+std::string Rows(int count);
+
 } // namespace orva::test

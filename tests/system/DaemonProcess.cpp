@@ -13,6 +13,7 @@
 #include <unistd.h>
 
 #include <csignal>
+#include <cstdlib>
 #include <fstream>
 #include <ostream>
 #include <stdexcept>
@@ -53,6 +54,9 @@ DaemonProcess::DaemonProcess(std::string directory, std::string output,
   std::vector<std::string> arguments{DAEMON};
   if (held) {
     arguments = {"/bin/sh", "-c", "kill -STOP $$; exec \"$0\"", DAEMON};
+  }
+  if (const char* launcher = std::getenv("ORVA_TEST_LAUNCHER")) {
+    arguments.insert(arguments.begin(), launcher);
   }
 
   posix_spawn_file_actions_t actions;

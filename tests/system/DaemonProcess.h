@@ -14,7 +14,8 @@ class DaemonProcess {
 public:
   /// Starts the daemon in `directory`, which is made; `environment` ("NAME=value") comes on top
   /// of the test's own. `output` is the file for its standard output. With `held` the process
-  /// waits for SIGCONT before it becomes the daemon. Throws std::system_error.
+  /// waits for SIGCONT before it becomes the daemon. Where the test's environment names a program
+  /// as ORVA_TEST_LAUNCHER, that one becomes the daemon. Throws std::system_error.
   DaemonProcess(std::string directory, std::string output,
                 const std::vector<std::string>& environment = {}, bool held = false);
   DaemonProcess(const DaemonProcess&) = delete;

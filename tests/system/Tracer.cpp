@@ -3,14 +3,15 @@
 #include <fcntl.h>
 #include <sys/ptrace.h>
 #include <sys/syscall.h>
-#include <sys/uio.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
 #include <csignal>
+#include <ctime>
 #include <filesystem>
+#include <fstream>
 #include <stdexcept>
 #include <system_error>
 
@@ -168,14 +169,24 @@ std::string Tracer::Data(const SystemCall& call) const {
   if (call.number != SYS_write && call.number != SYS_pwrite64 && call.number != SYS_sendto) {
     return {};
   }
-  std::string data(std::min<std::size_t>(call.arguments[2], 65536), '\0');
-  const iovec here{data.data(), data.size()};
-  // An address of the other process, which is not ours to look at.
-  const iovec there{reinterpret_cast<void*>(call.arguments[1]), // NOLINT(performance-no-int-to-ptr)
-                    data.size()};
-  const ssize_t size = process_vm_readv(process_, &here, 1, &there, 1, 0);
-  data.resize(static_cast<std::size_t>(std::max<ssize_t>(size, 0)));
-  return data;
+  return Memory(call.arguments[1], std::min<std::uint64_t>(call.arguments[2], 65536));
+}
+
+std::chrono::nanoseconds Tracer::Sleep(const SystemCall& call) const {
+  timespec time{};
+  if (call.number == SYS_clock_nanosleep) {
+    Memory(call.arguments[2], sizeof time).copy(reinterpret_cast<char*>(&time), sizeof time);
+  }
+  return std::chrono::seconds(time.tv_sec) + std::chrono::nanoseconds(time.tv_nsec);
+}
+
+std::string Tracer::Memory(std::uint64_t address, std::size_t size) const {
+  std::ifstream memory("/proc/" + std::to_string(process_) + "/mem", std::ios::binary);
+  std::string bytes(size, '\0');
+  memory.seekg(static_cast<std::streamoff>(address));
+  memory.read(bytes.data(), static_cast<std::streamsize>(size));
+  bytes.resize(static_cast<std::size_t>(memory.gcount()));
+  return bytes;
 }
 
 } // namespace orva::test

@@ -3,6 +3,8 @@
 #include <sys/types.h>
 
 #include <array>
+#include <chrono>
+#include <cstddef>
 #include <cstdint>
 #include <functional>
 #include <map>
@@ -40,9 +42,14 @@ public:
   /// What a write or a send is about to pass on; empty for other calls.
   std::string Data(const SystemCall& call) const;
 
+  /// How long a sleep is about to take; nothing for other calls.
+  std::chrono::nanoseconds Sleep(const SystemCall& call) const;
+
 private:
   void SeizeNewThreads();
   void Release(pid_t thread);
+  /// What the process has at an address.
+  std::string Memory(std::uint64_t address, std::size_t size) const;
 
   pid_t process_;
   std::map<pid_t, bool> held_; ///< by thread

@@ -8,6 +8,7 @@
 #include <sys/syscall.h>
 
 #include <atomic>
+#include <chrono>
 #include <random>
 #include <thread>
 
@@ -17,6 +18,9 @@ namespace {
 using ::testing::ElementsAre;
 using ::testing::IsEmpty;
 using ::testing::StartsWith;
+using namespace std::chrono_literals;
+using std::chrono::duration_cast;
+using std::chrono::milliseconds;
 
 constexpr unsigned SEED = 20'081;
 
@@ -129,8 +133,15 @@ protected:
   }
 
   Lines HandleForErrors(const std::string& message) {
+    appliance.Service().Send(message);
+    return AwaitErrors();
+  }
+
+  /// What has gone wrong until the daemon has handled everything.
+  Lines AwaitErrors() {
+    appliance.Barrier();
     Lines errors;
-    for (const LogLine& line : appliance.Handle(message)) {
+    for (const LogLine& line : appliance.TakeLog()) {
       if (line.priority == Error("").priority) {
         errors.push_back(line.text);
       }
@@ -220,19 +231,40 @@ protected:
     indexer.Commit();
     indexer.Rows().Run("BEGIN EXCLUSIVE");
   }
+
+  /// Has the daemon merge B, and holds it where it is about to have waited for the catalog as long
+  /// as that, or else behind the merge. Returns how long it waits by then.
+  milliseconds MergeUntilWaited(Tracer& tracer, milliseconds time) {
+    appliance.Service().Send(TranscodedBatch(b.Path()));
+    const std::string last = appliance.SendBarrier();
+    milliseconds waited{};
+    tracer.RunUntil([&](const SystemCall& call) {
+      const auto wait = duration_cast<milliseconds>(tracer.Sleep(call));
+      waited += wait;
+      return (wait > milliseconds::zero() && waited >= time) ||
+             tracer.Data(call).find(last) != std::string::npos;
+    });
+    return waited;
+  }
 };
 
-TEST_P(CatalogLocked, ForAWhileIsWaitedFor) {
-  appliance.Service().Send(TranscodedBatch(b.Path()));
-  appliance.Daemon().AwaitSystemCall(SYS_clock_nanosleep);
-  ExpectMerged({1});
-  indexer.Commit();
-  appliance.Barrier();
+TEST_P(CatalogLocked, ForFiveSecondsIsWaitedFor) {
+  {
+    Tracer tracer(appliance.Daemon().Pid());
+    EXPECT_EQ(5s, MergeUntilWaited(tracer, 5s));
+    ExpectMerged({1});
+    indexer.Commit();
+  }
+  EXPECT_THAT(AwaitErrors(), IsEmpty());
   ExpectMerged({2});
 }
 
-TEST_P(CatalogLocked, ForLongFailsTheMerge) {
-  EXPECT_THAT(HandleForErrors(TranscodedBatch(b.Path())),
+TEST_P(CatalogLocked, ForLongerFailsTheMerge) {
+  {
+    Tracer tracer(appliance.Daemon().Pid());
+    EXPECT_EQ(5s, MergeUntilWaited(tracer, 6s));
+  }
+  EXPECT_THAT(AwaitErrors(),
               ElementsAre(::testing::AllOf(StartsWith("Error that we will ignore "),
                                            ::testing::HasSubstr("database is locked"))));
   ExpectMerged({1});

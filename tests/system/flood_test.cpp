@@ -5,6 +5,7 @@
 #include "support/Extent.h"
 
 #include <algorithm>
+#include <climits>
 
 namespace orva::test {
 namespace {
@@ -165,19 +166,41 @@ TEST_F(Flood, ConnectionsThatEndInsideAMessageLeaveNothingBehind) {
   ExpectUnharmed("connections that end inside a message");
 }
 
+/// A spelling of `path` for each number, as long as it may be with `size` bytes.
+std::string Spelling(std::string path, int number, std::size_t size) {
+  for (int bits = number; bits > 0; bits /= 2) {
+    path += bits % 2 == 0 ? "/." : "//.";
+  }
+  return path + Repeated("/.", (size - path.size()) / 2);
+}
+
 TEST_F(Flood, SpellingsOfAMountPointAreABoundedNumberOfVolumes) {
   const int spellings = Extent(5'000, 100'000);
   for (int i = 0; i < spellings; ++i) {
-    std::string path = "/shares";
-    for (int bits = i; bits > 0; bits /= 2) {
-      path += bits % 2 == 0 ? "/." : "//.";
-    }
-    path += Repeated("/.", 1'000);
-    appliance.Service().Send(Notification("Purged", path));
+    appliance.Service().Send(Notification("Purged", Spelling("/shares", i, 2'048)));
   }
   appliance.Barrier();
   appliance.TakeLog();
   ExpectUnharmed("spellings of a mount point");
+}
+
+TEST_F(Flood, LongSpellingsOfAMountPointAreABoundedAmountOfMemory) {
+  constexpr std::size_t longest = PATH_MAX - 2; // and a "/" and an end
+  const Volume a("A", "150g");
+  appliance.Handle(Plugged(a.Path()));
+  appliance.Handle(Scanned(a.Path()));
+  for (int i = 0; i < 1'100; ++i) {
+    appliance.Service().Send(Notification("Scanned", Spelling(a.Path(), i, longest)));
+  }
+  // With each of these a new merger goes through all volumes.
+  const int mergers = Extent(50, 1'000);
+  for (int i = 0; i < mergers; ++i) {
+    appliance.Service().Send(Unplugged("/shares/Other"));
+  }
+  appliance.Barrier();
+  appliance.TakeLog();
+  EXPECT_EQ(Log{Info(":: Scanned")}, appliance.Handle(Scanned(a.Path())));
+  ExpectWithinBounds("long spellings of a mount point");
 }
 
 } // namespace

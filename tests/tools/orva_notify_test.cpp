@@ -487,12 +487,15 @@ TEST_F(OrvaNotify, GoesOnWhenNobodyReadsItsLines) {
 }
 
 TEST_F(OrvaNotify, GoesOnWhenDescriptorsRunOut) {
-#ifdef __SANITIZE_ADDRESS__
-  GTEST_SKIP() << "the sanitizer needs a descriptor itself to look at an object";
-#endif
   service_ = std::make_unique<Program>(
       Arguments{"/bin/sh", "-c", "ulimit -n 12; exec " ORVA_NOTIFY_PROGRAM " serve"});
   ASSERT_EQ(service_->ReadLine(), "listening on " + ORVA_NOTIFICATION_SOCKET);
+  {
+    // The sanitizer opens a pipe when it first meets an object of a class: none may be new later.
+    const Listener first;
+    EXPECT_EQ(RunNotify({"send", "end", "/shares/A"}).line, "sent to 1 client");
+  }
+  EXPECT_EQ(service_->ReadLineWith("gone"), "client 1 gone");
   {
     const std::array<Listener, 12> clients;
     EXPECT_THAT(service_->ReadLineWith("cannot take"),

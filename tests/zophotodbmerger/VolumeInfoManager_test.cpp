@@ -2,6 +2,8 @@
 
 #include "VolumeInfoManager.h"
 
+#include <climits>
+
 namespace orva::test {
 namespace {
 
@@ -69,6 +71,22 @@ TEST_F(VolumeInfoManagerTest, MoreVolumesThanAnybodyHasAreRefused) {
   Remove("/shares/");
   Add(Record(mountPoint, GIB, GIB));
   EXPECT_EQ(mountPoint, MountPoints().back());
+}
+
+TEST_F(VolumeInfoManagerTest, LongerMountPointsThanAnybodyHasAreRefused) {
+  const auto mountPoint = [](std::size_t size) { return "/shares" + std::string(size - 7, '/'); };
+  std::size_t left = 1U << 20U;
+  for (std::size_t size = PATH_MAX - 1; size <= left; --size) {
+    Add(Record(mountPoint(size), GIB, GIB));
+    left -= size;
+  }
+  EXPECT_THAT(Logged(), IsEmpty());
+  Add(Record(mountPoint(left + 1), GIB, GIB));
+  EXPECT_THAT(Logged(), ElementsAre(Error("There are too many volumes to register the mountpoint " +
+                                          mountPoint(left + 1))));
+  Add(Record(mountPoint(left), GIB, GIB));
+  EXPECT_THAT(Logged(), IsEmpty());
+  EXPECT_EQ(mountPoint(left), MountPoints().back());
 }
 
 TEST_F(VolumeInfoManagerTest, VolumesAreKeptInTheOrderOfTheirAdding) {

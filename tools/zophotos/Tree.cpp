@@ -76,12 +76,12 @@ std::vector<Node> MakeTree(const std::vector<StoredFolder>& folders, const std::
   }
   // From the end, the first node of each depth that is met below a parent is its last child.
   std::vector<bool> hasLast;
-  for (auto node = nodes.rbegin(); node != nodes.rend(); ++node) {
-    const bool known = node->depth < hasLast.size() && hasLast[node->depth];
-    node->isLast = !known;
-    hasLast.resize(node->depth + 1, false);
-    hasLast[node->depth] = true;
-  }
+  std::for_each(nodes.rbegin(), nodes.rend(), [&hasLast](Node& node) {
+    const bool known = node.depth < hasLast.size() && hasLast[node.depth];
+    node.isLast = !known;
+    hasLast.resize(node.depth + 1, false);
+    hasLast[node.depth] = true;
+  });
   return nodes;
 }
 

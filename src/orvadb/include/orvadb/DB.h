@@ -47,10 +47,10 @@ public:
   /// opened. Throws std::string.
   long long MeasureFile() const;
 
-  /// Makes sure that the values in `table` are those that were
-  /// stored there: refuses generated columns and, where the connection can write, computed
-  /// defaults, indices on expressions and any number of them, which a stranger may have made so
-  /// dear that a row takes minutes. A table that is not there has none. Throws std::string.
+  /// Makes sure that the values in `table` are those that were stored there: refuses generated
+  /// columns and, where the connection can write, computed defaults, indices on expressions or on
+  /// part of the rows, and very many indices, which a stranger may have made so dear that a row
+  /// takes minutes. A table that is not there has none. Throws std::string.
   void RefuseComputedValues(const std::string& table) const;
 
 protected:
@@ -88,7 +88,6 @@ private:
 
   sqlite3* handle_ = nullptr; ///< owned; released by Close
   std::string path_;
-  long long fileSize_ = 0;                 ///< bytes, when it was opened
   std::unique_ptr<Connection> connection_; ///< what belongs to the open handle; null while closed
 };
 
