@@ -20,9 +20,12 @@ namespace orva::test {
 namespace {
 
 namespace fs = std::filesystem;
+using ::testing::AllOf;
 using ::testing::HasSubstr;
 using ::testing::IsEmpty;
+using ::testing::Lt;
 using ::testing::Not;
+using ::testing::SizeIs;
 
 const std::string LOCATOR = "/tmp/zophotodbmerger.conf";
 
@@ -107,15 +110,22 @@ TEST_F(ZophotosLocator, MayNameWhatIsNoFile) {
 }
 
 TEST_F(ZophotosLocator, CannotSayAnythingToTheTerminal) {
-  Write("zophotos_db_path=/x\x1b[2J\xff\r\n");
-  ExpectNoDatabase(R"(/x\x1b[2J\xff\x0d does not exist)");
+  Write("zophotos_db_path=/x\x1b[2J\xff\u202e\r\n");
+  ExpectNoDatabase(R"(/x\x1b[2J\xff\xe2\x80\xae\x0d does not exist)");
+}
+
+TEST_F(ZophotosLocator, IsReadNoFurtherThanAPathCanBe) {
+  Write("zophotos_db_path=/" + std::string(1 << 20, 'x'));
+  const Outcome outcome = Zophotos({"status"});
+  EXPECT_EQ(5, outcome.status);
+  EXPECT_THAT(outcome.error, AllOf(HasSubstr("/xxx"), SizeIs(Lt(10000))));
 }
 
 /// How the inspector is called wrongly, and what it says.
 TEST(ZophotosUsage, IsToldFromFailure) {
   const std::vector<std::pair<Arguments, std::string>> wrong{
       {{}, "A subcommand is required"},
-      {{"destroy"}, "subcommand"},
+      {{"destroy"}, "destroy"},
       {{"ls", "--nonsense"}, "--nonsense"},
       {{"ls", "A", "B"}, "B"},
       {{"status", "A"}, "A"},

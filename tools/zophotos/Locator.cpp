@@ -2,6 +2,8 @@
 
 #include "Failure.h"
 
+#include <algorithm>
+#include <array>
 #include <filesystem>
 #include <fstream>
 #include <string_view>
@@ -31,8 +33,11 @@ std::string FindDatabase() {
   if (!file) {
     ThrowNoDatabase(std::string(LOCATOR) + " cannot be read");
   }
-  std::string line;
-  std::getline(file, line);
+  // Whoever wrote it: no path is longer.
+  std::array<char, 8192> text{};
+  file.read(text.data(), text.size());
+  std::string line(text.data(), static_cast<std::size_t>(file.gcount()));
+  line.resize(std::min(line.size(), line.find('\n')));
   if (!line.starts_with(KEY)) {
     ThrowNoDatabase(std::string(LOCATOR) + " has no " + std::string(KEY) + " in its first line");
   }

@@ -59,6 +59,12 @@ std::string_view Tail(std::string_view printable, std::size_t width) {
   return printable.substr(begin);
 }
 
+/// Marks that have a terminal show what follows in another order than it is written.
+bool IsDirectionMark(utf::code_point point) {
+  return point == 0x200E || point == 0x200F || (point >= 0x202A && point <= 0x202E) ||
+         (point >= 0x2066 && point <= 0x2069);
+}
+
 std::string Format(const char* format, const std::tm& time) {
   std::array<char, 64> text{};
   return {text.data(), std::strftime(text.data(), text.size(), format, &time)};
@@ -96,7 +102,7 @@ std::string Printable(std::string_view bytes) {
       [&](utf::code_point point, std::string_view character) {
         if (point == '\\') {
           text += "\\\\";
-        } else if (std::iswprint(static_cast<std::wint_t>(point)) != 0) {
+        } else if (std::iswprint(static_cast<std::wint_t>(point)) != 0 && !IsDirectionMark(point)) {
           text += character;
         } else {
           for (const char byte : character) {

@@ -18,7 +18,7 @@ using namespace orva::zophotos;
 class Options {
 public:
   Options() {
-    app_.require_subcommand(1);
+    app_.require_subcommand(0, 1); // none is an error of ours, so that an unknown one is named
     app_.fallthrough();
     app_.set_version_flag("--version", "zophotos " ZOPHOTOS_VERSION);
     app_.add_option("--database", database_,
@@ -31,7 +31,12 @@ public:
   }
 
   /// Throws CLI::ParseError, for help, too.
-  void Parse(int argc, char** argv) { app_.parse(argc, argv); }
+  void Parse(int argc, char** argv) {
+    app_.parse(argc, argv);
+    if (app_.get_subcommands().empty()) {
+      throw CLI::RequiredError::Subcommand(1);
+    }
+  }
 
   /// Prints what a failed Parse is about; returns the exit status.
   ExitStatus Explain(const CLI::ParseError& error) const {
