@@ -82,6 +82,16 @@ void WriteToReader(std::string_view text, WriteSome writeSome) {
   }
 }
 
+/// Opens the locator file, making it when there is none; -1 when that cannot be. The directory is
+/// everybody's: what stands at the name may be a trap.
+int OpenLocatorFile() {
+  const char* const path = ZOPHOTODBMERGER_CONFIG_FILE_NAME.c_str();
+  constexpr int flags = O_WRONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC;
+  // Where files of others are protected, one that could also be made there cannot be opened.
+  const int descriptor = open(path, flags);
+  return descriptor == -1 && errno == ENOENT ? open(path, flags | O_CREAT, 0666) : descriptor;
+}
+
 } // namespace
 
 void writeLine(std::initializer_list<std::string_view> pieces) {
@@ -109,9 +119,7 @@ void writeLine(std::initializer_list<std::string_view> pieces) {
 }
 
 void updateLocatorFile(const std::string& mountPoint) {
-  // The directory is everybody's: what stands at the name may be a trap.
-  const int descriptor = open(ZOPHOTODBMERGER_CONFIG_FILE_NAME.c_str(),
-                              O_WRONLY | O_CREAT | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC, 0666);
+  const int descriptor = OpenLocatorFile();
   if (descriptor == -1) {
     return;
   }

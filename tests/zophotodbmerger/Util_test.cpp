@@ -52,6 +52,15 @@ TEST_F(LocatorTest, ShorterLineReplacesALongerOne) {
   EXPECT_EQ("zophotos_db_path=/shares/V//.zophotos/zophotos.db\n", Locator());
 }
 
+TEST_F(LocatorTest, FileOfAnotherUserIsWritten) {
+  std::ofstream(LOCATOR_PATH) << "theirs";
+  if (chown(LOCATOR_PATH.c_str(), 1000, 1000) != 0) {
+    GTEST_SKIP() << "there is only one user here";
+  }
+  updateLocatorFile("/shares/Vol/");
+  EXPECT_EQ("zophotos_db_path=/shares/Vol//.zophotos/zophotos.db\n", Locator());
+}
+
 TEST_F(LocatorTest, LinkInItsPlaceIsLeftAlone) {
   std::ofstream("/tmp/precious") << "keep";
   std::filesystem::create_symlink("/tmp/precious", LOCATOR_PATH);
