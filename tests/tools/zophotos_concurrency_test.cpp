@@ -22,7 +22,6 @@ namespace {
 
 namespace fs = std::filesystem;
 using nlohmann::json;
-using ::testing::AllOf;
 using ::testing::ContainsRegex;
 using ::testing::EndsWith;
 using ::testing::HasSubstr;
@@ -222,6 +221,29 @@ TEST_F(ZophotosWatch, TakesALockForNoNews) {
   AwaitLooks();
   copy.Run("COMMIT");
   EXPECT_THAT(Next(), HasSubstr(R"("files_removed":1)"));
+}
+
+TEST_F(ZophotosWatch, TellsOnceOfALockThatStays) {
+  const Database copy = Copy();
+  Start({"--json", "--database", COPY});
+  copy.Run("BEGIN EXCLUSIVE");
+  EXPECT_EQ(Next(), R"("event":"delayed","reason":")" + COPY +
+                        R"( is locked, as it is while a large merge is written; try again"})");
+  AwaitLooks();
+  copy.Run("DELETE FROM Files WHERE name = '1.jpg'");
+  copy.Run("COMMIT");
+  EXPECT_THAT(Next(), HasSubstr(R"("files_removed":1)"));
+}
+
+TEST_F(ZophotosWatch, CountsWhatCameAndWentBetweenTwoLooks) {
+  const Database copy = Copy();
+  Start({"--json", "--database", COPY});
+  copy.Run("BEGIN");
+  copy.Run("INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT "
+           "folder_id, 'new ' || name, 1, volume, 1 FROM Files");
+  copy.Run("DELETE FROM Files");
+  copy.Run("COMMIT");
+  EXPECT_THAT(Next(), HasSubstr(R"("files_added":4,"files_removed":8)"));
 }
 
 TEST_F(ZophotosWatch, EndsBySignals) {

@@ -22,7 +22,6 @@ namespace {
 namespace fs = std::filesystem;
 using ::testing::AllOf;
 using ::testing::HasSubstr;
-using ::testing::IsEmpty;
 using ::testing::Lt;
 using ::testing::Not;
 using ::testing::SizeIs;
@@ -264,9 +263,24 @@ TEST_F(ZophotosFailure, OfAMergeThatWasInterrupted) {
                   COPY + " has a merge to take back that was interrupted; the daemon does so when "
                          "it opens the database, and this program only reads");
   }
+  Program watch(ZophotosCommand({"--json", "--database", COPY, "watch"}));
+  EXPECT_THAT(watch.ReadLine(), HasSubstr(R"("event":"delayed","reason":")" + COPY));
   EXPECT_TRUE(fs::exists(COPY + "-journal"));
   EXPECT_EQ(std::vector<std::string>{"4"}, Database(COPY).Run("SELECT count(*) FROM Files"));
   EXPECT_EQ(0, OnCopy({"status"}).status);
+}
+
+TEST_F(ZophotosFailure, OfADatabaseThatCannotBeReadWithoutWritingBesideIt) {
+  Copy().Run("PRAGMA journal_mode = WAL");
+  for (const Arguments& command : COMMANDS) {
+    SCOPED_TRACE(Text(command));
+    ExpectFailure(OnCopy(command), 5,
+                  COPY +
+                      " has a write-ahead log, which the daemon's databases do not have: to read "
+                      "it would be to write beside it");
+  }
+  EXPECT_FALSE(fs::exists(COPY + "-wal"));
+  EXPECT_FALSE(fs::exists(COPY + "-shm"));
 }
 
 TEST_F(ZophotosFailure, OfAnOutputThatCannotBeWritten) {

@@ -4,7 +4,6 @@
 #include "Table.h"
 
 #include <SQLiteCpp/Statement.h>
-#include <SQLiteCpp/Transaction.h>
 
 #include <vector>
 
@@ -113,8 +112,8 @@ ExitStatus ListFolder(const std::string& path, const std::string& folder, bool i
   const std::string folderPath = FolderPath(folder);
   std::vector<Entry> entries;
   {
-    SQLite::Database database = OpenDatabase(path);
-    const SQLite::Transaction oneState(database);
+    // A folder may hold most of a library, which has to be sorted.
+    SQLite::Database database = CopyDatabase(path);
     entries = ReadFolders(database, folderPath);
     ReadFiles(database, folderPath, entries);
     if (entries.empty() && !IsStored(database, folderPath)) {

@@ -7,7 +7,9 @@
 #include <SQLiteCpp/Statement.h>
 #include <sqlite3.h>
 
+#include <array>
 #include <filesystem>
+#include <fstream>
 #include <system_error>
 #include <utility>
 
@@ -36,6 +38,16 @@ void RequireTables(const SQLite::Database& database, const std::string& path) {
   }
 }
 
+/// Whether the file's header says that it is written with a log. SQLite makes the log's files also
+/// for those who only read.
+bool HasWriteAheadLog(const std::string& path) {
+  constexpr std::size_t readVersion = 19;
+  constexpr char writeAheadLog = 2;
+  std::array<char, 20> header{};
+  std::ifstream(path, std::ios::binary).read(header.data(), header.size());
+  return header.at(readVersion) == writeAheadLog;
+}
+
 /// Opens the file without a look at what is in it.
 SQLite::Database OpenFile(const std::string& path) {
   std::error_code error;
@@ -46,6 +58,11 @@ SQLite::Database OpenFile(const std::string& path) {
   if (type != std::filesystem::file_type::regular) {
     throw Failure(ExitStatus::Failed,
                   path + (error ? ": " + error.message() : " is not a regular file"));
+  }
+  if (HasWriteAheadLog(path)) {
+    throw Failure(ExitStatus::Failed, path +
+                                          " has a write-ahead log, which the daemon's databases do "
+                                          "not have: to read it would be to write beside it");
   }
   SQLite::Database database(path, SQLite::OPEN_READONLY, BUSY_TIMEOUT);
   Distrust(database);

@@ -59,10 +59,12 @@ std::string_view Tail(std::string_view printable, std::size_t width) {
   return printable.substr(begin);
 }
 
-/// Marks that have a terminal show what follows in another order than it is written.
-bool IsDirectionMark(utf::code_point point) {
-  return point == 0x200E || point == 0x200F || (point >= 0x202A && point <= 0x202E) ||
-         (point >= 0x2066 && point <= 0x2069);
+/// Characters that cannot be seen, and have what is around them shown otherwise than it is written;
+/// not the joiners that scripts and emojis need.
+bool IsInvisible(utf::code_point point) {
+  return point == 0x061C || point == 0x200B || point == 0x200E || point == 0x200F ||
+         (point >= 0x202A && point <= 0x202E) || (point >= 0x2060 && point <= 0x206F) ||
+         point == 0xFEFF || (point >= 0xE0000 && point <= 0xE007F);
 }
 
 std::string Format(const char* format, const std::tm& time) {
@@ -102,7 +104,7 @@ std::string Printable(std::string_view bytes) {
       [&](utf::code_point point, std::string_view character) {
         if (point == '\\') {
           text += "\\\\";
-        } else if (std::iswprint(static_cast<std::wint_t>(point)) != 0 && !IsDirectionMark(point)) {
+        } else if (std::iswprint(static_cast<std::wint_t>(point)) != 0 && !IsInvisible(point)) {
           text += character;
         } else {
           for (const char byte : character) {

@@ -14,7 +14,7 @@ void UseUtf8();
 /// `bytes` for programs: what is not UTF-8, and NUL, becomes U+FFFD.
 std::string ToUtf8(std::string_view bytes);
 
-/// `bytes` for people: control characters, direction marks, backslashes and what is not UTF-8 are
+/// `bytes` for people: control characters, invisible ones, backslashes and what is not UTF-8 are
 /// escaped, so that a name can do nothing to a terminal.
 std::string Printable(std::string_view bytes);
 

@@ -32,10 +32,10 @@ struct Progress {
   bool operator==(const Progress&) const = default;
 };
 
-/// Rows of one table. Ids only grow, so that those above an earlier greatest one are new.
+/// Rows of one table. Ids only grow, so that the last one given tells how many have come.
 struct Rows {
   std::int64_t count = 0;
-  std::int64_t greatestId = 0;
+  std::int64_t lastId = 0;
 };
 
 /// What two states of a database are compared by.
@@ -57,12 +57,19 @@ std::int64_t Ask(SQLite::Database& database, const char* sql) {
   return database.execAndGet(sql).getInt64();
 }
 
+/// The last id that a row of the table was given, whether it is still there or not.
+std::int64_t LastId(SQLite::Database& database, const char* table) {
+  // Within bounds whose difference can be counted, whatever somebody has written there.
+  SQLite::Statement query(database, "SELECT min(max(CAST(seq AS INTEGER), 0), 1 << 62) FROM "
+                                    "sqlite_sequence WHERE name = ?");
+  query.bind(1, table);
+  return query.executeStep() ? query.getColumn(0).getInt64() : 0;
+}
+
 State ReadState(SQLite::Database& database) {
   State state;
-  state.folders = {Ask(database, "SELECT count(*) FROM Folders"),
-                   Ask(database, "SELECT ifnull(max(folder_id), 0) FROM Folders")};
-  state.files = {Ask(database, "SELECT count(*) FROM Files"),
-                 Ask(database, "SELECT ifnull(max(file_id), 0) FROM Files")};
+  state.folders = {Ask(database, "SELECT count(*) FROM Folders"), LastId(database, "Folders")};
+  state.files = {Ask(database, "SELECT count(*) FROM Files"), LastId(database, "Files")};
   SQLite::Statement query(database, "SELECT volume, photos_xcoded, photos_total, last_updated_time "
                                     "FROM Statistics ORDER BY id DESC");
   while (query.executeStep()) {
@@ -73,19 +80,19 @@ State ReadState(SQLite::Database& database) {
   return state;
 }
 
-/// Counts what `newRowsSql` says of the rows above `before`'s greatest id, by volume; the volumes
-/// go into `volumes`.
-Difference Compare(SQLite::Database& database, const char* newRowsSql, const Rows& before,
-                   const Rows& now, std::set<std::string>& volumes) {
-  Difference difference;
+Difference Compare(const Rows& before, const Rows& now) {
+  const std::int64_t added = now.lastId - before.lastId;
+  return {.added = added, .removed = before.count + added - now.count};
+}
+
+/// Adds the volumes that new rows belong to; of a merge all belong to one, so the first are enough.
+void AddVolumes(SQLite::Database& database, const char* newRowsSql, const Rows& before,
+                std::set<std::string>& volumes) {
   SQLite::Statement query(database, newRowsSql);
-  query.bind(1, before.greatestId);
+  query.bind(1, before.lastId);
   while (query.executeStep()) {
     volumes.insert(query.getColumn(0).getString());
-    difference.added += query.getColumn(1).getInt64();
   }
-  difference.removed = before.count + difference.added - now.count;
-  return difference;
 }
 
 std::string Sign(const Difference& difference, const std::string& noun) {
@@ -113,11 +120,13 @@ public:
       } else if (Version(*database_) != version_) {
         PrintChange();
       }
+      delay_.clear();
     } catch (const Failure& failure) {
       Lose(failure.what());
     } catch (const SQLite::Exception& error) {
-      // A lock is no news: the next look will see what it was held for.
-      if (!IsLocked(error)) {
+      if (IsLocked(error)) {
+        Delay(Explain(error, path_));
+      } else {
         Lose(Explain(error, path_));
       }
     }
@@ -166,6 +175,14 @@ private:
     }
   }
 
+  /// Tells once why a change that there may be cannot be seen yet.
+  void Delay(const std::string& reason) {
+    if (reason != delay_) {
+      delay_ = reason;
+      Print("delayed", Printable(reason), {{"reason", ToUtf8(reason)}});
+    }
+  }
+
   void PrintChange() {
     std::set<std::string> changed;
     Difference folders;
@@ -174,12 +191,14 @@ private:
       const SQLite::Transaction oneState(*database_);
       State now = ReadState(*database_);
       version_ = Version(*database_);
-      folders = Compare(*database_,
-                        "SELECT volume, count(*) FROM Folders WHERE folder_id > ? GROUP BY volume",
-                        state_.folders, now.folders, changed);
-      files = Compare(*database_,
-                      "SELECT volume, count(*) FROM Files WHERE file_id > ? GROUP BY volume",
-                      state_.files, now.files, changed);
+      folders = Compare(state_.folders, now.folders);
+      files = Compare(state_.files, now.files);
+      AddVolumes(*database_,
+                 "SELECT volume FROM Folders WHERE folder_id > ? ORDER BY folder_id LIMIT 10000",
+                 state_.folders, changed);
+      AddVolumes(*database_,
+                 "SELECT volume FROM Files WHERE file_id > ? ORDER BY file_id LIMIT 10000",
+                 state_.files, changed);
       for (const auto& [volume, progress] : now.volumes) {
         const auto before = state_.volumes.find(volume);
         if (before == state_.volumes.end() || before->second != progress) {
@@ -225,7 +244,8 @@ private:
   std::optional<SQLite::Database> database_; ///< nothing while there is none
   std::int64_t version_ = 0;
   State state_;
-  std::string loss_; ///< the reason that was printed last, until there is a database again
+  std::string loss_;  ///< the reason that was printed last, until there is a database again
+  std::string delay_; ///< the same, until it can be read again
 };
 
 } // namespace
