@@ -62,7 +62,7 @@ void Expand(const Groups& groups, const std::string& name, std::set<std::string>
 std::set<std::string> AllowedCalls(const Unit& unit, const Groups& groups) {
   std::set<std::string> allowed;
   Expand(groups, "@default", allowed);
-  for (std::string value : unit.All("SystemCallFilter")) {
+  for (const std::string& value : unit.All("SystemCallFilter")) {
     const bool takes = value.starts_with('~');
     std::istringstream words(value.substr(takes ? 1 : 0));
     for (std::string word; words >> word;) {

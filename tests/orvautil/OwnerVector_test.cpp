@@ -27,7 +27,7 @@ static_assert(!std::is_copy_assignable_v<OwnerVector<Element>>);
 
 /// Takes the elements out of an owner that stays with the caller.
 OwnerVector<Element> TakeFrom(OwnerVector<Element>& source) {
-  return OwnerVector<Element>(std::move(source));
+  return {std::move(source)};
 }
 
 TEST(OwnerVector, DeletesItsElementsFirstToLastThroughTheirBase) {
