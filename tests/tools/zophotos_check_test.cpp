@@ -67,12 +67,12 @@ TEST_F(ZophotosCheck, FindsTheDaemonsDatabaseSound) {
 }
 
 TEST_F(ZophotosCheck, FindsAMissingStatusRow) {
-  ExpectDamage({"DELETE FROM Status"}, "  1 no status row 1\n    Status\n",
+  ExpectDamage({"DELETE FROM Status"}, "  status row missing: 1\n    Status\n",
                R"({"kind":"no_status","count":1,"examples":["Status"]})");
 }
 
 TEST_F(ZophotosCheck, FindsAMissingRootFolder) {
-  const std::string text = "  1 no root folder 1\n    Folders\n";
+  const std::string text = "  root folder missing: 1\n    Folders\n";
   const std::string json = R"({"kind":"no_root","count":1,"examples":["Folders"]})";
   ExpectDamage({"UPDATE Folders SET name = '/share/' WHERE folder_id = 1"}, text, json);
   ExpectDamage(
@@ -83,14 +83,14 @@ TEST_F(ZophotosCheck, FindsAMissingRootFolder) {
 TEST_F(ZophotosCheck, FindsFilesWithoutAFolder) {
   ExpectDamage(
       {"UPDATE Files SET folder_id = 999, file_id = 77 WHERE name = 'top.jpg'"},
-      "  1 files without a folder\n    file 77, top.jpg, of /shares/A/: no folder 999\n",
+      "  files without a folder: 1\n    file 77, top.jpg, of /shares/A/: no folder 999\n",
       R"({"kind":"file_without_folder","count":1,"examples":["file 77, top.jpg, of /shares/A/: no folder 999"]})");
 }
 
 TEST_F(ZophotosCheck, FindsFilesOfAnotherVolumeThanTheirFolder) {
   ExpectDamage(
       {"UPDATE Files SET volume = '/shares/B/' WHERE name = 'top.jpg'"},
-      "  1 files of another volume than their folder\n"
+      "  files of another volume than their folder: 1\n"
       "    /shares/A/top.jpg, of /shares/B/ in a folder of /shares/A/\n",
       R"({"kind":"file_of_other_volume","count":1,"examples":["/shares/A/top.jpg, of /shares/B/ in a folder of /shares/A/"]})");
 }
@@ -98,7 +98,7 @@ TEST_F(ZophotosCheck, FindsFilesOfAnotherVolumeThanTheirFolder) {
 TEST_F(ZophotosCheck, FindsFoldersThatAreThereMoreThanOnce) {
   ExpectDamage({"INSERT INTO Folders(parent_folder_id, name, modified_date, volume) SELECT "
                 "parent_folder_id, name, 7, volume FROM Folders WHERE name = '/shares/B/Old/'"},
-               "  1 folders that are there more than once\n    /shares/B/Old/, 2 times\n",
+               "  folders that are there more than once: 1\n    /shares/B/Old/, 2 times\n",
                R"({"kind":"duplicate_folder","count":1,"examples":["/shares/B/Old/, 2 times"]})");
 }
 
@@ -108,14 +108,14 @@ TEST_F(ZophotosCheck, FindsFilesThatAreThereMoreThanOnce) {
       "name, 7, volume, 8 FROM Files WHERE name = '1.jpg' LIMIT 1";
   ExpectDamage(
       {insert, insert},
-      "  1 files that are there more than once\n    /shares/B/Old/1.jpg, 3 times\n",
+      "  files that are there more than once: 1\n    /shares/B/Old/1.jpg, 3 times\n",
       R"({"kind":"duplicate_file","count":1,"examples":["/shares/B/Old/1.jpg, 3 times"]})");
 }
 
 TEST_F(ZophotosCheck, FindsVolumesWithMoreThanOneRowOfStatistics) {
   ExpectDamage({"INSERT INTO Statistics(volume, photos_xcoded, photos_total, last_updated_time) "
                 "VALUES('/shares/B/', 0, 0, 0)"},
-               "  1 volumes with more than one row of statistics\n    /shares/B/, 2 times\n",
+               "  volumes with more than one row of statistics: 1\n    /shares/B/, 2 times\n",
                R"({"kind":"duplicate_statistics","count":1,"examples":["/shares/B/, 2 times"]})");
 }
 
@@ -125,8 +125,8 @@ TEST_F(ZophotosCheck, TellsOfEachKindThatItFinds) {
   copy.Run("UPDATE Files SET folder_id = 999 WHERE name = 'top.jpg'");
   const Outcome outcome = OnCopy({"check"});
   EXPECT_EQ(1, outcome.status);
-  EXPECT_THAT(outcome.output,
-              AllOf(HasSubstr("  1 no status row 1\n"), HasSubstr("  1 files without a folder\n")));
+  EXPECT_THAT(outcome.output, AllOf(HasSubstr("  status row missing: 1\n"),
+                                    HasSubstr("  files without a folder: 1\n")));
 }
 
 TEST_F(ZophotosCheck, ListsTwentyExamplesAndCountsTheRest) {
@@ -137,7 +137,7 @@ TEST_F(ZophotosCheck, ListsTwentyExamplesAndCountsTheRest) {
       "INTO Files(folder_id, name, modified_date, volume, created_date) SELECT 99, i || '.jpg', "
       "1, '/shares/A/', 1 FROM n");
   const Outcome inText = OnCopy({"check"});
-  EXPECT_THAT(inText.output, HasSubstr("  25 files without a folder\n"));
+  EXPECT_THAT(inText.output, HasSubstr("  files without a folder: 25\n"));
   EXPECT_THAT(inText.output, HasSubstr(", 29.jpg, of /shares/A/: no folder 99\n    and 5 more\n"));
   EXPECT_THAT(inText.output, Not(HasSubstr("30.jpg")));
   const Outcome inJson = OnCopy({"check", "--json"});
@@ -151,7 +151,7 @@ TEST_F(ZophotosCheck, AnUnpluggedVolumesStatisticsAreNoDamage) {
   EXPECT_EQ(0, inText.status);
   EXPECT_EQ(MERGED + " is sound\n"
                      "Expected leftovers, no damage:\n"
-                     "  1 statistics of volumes that have nothing merged\n"
+                     "  statistics of volumes that have nothing merged: 1\n"
                      "    /shares/B/\n",
             inText.output);
   const Outcome inJson = Zophotos({"check", "--json"});
@@ -175,7 +175,7 @@ TEST_F(ZophotosCheck, FindsOverwrittenPages) {
     const Outcome outcome = OnCopy({"check"});
     EXPECT_EQ(1, outcome.status) << table;
     EXPECT_THAT(outcome.output, StartsWith(COPY + " is damaged\nDamage:\n")) << table;
-    EXPECT_THAT(outcome.output, HasSubstr(" faults in the file\n")) << table;
+    EXPECT_THAT(outcome.output, HasSubstr("\n  faults in the file: ")) << table;
     EXPECT_EQ("", outcome.error) << table;
     EXPECT_THAT(OnCopy({"check", "--json"}).output, HasSubstr(R"({"kind":"integrity","count":)"));
   }
@@ -192,7 +192,20 @@ TEST_F(ZophotosCheck, FindsAFileThatWasCutShort) {
   std::filesystem::resize_file(COPY, std::filesystem::file_size(COPY) - 5000);
   const Outcome outcome = OnCopy({"check"});
   EXPECT_EQ(1, outcome.status);
-  EXPECT_THAT(outcome.output, HasSubstr(" faults in the file\n"));
+  EXPECT_THAT(outcome.output, HasSubstr("\n  faults in the file: "));
+}
+
+TEST_F(ZophotosCheck, TakesWhatCannotBeReadForAFaultAndForNothingElse) {
+  Copy();
+  const std::string page(4096, '\x5a');
+  for (auto at = 4096; at < static_cast<int>(std::filesystem::file_size(COPY)); at += 4096) {
+    Overwrite(at, page);
+  }
+  const Outcome outcome = OnCopy({"check"});
+  EXPECT_EQ(1, outcome.status);
+  EXPECT_THAT(outcome.output, AllOf(HasSubstr("\n  faults in the file: "),
+                                    HasSubstr(", when looking for files without"),
+                                    Not(HasSubstr("files without a folder:"))));
 }
 
 TEST_F(ZophotosCheck, FindsAFileThatIsNoDatabase) {
@@ -200,7 +213,7 @@ TEST_F(ZophotosCheck, FindsAFileThatIsNoDatabase) {
   Overwrite(0, "This is a letter and no data");
   const Outcome outcome = OnCopy({"check"});
   EXPECT_EQ(1, outcome.status);
-  EXPECT_EQ(COPY + " is damaged\nDamage:\n  1 faults in the file\n    file is not a database\n",
+  EXPECT_EQ(COPY + " is damaged\nDamage:\n  faults in the file: 1\n    file is not a database\n",
             outcome.output);
 }
 
@@ -212,7 +225,7 @@ TEST_F(ZophotosCheck, FindsPagesThatNobodyUses) {
   }
   const Outcome outcome = OnCopy({"check"});
   EXPECT_EQ(1, outcome.status);
-  EXPECT_THAT(outcome.output, HasSubstr(" faults in the file\n"));
+  EXPECT_THAT(outcome.output, HasSubstr("\n  faults in the file: "));
 }
 
 } // namespace

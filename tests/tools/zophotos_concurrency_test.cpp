@@ -111,7 +111,7 @@ TEST_F(ZophotosWatch, TellsOfAMerge) {
   Merge(b);
   EXPECT_EQ(
       Next(),
-      R"("event":"changed","folders_added":1,"folders_removed":0,"files_added":2,"files_removed":0,"volumes":[{"volume":"/shares/B/","transcoded":3,"total":5}]})");
+      R"("event":"changed","folders_added":1,"folders_removed":0,"files_added":2,"files_removed":0,"volumes":[{"volume":"/shares/B/","transcoded":3,"total":5,"merged_up_to":"1970-01-01T00:50:02Z"}]})");
 }
 
 TEST_F(ZophotosWatch, TellsOfAMergeInText) {
@@ -146,6 +146,13 @@ TEST_F(ZophotosWatch, TellsOfAnUnplug) {
   Start();
   appliance.Handle(Unplugged(b.Path()));
   EXPECT_TRUE(AwaitRemoval(2, 1));
+}
+
+TEST_F(ZophotosWatch, TellsThatAnUnpluggedVolumeBeginsAnew) {
+  const Database copy = Copy();
+  Start({"--database", COPY});
+  copy.Run("UPDATE Statistics SET last_updated_time = 0 WHERE volume = '/shares/B/'");
+  EXPECT_THAT(watch->ReadLine(), EndsWith("  /shares/B/ is to be merged from its beginning"));
 }
 
 TEST_F(ZophotosWatch, SaysNothingWhileNothingChanges) {

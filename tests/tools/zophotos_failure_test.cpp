@@ -88,11 +88,14 @@ TEST_F(ZophotosLocator, MayBeMalformed) {
 }
 
 TEST_F(ZophotosLocator, MayBeNoFile) {
+  const std::string reason =
+      "/tmp/zophotodbmerger.conf is not a regular file, so that the daemon does not "
+      "write it";
   fs::create_directory(LOCATOR);
-  ExpectNoDatabase(NO_FILE);
+  ExpectNoDatabase(reason);
   fs::remove(LOCATOR);
   ASSERT_EQ(0, mkfifo(LOCATOR.c_str(), 0666));
-  ExpectNoDatabase(NO_FILE);
+  ExpectNoDatabase(reason);
 }
 
 TEST_F(ZophotosLocator, MayNameWhatIsNotThere) {
@@ -136,6 +139,7 @@ TEST(ZophotosUsage, IsToldFromFailure) {
       {{"find", "-0", "--json", "x"}, "takes one of --null and --json"},
       {{"--json", "find", "--null", "x"}, "takes one of --null and --json"},
       {{"--database"}, "--database"},
+      {{"--database", "", "status"}, "it is empty"},
       {{"status", "check"}, ""}};
   for (const auto& [arguments, message] : wrong) {
     SCOPED_TRACE(Text(arguments));

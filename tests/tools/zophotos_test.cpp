@@ -204,7 +204,7 @@ TEST_F(ZophotosRemovedFolder, StandsInTheTree) {
 TEST_F(ZophotosRemovedFolder, LeavesNoDamage) {
   ExpectOutput(Zophotos({"check"}), MERGED + " is sound\n"
                                              "Expected leftovers, no damage:\n"
-                                             "  1 folders whose parent folder was removed\n"
+                                             "  folders whose parent folder was removed: 1\n"
                                              "    /shares/A/Pictures/Summer/\n");
 }
 

@@ -37,9 +37,9 @@ struct Question {
 
 constexpr Question DAMAGE[] = {
     {"integrity", "faults in the file", "PRAGMA integrity_check(1000)"},
-    {"no_status", "no status row 1",
+    {"no_status", "status row missing",
      "SELECT 'Status' WHERE NOT EXISTS (SELECT 1 FROM Status WHERE id = 1)"},
-    {"no_root", "no root folder 1",
+    {"no_root", "root folder missing",
      "SELECT 'Folders' WHERE NOT EXISTS (SELECT 1 FROM Folders WHERE folder_id = 1 AND name = "
      "'/shares/')"},
     {"file_without_folder", "files without a folder",
@@ -69,14 +69,29 @@ constexpr Question LEFTOVERS[] = {
      "p WHERE p.folder_id = o.parent_folder_id) ORDER BY name"},
 };
 
-/// Asks one question. What SQLite cannot read for it is a finding of its own.
-void Ask(SQLite::Database& database, const Question& question, std::vector<Finding>& findings) {
+struct Report {
+  std::vector<Finding> damage;
+  std::vector<Finding> leftovers;
+};
+
+/// What SQLite cannot read is a fault in the file, whatever was asked.
+void AddFault(Report& report, const std::string& fault) {
+  if (report.damage.empty() || report.damage.front().kind != DAMAGE[0].kind) {
+    report.damage.insert(report.damage.begin(), {.kind = DAMAGE[0].kind, .title = DAMAGE[0].title});
+  }
+  report.damage.front().Add(fault);
+}
+
+/// Asks one question; what is found goes into `findings`, which belong to `report`.
+void Ask(SQLite::Database& database, const Question& question, Report& report,
+         std::vector<Finding>& findings) {
   Finding finding{.kind = question.kind, .title = question.title};
+  std::string fault;
   try {
     SQLite::Statement query(database, question.sql);
     while (query.executeStep()) {
       const std::string text = query.getColumn(0).getString();
-      if (text != "ok" || finding.kind != "integrity") {
+      if (text != "ok" || finding.kind != DAMAGE[0].kind) {
         finding.Add(text);
       }
     }
@@ -84,34 +99,31 @@ void Ask(SQLite::Database& database, const Question& question, std::vector<Findi
     if (!IsDamage(error)) {
       throw;
     }
-    finding.Add(error.what());
+    fault = std::string(error.what()) + ", when looking for " + question.title;
   }
   if (finding.count > 0) {
     findings.push_back(std::move(finding));
   }
+  if (!fault.empty()) {
+    AddFault(report, fault);
+  }
 }
-
-struct Report {
-  std::vector<Finding> damage;
-  std::vector<Finding> leftovers;
-};
 
 Report Examine(const std::string& path) {
   Report report;
   try {
     SQLite::Database database = CopyDatabase(path);
     for (const Question& question : DAMAGE) {
-      Ask(database, question, report.damage);
+      Ask(database, question, report, report.damage);
     }
     for (const Question& question : LEFTOVERS) {
-      Ask(database, question, report.leftovers);
+      Ask(database, question, report, report.leftovers);
     }
   } catch (const SQLite::Exception& error) {
     if (!IsDamage(error)) {
       throw;
     }
-    report.damage.push_back({.kind = DAMAGE[0].kind, .title = DAMAGE[0].title});
-    report.damage.back().Add(error.what());
+    AddFault(report, error.what());
   }
   return report;
 }
@@ -122,7 +134,7 @@ void PrintFindings(const std::string& heading, const std::vector<Finding>& findi
   }
   std::cout << heading << '\n';
   for (const Finding& finding : findings) {
-    std::cout << "  " << finding.count << ' ' << finding.title << '\n';
+    std::cout << "  " << finding.title << ": " << finding.count << '\n';
     for (const std::string& example : finding.examples) {
       std::cout << "    " << Printable(example) << '\n';
     }

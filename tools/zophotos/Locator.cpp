@@ -25,9 +25,14 @@ constexpr std::string_view KEY = "zophotos_db_path=";
 std::string FindDatabase() {
   // Anybody can make something there, and a FIFO would be waited for.
   std::error_code error;
-  if (!std::filesystem::is_regular_file(LOCATOR, error)) {
+  const auto type = std::filesystem::status(LOCATOR, error).type();
+  if (type == std::filesystem::file_type::not_found) {
     ThrowNoDatabase(std::string("there is no file ") + LOCATOR +
                     ", which the daemon writes when it starts");
+  }
+  if (type != std::filesystem::file_type::regular) {
+    ThrowNoDatabase(std::string(LOCATOR) +
+                    " is not a regular file, so that the daemon does not write it");
   }
   std::ifstream file(LOCATOR);
   if (!file) {

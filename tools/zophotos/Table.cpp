@@ -68,7 +68,8 @@ void Table::Print(std::ostream& stream, std::optional<std::size_t> width) const 
       line.append(GAP, ' ');
     }
     line.erase(line.find_last_not_of(' ') + 1);
-    stream << Head(line, limit) << '\n';
+    // A figure that lost its end would look like another.
+    stream << (Width(line) <= limit ? line : std::string(Head(line, limit - 1)) + "…") << '\n';
   }
 }
 

@@ -211,11 +211,15 @@ private:
     Json volumes = Json::array();
     for (const std::string& volume : changed) {
       const Progress progress = state_.volumes[volume];
-      text += "; " + Printable(volume) + " " + std::to_string(progress.transcoded) + " of " +
-              Count(progress.total, "photo") + " transcoded";
-      volumes.push_back({{"volume", ToUtf8(volume)},
-                         {"transcoded", progress.transcoded},
-                         {"total", progress.total}});
+      text += "; " + Printable(volume) + " ";
+      text += progress.mergedUpTo == 0 ? "is to be merged from its beginning"
+                                       : std::to_string(progress.transcoded) + " of " +
+                                             Count(progress.total, "photo") + " transcoded";
+      volumes.push_back(
+          {{"volume", ToUtf8(volume)},
+           {"transcoded", progress.transcoded},
+           {"total", progress.total},
+           {"merged_up_to", progress.mergedUpTo == 0 ? Json() : JsonTime(progress.mergedUpTo)}});
     }
     Print("changed",
           text.empty() ? "written, nothing added or removed" : text.substr(text[0] == ' ' ? 1 : 2),

@@ -23,8 +23,14 @@ public:
     app_.set_version_flag("--version", "zophotos " ZOPHOTOS_VERSION);
     app_.add_option("--database", database_,
                     "Read this database instead of the one that the daemon's locator file names")
-        ->type_name("FILE");
+        ->type_name("FILE")
+        ->check([](const std::string& path) {
+          return path.empty() ? std::string("it is empty") : std::string();
+        });
     app_.add_flag("--json", json_, "Print JSON: one object, or one a line from a list");
+    app_.failure_message([](const CLI::App* /*app*/, const CLI::Error& error) {
+      return std::string("zophotos: ") + error.what() + "\nTry 'zophotos --help'.\n";
+    });
     app_.footer("Exit status: 0 all right; 1 damaged, or nothing found; 2 wrong command line; 3 no "
                 "database now;\n4 locked, try again; 5 anything else. See zophotos(1).");
     AddCommands();
