@@ -348,7 +348,7 @@ TEST_F(OrvaNotify, ARawFileThatCannotBeReadIsAnError) {
 TEST_F(OrvaNotify, SendFailsWhenNoServiceListens) {
   const Outcome outcome = RunNotify({"send", "plugged", "/shares/A"});
   EXPECT_EQ(outcome.status, 1);
-  EXPECT_EQ(outcome.line, "orva-notify: No notification service listens on " +
+  EXPECT_EQ(outcome.line, "orva-notify: No orva-notify serves " +
                               ORVA_NOTIFICATION_SOCKET + ": No such file or directory");
 }
 
