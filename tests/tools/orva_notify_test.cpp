@@ -348,8 +348,8 @@ TEST_F(OrvaNotify, ARawFileThatCannotBeReadIsAnError) {
 TEST_F(OrvaNotify, SendFailsWhenNoServiceListens) {
   const Outcome outcome = RunNotify({"send", "plugged", "/shares/A"});
   EXPECT_EQ(outcome.status, 1);
-  EXPECT_EQ(outcome.line, "orva-notify: No orva-notify serves " +
-                              ORVA_NOTIFICATION_SOCKET + ": No such file or directory");
+  EXPECT_EQ(outcome.line, "orva-notify: No orva-notify serves " + ORVA_NOTIFICATION_SOCKET +
+                              ": No such file or directory");
 }
 
 TEST_F(OrvaNotify, WrongUsageIsToldFromFailure) {

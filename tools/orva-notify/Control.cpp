@@ -102,9 +102,9 @@ std::size_t Ask(const std::string& address, const Request& request, std::chrono:
   const auto deadline = Clock::now() + wait;
   util::ClientSocket socket(util::Socket::Address(ControlAddress(address)), true);
   if (!socket.IsOpen()) {
-    throw util::Exception(util::FormatString("No orva-notify serves %s: %s",
-                                             address.c_str(), strerror(errno)),
-                          __FILE__, __LINE__);
+    throw util::Exception(
+        util::FormatString("No orva-notify serves %s: %s", address.c_str(), strerror(errno)),
+        __FILE__, __LINE__);
   }
   if (!SendAll(socket, Encode(request), deadline)) {
     ThrowTooLate(request, wait);
