@@ -13,12 +13,21 @@ namespace {
 
 constexpr std::size_t MOST_EXAMPLES = 20;
 
+/// What to look for: each row of `sql` has one text, which describes one of what it finds.
+struct Question {
+  const char* kind;
+  const char* title;
+  const char* sql;
+};
+
 /// One kind of thing that was found, and the first ones of it.
 struct Finding {
+  explicit Finding(const Question& question) : kind(question.kind), title(question.title) {}
+
   std::string kind;  ///< for programs
   std::string title; ///< for people
   std::int64_t count = 0;
-  std::vector<std::string> examples{};
+  std::vector<std::string> examples;
 
   void Add(const std::string& example) {
     ++count;
@@ -28,15 +37,11 @@ struct Finding {
   }
 };
 
-/// What to look for: each row of `sql` has one text, which describes one of what it finds.
-struct Question {
-  const char* kind;
-  const char* title;
-  const char* sql;
-};
+constexpr Question INTEGRITY = {
+    "integrity", "faults in the file",
+    "SELECT integrity_check FROM pragma_integrity_check(1000) WHERE integrity_check != 'ok'"};
 
 constexpr Question DAMAGE[] = {
-    {"integrity", "faults in the file", "PRAGMA integrity_check(1000)"},
     {"no_status", "status row missing",
      "SELECT 'Status' WHERE NOT EXISTS (SELECT 1 FROM Status WHERE id = 1)"},
     {"no_root", "root folder missing",
@@ -74,56 +79,52 @@ struct Report {
   std::vector<Finding> leftovers;
 };
 
-/// What SQLite cannot read is a fault in the file, whatever was asked.
-void AddFault(Report& report, const std::string& fault) {
-  if (report.damage.empty() || report.damage.front().kind != DAMAGE[0].kind) {
-    report.damage.insert(report.damage.begin(), {.kind = DAMAGE[0].kind, .title = DAMAGE[0].title});
-  }
-  report.damage.front().Add(fault);
-}
-
-/// Asks one question; what is found goes into `findings`, which belong to `report`.
-void Ask(SQLite::Database& database, const Question& question, Report& report,
-         std::vector<Finding>& findings) {
-  Finding finding{.kind = question.kind, .title = question.title};
-  std::string fault;
+/// Adds what the question finds to `finding`. What SQLite cannot read for it is one of the
+/// `faults`.
+void Ask(SQLite::Database& database, const Question& question, Finding& finding, Finding& faults) {
   try {
     SQLite::Statement query(database, question.sql);
     while (query.executeStep()) {
-      const std::string text = query.getColumn(0).getString();
-      if (text != "ok" || finding.kind != DAMAGE[0].kind) {
-        finding.Add(text);
-      }
+      finding.Add(query.getColumn(0).getString());
     }
   } catch (const SQLite::Exception& error) {
     if (!IsDamage(error)) {
       throw;
     }
-    fault = std::string(error.what()) + ", when looking for " + question.title;
+    faults.Add(std::string(error.what()) + ", when looking for " + question.title);
   }
-  if (finding.count > 0) {
-    findings.push_back(std::move(finding));
+}
+
+template <typename Questions>
+std::vector<Finding> AskAll(SQLite::Database& database, const Questions& questions,
+                            Finding& faults) {
+  std::vector<Finding> findings;
+  for (const Question& question : questions) {
+    Finding finding(question);
+    Ask(database, question, finding, faults);
+    if (finding.count > 0) {
+      findings.push_back(std::move(finding));
+    }
   }
-  if (!fault.empty()) {
-    AddFault(report, fault);
-  }
+  return findings;
 }
 
 Report Examine(const std::string& path) {
   Report report;
+  Finding faults(INTEGRITY);
   try {
     SQLite::Database database = CopyDatabase(path);
-    for (const Question& question : DAMAGE) {
-      Ask(database, question, report, report.damage);
-    }
-    for (const Question& question : LEFTOVERS) {
-      Ask(database, question, report, report.leftovers);
-    }
+    Ask(database, INTEGRITY, faults, faults);
+    report.damage = AskAll(database, DAMAGE, faults);
+    report.leftovers = AskAll(database, LEFTOVERS, faults);
   } catch (const SQLite::Exception& error) {
     if (!IsDamage(error)) {
       throw;
     }
-    AddFault(report, error.what());
+    faults.Add(error.what());
+  }
+  if (faults.count > 0) {
+    report.damage.insert(report.damage.begin(), std::move(faults));
   }
   return report;
 }

@@ -11,7 +11,6 @@
 #include <ctime>
 #include <cwchar>
 #include <cwctype>
-#include <functional>
 #include <iterator>
 
 namespace orva::zophotos {
@@ -22,9 +21,9 @@ namespace utf = boost::locale::utf;
 
 /// Calls `onCharacter` with each code point and its bytes, and `onByte` with each byte that is part
 /// of none.
-void ForEachCharacter(std::string_view bytes,
-                      const std::function<void(utf::code_point, std::string_view)>& onCharacter,
-                      const std::function<void(char)>& onByte) {
+template <typename OnCharacter, typename OnByte>
+void ForEachCharacter(std::string_view bytes, const OnCharacter& onCharacter,
+                      const OnByte& onByte) {
   for (const char* next = bytes.begin(); next != bytes.end();) {
     const char* const begin = next;
     const utf::code_point point = utf::utf_traits<char>::decode(next, bytes.end());
