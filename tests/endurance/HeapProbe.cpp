@@ -1,6 +1,8 @@
 // Preloaded into the daemon: whenever it is about to wait for the next bytes from its socket, tells
 // a file how many bytes of the heap are in use. The file is named by HEAP_PROBE.
 
+#undef _FORTIFY_SOURCE // its headers define recv as well
+
 #include <dlfcn.h>
 #include <malloc.h>
 #include <sys/socket.h>
