@@ -81,7 +81,22 @@ std::string Appliance::SendBarrier() {
   return REFUSAL + name;
 }
 
+std::chrono::milliseconds Appliance::HandleUntilSlept(Tracer& tracer, const std::string& message,
+                                                      std::chrono::milliseconds time) {
+  service_.Send(message);
+  const std::string last = SendBarrier();
+  std::chrono::milliseconds slept{};
+  tracer.RunUntil([&](const SystemCall& call) {
+    const auto sleep = std::chrono::duration_cast<std::chrono::milliseconds>(tracer.Sleep(call));
+    slept += sleep;
+    return (sleep > sleep.zero() && slept >= time) ||
+           tracer.Data(call).find(last) != std::string::npos;
+  });
+  return slept;
+}
+
 std::vector<LogLine> Appliance::TakeLog() {
+
   const std::vector<LogLine> fresh = log_.Lines(logTaken_);
   logTaken_ += fresh.size();
   std::vector<LogLine> taken;

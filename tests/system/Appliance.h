@@ -4,8 +4,10 @@
 #include "Database.h"
 #include "NotificationService.h"
 #include "Syslog.h"
+#include "Tracer.h"
 #include "Volume.h"
 
+#include <chrono>
 #include <memory>
 #include <string>
 #include <vector>
@@ -48,6 +50,11 @@ public:
 
   /// Queues what Barrier waits for, and returns the text of the line that tells of it.
   std::string SendBarrier();
+
+  /// Has the daemon, which `tracer` holds, handle `message` until it is about to have slept for as
+  /// long as `time`, or else to the end. Returns how long it sleeps by then.
+  std::chrono::milliseconds HandleUntilSlept(Tracer& tracer, const std::string& message,
+                                             std::chrono::milliseconds time);
 
   /// What was logged since the last call, without the refusals of Barrier and without the
   /// merger thread's "Iterating over mount point" lines, which come at any time. Elapsed times

@@ -2,8 +2,6 @@
 
 #include "Deadline.h"
 
-#include "support/ThreadState.h"
-
 #include <fcntl.h>
 #include <poll.h>
 #include <spawn.h>
@@ -94,12 +92,6 @@ DaemonProcess::End DaemonProcess::AwaitEnd() {
   }
   pid_ = -1;
   return WIFEXITED(status) ? Exited(WEXITSTATUS(status)) : Killed(WTERMSIG(status));
-}
-
-void DaemonProcess::AwaitSystemCall(long number) const {
-  if (!test::AwaitSystemCall(pid_, number)) {
-    throw std::runtime_error("the daemon has not come to system call " + std::to_string(number));
-  }
 }
 
 std::vector<std::string> DaemonProcess::StandardOutput() const {

@@ -33,10 +33,6 @@ public:
   /// Waits for the daemon's end. Throws std::runtime_error after the deadline.
   End AwaitEnd();
 
-  /// Waits until a thread of the daemon is in the system call `number` (sys/syscall.h). Throws
-  /// std::runtime_error after the deadline.
-  void AwaitSystemCall(long number) const;
-
   /// The process, while it runs; -1 after its end.
   pid_t Pid() const { return pid_; }
 

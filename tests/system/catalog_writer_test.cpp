@@ -19,8 +19,6 @@ using ::testing::ElementsAre;
 using ::testing::IsEmpty;
 using ::testing::StartsWith;
 using namespace std::chrono_literals;
-using std::chrono::duration_cast;
-using std::chrono::milliseconds;
 
 constexpr unsigned SEED = 20'081;
 
@@ -231,27 +229,12 @@ protected:
     indexer.Commit();
     indexer.Rows().Run("BEGIN EXCLUSIVE");
   }
-
-  /// Has the daemon merge B, and holds it where it is about to have waited for the catalog as long
-  /// as that, or else behind the merge. Returns how long it waits by then.
-  milliseconds MergeUntilWaited(Tracer& tracer, milliseconds time) {
-    appliance.Service().Send(TranscodedBatch(b.Path()));
-    const std::string last = appliance.SendBarrier();
-    milliseconds waited{};
-    tracer.RunUntil([&](const SystemCall& call) {
-      const auto wait = duration_cast<milliseconds>(tracer.Sleep(call));
-      waited += wait;
-      return (wait > milliseconds::zero() && waited >= time) ||
-             tracer.Data(call).find(last) != std::string::npos;
-    });
-    return waited;
-  }
 };
 
 TEST_P(CatalogLocked, ForFiveSecondsIsWaitedFor) {
   {
     Tracer tracer(appliance.Daemon().Pid());
-    EXPECT_EQ(5s, MergeUntilWaited(tracer, 5s));
+    EXPECT_EQ(5s, appliance.HandleUntilSlept(tracer, TranscodedBatch(b.Path()), 5s));
     ExpectMerged({1});
     indexer.Commit();
   }
@@ -262,7 +245,7 @@ TEST_P(CatalogLocked, ForFiveSecondsIsWaitedFor) {
 TEST_P(CatalogLocked, ForLongerFailsTheMerge) {
   {
     Tracer tracer(appliance.Daemon().Pid());
-    EXPECT_EQ(5s, MergeUntilWaited(tracer, 6s));
+    EXPECT_EQ(5s, appliance.HandleUntilSlept(tracer, TranscodedBatch(b.Path()), 6s));
   }
   EXPECT_THAT(AwaitErrors(),
               ElementsAre(::testing::AllOf(StartsWith("Error that we will ignore "),

@@ -5,18 +5,17 @@
 
 #include "support/Extent.h"
 
-#include <sys/syscall.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <chrono>
 #include <functional>
 #include <regex>
-#include <thread>
 
 namespace orva::test {
 namespace {
 
+using namespace std::chrono_literals;
 using ::testing::AllOf;
 using ::testing::AnyOf;
 using ::testing::Contains;
@@ -277,15 +276,16 @@ TEST_F(MasterOutage, AReadOnlyMasterFailsWhatWouldChangeIt) {
 /// Another program that uses the merged database while a merge runs.
 class MasterLocked : public MasterOutage, public ::testing::WithParamInterface<const char*> {
 protected:
-  /// Runs a merge of B against the lock, which is let go half a second after the merge has begun
-  /// to wait for it.
+  /// Runs a merge of B against the lock, which is let go when the merge has waited for it for half
+  /// a second.
   Log HandleLockedForHalfASecond() {
     const MergedDatabase other(a.Path());
     Lock(other);
-    appliance.Service().Send(TranscodedBatch(b.Path()));
-    appliance.Daemon().AwaitSystemCall(SYS_clock_nanosleep);
-    std::this_thread::sleep_for(std::chrono::milliseconds(500)); // what the other program needs
-    other.Rows().Run("COMMIT");
+    {
+      Tracer tracer(appliance.Daemon().Pid());
+      EXPECT_GE(appliance.HandleUntilSlept(tracer, TranscodedBatch(b.Path()), 500ms), 500ms);
+      other.Rows().Run("COMMIT");
+    }
     appliance.Barrier();
     return appliance.TakeLog();
   }
