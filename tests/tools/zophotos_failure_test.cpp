@@ -87,6 +87,13 @@ TEST_F(ZophotosLocator, MayBeMalformed) {
   }
 }
 
+TEST_F(ZophotosLocator, MayHaveANul) {
+  for (const std::string& path : {std::string("\0", 1), std::string("/shares\0/x", 10)}) {
+    Write("zophotos_db_path=" + path + "\n");
+    ExpectNoDatabase("/tmp/zophotodbmerger.conf has a NUL in its first line, which no path has");
+  }
+}
+
 TEST_F(ZophotosLocator, MayBeNoFile) {
   const std::string reason =
       "/tmp/zophotodbmerger.conf is not a regular file, so that the daemon does not "
@@ -140,7 +147,7 @@ TEST(ZophotosUsage, IsToldFromFailure) {
       {{"--json", "find", "--null", "x"}, "takes one of --null and --json"},
       {{"--database"}, "--database"},
       {{"--database", "", "status"}, "it is empty"},
-      {{"status", "check"}, ""}};
+      {{"status", "check"}, "check"}};
   for (const auto& [arguments, message] : wrong) {
     SCOPED_TRACE(Text(arguments));
     const Outcome outcome = Zophotos(arguments);
@@ -158,7 +165,7 @@ TEST(ZophotosUsage, IsExplained) {
       EXPECT_THAT(help.output, HasSubstr("\n  " + std::string(command) + " "));
       const Outcome more = Zophotos({command, "--help"});
       EXPECT_EQ(0, more.status);
-      EXPECT_THAT(more.output, HasSubstr(command));
+      EXPECT_THAT(more.output, AllOf(HasSubstr(command), HasSubstr("zophotos --help")));
     }
   }
 }
@@ -200,6 +207,24 @@ TEST_F(ZophotosFailure, OfAViewInPlaceOfATable) {
     copy.Run("CREATE VIEW Statistics AS SELECT * FROM Other");
   }
   ExpectRefused(" is no merged photo database: it has no table Statistics");
+}
+
+/// Half a character sorts by other bytes than those that it is read as.
+TEST_F(ZophotosFailure, OfTextsInUtf16) {
+  fs::create_directory("/tmp/copy");
+  const Database database(COPY, true);
+  database.Run("PRAGMA encoding = 'UTF-16le'");
+  for (const char* const table : {"Status(id)", "Statistics(id)", "Files(folder_id)",
+                                  "Folders(folder_id INTEGER PRIMARY KEY, name TEXT, volume TEXT, "
+                                  "modified_date INTEGER)"}) {
+    database.Run("CREATE TABLE " + std::string(table));
+  }
+  // "/shares/" and the second half of a pair.
+  database.Run("INSERT INTO Folders(name) VALUES(CAST(x'2f007300680061007200650073002f0000dc2f00' "
+               "AS TEXT))");
+  const std::string message = " is no merged photo database: its texts are in UTF-16le";
+  ExpectRefused(message);
+  ExpectFailure(OnCopy({"check"}), 5, COPY + message);
 }
 
 TEST_F(ZophotosFailure, OfAFileThatIsEmpty) {
@@ -297,19 +322,23 @@ TEST_F(ZophotosFailure, OfAnOutputThatCannotBeWritten) {
   }
 }
 
-TEST_F(ZophotosFailure, OfSpaceForAPrivateCopy) {
+TEST_F(ZophotosFailure, OfAPlaceForAPrivateCopy) {
   Copy().Run(
       "WITH RECURSIVE n(i) AS (SELECT 1 UNION ALL SELECT i + 1 FROM n WHERE i < 100000) INSERT "
       "INTO Files(folder_id, name, modified_date, volume, created_date) SELECT 1, i, 1, 'x', 1 "
       "FROM n");
-  const Volume small("Small", "64k");
-  setenv("SQLITE_TMPDIR", small.Path().c_str(), 1);
-  for (const Arguments& command : {Arguments{"status"}, Arguments{"tree"}, Arguments{"find", "*"},
-                                   Arguments{"check"}, Arguments{"export", "--csv"}}) {
-    SCOPED_TRACE(Text(command));
-    ExpectFailure(OnCopy(command), 5,
-                  "no space for a private copy of " + COPY +
-                      "; SQLITE_TMPDIR names another folder for it");
+  const Volume full("Full", "64k");
+  const Volume closed("Closed", "64k,nr_inodes=1");
+  for (const auto& [volume, fault] :
+       {std::pair(&full, "no space"), std::pair(&closed, "no writable folder")}) {
+    setenv("SQLITE_TMPDIR", volume->Path().c_str(), 1);
+    for (const Arguments& command : {Arguments{"status"}, Arguments{"tree"}, Arguments{"find", "*"},
+                                     Arguments{"check"}, Arguments{"export", "--csv"}}) {
+      SCOPED_TRACE(Text(command));
+      ExpectFailure(OnCopy(command), 5,
+                    std::string(fault) + " for a private copy of " + COPY +
+                        "; SQLITE_TMPDIR names another folder for it");
+    }
   }
   unsetenv("SQLITE_TMPDIR");
 }

@@ -298,6 +298,14 @@ TEST_F(ZophotosHostile, IdsAtTheirEndDoNoHarm) {
   ExpectNoHarm();
 }
 
+TEST_F(ZophotosHostile, IdsThatGoBackAddNothing) {
+  const Database copy = Copy();
+  Program watch(ZophotosCommand({"--database", COPY, "watch"}));
+  EXPECT_THAT(watch.ReadLine(), HasSubstr("watching"));
+  copy.Run("UPDATE sqlite_sequence SET seq = 0");
+  EXPECT_THAT(watch.ReadLine(), HasSubstr("  written, nothing added or removed"));
+}
+
 TEST_F(ZophotosHostile, NamesOfOtherTypesDoNoHarm) {
   const Database copy = Copy();
   copy.Run("UPDATE Folders SET name = zeroblob(100), volume = x'ff00' WHERE name = '/shares/B/'");

@@ -110,6 +110,23 @@ TEST_F(ZophotosStatus, TimesInTextAreLocal) {
               HasSubstr(R"("stamped":"1970-01-01T00:16:40Z")"));
 }
 
+TEST_F(ZophotosStatus, LeavesOutAStatusRowThatIsMissing) {
+  Copy().Run("DELETE FROM Status");
+  EXPECT_THAT(OnCopy({"status"}).output, HasSubstr("\nVersion   -\nStamped   -\n\nVOLUME"));
+  EXPECT_THAT(OnCopy({"status", "--json"}).output, HasSubstr(R"("version":null,"stamped":null,)"));
+}
+
+TEST_F(ZophotosStatus, TimesThatNoCalendarHasAreNumbers) {
+  const Database copy = Copy();
+  for (const auto& [seconds, text] :
+       {std::pair("-62135596800", "1-01-01 00:00:00"), std::pair("-62135596801", "-62135596801"),
+        std::pair("253402300799", "9999-12-31 23:59:59"), std::pair("253402300800", "253402300800"),
+        std::pair("67767976233532800", "67767976233532800")}) {
+    copy.Run("UPDATE Status SET mdate = ?", {seconds});
+    EXPECT_THAT(OnCopy({"status"}).output, HasSubstr("\nStamped   " + std::string(text) + "\n"));
+  }
+}
+
 TEST_F(ZophotosStatus, ReadsTheDatabaseThatItIsGiven) {
   const Database copy = Copy();
   copy.Run("UPDATE Status SET mc_version = '7.5'");
@@ -324,6 +341,29 @@ TEST_F(ZophotosFind, EscapesWhatATerminalOrALineCannotTake) {
   AddRows(Copy(), "'/shares/A/odd/'", ODD_NAME_SQL);
   ExpectOutput(OnCopy({"find", "x*"}), R"(/shares/A/odd/x\x0a\x1b[\xff\\.jpg)"
                                        "\n");
+}
+
+TEST_F(ZophotosFind, EscapesCharactersThatCannotBeSeen) {
+  const Database copy = Copy();
+  const std::vector<std::pair<std::string, std::string>> names = {
+      {"\u00AD", R"(\xc2\xad)"},
+      {"\u034F", R"(\xcd\x8f)"},
+      {"\u115F", R"(\xe1\x85\x9f)"},
+      {"\u200B", R"(\xe2\x80\x8b)"},
+      {"\u202E", R"(\xe2\x80\xae)"},
+      {"\u3164", R"(\xe3\x85\xa4)"},
+      {"\uFFA0", R"(\xef\xbe\xa0)"},
+      {"\U0001D173", R"(\xf0\x9d\x85\xb3)"},
+      {"\U000E0041", R"(\xf3\xa0\x81\x81)"}};
+  for (const auto& [name, escaped] : names) {
+    copy.Run("UPDATE Files SET name = ?1 WHERE name = 'top.jpg' OR name LIKE '%.x'", {name + ".x"});
+    ExpectOutput(OnCopy({"find", "*.x"}), "/shares/A/" + escaped + ".x\n");
+  }
+  // A family's joiners, the selector of a picture, and that of a Chinese character's form.
+  for (const char* const name : {"👩‍👧.x", "❤️.x", "葛\U000E0100.x", "ü.x"}) {
+    copy.Run("UPDATE Files SET name = ? WHERE name LIKE '%.x'", {name});
+    ExpectOutput(OnCopy({"find", "*.x"}), "/shares/A/" + std::string(name) + "\n");
+  }
 }
 
 TEST_F(ZophotosFind, PrintsPathsAsTheyAreWithANullBehind) {

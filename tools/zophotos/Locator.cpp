@@ -50,6 +50,9 @@ std::string FindDatabase() {
   if (line.empty()) {
     ThrowNoDatabase(std::string(LOCATOR) + " names none at this moment");
   }
+  if (line.find('\0') != std::string::npos) {
+    ThrowNoDatabase(std::string(LOCATOR) + " has a NUL in its first line, which no path has");
+  }
   return line;
 }
 

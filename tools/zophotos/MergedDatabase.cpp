@@ -29,12 +29,17 @@ void Distrust(SQLite::Database& database) {
   }
 }
 
-void RequireTables(const SQLite::Database& database, const std::string& path) {
+/// Tables and texts as the daemon makes them. In UTF-16 texts are not ordered by their bytes.
+void RequireMergedDatabase(SQLite::Database& database, const std::string& path) {
+  const std::string fault = path + " is no merged photo database: ";
   for (const char* const table : {"Status", "Statistics", "Folders", "Files"}) {
     if (!database.tableExists(table)) {
-      throw Failure(ExitStatus::Failed,
-                    path + " is no merged photo database: it has no table " + table);
+      throw Failure(ExitStatus::Failed, fault + "it has no table " + table);
     }
+  }
+  const std::string encoding = database.execAndGet("PRAGMA encoding").getString();
+  if (encoding != "UTF-8") {
+    throw Failure(ExitStatus::Failed, fault + "its texts are in " + encoding);
   }
 }
 
@@ -46,6 +51,15 @@ bool HasWriteAheadLog(const std::string& path) {
   std::array<char, 20> header{};
   std::ifstream(path, std::ios::binary).read(header.data(), header.size());
   return header.at(readVersion) == writeAheadLog;
+}
+
+/// What cannot be opened later is not this file.
+SQLite::Database Connect(const std::string& path) {
+  try {
+    return {path, SQLite::OPEN_READONLY, BUSY_TIMEOUT};
+  } catch (const SQLite::Exception& error) {
+    throw Failure(ExitStatus::Failed, path + ": " + error.what());
+  }
 }
 
 /// Opens the file without a look at what is in it.
@@ -64,7 +78,7 @@ SQLite::Database OpenFile(const std::string& path) {
                                           " has a write-ahead log, which the daemon's databases do "
                                           "not have: to read it would be to write beside it");
   }
-  SQLite::Database database(path, SQLite::OPEN_READONLY, BUSY_TIMEOUT);
+  SQLite::Database database = Connect(path);
   Distrust(database);
   return database;
 }
@@ -98,7 +112,7 @@ bool IsInterruptedMerge(const SQLite::Exception& error) {
 
 SQLite::Database OpenDatabase(const std::string& path) {
   SQLite::Database database = OpenFile(path);
-  RequireTables(database, path);
+  RequireMergedDatabase(database, path);
   return database;
 }
 
@@ -109,7 +123,7 @@ SQLite::Database CopyDatabase(const std::string& path) {
     SQLite::Database database = OpenFile(path);
     CopyPages(database, copy);
   }
-  RequireTables(copy, path);
+  RequireMergedDatabase(copy, path);
   return copy;
 }
 
@@ -153,8 +167,10 @@ std::string Explain(const SQLite::Exception& error, const std::string& path) {
   if (IsLocked(error)) {
     return path + " is locked, as it is while a large merge is written; try again";
   }
-  if ((error.getErrorCode() & 0xFF) == SQLITE_FULL) {
-    return "no space for a private copy of " + path + "; SQLITE_TMPDIR names another folder for it";
+  const int code = error.getErrorCode() & 0xFF;
+  if (code == SQLITE_FULL || code == SQLITE_CANTOPEN) {
+    return std::string(code == SQLITE_FULL ? "no space" : "no writable folder") +
+           " for a private copy of " + path + "; SQLITE_TMPDIR names another folder for it";
   }
   return path + ": " + error.what();
 }

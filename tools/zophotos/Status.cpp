@@ -7,6 +7,7 @@
 
 #include <algorithm>
 #include <map>
+#include <optional>
 
 namespace orva::zophotos {
 
@@ -22,6 +23,21 @@ struct Volume {
 };
 
 using Volumes = std::map<std::string, Volume>;
+
+/// The status row.
+struct Row {
+  std::string version;
+  std::int64_t stamp = 0; ///< seconds since the epoch
+};
+
+/// Nothing where somebody has removed it.
+std::optional<Row> ReadRow(SQLite::Database& database) {
+  SQLite::Statement query(database, "SELECT mc_version, mdate FROM Status WHERE id = 1");
+  if (!query.executeStep()) {
+    return std::nullopt;
+  }
+  return Row{query.getColumn(0).getString(), query.getColumn(1).getInt64()};
+}
 
 /// The daemon, too, reads only a volume's first row.
 void ReadStatistics(SQLite::Database& database, Volumes& volumes) {
@@ -95,10 +111,10 @@ Table MakeTable(const Volumes& volumes, int barWidth) {
   return table;
 }
 
-void PrintText(const std::string& path, const std::string& version, std::int64_t stamp,
-               const Volumes& volumes) {
-  std::cout << "Database  " << Printable(path) << "\nVersion   " << Printable(version)
-            << "\nStamped   " << LocalTime(stamp) << "\n\n";
+void PrintText(const std::string& path, const std::optional<Row>& row, const Volumes& volumes) {
+  std::cout << "Database  " << Printable(path) << "\nVersion   "
+            << (row ? Printable(row->version) : "-") << "\nStamped   "
+            << (row ? LocalTime(row->stamp) : "-") << "\n\n";
   if (volumes.empty()) {
     std::cout << "No volume has been merged yet.\n";
     return;
@@ -110,8 +126,7 @@ void PrintText(const std::string& path, const std::string& version, std::int64_t
   (fits ? table : MakeTable(volumes, 0)).Print(std::cout, width);
 }
 
-void PrintJson(const std::string& path, const std::string& version, std::int64_t stamp,
-               const Volumes& volumes) {
+void PrintJson(const std::string& path, const std::optional<Row>& row, const Volumes& volumes) {
   Json list = Json::array();
   for (const auto& [name, volume] : volumes) {
     list.push_back(
@@ -123,8 +138,8 @@ void PrintJson(const std::string& path, const std::string& version, std::int64_t
          {"merged_up_to", volume.mergedUpTo == 0 ? Json() : JsonTime(volume.mergedUpTo)}});
   }
   PrintLine({{"database", ToUtf8(path)},
-             {"version", ToUtf8(version)},
-             {"stamped", JsonTime(stamp)},
+             {"version", row ? Json(ToUtf8(row->version)) : Json()},
+             {"stamped", row ? JsonTime(row->stamp) : Json()},
              {"volumes", std::move(list)}});
 }
 
@@ -133,15 +148,7 @@ void PrintJson(const std::string& path, const std::string& version, std::int64_t
 ExitStatus ShowStatus(const std::string& path, Form form) {
   // Counting reads every row.
   SQLite::Database database = CopyDatabase(path);
-  std::string version;
-  std::int64_t stamp = 0;
-  SQLite::Statement status(database, "SELECT mc_version, mdate FROM Status WHERE id = 1");
-  if (status.executeStep()) {
-    version = status.getColumn(0).getString();
-    stamp = status.getColumn(1).getInt64();
-  }
-  const Volumes volumes = ReadVolumes(database);
-  (form == Form::Json ? PrintJson : PrintText)(path, version, stamp, volumes);
+  (form == Form::Json ? PrintJson : PrintText)(path, ReadRow(database), ReadVolumes(database));
   return ExitStatus::Success;
 }
 

@@ -5,6 +5,7 @@
 #include <sys/ioctl.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <array>
 #include <clocale>
 #include <cstdio>
@@ -12,6 +13,7 @@
 #include <cwchar>
 #include <cwctype>
 #include <iterator>
+#include <utility>
 
 namespace orva::zophotos {
 
@@ -58,12 +60,25 @@ std::string_view Tail(std::string_view printable, std::size_t width) {
   return printable.substr(begin);
 }
 
-/// Characters that cannot be seen, and have what is around them shown otherwise than it is written;
-/// not the joiners that scripts and emojis need.
+/// Characters that cannot be seen, some of which have what is around them shown otherwise than it
+/// is written: those that Unicode calls default ignorable, without the joiners and variation
+/// selectors that scripts and emojis need.
 bool IsInvisible(utf::code_point point) {
-  return point == 0x061C || point == 0x200B || point == 0x200E || point == 0x200F ||
-         (point >= 0x202A && point <= 0x202E) || (point >= 0x2060 && point <= 0x206F) ||
-         point == 0xFEFF || (point >= 0xE0000 && point <= 0xE007F);
+  constexpr std::pair<utf::code_point, utf::code_point> ranges[] = {
+      {0x00AD, 0x00AD},   {0x034F, 0x034F},  {0x061C, 0x061C},   {0x115F, 0x1160},
+      {0x17B4, 0x17B5},   {0x180E, 0x180E},  {0x200B, 0x200B},   {0x200E, 0x200F},
+      {0x202A, 0x202E},   {0x2060, 0x206F},  {0x3164, 0x3164},   {0xFEFF, 0xFEFF},
+      {0xFFA0, 0xFFA0},   {0xFFF0, 0xFFF8},  {0x1BCA0, 0x1BCA3}, {0x1D173, 0x1D17A},
+      {0xE0000, 0xE00FF}, {0xE01F0, 0xE0FFF}};
+  return std::any_of(std::begin(ranges), std::end(ranges), [point](const auto& range) {
+    return point >= range.first && point <= range.second;
+  });
+}
+
+bool IsInCalendar(std::int64_t seconds) {
+  constexpr std::int64_t beginOfYear1 = -62'135'596'800;
+  constexpr std::int64_t endOfYear9999 = 253'402'300'800;
+  return seconds >= beginOfYear1 && seconds < endOfYear9999;
 }
 
 std::string Format(const char* format, const std::tm& time) {
@@ -160,16 +175,15 @@ std::optional<std::size_t> TerminalWidth() {
 std::string LocalTime(std::int64_t seconds) {
   const std::time_t time = seconds;
   std::tm fields{};
-  return localtime_r(&time, &fields) == nullptr ? std::to_string(seconds)
-                                                : Format("%Y-%m-%d %H:%M:%S", fields);
+  return IsInCalendar(seconds) && localtime_r(&time, &fields) != nullptr
+             ? Format("%Y-%m-%d %H:%M:%S", fields)
+             : std::to_string(seconds);
 }
 
 std::optional<std::string> IsoTime(std::int64_t seconds) {
-  constexpr std::int64_t beginOfYear1 = -62'135'596'800;
-  constexpr std::int64_t endOfYear9999 = 253'402'300'800;
   const std::time_t time = seconds;
   std::tm fields{};
-  if (seconds < beginOfYear1 || seconds >= endOfYear9999 || gmtime_r(&time, &fields) == nullptr) {
+  if (!IsInCalendar(seconds) || gmtime_r(&time, &fields) == nullptr) {
     return std::nullopt;
   }
   // strftime's %Y has no leading zeros.

@@ -30,7 +30,7 @@ std::string Shorten(const std::string& printable, std::size_t width);
 /// Columns of the terminal behind standard output; nothing when that is none.
 std::optional<std::size_t> TerminalWidth();
 
-/// "2026-11-21 09:15:00" in local time, for people; a time that no calendar has is the number.
+/// "2026-11-21 09:15:00" in local time, for people; the number outside the years 1 to 9999.
 std::string LocalTime(std::int64_t seconds);
 
 /// "2026-11-21T08:15:00Z", for programs; nothing outside the years 1 to 9999.

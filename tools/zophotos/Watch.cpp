@@ -8,6 +8,7 @@
 
 #include <sys/stat.h>
 
+#include <algorithm>
 #include <chrono>
 #include <ctime>
 #include <map>
@@ -81,8 +82,9 @@ State ReadState(SQLite::Database& database) {
 }
 
 Difference Compare(const Rows& before, const Rows& now) {
-  const std::int64_t added = now.lastId - before.lastId;
-  return {.added = added, .removed = before.count + added - now.count};
+  // Only a stranger gives ids that go back.
+  const auto added = std::max<std::int64_t>(now.lastId - before.lastId, 0);
+  return {.added = added, .removed = std::max<std::int64_t>(before.count + added - now.count, 0)};
 }
 
 /// Adds the volumes that new rows belong to; of a merge all belong to one, so the first are enough.

@@ -113,6 +113,9 @@ private:
     check_ = app_.add_subcommand("check", "What is wrong with the database");
     watch_ = app_.add_subcommand("watch", "A line for each change, until interrupted");
     AddExport();
+    for (CLI::App* const command : app_.get_subcommands({})) {
+      command->footer("Options of every command: zophotos --help");
+    }
   }
 
   void AddExport() {
