@@ -3,6 +3,7 @@
 #include "Messages.h"
 
 #include <ctime>
+#include <filesystem>
 
 namespace orva::test {
 namespace {
@@ -265,6 +266,33 @@ TEST_F(Merge, SeveralVolumesShareTheMastersDatabase) {
   EXPECT_EQ(files, merged.Files());
   EXPECT_THAT(merged.Statistics(), ElementsAre("/shares/A/|3|3|2002", "/shares/B/|1|1|50"));
   EXPECT_FALSE(HasMergedDatabase(b.Path()));
+}
+
+/// There is no folder /shares/Disks/ that its own could be in.
+TEST_F(Merge, AVolumeThatIsNotRightBelowTheSharesRootHasOnlyStatistics) {
+  MergeFirst();
+  std::filesystem::create_directory("/shares/Disks");
+  const Volume b("Disks/B", "1g");
+  Catalog other(b);
+  other.AddPhoto("b.jpg", 1100, 50);
+  appliance.Handle(Plugged(b.Path()));
+  appliance.Handle(TranscodedBatch(b.Path()));
+  const MergedDatabase merged(a.Path());
+  EXPECT_EQ(allFolders, merged.Folders());
+  EXPECT_EQ(allFiles, merged.Files());
+  EXPECT_THAT(merged.Statistics(), ElementsAre("/shares/A/|3|3|2002", "/shares/Disks/B/|1|1|50"));
+}
+
+/// There is the folder of the volume that it is mounted on.
+TEST_F(Merge, AVolumeInsideAnotherIsMergedBelowIt) {
+  MergeFirst();
+  const Volume b("A/B", "1g");
+  Catalog other(b);
+  other.AddPhoto("b.jpg", 1100, 50);
+  appliance.Handle(Plugged(b.Path()));
+  appliance.Handle(TranscodedBatch(b.Path()));
+  EXPECT_THAT(MergedDatabase(a.Path()).Files(),
+              ::testing::Contains("/shares/A/B/b.jpg|1100|1100|/shares/A/B/"));
 }
 
 TEST_F(Merge, AReadOnlyVolumeIsMerged) {
