@@ -89,7 +89,7 @@ std::chrono::milliseconds Appliance::HandleUntilSlept(Tracer& tracer, const std:
   tracer.RunUntil([&](const SystemCall& call) {
     const auto sleep = std::chrono::duration_cast<std::chrono::milliseconds>(tracer.Sleep(call));
     slept += sleep;
-    return (sleep > sleep.zero() && slept >= time) ||
+    return (sleep.count() > 0 && slept >= time) ||
            tracer.Data(call).find(last) != std::string::npos;
   });
   return slept;
