@@ -1,6 +1,7 @@
 #include "Appliance.h"
 
 #include "Database.h"
+#include "Tracer.h"
 #include "orvautil/Core.h"
 
 #include <algorithm>
@@ -87,16 +88,13 @@ std::chrono::milliseconds Appliance::HandleUntilSlept(Tracer& tracer, const std:
   const std::string last = SendBarrier();
   std::chrono::milliseconds slept{};
   tracer.RunUntil([&](const SystemCall& call) {
-    const auto sleep = std::chrono::duration_cast<std::chrono::milliseconds>(tracer.Sleep(call));
-    slept += sleep;
-    return (sleep.count() > 0 && slept >= time) ||
-           tracer.Data(call).find(last) != std::string::npos;
+    slept += std::chrono::duration_cast<std::chrono::milliseconds>(tracer.Sleep(call));
+    return slept >= time || tracer.Data(call).find(last) != std::string::npos;
   });
   return slept;
 }
 
 std::vector<LogLine> Appliance::TakeLog() {
-
   const std::vector<LogLine> fresh = log_.Lines(logTaken_);
   logTaken_ += fresh.size();
   std::vector<LogLine> taken;

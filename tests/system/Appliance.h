@@ -4,7 +4,6 @@
 #include "Database.h"
 #include "NotificationService.h"
 #include "Syslog.h"
-#include "Tracer.h"
 #include "Volume.h"
 
 #include <chrono>
@@ -13,6 +12,8 @@
 #include <vector>
 
 namespace orva::test {
+
+class Tracer;
 
 /// The appliance around the daemon: its system log, its notification service and the files that
 /// the daemon leaves, in the private root that the test runs in. A test makes volumes, starts
