@@ -17,6 +17,11 @@ inline Json JsonTime(std::int64_t seconds) {
   return text ? Json(*text) : Json();
 }
 
+/// The stamp up to which a volume is merged; null for 0, which stands for none.
+inline Json JsonStamp(std::int64_t seconds) {
+  return seconds == 0 ? Json() : JsonTime(seconds);
+}
+
 /// Prints an object, whose texts are UTF-8, as one line.
 inline void PrintLine(const Json& object) {
   std::cout << object.dump() << '\n';

@@ -129,13 +129,12 @@ void PrintText(const std::string& path, const std::optional<Row>& row, const Vol
 void PrintJson(const std::string& path, const std::optional<Row>& row, const Volumes& volumes) {
   Json list = Json::array();
   for (const auto& [name, volume] : volumes) {
-    list.push_back(
-        {{"volume", ToUtf8(name)},
-         {"transcoded", volume.transcoded},
-         {"total", volume.total},
-         {"folders", volume.folders},
-         {"files", volume.files},
-         {"merged_up_to", volume.mergedUpTo == 0 ? Json() : JsonTime(volume.mergedUpTo)}});
+    list.push_back({{"volume", ToUtf8(name)},
+                    {"transcoded", volume.transcoded},
+                    {"total", volume.total},
+                    {"folders", volume.folders},
+                    {"files", volume.files},
+                    {"merged_up_to", JsonStamp(volume.mergedUpTo)}});
   }
   PrintLine({{"database", ToUtf8(path)},
              {"version", row ? Json(ToUtf8(row->version)) : Json()},

@@ -217,11 +217,10 @@ private:
       text += progress.mergedUpTo == 0 ? "is to be merged from its beginning"
                                        : std::to_string(progress.transcoded) + " of " +
                                              Count(progress.total, "photo") + " transcoded";
-      volumes.push_back(
-          {{"volume", ToUtf8(volume)},
-           {"transcoded", progress.transcoded},
-           {"total", progress.total},
-           {"merged_up_to", progress.mergedUpTo == 0 ? Json() : JsonTime(progress.mergedUpTo)}});
+      volumes.push_back({{"volume", ToUtf8(volume)},
+                         {"transcoded", progress.transcoded},
+                         {"total", progress.total},
+                         {"merged_up_to", JsonStamp(progress.mergedUpTo)}});
     }
     Print("changed",
           text.empty() ? "written, nothing added or removed" : text.substr(text[0] == ' ' ? 1 : 2),
