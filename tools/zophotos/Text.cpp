@@ -3,9 +3,9 @@
 #include <boost/locale/utf.hpp>
 
 #include <sys/ioctl.h>
+#include <unicode/uchar.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <array>
 #include <clocale>
 #include <cstdio>
@@ -13,7 +13,6 @@
 #include <cwchar>
 #include <cwctype>
 #include <iterator>
-#include <utility>
 
 namespace orva::zophotos {
 
@@ -64,15 +63,11 @@ std::string_view Tail(std::string_view printable, std::size_t width) {
 /// is written: those that Unicode calls default ignorable, without the joiners and variation
 /// selectors that scripts and emojis need.
 bool IsInvisible(utf::code_point point) {
-  constexpr std::pair<utf::code_point, utf::code_point> ranges[] = {
-      {0x00AD, 0x00AD},   {0x034F, 0x034F},  {0x061C, 0x061C},   {0x115F, 0x1160},
-      {0x17B4, 0x17B5},   {0x180E, 0x180E},  {0x200B, 0x200B},   {0x200E, 0x200F},
-      {0x202A, 0x202E},   {0x2060, 0x206F},  {0x3164, 0x3164},   {0xFEFF, 0xFEFF},
-      {0xFFA0, 0xFFA0},   {0xFFF0, 0xFFF8},  {0x1BCA0, 0x1BCA3}, {0x1D173, 0x1D17A},
-      {0xE0000, 0xE00FF}, {0xE01F0, 0xE0FFF}};
-  return std::any_of(std::begin(ranges), std::end(ranges), [point](const auto& range) {
-    return point >= range.first && point <= range.second;
-  });
+  const auto has = [point](UProperty property) {
+    return u_hasBinaryProperty(static_cast<UChar32>(point), property) != 0;
+  };
+  return has(UCHAR_DEFAULT_IGNORABLE_CODE_POINT) && !has(UCHAR_JOIN_CONTROL) &&
+         !has(UCHAR_VARIATION_SELECTOR);
 }
 
 bool IsInCalendar(std::int64_t seconds) {
