@@ -41,7 +41,7 @@ void Run(sqlite3* handle, const char* sql) {
 }
 
 /// A volume is whoever's plugged it in: nothing that its database brings along is run.
-void Distrust(sqlite3* handle) {
+void DisableUntrustedFeatures(sqlite3* handle) {
   for (const auto& [option, value] :
        {std::pair(SQLITE_DBCONFIG_ENABLE_TRIGGER, 0), std::pair(SQLITE_DBCONFIG_ENABLE_VIEW, 0),
         std::pair(SQLITE_DBCONFIG_TRUSTED_SCHEMA, 0), std::pair(SQLITE_DBCONFIG_DEFENSIVE, 1)}) {
@@ -119,7 +119,7 @@ void DB::Open(std::string path, Access access, int busyTimeout, bool immutable) 
     }
     connection_ = std::make_unique<Connection>(handle_, busyTimeout, size);
     sqlite3_busy_timeout(handle_, busyTimeout);
-    Distrust(handle_);
+    DisableUntrustedFeatures(handle_);
     if (access == Access::ReadWrite) {
       // A merge keeps its changes in memory until it commits, so that readers wait only then.
       Run(handle_, "PRAGMA cache_size = -65536");
@@ -163,7 +163,7 @@ long long DB::MeasureFile() const {
   return size;
 }
 
-void DB::RefuseComputedValues(const std::string& table) const {
+void DB::RejectComputedColumns(const std::string& table) const {
   const bool written = sqlite3_db_readonly(handle_, "main") == 0;
   const auto refuse = [&](bool computed, const char* what) {
     if (computed) {

@@ -85,7 +85,7 @@ std::unique_ptr<Item> ReadItem(const Statement& row, const std::string& base) {
 
 util::OwnerVector<db::Folder> ReadFolders(const std::string& volumeMountPoint,
                                           const db::VolumeDB& catalog) {
-  catalog.RefuseComputedValues("Folders");
+  catalog.RejectComputedColumns("Folders");
   ListMemory memory(catalog);
   util::OwnerVector<db::Folder> folders;
   folders.reserve(EXPECTED_ITEMS);
@@ -106,8 +106,8 @@ util::OwnerVector<db::Folder> ReadFolders(const std::string& volumeMountPoint,
 
 util::OwnerVector<db::File> ReadChangedFiles(const std::string& volumeMountPoint,
                                              const db::VolumeDB& catalog, std::time_t since) {
-  catalog.RefuseComputedValues("Files");
-  catalog.RefuseComputedValues("Transcodings");
+  catalog.RejectComputedColumns("Files");
+  catalog.RejectComputedColumns("Transcodings");
   ListMemory memory(catalog);
   util::OwnerVector<db::File> files;
   files.reserve(EXPECTED_ITEMS);
@@ -132,7 +132,7 @@ util::OwnerVector<db::File> ReadChangedFiles(const std::string& volumeMountPoint
 }
 
 PhotoCounts CountPhotos(const std::string& /*volumeMountPoint*/, const db::VolumeDB& catalog) {
-  catalog.RefuseComputedValues("Files");
+  catalog.RejectComputedColumns("Files");
   PhotoCounts counts;
   {
     Statement query(catalog,

@@ -110,9 +110,9 @@ void HandOver(std::unique_ptr<Record> record, std::vector<Record*>& records) {
 
 } // namespace
 
-PhotoDB::PhotoDB(const std::string& location, Asking asking)
+PhotoDB::PhotoDB(const std::string& location, CacheUse cacheUse)
     : dbLocation(util::MakePath(util::Path(location).Canonicalize(), ".zophotos")),
-      asking_(asking) {
+      cacheUse_(cacheUse) {
   if (!IsPresent(dbLocation)) {
     util::Path(dbLocation).Create(DIRECTORY_PERMISSIONS);
     if (!ChangeDirectoryMode(dbLocation, EVERYBODY)) {
@@ -142,7 +142,7 @@ void PhotoDB::Init() {
   Open(path);
   if (existed) {
     for (const char* const table : {"Status", "Statistics", "Folders", "Files"}) {
-      RefuseComputedValues(table);
+      RejectComputedColumns(table);
     }
     LoadStatus();
   }
@@ -249,14 +249,14 @@ std::unique_ptr<Folder> PhotoDB::GetFolder(const std::string& name,
   return query.Fetch(__FILE__, __LINE__) ? ReadFolder(query) : nullptr;
 }
 
-void PhotoDB::Knowledge::Forget() {
+void PhotoDB::MergeCache::Forget() {
   firstOwnFolder = NONE;
   folderId = NONE;
   names.reset();
 }
 
-void PhotoDB::Knowledge::EnterFolder(long long id, std::string_view path,
-                                     const std::string& volume) {
+void PhotoDB::MergeCache::EnterFolder(long long id, std::string_view path,
+                                      const std::string& volume) {
   folderId = id;
   folderPath = path;
   folderVolume = volume;
@@ -265,12 +265,12 @@ void PhotoDB::Knowledge::EnterFolder(long long id, std::string_view path,
   names.reset();
 }
 
-PhotoDB::Knowledge& PhotoDB::Known() const {
-  if (known_.transaction != RunningTransaction()) {
-    known_ = Knowledge();
-    known_.transaction = RunningTransaction();
+PhotoDB::MergeCache& PhotoDB::Cache() const {
+  if (cache_.transaction != RunningTransaction()) {
+    cache_ = MergeCache();
+    cache_.transaction = RunningTransaction();
   }
-  return known_;
+  return cache_;
 }
 
 long long PhotoDB::FindFolder(std::string_view path) const {
@@ -308,16 +308,16 @@ void PhotoDB::AddFolder(std::string volume, db::Folder& folder) const {
   insert.BindTextView(4, volume, __FILE__, __LINE__);
   insert.Execute(__FILE__, __LINE__);
 
-  Knowledge& known = Known();
-  if (known.transaction != 0 && known.firstOwnFolder == Knowledge::NONE) {
+  MergeCache& cache = Cache();
+  if (cache.transaction != 0 && cache.firstOwnFolder == MergeCache::NONE) {
     // Ids only grow, so this one and all that follow are ours.
-    known.firstOwnFolder = LastInsertId();
-    known.greatestPath.clear();
+    cache.firstOwnFolder = LastInsertId();
+    cache.greatestPath.clear();
   }
 }
 
 void PhotoDB::DeleteVolumes() const {
-  Known().Forget();
+  Cache().Forget();
   for (const char* const sql : {"DELETE FROM Folders WHERE folder_id != 1", "DELETE FROM Files ",
                                 "DELETE FROM Statistics", "VACUUM"}) {
     Statement(*this, sql, __FILE__, __LINE__).Execute(__FILE__, __LINE__);
@@ -325,7 +325,7 @@ void PhotoDB::DeleteVolumes() const {
 }
 
 void PhotoDB::DeleteVolume(const std::string& volume) const {
-  Known().Forget();
+  Cache().Forget();
   // Nothing holds these together, so their order does: whatever stops between them leaves no file
   // without a folder, which would never be found again, and a volume whose next merge begins anew
   // and restores what is gone.
@@ -346,9 +346,9 @@ std::unique_ptr<File> PhotoDB::GetFile(long long fileId) const {
 
 bool PhotoDB::IsFilePresent(const std::string& volume, const db::File& file,
                             std::string_view folderPath) const {
-  Knowledge& known = Known();
-  if (known.names) {
-    return known.names->contains(file.name);
+  MergeCache& cache = Cache();
+  if (cache.names) {
+    return cache.names->contains(file.name);
   }
   bool present = false;
   int cost = 0;
@@ -377,19 +377,19 @@ void PhotoDB::LearnNames(const std::string& volume, int cost) const {
   constexpr std::size_t mostNames = 200'000;
   constexpr std::size_t mostBytes = 64 << 20;
 
-  Knowledge& known = Known();
-  known.folderCost += cost;
-  if (asking_ == Asking::Always || known.transaction == 0 || cost < dearCost ||
-      known.folderCost < std::max(enoughCost, known.triedCost * 2)) {
+  MergeCache& cache = Cache();
+  cache.folderCost += cost;
+  if (cacheUse_ == CacheUse::Bypass || cache.transaction == 0 || cost < dearCost ||
+      cache.folderCost < std::max(enoughCost, cache.triedCost * 2)) {
     return;
   }
-  known.triedCost = known.folderCost;
+  cache.triedCost = cache.folderCost;
   const auto limit =
-      std::clamp(static_cast<std::size_t>(known.folderCost / costPerName), fewNames, mostNames);
-  Knowledge::Names names;
+      std::clamp(static_cast<std::size_t>(cache.folderCost / costPerName), fewNames, mostNames);
+  MergeCache::Names names;
   std::size_t bytes = 0;
   Statement query(*this, "SELECT * FROM Files WHERE folder_id = ? ", __FILE__, __LINE__);
-  query.BindInt64(1, known.folderId, __FILE__, __LINE__);
+  query.BindInt64(1, cache.folderId, __FILE__, __LINE__);
   while (query.Fetch(__FILE__, __LINE__)) {
     bytes += query.GetTextView(2).size();
     if (names.size() == limit || bytes > mostBytes) {
@@ -399,28 +399,28 @@ void PhotoDB::LearnNames(const std::string& volume, int cost) const {
       names.emplace(query.GetTextView(2));
     }
   }
-  known.names = std::move(names);
+  cache.names = std::move(names);
 }
 
 void PhotoDB::AddFile(const std::string& volume, db::File& file) const {
   const std::string_view folderPath = FolderPath(file.path);
-  Knowledge& known = Known();
-  const bool asksAll = asking_ == Asking::Always || known.transaction == 0;
-  if (asksAll || known.folderId == Knowledge::NONE || known.folderPath != folderPath ||
-      known.folderVolume != volume) {
+  MergeCache& cache = Cache();
+  const bool asksAll = cacheUse_ == CacheUse::Bypass || cache.transaction == 0;
+  if (asksAll || cache.folderId == MergeCache::NONE || cache.folderPath != folderPath ||
+      cache.folderVolume != volume) {
     const long long found = FindFolder(folderPath, volume);
     if (found == NO_FOLDER) {
       return;
     }
-    known.EnterFolder(found, folderPath, volume);
+    cache.EnterFolder(found, folderPath, volume);
   }
-  const long long folderId = known.folderId;
+  const long long folderId = cache.folderId;
 
   // In a folder of our own there are only files that we added. When they came in the order of
   // their paths, and are named as these say, a file that comes behind them all is new.
   const bool isNamedByPath = std::string_view(file.path).substr(folderPath.size()) == file.name;
   const bool isNew =
-      folderId >= known.firstOwnFolder && isNamedByPath && file.path > known.greatestPath;
+      folderId >= cache.firstOwnFolder && isNamedByPath && file.path > cache.greatestPath;
   if ((asksAll || !isNew) && IsFilePresent(volume, file, folderPath)) {
     return;
   }
@@ -437,19 +437,19 @@ void PhotoDB::AddFile(const std::string& volume, db::File& file) const {
   insert.BindTime(5, file.lastModifiedDate, __FILE__, __LINE__);
   insert.Execute(__FILE__, __LINE__);
 
-  if (known.names) {
-    known.names->insert(file.name);
+  if (cache.names) {
+    cache.names->insert(file.name);
   }
   if (!isNamedByPath) {
-    known.Forget();
-  } else if (file.path > known.greatestPath) {
-    known.greatestPath = file.path;
+    cache.Forget();
+  } else if (file.path > cache.greatestPath) {
+    cache.greatestPath = file.path;
   }
 }
 
 void PhotoDB::DeleteFolder(const std::string& volume, db::Folder& folder) const {
   writeLine({"Deleting ", folder.path});
-  Known().Forget();
+  Cache().Forget();
   const long long folderId = FindFolder(folder.path, volume);
   if (folderId != NO_FOLDER) {
     writeLine({"Found folder ", std::to_string(folderId), " for ", folder.path});
@@ -464,7 +464,7 @@ void PhotoDB::DeleteFolder(const std::string& volume, db::Folder& folder) const 
 
 void PhotoDB::DeleteFile(const std::string& /*volume*/, db::File& file) const {
   writeLine({"Deleting ", file.path});
-  Known().Forget();
+  Cache().Forget();
   const long long folderId = FindFolder(FolderPath(file.path));
   if (folderId != NO_FOLDER) {
     writeLine({"Found parent folder ", std::to_string(folderId), " for ", file.path});
@@ -487,20 +487,20 @@ void PhotoDB::IndexForRemovals(int cost) const {
   constexpr long long negligibleCost = 100'000;
   constexpr long long indexCostPerFile = 10;
 
-  Knowledge& known = Known();
-  known.removalCost += cost;
-  if (asking_ == Asking::Always || known.transaction == 0 || known.indexed ||
-      known.removalCost < negligibleCost) {
+  MergeCache& cache = Cache();
+  cache.removalCost += cost;
+  if (cacheUse_ == CacheUse::Bypass || cache.transaction == 0 || cache.indexed ||
+      cache.removalCost < negligibleCost) {
     return;
   }
-  if (known.indexCost == 0) {
+  if (cache.indexCost == 0) {
     Statement query(*this, "SELECT max(file_id) FROM Files", __FILE__, __LINE__);
-    known.indexCost = query.Fetch(__FILE__, __LINE__) ? query.GetInt64(0) * indexCostPerFile : 0;
+    cache.indexCost = query.Fetch(__FILE__, __LINE__) ? query.GetInt64(0) * indexCostPerFile : 0;
   }
-  if (known.removalCost >= known.indexCost) {
+  if (cache.removalCost >= cache.indexCost) {
     CreateTransientIndex("CREATE INDEX Files_merge ON Files(folder_id, name)",
                          "DROP INDEX Files_merge", __FILE__, __LINE__);
-    known.indexed = true;
+    cache.indexed = true;
   }
 }
 

@@ -43,12 +43,12 @@ public:
   };
 
   /// Whether a statement whose answer is known is asked all the same: for tests, which compare.
-  enum class Asking { WhenUnknown, Always };
+  enum class CacheUse { Normal, Bypass };
 
   /// Makes sure that the directory for the database exists at `location`; opens nothing. Throws
   /// Error when there can be none, and util::Exception when a new one cannot be made accessible
   /// to everybody.
-  explicit PhotoDB(const std::string& location, Asking asking = Asking::WhenUnknown);
+  explicit PhotoDB(const std::string& location, CacheUse cacheUse = CacheUse::Normal);
 
   /// Opens the database; creates it when there is none, else loads `status` from it.
   void Init();
@@ -119,7 +119,7 @@ public:
 private:
   /// What this object knows of the content in the running transaction, in which nobody else
   /// writes. Every removal makes it forget.
-  struct Knowledge {
+  struct MergeCache {
     static constexpr long long NONE = std::numeric_limits<long long>::max();
 
     unsigned long long transaction = 0; ///< the one that all this is about
@@ -138,7 +138,7 @@ private:
     /// What looking for files in it has cost, and had when its names were last wanted.
     long long folderCost = 0;
     long long triedCost = 0;
-    /// The names of all its files, once they are known.
+    /// The names of all its files, once they are cache.
     using Names = std::unordered_set<std::string>;
     std::optional<Names> names;
 
@@ -147,7 +147,7 @@ private:
     long long indexCost = 0;
     bool indexed = false;
 
-    /// Something was removed: only what it has cost stays known.
+    /// Something was removed: only what it has cost stays cache.
     void Forget();
     void EnterFolder(long long id, std::string_view path, const std::string& volume);
   };
@@ -160,7 +160,7 @@ private:
                      std::string_view folderPath) const;
   void LearnNames(const std::string& volume, int cost) const;
   void IndexForRemovals(int cost) const;
-  Knowledge& Known() const;
+  MergeCache& Cache() const;
 
   std::string dbLocation; ///< the directory of the database file
 
@@ -169,8 +169,8 @@ public:
   Status status;
 
 private:
-  Asking asking_;
-  mutable Knowledge known_; ///< changes no answer, only what is asked for it
+  CacheUse cacheUse_;
+  mutable MergeCache cache_; ///< changes no answer, only what is asked for it
 };
 
 } // namespace orva::dbmerger

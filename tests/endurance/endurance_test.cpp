@@ -8,7 +8,7 @@
 #include "Appliance.h"
 #include "Expectations.h"
 #include "Messages.h"
-#include "support/Extent.h"
+#include "support/TestScale.h"
 
 #include <gtest/gtest.h>
 
@@ -682,7 +682,7 @@ const std::vector<Endurance::Kind> Endurance::KINDS{
 
 TEST_F(Endurance, TheDaemonHoldsOut) {
   Start();
-  const auto events = Extent<std::size_t>(300, 10'000);
+  const auto events = TestScale<std::size_t>(300, 10'000);
   Vitals early;
   for (std::size_t event = 1; event <= events && !HasFailure(); ++event) {
     Play(event, events);

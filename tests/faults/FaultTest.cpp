@@ -4,7 +4,7 @@
 #include "PhotoDB.h"
 #include "TestCatalog.h"
 
-#include "support/Extent.h"
+#include "support/TestScale.h"
 
 #include <algorithm>
 #include <filesystem>
@@ -156,7 +156,7 @@ FaultTest::Files FaultTest::TakeFiles() {
   return files;
 }
 
-void FaultTest::LayFiles(const Files& files) {
+void FaultTest::RestoreFiles(const Files& files) {
   std::filesystem::remove_all(DIRECTORY);
   if (files) {
     MakeDirectory(DIRECTORY);
@@ -180,13 +180,13 @@ FaultTest::Scenario FaultTest::Finish(Scenario scenario, const Lines& volumes) {
   OutputOf(scenario.operation);
   scenario.after = Content();
   if (!volumes.empty()) {
-    LayFiles(std::nullopt);
+    RestoreFiles(std::nullopt);
     for (const std::string& volume : volumes) {
       OutputOf([&] { Merge(volume); });
     }
     scenario.merged = Content();
   }
-  LayFiles(scenario.files);
+  RestoreFiles(scenario.files);
   return scenario;
 }
 
@@ -231,7 +231,7 @@ std::vector<Lines> FaultTest::PartsOfADeletion() {
     Database(DATABASE).Run(sql, {VOLUME});
     parts.push_back(Content());
   }
-  LayFiles(files);
+  RestoreFiles(files);
   return parts;
 }
 
@@ -278,7 +278,7 @@ FaultTest::Scenario FaultTest::Clearing() {
     Database(DATABASE).Run(sql);
     parts.push_back(Content());
   }
-  LayFiles(files);
+  RestoreFiles(files);
   return Finish({.name = "a removal of all volumes",
                  .operation =
                      [] {
@@ -313,14 +313,14 @@ void FaultTest::ExpectToSurvive(const Scenario& scenario, const std::vector<Faul
 /// Returns how many times the operation was run with the fault.
 int FaultTest::Disturb(const Scenario& scenario, const Fault& fault) {
   constexpr int briefRuns = 10;
-  LayFiles(scenario.files);
+  RestoreFiles(scenario.files);
   const int chances = Try(fault, 0, scenario.operation).tally.chances;
   EXPECT_EQ(scenario.after, Content());
-  const int step = Extent(std::max(1, chances / briefRuns), 1);
+  const int step = TestScale(std::max(1, chances / briefRuns), 1);
   int runs = 0;
   for (int nth = 1; nth <= chances && !HasFailure(); nth += step) {
     SCOPED_TRACE("at opportunity " + std::to_string(nth) + " of " + std::to_string(chances));
-    LayFiles(scenario.files);
+    RestoreFiles(scenario.files);
     const Outcome outcome = Try(fault, nth, scenario.operation);
     EXPECT_NE(0, outcome.tally.faults);
     CheckOutcome(scenario, fault, outcome);
@@ -371,10 +371,10 @@ void FaultTest::CheckOutcome(const Scenario& scenario, const Fault& fault, const
     }
   }
 
-  LayFiles(left);
+  RestoreFiles(left);
   ExpectUndisturbed(scenario.operation, scenario.after);
   if (content != scenario.before && !scenario.merged.empty()) {
-    LayFiles(left);
+    RestoreFiles(left);
     ExpectUndisturbed([this] { Merge(VOLUME); }, scenario.merged);
   }
 }

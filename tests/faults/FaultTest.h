@@ -71,7 +71,7 @@ protected:
   static Lines Content();
 
   static Files TakeFiles();
-  static void LayFiles(const Files& files);
+  static void RestoreFiles(const Files& files);
 
   static const std::string MASTER;
   static const std::string VOLUME;

@@ -29,7 +29,7 @@ protected:
       return chances;
     };
     const int end = run(0);
-    LayFiles(merge.files);
+    RestoreFiles(merge.files);
     run(end);
     Files files = TakeFiles();
     const std::string journal = files->at("zophotos.db-journal");
@@ -37,7 +37,7 @@ protected:
     (*files)["zophotos.db.new-journal"] = journal;
     files->erase("zophotos.db");
 
-    LayFiles(std::nullopt);
+    RestoreFiles(std::nullopt);
     Scenario scenario = Creation();
     scenario.name = "a first creation among leftovers";
     scenario.files = files;
@@ -53,7 +53,7 @@ protected:
       scenario.operation();
       plan.nth = counting.Seen() - beforeLast;
     }
-    LayFiles(scenario.files);
+    RestoreFiles(scenario.files);
     const FaultVfs faults(plan);
     scenario.operation();
   }

@@ -57,7 +57,7 @@ const std::string FOLDER_ROWS_BUT_PATH =
 
 /// Very many folders of one path, which are `deleted` or not.
 std::vector<std::string> FoldersOfOnePath(const std::string& deleted) {
-  return {"INSERT INTO Folders " + Rows(Extent(50'000, 1'000'000)) +
+  return {"INSERT INTO Folders " + Rows(TestScale(50'000, 1'000'000)) +
           "SELECT x + 10, -1, 'a/', 'a', 4, 0, 0, 0, 0, " + deleted + ", 0, 0 FROM n"};
 }
 
@@ -240,7 +240,7 @@ const std::vector<Case> CASES = {
      REFUSED},
     {"EnormousText",
      {"UPDATE Folders SET path = zeroblob(" +
-      std::to_string(Extent(64LL << 20U, (1LL << 30U) - (100LL << 20U))) + ") WHERE id = 1"},
+      std::to_string(TestScale(64LL << 20U, (1LL << 30U) - (100LL << 20U))) + ") WHERE id = 1"},
      REFUSED},
     {"EnormousFurtherColumn",
      {"ALTER TABLE Folders ADD COLUMN more",

@@ -178,7 +178,7 @@ void Mutate(Bytes& file, std::size_t pageSize, std::mt19937& random) {
 
 TEST_F(CatalogFileTest, RandomBytesChanged) {
   constexpr std::size_t pageSize = 512;
-  const unsigned mutants = Extent(200U, 20'000U);
+  const unsigned mutants = TestScale(200U, 20'000U);
   MakeCatalog(VOLUME, pageSize);
   const Bytes whole = Bytes::Of(CATALOG);
   unsigned merged = 0;

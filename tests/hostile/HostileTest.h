@@ -6,7 +6,7 @@
 #include "DaemonLayerTest.h"
 #include "Database.h"
 #include "TestCatalog.h"
-#include "support/Extent.h"
+#include "support/TestScale.h"
 
 #include "orvautil/Core.h"
 

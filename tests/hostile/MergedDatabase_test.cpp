@@ -138,22 +138,22 @@ const std::vector<Case> CASES = {
     {"LongVersion", {"UPDATE Status SET mc_version = zeroblob(20000000)"}, REFUSED},
     {"ManyFoldersOfOneName",
      {"INSERT INTO Folders(parent_folder_id, name, modified_date, volume) " +
-      Rows(Extent(100'000, 1'000'000)) + "SELECT 1, '/shares/Good/a/', 0, 'x' FROM n"},
+      Rows(TestScale(100'000, 1'000'000)) + "SELECT 1, '/shares/Good/a/', 0, 'x' FROM n"},
      EITHER},
     {"ManyFilesOfOneName",
      {"INSERT INTO Files(folder_id, name, modified_date, volume, created_date) " +
-      Rows(Extent(100'000, 1'000'000)) + "SELECT 2, 'top.jpg', 0, 'x', 0 FROM n"},
+      Rows(TestScale(100'000, 1'000'000)) + "SELECT 2, 'top.jpg', 0, 'x', 0 FROM n"},
      EITHER},
     {"ManyStatisticsOfOneVolume",
      {"INSERT INTO Statistics(volume, photos_xcoded, photos_total, last_updated_time) " +
-      Rows(Extent(100'000, 1'000'000)) + "SELECT '/shares/Good/', 0, 0, 0 FROM n"},
+      Rows(TestScale(100'000, 1'000'000)) + "SELECT '/shares/Good/', 0, 0, 0 FROM n"},
      EITHER},
     {"ManyStatusRows",
-     {"INSERT INTO Status(mc_version, mdate) " + Rows(Extent(100'000, 1'000'000)) +
+     {"INSERT INTO Status(mc_version, mdate) " + Rows(TestScale(100'000, 1'000'000)) +
       "SELECT 'x', 0 FROM n"},
      EITHER},
     {"FoldersOfTheirOwn", {"UPDATE Folders SET parent_folder_id = folder_id"}, EITHER},
-    {"ManyIndices", ManyIndices(Extent(500, 5'000)), EITHER},
+    {"ManyIndices", ManyIndices(TestScale(500, 5'000)), EITHER},
     {"RowsThatReplaceOthers", FilesWith("created_date INTEGER UNIQUE ON CONFLICT REPLACE"), EITHER},
 
     {"InAWriteAheadLog", {"PRAGMA journal_mode = WAL"}, WORKS},
@@ -289,7 +289,7 @@ TEST_F(MergedDatabaseTest, CutAnywhere) {
 }
 
 TEST_F(MergedDatabaseTest, RandomBytesChanged) {
-  const unsigned mutants = Extent(50U, 5'000U);
+  const unsigned mutants = TestScale(50U, 5'000U);
   Run({"PRAGMA page_size = 512", "VACUUM"});
   const Bytes whole = Bytes::Of(MERGED);
   for (unsigned seed = 0; seed < mutants && !HasFailure(); ++seed) {

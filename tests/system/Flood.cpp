@@ -1,6 +1,6 @@
 #include "Flood.h"
 
-#include "support/Extent.h"
+#include "support/TestScale.h"
 
 #include <algorithm>
 

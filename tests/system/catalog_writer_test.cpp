@@ -3,7 +3,7 @@
 #include "Messages.h"
 #include "Tracer.h"
 
-#include "support/Extent.h"
+#include "support/TestScale.h"
 
 #include <sys/syscall.h>
 
@@ -179,7 +179,7 @@ TEST_P(CatalogWriter, ThatCommitsBetweenTwoReadsOfAMergeIsLeftForTheNext) {
 }
 
 TEST_P(CatalogWriter, ThatCommitsWhileMergesRunIsSeenAtOneOfItsCommits) {
-  const int merges = Extent(100, 500);
+  const int merges = TestScale(100, 500);
   std::atomic<int> begun = 0; // merges
   std::atomic<int> latest = 1;
   std::thread writer([&] {

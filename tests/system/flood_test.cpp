@@ -2,7 +2,7 @@
 
 #include "Flood.h"
 
-#include "support/Extent.h"
+#include "support/TestScale.h"
 
 #include <algorithm>
 #include <climits>
@@ -26,7 +26,7 @@ std::string Repeated(const std::string& text, std::size_t count) {
 
 TEST_F(Flood, ABillionBytesWithoutADelimiterAreOneMessage) {
   const std::string mebibyte(1U << 20U, 'x');
-  const int mebibytes = Extent(64, 1024);
+  const int mebibytes = TestScale(64, 1024);
   for (int i = 0; i < mebibytes; ++i) {
     appliance.Service().SendBytes(mebibyte);
   }
@@ -37,7 +37,7 @@ TEST_F(Flood, ABillionBytesWithoutADelimiterAreOneMessage) {
 }
 
 TEST_F(Flood, MessagesThatAreTooLongAreSkippedOneByOne) {
-  const std::size_t count = Extent(200, 4000);
+  const std::size_t count = TestScale(200, 4000);
   const std::string message = std::string(LONGEST + 1, 'x') + DELIMITER;
   for (std::size_t i = 0; i < count; ++i) {
     appliance.Service().SendBytes(message);
@@ -48,7 +48,7 @@ TEST_F(Flood, MessagesThatAreTooLongAreSkippedOneByOne) {
 }
 
 TEST_F(Flood, AMessageMayComeByteByByte) {
-  const auto size = Extent<std::size_t>(4096, LONGEST);
+  const auto size = TestScale<std::size_t>(4096, LONGEST);
   const std::string end = GOOD.substr(GOOD.find("?>") + 2);
   const std::string begin = GOOD.substr(0, GOOD.size() - end.size());
   const std::string message = begin + std::string(size - GOOD.size(), ' ') + end + DELIMITER;
@@ -72,7 +72,7 @@ TEST_F(Flood, ManyMessagesAtOnceAreHandledInOrder) {
       {R"(<Other about="ORVANotification"/>)", {Error("ERROR ! Node name = Other")}},
       {"<Other/>", {}},
   };
-  const int messages = Extent(5'000, 100'000);
+  const int messages = TestScale(5'000, 100'000);
   std::string bytes;
   Log expected;
   for (int i = 0; i < messages; ++i) {
@@ -93,7 +93,7 @@ TEST_F(Flood, ManyMessagesAtOnceAreHandledInOrder) {
 }
 
 TEST_F(Flood, APeerThatNeverReadsHasNothingToRead) {
-  const int rounds = Extent(50, 5'000);
+  const int rounds = TestScale(50, 5'000);
   std::string bytes;
   for (int i = 0; i < rounds; ++i) {
     for (const std::string& message :
@@ -119,7 +119,7 @@ TEST_F(Flood, DelimitersInARowAreEmptyMessages) {
 }
 
 TEST_F(Flood, ZerosThatAreNoDelimiterSpoilOnlyTheNextMessage) {
-  for (std::size_t zeros = 0; zeros <= Extent<std::size_t>(9, 1'000); ++zeros) {
+  for (std::size_t zeros = 0; zeros <= TestScale<std::size_t>(9, 1'000); ++zeros) {
     appliance.Service().SendBytes(std::string(zeros, '\0') + GOOD + DELIMITER);
     appliance.Barrier();
     const Log log = appliance.TakeLog();
@@ -134,7 +134,7 @@ TEST_F(Flood, ZerosThatAreNoDelimiterSpoilOnlyTheNextMessage) {
 }
 
 TEST_F(Flood, EveryPrefixOfAGoodMessageIsRefused) {
-  const std::string comment = "<!-- " + std::string(Extent(0, 4'000), 'c') + " -->";
+  const std::string comment = "<!-- " + std::string(TestScale(0, 4'000), 'c') + " -->";
   const std::string message =
       Notification("TranscodedBatch", "/shares/A", comment + ProfileElement("0123"));
   const std::size_t named =
@@ -155,7 +155,7 @@ TEST_F(Flood, EverySuffixOfAGoodMessageIsRefused) {
 }
 
 TEST_F(Flood, ConnectionsThatEndInsideAMessageLeaveNothingBehind) {
-  const int connections = Extent(50, 2'000);
+  const int connections = TestScale(50, 2'000);
   for (int i = 0; i < connections; ++i) {
     appliance.Service().SendBytes(std::string(LONGEST, 'x'));
     appliance.Service().CloseClient();
@@ -175,7 +175,7 @@ std::string Spelling(std::string path, int number, std::size_t size) {
 }
 
 TEST_F(Flood, SpellingsOfAMountPointAreABoundedNumberOfVolumes) {
-  const int spellings = Extent(5'000, 100'000);
+  const int spellings = TestScale(5'000, 100'000);
   for (int i = 0; i < spellings; ++i) {
     appliance.Service().Send(Notification("Purged", Spelling("/shares", i, 2'048)));
   }
@@ -193,7 +193,7 @@ TEST_F(Flood, LongSpellingsOfAMountPointAreABoundedAmountOfMemory) {
     appliance.Service().Send(Notification("Scanned", Spelling(a.Path(), i, longest)));
   }
   // With each of these a new merger goes through all volumes.
-  const int mergers = Extent(50, 1'000);
+  const int mergers = TestScale(50, 1'000);
   for (int i = 0; i < mergers; ++i) {
     appliance.Service().Send(Unplugged("/shares/Other"));
   }

@@ -2,7 +2,7 @@
 
 #include "Flood.h"
 
-#include "support/Extent.h"
+#include "support/TestScale.h"
 
 #include <arpa/inet.h>
 #include <netinet/in.h>
@@ -270,7 +270,7 @@ std::string FilledWithNames(Names& names, const std::string& head, const std::st
 
 TEST_F(HostileMessage, TheMostAttributesHold) {
   const auto attribute = [](const std::string& name) { return " " + name + "=\"\""; };
-  for (int i = 0; i < Extent(3, 100); ++i) {
+  for (int i = 0; i < TestScale(3, 100); ++i) {
     Names names;
     Handled(FilledWithNames(names, START, "/>", attribute));
     Handled(FilledWithNames(names, START + "><a", "/>" + FINISH, attribute));
@@ -279,7 +279,7 @@ TEST_F(HostileMessage, TheMostAttributesHold) {
 }
 
 TEST_F(HostileMessage, TheMostElementsHold) {
-  for (int i = 0; i < Extent(3, 100); ++i) {
+  for (int i = 0; i < TestScale(3, 100); ++i) {
     Names names;
     Handled(Filled(START + ">", "<a/>", FINISH));
     Handled(FilledWithNames(names, START + ">", FINISH,
@@ -289,7 +289,7 @@ TEST_F(HostileMessage, TheMostElementsHold) {
 }
 
 TEST_F(HostileMessage, AllOfTheLargestHoldTogether) {
-  for (int i = 0; i < Extent(2, 20); ++i) {
+  for (int i = 0; i < TestScale(2, 20); ++i) {
     Names names;
     Handled(FilledWithNames(names, START, "/>",
                             [](const std::string& name) { return " " + name + "=\"\""; }));
@@ -313,7 +313,7 @@ TEST_F(HostileMessage, DuplicateAttributesAreRefused) {
 }
 
 TEST_F(HostileMessage, AMillionNamespacesHold) {
-  const int namespaces = Extent(50'000, 1'000'000);
+  const int namespaces = TestScale(50'000, 1'000'000);
   Names names;
   int declared = 0;
   while (declared < namespaces) {
@@ -326,7 +326,7 @@ TEST_F(HostileMessage, AMillionNamespacesHold) {
 }
 
 TEST_F(HostileMessage, AMillionNamesHold) {
-  const int count = Extent(50'000, 1'000'000);
+  const int count = TestScale(50'000, 1'000'000);
   Names names;
   int used = 0;
   while (used < count) {

@@ -3,7 +3,7 @@
 #include "Messages.h"
 #include "Tracer.h"
 
-#include "support/Extent.h"
+#include "support/TestScale.h"
 
 #include <sys/syscall.h>
 
@@ -299,7 +299,7 @@ private:
 
 TEST_F(Kill, AtAnyInstantLosesNothingThatTheNextLifeDoesNotBringBack) {
   constexpr unsigned SEED = 471108;
-  const int rounds = Extent(1, 20);
+  const int rounds = TestScale(1, 20);
 
   Record();
   ASSERT_EQ(PHASES_OF_A_LIFE, Phases());

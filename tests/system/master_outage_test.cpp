@@ -3,7 +3,7 @@
 #include "Messages.h"
 #include "Tracer.h"
 
-#include "support/Extent.h"
+#include "support/TestScale.h"
 
 #include <unistd.h>
 
@@ -184,7 +184,7 @@ std::vector<Lines> FullDiskErrors() {
 }
 
 TEST_F(MasterOutage, AFullDiskFailsTheMergeUntilThereIsRoom) {
-  const int photos = Extent(300, 5'000);
+  const int photos = TestScale(300, 5'000);
   onB.AddPhotos("New/", photos - 300, 2000, 300);
   const std::vector<Lines> possible = FullDiskErrors();
   const double used = a.Used();

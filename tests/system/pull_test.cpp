@@ -3,7 +3,7 @@
 #include "Messages.h"
 #include "Tracer.h"
 
-#include "support/Extent.h"
+#include "support/TestScale.h"
 
 #include <sys/mount.h>
 #include <sys/stat.h>
@@ -23,7 +23,7 @@ using ::testing::SizeIs;
 using ::testing::StartsWith;
 
 /// How many instants of a merge go by from one at which a volume is pulled to the next.
-const int STRIDE = Extent(6, 1);
+const int STRIDE = TestScale(6, 1);
 
 Lines Errors(const Log& log) {
   Lines errors;

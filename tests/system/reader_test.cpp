@@ -4,7 +4,7 @@
 #include "Messages.h"
 #include "Tracer.h"
 
-#include "support/Extent.h"
+#include "support/TestScale.h"
 
 #include <fcntl.h>
 #include <poll.h>
@@ -160,11 +160,11 @@ protected:
 };
 
 TEST_F(Readers, SeeOnlyWhatWasCommitted) {
-  Grow(Extent(10'000, 50'000));
+  Grow(TestScale(10'000, 50'000));
   Merge();
   std::set<std::string> committed{Whole()};
   std::array<Reader, 2> readers;
-  for (int i = 0; i < Extent(10, 100); ++i) {
+  for (int i = 0; i < TestScale(10, 100); ++i) {
     const std::set<std::string> between = SetBack();
     Grow(1000);
     if (i % 5 == 4) {
@@ -249,7 +249,7 @@ TEST_F(Readers, TellHowLongTheyWaited) {
   Grow(1'000);
   for (const int photos : {1'000, 50'000}) {
     long longest = 0;
-    for (int i = 0; i < Extent(2, 10); ++i) {
+    for (int i = 0; i < TestScale(2, 10); ++i) {
       Merge();
       const std::string before = Whole();
       Grow(photos);

@@ -61,12 +61,12 @@ void ListeningSocket::Bind() {
   }
 }
 
-OwnedDescriptor ListeningSocket::Accept() {
+util::FileDescriptor ListeningSocket::Accept() {
   int descriptor = -1;
   do {
     descriptor = accept4(Descriptor(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK);
   } while (descriptor == -1 && (errno == EINTR || errno == ECONNABORTED));
-  return OwnedDescriptor(descriptor);
+  return util::FileDescriptor(descriptor);
 }
 
 } // namespace orva::notify

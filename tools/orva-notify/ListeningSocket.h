@@ -1,6 +1,6 @@
 #pragma once
 
-#include "orva-notify/OwnedDescriptor.h"
+#include "orvautil/FileDescriptor.h"
 #include "orvautil/Socket.h"
 
 #include <string>
@@ -19,7 +19,7 @@ public:
   ~ListeningSocket() override;
 
   /// The next connection that waits, non-blocking; none, with errno set, when there is none.
-  OwnedDescriptor Accept();
+  util::FileDescriptor Accept();
 
 private:
   void Bind();

@@ -39,15 +39,15 @@ std::string CountOfClients(std::size_t count) {
   return std::to_string(count) + (count == 1 ? " client" : " clients");
 }
 
-OwnedDescriptor CheckedDescriptor(int descriptor, const char* what) {
+util::FileDescriptor CheckedDescriptor(int descriptor, const char* what) {
   if (descriptor == -1) {
     throw util::Exception(FormatString("Cannot open %s: %s", what, strerror(errno)), __FILE__,
                           __LINE__);
   }
-  return OwnedDescriptor(descriptor);
+  return util::FileDescriptor(descriptor);
 }
 
-OwnedDescriptor CatchStopSignals() {
+util::FileDescriptor CatchStopSignals() {
   sigset_t signals;
   sigemptyset(&signals);
   sigaddset(&signals, SIGINT);
@@ -56,9 +56,9 @@ OwnedDescriptor CatchStopSignals() {
   return CheckedDescriptor(signalfd(-1, &signals, SFD_NONBLOCK | SFD_CLOEXEC), "signals");
 }
 
-OwnedDescriptor OpenMountInfo(bool watch) {
+util::FileDescriptor OpenMountInfo(bool watch) {
   return watch ? CheckedDescriptor(open(MOUNT_INFO, O_RDONLY | O_CLOEXEC), MOUNT_INFO)
-               : OwnedDescriptor(-1);
+               : util::FileDescriptor(-1);
 }
 
 template <typename Connection>
@@ -113,7 +113,7 @@ void Service::Wait() {
 }
 
 void Service::ReadRequests() {
-  while (OwnedDescriptor connection = AcceptFrom(control_)) {
+  while (util::FileDescriptor connection = AcceptFrom(control_)) {
     requests_.push_back(std::make_unique<ControlConnection>(connection.Release()));
   }
   for (const auto& request : requests_) {
@@ -140,7 +140,7 @@ void Service::FollowMounts() {
 }
 
 void Service::AcceptClients() {
-  while (OwnedDescriptor connection = AcceptFrom(notification_)) {
+  while (util::FileDescriptor connection = AcceptFrom(notification_)) {
     clients_.push_back(std::make_unique<Client>(connection.Release(), ++lastNumber_));
     Client& client = *clients_.back();
     Print(FormatString("client %u connected", client.Number()));
@@ -216,8 +216,8 @@ void Service::ForgetClosed() {
   }
 }
 
-OwnedDescriptor Service::AcceptFrom(ListeningSocket& socket) {
-  OwnedDescriptor connection = socket.Accept();
+util::FileDescriptor Service::AcceptFrom(ListeningSocket& socket) {
+  util::FileDescriptor connection = socket.Accept();
   const bool isFull = connection.Get() == -1 && errno != EAGAIN;
   if (isFull && !isFull_) {
     Print(FormatString("cannot take another connection until one ends: %s", strerror(errno)));

@@ -4,7 +4,7 @@
 #include "orva-notify/Control.h"
 #include "orva-notify/ListeningSocket.h"
 #include "orva-notify/MountInfo.h"
-#include "orva-notify/OwnedDescriptor.h"
+#include "orvautil/FileDescriptor.h"
 
 #include <cstddef>
 #include <memory>
@@ -39,14 +39,14 @@ private:
   std::size_t DropAll();
   void Queue(Client& client, const Message& framed);
   void ForgetClosed();
-  OwnedDescriptor AcceptFrom(ListeningSocket& socket);
+  util::FileDescriptor AcceptFrom(ListeningSocket& socket);
 
   const std::string address_;
-  OwnedDescriptor signals_;
+  util::FileDescriptor signals_;
   ListeningSocket control_; // first, so that a second service is refused before a client sees it
   ListeningSocket notification_;
-  OwnedDescriptor mountInfo_; ///< only waited for; none when mounts are not watched
-  Volumes volumes_;           ///< as announced
+  util::FileDescriptor mountInfo_; ///< only waited for; none when mounts are not watched
+  Volumes volumes_;                ///< as announced
   std::vector<std::unique_ptr<Client>> clients_;
   std::vector<std::unique_ptr<ControlConnection>> requests_;
   unsigned lastNumber_ = 0;

@@ -21,7 +21,7 @@ namespace {
 constexpr int BUSY_TIMEOUT = 5000;
 
 /// The database may have come with a volume from elsewhere: nothing that it brings along is run.
-void Distrust(SQLite::Database& database) {
+void DisableUntrustedFeatures(SQLite::Database& database) {
   for (const auto& [option, value] :
        {std::pair(SQLITE_DBCONFIG_ENABLE_VIEW, 0), std::pair(SQLITE_DBCONFIG_TRUSTED_SCHEMA, 0),
         std::pair(SQLITE_DBCONFIG_DEFENSIVE, 1)}) {
@@ -79,7 +79,7 @@ SQLite::Database OpenFile(const std::string& path) {
                                           "not have: to read it would be to write beside it");
   }
   SQLite::Database database = Connect(path);
-  Distrust(database);
+  DisableUntrustedFeatures(database);
   return database;
 }
 
@@ -118,7 +118,7 @@ SQLite::Database OpenDatabase(const std::string& path) {
 
 SQLite::Database CopyDatabase(const std::string& path) {
   SQLite::Database copy("", SQLite::OPEN_READWRITE | SQLite::OPEN_CREATE);
-  Distrust(copy);
+  DisableUntrustedFeatures(copy);
   {
     SQLite::Database database = OpenFile(path);
     CopyPages(database, copy);

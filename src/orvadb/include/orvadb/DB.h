@@ -51,7 +51,7 @@ public:
   /// columns and, where the connection can write, computed defaults, indices on expressions or on
   /// part of the rows, and very many indices, which a stranger may have made so dear that a row
   /// takes minutes. A table that is not there has none. Throws std::string.
-  void RefuseComputedValues(const std::string& table) const;
+  void RejectComputedColumns(const std::string& table) const;
 
 protected:
   /// What a connection may do with its file.

@@ -71,10 +71,10 @@ Operation DeleteFile(const std::string& volume, const std::string& path, const s
   };
 }
 
-class ShortcutsTest : public testing::Test {
+class MergeCacheTest : public testing::Test {
 protected:
-  ShortcutsTest() {
-    for (const char* const location : {KNOWING, ASKING}) {
+  MergeCacheTest() {
+    for (const char* const location : {CACHED, UNCACHED}) {
       std::filesystem::create_directories(location);
       PhotoDB(location).Init();
     }
@@ -83,10 +83,10 @@ protected:
   /// Runs the operations in one transaction on a database object of their own, twice.
   static void Run(const std::vector<Operation>& operations, bool commit = true) {
     testing::internal::CaptureStdout(); // the lines about single files
-    RunOn(KNOWING, PhotoDB::Asking::WhenUnknown, operations, commit);
+    RunOn(CACHED, PhotoDB::CacheUse::Normal, operations, commit);
     const std::string knowing = testing::internal::GetCapturedStdout();
     testing::internal::CaptureStdout();
-    RunOn(ASKING, PhotoDB::Asking::Always, operations, commit);
+    RunOn(UNCACHED, PhotoDB::CacheUse::Bypass, operations, commit);
     EXPECT_EQ(testing::internal::GetCapturedStdout(), knowing);
   }
 
@@ -95,7 +95,7 @@ protected:
          {"SELECT * FROM Folders ORDER BY folder_id", "SELECT * FROM Files ORDER BY file_id",
           "SELECT * FROM sqlite_sequence ORDER BY name",
           "SELECT type, name, sql FROM sqlite_master ORDER BY name"}) {
-      ASSERT_EQ(Rows(ASKING, sql), Rows(KNOWING, sql));
+      ASSERT_EQ(Rows(UNCACHED, sql), Rows(CACHED, sql));
     }
   }
 
@@ -110,9 +110,9 @@ protected:
     return query.Fetch(__FILE__, __LINE__);
   }
 
-  static void RunOn(const std::string& location, PhotoDB::Asking asking,
+  static void RunOn(const std::string& location, PhotoDB::CacheUse cacheUse,
                     const std::vector<Operation>& operations, bool commit) {
-    PhotoDB photos(location, asking);
+    PhotoDB photos(location, cacheUse);
     photos.Init();
     Transaction transaction(photos, 1000, __FILE__, __LINE__);
     for (const Operation& operation : operations) {
@@ -123,8 +123,8 @@ protected:
     }
   }
 
-  static constexpr const char* KNOWING = "/tmp/knowing";
-  static constexpr const char* ASKING = "/tmp/asking";
+  static constexpr const char* CACHED = "/tmp/knowing";
+  static constexpr const char* UNCACHED = "/tmp/cacheUse";
 };
 
 /// A source of catalogs and mutations, the same for the same seed.
@@ -189,7 +189,7 @@ private:
   std::mt19937 random_;
 };
 
-TEST_F(ShortcutsTest, RandomMergesGiveTheSameRowsWithTheSameIds) {
+TEST_F(MergeCacheTest, RandomMergesGiveTheSameRowsWithTheSameIds) {
   for (unsigned seed = 1; seed <= 40; ++seed) {
     SCOPED_TRACE(seed);
     Source source(seed);
@@ -197,24 +197,24 @@ TEST_F(ShortcutsTest, RandomMergesGiveTheSameRowsWithTheSameIds) {
       Run(source.Merge(), source.Commits());
       ASSERT_NO_FATAL_FAILURE(ExpectSameRows());
     }
-    for (const char* const location : {KNOWING, ASKING}) {
+    for (const char* const location : {CACHED, UNCACHED}) {
       PhotoDB photos(location);
       photos.Init();
       photos.DeleteVolumes();
     }
   }
-  EXPECT_THAT(Rows(KNOWING, "SELECT seq > 100 FROM sqlite_sequence WHERE name = 'Files'"),
+  EXPECT_THAT(Rows(CACHED, "SELECT seq > 100 FROM sqlite_sequence WHERE name = 'Files'"),
               testing::ElementsAre("1"));
 }
 
-TEST_F(ShortcutsTest, SeveralTransactionsOfOneObjectGiveTheSameRows) {
+TEST_F(MergeCacheTest, SeveralTransactionsOfOneObjectGiveTheSameRows) {
   for (unsigned seed = 101; seed <= 120; ++seed) {
     SCOPED_TRACE(seed);
     testing::internal::CaptureStdout();
-    for (const auto& [location, asking] : {std::pair(KNOWING, PhotoDB::Asking::WhenUnknown),
-                                           std::pair(ASKING, PhotoDB::Asking::Always)}) {
+    for (const auto& [location, cacheUse] : {std::pair(CACHED, PhotoDB::CacheUse::Normal),
+                                             std::pair(UNCACHED, PhotoDB::CacheUse::Bypass)}) {
       Source source(seed);
-      PhotoDB photos(location, asking);
+      PhotoDB photos(location, cacheUse);
       photos.Init();
       for (int merge = 0; merge < 8; ++merge) {
         std::optional<Transaction> transaction;
@@ -234,19 +234,19 @@ TEST_F(ShortcutsTest, SeveralTransactionsOfOneObjectGiveTheSameRows) {
   }
 }
 
-TEST_F(ShortcutsTest, AFileNamedOtherwiseThanItsPathIsFoundByItsName) {
+TEST_F(MergeCacheTest, AFileNamedOtherwiseThanItsPathIsFoundByItsName) {
   const std::string volume = "/shares/A/";
   Run({AddFolder(volume, volume), AddFile(volume, volume + "a", "z"),
        AddFile(volume, volume + "z", "z"), AddFile(volume, volume + "zz", "y"),
        AddFile(volume, volume + "zzz", "y")});
   ExpectSameRows();
-  EXPECT_THAT(Rows(KNOWING, "SELECT name FROM Files ORDER BY file_id"),
+  EXPECT_THAT(Rows(CACHED, "SELECT name FROM Files ORDER BY file_id"),
               testing::ElementsAre("z", "y"));
 }
 
-TEST_F(ShortcutsTest, AFolderThatWasRolledBackIsForgotten) {
+TEST_F(MergeCacheTest, AFolderThatWasRolledBackIsForgotten) {
   const std::string volume = "/shares/A/";
-  PhotoDB photos(KNOWING);
+  PhotoDB photos(CACHED);
   photos.Init();
   {
     const Transaction rolledBack(photos, 1000, __FILE__, __LINE__);
@@ -256,12 +256,12 @@ TEST_F(ShortcutsTest, AFolderThatWasRolledBackIsForgotten) {
   Transaction transaction(photos, 1000, __FILE__, __LINE__);
   AddFile(volume, volume + "b", "b")(photos);
   transaction.Commit(__FILE__, __LINE__);
-  EXPECT_THAT(Rows(KNOWING, "SELECT * FROM Files"), testing::IsEmpty());
+  EXPECT_THAT(Rows(CACHED, "SELECT * FROM Files"), testing::IsEmpty());
 }
 
-TEST_F(ShortcutsTest, WhatOthersAddBetweenTwoTransactionsIsSeen) {
+TEST_F(MergeCacheTest, WhatOthersAddBetweenTwoTransactionsIsSeen) {
   const std::string volume = "/shares/A/";
-  PhotoDB photos(KNOWING);
+  PhotoDB photos(CACHED);
   photos.Init();
   {
     Transaction transaction(photos, 1000, __FILE__, __LINE__);
@@ -269,11 +269,11 @@ TEST_F(ShortcutsTest, WhatOthersAddBetweenTwoTransactionsIsSeen) {
     AddFile(volume, volume + "a", "a")(photos);
     transaction.Commit(__FILE__, __LINE__);
   }
-  RunOn(KNOWING, PhotoDB::Asking::Always, {AddFile(volume, volume + "b", "b")}, true);
+  RunOn(CACHED, PhotoDB::CacheUse::Bypass, {AddFile(volume, volume + "b", "b")}, true);
   Transaction transaction(photos, 1000, __FILE__, __LINE__);
   AddFile(volume, volume + "b", "b")(photos);
   transaction.Commit(__FILE__, __LINE__);
-  EXPECT_THAT(Rows(KNOWING, "SELECT name FROM Files"), testing::ElementsAre("a", "b"));
+  EXPECT_THAT(Rows(CACHED, "SELECT name FROM Files"), testing::ElementsAre("a", "b"));
 }
 
 /// Folders that all have files of the same names, as cameras give them.
@@ -292,17 +292,17 @@ std::vector<Operation> Camera(int firstName, int lastName) {
   return operations;
 }
 
-TEST_F(ShortcutsTest, NamesThatManyFoldersShareAreAddedOnce) {
+TEST_F(MergeCacheTest, NamesThatManyFoldersShareAreAddedOnce) {
   Run(Camera(1010, 1060));
   ExpectSameRows();
   Run(Camera(1000, 1070));
   ExpectSameRows();
   Run(Camera(1000, 1070));
   ExpectSameRows();
-  EXPECT_THAT(Rows(KNOWING, "SELECT count(*) FROM Files"), testing::ElementsAre("7000"));
+  EXPECT_THAT(Rows(CACHED, "SELECT count(*) FROM Files"), testing::ElementsAre("7000"));
 }
 
-TEST_F(ShortcutsTest, KnownNamesAreForgottenWhenAFileIsRemoved) {
+TEST_F(MergeCacheTest, KnownNamesAreForgottenWhenAFileIsRemoved) {
   Run(Camera(1000, 1030));
   std::vector<Operation> operations = Camera(1000, 1030);
   const std::string volume = "/shares/A/";
@@ -313,10 +313,10 @@ TEST_F(ShortcutsTest, KnownNamesAreForgottenWhenAFileIsRemoved) {
   operations.push_back(AddFile(volume, path, "IMG_1010"));
   Run(operations);
   ExpectSameRows();
-  EXPECT_THAT(Rows(KNOWING, "SELECT count(*) FROM Files"), testing::ElementsAre("3000"));
+  EXPECT_THAT(Rows(CACHED, "SELECT count(*) FROM Files"), testing::ElementsAre("3000"));
 }
 
-class FlatFolderTest : public ShortcutsTest {
+class FlatFolderTest : public MergeCacheTest {
 protected:
   static constexpr int FILES = 3000;
 
@@ -349,7 +349,7 @@ TEST_F(FlatFolderTest, ManyRemovalsLeaveTheSameRowsAndNoIndex) {
   Run(operations);
   EXPECT_TRUE(indexed);
   ExpectSameRows();
-  EXPECT_THAT(Rows(KNOWING, "SELECT count(*) FROM Files"), testing::ElementsAre("1501"));
+  EXPECT_THAT(Rows(CACHED, "SELECT count(*) FROM Files"), testing::ElementsAre("1501"));
 }
 
 TEST_F(FlatFolderTest, AHandfulOfRemovalsMakesNoIndex) {
@@ -364,7 +364,7 @@ TEST_F(FlatFolderTest, AHandfulOfRemovalsMakesNoIndex) {
 TEST_F(FlatFolderTest, ARollbackTakesTheIndexWithIt) {
   Run(Removals(FILES / 2), false);
   ExpectSameRows();
-  EXPECT_THAT(Rows(KNOWING, "SELECT count(*) FROM Files"), testing::ElementsAre("3000"));
+  EXPECT_THAT(Rows(CACHED, "SELECT count(*) FROM Files"), testing::ElementsAre("3000"));
   Run(Removals(FILES / 2));
   ExpectSameRows();
 }

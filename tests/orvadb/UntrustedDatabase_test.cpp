@@ -22,9 +22,9 @@ using testing::ElementsAre;
 using testing::HasSubstr;
 
 /// A database that somebody else has made.
-class DistrustTest : public testing::Test {
+class UntrustedDatabaseTest : public testing::Test {
 protected:
-  DistrustTest() {
+  UntrustedDatabaseTest() {
     fs::remove_all("/tmp/db");
     fs::create_directory("/tmp/db");
     Query(Raw(path), "CREATE TABLE t(a, b)");
@@ -48,7 +48,7 @@ protected:
     TestDB db;
     db.Open(path, writable ? TestDB::Access::ReadWrite : TestDB::Access::ReadOnly, 7, false);
     try {
-      db.RefuseComputedValues("t");
+      db.RejectComputedColumns("t");
     } catch (const std::string& failure) {
       return failure;
     }
@@ -58,40 +58,40 @@ protected:
   const std::string path = "/tmp/db/test.db";
 };
 
-TEST_F(DistrustTest, TriggersDoNotRun) {
+TEST_F(UntrustedDatabaseTest, TriggersDoNotRun) {
   Made(
       "CREATE TRIGGER more AFTER INSERT ON t BEGIN INSERT INTO t VALUES('by the trigger', 0); END");
   EXPECT_EQ(FailureOf("INSERT INTO t VALUES(1, 2)"), "");
   EXPECT_THAT(Query(Raw(path), "SELECT a FROM t"), ElementsAre("1"));
 }
 
-TEST_F(DistrustTest, ViewsAreNoTables) {
+TEST_F(UntrustedDatabaseTest, ViewsAreNoTables) {
   Made("CREATE VIEW v AS SELECT a FROM t");
   EXPECT_THAT(FailureOf("SELECT * FROM v"), HasSubstr("access to view \"v\" prohibited"));
 }
 
-TEST_F(DistrustTest, VirtualTablesAreNoTables) {
+TEST_F(UntrustedDatabaseTest, VirtualTablesAreNoTables) {
   Made("CREATE VIRTUAL TABLE v USING fts5(a)");
   EXPECT_NE(FailureOf("SELECT * FROM v"), "");
 }
 
-TEST_F(DistrustTest, ChecksAreNotMade) {
+TEST_F(UntrustedDatabaseTest, ChecksAreNotMade) {
   Made("CREATE TABLE checked(a CHECK(a = 'never'))");
   EXPECT_EQ(FailureOf("INSERT INTO checked VALUES(1)"), "");
 }
 
-TEST_F(DistrustTest, ValuesLongerThanAnyNameAreNotRead) {
+TEST_F(UntrustedDatabaseTest, ValuesLongerThanAnyNameAreNotRead) {
   Made("INSERT INTO t VALUES(1, zeroblob(16777216)), (2, zeroblob(17000000))");
   EXPECT_THAT(FailureOf("SELECT a, b FROM t"), HasSubstr("string or blob too big"));
 }
 
-TEST_F(DistrustTest, EndlessStatementIsInterrupted) {
+TEST_F(UntrustedDatabaseTest, EndlessStatementIsInterrupted) {
   EXPECT_THAT(FailureOf("WITH RECURSIVE n(i) AS (SELECT 1 UNION ALL SELECT i + 1 FROM n) "
                         "SELECT count(*) FROM n"),
               HasSubstr("more work than a database of this size can need (extended code 9)"));
 }
 
-TEST_F(DistrustTest, FetchingPagesIsWorkToo) {
+TEST_F(UntrustedDatabaseTest, FetchingPagesIsWorkToo) {
   Made("INSERT INTO t VALUES(zeroblob(100000), 0)");
   const std::string count = "WITH RECURSIVE n(i) AS (SELECT 1 UNION ALL SELECT i + 1 FROM n WHERE "
                             "i < 100000) SELECT count(*) FROM n, t WHERE ";
@@ -106,14 +106,14 @@ const std::string DEAR = "SELECT count(*) FROM t x, t y WHERE +x.a = +y.b";
 const std::string THREE_THOUSAND = "WITH RECURSIVE n(i) AS (SELECT 1 UNION ALL SELECT i + 1 FROM n "
                                    "WHERE i < 3000) INSERT INTO t SELECT i, -i FROM n";
 
-TEST_F(DistrustTest, LargeDatabaseMayTakeMoreWork) {
+TEST_F(UntrustedDatabaseTest, LargeDatabaseMayTakeMoreWork) {
   Made(THREE_THOUSAND);
   EXPECT_THAT(FailureOf(DEAR), HasSubstr("more work than"));
   Made("CREATE TABLE large(a); INSERT INTO large VALUES(zeroblob(10000000))");
   EXPECT_EQ(FailureOf(DEAR), "");
 }
 
-TEST_F(DistrustTest, RowsThatTheConnectionHasChangedMayTakeMoreWork) {
+TEST_F(UntrustedDatabaseTest, RowsThatTheConnectionHasChangedMayTakeMoreWork) {
   const TestDB db(path);
   db.Rows("BEGIN");
   db.Rows(THREE_THOUSAND);
@@ -123,7 +123,7 @@ TEST_F(DistrustTest, RowsThatTheConnectionHasChangedMayTakeMoreWork) {
   EXPECT_NO_THROW(Statement(db, DEAR.c_str(), __FILE__, __LINE__).Execute(__FILE__, __LINE__));
 }
 
-TEST_F(DistrustTest, EachStatementHasItsOwnLimit) {
+TEST_F(UntrustedDatabaseTest, EachStatementHasItsOwnLimit) {
   const TestDB db(path);
   for (int i = 0; i < 20; ++i) {
     Statement(db,
@@ -134,7 +134,7 @@ TEST_F(DistrustTest, EachStatementHasItsOwnLimit) {
   }
 }
 
-TEST_F(DistrustTest, StoredValuesAreTaken) {
+TEST_F(UntrustedDatabaseTest, StoredValuesAreTaken) {
   Made("CREATE INDEX plain ON t(a, b)");
   int column = 0;
   for (const char* const value : {"0", "-1.5", "'plain text'", "NULL"}) {
@@ -145,7 +145,7 @@ TEST_F(DistrustTest, StoredValuesAreTaken) {
   EXPECT_EQ(Refusal(), "") << "a table that is not there computes nothing";
 }
 
-TEST_F(DistrustTest, GeneratedColumnsAreRefused) {
+TEST_F(UntrustedDatabaseTest, GeneratedColumnsAreRefused) {
   Made("DROP TABLE t; CREATE TABLE t(a, b AS (a || a))");
   EXPECT_THAT(Refusal(), HasSubstr("generated column in table t of '/tmp/db/test.db'"));
   EXPECT_THAT(Refusal(false), HasSubstr("generated column"));
@@ -153,7 +153,7 @@ TEST_F(DistrustTest, GeneratedColumnsAreRefused) {
   EXPECT_THAT(Refusal(), HasSubstr("generated column"));
 }
 
-TEST_F(DistrustTest, WhatIsComputedOnWritingIsRefusedOnlyWhereRowsAreWritten) {
+TEST_F(UntrustedDatabaseTest, WhatIsComputedOnWritingIsRefusedOnlyWhereRowsAreWritten) {
   for (const char* const sql :
        {"ALTER TABLE t ADD COLUMN c DEFAULT ('a' || 'b')", "CREATE INDEX i ON t(a || b)",
         "CREATE INDEX i ON t(a) WHERE b LIKE '%'",
@@ -165,7 +165,7 @@ TEST_F(DistrustTest, WhatIsComputedOnWritingIsRefusedOnlyWhereRowsAreWritten) {
   }
 }
 
-TEST_F(DistrustTest, MoreIndicesThanARowIsWorthAreRefused) {
+TEST_F(UntrustedDatabaseTest, MoreIndicesThanARowIsWorthAreRefused) {
   for (int i = 0; i < 33; ++i) {
     EXPECT_EQ(Refusal(), "") << i;
     Made("CREATE INDEX i" + std::to_string(i) + " ON t(a)");
@@ -173,7 +173,7 @@ TEST_F(DistrustTest, MoreIndicesThanARowIsWorthAreRefused) {
   EXPECT_THAT(Refusal(), HasSubstr("more indices than a row is worth"));
 }
 
-TEST_F(DistrustTest, FileThatHasGrownMayTakeMoreWork) {
+TEST_F(UntrustedDatabaseTest, FileThatHasGrownMayTakeMoreWork) {
   Made(THREE_THOUSAND);
   const TestDB db(path);
   Made("CREATE TABLE large(a); INSERT INTO large VALUES(zeroblob(10000000))");
@@ -188,7 +188,7 @@ TEST_F(DistrustTest, FileThatHasGrownMayTakeMoreWork) {
 /// What ends a journal after whose use SQLite deletes the file whose name stands before.
 const std::string SUPER_JOURNAL_MARK = "\xd9\xd5\x05\xf9\x20\xa1\x63\xd7";
 
-TEST_F(DistrustTest, JournalThatNamesAnotherFileIsNotUndone) {
+TEST_F(UntrustedDatabaseTest, JournalThatNamesAnotherFileIsNotUndone) {
   std::ofstream(path + "-journal") << "/tmp/db/victim and more" << SUPER_JOURNAL_MARK;
   TestDB db;
   EXPECT_THAT(Thrown([&] { db.Open(path); }),
@@ -197,14 +197,14 @@ TEST_F(DistrustTest, JournalThatNamesAnotherFileIsNotUndone) {
   EXPECT_EQ(db.GetPath(), "");
 }
 
-TEST_F(DistrustTest, JournalWithTheMarkElsewhereIsAnyJournal) {
+TEST_F(UntrustedDatabaseTest, JournalWithTheMarkElsewhereIsAnyJournal) {
   for (const std::string& content : {SUPER_JOURNAL_MARK + "x", SUPER_JOURNAL_MARK.substr(1)}) {
     std::ofstream(path + "-journal") << content;
     EXPECT_NO_THROW(TestDB db(path)) << content.size();
   }
 }
 
-TEST_F(DistrustTest, FileWithAnotherNameIsReadButNotWritten) {
+TEST_F(UntrustedDatabaseTest, FileWithAnotherNameIsReadButNotWritten) {
   fs::create_hard_link(path, "/tmp/db/snapshot");
   TestDB db;
   EXPECT_THAT(Thrown([&] { db.Open(path); }), HasSubstr("'/tmp/db/test.db' has another name"));
@@ -216,13 +216,13 @@ TEST_F(DistrustTest, FileWithAnotherNameIsReadButNotWritten) {
               HasSubstr("'/tmp/db/test.db-shm' has another name"));
 }
 
-TEST_F(DistrustTest, HolesCountForLittle) {
+TEST_F(UntrustedDatabaseTest, HolesCountForLittle) {
   fs::resize_file(path, 1LL << 40);
   const TestDB db(path);
   EXPECT_LT(db.MeasureFile(), 5 << 20);
 }
 
-TEST_F(DistrustTest, SizeCountsTheLogToo) {
+TEST_F(UntrustedDatabaseTest, SizeCountsTheLogToo) {
   const Raw writer(path);
   Query(writer, "PRAGMA journal_mode = WAL; CREATE TABLE more(a)");
   const TestDB db(path);

@@ -13,7 +13,7 @@ inline bool IsExtended() {
 
 /// How much of something a test does: `brief` in the ordinary run, `extended` in the long one.
 template <typename Number>
-Number Extent(Number brief, Number extended) {
+Number TestScale(Number brief, Number extended) {
   return IsExtended() ? extended : brief;
 }
 
