@@ -1,7 +1,11 @@
-#include "Raw.h"
+#include "TestDB.h"
+
+#include "system/Database.h"
 
 #include "orvadb/DB.h"
 #include "orvadb/Statement.h"
+
+#include "support/Thrown.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -17,9 +21,7 @@ namespace orva::db {
 namespace {
 
 namespace fs = std::filesystem;
-using test::Query;
-using test::Raw;
-
+using test::Database;
 using test::TestDB;
 using test::Thrown;
 using testing::AllOf;
@@ -60,11 +62,11 @@ TEST_F(DBTest, OpenCreatesAnEmptyDatabaseAndRemembersItsPath) {
   EXPECT_EQ(db.GetPath(), path);
   EXPECT_TRUE(fs::is_regular_file(path));
   Statement(db, "CREATE TABLE t(a)", __FILE__, __LINE__).Execute(__FILE__, __LINE__);
-  EXPECT_THAT(Query(Raw(path), "SELECT name FROM sqlite_master"), ElementsAre("t"));
+  EXPECT_THAT(Database(path).Run("SELECT name FROM sqlite_master"), ElementsAre("t"));
 }
 
 TEST_F(DBTest, OpenKeepsWhatIsThere) {
-  Query(Raw(path), "CREATE TABLE t(a); INSERT INTO t VALUES('kept')");
+  Database(path, true).exec("CREATE TABLE t(a); INSERT INTO t VALUES('kept')");
   EXPECT_THAT(TestDB(path).Rows("SELECT a FROM t"), ElementsAre("kept"));
 }
 
@@ -157,7 +159,7 @@ TEST_F(DBTest, TheMessageOfAFailedOpenNamesTheFileAndTheReason) {
 }
 
 TEST_F(DBTest, OpenFollowsNoLinkToAFile) {
-  Query(Raw(path), "CREATE TABLE t(a)");
+  Database(path, true).exec("CREATE TABLE t(a)");
   fs::create_symlink(path, "/tmp/db/link.db");
   EXPECT_THROW(TestDB("/tmp/db/link.db"), std::string);
 }
@@ -204,7 +206,7 @@ TEST_F(DBTest, AReadOnlyConnectionNeverCreatesAndNeverWrites) {
   EXPECT_THROW(db.Open(path, TestDB::Access::ReadOnly, 7, false), std::string);
   EXPECT_FALSE(fs::exists(path));
 
-  Query(Raw(path), "CREATE TABLE t(a)");
+  Database(path, true).exec("CREATE TABLE t(a)");
   db.Open(path, TestDB::Access::ReadOnly, 7, false);
   EXPECT_THAT(db.Rows("PRAGMA busy_timeout"), ElementsAre("7"));
   EXPECT_THAT(

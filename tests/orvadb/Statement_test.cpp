@@ -1,7 +1,11 @@
-#include "Raw.h"
+#include "TestDB.h"
+
+#include "system/Database.h"
 
 #include "orvadb/Connection.h"
 #include "orvadb/Statement.h"
+
+#include "support/Thrown.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -16,12 +20,9 @@ namespace orva::db {
 namespace {
 
 namespace fs = std::filesystem;
-using test::Query;
-using test::Raw;
-
+using test::Database;
 using test::TestDB;
 using test::Thrown;
-using test::Try;
 using testing::ElementsAre;
 using testing::IsEmpty;
 using testing::SizeIs;
@@ -78,7 +79,7 @@ TEST_F(StatementTest, FetchTellsWhetherARowIsReady) {
 TEST_F(StatementTest, ExecuteRunsToCompletion) {
   db.Rows("CREATE TABLE u(a); INSERT INTO t VALUES(1), (2), (3)");
   Execute("INSERT INTO u SELECT a FROM t RETURNING a");
-  EXPECT_THAT(Query(Raw(path), "SELECT a FROM u"), ElementsAre("1", "2", "3"));
+  EXPECT_THAT(Database(path).Run("SELECT a FROM u"), ElementsAre("1", "2", "3"));
 }
 
 // Errors.
@@ -286,13 +287,14 @@ TEST_F(StatementTest, AUsedStatementKeepsNoBindings) {
 
 TEST_F(StatementTest, AUsedStatementHoldsNoLock) {
   db.Rows("INSERT INTO t VALUES(1), (2)");
-  const Raw other(path);
+  SQLite::Database other(path, SQLite::OPEN_READWRITE);
   {
     Statement select = Make("SELECT a FROM t");
     ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
-    EXPECT_EQ(Try(other, "INSERT INTO t VALUES(3)"), SQLITE_BUSY) << "a reader keeps writers out";
+    EXPECT_EQ(other.tryExec("INSERT INTO t VALUES(3)"), SQLITE_BUSY)
+        << "a reader keeps writers out";
   }
-  EXPECT_EQ(Try(other, "INSERT INTO t VALUES(3)"), SQLITE_OK);
+  EXPECT_EQ(other.tryExec("INSERT INTO t VALUES(3)"), SQLITE_OK);
 }
 
 TEST_F(StatementTest, AUsedStatementStartsAgainFromTheBeginning) {
@@ -336,7 +338,7 @@ TEST_F(StatementTest, KeptStatementsDoNotHinderVacuum) {
 
 TEST_F(StatementTest, KeptStatementsFollowTheSchemaOfAnotherProgram) {
   Execute("SELECT * FROM t");
-  Query(Raw(path), "DROP TABLE t; CREATE TABLE t(x, y); INSERT INTO t VALUES(8, 9)");
+  Database(path).exec("DROP TABLE t; CREATE TABLE t(x, y); INSERT INTO t VALUES(8, 9)");
   Statement select = Make("SELECT * FROM t");
   ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
   EXPECT_EQ(select.GetInt(1), 9);

@@ -1,9 +1,12 @@
-#include "Raw.h"
+#include "TestDB.h"
+
+#include "system/Database.h"
 
 #include "orvadb/Statement.h"
 #include "orvadb/Transaction.h"
 
 #include "support/ThreadState.h"
+#include "support/Thrown.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -20,12 +23,9 @@ namespace orva::db {
 namespace {
 
 namespace fs = std::filesystem;
-using test::Query;
-using test::Raw;
-
+using test::Database;
 using test::TestDB;
 using test::Thrown;
-using test::Try;
 using testing::AllOf;
 using testing::ElementsAre;
 using testing::HasSubstr;
@@ -50,7 +50,9 @@ protected:
     return Statement(db, sql, __FILE__, __LINE__).Step(__FILE__, __LINE__);
   }
 
-  std::vector<std::string> Saved() const { return Query(Raw(path), "SELECT a FROM t ORDER BY a"); }
+  std::vector<std::string> Saved() const {
+    return Database(path).Run("SELECT a FROM t ORDER BY a");
+  }
 
   const std::string path = "/tmp/transaction/test.db";
   TestDB db;
@@ -82,7 +84,7 @@ TEST_F(TransactionTest, AnExceptionRollsBack) {
         throw std::runtime_error("halfway");
       },
       std::runtime_error);
-  EXPECT_THAT(Query(Raw(path), "SELECT name FROM sqlite_master WHERE type = 'table'"),
+  EXPECT_THAT(Database(path).Run("SELECT name FROM sqlite_master WHERE type = 'table'"),
               ElementsAre("t"));
   EXPECT_THAT(Saved(), IsEmpty());
 }
@@ -119,18 +121,18 @@ TEST_F(TransactionTest, TransactionsFollowEachOther) {
 }
 
 TEST_F(TransactionTest, KeepsOtherWritersOutFromTheBeginning) {
-  const Raw other(path);
+  SQLite::Database other(path, SQLite::OPEN_READWRITE);
   {
     const Transaction transaction(db, 0, __FILE__, __LINE__);
-    EXPECT_EQ(Try(other, "BEGIN IMMEDIATE"), SQLITE_BUSY);
-    EXPECT_EQ(Try(other, "SELECT * FROM t"), SQLITE_OK) << "readers may go on";
+    EXPECT_EQ(other.tryExec("BEGIN IMMEDIATE"), SQLITE_BUSY);
+    EXPECT_EQ(other.tryExec("SELECT * FROM t"), SQLITE_OK) << "readers may go on";
   }
-  EXPECT_EQ(Try(other, "BEGIN IMMEDIATE"), SQLITE_OK);
+  EXPECT_EQ(other.tryExec("BEGIN IMMEDIATE"), SQLITE_OK);
 }
 
 TEST_F(TransactionTest, WhereAnotherWritesItFailsWithTheCallersPlace) {
-  const Raw other(path);
-  Query(other, "BEGIN IMMEDIATE");
+  SQLite::Database other(path, SQLite::OPEN_READWRITE);
+  other.exec("BEGIN IMMEDIATE");
   EXPECT_EQ(Thrown([&] { Transaction(db, 0, "Caller.cpp", 21); }),
             "Caller.cpp:21: database is locked (extended code 5) in \"BEGIN IMMEDIATE\"");
 }
@@ -149,8 +151,8 @@ TEST_F(TransactionTest, ASecondOneOnTheConnectionFails) {
 // Waiting.
 
 TEST_F(TransactionTest, WaitsForAnotherWriterForItsBusyTimeOut) {
-  const Raw other(path);
-  Query(other, "BEGIN EXCLUSIVE; INSERT INTO t VALUES('theirs')");
+  SQLite::Database other(path, SQLite::OPEN_READWRITE);
+  other.exec("BEGIN EXCLUSIVE; INSERT INTO t VALUES('theirs')");
 
   // Set when the waiting connection begins; from then on only the lock makes it sleep.
   std::atomic<pid_t> waiting = 0;
@@ -163,17 +165,19 @@ TEST_F(TransactionTest, WaitsForAnotherWriterForItsBusyTimeOut) {
 
   std::string failure;
   std::jthread waiter([&] {
-    failure = Thrown([&] {
+    try {
       Transaction transaction(db, 600'000, __FILE__, __LINE__);
       Execute("INSERT INTO t VALUES('ours')");
       transaction.Commit(__FILE__, __LINE__);
-    });
+    } catch (const std::string& thrown) {
+      failure = thrown;
+    }
   });
   waiting.wait(0);
   EXPECT_TRUE(test::AwaitSleeping(waiting));
-  Query(other, "COMMIT");
+  other.exec("COMMIT");
   waiter.join();
-  EXPECT_EQ(failure, "nothing thrown");
+  EXPECT_EQ(failure, "");
   EXPECT_THAT(Saved(), ElementsAre("ours", "theirs"));
 }
 
@@ -193,8 +197,8 @@ TEST_F(TransactionTest, TheBusyTimeOutIsTheTransactionsOnlyWhileItRuns) {
 }
 
 TEST_F(TransactionTest, AFailedBeginningRestoresTheBusyTimeOut) {
-  const Raw other(path);
-  Query(other, "BEGIN IMMEDIATE");
+  SQLite::Database other(path, SQLite::OPEN_READWRITE);
+  other.exec("BEGIN IMMEDIATE");
   EXPECT_THROW(Transaction(db, 0, __FILE__, __LINE__), std::string);
   EXPECT_THAT(db.Rows("PRAGMA busy_timeout"), ElementsAre("1000"));
 }
@@ -259,15 +263,15 @@ TEST_F(TransactionTest, AStepThatFailedInTheLastOneDoesNotCount) {
 
 TEST_F(TransactionTest, ACommitThatReadersHinderFailsAndChangesNothing) {
   Execute("INSERT INTO t VALUES(1)");
-  const Raw other(path);
-  Query(other, "BEGIN; SELECT * FROM t");
+  SQLite::Database other(path, SQLite::OPEN_READWRITE);
+  other.exec("BEGIN; SELECT * FROM t");
   {
     Transaction transaction(db, 0, __FILE__, __LINE__);
     Execute("INSERT INTO t VALUES(2)");
     EXPECT_EQ(Thrown([&] { transaction.Commit("Caller.cpp", 30); }),
               "Caller.cpp:30: database is locked (extended code 5) in \"COMMIT\"");
   }
-  Query(other, "COMMIT");
+  other.exec("COMMIT");
   EXPECT_THAT(Saved(), ElementsAre("1"));
 }
 
@@ -318,18 +322,18 @@ protected:
 };
 
 TEST_F(ReadOnlyTransactionTest, KeepsNobodyFromWriting) {
-  const Raw other(path);
+  SQLite::Database other(path, SQLite::OPEN_READWRITE);
   const Transaction transaction(reader, 0, __FILE__, __LINE__);
-  EXPECT_EQ(Try(other, "INSERT INTO t VALUES(1)"), SQLITE_OK) << "nothing was read yet";
+  EXPECT_EQ(other.tryExec("INSERT INTO t VALUES(1)"), SQLITE_OK) << "nothing was read yet";
 }
 
 TEST_F(ReadOnlyTransactionTest, SeesTheSameToTheEndWhileAnotherWrites) {
-  const Raw other(path);
-  Query(other, "PRAGMA journal_mode = WAL; INSERT INTO t VALUES(1)");
+  SQLite::Database other(path, SQLite::OPEN_READWRITE);
+  other.exec("PRAGMA journal_mode = WAL; INSERT INTO t VALUES(1)");
   {
     Transaction transaction(reader, 0, __FILE__, __LINE__);
     EXPECT_THAT(Read(), ElementsAre("1"));
-    Query(other, "INSERT INTO t VALUES(2)");
+    other.exec("INSERT INTO t VALUES(2)");
     EXPECT_THAT(Saved(), ElementsAre("1", "2"));
     EXPECT_THAT(Read(), ElementsAre("1"));
     transaction.Commit(__FILE__, __LINE__);
@@ -339,22 +343,22 @@ TEST_F(ReadOnlyTransactionTest, SeesTheSameToTheEndWhileAnotherWrites) {
 
 TEST_F(ReadOnlyTransactionTest, KeepsARollbackJournalFromChangingTheFileUnderIt) {
   Execute("INSERT INTO t VALUES(1)");
-  const Raw other(path);
+  SQLite::Database other(path, SQLite::OPEN_READWRITE);
   {
     const Transaction transaction(reader, 0, __FILE__, __LINE__);
     EXPECT_THAT(Read(), ElementsAre("1"));
-    EXPECT_EQ(Try(other, "INSERT INTO t VALUES(2)"), SQLITE_BUSY);
+    EXPECT_EQ(other.tryExec("INSERT INTO t VALUES(2)"), SQLITE_BUSY);
     EXPECT_THAT(Read(), ElementsAre("1"));
   }
-  EXPECT_EQ(Try(other, "INSERT INTO t VALUES(2)"), SQLITE_OK);
+  EXPECT_EQ(other.tryExec("INSERT INTO t VALUES(2)"), SQLITE_OK);
   EXPECT_THAT(Read(), ElementsAre("1", "2"));
 }
 
 TEST_F(ReadOnlyTransactionTest, AFailedReadMakesTheCommitFail) {
-  const Raw other(path);
+  SQLite::Database other(path, SQLite::OPEN_READWRITE);
   EXPECT_THAT(Read(), IsEmpty()); // so that the schema is known and the statement compiled
   Transaction transaction(reader, 0, __FILE__, __LINE__);
-  Query(other, "BEGIN EXCLUSIVE");
+  other.exec("BEGIN EXCLUSIVE");
   EXPECT_EQ(
       Statement(reader, "SELECT a FROM t ORDER BY a", __FILE__, __LINE__).Step("Inner.cpp", 11),
       SQLITE_BUSY);

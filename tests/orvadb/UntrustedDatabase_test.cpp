@@ -1,58 +1,63 @@
-#include "Raw.h"
+#include "TestDB.h"
+
+#include "system/Database.h"
 
 #include "orvadb/DB.h"
 #include "orvadb/Statement.h"
+
+#include "support/Thrown.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
 #include <filesystem>
 #include <fstream>
+#include <functional>
 #include <string>
 
 namespace orva::db {
 namespace {
 
 namespace fs = std::filesystem;
-using test::Query;
-using test::Raw;
+using test::Database;
 using test::TestDB;
 using test::Thrown;
 using testing::ElementsAre;
 using testing::HasSubstr;
 
-/// A database that somebody else has made.
+/// The failure of `action`; empty when it succeeds.
+std::string Failure(const std::function<void()>& action) {
+  try {
+    action();
+  } catch (const std::string& failure) {
+    return failure;
+  }
+  return {};
+}
+
+/// A database that an untrusted program has made.
 class UntrustedDatabaseTest : public testing::Test {
 protected:
   UntrustedDatabaseTest() {
     fs::remove_all("/tmp/db");
     fs::create_directory("/tmp/db");
-    Query(Raw(path), "CREATE TABLE t(a, b)");
+    Database(path, true).exec("CREATE TABLE t(a, b)");
   }
 
-  void Made(const std::string& sql) const { Query(Raw(path), sql); }
+  void Made(const std::string& sql) const { Database(path).exec(sql); }
 
   /// The failure of a statement on it; empty when there is none.
   std::string FailureOf(const std::string& sql) const {
     const TestDB db(path);
-    try {
-      Statement(db, sql.c_str(), __FILE__, __LINE__).Execute(__FILE__, __LINE__);
-    } catch (const std::string& failure) {
-      return failure;
-    }
-    return {};
+    return Failure(
+        [&] { Statement(db, sql.c_str(), __FILE__, __LINE__).Execute(__FILE__, __LINE__); });
   }
 
   /// Why the values of the table are not trusted; empty when they are.
   std::string Refusal(bool writable = true) const {
     TestDB db;
     db.Open(path, writable ? TestDB::Access::ReadWrite : TestDB::Access::ReadOnly, 7, false);
-    try {
-      db.RejectComputedColumns("t");
-    } catch (const std::string& failure) {
-      return failure;
-    }
-    return {};
+    return Failure([&] { db.RejectComputedColumns("t"); });
   }
 
   const std::string path = "/tmp/db/test.db";
@@ -62,7 +67,7 @@ TEST_F(UntrustedDatabaseTest, TriggersDoNotRun) {
   Made(
       "CREATE TRIGGER more AFTER INSERT ON t BEGIN INSERT INTO t VALUES('by the trigger', 0); END");
   EXPECT_EQ(FailureOf("INSERT INTO t VALUES(1, 2)"), "");
-  EXPECT_THAT(Query(Raw(path), "SELECT a FROM t"), ElementsAre("1"));
+  EXPECT_THAT(Database(path).Run("SELECT a FROM t"), ElementsAre("1"));
 }
 
 TEST_F(UntrustedDatabaseTest, ViewsAreNoTables) {
@@ -223,8 +228,8 @@ TEST_F(UntrustedDatabaseTest, HolesCountForLittle) {
 }
 
 TEST_F(UntrustedDatabaseTest, SizeCountsTheLogToo) {
-  const Raw writer(path);
-  Query(writer, "PRAGMA journal_mode = WAL; CREATE TABLE more(a)");
+  Database writer(path);
+  writer.exec("PRAGMA journal_mode = WAL; CREATE TABLE more(a)");
   const TestDB db(path);
   EXPECT_EQ(db.MeasureFile(),
             static_cast<long long>(fs::file_size(path) + fs::file_size(path + "-wal")));
@@ -280,7 +285,7 @@ TEST_F(CreateTest, FailureLeavesNothing) {
 }
 
 TEST_F(CreateTest, WhatAStopHasLeftGoesFirst) {
-  Query(Raw(path + ".new"), "CREATE TABLE t(a); CREATE TABLE more(a)");
+  Database(path + ".new", true).exec("CREATE TABLE t(a); CREATE TABLE more(a)");
   for (const char* const left : {".new-journal", ".new-wal", ".new-shm", "-journal", "-wal"}) {
     std::ofstream(path + left) << "left";
   }

@@ -1,7 +1,11 @@
-#include "Raw.h"
+#include "TestDB.h"
+
+#include "system/Database.h"
 
 #include "orvadb/Statement.h"
 #include "orvadb/VolumeDB.h"
+
+#include "support/Thrown.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -20,9 +24,7 @@ namespace orva::db {
 namespace {
 
 namespace fs = std::filesystem;
-using test::Query;
-using test::Raw;
-
+using test::Database;
 using test::Thrown;
 using testing::AllOf;
 using testing::ElementsAre;
@@ -90,7 +92,7 @@ protected:
 
   /// Writes a catalog that holds the text `kept`.
   static void WriteCatalog(const std::string& path) {
-    Query(Raw(path), "CREATE TABLE t(a); INSERT INTO t VALUES('kept')");
+    Database(path, true).exec("CREATE TABLE t(a); INSERT INTO t VALUES('kept')");
   }
 
   const std::string volume = "/shares/Vol";
@@ -134,7 +136,7 @@ TEST_F(VolumeDBTest, ForWritingItCreatesTheFileButNotItsFolder) {
     const Catalog db(volume, true);
     db.Rows("CREATE TABLE t(a)");
   }
-  EXPECT_THAT(Query(Raw(catalog), "SELECT name FROM sqlite_master"), ElementsAre("t"));
+  EXPECT_THAT(Database(catalog).Run("SELECT name FROM sqlite_master"), ElementsAre("t"));
   fs::remove_all(home);
   EXPECT_THROW(Catalog(volume, true), std::string);
   EXPECT_FALSE(fs::exists(home));
@@ -194,10 +196,10 @@ TEST_F(VolumeDBTest, AnEmptyFileIsACatalogWithoutTables) {
 
 TEST_F(VolumeDBTest, ALogOfARunningWriterIsReadWithTheCatalog) {
   WriteCatalog(catalog);
-  const Raw indexer(catalog);
-  Query(indexer, "PRAGMA journal_mode = WAL; INSERT INTO t VALUES('logged')");
+  Database indexer(catalog, true);
+  indexer.exec("PRAGMA journal_mode = WAL; INSERT INTO t VALUES('logged')");
   EXPECT_THAT(Catalog(volume, false).Rows("SELECT a FROM t"), ElementsAre("kept", "logged"));
-  Query(indexer, "INSERT INTO t VALUES('later')");
+  indexer.exec("INSERT INTO t VALUES('later')");
   EXPECT_THAT(Catalog(volume, false).Rows("SELECT a FROM t"),
               ElementsAre("kept", "logged", "later"));
 }
@@ -208,9 +210,9 @@ class ReadOnlyVolumeTest : public testing::TestWithParam<std::string> {
 protected:
   /// Writes a catalog that holds the text `kept`, with the journal `mode`.
   void WriteCatalog(const std::string& mode) const {
-    const Raw indexer(catalog);
-    Query(indexer, "PRAGMA journal_mode = " + mode);
-    Query(indexer, "CREATE TABLE t(a); INSERT INTO t VALUES('kept')");
+    Database indexer(catalog, true);
+    indexer.exec("PRAGMA journal_mode = " + mode);
+    indexer.exec("CREATE TABLE t(a); INSERT INTO t VALUES('kept')");
   }
 
   const std::string point = "/shares/" + GetParam();
@@ -247,9 +249,9 @@ TEST_P(ReadOnlyVolumeTest, ACatalogWhoseLogIsEmptyIsRead) {
 
 TEST_P(ReadOnlyVolumeTest, ACatalogWithALogToReadIsAnError) {
   {
-    const Raw indexer(catalog);
-    sqlite3_db_config(indexer, SQLITE_DBCONFIG_NO_CKPT_ON_CLOSE, 1, nullptr);
-    Query(indexer, "PRAGMA journal_mode = WAL; CREATE TABLE t(a); INSERT INTO t VALUES('kept')");
+    Database indexer(catalog, true);
+    sqlite3_db_config(indexer.getHandle(), SQLITE_DBCONFIG_NO_CKPT_ON_CLOSE, 1, nullptr);
+    indexer.exec("PRAGMA journal_mode = WAL; CREATE TABLE t(a); INSERT INTO t VALUES('kept')");
   }
   ASSERT_GT(fs::file_size(catalog + "-wal"), 0U);
   volume.MakeReadOnly();

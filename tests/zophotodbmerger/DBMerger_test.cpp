@@ -535,7 +535,7 @@ TEST_F(DBMergerTest, UnusableMasterPasses) {
   AddPhotos();
   std::ofstream(MASTER + ".zophotos") << "in the way";
   EXPECT_EQ("Invalid DB location : '/shares/Master/.zophotos'",
-            ThrownBy<PhotoDB::Error>([&] { Merge(); }).Message());
+            Thrown<PhotoDB::Error>([&] { Merge(); }).Message());
   EXPECT_THROW(ReMerge(), PhotoDB::Error);
   EXPECT_THROW(merger.RemoveVolume(MASTER, VOLUME), PhotoDB::Error);
   EXPECT_THAT(Logged(), IsEmpty());

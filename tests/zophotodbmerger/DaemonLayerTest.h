@@ -3,6 +3,8 @@
 #include "Syslog.h"
 #include "VolumeInfo.h"
 
+#include "support/Thrown.h"
+
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
@@ -43,17 +45,6 @@ std::string OutputOf(Action action) {
     throw;
   }
   return ::testing::internal::GetCapturedStdout();
-}
-
-/// What `action` throws as Thrown; a failure of the test when it throws nothing.
-template <typename Thrown, typename Action>
-Thrown ThrownBy(Action action) {
-  try {
-    action();
-  } catch (const Thrown& thrown) {
-    return thrown;
-  }
-  throw std::logic_error("nothing was thrown");
 }
 
 /// Makes a directory, with its parents, and returns its path.

@@ -114,7 +114,7 @@ TEST_F(DefaultStateTest, UnusableMasterKeepsTheStateAndTheElection) {
   Register("/shares/Vol/", LARGE);
   std::ofstream("/shares/Vol/.zophotos") << "in the way";
   EXPECT_EQ("Invalid DB location : '/shares/Vol/.zophotos'",
-            ThrownBy<dbmerger::PhotoDB::Error>([&] { Scanned("/shares/Vol/"); }).Message());
+            Thrown<dbmerger::PhotoDB::Error>([&] { Scanned("/shares/Vol/"); }).Message());
   EXPECT_EQ(State::DEFAULT, CurrentType());
   EXPECT_EQ("/shares/Vol/", Master());
   EXPECT_EQ(SHARES_LOCATOR, Locator());

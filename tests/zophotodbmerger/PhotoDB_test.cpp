@@ -127,7 +127,7 @@ TEST_F(PhotoDBLocationTest, MissingLocationKeepsAScratchDatabaseInTheWorkingDire
 TEST_F(PhotoDBLocationTest, FileInTheDirectorysPlaceIsAnUnusableLocation) {
   std::ofstream(DIRECTORY) << "in the way";
   EXPECT_EQ("Invalid DB location : '/shares/Vol/.zophotos'",
-            ThrownBy<PhotoDB::Error>([] { PhotoDB photos(LOCATION); }).Message());
+            Thrown<PhotoDB::Error>([] { PhotoDB photos(LOCATION); }).Message());
 }
 
 TEST_F(PhotoDBLocationTest, LinkInTheDirectorysPlaceIsAnUnusableLocation) {
@@ -135,7 +135,7 @@ TEST_F(PhotoDBLocationTest, LinkInTheDirectorysPlaceIsAnUnusableLocation) {
   chmod("/shares/Elsewhere", 0700);
   std::filesystem::create_directory_symlink("/shares/Elsewhere", DIRECTORY);
   EXPECT_EQ("Invalid DB location : '/shares/Vol/.zophotos'",
-            ThrownBy<PhotoDB::Error>([] { PhotoDB photos(LOCATION); }).Message());
+            Thrown<PhotoDB::Error>([] { PhotoDB photos(LOCATION); }).Message());
   EXPECT_EQ(0700U, ModeOf("/shares/Elsewhere"));
 }
 
@@ -152,7 +152,7 @@ TEST_F(PhotoDBLocationTest, UnusableLocationIsNoStandardException) {
 TEST_F(PhotoDBLocationTest, DirectoryThatCannotBeMadeIsAnException) {
   ASSERT_EQ(0, mount("volume", LOCATION.c_str(), "tmpfs", MS_RDONLY, nullptr));
   EXPECT_STREQ("Change permissions failed on dbLocation: '/shares/Vol/.zophotos'",
-               ThrownBy<util::Exception>([] { PhotoDB photos(LOCATION); }).what());
+               Thrown<util::Exception>([] { PhotoDB photos(LOCATION); }).what());
 }
 
 TEST_F(PhotoDBLocationTest, LinkInTheFilesPlaceIsRefused) {
@@ -250,7 +250,7 @@ TEST_F(PhotoDBTest, ExistingDatabaseWithoutAStatusRowLeavesTheRecordUnset) {
 TEST_F(PhotoDBTest, ExistingFileWithoutAStatusTableIsThrown) {
   Rows("DROP TABLE Status");
   PhotoDB again(LOCATION);
-  EXPECT_THAT(ThrownBy<std::string>([&] { again.Init(); }), HasSubstr("SELECT * FROM Status"));
+  EXPECT_THAT(Thrown([&] { again.Init(); }), HasSubstr("SELECT * FROM Status"));
 }
 
 TEST_F(PhotoDBLocationTest, FileThatIsNoDatabaseIsThrown) {
@@ -608,8 +608,7 @@ TEST_F(PhotoDBTest, FailedDeletionsPassOn) {
   Rows("DROP TABLE Files");
   EXPECT_THROW(DeleteFile("/shares/Vol/", "a.jpg"), std::string);
   EXPECT_THROW(DeleteFolder("/shares/Vol/"), std::string);
-  EXPECT_THAT(ThrownBy<std::string>([&] { photos.DeleteVolumes(); }),
-              HasSubstr("no such table: Files"));
+  EXPECT_THAT(Thrown([&] { photos.DeleteVolumes(); }), HasSubstr("no such table: Files"));
 }
 
 TEST_F(PhotoDBTest, FailureInTheMiddleLeavesWhatWasDoneBefore) {
@@ -618,8 +617,7 @@ TEST_F(PhotoDBTest, FailureInTheMiddleLeavesWhatWasDoneBefore) {
   photos.InsertStatistics(VOLUME);
   photos.UpdateStatistics({VOLUME, 3, 4, 500});
   Rows("ALTER TABLE Folders RENAME TO Away");
-  EXPECT_THAT(ThrownBy<std::string>([&] { photos.DeleteVolume(VOLUME); }),
-              HasSubstr("no such table: Folders"));
+  EXPECT_THAT(Thrown([&] { photos.DeleteVolume(VOLUME); }), HasSubstr("no such table: Folders"));
   EXPECT_THAT(Rows("SELECT name FROM Files"), IsEmpty());
   EXPECT_THAT(Rows("SELECT name FROM Away"), ElementsAre("/shares/", "/shares/Vol/"));
   EXPECT_THAT(MergedStatistics(LOCATION), ElementsAre("/shares/Vol/|3|4|0"));
@@ -639,7 +637,7 @@ TEST_F(PhotoDBTest, FailedAddsPassOn) {
   AddFolder("/shares/Vol/");
   AddFile("/shares/Vol/", "a.jpg");
   RefuseTwice("Files", "volume");
-  EXPECT_THAT(ThrownBy<std::string>([&] { AddFile("/shares/Vol/", "b.jpg"); }),
+  EXPECT_THAT(Thrown([&] { AddFile("/shares/Vol/", "b.jpg"); }),
               HasSubstr("UNIQUE constraint failed"));
 }
 
@@ -761,7 +759,7 @@ TEST_F(PhotoDBTest, FailedUpdateOfTheStatusIsThrownAndNamesThePlaceInThisLayer) 
   Rows("INSERT INTO Status(mc_version, mdate) VALUES('other', 1)");
   RefuseTwice("Status", "mc_version");
   photos.status.mc_version = "other";
-  EXPECT_THAT(ThrownBy<std::string>([&] { photos.UpdateStatus(); }),
+  EXPECT_THAT(Thrown([&] { photos.UpdateStatus(); }),
               ::testing::AllOf(StartsWith("src/zophotodbmerger/PhotoDB.cpp:"),
                                HasSubstr("UNIQUE constraint failed")));
 }

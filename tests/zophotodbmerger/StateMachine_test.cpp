@@ -126,7 +126,7 @@ TEST_F(StateMachineTest, StartWithoutTheSharesRootGoesOnWithAnEmptyRegistry) {
 TEST_F(StateMachineTest, UnusableSharesRootLetsNoMachineBeMade) {
   std::ofstream("/shares/.zophotos") << "in the way";
   EXPECT_EQ("Invalid DB location : '/shares/.zophotos'",
-            ThrownBy<PhotoDB::Error>([] { StateMachine::Instance(); }).Message());
+            Thrown<PhotoDB::Error>([] { StateMachine::Instance(); }).Message());
   EXPECT_EQ(nullptr, StateMachine::instance);
   EXPECT_EQ("(absent)", Locator());
   EXPECT_EQ(nullptr, VolumeInfoManager::instance);
@@ -209,8 +209,8 @@ TEST_F(StateMachineTest, EndOfAStateThatThrowsPassesAndFreesBoth) {
   Set(machine, current);
   std::string thrown;
   OutputOf([&] {
-    thrown = ThrownBy<std::string>(
-        [&] { machine.setCurrentState(std::make_unique<ProbeState>(0, ended).release()); });
+    thrown =
+        Thrown([&] { machine.setCurrentState(std::make_unique<ProbeState>(0, ended).release()); });
   });
   EXPECT_EQ("the end failed", thrown);
   EXPECT_THAT(ended, ElementsAre("end of 1", "end of 0"));
