@@ -1,8 +1,8 @@
 #include "FaultTest.h"
 
+#include "Catalog.h"
 #include "Database.h"
 #include "PhotoDB.h"
-#include "TestCatalog.h"
 
 #include "support/TestScale.h"
 
@@ -36,59 +36,41 @@ std::string FolderPath(int folder) {
   return "2020-" + std::to_string(folder) + "/";
 }
 
-/// A photo's id in the catalog.
-int PhotoId(int folder, int photo) {
-  return folder * 100 + photo;
+std::string PhotoPath(int folder, int photo) {
+  return FolderPath(folder) + "IMG_" + std::to_string(photo) + ".jpg";
 }
 
-void AddPhoto(TestCatalog& catalog, int folder, int photo, long stamp) {
-  catalog.AddPhoto(PhotoId(folder, photo),
-                   FolderPath(folder) + "IMG_" + std::to_string(photo) + ".jpg", 1'000 + photo,
-                   stamp);
-}
-
-TestCatalog MakeCatalog(const std::string& volume) {
+Catalog MakeCatalog(const std::string& volume) {
   std::filesystem::remove_all(volume);
-  TestCatalog catalog(volume);
+  Catalog catalog(volume);
   // The smallest pages, and every statement reads its own, so that there are more to be read.
   catalog.Rows().Run("PRAGMA default_cache_size = 1");
   catalog.Rows().Run("PRAGMA page_size = 512");
   catalog.Rows().Run("VACUUM");
   for (int folder = 1; folder <= FOLDERS; ++folder) {
-    catalog.AddFolder(folder, FolderPath(folder), 100 + folder);
+    catalog.AddFolder(FolderPath(folder), 100 + folder);
     for (int photo = 1; photo <= PHOTOS; ++photo) {
-      AddPhoto(catalog, folder, photo, 10'000 + PhotoId(folder, photo));
+      catalog.AddPhoto(PhotoPath(folder, photo), 1'000 + photo, 10'000 + folder * 100 + photo);
     }
   }
   return catalog;
 }
 
 /// What an indexer does between two merges: new photos, a new folder, photos and a folder gone.
-void Change(TestCatalog& catalog) {
-  catalog.AddFolder(FOLDERS + 1, FolderPath(FOLDERS + 1), 200);
+void Change(Catalog& catalog) {
+  catalog.AddFolder(FolderPath(FOLDERS + 1), 200);
   for (int photo = 1; photo <= PHOTOS; ++photo) {
-    AddPhoto(catalog, FOLDERS + 1, photo, 20'000 + photo);
-    catalog.DeletePhoto(PhotoId(1, photo), 20'100 + photo);
+    catalog.AddPhoto(PhotoPath(FOLDERS + 1, photo), 1'000 + photo, 20'000 + photo);
+    catalog.DeletePhoto(PhotoPath(1, photo), 20'100 + photo);
   }
-  AddPhoto(catalog, 2, PHOTOS + 1, 20'200);
-  catalog.DeletePhoto(PhotoId(3, 1), 20'201);
-  catalog.Rows().Run("UPDATE Folders SET isDeleted = 1 WHERE id = 1");
+  catalog.AddPhoto(PhotoPath(2, PHOTOS + 1), 1'000 + PHOTOS + 1, 20'200);
+  catalog.DeletePhoto(PhotoPath(3, 1), 20'201);
+  catalog.DeleteFolder(FolderPath(1));
 }
 
 std::string ReadFile(const std::filesystem::path& path) {
   std::ifstream file(path, std::ios::binary);
   return {std::istreambuf_iterator<char>(file), {}};
-}
-
-/// Lengthens `lines` by the rows of a query, or by its failure.
-void Append(Lines& lines, const Database& database, const std::string& sql) {
-  try {
-    for (const std::string& row : database.Run(sql)) {
-      lines.push_back(row);
-    }
-  } catch (const std::runtime_error& error) {
-    lines.emplace_back(error.what());
-  }
 }
 
 /// The lines that only one of two contents has: "- " of the first, "+ " of the second.
@@ -131,18 +113,8 @@ Lines FaultTest::Content() {
   if (!std::filesystem::exists(DATABASE)) {
     return NO_DATABASE;
   }
-  Lines content;
-  const Database database(DATABASE);
-  for (const char* const sql :
-       {"SELECT type, name, sql FROM sqlite_master ORDER BY name", "SELECT * FROM Status",
-        "SELECT volume, photos_xcoded, photos_total, last_updated_time FROM Statistics ORDER BY 1",
-        "SELECT f.name, coalesce(p.name, f.parent_folder_id), f.modified_date, f.volume FROM "
-        "Folders f LEFT JOIN Folders p ON p.folder_id = f.parent_folder_id ORDER BY 1, 4",
-        "SELECT coalesce(o.name, 'no folder: ') || f.name, f.modified_date, f.created_date, "
-        "f.volume FROM Files f LEFT JOIN Folders o ON o.folder_id = f.folder_id ORDER BY 1, 4"}) {
-    Append(content, database, sql);
-  }
-  return content;
+  const MergedDatabase database(MASTER);
+  return database.Rows().Run("SELECT mdate FROM Status") + database.Content();
 }
 
 FaultTest::Files FaultTest::TakeFiles() {
@@ -209,7 +181,7 @@ FaultTest::Scenario FaultTest::FirstMergeWithoutADatabase() {
 /// Merges both volumes, and then has the indexer change the catalog of the one.
 void FaultTest::LayMergedVolumes() {
   MakeCatalog(OTHER);
-  TestCatalog catalog = MakeCatalog(VOLUME);
+  Catalog catalog = MakeCatalog(VOLUME);
   OutputOf([this] { Merge(OTHER); });
   OutputOf([this] { Merge(VOLUME); });
   Change(catalog);

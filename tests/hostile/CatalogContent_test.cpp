@@ -290,7 +290,7 @@ TEST_P(CatalogContentTest, Merge) {
     catalog.Run("CREATE TABLE Fixed(a)");
   }
   {
-    TestCatalog catalog(VOLUME);
+    Catalog catalog(VOLUME);
     AddPhotos(catalog);
   }
   {

@@ -19,7 +19,7 @@ class CatalogFileTest : public HostileTest {
 protected:
   /// Makes a good catalog on the hostile volume, in pages of this size.
   static void MakeCatalog(const std::string& volume = VOLUME, int pageSize = 4096) {
-    TestCatalog catalog(volume);
+    Catalog catalog(volume);
     AddPhotos(catalog);
     catalog.Rows().Run("PRAGMA page_size = " + std::to_string(pageSize));
     catalog.Rows().Run("VACUUM");

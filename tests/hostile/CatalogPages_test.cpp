@@ -16,7 +16,7 @@ protected:
   /// Makes the catalog anew, with some photos.
   static void MakeCatalog() {
     std::filesystem::remove(CATALOG);
-    TestCatalog catalog(VOLUME);
+    Catalog catalog(VOLUME);
     AddPhotos(catalog);
   }
 
@@ -170,7 +170,7 @@ TEST_F(CatalogPagesTest, OneLongPathInAllRows) {
   for (const unsigned levels : {0U, 1U, 12U}) {
     SCOPED_TRACE(levels);
     std::filesystem::remove(CATALOG);
-    TestCatalog(VOLUME).AddFolder(1, std::string(900'000, 'x') + "/");
+    Catalog(VOLUME).AddFolder(std::string(900'000, 'x') + "/");
     const std::uint32_t root = RootOf("Folders");
     CraftedDatabase catalog(CATALOG);
     catalog.RepeatCell(root, 0);
@@ -184,7 +184,7 @@ TEST_F(CatalogPagesTest, OneLongPathInAllRows) {
 
 TEST_F(CatalogPagesTest, OneLongPathInAllFiles) {
   std::filesystem::remove(CATALOG);
-  TestCatalog(VOLUME).AddPhoto(1, std::string(900'000, 'x'), 1, 1);
+  Catalog(VOLUME).AddPhoto(std::string(900'000, 'x'), 1, 1);
   for (const char* const table : {"Files", "Transcodings"}) {
     const std::uint32_t root = RootOf(table);
     CraftedDatabase catalog(CATALOG);
@@ -197,7 +197,7 @@ TEST_F(CatalogPagesTest, OneLongPathInAllFiles) {
 // Rows that are passed over, each with a megabyte to pass over.
 TEST_F(CatalogPagesTest, OneLongColumnInAllHiddenRows) {
   std::filesystem::remove(CATALOG);
-  TestCatalog(VOLUME).Add(
+  Catalog(VOLUME).Add(
       FolderRow{.id = 1, .path = std::string(900'000, 'x') + "/", .isHidden = true});
   const std::uint32_t root = RootOf("Folders");
   CraftedDatabase catalog(CATALOG);

@@ -85,12 +85,12 @@ HostileTest::HostileTest() {
   }
   std::ofstream(VICTIM) << "dear content";
   std::ofstream("/tmp/victim") << "dear content";
-  TestCatalog good(GOOD);
+  Catalog good(GOOD);
   AddPhotos(good);
   Attempt::Run({{"merge", MASTER, GOOD}});
   merged_ = Bytes::Of(MERGED);
 
-  good.AddPhoto(4, "a/new.jpg", 24, 400);
+  good.AddPhoto("a/new.jpg", 24, 400);
   usualMemory_ = Attempt::Run({{"merge", MASTER, GOOD}}).peakMemory;
   goodContent_ = GoodContent(MASTER);
   RestoreMaster();
@@ -201,12 +201,12 @@ void HostileTest::CheckMemory(const Attempt& attempt) const {
       << content << " bytes are on the volume";
 }
 
-void AddPhotos(TestCatalog& catalog) {
-  catalog.AddFolder(1, "a/", 11);
-  catalog.AddFolder(2, "a/b/", 12);
-  catalog.AddPhoto(1, "top.jpg", 21, 100);
-  catalog.AddPhoto(2, "a/one.jpg", 22, 300);
-  catalog.AddPhoto(3, "a/b/two.jpg", 23, 200);
+void AddPhotos(Catalog& catalog) {
+  catalog.AddFolder("a/", 11);
+  catalog.AddFolder("a/b/", 12);
+  catalog.AddPhoto("top.jpg", 21, 100);
+  catalog.AddPhoto("a/one.jpg", 22, 300);
+  catalog.AddPhoto("a/b/two.jpg", 23, 200);
 }
 
 void MakeCatalogFolder() {

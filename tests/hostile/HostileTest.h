@@ -1,11 +1,11 @@
 #pragma once
 
 #include "Attempt.h"
+#include "Catalog.h"
 #include "CraftedDatabase.h"
 #include "CraftedLog.h"
 #include "DaemonLayerTest.h"
 #include "Database.h"
-#include "TestCatalog.h"
 #include "support/TestScale.h"
 
 #include "orvautil/Core.h"
@@ -75,7 +75,7 @@ private:
 };
 
 /// The rows of a catalog that is good: two folders with three photos.
-void AddPhotos(TestCatalog& catalog);
+void AddPhotos(Catalog& catalog);
 
 /// The folder that a catalog is in, made.
 void MakeCatalogFolder();

@@ -25,8 +25,8 @@ TEST_F(DefaultStateTest, PluggedElectsAndWaitsForTheScan) {
   EXPECT_EQ("/shares/Vol/", Master());
   EXPECT_THAT(Logged(), ElementsAre(Info("Default:: VolumePlugged "),
                                     Info("We now have a master volume " +
-                                         MasterText("/shares/Vol/", "1.5e+11"))));
-  EXPECT_EQ(SHARES_LOCATOR, Locator());
+                                         MasterText("/shares/Vol/", LARGE))));
+  EXPECT_EQ(SHARES_LOCATOR, Appliance::Locator());
   EXPECT_FALSE(std::filesystem::exists("/shares/Vol/.zophotos"));
 }
 
@@ -82,8 +82,8 @@ TEST_F(DefaultStateTest, ScannedGoesStraightToTheScannedState) {
   EXPECT_THAT(Logged(), ElementsAre(Info("Default:: Volume Scanned "),
                                     Info("Moving to the scanned state since we can safely do so "),
                                     Info("We now have a master volume " +
-                                         MasterText("/shares/Vol/", "1.5e+11"))));
-  EXPECT_EQ("zophotos_db_path=/shares/Vol//.zophotos/zophotos.db\n", Locator());
+                                         MasterText("/shares/Vol/", LARGE))));
+  EXPECT_EQ("zophotos_db_path=/shares/Vol//.zophotos/zophotos.db\n", Appliance::Locator());
   EXPECT_THAT(MergedFolders("/shares/Vol"), IsEmpty()) << "the scan itself brings nothing";
 }
 
@@ -100,7 +100,7 @@ TEST_F(DefaultStateTest, TranscodedBeginsWithTheElection) {
   EXPECT_EQ(State::MASTER_VOLUME_SCANNED, CurrentType());
   EXPECT_THAT(Logged(), ElementsAre(Info("Moving to the scanned state since we can safely do so "),
                                     Info("We now have a master volume " + SHARES_MASTER_TEXT)));
-  EXPECT_EQ("zophotos_db_path=/shares/.zophotos/zophotos.db\n", Locator());
+  EXPECT_EQ("zophotos_db_path=/shares/.zophotos/zophotos.db\n", Appliance::Locator());
 }
 
 TEST_F(DefaultStateTest, TranscodedWithoutACandidateStays) {
@@ -117,7 +117,7 @@ TEST_F(DefaultStateTest, UnusableMasterKeepsTheStateAndTheElection) {
             Thrown<dbmerger::PhotoDB::Error>([&] { Scanned("/shares/Vol/"); }).Message());
   EXPECT_EQ(State::DEFAULT, CurrentType());
   EXPECT_EQ("/shares/Vol/", Master());
-  EXPECT_EQ(SHARES_LOCATOR, Locator());
+  EXPECT_EQ(SHARES_LOCATOR, Appliance::Locator());
 }
 
 } // namespace

@@ -1,8 +1,8 @@
 #include "StatesTest.h"
 
+#include "Catalog.h"
 #include "MasterVolumeScannedState.h"
 #include "PhotoDB.h"
-#include "TestCatalog.h"
 
 #include <fstream>
 
@@ -34,9 +34,9 @@ protected:
 };
 
 /// A catalog with one photo.
-TestCatalog MakeCatalog(const std::string& mountPoint) {
-  TestCatalog catalog(mountPoint);
-  catalog.AddPhoto(1, "a.jpg", 10, 100);
+Catalog MakeCatalog(const std::string& mountPoint) {
+  Catalog catalog(mountPoint);
+  catalog.AddPhoto("a.jpg", 10, 100);
   return catalog;
 }
 
@@ -46,13 +46,13 @@ TEST_F(MasterVolumeScannedStateTest, HasTypeTwo) {
 
 TEST_F(MasterVolumeScannedStateTest, HasCreatedTheDatabaseAndPublishedIt) {
   EXPECT_THAT(MergedRows("/shares/Vol", "SELECT mdate FROM Status"), ElementsAre("1000"));
-  EXPECT_EQ("zophotos_db_path=/shares/Vol//.zophotos/zophotos.db\n", Locator());
+  EXPECT_EQ("zophotos_db_path=/shares/Vol//.zophotos/zophotos.db\n", Appliance::Locator());
 }
 
 TEST_F(StatesTest, ScannedStateWithoutAMasterNamesTheEmptyVolume) {
   std::filesystem::current_path(MakeDirectory("/tmp/scratch"));
   const dbmerger::MasterVolumeScannedState state;
-  EXPECT_EQ("zophotos_db_path=DUMMY_MOUNT_POINT/.zophotos/zophotos.db\n", Locator());
+  EXPECT_EQ("zophotos_db_path=DUMMY_MOUNT_POINT/.zophotos/zophotos.db\n", Appliance::Locator());
   EXPECT_TRUE(std::filesystem::exists("/tmp/scratch/.zophotos/zophotos.db"));
 }
 
@@ -61,7 +61,7 @@ TEST_F(StatesTest, ScannedStateThatCannotBeMadeJoinsItsMerger) {
   std::ofstream("/shares/.zophotos") << "in the way";
   ASSERT_TRUE(Registry().reelectMasterVolume());
   EXPECT_THROW(dbmerger::MasterVolumeScannedState(), PhotoDB::Error);
-  EXPECT_EQ(SHARES_LOCATOR, Locator());
+  EXPECT_EQ(SHARES_LOCATOR, Appliance::Locator());
   EXPECT_EQ(State::DEFAULT, CurrentType());
 }
 
@@ -91,23 +91,23 @@ TEST_F(MasterVolumeScannedStateTest, TranscodedMergesTheVolume) {
   MakeCatalog("/shares/Other/");
   Transcoded("/shares/Other/");
   EXPECT_THAT(MergedFiles("/shares/Vol"), ElementsAre("/shares/Other/a.jpg"));
-  EXPECT_EQ(Joined({Merging("handlePictureTranscoded", "/shares/Other/")},
-                   MergeLines("/shares/Other/", 1, 1)),
+  EXPECT_EQ(Log{Merging("handlePictureTranscoded", "/shares/Other/")} +
+                MergeLines("/shares/Other/", 1, 1),
             Logged());
   EXPECT_EQ(State::MASTER_VOLUME_SCANNED, CurrentType());
 }
 
 TEST_F(MasterVolumeScannedStateTest, PurgedMergesTheVolumeAnew) {
-  const TestCatalog catalog = MakeCatalog("/shares/Other/");
+  const Catalog catalog = MakeCatalog("/shares/Other/");
   Transcoded("/shares/Other/");
   Logged();
   // Only a merge from the beginning notices this one.
   catalog.Rows().Run("UPDATE Files SET path = 'b.jpg', name = 'b.jpg'");
   Purged("/shares/Other/");
   EXPECT_THAT(MergedFiles("/shares/Vol"), ElementsAre("/shares/Other/b.jpg"));
-  EXPECT_EQ(
-      Joined({Merging("handleVolumePurged", "/shares/Other/")}, MergeLines("/shares/Other/", 1, 1)),
-      Logged());
+  EXPECT_EQ(Log{Merging("handleVolumePurged", "/shares/Other/")} +
+                MergeLines("/shares/Other/", 1, 1),
+            Logged());
 }
 
 TEST_F(MasterVolumeScannedStateTest, UnpluggedOtherVolumeIsRemovedAndTheStateReplaced) {
@@ -129,10 +129,10 @@ TEST_F(MasterVolumeScannedStateTest, UnpluggedOtherVolumeIsRemovedAndTheStateRep
   EXPECT_THAT(MergedFiles("/shares/Vol"), ElementsAre("/shares/Vol/a.jpg"));
   EXPECT_THAT(MergedStatistics("/shares/Vol"),
               ElementsAre("/shares/Other/|1|1|0", "/shares/Vol/|1|1|100"));
-  EXPECT_EQ("zophotos_db_path=/shares/Vol//.zophotos/zophotos.db\n", Locator());
+  EXPECT_EQ("zophotos_db_path=/shares/Vol//.zophotos/zophotos.db\n", Appliance::Locator());
   EXPECT_THAT(Logged(), ElementsAre(UNPLUGGED, MOVING,
                                     Info("We now have a master volume " +
-                                         MasterText("/shares/Vol/", "1.5e+11") + " ")));
+                                         MasterText("/shares/Vol/", LARGE) + " ")));
 }
 
 TEST_F(MasterVolumeScannedStateTest, MergesGoOnAfterAnUnplug) {
@@ -161,14 +161,14 @@ TEST_F(MasterVolumeScannedStateTest, UnpluggedMasterIsFollowedByAnother) {
 
   EXPECT_EQ(State::MASTER_VOLUME_SCANNED, CurrentType());
   EXPECT_EQ("/shares/Next/", Master());
-  EXPECT_EQ("zophotos_db_path=/shares/Next//.zophotos/zophotos.db\n", Locator());
+  EXPECT_EQ("zophotos_db_path=/shares/Next//.zophotos/zophotos.db\n", Appliance::Locator());
   EXPECT_THAT(MergedFolders("/shares/Next"), IsEmpty());
   EXPECT_THAT(MergedFiles("/shares/Vol"), ElementsAre("/shares/Vol/a.jpg"))
       << "the rows are removed from the database of the empty volume";
   EXPECT_TRUE(std::filesystem::exists("/tmp/scratch/.zophotos/zophotos.db"));
   EXPECT_THAT(Logged(), ElementsAre(UNPLUGGED, MOVING,
                                     Info("We now have a master volume " +
-                                         MasterText("/shares/Next/", "1.2e+11") + " ")));
+                                         MasterText("/shares/Next/", MIDDLE) + " ")));
 }
 
 TEST_F(MasterVolumeScannedStateTest, UnpluggedMasterWithoutASuccessorFallsBack) {
@@ -182,7 +182,7 @@ TEST_F(MasterVolumeScannedStateTest, UnpluggedMasterWithoutASuccessorFallsBack) 
               ElementsAre(UNPLUGGED, Info("We do NOT have a master volume, so going back to the "
                                           "Default State ")));
   EXPECT_THAT(MergedFolders("/shares"), IsEmpty());
-  EXPECT_EQ(SHARES_LOCATOR, Locator());
+  EXPECT_EQ(SHARES_LOCATOR, Appliance::Locator());
   ASSERT_EQ(1U, Registry().getVolumes().size());
   EXPECT_EQ(SHARES_MASTER_TEXT, Registry().getVolumes()[0].ToString());
 }

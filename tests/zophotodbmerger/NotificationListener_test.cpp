@@ -4,7 +4,6 @@
 #include "NotificationListener.h"
 #include "NotificationService.h"
 #include "PhotoDB.h"
-#include "TestCatalog.h"
 #include "Volume.h"
 
 #include "orvautil/ClientSocket.h"
@@ -339,7 +338,7 @@ TEST_F(DaemonLayerTest, NotificationMakesTheMachineWhenThereIsNone) {
   NotificationListener().HandleMessage(unused, nullptr, 0,
                                        *parser.getDocument()->getDocumentElement());
   EXPECT_NE(nullptr, dbmerger::StateMachine::instance);
-  EXPECT_EQ(SHARES_LOCATOR, Locator());
+  EXPECT_EQ(SHARES_LOCATOR, Appliance::Locator());
   EXPECT_THAT(Logged(), ElementsAre(Info("Default:: Volumeunplugged, ignoring! ")));
 }
 

@@ -64,7 +64,7 @@ TEST_F(StateMachineTest, StartsInDefaultStateSilently) {
 
 TEST_F(StateMachineTest, StartPointsTheLocatorAtTheSharesRoot) {
   const StateMachine machine;
-  EXPECT_EQ("zophotos_db_path=/shares//.zophotos/zophotos.db\n", Locator());
+  EXPECT_EQ("zophotos_db_path=/shares//.zophotos/zophotos.db\n", Appliance::Locator());
 }
 
 TEST_F(StateMachineTest, StartRegistersTheSharesRoot) {
@@ -118,7 +118,7 @@ TEST_F(StateMachineTest, StartWithoutTheSharesRootGoesOnWithAnEmptyRegistry) {
   EXPECT_THAT(Logged(),
               ElementsAre(Error("There is no filesystem location for the mountpoint /shares")));
   EXPECT_THAT(VolumeInfoManager::Instance().getVolumes(), IsEmpty());
-  EXPECT_EQ(SHARES_LOCATOR, Locator());
+  EXPECT_EQ(SHARES_LOCATOR, Appliance::Locator());
   EXPECT_TRUE(std::filesystem::exists("/tmp/scratch/.zophotos/zophotos.db"));
   EXPECT_FALSE(std::filesystem::exists("/shares"));
 }
@@ -128,7 +128,7 @@ TEST_F(StateMachineTest, UnusableSharesRootLetsNoMachineBeMade) {
   EXPECT_EQ("Invalid DB location : '/shares/.zophotos'",
             Thrown<PhotoDB::Error>([] { StateMachine::Instance(); }).Message());
   EXPECT_EQ(nullptr, StateMachine::instance);
-  EXPECT_EQ("(absent)", Locator());
+  EXPECT_EQ("(absent)", Appliance::Locator());
   EXPECT_EQ(nullptr, VolumeInfoManager::instance);
 }
 
@@ -238,7 +238,7 @@ TEST_F(StateMachineTest, FallbackPreparesTheSharesRootAgain) {
   EXPECT_EQ(State::DEFAULT, machine.getCurrentState()->getStateType());
   EXPECT_THAT(MergedFolders("/shares"), IsEmpty());
   EXPECT_GE(std::stol(MergedRows("/shares", "SELECT mdate FROM Status").at(0)), before);
-  EXPECT_EQ(SHARES_LOCATOR, Locator());
+  EXPECT_EQ(SHARES_LOCATOR, Appliance::Locator());
   ASSERT_EQ(1U, VolumeInfoManager::Instance().getVolumes().size());
   EXPECT_EQ(SHARES_MASTER_TEXT, VolumeInfoManager::Instance().getVolumes()[0].ToString());
   EXPECT_THAT(Logged(), IsEmpty());

@@ -68,10 +68,4 @@ constexpr double LARGE = 150e9;
 constexpr double MIDDLE = 120e9;
 constexpr double SMALL = 1e9;
 
-/// The master's record as text, for a volume that Register made.
-inline std::string MasterText(const std::string& mountPoint, const std::string& capacity) {
-  return "\nMountPoint: " + mountPoint + "\nCapacity: " + capacity +
-         "M\nUsed: 0M\nPhotoDB size: 1\nReadOnly: 0\n";
-}
-
 } // namespace orva::test

@@ -33,30 +33,30 @@ std::string Content(const std::string& path) {
 
 TEST_F(LocatorTest, NamesTheDatabaseOfTheMountPoint) {
   updateLocatorFile("/shares/Vol");
-  EXPECT_EQ("zophotos_db_path=/shares/Vol/.zophotos/zophotos.db\n", Locator());
+  EXPECT_EQ("zophotos_db_path=/shares/Vol/.zophotos/zophotos.db\n", Appliance::Locator());
 }
 
 TEST_F(LocatorTest, TakesTheMountPointAsItStands) {
   updateLocatorFile("/shares/Vol/");
-  EXPECT_EQ("zophotos_db_path=/shares/Vol//.zophotos/zophotos.db\n", Locator());
+  EXPECT_EQ("zophotos_db_path=/shares/Vol//.zophotos/zophotos.db\n", Appliance::Locator());
 }
 
 TEST_F(LocatorTest, EmptyMountPointLeavesTheKeyAlone) {
   updateLocatorFile("");
-  EXPECT_EQ("zophotos_db_path=\n", Locator());
+  EXPECT_EQ("zophotos_db_path=\n", Appliance::Locator());
 }
 
 TEST_F(LocatorTest, ShorterLineReplacesALongerOne) {
   updateLocatorFile("/shares/A rather long name of a volume/");
   updateLocatorFile("/shares/V/");
-  EXPECT_EQ("zophotos_db_path=/shares/V//.zophotos/zophotos.db\n", Locator());
+  EXPECT_EQ("zophotos_db_path=/shares/V//.zophotos/zophotos.db\n", Appliance::Locator());
 }
 
 TEST_F(LocatorTest, FileOfAnotherUserIsWritten) {
   std::ofstream(LOCATOR_PATH) << "theirs";
   ASSERT_EQ(0, chown(LOCATOR_PATH.c_str(), 1, 1));
   updateLocatorFile("/shares/Vol/");
-  EXPECT_EQ("zophotos_db_path=/shares/Vol//.zophotos/zophotos.db\n", Locator());
+  EXPECT_EQ("zophotos_db_path=/shares/Vol//.zophotos/zophotos.db\n", Appliance::Locator());
 }
 
 TEST_F(LocatorTest, LinkInItsPlaceIsLeftAlone) {
