@@ -65,12 +65,12 @@ TEST_F(DBTest, OpenCreatesAnEmptyDatabaseAndRemembersItsPath) {
   EXPECT_THAT(Database(path).Run("SELECT name FROM sqlite_master"), ElementsAre("t"));
 }
 
-TEST_F(DBTest, OpenKeepsWhatIsThere) {
+TEST_F(DBTest, OpenKeepsAnExistingDatabase) {
   Database(path, true).exec("CREATE TABLE t(a); INSERT INTO t VALUES('kept')");
   EXPECT_THAT(TestDB(path).Rows("SELECT a FROM t"), ElementsAre("kept"));
 }
 
-TEST_F(DBTest, NamesThatMeanSomethingElsewhereArePlainFiles) {
+TEST_F(DBTest, NamesThatLookLikeUrisArePlainFiles) {
   for (const std::string name : {"a?mode=ro", "a#b", "a%41", "file:x", ":memory:", "\xff"}) {
     TestDB db("/tmp/db/" + name);
     db.Rows("CREATE TABLE t(a)");
@@ -98,7 +98,7 @@ TEST_F(DBTest, OpenOnAnOpenObjectMayChangeTheFile) {
   EXPECT_THAT(db.Rows("SELECT name FROM sqlite_master"), IsEmpty());
 }
 
-TEST_F(DBTest, OpenTakesItsOwnPathOnceMore) {
+TEST_F(DBTest, OpenAcceptsItsOwnPath) {
   TestDB db(path);
   db.Rows("CREATE TABLE t(a)");
   db.Open(db.GetPath());
@@ -106,7 +106,7 @@ TEST_F(DBTest, OpenTakesItsOwnPathOnceMore) {
   EXPECT_THAT(db.Rows("SELECT name FROM sqlite_master"), ElementsAre("t"));
 }
 
-TEST_F(DBTest, CloseEndsTheConnectionAndIsHarmlessWhenClosed) {
+TEST_F(DBTest, CloseEndsTheConnectionAndMayBeRepeated) {
   TestDB db;
   db.Close();
   db.Open(path);
@@ -129,7 +129,7 @@ int OpenFiles() {
   return count;
 }
 
-TEST_F(DBTest, NoFileStaysOpenBehindAnObject) {
+TEST_F(DBTest, OpenAndDestructionCloseEveryFile) {
   {
     TestDB db(path);
     db.Rows("CREATE TABLE t(a)");
@@ -177,14 +177,14 @@ TEST_F(DBTest, OpenFollowsNoLinkToAFolder) {
   EXPECT_TRUE(fs::is_empty("/tmp/db/folder"));
 }
 
-TEST_F(DBTest, OpenRefusesWhatIsNoRegularFileWithoutWaiting) {
+TEST_F(DBTest, OpenRefusesSpecialFilesWithoutWaiting) {
   ASSERT_EQ(mkfifo("/tmp/db/fifo", 0666), 0);
   EXPECT_THAT(Thrown([] { TestDB("/tmp/db/fifo"); }), HasSubstr("'/tmp/db/fifo'"));
   EXPECT_THROW(TestDB("/tmp/db"), std::string);
   EXPECT_THROW(TestDB("/dev/null"), std::string);
 }
 
-TEST_F(DBTest, AFileThatIsNoDatabaseIsNotOpened) {
+TEST_F(DBTest, OpenRefusesAFileThatIsNotADatabase) {
   std::ofstream(path) << std::string(4096, 'x');
   EXPECT_THAT(Thrown([&] { const TestDB db(path); }),
               HasSubstr("file is not a database (extended code 26)"));
@@ -197,7 +197,7 @@ TEST_F(DBTest, KeepsTheDefaultJournalFullSynchronisationAndNoForeignKeys) {
   EXPECT_THAT(db.Rows("PRAGMA foreign_keys"), ElementsAre("0"));
 }
 
-TEST_F(DBTest, AConnectionWaitsForOthersFromTheBeginning) {
+TEST_F(DBTest, AConnectionWaitsASecondForLocks) {
   EXPECT_THAT(TestDB(path).Rows("PRAGMA busy_timeout"), ElementsAre("1000"));
 }
 

@@ -69,7 +69,7 @@ TEST_F(StatementTest, StepReturnsTheCodeOfAFailureAndThrowsNothing) {
   EXPECT_EQ(Make("INSERT INTO t VALUES(1)").Step(__FILE__, __LINE__), SQLITE_CONSTRAINT);
 }
 
-TEST_F(StatementTest, FetchTellsWhetherARowIsReady) {
+TEST_F(StatementTest, FetchReturnsWhetherARowIsReady) {
   db.Rows("INSERT INTO t VALUES(1)");
   Statement select = Make("SELECT a FROM t");
   EXPECT_TRUE(select.Fetch(__FILE__, __LINE__));
@@ -103,7 +103,7 @@ TEST_F(StatementTest, SqlThatCannotBePreparedIsThrown) {
   EXPECT_THAT(db.Compiled(), IsEmpty());
 }
 
-TEST_F(StatementTest, BindingAParameterThatIsNotThereIsThrown) {
+TEST_F(StatementTest, BindingAMissingParameterIsThrown) {
   Statement select = Make("SELECT ?");
   const std::string expected =
       "Caller.cpp:9: column index out of range (extended code 25) in \"SELECT ?\"";
@@ -135,7 +135,7 @@ TEST_F(StatementTest, ParametersCountFromOneAndColumnsFromZero) {
   EXPECT_EQ(select.GetTime(3), 1L << 33);
 }
 
-TEST_F(StatementTest, TheLimitsOfIntegersPass) {
+TEST_F(StatementTest, TheLimitsOfIntegersAreKept) {
   Statement select = Make("SELECT ?, ?, ?, ?");
   select.BindInt(1, std::numeric_limits<int>::min(), __FILE__, __LINE__);
   select.BindInt64(2, std::numeric_limits<long long>::min(), __FILE__, __LINE__);
@@ -180,7 +180,7 @@ TEST_F(StatementTest, TimesAndIntegersAreStoredAsIntegersAndTextsAsTexts) {
   EXPECT_EQ(select.GetText(3), "text");
 }
 
-TEST_F(StatementTest, TextsAreBoundWhole) {
+TEST_F(StatementTest, TextsAreBoundWithTheirNulBytes) {
   const std::string zeros("a\0b\0", 4);
   {
     Statement insert = Make("INSERT INTO t VALUES(?)");
@@ -214,7 +214,7 @@ TEST_F(StatementTest, AnEmptyTextIsATextAndNullReadsAsEmpty) {
   EXPECT_EQ(select.GetTime(2), 0);
 }
 
-TEST_F(StatementTest, BytesThatAreNoUtf8PassAsTheyAre) {
+TEST_F(StatementTest, InvalidUtf8IsKept) {
   Statement select = Make("SELECT ?");
   select.BindText(1, "\xff\xc3/\x80", __FILE__, __LINE__);
   ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
@@ -239,7 +239,7 @@ TEST_F(StatementTest, TheSameTextIsCompiledOnce) {
   EXPECT_THAT(db.Rows("SELECT count(*) FROM t"), ElementsAre("5"));
 }
 
-TEST_F(StatementTest, ATextInUseIsCompiledAnew) {
+TEST_F(StatementTest, ATextInUseIsCompiledAgain) {
   db.Rows("INSERT INTO t VALUES(1), (2)");
   {
     Statement outer = Make("SELECT a FROM t ORDER BY a");
@@ -315,7 +315,7 @@ TEST_F(StatementTest, KeptStatementsFollowTheSchema) {
   EXPECT_EQ(select.GetInt(1), 7);
 }
 
-TEST_F(StatementTest, KeptStatementsDoNotHinderDroppingTheirTable) {
+TEST_F(StatementTest, KeptStatementsDoNotPreventDroppingTheirTable) {
   Execute("SELECT * FROM t");
   Execute("DROP TABLE t");
   // Compiled again for the new schema, which has no such table: the step fails.
@@ -323,7 +323,7 @@ TEST_F(StatementTest, KeptStatementsDoNotHinderDroppingTheirTable) {
   EXPECT_EQ(select.Step(__FILE__, __LINE__), SQLITE_ERROR);
 }
 
-TEST_F(StatementTest, KeptStatementsDoNotHinderVacuum) {
+TEST_F(StatementTest, KeptStatementsDoNotPreventVacuum) {
   db.Rows("INSERT INTO t VALUES(1), (2)");
   {
     Statement select = Make("SELECT a FROM t");

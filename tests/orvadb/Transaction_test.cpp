@@ -32,7 +32,7 @@ using testing::HasSubstr;
 using testing::IsEmpty;
 using testing::StartsWith;
 
-/// A database with a table of one column of different values, and another program beside it.
+/// A database with a table of one unique column.
 class TransactionTest : public testing::Test {
 protected:
   TransactionTest() {
@@ -58,7 +58,7 @@ protected:
   TestDB db;
 };
 
-TEST_F(TransactionTest, CommitMakesTheChangesLasting) {
+TEST_F(TransactionTest, CommitSavesTheChanges) {
   Transaction transaction(db, 0, __FILE__, __LINE__);
   Execute("INSERT INTO t VALUES(1)");
   EXPECT_THAT(Saved(), IsEmpty());
@@ -66,7 +66,7 @@ TEST_F(TransactionTest, CommitMakesTheChangesLasting) {
   EXPECT_THAT(Saved(), ElementsAre("1"));
 }
 
-TEST_F(TransactionTest, WhatIsNotCommittedIsRolledBack) {
+TEST_F(TransactionTest, ChangesAreRolledBackWithoutACommit) {
   {
     const Transaction transaction(db, 0, __FILE__, __LINE__);
     Execute("INSERT INTO t VALUES(1)");
@@ -120,7 +120,7 @@ TEST_F(TransactionTest, TransactionsFollowEachOther) {
   EXPECT_THAT(Saved(), ElementsAre("1", "2"));
 }
 
-TEST_F(TransactionTest, KeepsOtherWritersOutFromTheBeginning) {
+TEST_F(TransactionTest, PreventsOtherWritersFromTheBeginning) {
   SQLite::Database other(path, SQLite::OPEN_READWRITE);
   {
     const Transaction transaction(db, 0, __FILE__, __LINE__);
@@ -130,14 +130,14 @@ TEST_F(TransactionTest, KeepsOtherWritersOutFromTheBeginning) {
   EXPECT_EQ(other.tryExec("BEGIN IMMEDIATE"), SQLITE_OK);
 }
 
-TEST_F(TransactionTest, WhereAnotherWritesItFailsWithTheCallersPlace) {
+TEST_F(TransactionTest, FailsWithTheCallersPlaceWhileAnotherWrites) {
   SQLite::Database other(path, SQLite::OPEN_READWRITE);
   other.exec("BEGIN IMMEDIATE");
   EXPECT_EQ(Thrown([&] { Transaction(db, 0, "Caller.cpp", 21); }),
             "Caller.cpp:21: database is locked (extended code 5) in \"BEGIN IMMEDIATE\"");
 }
 
-TEST_F(TransactionTest, OnAClosedDatabaseItFails) {
+TEST_F(TransactionTest, FailsOnAClosedDatabase) {
   db.Close();
   EXPECT_THAT(Thrown([&] { Transaction(db, 0, "Caller.cpp", 21); }), StartsWith("Caller.cpp:21: "));
 }
@@ -203,7 +203,7 @@ TEST_F(TransactionTest, AFailedBeginningRestoresTheBusyTimeOut) {
   EXPECT_THAT(db.Rows("PRAGMA busy_timeout"), ElementsAre("1000"));
 }
 
-// Failures inside.
+// Failures in a transaction.
 
 TEST_F(TransactionTest, AFailedStepMakesTheCommitFail) {
   std::string message;
@@ -234,7 +234,7 @@ TEST_F(TransactionTest, TheFirstFailedStepIsTheOneReported) {
               HasSubstr("INSERT INTO t VALUES(1)"));
 }
 
-TEST_F(TransactionTest, StepsThatEndWithARowOrTheEndAreNoFailures) {
+TEST_F(TransactionTest, StepsThatReturnARowOrTheEndAreNotFailures) {
   Execute("INSERT INTO t VALUES(1)");
   Transaction transaction(db, 0, __FILE__, __LINE__);
   EXPECT_EQ(Step("SELECT a FROM t"), Statement::ROW);
@@ -250,7 +250,7 @@ TEST_F(TransactionTest, AStepThatFailedBeforeItBeganDoesNotCount) {
   EXPECT_NO_THROW(transaction.Commit(__FILE__, __LINE__));
 }
 
-TEST_F(TransactionTest, AStepThatFailedInTheLastOneDoesNotCount) {
+TEST_F(TransactionTest, AStepThatFailedInThePreviousTransactionDoesNotCount) {
   Execute("INSERT INTO t VALUES(1)");
   {
     const Transaction transaction(db, 0, __FILE__, __LINE__);
@@ -261,7 +261,7 @@ TEST_F(TransactionTest, AStepThatFailedInTheLastOneDoesNotCount) {
   EXPECT_NO_THROW(transaction.Commit(__FILE__, __LINE__));
 }
 
-TEST_F(TransactionTest, ACommitThatReadersHinderFailsAndChangesNothing) {
+TEST_F(TransactionTest, ACommitThatReadersPreventFailsAndChangesNothing) {
   Execute("INSERT INTO t VALUES(1)");
   SQLite::Database other(path, SQLite::OPEN_READWRITE);
   other.exec("BEGIN; SELECT * FROM t");
@@ -291,7 +291,7 @@ TEST_F(TransactionTest, NothingIsWrittenAfterSqliteHasRolledBackByItself) {
   EXPECT_THAT(Saved(), ElementsAre("1", "3"));
 }
 
-TEST_F(TransactionTest, WhereSqliteHasRolledBackByItselfTheEndIsHarmless) {
+TEST_F(TransactionTest, EndsNormallyAfterSqliteHasRolledBackByItself) {
   Execute("INSERT INTO t VALUES(1)");
   {
     Transaction transaction(db, 70, __FILE__, __LINE__);
@@ -303,7 +303,7 @@ TEST_F(TransactionTest, WhereSqliteHasRolledBackByItselfTheEndIsHarmless) {
   EXPECT_THAT(db.Rows("PRAGMA busy_timeout"), ElementsAre("1000"));
 }
 
-// Where the connection can only read.
+// Read-only connections.
 
 class ReadOnlyTransactionTest : public TransactionTest {
 protected:
@@ -321,13 +321,13 @@ protected:
   TestDB reader;
 };
 
-TEST_F(ReadOnlyTransactionTest, KeepsNobodyFromWriting) {
+TEST_F(ReadOnlyTransactionTest, DoesNotPreventWriting) {
   SQLite::Database other(path, SQLite::OPEN_READWRITE);
   const Transaction transaction(reader, 0, __FILE__, __LINE__);
   EXPECT_EQ(other.tryExec("INSERT INTO t VALUES(1)"), SQLITE_OK) << "nothing was read yet";
 }
 
-TEST_F(ReadOnlyTransactionTest, SeesTheSameToTheEndWhileAnotherWrites) {
+TEST_F(ReadOnlyTransactionTest, SeesOneStateWhileAnotherWrites) {
   SQLite::Database other(path, SQLite::OPEN_READWRITE);
   other.exec("PRAGMA journal_mode = WAL; INSERT INTO t VALUES(1)");
   {
@@ -341,7 +341,7 @@ TEST_F(ReadOnlyTransactionTest, SeesTheSameToTheEndWhileAnotherWrites) {
   EXPECT_THAT(Read(), ElementsAre("1", "2"));
 }
 
-TEST_F(ReadOnlyTransactionTest, KeepsARollbackJournalFromChangingTheFileUnderIt) {
+TEST_F(ReadOnlyTransactionTest, PreventsAWriterWithARollbackJournal) {
   Execute("INSERT INTO t VALUES(1)");
   SQLite::Database other(path, SQLite::OPEN_READWRITE);
   {

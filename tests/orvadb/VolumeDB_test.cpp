@@ -31,7 +31,7 @@ using testing::ElementsAre;
 using testing::HasSubstr;
 using testing::IsEmpty;
 
-/// A catalog whose connection a test may look at.
+/// A catalog with rows as texts.
 class Catalog : public VolumeDB {
 public:
   using VolumeDB::Handle;
@@ -117,13 +117,13 @@ TEST_F(VolumeDBTest, ThePrefixIsTheMountPointAsItWasGiven) {
   EXPECT_EQ(db.GetPath(), catalog);
 }
 
-TEST_F(VolumeDBTest, ForReadingItNeverCreates) {
+TEST_F(VolumeDBTest, OpeningForReadingCreatesNothing) {
   EXPECT_THAT(Thrown([&] { Catalog(volume, false); }),
               AllOf(HasSubstr("unable to open database file"), HasSubstr(catalog)));
   EXPECT_TRUE(fs::is_empty(home));
 }
 
-TEST_F(VolumeDBTest, ForReadingItNeverWrites) {
+TEST_F(VolumeDBTest, OpeningForReadingWritesNothing) {
   WriteCatalog(catalog);
   const Catalog db(volume, false);
   EXPECT_THAT(Thrown([&] { db.Rows("DELETE FROM t"); }),
@@ -131,7 +131,7 @@ TEST_F(VolumeDBTest, ForReadingItNeverWrites) {
   EXPECT_THAT(FilesIn(home), ElementsAre("orva.db"));
 }
 
-TEST_F(VolumeDBTest, ForWritingItCreatesTheFileButNotItsFolder) {
+TEST_F(VolumeDBTest, OpeningForWritingCreatesTheFileButNotItsFolder) {
   {
     const Catalog db(volume, true);
     db.Rows("CREATE TABLE t(a)");
@@ -148,7 +148,7 @@ TEST_F(VolumeDBTest, ACatalogThatIsBeingWrittenIsWaitedFor) {
   EXPECT_THAT(Catalog(volume, true).Rows("PRAGMA busy_timeout"), ElementsAre("5000"));
 }
 
-TEST_F(VolumeDBTest, AVolumeThatIsNotThereIsAnError) {
+TEST_F(VolumeDBTest, AMissingVolumeIsAnError) {
   EXPECT_THAT(Thrown([] { Catalog("/shares/None/", false); }), HasSubstr("'/shares/None/'"));
   EXPECT_THROW(Catalog("/shares/None", true), std::string);
   EXPECT_THROW(Catalog("", false), std::string);
@@ -165,7 +165,7 @@ TEST_F(VolumeDBTest, AMountPointMayBeALink) {
   EXPECT_EQ(db.GetPrefix(), "/shares/Link/");
 }
 
-TEST_F(VolumeDBTest, BelowTheMountPointNoLinkIsFollowed) {
+TEST_F(VolumeDBTest, LinksBelowTheMountPointAreNotFollowed) {
   WriteCatalog("/tmp/elsewhere.db");
   fs::create_symlink("/tmp/elsewhere.db", catalog);
   EXPECT_THROW(Catalog(volume, false), std::string);
@@ -178,7 +178,7 @@ TEST_F(VolumeDBTest, BelowTheMountPointNoLinkIsFollowed) {
   EXPECT_THROW(Catalog(volume, false), std::string);
 }
 
-TEST_F(VolumeDBTest, WhatIsNoRegularFileIsRefusedWithoutWaiting) {
+TEST_F(VolumeDBTest, SpecialFilesAreRefusedWithoutWaiting) {
   ASSERT_EQ(mkfifo(catalog.c_str(), 0666), 0);
   EXPECT_THROW(Catalog(volume, false), std::string);
   EXPECT_THROW(Catalog(volume, true), std::string);
@@ -204,7 +204,7 @@ TEST_F(VolumeDBTest, ALogOfARunningWriterIsReadWithTheCatalog) {
               ElementsAre("kept", "logged", "later"));
 }
 
-// Read-only file systems, by the name of the volume.
+// Read-only file systems, with volumes of different names.
 
 class ReadOnlyVolumeTest : public testing::TestWithParam<std::string> {
 protected:
@@ -265,7 +265,7 @@ TEST_P(ReadOnlyVolumeTest, AnAbsentCatalogIsAnError) {
   EXPECT_THROW(Catalog(point, true), std::string);
 }
 
-TEST_P(ReadOnlyVolumeTest, AWritableVolumeOfThatNameIsReadAndWritten) {
+TEST_P(ReadOnlyVolumeTest, AWritableVolumeIsReadAndWritten) {
   WriteCatalog("WAL");
   EXPECT_THAT(Catalog(point, false).Rows("SELECT a FROM t"), ElementsAre("kept"));
   Catalog(point, true).Rows("INSERT INTO t VALUES('more')");

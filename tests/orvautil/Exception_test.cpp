@@ -13,7 +13,7 @@ TEST(Exception, IsCaughtAsAStandardExceptionWithItsMessage) {
   }
 }
 
-TEST(Exception, NamesThePlaceThatThrew) {
+TEST(Exception, NamesTheSourceLineThatThrew) {
   const Exception exception("the message", "Place.cpp", 42);
   EXPECT_STREQ(exception.File(), "Place.cpp");
   EXPECT_EQ(exception.Line(), 42U);

@@ -46,7 +46,7 @@ std::vector<std::string> Paths(const util::OwnerVector<Item>& items) {
   return paths;
 }
 
-TEST_F(CatalogReaderTest, EmptyCatalogYieldsTheRootAlone) {
+TEST_F(CatalogReaderTest, EmptyCatalogHasOnlyTheRoot) {
   const auto folders = ReadFolders();
   ASSERT_EQ(1U, folders.size());
   const db::Folder& root = *folders.front();
@@ -115,7 +115,7 @@ TEST_F(CatalogReaderTest, DeletedFoldersAreRead) {
   EXPECT_THAT(Paths(ReadFolders()), ElementsAre("/shares/Vol/", "/shares/Vol/deleted/"));
 }
 
-TEST_F(CatalogReaderTest, FolderComesBeforeAllThatItHolds) {
+TEST_F(CatalogReaderTest, FolderComesBeforeItsContent) {
   catalog.AddFolder("b/c/d/");
   catalog.AddFolder("b/c/");
   catalog.AddFolder("\xC3\xA9/");
@@ -139,7 +139,7 @@ TEST_F(CatalogReaderTest, FurtherColumnsOfAFolderAreIgnored) {
   EXPECT_EQ(0, folders[1]->fileCount);
 }
 
-TEST_F(CatalogReaderTest, FolderTimesAre32BitsWithTheirSign) {
+TEST_F(CatalogReaderTest, FolderTimesAreSigned32BitNumbers) {
   catalog.Add(FolderRow{
       .path = "a/", .lastModifiedDate = MORE_THAN_32_BITS, .lastUpdatedDate = 2147483648});
   const auto folders = ReadFolders();
@@ -182,7 +182,7 @@ TEST_F(CatalogReaderTest, EveryColumnOfAFileIsRead) {
   EXPECT_EQ(6'000'000'000, file.size);
 }
 
-TEST_F(CatalogReaderTest, FileTimesAre32BitsWithTheirSign) {
+TEST_F(CatalogReaderTest, FileTimesAreSigned32BitNumbers) {
   catalog.AddPhoto("a", MORE_THAN_32_BITS, 2147483648);
   const auto files = ReadChangedFiles(0);
   ASSERT_EQ(1U, files.size());
@@ -210,7 +210,7 @@ TEST_F(CatalogReaderTest, TimeOfAReadIsComparedIn64Bits) {
   EXPECT_THAT(Paths(ReadChangedFiles(5'000'000'000)), ElementsAre("/shares/Vol/b"));
 }
 
-TEST_F(CatalogReaderTest, OnlyTheFixedProfileCounts) {
+TEST_F(CatalogReaderTest, OnlyTranscodingsOfTheProfileAreRead) {
   catalog.AddPhoto("a", 0, 10);
   catalog.Add(FileRow{.id = 2, .path = "b"});
   catalog.Add(TranscodingRow{
@@ -219,7 +219,7 @@ TEST_F(CatalogReaderTest, OnlyTheFixedProfileCounts) {
   EXPECT_THAT(Paths(ReadChangedFiles(0)), ElementsAre("/shares/Vol/a"));
 }
 
-TEST_F(CatalogReaderTest, FinishedOnesOfPresentFilesAndWithdrawnOnesOfDeletedFilesAreRead) {
+TEST_F(CatalogReaderTest, FinishedTranscodingsOfPresentFilesAndWithdrawnOnesOfDeletedFilesAreRead) {
   for (const bool deleted : {false, true}) {
     for (const long status : {-1, 0, 1, 2, 3}) {
       const long id = 10 * static_cast<long>(deleted) + status + 2;
@@ -234,7 +234,7 @@ TEST_F(CatalogReaderTest, FinishedOnesOfPresentFilesAndWithdrawnOnesOfDeletedFil
   EXPECT_FALSE(files[1]->isDeleted);
 }
 
-TEST_F(CatalogReaderTest, FlagsAndCategoryDoNotKeepAFileBack) {
+TEST_F(CatalogReaderTest, FilesOfAnyFlagsAndCategoryAreRead) {
   catalog.Add(FileRow{.id = 1, .path = "backup", .isBackup = true});
   catalog.Add(FileRow{.id = 2, .path = "hidden", .isHidden = true});
   catalog.Add(FileRow{.id = 3, .path = "song", .category = 1});
@@ -246,7 +246,7 @@ TEST_F(CatalogReaderTest, FlagsAndCategoryDoNotKeepAFileBack) {
                                                       "/shares/Vol/song", "/shares/Vol/system"));
 }
 
-TEST_F(CatalogReaderTest, FileComesOncePerTranscoding) {
+TEST_F(CatalogReaderTest, FileIsReadOncePerTranscoding) {
   catalog.AddPhoto("a", 0, 10);
   catalog.Add(TranscodingRow{.sourceId = 1, .lastUpdatedDate = 20});
   EXPECT_THAT(Paths(ReadChangedFiles(0)), ElementsAre("/shares/Vol/a", "/shares/Vol/a"));
@@ -309,7 +309,7 @@ TEST_F(CatalogReaderTest, MissingTableIsThrown) {
   EXPECT_THROW(Count(), std::string);
 }
 
-TEST_F(CatalogReaderTest, BrokenRowEndsTheListAndItsTransaction) {
+TEST_F(CatalogReaderTest, UnreadableRowEndsTheListAndFailsItsTransaction) {
   catalog.AddFolder("a/");
   catalog.AddFolder("b/");
   catalog.AddFolder("c/");
@@ -332,7 +332,7 @@ TEST(FolderItemCmp, PathComesBeforeAllLongerPathsThatBeginWithIt) {
   EXPECT_FALSE(before(&shorter, &shorter));
 }
 
-TEST(FolderItemCmp, BytesAreUnsigned) {
+TEST(FolderItemCmp, BytesAreComparedAsUnsigned) {
   const dbmerger::FolderItemCmp<db::FolderItem> before;
   db::Folder ascii;
   db::Folder accented;

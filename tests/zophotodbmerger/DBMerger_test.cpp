@@ -23,7 +23,7 @@ using ::testing::IsEmpty;
 const std::string MASTER = "/shares/Master/";
 const std::string VOLUME = "/shares/Vol/";
 
-/// A value that is longer than any that is read: a row that has it cannot be.
+/// A value that is too long to be read, so that its row cannot be read either.
 const std::string UNREADABLE = "zeroblob(20000000)";
 
 class DBMergerTest : public DaemonLayerTest {
@@ -56,14 +56,14 @@ protected:
     catalog.AddPhoto("a/b/two.jpg", 23, 200);
   }
 
-  /// The one line of a merge that was given up, without its beginning.
+  /// The only error in the log: that of a failed merge, without its beginning.
   std::string FailureOfTheMerge() {
     const std::string beginning = "Error that we will ignore ";
     Log lines = Logged();
     std::erase_if(lines, [](const LogLine& line) { return line.priority == Info("").priority; });
     if (lines.size() != 1 || lines[0].priority != Error("").priority ||
         !lines[0].text.starts_with(beginning) || !lines[0].text.ends_with('\n')) {
-      throw std::logic_error("not the one line of a failed merge: " +
+      throw std::logic_error("not the only error of a failed merge: " +
                              ::testing::PrintToString(lines));
     }
     return lines[0].text.substr(beginning.size());
@@ -97,14 +97,14 @@ TEST_F(DaemonLayerTest, MergerLogsTheRegisteredMountPoints) {
                                                 Info("Iterating over mount point /shares/c/\n")));
 }
 
-TEST_F(DaemonLayerTest, MergerWithoutVolumesEndsSilentlyAndMakesTheRegistry) {
+TEST_F(DaemonLayerTest, MergerWithoutVolumesEndsSilentlyAndCreatesTheRegistry) {
   DBMerger merger;
   EXPECT_NE(nullptr, VolumeInfoManager::instance);
   merger.Wait();
   EXPECT_THAT(LoggedByAllThreads(), IsEmpty());
 }
 
-TEST_F(DaemonLayerTest, MergerHasItsCopyOfTheRegistryWhenItIsMade) {
+TEST_F(DaemonLayerTest, MergerCopiesTheRegistryWhenItIsCreated) {
   VolumeInfo volume{.mountPoint = MakeDirectory("/shares/a/")};
   VolumeInfoManager::Instance().addVolumeInfo(volume);
   DBMerger merger;
@@ -115,7 +115,7 @@ TEST_F(DaemonLayerTest, MergerHasItsCopyOfTheRegistryWhenItIsMade) {
 
 // Merges.
 
-TEST_F(DBMergerTest, FirstMergeBringsEverything) {
+TEST_F(DBMergerTest, FirstMergeAddsEverything) {
   AddPhotos();
   EXPECT_EQ(Adding("/shares/Vol/a/b/two.jpg") + Adding("/shares/Vol/a/one.jpg") +
                 Adding("/shares/Vol/top.jpg"),
@@ -163,7 +163,7 @@ TEST_F(DBMergerTest, UnchangedMergeRefreshesTheCountsOnly) {
               ElementsAre("1"));
 }
 
-TEST_F(DBMergerTest, DeletedFileIsRemovedAndMovesTheTime) {
+TEST_F(DBMergerTest, DeletedFileIsRemovedAndAdvancesTheTime) {
   AddPhotos();
   Merge();
   catalog.DeletePhoto("a/one.jpg", 400);
@@ -175,7 +175,7 @@ TEST_F(DBMergerTest, DeletedFileIsRemovedAndMovesTheTime) {
   EXPECT_THAT(MergedStatistics(MASTER), ElementsAre("/shares/Vol/|2|2|400"));
 }
 
-TEST_F(DBMergerTest, DeletedFileThatWasNeverMergedMovesTheTimeAsWell) {
+TEST_F(DBMergerTest, DeletedFileThatWasNeverMergedAdvancesTheTime) {
   AddPhotos();
   catalog.DeletePhoto("a/one.jpg", 400);
   Merge();
@@ -183,7 +183,7 @@ TEST_F(DBMergerTest, DeletedFileThatWasNeverMergedMovesTheTimeAsWell) {
   EXPECT_THAT(MergedStatistics(MASTER), ElementsAre("/shares/Vol/|2|2|400"));
 }
 
-TEST_F(DBMergerTest, DeletedFolderGoesWithItsFiles) {
+TEST_F(DBMergerTest, DeletedFolderIsRemovedWithItsFiles) {
   AddPhotos();
   Merge();
   catalog.DeleteFolder("a/b/");
@@ -211,7 +211,7 @@ TEST_F(DBMergerTest, HiddenAndBackupFilesAreMerged) {
   EXPECT_THAT(MergedStatistics(MASTER), ElementsAre("/shares/Vol/|0|0|20"));
 }
 
-TEST_F(DBMergerTest, FilesOfInvisibleFoldersAreLeftOutButMoveTheTime) {
+TEST_F(DBMergerTest, FilesOfInvisibleFoldersAreLeftOutButAdvanceTheTime) {
   catalog.AddFolder("hidden/", 0, {.hidden = true});
   catalog.AddPhoto("hidden/a.jpg", 0, 10);
   EXPECT_EQ(Adding("/shares/Vol/hidden/a.jpg"), Merge());
@@ -235,7 +235,7 @@ TEST_F(DBMergerTest, TimeNeverMovesBackwards) {
   EXPECT_THAT(MergedStatistics(MASTER), ElementsAre("/shares/Vol/|1|1|0"));
 }
 
-TEST_F(DBMergerTest, MergeLeavesTheTimeOfTheStatusAsItWas) {
+TEST_F(DBMergerTest, MergeDoesNotChangeTheTimeOfTheStatus) {
   AddPhotos();
   Merge();
   MergedRows(MASTER, "UPDATE Status SET mdate = 4242, desc = 'text'");
@@ -244,7 +244,7 @@ TEST_F(DBMergerTest, MergeLeavesTheTimeOfTheStatusAsItWas) {
   EXPECT_THAT(MergedRows(MASTER, "SELECT * FROM Status"), ElementsAre("1|2.0|4242|text|0"));
 }
 
-TEST_F(DBMergerTest, VolumesAreMergedSideBySide) {
+TEST_F(DBMergerTest, SeveralVolumesAreMerged) {
   AddPhotos();
   Merge();
   Catalog other("/shares/Other/");
@@ -256,7 +256,7 @@ TEST_F(DBMergerTest, VolumesAreMergedSideBySide) {
               ElementsAre("/shares/Other/|1|1|50", "/shares/Vol/|3|3|300"));
 }
 
-TEST_F(DBMergerTest, CatalogIsLeftAsItIs) {
+TEST_F(DBMergerTest, CatalogIsNotChanged) {
   AddPhotos();
   const auto before = catalog.Rows().Run("PRAGMA data_version");
   Merge();
@@ -272,10 +272,10 @@ TEST_F(DBMergerTest, StoppedMergeCommitsTheCountsAndAnUnchangedTime) {
   EXPECT_THAT(MergedFolders(MASTER), IsEmpty());
   EXPECT_THAT(MergedFiles(MASTER), IsEmpty());
   EXPECT_THAT(MergedStatistics(MASTER), ElementsAre("/shares/Vol/|3|3|0"));
-  EXPECT_TRUE(merger.stopRequested) << "it is never cleared";
+  EXPECT_TRUE(merger.stopRequested) << "the merger does not clear it";
 }
 
-// Volumes anew and away.
+// Re-merges and removals.
 
 TEST_F(DBMergerTest, ReMergeStartsFromTheBeginning) {
   AddPhotos();
@@ -309,14 +309,14 @@ TEST_F(DBMergerTest, FailedReMergeLeavesTheVolumeEmptyAndItsTimeZero) {
   EXPECT_THAT(MergedStatistics(MASTER), ElementsAre("/shares/Vol/|3|3|0"));
 }
 
-TEST_F(DBMergerTest, FailedDeletionOfAReMergePasses) {
+TEST_F(DBMergerTest, FailedDeletionInAReMergeIsThrown) {
   AddPhotos();
   Merge();
   MergedRows(MASTER, "DROP TABLE Statistics");
   EXPECT_THROW(ReMerge(), std::string);
 }
 
-TEST_F(DBMergerTest, RemovedVolumeLeavesItsCounts) {
+TEST_F(DBMergerTest, RemovedVolumeKeepsItsCounts) {
   AddPhotos();
   Merge();
   Logged();
@@ -327,7 +327,7 @@ TEST_F(DBMergerTest, RemovedVolumeLeavesItsCounts) {
   EXPECT_THAT(Logged(), IsEmpty());
 }
 
-TEST_F(DBMergerTest, RemovalFromTheEmptyVolumeTouchesNoVolume) {
+TEST_F(DBMergerTest, RemovalWithoutAMasterChangesNoVolume) {
   AddPhotos();
   Merge();
   Logged();
@@ -338,7 +338,7 @@ TEST_F(DBMergerTest, RemovalFromTheEmptyVolumeTouchesNoVolume) {
   EXPECT_THAT(Logged(), IsEmpty());
 }
 
-TEST_F(DBMergerTest, FailedRemovalPasses) {
+TEST_F(DBMergerTest, FailedRemovalIsThrown) {
   PhotoDB(MASTER).Init();
   MergedRows(MASTER, "DROP TABLE Files");
   EXPECT_THROW(merger.RemoveVolume(MASTER, VOLUME), std::string);
@@ -346,7 +346,7 @@ TEST_F(DBMergerTest, FailedRemovalPasses) {
 
 // Failures.
 
-/// A merge that the merged database refuses in the middle, in each of SQLite's ways.
+/// A merge in which an insertion fails, with each of SQLite's ways to resolve a conflict.
 class RefusedMergeTest : public DBMergerTest, public ::testing::WithParamInterface<const char*> {};
 
 TEST_P(RefusedMergeTest, LeavesEverythingAsBefore) {
@@ -464,7 +464,7 @@ TEST_F(DBMergerTest, CatalogThatStaysLockedFailsTheMerge) {
   EXPECT_EQ(before, MergedContent(MASTER));
 }
 
-/// True when somebody is changing the merged database.
+/// True while another connection changes the merged database.
 bool IsBeingMerged(const Database& merged) {
   try {
     merged.Run("BEGIN IMMEDIATE");
@@ -488,7 +488,7 @@ std::thread CommitDuringTheMerge(const Catalog& catalog) {
   });
 }
 
-TEST_F(DBMergerTest, CatalogThatIsJustWrittenIsWaitedFor) {
+TEST_F(DBMergerTest, CatalogThatIsBeingWrittenIsWaitedFor) {
   AddPhotos();
   PhotoDB(MASTER).Init();
   catalog.Rows().Run("BEGIN EXCLUSIVE");
@@ -500,7 +500,7 @@ TEST_F(DBMergerTest, CatalogThatIsJustWrittenIsWaitedFor) {
   EXPECT_EQ(4U, MergedFiles(MASTER).size());
 }
 
-TEST_F(DBMergerTest, CatalogThatGrowsWhileItIsWaitedForIsReadWhole) {
+TEST_F(DBMergerTest, CatalogThatGrowsWhileItIsWaitedForIsReadCompletely) {
   AddPhotos();
   PhotoDB(MASTER).Init();
   catalog.Rows().Run("BEGIN EXCLUSIVE");
@@ -514,7 +514,7 @@ TEST_F(DBMergerTest, CatalogThatGrowsWhileItIsWaitedForIsReadWhole) {
   EXPECT_EQ(10'003U, MergedFiles(MASTER).size());
 }
 
-TEST_F(DBMergerTest, ReaderOfTheMergedDatabaseIsNoObstacleToTheNextMerge) {
+TEST_F(DBMergerTest, ReaderOfTheMergedDatabaseDoesNotPreventTheNextMerge) {
   AddPhotos();
   Merge();
   Logged();
@@ -526,7 +526,7 @@ TEST_F(DBMergerTest, ReaderOfTheMergedDatabaseIsNoObstacleToTheNextMerge) {
   EXPECT_THAT(reader.Run("SELECT count(*) FROM Files"), ElementsAre("4"));
 }
 
-TEST_F(DBMergerTest, UnusableMasterPasses) {
+TEST_F(DBMergerTest, UnusableMasterIsThrown) {
   AddPhotos();
   std::ofstream(MASTER + ".zophotos") << "in the way";
   EXPECT_EQ("Invalid DB location : '/shares/Master/.zophotos'",
@@ -536,7 +536,7 @@ TEST_F(DBMergerTest, UnusableMasterPasses) {
   EXPECT_THAT(Logged(), IsEmpty());
 }
 
-TEST_F(DBMergerTest, MergesGoOnAfterAFailure) {
+TEST_F(DBMergerTest, MergeSucceedsAfterAFailedOne) {
   AddPhotos();
   std::ofstream(MASTER + ".zophotos") << "in the way";
   EXPECT_THROW(Merge(), PhotoDB::Error);

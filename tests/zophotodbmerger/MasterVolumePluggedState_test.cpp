@@ -23,7 +23,7 @@ protected:
     Logged();
   }
 
-  /// Takes the master away, and all that could follow it.
+  /// Removes the master and every volume that could replace it.
   void ForgetEverything() const {
     ForgetSharesRoot();
     Forget("/shares/Vol/");
@@ -48,7 +48,7 @@ TEST_F(MasterVolumePluggedStateTest, PurgedIsIgnored) {
                                          "Volume, so volume purged - ignored ")));
 }
 
-TEST_F(MasterVolumePluggedStateTest, ScannedMovesOn) {
+TEST_F(MasterVolumePluggedStateTest, ScannedMovesToTheScannedState) {
   EXPECT_NE("", Scanned("/shares/Vol/"));
   EXPECT_EQ(State::MASTER_VOLUME_SCANNED, CurrentType());
   EXPECT_THAT(Logged(), ElementsAre(Info("MasterVolumePluggedState:: VolumeScanned "), MOVING,
@@ -58,7 +58,7 @@ TEST_F(MasterVolumePluggedStateTest, ScannedMovesOn) {
   EXPECT_THAT(MergedFolders("/shares/Vol"), IsEmpty());
 }
 
-TEST_F(MasterVolumePluggedStateTest, ScannedWithoutAMasterStays) {
+TEST_F(MasterVolumePluggedStateTest, ScannedWithoutAMasterKeepsTheState) {
   ForgetEverything();
   EXPECT_EQ("", Scanned("/shares/Vol/"));
   EXPECT_EQ(State::MASTER_VOLUME_PLUGGED, CurrentType());
@@ -68,7 +68,7 @@ TEST_F(MasterVolumePluggedStateTest, ScannedWithoutAMasterStays) {
                                "Volume Scanned - ignored ")));
 }
 
-TEST_F(MasterVolumePluggedStateTest, TranscodedMovesOn) {
+TEST_F(MasterVolumePluggedStateTest, TranscodedMovesToTheScannedState) {
   EXPECT_NE("", Transcoded("/shares/Vol/"));
   EXPECT_EQ(State::MASTER_VOLUME_SCANNED, CurrentType());
   EXPECT_THAT(Logged(), ElementsAre(Info("MasterVolumePluggedState:: Transcoded batch "), MOVING,
@@ -76,7 +76,7 @@ TEST_F(MasterVolumePluggedStateTest, TranscodedMovesOn) {
                                          MasterText("/shares/Vol/", LARGE))));
 }
 
-TEST_F(MasterVolumePluggedStateTest, TranscodedWithoutAMasterStays) {
+TEST_F(MasterVolumePluggedStateTest, TranscodedWithoutAMasterKeepsTheState) {
   ForgetEverything();
   EXPECT_EQ("", Transcoded("/shares/Vol/"));
   EXPECT_EQ(State::MASTER_VOLUME_PLUGGED, CurrentType());
@@ -86,7 +86,7 @@ TEST_F(MasterVolumePluggedStateTest, TranscodedWithoutAMasterStays) {
                                "picture transcoded - ignored ")));
 }
 
-TEST_F(MasterVolumePluggedStateTest, UnpluggedOtherVolumeMovesOn) {
+TEST_F(MasterVolumePluggedStateTest, UnpluggedOtherVolumeMovesToTheScannedState) {
   EXPECT_NE("", Unplugged("/shares/Other/"));
   EXPECT_EQ(State::MASTER_VOLUME_SCANNED, CurrentType());
   EXPECT_THAT(Logged(), ElementsAre(Info("MasterVolumePluggedState:: Volumeunplugged "), MOVING,
@@ -95,7 +95,7 @@ TEST_F(MasterVolumePluggedStateTest, UnpluggedOtherVolumeMovesOn) {
   EXPECT_EQ("zophotos_db_path=/shares/Vol//.zophotos/zophotos.db\n", Appliance::Locator());
 }
 
-TEST_F(MasterVolumePluggedStateTest, UnpluggedMasterIsFollowedByAnother) {
+TEST_F(MasterVolumePluggedStateTest, UnpluggedMasterIsReplacedByAnother) {
   Register("/shares/Next/", MIDDLE);
   Forget("/shares/Vol/");
   Unplugged("/shares/Vol/");

@@ -17,7 +17,7 @@ using ::testing::IsEmpty;
 const LogLine UNPLUGGED = Info("MasterVolumeScannedState:: Volumeunplugged ");
 const LogLine MOVING = Info("Moving to the scanned state since we can safely do so ");
 
-/// The working state, with the volume "/shares/Vol/" as the master.
+/// The scanned state, with the volume "/shares/Vol/" as the master.
 class MasterVolumeScannedStateTest : public StatesTest {
 protected:
   MasterVolumeScannedStateTest() {
@@ -44,7 +44,7 @@ TEST_F(MasterVolumeScannedStateTest, HasTypeTwo) {
   EXPECT_EQ(2, CurrentType());
 }
 
-TEST_F(MasterVolumeScannedStateTest, HasCreatedTheDatabaseAndPublishedIt) {
+TEST_F(MasterVolumeScannedStateTest, CreatesTheDatabaseAndPublishesIt) {
   EXPECT_THAT(MergedRows("/shares/Vol", "SELECT mdate FROM Status"), ElementsAre("1000"));
   EXPECT_EQ("zophotos_db_path=/shares/Vol//.zophotos/zophotos.db\n", Appliance::Locator());
 }
@@ -56,7 +56,7 @@ TEST_F(StatesTest, ScannedStateWithoutAMasterNamesTheEmptyVolume) {
   EXPECT_TRUE(std::filesystem::exists("/tmp/scratch/.zophotos/zophotos.db"));
 }
 
-TEST_F(StatesTest, ScannedStateThatCannotBeMadeJoinsItsMerger) {
+TEST_F(StatesTest, ScannedStateWhoseConstructionFailsJoinsItsMerger) {
   std::filesystem::remove_all("/shares/.zophotos");
   std::ofstream("/shares/.zophotos") << "in the way";
   ASSERT_TRUE(Registry().reelectMasterVolume());
@@ -65,7 +65,7 @@ TEST_F(StatesTest, ScannedStateThatCannotBeMadeJoinsItsMerger) {
   EXPECT_EQ(State::DEFAULT, CurrentType());
 }
 
-TEST_F(MasterVolumeScannedStateTest, OpensADatabaseThatIsThere) {
+TEST_F(MasterVolumeScannedStateTest, OpensAnExistingDatabase) {
   MergedRows("/shares/Vol", "INSERT INTO Folders VALUES(2, 1, '/shares/x/', 0, '/shares/x/')");
   { const dbmerger::MasterVolumeScannedState state; }
   EXPECT_THAT(MergedFolders("/shares/Vol"), ElementsAre("/shares/x/|/shares/x/"));
@@ -78,7 +78,7 @@ TEST_F(MasterVolumeScannedStateTest, PluggedIsIgnored) {
   EXPECT_THAT(Logged(), ElementsAre(Info("MasterVolumeScannedState:: VolumePlugged, ignoring! ")));
 }
 
-TEST_F(MasterVolumeScannedStateTest, ScannedDoesNothingAndSaysNothing) {
+TEST_F(MasterVolumeScannedStateTest, ScannedChangesAndLogsNothing) {
   MakeCatalog("/shares/Vol/");
   State* const before = &Current();
   EXPECT_EQ("", Scanned("/shares/Vol/"));
@@ -97,11 +97,11 @@ TEST_F(MasterVolumeScannedStateTest, TranscodedMergesTheVolume) {
   EXPECT_EQ(State::MASTER_VOLUME_SCANNED, CurrentType());
 }
 
-TEST_F(MasterVolumeScannedStateTest, PurgedMergesTheVolumeAnew) {
+TEST_F(MasterVolumeScannedStateTest, PurgedReMergesTheVolume) {
   const Catalog catalog = MakeCatalog("/shares/Other/");
   Transcoded("/shares/Other/");
   Logged();
-  // Only a merge from the beginning notices this one.
+  // Only a re-merge notices this change.
   catalog.Rows().Run("UPDATE Files SET path = 'b.jpg', name = 'b.jpg'");
   Purged("/shares/Other/");
   EXPECT_THAT(MergedFiles("/shares/Vol"), ElementsAre("/shares/Other/b.jpg"));
@@ -135,14 +135,14 @@ TEST_F(MasterVolumeScannedStateTest, UnpluggedOtherVolumeIsRemovedAndTheStateRep
                                          MasterText("/shares/Vol/", LARGE) + " ")));
 }
 
-TEST_F(MasterVolumeScannedStateTest, MergesGoOnAfterAnUnplug) {
+TEST_F(MasterVolumeScannedStateTest, MergesContinueAfterAnUnplug) {
   MakeCatalog("/shares/Vol/");
   Unplugged("/shares/Other/");
   Transcoded("/shares/Vol/");
   EXPECT_THAT(MergedFiles("/shares/Vol"), ElementsAre("/shares/Vol/a.jpg"));
 }
 
-TEST_F(MasterVolumeScannedStateTest, ReplacedStateAppliesNothingAnymore) {
+TEST_F(MasterVolumeScannedStateTest, ReplacedStateMergesNothing) {
   MakeCatalog("/shares/Vol/");
   State& replaced = Current();
   Unplugged("/shares/Other/");
@@ -150,7 +150,7 @@ TEST_F(MasterVolumeScannedStateTest, ReplacedStateAppliesNothingAnymore) {
   EXPECT_THAT(MergedFiles("/shares/Vol"), IsEmpty());
 }
 
-TEST_F(MasterVolumeScannedStateTest, UnpluggedMasterIsFollowedByAnother) {
+TEST_F(MasterVolumeScannedStateTest, UnpluggedMasterIsReplacedByAnother) {
   MakeCatalog("/shares/Vol/");
   Transcoded("/shares/Vol/");
   Register("/shares/Next/", MIDDLE);
@@ -198,7 +198,7 @@ TEST_F(MasterVolumeScannedStateTest, FailedRemovalKeepsTheStateAndItsMerger) {
   EXPECT_THAT(MergedFiles("/shares/Vol"), ElementsAre("/shares/Vol/a.jpg"));
 }
 
-TEST_F(MasterVolumeScannedStateTest, FailureBehindTheRemovalLeavesTheMergerStopped) {
+TEST_F(MasterVolumeScannedStateTest, FailureAfterTheRemovalLeavesTheMergerStopped) {
   MakeCatalog("/shares/Vol/");
   Register("/shares/Next/", MIDDLE);
   std::ofstream("/shares/Next/.zophotos") << "in the way";
@@ -214,7 +214,7 @@ TEST_F(MasterVolumeScannedStateTest, FailureBehindTheRemovalLeavesTheMergerStopp
   EXPECT_THAT(MergedStatistics("/shares/Next"), ElementsAre("/shares/Vol/|1|1|0"));
 }
 
-TEST_F(MasterVolumeScannedStateTest, UnusableMasterPassesFromAMerge) {
+TEST_F(MasterVolumeScannedStateTest, UnusableMasterIsThrownFromAMerge) {
   MakeCatalog("/shares/Vol/");
   std::filesystem::remove_all("/shares/Vol/.zophotos");
   std::ofstream("/shares/Vol/.zophotos") << "in the way";

@@ -28,18 +28,18 @@ protected:
     Registry().addVolumeInfo(volume);
   }
 
-  /// Forgets a volume, as a notification does before the state hears of it.
+  /// Removes a volume from the registry, as a notification does before the state gets the event.
   void Forget(const std::string& mountPoint) const {
     dbmerger::VolumeInfo volume{.mountPoint = mountPoint};
     Registry().removeVolumeInfo(volume);
   }
 
-  /// Leaves nothing in the registry that could be elected.
+  /// Removes the shares root, which could be elected, from the registry.
   void ForgetSharesRoot() const { Forget("/shares"); }
 
   using Handler = void (dbmerger::State::*)(dbmerger::VolumeInfo);
 
-  /// Hands an event to the current state. Returns its standard output.
+  /// Passes an event to the current state. Returns its standard output.
   std::string Handle(Handler handler, const std::string& mountPoint) const {
     return OutputOf([&] { (Current().*handler)(dbmerger::VolumeInfo{.mountPoint = mountPoint}); });
   }
