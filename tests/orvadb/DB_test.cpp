@@ -61,7 +61,7 @@ TEST_F(DBTest, OpenCreatesAnEmptyDatabaseAndRemembersItsPath) {
   const TestDB db(path);
   EXPECT_EQ(db.GetPath(), path);
   EXPECT_TRUE(fs::is_regular_file(path));
-  Statement(db, "CREATE TABLE t(a)", __FILE__, __LINE__).Execute(__FILE__, __LINE__);
+  Statement(db, "CREATE TABLE t(a)").Execute();
   EXPECT_THAT(Database(path).Run("SELECT name FROM sqlite_master"), ElementsAre("t"));
 }
 
@@ -81,13 +81,13 @@ TEST_F(DBTest, NamesThatLookLikeUrisArePlainFiles) {
 TEST_F(DBTest, OpenOnAnOpenObjectGivesAFreshConnectionOnTheNewFile) {
   TestDB db(path);
   db.Rows("CREATE TABLE t(a)");
-  Statement(db, "INSERT INTO t VALUES(1)", __FILE__, __LINE__).Execute(__FILE__, __LINE__);
+  Statement(db, "INSERT INTO t VALUES(1)").Execute();
   fs::remove(path);
   db.Open(path);
   EXPECT_THAT(db.Rows("SELECT name FROM sqlite_master"), IsEmpty());
   EXPECT_THAT(db.Compiled(), IsEmpty());
   EXPECT_TRUE(fs::exists(path));
-  EXPECT_THROW(Statement(db, "INSERT INTO t VALUES(1)", __FILE__, __LINE__), std::string);
+  EXPECT_THROW(Statement(db, "INSERT INTO t VALUES(1)"), std::string);
 }
 
 TEST_F(DBTest, OpenOnAnOpenObjectMayChangeTheFile) {
@@ -110,7 +110,7 @@ TEST_F(DBTest, CloseEndsTheConnectionAndMayBeRepeated) {
   TestDB db;
   db.Close();
   db.Open(path);
-  Statement(db, "CREATE TABLE t(a)", __FILE__, __LINE__).Execute(__FILE__, __LINE__);
+  Statement(db, "CREATE TABLE t(a)").Execute();
   db.Close();
   EXPECT_EQ(db.Handle(), nullptr);
   EXPECT_EQ(db.GetPath(), "");
@@ -133,7 +133,7 @@ TEST_F(DBTest, OpenAndDestructionCloseEveryFile) {
   {
     TestDB db(path);
     db.Rows("CREATE TABLE t(a)");
-    Statement(db, "SELECT a FROM t", __FILE__, __LINE__).Step(__FILE__, __LINE__);
+    Statement(db, "SELECT a FROM t").Step();
     EXPECT_GT(OpenFiles(), 0);
     db.Open("/tmp/db/other.db");
   }
@@ -209,11 +209,8 @@ TEST_F(DBTest, AReadOnlyConnectionNeverCreatesAndNeverWrites) {
   Database(path, true).exec("CREATE TABLE t(a)");
   db.Open(path, TestDB::Access::ReadOnly, 7, false);
   EXPECT_THAT(db.Rows("PRAGMA busy_timeout"), ElementsAre("7"));
-  EXPECT_THAT(
-      Thrown([&] {
-        Statement(db, "INSERT INTO t VALUES(1)", __FILE__, __LINE__).Execute(__FILE__, __LINE__);
-      }),
-      HasSubstr("attempt to write a readonly database"));
+  EXPECT_THAT(Thrown([&] { Statement(db, "INSERT INTO t VALUES(1)").Execute(); }),
+              HasSubstr("attempt to write a readonly database"));
 }
 
 } // namespace

@@ -42,13 +42,9 @@ protected:
     db.Rows("CREATE TABLE t(a UNIQUE)");
   }
 
-  void Execute(const char* sql) const {
-    Statement(db, sql, __FILE__, __LINE__).Execute(__FILE__, __LINE__);
-  }
+  void Execute(const char* sql) const { Statement(db, sql).Execute(); }
 
-  int Step(const char* sql) const {
-    return Statement(db, sql, __FILE__, __LINE__).Step(__FILE__, __LINE__);
-  }
+  int Step(const char* sql) const { return Statement(db, sql).Step(); }
 
   std::vector<std::string> Saved() const {
     return Database(path).Run("SELECT a FROM t ORDER BY a");
@@ -59,16 +55,16 @@ protected:
 };
 
 TEST_F(TransactionTest, CommitSavesTheChanges) {
-  Transaction transaction(db, 0, __FILE__, __LINE__);
+  Transaction transaction(db, 0);
   Execute("INSERT INTO t VALUES(1)");
   EXPECT_THAT(Saved(), IsEmpty());
-  transaction.Commit(__FILE__, __LINE__);
+  transaction.Commit();
   EXPECT_THAT(Saved(), ElementsAre("1"));
 }
 
 TEST_F(TransactionTest, ChangesAreRolledBackWithoutACommit) {
   {
-    const Transaction transaction(db, 0, __FILE__, __LINE__);
+    const Transaction transaction(db, 0);
     Execute("INSERT INTO t VALUES(1)");
   }
   EXPECT_THAT(Saved(), IsEmpty());
@@ -78,7 +74,7 @@ TEST_F(TransactionTest, ChangesAreRolledBackWithoutACommit) {
 TEST_F(TransactionTest, AnExceptionRollsBack) {
   EXPECT_THROW(
       {
-        const Transaction transaction(db, 0, __FILE__, __LINE__);
+        const Transaction transaction(db, 0);
         Execute("INSERT INTO t VALUES(1)");
         Execute("CREATE TABLE u(a)");
         throw std::runtime_error("halfway");
@@ -91,20 +87,20 @@ TEST_F(TransactionTest, AnExceptionRollsBack) {
 
 TEST_F(TransactionTest, RollsBackUnderAStatementThatIsStillInUse) {
   Execute("INSERT INTO t VALUES(1), (2)");
-  Statement select(db, "SELECT a FROM t", __FILE__, __LINE__);
+  Statement select(db, "SELECT a FROM t");
   {
-    const Transaction transaction(db, 0, __FILE__, __LINE__);
+    const Transaction transaction(db, 0);
     Execute("DELETE FROM t WHERE a = 2");
-    ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
+    ASSERT_TRUE(select.Fetch());
   }
   EXPECT_THAT(Saved(), ElementsAre("1", "2"));
 }
 
 TEST_F(TransactionTest, NothingIsRolledBackAfterTheCommit) {
   {
-    Transaction transaction(db, 0, __FILE__, __LINE__);
+    Transaction transaction(db, 0);
     Execute("INSERT INTO t VALUES(1)");
-    transaction.Commit(__FILE__, __LINE__);
+    transaction.Commit();
     Execute("INSERT INTO t VALUES(2)");
   }
   EXPECT_THAT(Saved(), ElementsAre("1", "2"));
@@ -112,10 +108,10 @@ TEST_F(TransactionTest, NothingIsRolledBackAfterTheCommit) {
 
 TEST_F(TransactionTest, TransactionsFollowEachOther) {
   for (const char* const sql : {"INSERT INTO t VALUES(1)", "INSERT INTO t VALUES(2)"}) {
-    { const Transaction abandoned(db, 0, __FILE__, __LINE__); }
-    Transaction transaction(db, 0, __FILE__, __LINE__);
+    { const Transaction abandoned(db, 0); }
+    Transaction transaction(db, 0);
     Execute(sql);
-    transaction.Commit(__FILE__, __LINE__);
+    transaction.Commit();
   }
   EXPECT_THAT(Saved(), ElementsAre("1", "2"));
 }
@@ -123,7 +119,7 @@ TEST_F(TransactionTest, TransactionsFollowEachOther) {
 TEST_F(TransactionTest, PreventsOtherWritersFromTheBeginning) {
   SQLite::Database other(path, SQLite::OPEN_READWRITE);
   {
-    const Transaction transaction(db, 0, __FILE__, __LINE__);
+    const Transaction transaction(db, 0);
     EXPECT_EQ(other.tryExec("BEGIN IMMEDIATE"), SQLITE_BUSY);
     EXPECT_EQ(other.tryExec("SELECT * FROM t"), SQLITE_OK) << "readers may go on";
   }
@@ -143,8 +139,8 @@ TEST_F(TransactionTest, FailsOnAClosedDatabase) {
 }
 
 TEST_F(TransactionTest, ASecondOneOnTheConnectionFails) {
-  const Transaction transaction(db, 0, __FILE__, __LINE__);
-  EXPECT_THAT(Thrown([&] { Transaction(db, 0, __FILE__, __LINE__); }),
+  const Transaction transaction(db, 0);
+  EXPECT_THAT(Thrown([&] { Transaction(db, 0); }),
               HasSubstr("cannot start a transaction within a transaction"));
 }
 
@@ -166,9 +162,9 @@ TEST_F(TransactionTest, WaitsForAnotherWriterForItsBusyTimeOut) {
   std::string failure;
   std::jthread waiter([&] {
     try {
-      Transaction transaction(db, 600'000, __FILE__, __LINE__);
+      Transaction transaction(db, 600'000);
       Execute("INSERT INTO t VALUES('ours')");
-      transaction.Commit(__FILE__, __LINE__);
+      transaction.Commit();
     } catch (const std::string& thrown) {
       failure = thrown;
     }
@@ -184,13 +180,13 @@ TEST_F(TransactionTest, WaitsForAnotherWriterForItsBusyTimeOut) {
 TEST_F(TransactionTest, TheBusyTimeOutIsTheTransactionsOnlyWhileItRuns) {
   ASSERT_THAT(db.Rows("PRAGMA busy_timeout"), ElementsAre("1000"));
   {
-    Transaction transaction(db, 70, __FILE__, __LINE__);
+    Transaction transaction(db, 70);
     EXPECT_THAT(db.Rows("PRAGMA busy_timeout"), ElementsAre("70"));
-    transaction.Commit(__FILE__, __LINE__);
+    transaction.Commit();
     EXPECT_THAT(db.Rows("PRAGMA busy_timeout"), ElementsAre("1000"));
   }
   {
-    const Transaction transaction(db, 80, __FILE__, __LINE__);
+    const Transaction transaction(db, 80);
     EXPECT_THAT(db.Rows("PRAGMA busy_timeout"), ElementsAre("80"));
   }
   EXPECT_THAT(db.Rows("PRAGMA busy_timeout"), ElementsAre("1000"));
@@ -199,7 +195,7 @@ TEST_F(TransactionTest, TheBusyTimeOutIsTheTransactionsOnlyWhileItRuns) {
 TEST_F(TransactionTest, AFailedBeginningRestoresTheBusyTimeOut) {
   SQLite::Database other(path, SQLite::OPEN_READWRITE);
   other.exec("BEGIN IMMEDIATE");
-  EXPECT_THROW(Transaction(db, 0, __FILE__, __LINE__), std::string);
+  EXPECT_THROW(Transaction(db, 0), std::string);
   EXPECT_THAT(db.Rows("PRAGMA busy_timeout"), ElementsAre("1000"));
 }
 
@@ -208,11 +204,11 @@ TEST_F(TransactionTest, AFailedBeginningRestoresTheBusyTimeOut) {
 TEST_F(TransactionTest, AFailedStepMakesTheCommitFail) {
   std::string message;
   {
-    Transaction transaction(db, 0, __FILE__, __LINE__);
+    Transaction transaction(db, 0);
     Execute("INSERT INTO t VALUES(1)");
     {
-      Statement insert(db, "INSERT INTO t VALUES(?)", __FILE__, __LINE__);
-      insert.BindInt(1, 1, __FILE__, __LINE__);
+      Statement insert(db, "INSERT INTO t VALUES(?)");
+      insert.BindInt(1, 1);
       EXPECT_EQ(insert.Step("Inner.cpp", 11), SQLITE_CONSTRAINT);
     }
     Execute("INSERT INTO t VALUES(2)");
@@ -227,38 +223,37 @@ TEST_F(TransactionTest, AFailedStepMakesTheCommitFail) {
 
 TEST_F(TransactionTest, TheFirstFailedStepIsTheOneReported) {
   Execute("INSERT INTO t VALUES(1), (2)");
-  Transaction transaction(db, 0, __FILE__, __LINE__);
+  Transaction transaction(db, 0);
   Step("INSERT INTO t VALUES(1)");
   Step("INSERT INTO t VALUES(2)");
-  EXPECT_THAT(Thrown([&] { transaction.Commit(__FILE__, __LINE__); }),
-              HasSubstr("INSERT INTO t VALUES(1)"));
+  EXPECT_THAT(Thrown([&] { transaction.Commit(); }), HasSubstr("INSERT INTO t VALUES(1)"));
 }
 
 TEST_F(TransactionTest, StepsThatReturnARowOrTheEndAreNotFailures) {
   Execute("INSERT INTO t VALUES(1)");
-  Transaction transaction(db, 0, __FILE__, __LINE__);
+  Transaction transaction(db, 0);
   EXPECT_EQ(Step("SELECT a FROM t"), Statement::ROW);
   EXPECT_EQ(Step("INSERT INTO t VALUES(2)"), Statement::DONE);
-  EXPECT_NO_THROW(transaction.Commit(__FILE__, __LINE__));
+  EXPECT_NO_THROW(transaction.Commit());
 }
 
 TEST_F(TransactionTest, AStepThatFailedBeforeItBeganDoesNotCount) {
   Execute("INSERT INTO t VALUES(1)");
   EXPECT_EQ(Step("INSERT INTO t VALUES(1)"), SQLITE_CONSTRAINT);
-  Transaction transaction(db, 0, __FILE__, __LINE__);
+  Transaction transaction(db, 0);
   Execute("INSERT INTO t VALUES(2)");
-  EXPECT_NO_THROW(transaction.Commit(__FILE__, __LINE__));
+  EXPECT_NO_THROW(transaction.Commit());
 }
 
 TEST_F(TransactionTest, AStepThatFailedInThePreviousTransactionDoesNotCount) {
   Execute("INSERT INTO t VALUES(1)");
   {
-    const Transaction transaction(db, 0, __FILE__, __LINE__);
+    const Transaction transaction(db, 0);
     EXPECT_EQ(Step("INSERT INTO t VALUES(1)"), SQLITE_CONSTRAINT);
   }
-  Transaction transaction(db, 0, __FILE__, __LINE__);
+  Transaction transaction(db, 0);
   Execute("INSERT INTO t VALUES(2)");
-  EXPECT_NO_THROW(transaction.Commit(__FILE__, __LINE__));
+  EXPECT_NO_THROW(transaction.Commit());
 }
 
 TEST_F(TransactionTest, ACommitThatReadersPreventFailsAndChangesNothing) {
@@ -266,7 +261,7 @@ TEST_F(TransactionTest, ACommitThatReadersPreventFailsAndChangesNothing) {
   SQLite::Database other(path, SQLite::OPEN_READWRITE);
   other.exec("BEGIN; SELECT * FROM t");
   {
-    Transaction transaction(db, 0, __FILE__, __LINE__);
+    Transaction transaction(db, 0);
     Execute("INSERT INTO t VALUES(2)");
     EXPECT_EQ(Thrown([&] { transaction.Commit("Caller.cpp", 30); }),
               "Caller.cpp:30: database is locked (extended code 5) in \"COMMIT\"");
@@ -278,7 +273,7 @@ TEST_F(TransactionTest, ACommitThatReadersPreventFailsAndChangesNothing) {
 TEST_F(TransactionTest, NothingIsWrittenAfterSqliteHasRolledBackByItself) {
   Execute("INSERT INTO t VALUES(1)");
   {
-    const Transaction transaction(db, 0, __FILE__, __LINE__);
+    const Transaction transaction(db, 0);
     EXPECT_EQ(Step("INSERT OR ROLLBACK INTO t VALUES(1)"), SQLITE_CONSTRAINT);
     EXPECT_THAT(
         Thrown([&] { Statement(db, "INSERT INTO t VALUES(2)", "Caller.cpp", 22); }),
@@ -294,10 +289,10 @@ TEST_F(TransactionTest, NothingIsWrittenAfterSqliteHasRolledBackByItself) {
 TEST_F(TransactionTest, EndsNormallyAfterSqliteHasRolledBackByItself) {
   Execute("INSERT INTO t VALUES(1)");
   {
-    Transaction transaction(db, 70, __FILE__, __LINE__);
+    Transaction transaction(db, 70);
     Execute("INSERT INTO t VALUES(2)");
     EXPECT_EQ(Step("INSERT OR ROLLBACK INTO t VALUES(1)"), SQLITE_CONSTRAINT);
-    EXPECT_THROW(transaction.Commit(__FILE__, __LINE__), std::string);
+    EXPECT_THROW(transaction.Commit(), std::string);
   }
   EXPECT_THAT(Saved(), ElementsAre("1"));
   EXPECT_THAT(db.Rows("PRAGMA busy_timeout"), ElementsAre("1000"));
@@ -311,8 +306,8 @@ protected:
 
   std::vector<std::string> Read() const {
     std::vector<std::string> rows;
-    Statement select(reader, "SELECT a FROM t ORDER BY a", __FILE__, __LINE__);
-    while (select.Fetch(__FILE__, __LINE__)) {
+    Statement select(reader, "SELECT a FROM t ORDER BY a");
+    while (select.Fetch()) {
       rows.push_back(select.GetText(0));
     }
     return rows;
@@ -323,7 +318,7 @@ protected:
 
 TEST_F(ReadOnlyTransactionTest, DoesNotPreventWriting) {
   SQLite::Database other(path, SQLite::OPEN_READWRITE);
-  const Transaction transaction(reader, 0, __FILE__, __LINE__);
+  const Transaction transaction(reader, 0);
   EXPECT_EQ(other.tryExec("INSERT INTO t VALUES(1)"), SQLITE_OK) << "nothing was read yet";
 }
 
@@ -331,12 +326,12 @@ TEST_F(ReadOnlyTransactionTest, SeesOneStateWhileAnotherWrites) {
   SQLite::Database other(path, SQLite::OPEN_READWRITE);
   other.exec("PRAGMA journal_mode = WAL; INSERT INTO t VALUES(1)");
   {
-    Transaction transaction(reader, 0, __FILE__, __LINE__);
+    Transaction transaction(reader, 0);
     EXPECT_THAT(Read(), ElementsAre("1"));
     other.exec("INSERT INTO t VALUES(2)");
     EXPECT_THAT(Saved(), ElementsAre("1", "2"));
     EXPECT_THAT(Read(), ElementsAre("1"));
-    transaction.Commit(__FILE__, __LINE__);
+    transaction.Commit();
   }
   EXPECT_THAT(Read(), ElementsAre("1", "2"));
 }
@@ -345,7 +340,7 @@ TEST_F(ReadOnlyTransactionTest, PreventsAWriterWithARollbackJournal) {
   Execute("INSERT INTO t VALUES(1)");
   SQLite::Database other(path, SQLite::OPEN_READWRITE);
   {
-    const Transaction transaction(reader, 0, __FILE__, __LINE__);
+    const Transaction transaction(reader, 0);
     EXPECT_THAT(Read(), ElementsAre("1"));
     EXPECT_EQ(other.tryExec("INSERT INTO t VALUES(2)"), SQLITE_BUSY);
     EXPECT_THAT(Read(), ElementsAre("1"));
@@ -357,13 +352,10 @@ TEST_F(ReadOnlyTransactionTest, PreventsAWriterWithARollbackJournal) {
 TEST_F(ReadOnlyTransactionTest, AFailedReadMakesTheCommitFail) {
   SQLite::Database other(path, SQLite::OPEN_READWRITE);
   EXPECT_THAT(Read(), IsEmpty()); // so that the schema is known and the statement compiled
-  Transaction transaction(reader, 0, __FILE__, __LINE__);
+  Transaction transaction(reader, 0);
   other.exec("BEGIN EXCLUSIVE");
-  EXPECT_EQ(
-      Statement(reader, "SELECT a FROM t ORDER BY a", __FILE__, __LINE__).Step("Inner.cpp", 11),
-      SQLITE_BUSY);
-  EXPECT_THAT(Thrown([&] { transaction.Commit(__FILE__, __LINE__); }),
-              HasSubstr("Inner.cpp:11: database is locked"));
+  EXPECT_EQ(Statement(reader, "SELECT a FROM t ORDER BY a").Step("Inner.cpp", 11), SQLITE_BUSY);
+  EXPECT_THAT(Thrown([&] { transaction.Commit(); }), HasSubstr("Inner.cpp:11: database is locked"));
 }
 
 } // namespace

@@ -49,8 +49,7 @@ protected:
   /// The failure of a statement on it; empty when there is none.
   std::string FailureOf(const std::string& sql) const {
     const TestDB db(path);
-    return Failure(
-        [&] { Statement(db, sql.c_str(), __FILE__, __LINE__).Execute(__FILE__, __LINE__); });
+    return Failure([&] { Statement(db, sql.c_str()).Execute(); });
   }
 
   /// Why the table is refused; empty when it is accepted.
@@ -125,7 +124,7 @@ TEST_F(UntrustedDatabaseTest, RowsThatTheConnectionHasChangedMayTakeMoreWork) {
   for (int i = 0; i < 10; ++i) {
     db.Rows("UPDATE t SET a = a + 1");
   }
-  EXPECT_NO_THROW(Statement(db, EXPENSIVE.c_str(), __FILE__, __LINE__).Execute(__FILE__, __LINE__));
+  EXPECT_NO_THROW(Statement(db, EXPENSIVE.c_str()).Execute());
 }
 
 TEST_F(UntrustedDatabaseTest, EachStatementHasItsOwnLimit) {
@@ -133,9 +132,8 @@ TEST_F(UntrustedDatabaseTest, EachStatementHasItsOwnLimit) {
   for (int i = 0; i < 20; ++i) {
     Statement(db,
               "WITH RECURSIVE n(i) AS (SELECT 1 UNION ALL SELECT i + 1 FROM n WHERE i < 100000) "
-              "SELECT count(*) FROM n",
-              __FILE__, __LINE__)
-        .Execute(__FILE__, __LINE__);
+              "SELECT count(*) FROM n")
+        .Execute();
   }
 }
 
@@ -182,9 +180,7 @@ TEST_F(UntrustedDatabaseTest, FileThatHasGrownMayTakeMoreWork) {
   Make(THREE_THOUSAND);
   const TestDB db(path);
   Make("CREATE TABLE large(a); INSERT INTO large VALUES(zeroblob(10000000))");
-  const auto count = [&] {
-    Statement(db, EXPENSIVE.c_str(), __FILE__, __LINE__).Execute(__FILE__, __LINE__);
-  };
+  const auto count = [&] { Statement(db, EXPENSIVE.c_str()).Execute(); };
   EXPECT_THROW(count(), std::string);
   db.MeasureFile();
   EXPECT_NO_THROW(count());

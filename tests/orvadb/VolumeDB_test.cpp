@@ -39,8 +39,8 @@ public:
 
   std::vector<std::string> Rows(const char* sql) const {
     std::vector<std::string> rows;
-    Statement select(*this, sql, __FILE__, __LINE__);
-    while (select.Fetch(__FILE__, __LINE__)) {
+    Statement select(*this, sql);
+    while (select.Fetch()) {
       rows.push_back(select.GetText(0));
     }
     return rows;

@@ -19,5 +19,11 @@ TEST(Exception, NamesTheSourceLineThatThrew) {
   EXPECT_EQ(exception.Line(), 42U);
 }
 
+TEST(Exception, NamesItsOwnSourceLineByDefault) {
+  const Exception exception("the message");
+  EXPECT_STREQ(exception.File(), __FILE__);
+  EXPECT_EQ(exception.Line(), __LINE__ - 2U);
+}
+
 } // namespace
 } // namespace orva::util

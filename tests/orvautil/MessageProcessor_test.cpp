@@ -511,7 +511,7 @@ struct Unknown {};
 INSTANTIATE_TEST_SUITE_P(
     Handler, MessageProcessorThrownTest,
     testing::Values(
-        Thrown{"OurException", [] { throw Exception("ours", __FILE__, __LINE__); }, "ours"},
+        Thrown{"OurException", [] { throw Exception("ours"); }, "ours"},
         Thrown{"BadAlloc", [] { throw std::bad_alloc(); }, std::bad_alloc().what()},
         Thrown{"PercentSign", [] { throw std::runtime_error("100%s %n"); }, "100%s %n"},
         Thrown{"String", [] { throw std::string("a database failure"); }, "a database failure"},

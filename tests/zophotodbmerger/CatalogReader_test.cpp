@@ -315,10 +315,10 @@ TEST_F(CatalogReaderTest, UnreadableRowEndsTheListAndFailsItsTransaction) {
   catalog.AddFolder("c/");
   catalog.Rows().Run("UPDATE Folders SET name = zeroblob(20000000) WHERE id = 3");
   const db::VolumeDB connection(MOUNT_POINT, false);
-  db::Transaction transaction(connection, 1000, __FILE__, __LINE__);
+  db::Transaction transaction(connection, 1000);
   EXPECT_THAT(Paths(dbmerger::ReadFolders(MOUNT_POINT, connection)),
               ElementsAre("/shares/Vol/", "/shares/Vol/a/", "/shares/Vol/b/"));
-  EXPECT_THROW(transaction.Commit(__FILE__, __LINE__), std::string);
+  EXPECT_THROW(transaction.Commit(), std::string);
 }
 
 TEST(FolderItemCmp, PathComesBeforeAllLongerPathsThatBeginWithIt) {

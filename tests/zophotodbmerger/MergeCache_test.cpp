@@ -104,21 +104,20 @@ protected:
   }
 
   static bool HasTransientIndex(PhotoDB& photos) {
-    Statement query(photos, "SELECT 1 FROM sqlite_master WHERE name = 'Files_merge'", __FILE__,
-                    __LINE__);
-    return query.Fetch(__FILE__, __LINE__);
+    Statement query(photos, "SELECT 1 FROM sqlite_master WHERE name = 'Files_merge'");
+    return query.Fetch();
   }
 
   static void RunOn(const std::string& location, PhotoDB::CacheUse cacheUse,
                     const std::vector<Operation>& operations, bool commit) {
     PhotoDB photos(location, cacheUse);
     photos.Init();
-    Transaction transaction(photos, 1000, __FILE__, __LINE__);
+    Transaction transaction(photos, 1000);
     for (const Operation& operation : operations) {
       operation(photos);
     }
     if (commit) {
-      transaction.Commit(__FILE__, __LINE__);
+      transaction.Commit();
     }
   }
 
@@ -218,13 +217,13 @@ TEST_F(MergeCacheTest, SeveralTransactionsOfOneObjectGiveTheSameRows) {
       for (int merge = 0; merge < 8; ++merge) {
         std::optional<Transaction> transaction;
         if (source.Below(6) != 0) { // otherwise each statement is a transaction of its own
-          transaction.emplace(photos, 1000U, __FILE__, static_cast<unsigned>(__LINE__));
+          transaction.emplace(photos, 1000U);
         }
         for (const Operation& operation : source.Merge()) {
           operation(photos);
         }
         if (transaction && source.Commits()) {
-          transaction->Commit(__FILE__, __LINE__);
+          transaction->Commit();
         }
       }
     }
@@ -248,13 +247,13 @@ TEST_F(MergeCacheTest, AFolderThatWasRolledBackIsRemovedFromTheCache) {
   PhotoDB photos(CACHED);
   photos.Init();
   {
-    const Transaction rolledBack(photos, 1000, __FILE__, __LINE__);
+    const Transaction rolledBack(photos, 1000);
     AddFolder(volume, volume)(photos);
     AddFile(volume, volume + "a", "a")(photos);
   }
-  Transaction transaction(photos, 1000, __FILE__, __LINE__);
+  Transaction transaction(photos, 1000);
   AddFile(volume, volume + "b", "b")(photos);
-  transaction.Commit(__FILE__, __LINE__);
+  transaction.Commit();
   EXPECT_THAT(Rows(CACHED, "SELECT * FROM Files"), testing::IsEmpty());
 }
 
@@ -263,15 +262,15 @@ TEST_F(MergeCacheTest, RowsThatOthersAddBetweenTransactionsAreSeen) {
   PhotoDB photos(CACHED);
   photos.Init();
   {
-    Transaction transaction(photos, 1000, __FILE__, __LINE__);
+    Transaction transaction(photos, 1000);
     AddFolder(volume, volume)(photos);
     AddFile(volume, volume + "a", "a")(photos);
-    transaction.Commit(__FILE__, __LINE__);
+    transaction.Commit();
   }
   RunOn(CACHED, PhotoDB::CacheUse::Bypass, {AddFile(volume, volume + "b", "b")}, true);
-  Transaction transaction(photos, 1000, __FILE__, __LINE__);
+  Transaction transaction(photos, 1000);
   AddFile(volume, volume + "b", "b")(photos);
-  transaction.Commit(__FILE__, __LINE__);
+  transaction.Commit();
   EXPECT_THAT(Rows(CACHED, "SELECT name FROM Files"), testing::ElementsAre("a", "b"));
 }
 
