@@ -42,15 +42,15 @@ Lines ErrorsIn(const Log& log) {
   return errors;
 }
 
-/// Whether a log ends with the lines of a good merge of the good volume.
+/// Whether a log ends with the lines of a successful merge of the good volume.
 bool EndsWithGoodMerge(const Log& log, int files) {
   const Log good = MergeLines(GOOD, GOOD_FOLDERS, files);
   return log.size() >= good.size() &&
          std::equal(good.begin(), good.end(), log.end() - static_cast<long>(good.size()));
 }
 
-/// All that the good volume and the daemon itself have in a merged database. Ids of rows that
-/// come after those of another volume are not the same.
+/// The rows of the good volume and of the daemon itself in a merged database. Without their ids,
+/// which depend on the rows of other volumes.
 Lines GoodContent(const std::string& location) {
   Lines content = MergedRows(location, "SELECT * FROM Status");
   for (const char* const sql :
@@ -60,15 +60,13 @@ Lines GoodContent(const std::string& location) {
         "'/shares/Good/') ORDER BY 1",
         "SELECT o.name || f.name, f.modified_date, f.created_date FROM Files f LEFT JOIN Folders "
         "o ON o.folder_id = f.folder_id WHERE f.volume = '/shares/Good/' ORDER BY 1"}) {
-    for (const std::string& row : MergedRows(location, sql)) {
-      content.push_back(row);
-    }
+    content = content + MergedRows(location, sql);
   }
   return content;
 }
 
-/// Rows that a merge of the hostile volume must not have brought.
-Lines StrangeRows(const std::string& location) {
+/// Rows that a merge of the hostile volume must not add.
+Lines UnexpectedRows(const std::string& location) {
   return MergedRows(location,
                     "SELECT name, volume FROM Folders WHERE volume NOT IN ('<DUMMY>', "
                     "'/shares/Good/') AND (volume != '/shares/Vol/' OR substr(name, 1, 12) != "
@@ -83,8 +81,8 @@ HostileTest::HostileTest() {
   for (const std::string& directory : {MASTER, VOLUME, SPARE, DECOY}) {
     MakeDirectory(directory);
   }
-  std::ofstream(VICTIM) << "dear content";
-  std::ofstream("/tmp/victim") << "dear content";
+  std::ofstream(VICTIM) << "content";
+  std::ofstream("/tmp/victim") << "content";
   Catalog good(GOOD);
   AddPhotos(good);
   Attempt::Run({{"merge", MASTER, GOOD}});
@@ -117,7 +115,7 @@ HostileTest::Outcome HostileTest::MergeHostileVolume() {
   EXPECT_THAT(attempt.thrown, ::testing::ElementsAre("", ""));
   EXPECT_TRUE(EndsWithGoodMerge(log, 1)) << ::testing::PrintToString(log);
   EXPECT_EQ(goodContent_, GoodContent(MASTER));
-  EXPECT_THAT(StrangeRows(MASTER), ::testing::IsEmpty());
+  EXPECT_THAT(UnexpectedRows(MASTER), ::testing::IsEmpty());
   EXPECT_THAT(MergedRows(MASTER, "PRAGMA integrity_check"), ::testing::ElementsAre("ok"));
 
   const Lines errors = ErrorsIn(log);
@@ -158,9 +156,7 @@ std::vector<std::string> HostileTest::UseHostileMaster() {
     fs::remove(LOCATOR_PATH);
   }
 
-  std::vector<std::string> results = ErrorsIn(log);
-  results.insert(results.end(), attempt.thrown.begin(), attempt.thrown.end());
-  return results;
+  return ErrorsIn(log) + attempt.thrown;
 }
 
 void HostileTest::RestoreMaster() const {
@@ -222,6 +218,29 @@ long long BytesOnMedium(const std::string& path) {
     }
   }
   return bytes;
+}
+
+std::uint32_t RootPage(const std::string& database, const std::string& name) {
+  return static_cast<std::uint32_t>(std::stoul(
+      Database(database).Run("SELECT rootpage FROM sqlite_schema WHERE name = ?", {name}).at(0)));
+}
+
+void Mutate(Bytes& file, std::size_t pageSize, std::mt19937& random) {
+  const auto below = [&](std::size_t end) {
+    return std::uniform_int_distribution<std::size_t>(0, end - 1)(random);
+  };
+  const std::size_t changes = 1 + below(8);
+  for (std::size_t i = 0; i < changes; ++i) {
+    constexpr std::size_t headOfPage = 120;
+    const std::size_t page = below(file.Size() / pageSize) * pageSize;
+    const std::size_t offset = page + below(below(2) == 0 ? headOfPage : pageSize);
+    file[offset] = static_cast<std::uint8_t>(below(256));
+  }
+}
+
+std::string ExpensiveValue(const std::string& term) {
+  return "instr(hex(zeroblob(500000)), hex(zeroblob(200000)) || " + term +
+         " || hex(zeroblob(200000)))";
 }
 
 std::string Rows(int count) {

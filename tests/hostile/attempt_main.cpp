@@ -1,6 +1,6 @@
-// Does what it is told on its command line, in threes (operation, master, volume), with the
-// daemon's own classes, and reports what left each on the descriptor that it has for standard
-// input: a line each, then its peak of memory.
+// Runs the operations on its command line (operation, master, volume, repeated) with the daemon's
+// classes. Writes to standard input, which is open for writing, a line with what each operation
+// threw, and at the end its peak memory.
 
 #include "DBMerger.h"
 #include "PhotoDB.h"
@@ -18,7 +18,7 @@ namespace {
 using namespace orva;
 using Action = std::function<void(const std::string& master, const std::string& volume)>;
 
-/// Of a message, what tells it from others, on one line.
+/// The beginning of a message, on one line.
 std::string Beginning(std::string message) {
   constexpr std::size_t enough = 400;
   message.resize(std::min(message.size(), enough));
