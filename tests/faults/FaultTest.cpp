@@ -43,7 +43,7 @@ std::string PhotoPath(int folder, int photo) {
 Catalog MakeCatalog(const std::string& volume) {
   std::filesystem::remove_all(volume);
   Catalog catalog(volume);
-  // The smallest pages, and every statement reads its own, so that there are more to be read.
+  // Small pages and a small cache, so that more pages are read.
   catalog.Rows().Run("PRAGMA default_cache_size = 1");
   catalog.Rows().Run("PRAGMA page_size = 512");
   catalog.Rows().Run("VACUUM");
@@ -56,7 +56,7 @@ Catalog MakeCatalog(const std::string& volume) {
   return catalog;
 }
 
-/// What an indexer does between two merges: new photos, a new folder, photos and a folder gone.
+/// Changes of an indexer between two merges: new photos, a new folder, deleted photos and a folder.
 void Change(Catalog& catalog) {
   catalog.AddFolder(FolderPath(FOLDERS + 1), 200);
   for (int photo = 1; photo <= PHOTOS; ++photo) {
@@ -100,7 +100,7 @@ Lines Integrity() {
 
 FaultTest::FaultTest() {
   MakeDirectory(MASTER);
-  // Its thread is at its end before a test forks.
+  // The merger's thread must have ended before a test forks.
   merger.Wait();
 }
 
@@ -144,8 +144,8 @@ void FaultTest::Merge(const std::string& volume) {
   merger.MergeDB(MASTER, volume);
 }
 
-/// Looks up what the scenario leads to, from the files that are laid now. `volumes` are what a
-/// whole database holds afterwards; none when that is of no interest.
+/// Completes the scenario from the files that are there now. `volumes` are those of a complete
+/// database after it; none where that is not checked.
 FaultTest::Scenario FaultTest::Finish(Scenario scenario, const Lines& volumes) {
   scenario.files = TakeFiles();
   scenario.before = Content();
@@ -178,8 +178,8 @@ FaultTest::Scenario FaultTest::FirstMergeWithoutADatabase() {
   return scenario;
 }
 
-/// Merges both volumes, and then has the indexer change the catalog of the one.
-void FaultTest::LayMergedVolumes() {
+/// Merges both volumes and then changes the catalog of VOLUME.
+void FaultTest::MakeMergedVolumes() {
   MakeCatalog(OTHER);
   Catalog catalog = MakeCatalog(VOLUME);
   OutputOf([this] { Merge(OTHER); });
@@ -188,12 +188,12 @@ void FaultTest::LayMergedVolumes() {
 }
 
 FaultTest::Scenario FaultTest::LaterMerge() {
-  LayMergedVolumes();
+  MakeMergedVolumes();
   return Finish({.name = "a later merge", .operation = [this] { Merge(VOLUME); }, .throws = false},
                 {OTHER, VOLUME});
 }
 
-/// What the deletion of the volume may leave when only its first statements succeed.
+/// The contents after the first statements of the volume's deletion.
 std::vector<Lines> FaultTest::PartsOfADeletion() {
   std::vector<Lines> parts;
   const Files files = TakeFiles();
@@ -208,7 +208,7 @@ std::vector<Lines> FaultTest::PartsOfADeletion() {
 }
 
 FaultTest::Scenario FaultTest::ReMerge() {
-  LayMergedVolumes();
+  MakeMergedVolumes();
   return Finish({.name = "a re-merge",
                  .operation = [this] { merger.ReMergeDB(MASTER, VOLUME); },
                  .between = PartsOfADeletion()},
@@ -216,7 +216,7 @@ FaultTest::Scenario FaultTest::ReMerge() {
 }
 
 FaultTest::Scenario FaultTest::Removal() {
-  LayMergedVolumes();
+  MakeMergedVolumes();
   return Finish({.name = "a removal of a volume",
                  .operation = [this] { merger.RemoveVolume(MASTER, VOLUME); },
                  .between = PartsOfADeletion()},
@@ -230,7 +230,7 @@ FaultTest::Scenario FaultTest::Creation() {
 }
 
 FaultTest::Scenario FaultTest::Opening() {
-  LayMergedVolumes();
+  MakeMergedVolumes();
   return Finish({.name = "an opening",
                  .operation =
                      [] {
@@ -243,7 +243,7 @@ FaultTest::Scenario FaultTest::Opening() {
 }
 
 FaultTest::Scenario FaultTest::Clearing() {
-  LayMergedVolumes();
+  MakeMergedVolumes();
   const Files files = TakeFiles();
   std::vector<Lines> parts;
   for (const char* const sql : {"DELETE FROM Folders WHERE folder_id != 1", "DELETE FROM Files"}) {
@@ -269,7 +269,7 @@ void FaultTest::ExpectToSurvive(const Scenario& scenario, const std::vector<Faul
   int runs = 0;
   for (const Fault& fault : faults) {
     SCOPED_TRACE(scenario.name + ", " + fault.name);
-    const int made = Disturb(scenario, fault);
+    const int made = RunWith(scenario, fault);
     if (HasFailure()) {
       return;
     }
@@ -282,13 +282,13 @@ void FaultTest::ExpectToSurvive(const Scenario& scenario, const std::vector<Faul
   EXPECT_NE(0, runs);
 }
 
-/// Returns how many times the operation was run with the fault.
-int FaultTest::Disturb(const Scenario& scenario, const Fault& fault) {
-  constexpr int briefRuns = 10;
+/// Returns how often the operation was run with the fault.
+int FaultTest::RunWith(const Scenario& scenario, const Fault& fault) {
+  constexpr int shortRuns = 10;
   RestoreFiles(scenario.files);
   const int chances = Try(fault, 0, scenario.operation).tally.chances;
   EXPECT_EQ(scenario.after, Content());
-  const int step = TestScale(std::max(1, chances / briefRuns), 1);
+  const int step = TestScale(std::max(1, chances / shortRuns), 1);
   int runs = 0;
   for (int nth = 1; nth <= chances && !HasFailure(); nth += step) {
     SCOPED_TRACE("at opportunity " + std::to_string(nth) + " of " + std::to_string(chances));
@@ -331,7 +331,7 @@ void FaultTest::CheckOutcome(const Scenario& scenario, const Fault& fault, const
       << "from before: " << ::testing::PrintToString(Difference(scenario.before, content))
       << "\nfrom after: " << ::testing::PrintToString(Difference(scenario.after, content));
 
-  if (!fault.stopsProcess) {
+  if (!fault.endsProcess) {
     Lines complaints = outcome.thrown;
     complaints.insert(complaints.end(), outcome.logged.begin(), outcome.logged.end());
     EXPECT_LE(complaints.size(), 1U) << ::testing::PrintToString(complaints);
@@ -344,17 +344,17 @@ void FaultTest::CheckOutcome(const Scenario& scenario, const Fault& fault, const
   }
 
   RestoreFiles(left);
-  ExpectUndisturbed(scenario.operation, scenario.after);
+  ExpectSuccess(scenario.operation, scenario.after);
   if (content != scenario.before && !scenario.merged.empty()) {
     RestoreFiles(left);
-    ExpectUndisturbed([this] { Merge(VOLUME); }, scenario.merged);
+    ExpectSuccess([this] { Merge(VOLUME); }, scenario.merged);
   }
 }
 
-/// Runs an operation without a fault where there has been one.
-void FaultTest::ExpectUndisturbed(const Action& action, const Lines& content) {
-  const Fault none{.name = "none", .run = [](int /*nth*/, const Action& undisturbed) {
-                     undisturbed();
+/// Runs an operation without a fault after one with a fault.
+void FaultTest::ExpectSuccess(const Action& action, const Lines& content) {
+  const Fault none{.name = "none", .run = [](int /*nth*/, const Action& operation) {
+                     operation();
                      return Fault::Tally();
                    }};
   const Outcome outcome = Try(none, 0, action);
