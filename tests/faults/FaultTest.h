@@ -40,12 +40,11 @@ protected:
   struct Scenario {
     std::string name; ///< in the figures: "a first merge"
     Action operation;
-    Files files{};      ///< the files before it
-    bool throws = true; ///< otherwise a failure is logged as that of a merge
-    std::vector<Lines>
-        between{};  ///< possible contents after a failure, in addition to the next two
-    Lines before{}; ///< the content before it
-    Lines after{};  ///< the content after it without a fault
+    Files files{};                ///< the files before it
+    bool throws = true;           ///< otherwise a failure is logged as that of a merge
+    std::vector<Lines> between{}; ///< further contents that a failure may leave
+    Lines before{};               ///< the content before it
+    Lines after{};                ///< the content after it without a fault
     /// The content after the volume's next merge, unless the content has not changed; empty where
     /// that is not checked.
     Lines merged{};

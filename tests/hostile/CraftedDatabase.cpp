@@ -73,15 +73,6 @@ std::size_t CraftedDatabase::Header(std::uint32_t page) const {
   return Offset(page) + (page == 1 ? FILE_HEADER : 0);
 }
 
-std::uint32_t CraftedDatabase::FirstLeaf(std::uint32_t root) const {
-  std::uint32_t page = root;
-  while (file_.Read(Header(page), 1) == TABLE_INTERIOR) {
-    const std::uint32_t cell = file_.Read(Header(page) + INTERIOR_HEADER, 2);
-    page = file_.Read(Offset(page) + cell, 4);
-  }
-  return page;
-}
-
 std::uint32_t CraftedDatabase::Cells(std::uint32_t page) const {
   return file_.Read(Header(page) + 3, 2);
 }

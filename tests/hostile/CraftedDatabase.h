@@ -43,9 +43,6 @@ public:
   std::uint32_t PageSize() const { return pageSize_; }
   std::uint32_t Pages() const { return static_cast<std::uint32_t>(file_.Size() / pageSize_); }
 
-  /// The leftmost leaf of the b-tree at `root`.
-  std::uint32_t FirstLeaf(std::uint32_t root) const;
-
   /// The number of cells on a b-tree page.
   std::uint32_t Cells(std::uint32_t page) const;
 
