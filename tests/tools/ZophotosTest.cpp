@@ -1,12 +1,14 @@
 #include "ZophotosTest.h"
 
+#include "support/Programs.h"
+
 #include <cstdlib>
 #include <filesystem>
 
 namespace orva::test {
 
 Arguments ZophotosCommand(Arguments arguments) {
-  arguments.insert(arguments.begin(), ZOPHOTOS);
+  arguments.insert(arguments.begin(), ProgramPath("zophotos"));
   return arguments;
 }
 
