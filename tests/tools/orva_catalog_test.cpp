@@ -6,6 +6,8 @@
 #include "Options.h"
 #include "Sql.h"
 
+#include "commandline/UsageError.h"
+
 #include "orvadb/File.h"
 #include "orvadb/Folder.h"
 #include "orvadb/Transaction.h"
@@ -31,6 +33,7 @@
 #include <limits>
 #include <memory>
 #include <string>
+#include <utility>
 #include <vector>
 
 namespace {
@@ -649,43 +652,69 @@ TEST_F(OrvaCatalog, RestampingStampsEveryTranscodingAndNothingElse) {
 // --- Command line ------------------------------------------------------------------------------
 
 TEST(OrvaCatalogOptions, AreRead) {
-  const catalog::Options options =
+  const auto options =
       catalog::ParseOptions({"generate", "/shares/Vol", "--files", "12", "--per-folder", "5",
                              "--names", "camera", "--tree", "deep"});
-  EXPECT_EQ(options.command, catalog::Command::Generate);
-  EXPECT_EQ(options.mountPoint, "/shares/Vol");
-  EXPECT_EQ(options.plan.files, 12);
-  EXPECT_EQ(options.plan.perFolder, 5);
-  EXPECT_EQ(options.plan.names, catalog::Names::Camera);
-  EXPECT_EQ(options.plan.tree, catalog::Tree::Deep);
-  EXPECT_EQ(catalog::ParseOptions({"generate", "/v", "--restamp"}).command,
+  ASSERT_TRUE(options);
+  EXPECT_EQ(options->command, catalog::Command::Generate);
+  EXPECT_EQ(options->mountPoint, "/shares/Vol");
+  EXPECT_EQ(options->plan.files, 12);
+  EXPECT_EQ(options->plan.perFolder, 5);
+  EXPECT_EQ(options->plan.names, catalog::Names::Camera);
+  EXPECT_EQ(options->plan.tree, catalog::Tree::Deep);
+  EXPECT_EQ(catalog::ParseOptions({"index", "/v"})->command, catalog::Command::Index);
+  EXPECT_EQ(catalog::ParseOptions({"generate", "/v", "--restamp"})->command,
             catalog::Command::Restamp);
-  EXPECT_EQ(catalog::ParseOptions({"generate", "/v", "--files", "1", "--restamp"}).command,
+  EXPECT_EQ(catalog::ParseOptions({"generate", "/v", "--files", "1", "--restamp"})->command,
             catalog::Command::Restamp);
 }
 
+TEST(OrvaCatalogOptions, AreDecimalAndTheLastOneCounts) {
+  const auto options =
+      catalog::ParseOptions({"generate", "/v", "--files=7", "--files", "010", "--per-folder",
+                             "1000000000", "--names", "unique", "--tree", "flat"});
+  ASSERT_TRUE(options);
+  EXPECT_EQ(options->plan.files, 10);
+  EXPECT_EQ(options->plan.perFolder, 1'000'000'000);
+  EXPECT_EQ(options->plan.names, catalog::Names::Unique);
+  EXPECT_EQ(options->plan.tree, catalog::Tree::Flat);
+}
+
 TEST(OrvaCatalogOptions, WrongUsageIsRefused) {
-  const std::vector<Lines> wrong = {
-      {},
-      {"scan", "/v"},
-      {"index"},
-      {"index", ""},
-      {"index", "--files"},
-      {"index", "/v", "/w"},
-      {"generate", "/v"},
-      {"generate", "/v", "--files"},
-      {"generate", "/v", "--files", "1", "--per-folder", "1", "--names", "camera"},
-      {"generate", "/v", "--files", "-1", "--restamp"},
-      {"generate", "/v", "--files", "1x", "--restamp"},
-      {"generate", "/v", "--files", "99999999999999999999", "--restamp"},
-      {"generate", "/v", "--per-folder", "0", "--restamp"},
-      {"generate", "/v", "--names", "none", "--restamp"},
-      {"generate", "/v", "--tree", "round", "--restamp"},
-      {"generate", "/v", "--colour", "red", "--restamp"},
-      {"generate", "/v", "stray", "--restamp"}};
-  for (const Lines& arguments : wrong) {
-    EXPECT_THROW(catalog::ParseOptions(arguments), catalog::UsageError)
-        << testing::PrintToString(arguments);
+  const std::vector<std::pair<Lines, std::string>> wrong = {
+      {{}, "A subcommand is required"},
+      {{"scan", "/v"}, "unexpected argument 'scan'"},
+      {{"index"}, "MOUNT is required"},
+      {{"index", ""}, "MOUNT: must not be empty"},
+      {{"index", "--files"}, "MOUNT is required"},
+      {{"index", "/v", "--files"}, "unexpected argument '--files'"},
+      {{"index", "/v", "/w"}, "unexpected argument '/w'"},
+      {{"generate", "/v"}, "--files is required"},
+      {{"generate", "/v", "--files"}, "--files: 1 required NUMBER missing"},
+      {{"generate", "/v", "--files=", "1", "--restamp"}, "--files= has no value"},
+      {{"generate", "/v", "--files", "1", "--per-folder", "1", "--names", "camera"},
+       "--tree is required"},
+      {{"generate", "/v", "--files", "-1", "--restamp"},
+       "--files: takes a number from 0 to 1000000000, not '-1'"},
+      {{"generate", "/v", "--files", "1x", "--restamp"},
+       "--files: takes a number from 0 to 1000000000, not '1x'"},
+      {{"generate", "/v", "--files", "0x10", "--restamp"},
+       "--files: takes a number from 0 to 1000000000, not '0x10'"},
+      {{"generate", "/v", "--files", "99999999999999999999", "--restamp"},
+       "--files: takes a number from 0 to 1000000000, not '99999999999999999999'"},
+      {{"generate", "/v", "--per-folder", "0", "--restamp"},
+       "--per-folder: takes a number from 1 to 1000000000, not '0'"},
+      {{"generate", "/v", "--names", "none", "--restamp"}, "--names: none not in {unique,camera}"},
+      {{"generate", "/v", "--tree", "round", "--restamp"}, "--tree: round not in {flat,deep}"},
+      {{"generate", "/v", "--colour", "red", "--restamp"}, "unexpected argument '--colour'"},
+      {{"generate", "/v", "stray", "--restamp"}, "unexpected argument 'stray'"}};
+  for (const auto& [arguments, message] : wrong) {
+    try {
+      catalog::ParseOptions(arguments);
+      ADD_FAILURE() << testing::PrintToString(arguments) << " accepted instead of: " << message;
+    } catch (const commandline::UsageError& error) {
+      EXPECT_EQ(error.what(), message);
+    }
   }
 }
 
@@ -723,13 +752,31 @@ TEST_F(OrvaCatalog, TheProgramGeneratesAndRestamps) {
   EXPECT_EQ(stamped.output, volume_.native() + ": stamped 25 transcodings anew\n");
 }
 
+TEST_F(OrvaCatalog, HelpAndVersionGoToStandardOutput) {
+  const auto printed = [](const std::string& arguments) {
+    const Outcome outcome =
+        RunShell(std::string(ORVA_CATALOG_PROGRAM) + ' ' + arguments + " 2>/dev/null");
+    EXPECT_EQ(outcome.status, 0) << arguments;
+    return outcome.output;
+  };
+  const std::string help = printed("--help");
+  for (const char* const part : {"Fills the media catalog", "Usage: orva-catalog", "index",
+                                 "generate", "--help", "--version", "Exit status"}) {
+    EXPECT_NE(help.find(part), std::string::npos) << part;
+  }
+  EXPECT_EQ(printed("-h"), help);
+  const std::string generate = printed("generate --help");
+  for (const char* const part : {"Usage: orva-catalog generate", "MOUNT", "--files", "--per-folder",
+                                 "--names", "--tree", "--restamp"}) {
+    EXPECT_NE(generate.find(part), std::string::npos) << part;
+  }
+  EXPECT_EQ(printed("--version"), "orva-catalog " ORVA_CATALOG_VERSION "\n");
+}
+
 TEST_F(OrvaCatalog, TheProgramsExitStatusTellsUsageFromFailure) {
-  const Outcome help = RunProgram("--help");
-  EXPECT_EQ(help.status, 0);
-  EXPECT_EQ(help.output, catalog::HELP);
   const Outcome usage = RunProgram("index");
   EXPECT_EQ(usage.status, 2);
-  EXPECT_EQ(usage.output, "orva-catalog: index needs the mount point of a volume\n"
+  EXPECT_EQ(usage.output, "orva-catalog: MOUNT is required\n"
                           "Try 'orva-catalog --help'.\n");
   const Outcome absent = RunProgram("index /absent");
   EXPECT_EQ(absent.status, 1);

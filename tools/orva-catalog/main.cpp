@@ -3,6 +3,8 @@
 #include "Indexer.h"
 #include "Options.h"
 
+#include "commandline/UsageError.h"
+
 #include "orvadb/VolumeDB.h"
 
 #include "orvautil/Core.h"
@@ -97,9 +99,6 @@ void Restamp(const std::string& volume) {
 
 void Run(const catalog::Options& options) {
   switch (options.command) {
-  case catalog::Command::Help:
-    std::cout << catalog::HELP;
-    break;
   case catalog::Command::Index:
     Index(FindVolume(options.mountPoint));
     break;
@@ -116,9 +115,11 @@ void Run(const catalog::Options& options) {
 
 int main(int argc, char** argv) {
   try {
-    Run(catalog::ParseOptions(std::vector<std::string>(argv + 1, argv + argc)));
+    if (const auto options = catalog::ParseOptions({argv + 1, argv + argc})) {
+      Run(*options);
+    }
     return 0;
-  } catch (const catalog::UsageError& error) {
+  } catch (const commandline::UsageError& error) {
     std::cerr << "orva-catalog: " << error.what() << "\nTry 'orva-catalog --help'.\n";
     return 2;
   } catch (const std::exception& error) {
