@@ -1,3 +1,4 @@
+#include "commandline/UsageError.h"
 #include "orva-notify/Client.h"
 #include "orva-notify/CommandLine.h"
 #include "orva-notify/Control.h"
@@ -202,53 +203,68 @@ TEST(CommandLine, KnowsEachEvent) {
       {"scanned", Event::Scanned}, {"transcoded", Event::TranscodedBatch},
       {"end", Event::End},         {"purged", Event::Purged}};
   for (const auto& [word, event] : words) {
-    const CommandLine command = ParseCommandLine({"send", word, "/shares/A"});
-    EXPECT_EQ(command.action, CommandLine::Action::Send);
-    EXPECT_EQ(command.event, event) << word;
-    EXPECT_EQ(command.mountPoint, "/shares/A");
+    const auto command = ParseCommandLine({"send", word, "/shares/A"});
+    ASSERT_TRUE(command) << word;
+    EXPECT_EQ(command->action, CommandLine::Action::Send);
+    EXPECT_EQ(command->event, event) << word;
+    EXPECT_EQ(command->mountPoint, "/shares/A");
   }
 }
 
-TEST(CommandLine, TakesOptionsBeforeAndBehindTheOperands) {
-  const CommandLine command =
-      ParseCommandLine({"send", "--clients", "3", "scanned", "", "--wait", "7"});
-  EXPECT_EQ(command.event, Event::Scanned);
-  EXPECT_EQ(command.mountPoint, "");
-  EXPECT_EQ(command.clients, 3U);
-  EXPECT_EQ(command.wait, std::chrono::seconds(7));
+TEST(CommandLine, TakesOptionsBeforeAndAfterTheOperands) {
+  const auto command = ParseCommandLine({"send", "--clients", "3", "scanned", "", "--wait", "7"});
+  ASSERT_TRUE(command);
+  EXPECT_EQ(command->event, Event::Scanned);
+  EXPECT_EQ(command->mountPoint, "");
+  EXPECT_EQ(command->clients, 3U);
+  EXPECT_EQ(command->wait, std::chrono::seconds(7));
 
-  const CommandLine raw = ParseCommandLine({"send", "--raw", "-"});
-  EXPECT_EQ(raw.event, std::nullopt);
-  EXPECT_EQ(raw.rawFile, "-");
-  EXPECT_EQ(raw.wait, std::chrono::seconds(10));
+  const auto raw = ParseCommandLine({"send", "--raw", "-"});
+  ASSERT_TRUE(raw);
+  EXPECT_EQ(raw->event, std::nullopt);
+  EXPECT_EQ(raw->rawFile, "-");
+  EXPECT_EQ(raw->wait, std::chrono::seconds(10));
 
-  EXPECT_TRUE(ParseCommandLine({"serve", "--watch"}).watch);
-  EXPECT_FALSE(ParseCommandLine({"serve"}).watch);
-  EXPECT_EQ(ParseCommandLine({"drop"}).action, CommandLine::Action::Drop);
-  EXPECT_EQ(ParseCommandLine({"send", "--help"}).action, CommandLine::Action::Help);
+  EXPECT_TRUE(ParseCommandLine({"serve", "--watch"})->watch);
+  EXPECT_FALSE(ParseCommandLine({"serve"})->watch);
+  EXPECT_EQ(ParseCommandLine({"serve"})->action, CommandLine::Action::Serve);
+  EXPECT_EQ(ParseCommandLine({"drop"})->action, CommandLine::Action::Drop);
+  EXPECT_EQ(ParseCommandLine({"send", "--help"}), std::nullopt);
+}
+
+TEST(CommandLine, TakesDecimalNumbersAndTheLastOneCounts) {
+  const auto command =
+      ParseCommandLine({"drop", "--clients=1", "--clients=0100000", "--wait", "010"});
+  ASSERT_TRUE(command);
+  EXPECT_EQ(command->clients, 100'000U);
+  EXPECT_EQ(command->wait, std::chrono::seconds(10));
 }
 
 TEST(CommandLine, SaysWhatIsWrong) {
   const std::vector<std::pair<Arguments, std::string>> wrong = {
-      {{}, "missing command"},
-      {{"listen"}, "unknown command 'listen'"},
-      {{"send"}, "send takes an event and a mount point, or --raw FILE"},
-      {{"send", "plugged"}, "send takes an event and a mount point, or --raw FILE"},
-      {{"send", "Plugged", "/shares/A"}, "unknown event 'Plugged'"},
+      {{}, "A subcommand is required"},
+      {{"listen"}, "unexpected argument 'listen'"},
+      {{"send"}, "send: takes an event and a mount point, or --raw FILE"},
+      {{"send", "plugged"}, "send: takes an event and a mount point, or --raw FILE"},
+      {{"send", "Plugged", "/shares/A"}, "EVENT: unknown event 'Plugged'"},
       {{"send", "plugged", "/a", "/b"}, "unexpected argument '/b'"},
-      {{"send", "--raw"}, "missing file after --raw"},
-      {{"send", "--raw", "f", "plugged"}, "unexpected argument 'plugged'"},
-      {{"send", "--watch", "plugged", "/a"}, "unknown option '--watch'"},
-      {{"serve", "--clients", "1"}, "unknown option '--clients'"},
+      {{"send", "--raw"}, "--raw: 1 required FILE missing"},
+      {{"send", "--raw", ""}, "--raw: must not be empty"},
+      {{"send", "--raw=", "f"}, "--raw= has no value"},
+      {{"send", "--raw", "f", "plugged"}, "--raw excludes EVENT"},
+      {{"send", "--watch", "plugged", "/a"}, "unexpected argument '--watch'"},
+      {{"serve", "--clients", "1"}, "unexpected argument '--clients'"},
       {{"serve", "all"}, "unexpected argument 'all'"},
-      {{"drop", "--clients", "2x"}, "--clients takes a number up to 100000, not '2x'"},
-      {{"drop", "--wait", "-1"}, "--wait takes a number up to 100000, not '-1'"},
-      {{"drop", "--wait", "100001"}, "--wait takes a number up to 100000, not '100001'"}};
+      {{"drop", "--clients"}, "--clients: 1 required NUMBER missing"},
+      {{"drop", "--clients", "2x"}, "--clients: takes a number from 0 to 100000, not '2x'"},
+      {{"drop", "--clients", "0x2"}, "--clients: takes a number from 0 to 100000, not '0x2'"},
+      {{"drop", "--wait", "-1"}, "--wait: takes a number from 0 to 100000, not '-1'"},
+      {{"drop", "--wait", "100001"}, "--wait: takes a number from 0 to 100000, not '100001'"}};
   for (const auto& [arguments, message] : wrong) {
     try {
       ParseCommandLine(arguments);
       ADD_FAILURE() << "accepted instead of: " << message;
-    } catch (const UsageError& error) {
+    } catch (const commandline::UsageError& error) {
       EXPECT_EQ(error.what(), message);
     }
   }
@@ -355,10 +371,13 @@ TEST_F(OrvaNotify, SendFailsWhenNoServiceListens) {
 TEST_F(OrvaNotify, WrongUsageIsToldFromFailure) {
   const Outcome wrong = RunNotify({"send", "exploded", "/shares/A"});
   EXPECT_EQ(wrong.status, 2);
-  EXPECT_EQ(wrong.line, "orva-notify: unknown event 'exploded'; orva-notify --help says more");
+  EXPECT_EQ(wrong.line, "orva-notify: EVENT: unknown event 'exploded'");
   const Outcome help = RunNotify({"--help"});
   EXPECT_EQ(help.status, 0);
   EXPECT_THAT(help.line, HasSubstr("notification service"));
+  const Outcome version = RunNotify({"--version"});
+  EXPECT_EQ(version.status, 0);
+  EXPECT_EQ(version.line, "orva-notify " ORVA_NOTIFY_VERSION);
 }
 
 TEST_F(OrvaNotify, WaitsForTheClientsItIsToldOf) {

@@ -1,6 +1,6 @@
 #include "Options.h"
 
-#include "commandline/CommandLine.h"
+#include "commandline/Parse.h"
 
 namespace orva::catalog {
 namespace {

@@ -1,3 +1,4 @@
+#include "commandline/UsageError.h"
 #include "orva-notify/CommandLine.h"
 #include "orva-notify/Control.h"
 #include "orva-notify/Service.h"
@@ -57,9 +58,6 @@ void Drop(const CommandLine& command) {
 
 void Execute(const CommandLine& command) {
   switch (command.action) {
-  case CommandLine::Action::Help:
-    std::cout << HELP;
-    break;
   case CommandLine::Action::Serve:
     Serve(command);
     break;
@@ -78,10 +76,12 @@ int main(int count, char* arguments[]) {
   // A reader of our lines that goes away must not end the service.
   std::signal(SIGPIPE, SIG_IGN);
   try {
-    Execute(ParseCommandLine({arguments + 1, arguments + count}));
+    if (const auto command = ParseCommandLine({arguments + 1, arguments + count})) {
+      Execute(*command);
+    }
     return EXIT_SUCCESS;
-  } catch (const UsageError& error) {
-    std::cerr << "orva-notify: " << error.what() << "; orva-notify --help says more\n";
+  } catch (const orva::commandline::UsageError& error) {
+    std::cerr << "orva-notify: " << error.what() << "\nTry 'orva-notify --help'.\n";
     return EXIT_USAGE;
   } catch (const std::exception& error) {
     std::cerr << "orva-notify: " << error.what() << '\n';
