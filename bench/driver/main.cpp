@@ -6,6 +6,8 @@
 #include "Options.h"
 #include "Report.h"
 
+#include "commandline/UsageError.h"
+
 #include <exception>
 #include <fstream>
 #include <iostream>
@@ -32,14 +34,11 @@ void Run(const Options& options) {
 
 int main(int argc, char** argv) {
   try {
-    const Options options = ParseOptions(std::vector<std::string>(argv + 1, argv + argc));
-    if (options.help) {
-      std::cout << HELP;
-    } else {
-      Run(options);
+    if (const auto options = ParseOptions({argv + 1, argv + argc})) {
+      Run(*options);
     }
     return 0;
-  } catch (const std::invalid_argument& error) {
+  } catch (const orva::commandline::UsageError& error) {
     std::cerr << "bench: " << error.what() << "\nTry 'bench --help'.\n";
     return 2;
   } catch (const std::exception& error) {
