@@ -25,7 +25,7 @@ namespace {
 
 using namespace orva;
 
-/// The volume's mount point without links; throws when it is no directory.
+/// The volume's mount point with all links resolved. Throws when it is not a directory.
 std::string FindVolume(const std::string& mountPoint) {
   std::string volume = util::Path(mountPoint).Canonicalize();
   if (volume.empty() || !std::filesystem::is_directory(volume)) {
@@ -34,7 +34,7 @@ std::string FindVolume(const std::string& mountPoint) {
   return volume;
 }
 
-/// A line on the terminal that shows how far a run has come, gone again at its end.
+/// A line on the terminal that shows the progress of a run. It is erased at the end.
 class ProgressLine {
 public:
   ProgressLine() : isTerminal_(isatty(STDERR_FILENO) == 1) {}
