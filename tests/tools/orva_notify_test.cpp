@@ -47,7 +47,7 @@ using testing::Pair;
 using Arguments = std::vector<std::string>;
 using Clock = std::chrono::steady_clock;
 
-/// Waits for `descriptor` to be readable; false when the deadline has passed.
+/// Waits until `descriptor` is readable. Returns false when the deadline has passed.
 bool IsReadable(int descriptor, Clock::time_point deadline) {
   const auto left = std::chrono::ceil<std::chrono::milliseconds>(deadline - Clock::now());
   pollfd ready{.fd = descriptor, .events = POLLIN, .revents = 0};
@@ -59,10 +59,10 @@ Arguments Notify(Arguments arguments) {
   return arguments;
 }
 
-/// What a command came to.
+/// The result of a command.
 struct Outcome {
   int status = 0;
-  std::string line; ///< the first that it printed
+  std::string line; ///< the first line of its output
 };
 
 Outcome RunNotify(const Arguments& arguments, const std::string& input = "/dev/null") {
@@ -71,7 +71,7 @@ Outcome RunNotify(const Arguments& arguments, const std::string& input = "/dev/n
   return {program.WaitForEnd(), line};
 }
 
-/// A client of the service, as the daemon is one.
+/// A client of the service, like the daemon.
 class Listener {
 public:
   Listener() : socket_(util::Socket::Address(ORVA_NOTIFICATION_SOCKET), false) {}
@@ -175,13 +175,13 @@ TEST(Notification, GivesATranscodedBatchItsProfile) {
             "<profile>cb62bbdd389b48898f2e5244977cb2c5</profile></ORVANotification>");
 }
 
-TEST(Notification, EncodesWhatXmlOrTheEncodingCouldMistake) {
+TEST(Notification, EncodesWhatIsSpecialInXmlOrInTheEncoding) {
   EXPECT_EQ(Compose(Event::End, "/shares/a b%41&<\">'+\n\xC3\xA4"),
             "<ORVANotification Name=\"End\" "
             "MountPoint=\"/shares/a%20b%2541%26%3C%22%3E%27%2B%0A%C3%A4\"/>");
 }
 
-TEST(Notification, EveryByteOfAMountPointComesBackDecoded) {
+TEST(Notification, EveryByteOfAMountPointIsDecodedAgain) {
   std::string mountPoint = "/";
   for (int byte = 1; byte < 256; ++byte) {
     mountPoint += static_cast<char>(byte);
@@ -293,7 +293,7 @@ TEST(MountInfo, DecodesTheKernelsEscapes) {
                           Pair("/shares/tail\\04", 32)));
 }
 
-TEST(MountInfo, SeesTheMountOnTopAndNothingHidden) {
+TEST(MountInfo, HoldsTheTopMountAndNoHiddenOnes) {
   EXPECT_THAT(VolumesOf("31 1 0:6 / /shares/A rw - tmpfs x y\n"
                         "32 1 0:7 / /shares rw - tmpfs x y\n"
                         "33 32 0:8 / /shares/B rw - tmpfs x y\n"
@@ -301,19 +301,19 @@ TEST(MountInfo, SeesTheMountOnTopAndNothingHidden) {
               ElementsAre(Pair("/shares/B", 34)));
 }
 
-TEST(MountInfo, PassesOverWhatItCannotRead) {
+TEST(MountInfo, SkipsMalformedLines) {
   EXPECT_THAT(VolumesOf("\nnonsense\n31 1 0:6\n32 1 0:6 / /shares/A rw - tmpfs x y\n"),
               ElementsAre(Pair("/shares/A", 32)));
 }
 
-TEST(MountInfo, AnotherMountAtTheSamePlaceIsUnpluggedAndPlugged) {
+TEST(MountInfo, AnotherMountOnAMountPointIsUnpluggedAndPlugged) {
   const VolumeChanges changes = Compare({{"/shares/A", 1}, {"/shares/B", 2}, {"/shares/C", 3}},
                                         {{"/shares/B", 2}, {"/shares/C", 7}, {"/shares/D", 8}});
   EXPECT_THAT(changes.unplugged, ElementsAre("/shares/A", "/shares/C"));
   EXPECT_THAT(changes.plugged, ElementsAre("/shares/C", "/shares/D"));
 }
 
-TEST_F(OrvaNotify, SendsEachClientWhatItIsHanded) {
+TEST_F(OrvaNotify, SendsEveryMessageToEachClient) {
   Serve();
   Listener one;
   Listener two;
@@ -327,7 +327,7 @@ TEST_F(OrvaNotify, SendsEachClientWhatItIsHanded) {
   }
 }
 
-TEST_F(OrvaNotify, PrintsALineForWhatHappens) {
+TEST_F(OrvaNotify, PrintsALineForEachEvent) {
   Serve();
   Listener client;
   EXPECT_EQ(service_->ReadLine(), "client 1 connected");
@@ -368,7 +368,7 @@ TEST_F(OrvaNotify, SendFailsWhenNoServiceListens) {
                               ": No such file or directory");
 }
 
-TEST_F(OrvaNotify, WrongUsageIsToldFromFailure) {
+TEST_F(OrvaNotify, TheExitStatusDistinguishesWrongUsageFromFailure) {
   const Outcome wrong = RunNotify({"send", "exploded", "/shares/A"});
   EXPECT_EQ(wrong.status, 2);
   EXPECT_EQ(wrong.line, "orva-notify: EVENT: unknown event 'exploded'");
@@ -380,7 +380,7 @@ TEST_F(OrvaNotify, WrongUsageIsToldFromFailure) {
   EXPECT_EQ(version.line, "orva-notify " ORVA_NOTIFY_VERSION);
 }
 
-TEST_F(OrvaNotify, WaitsForTheClientsItIsToldOf) {
+TEST_F(OrvaNotify, WaitsForTheGivenNumberOfClients) {
   Serve();
   Listener one;
   const Outcome tooFew =
@@ -398,7 +398,7 @@ TEST_F(OrvaNotify, WaitsForTheClientsItIsToldOf) {
   EXPECT_EQ(two.ReadMessage(), Compose(Event::Plugged, "/shares/A"));
 }
 
-TEST_F(OrvaNotify, DropClosesTheClientsAndGoesOnListening) {
+TEST_F(OrvaNotify, DropClosesTheClientsAndTheServiceListensOn) {
   Serve();
   Listener one;
   Listener two;
@@ -424,7 +424,7 @@ TEST_F(OrvaNotify, StopsCleanlyOnBothSignals) {
   }
 }
 
-TEST_F(OrvaNotify, TakesThePlaceOfAServiceThatWasKilled) {
+TEST_F(OrvaNotify, ReplacesTheSocketOfAServiceThatWasKilled) {
   Serve();
   service_->Signal(SIGKILL);
   EXPECT_EQ(service_->WaitForEnd(), 128 + SIGKILL);
@@ -433,7 +433,7 @@ TEST_F(OrvaNotify, TakesThePlaceOfAServiceThatWasKilled) {
   EXPECT_TRUE(Listener().IsConnected());
 }
 
-TEST_F(OrvaNotify, RefusesToServeBesideAnother) {
+TEST_F(OrvaNotify, FailsWhenAnotherServiceListens) {
   Serve();
   const Outcome second = RunNotify({"serve"});
   EXPECT_EQ(second.status, 1);
@@ -442,7 +442,7 @@ TEST_F(OrvaNotify, RefusesToServeBesideAnother) {
   EXPECT_EQ(RunNotify({"send", "end", "/shares/A"}).line, "sent to 1 client");
 }
 
-TEST_F(OrvaNotify, LeavesAFileThatIsNoSocketAlone) {
+TEST_F(OrvaNotify, DoesNotReplaceAFileThatIsNotASocket) {
   std::filesystem::create_directories(
       std::filesystem::path(ORVA_NOTIFICATION_SOCKET).parent_path());
   std::ofstream(ORVA_NOTIFICATION_SOCKET) << "precious";
@@ -482,7 +482,7 @@ TEST_F(OrvaNotify, RefusesAMessageThatIsTooLong) {
             "orva-notify: A message of 67108865 bytes is too long, 67108864 are allowed");
 }
 
-TEST_F(OrvaNotify, SurvivesARequestThatIsNone) {
+TEST_F(OrvaNotify, SurvivesMalformedRequests) {
   Serve();
   const std::vector<std::string> texts = {"hello\n", "send 0 99999999999\n", "send 0 1\nxy",
                                           std::string(64, 'x')};
@@ -497,7 +497,7 @@ TEST_F(OrvaNotify, SurvivesARequestThatIsNone) {
   EXPECT_EQ(RunNotify({"send", "end", "/shares/A"}).line, "sent to 0 clients");
 }
 
-TEST_F(OrvaNotify, GoesOnWhenNobodyReadsItsLines) {
+TEST_F(OrvaNotify, ContinuesWhenItsOutputIsClosed) {
   Serve();
   service_->CloseOutput();
   Listener client;
@@ -505,12 +505,13 @@ TEST_F(OrvaNotify, GoesOnWhenNobodyReadsItsLines) {
   EXPECT_EQ(RunNotify({"send", "end", "/shares/B"}).line, "sent to 1 client");
 }
 
-TEST_F(OrvaNotify, GoesOnWhenDescriptorsRunOut) {
+TEST_F(OrvaNotify, ContinuesWhenDescriptorsRunOut) {
   service_ = std::make_unique<Program>(
       Arguments{"/bin/sh", "-c", "ulimit -n 12; exec " ORVA_NOTIFY_PROGRAM " serve"});
   ASSERT_EQ(service_->ReadLine(), "listening on " + ORVA_NOTIFICATION_SOCKET);
   {
-    // The sanitizer opens a pipe when it first meets an object of a class: none may be new later.
+    // The sanitizer opens a pipe when it checks the first object of a class. That must happen now,
+    // while there are free descriptors.
     const Listener first;
     EXPECT_EQ(RunNotify({"send", "end", "/shares/A"}).line, "sent to 1 client");
   }
@@ -536,20 +537,20 @@ TEST_F(OrvaNotify, AnnouncesMountsAndUnmountsBelowShares) {
   EXPECT_EQ(service_->ReadLineWith("seen"), "unplugged seen: /shares/My Photos");
 }
 
-TEST_F(OrvaNotify, TellsANewClientOfThePresentVolumesFirst) {
+TEST_F(OrvaNotify, AnnouncesMountedVolumesToANewClientFirst) {
   const Volume b("/shares/B");
   Serve({"--watch"});
   const Volume a("/shares/A");
   Listener client;
   EXPECT_EQ(RunNotify({"send", "scanned", "/shares/A"}).line, "sent to 1 client");
   std::vector<std::string> messages{client.ReadMessage(), client.ReadMessage()};
-  std::sort(messages.begin(), messages.end());
+  std::ranges::sort(messages);
   EXPECT_THAT(messages, ElementsAre(Compose(Event::Plugged, "/shares/A"),
                                     Compose(Event::Plugged, "/shares/B")));
   EXPECT_EQ(client.ReadMessage(), Compose(Event::Scanned, "/shares/A"));
 }
 
-TEST_F(OrvaNotify, AnnouncesAMountInPlaceOfAnother) {
+TEST_F(OrvaNotify, AnnouncesAMountOnTopOfAnother) {
   const Volume lower("/shares/A");
   Serve({"--watch"});
   Listener client;
@@ -559,7 +560,7 @@ TEST_F(OrvaNotify, AnnouncesAMountInPlaceOfAnother) {
   EXPECT_EQ(client.ReadMessage(), Compose(Event::Plugged, "/shares/A"));
 }
 
-TEST_F(OrvaNotify, SaysNothingOfMountsUnlessItWatches) {
+TEST_F(OrvaNotify, AnnouncesNoMountsWithoutWatch) {
   const Volume before("/shares/A");
   Serve();
   Listener client;

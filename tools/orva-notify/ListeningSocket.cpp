@@ -24,7 +24,7 @@ bool IsSocket(const std::string& path) {
   return lstat(path.c_str(), &status) == 0 && S_ISSOCK(status.st_mode);
 }
 
-// What a service that was killed left behind refuses connections.
+// The socket of a service that was killed refuses connections.
 void RemoveStaleSocket(const std::string& path) {
   const util::ClientSocket probe(util::Socket::Address(path), true);
   if (!probe.IsOpen() && errno == ECONNREFUSED && IsSocket(path)) {

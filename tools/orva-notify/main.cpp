@@ -47,12 +47,13 @@ void PrintCount(const char* what, std::size_t count) {
 }
 
 void Send(const CommandLine& command) {
-  const Request request{Request::Kind::Send, command.clients, MessageOf(command)};
+  const Request request{
+      .kind = Request::Kind::Send, .clients = command.clients, .message = MessageOf(command)};
   PrintCount("sent to", Ask(ORVA_NOTIFICATION_SOCKET, request, command.wait));
 }
 
 void Drop(const CommandLine& command) {
-  const Request request{Request::Kind::Drop, command.clients, {}};
+  const Request request{.kind = Request::Kind::Drop, .clients = command.clients};
   PrintCount("dropped", Ask(ORVA_NOTIFICATION_SOCKET, request, command.wait));
 }
 
@@ -73,7 +74,7 @@ void Execute(const CommandLine& command) {
 } // namespace
 
 int main(int count, char* arguments[]) {
-  // A reader of our lines that goes away must not end the service.
+  // The service continues when its standard output is a pipe that was closed.
   std::signal(SIGPIPE, SIG_IGN);
   try {
     if (const auto command = ParseCommandLine({arguments + 1, arguments + count})) {
