@@ -13,8 +13,8 @@ std::optional<Options> ParseOptions(const std::vector<std::string>& arguments) {
   bool quick = false;
   long long limit = options.limit.count();
 
-  CLI::App app("Measures the daemon beside the floor and the horizon; doc/performance.md says what "
-               "the figures mean.",
+  CLI::App app("Compares the daemon with the floor and the horizon; doc/performance.md explains "
+               "the figures.",
                "bench");
   app.set_version_flag("--version", "bench " BENCH_VERSION);
   app.add_flag("--quick", quick, "Leave out the catalogs of 1,000,000 files");

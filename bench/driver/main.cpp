@@ -1,5 +1,5 @@
-// Measures the daemon beside what SQLite needs for the same work. Runs in a private root, started
-// by scripts/bench in the checkout.
+// Compares the daemon with what SQLite needs for the same work. scripts/bench starts it in a
+// private root, in the checkout.
 
 #include "Measurements.h"
 #include "MicroResults.h"

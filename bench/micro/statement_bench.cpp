@@ -1,5 +1,5 @@
-// A statement by the database layer, which compiles a text once, and by SQLite's own interface,
-// compiled each time it is used.
+// Compares a statement of the database layer, which compiles a text once, with one of SQLite's C
+// interface, compiled for each use.
 
 #include "orvadb/DB.h"
 #include "orvadb/Statement.h"
@@ -22,7 +22,7 @@ const char* const ROW = "INSERT INTO Folders(parent_folder_id, name, modified_da
 const char* const QUERY = "select * FROM Folders where name = ?";
 const std::string PATH = "/shares/A/Pictures/";
 
-/// A database in a file of its own, /tmp being in memory.
+/// A database in a file in /tmp, which is in memory.
 class OneFolder : public db::DB {
 public:
   OneFolder() {
