@@ -1,9 +1,6 @@
 #include "orva-notify/MountInfo.h"
 
-#include <algorithm>
 #include <istream>
-#include <iterator>
-#include <ranges>
 #include <sstream>
 
 namespace orva::notify {
@@ -39,10 +36,14 @@ bool IsDirectlyBelowShares(const std::string& mountPoint) {
 
 /// The mount points of the mounts that are in `volumes` and not in `others`.
 std::vector<std::string> MountPointsOnlyIn(const Volumes& volumes, const Volumes& others) {
-  std::vector<Volumes::value_type> mounts;
-  std::ranges::set_difference(volumes, others, std::back_inserter(mounts));
-  const auto mountPoints = std::views::keys(mounts);
-  return {mountPoints.begin(), mountPoints.end()};
+  std::vector<std::string> mountPoints;
+  for (const auto& [mountPoint, id] : volumes) {
+    const auto other = others.find(mountPoint);
+    if (other == others.end() || other->second != id) {
+      mountPoints.push_back(mountPoint);
+    }
+  }
+  return mountPoints;
 }
 
 } // namespace
