@@ -207,8 +207,8 @@ private:
   void RequireFiles(long long files) const {
     db::DB database;
     database.Open(DatabaseFile());
-    db::Statement count(database, "SELECT count(*) FROM Files", __FILE__, __LINE__);
-    if (!count.Fetch(__FILE__, __LINE__) || count.GetInt64(0) != files) {
+    db::Statement count(database, "SELECT count(*) FROM Files");
+    if (!count.Fetch() || count.GetInt64(0) != files) {
       throw std::runtime_error("the merged database of " + shape_ + " does not have " +
                                std::to_string(files) + " files");
     }

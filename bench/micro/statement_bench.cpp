@@ -28,7 +28,7 @@ public:
   OneFolder() {
     Open("/tmp/micro.db");
     for (const char* const sql : {"DROP TABLE IF EXISTS Folders", TABLE, INDEX, ROW}) {
-      db::Statement(*this, sql, __FILE__, __LINE__).Execute(__FILE__, __LINE__);
+      db::Statement(*this, sql).Execute();
     }
   }
 
@@ -38,9 +38,9 @@ public:
 void KeptStatement(benchmark::State& state) {
   const OneFolder database;
   while (state.KeepRunning()) {
-    db::Statement query(database, QUERY, __FILE__, __LINE__);
-    query.BindText(1, PATH, __FILE__, __LINE__);
-    if (!query.Fetch(__FILE__, __LINE__)) {
+    db::Statement query(database, QUERY);
+    query.BindText(1, PATH);
+    if (!query.Fetch()) {
       state.SkipWithError("no row");
     }
     benchmark::DoNotOptimize(query.GetInt64(0));

@@ -109,11 +109,10 @@ protected:
         "SELECT f.path, f.isDeleted, t.lastUpdatedDate from Files f, Transcodings t "
         "WHERE f.id = t.sourceId AND t.lastUpdatedDate > ? "
         "AND t.profile = 'cb62bbdd389b48898f2e5244977cb2c5' AND "
-        "((f.isDeleted = 0 and t.status = 1) OR (f.isDeleted = 1 and t.status = 0)) ORDER BY 1",
-        __FILE__, __LINE__);
-    statement.BindTime(1, since, __FILE__, __LINE__);
+        "((f.isDeleted = 0 and t.status = 1) OR (f.isDeleted = 1 and t.status = 0)) ORDER BY 1");
+    statement.BindTime(1, since);
     Lines lines;
-    while (statement.Fetch(__FILE__, __LINE__)) {
+    while (statement.Fetch()) {
       lines.push_back(statement.GetText(0) + '|' + statement.GetText(1) + '|' +
                       statement.GetText(2));
     }
@@ -208,14 +207,14 @@ TEST_F(OrvaCatalog, ReadersSeeTheLastCompleteStateWhileARunWrites) {
   Write("a.jpg");
   Index();
   const auto writer = Open();
-  db::Transaction writing(*writer, 0, __FILE__, __LINE__);
+  db::Transaction writing(*writer, 0);
   catalog::Execute(*writer, "DELETE FROM Files");
 
   const db::VolumeDB reader(volume_.native(), false);
   {
-    const db::Transaction reading(reader, 0, __FILE__, __LINE__);
+    const db::Transaction reading(reader, 0);
     EXPECT_EQ(SelectNumber(reader, "SELECT count(*) FROM Files"), 1);
-    writing.Commit(__FILE__, __LINE__);
+    writing.Commit();
     EXPECT_EQ(SelectNumber(reader, "SELECT count(*) FROM Files"), 1);
   }
   EXPECT_EQ(SelectNumber(reader, "SELECT count(*) FROM Files"), 0);

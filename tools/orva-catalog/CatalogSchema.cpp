@@ -20,7 +20,7 @@ void CreateHome(const std::string& mountPoint) {
   std::error_code error;
   std::filesystem::create_directory(home, error);
   if (error) {
-    throw util::Exception(home + ": " + error.message(), __FILE__, __LINE__);
+    throw util::Exception(home + ": " + error.message());
   }
 }
 
@@ -37,10 +37,10 @@ std::unique_ptr<db::VolumeDB> OpenCatalog(const std::string& mountPoint) {
 }
 
 void CreateSchema(const db::DB& catalog) {
-  db::Transaction transaction(catalog, BUSY_TIMEOUT, __FILE__, __LINE__);
+  db::Transaction transaction(catalog, BUSY_TIMEOUT);
   CreateTables(catalog);
   CreateIndexes(catalog);
-  transaction.Commit(__FILE__, __LINE__);
+  transaction.Commit();
 }
 
 void CreateTables(const db::DB& catalog) {

@@ -90,21 +90,21 @@ private:
 } // namespace
 
 long long Generate(const db::DB& catalog, const GeneratorPlan& plan, std::time_t now) {
-  db::Transaction transaction(catalog, BUSY_TIMEOUT, __FILE__, __LINE__);
+  db::Transaction transaction(catalog, BUSY_TIMEOUT);
   const std::time_t stamp = NextStamp(catalog, now);
   DropTables(catalog);
   CreateTables(catalog);
   const long long folders = Generation(catalog, plan, stamp).Run();
   CreateIndexes(catalog);
-  transaction.Commit(__FILE__, __LINE__);
+  transaction.Commit();
   return folders;
 }
 
 long long Restamp(const db::DB& catalog, std::time_t now) {
-  db::Transaction transaction(catalog, BUSY_TIMEOUT, __FILE__, __LINE__);
+  db::Transaction transaction(catalog, BUSY_TIMEOUT);
   Execute(catalog, "UPDATE Transcodings SET lastUpdatedDate = ?", NextStamp(catalog, now));
   const long long count = SelectNumber(catalog, "SELECT count(*) FROM Transcodings");
-  transaction.Commit(__FILE__, __LINE__);
+  transaction.Commit();
   return count;
 }
 

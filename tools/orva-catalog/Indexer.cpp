@@ -35,12 +35,12 @@ Indexer::Indexer(const db::DB& catalog, std::string mountPoint, std::time_t now,
       progress_(std::move(progress)) {}
 
 IndexSummary Indexer::Run() {
-  db::Transaction transaction(catalog_, BUSY_TIMEOUT, __FILE__, __LINE__);
+  db::Transaction transaction(catalog_, BUSY_TIMEOUT);
   stamp_ = NextStamp(catalog_, now_);
   LoadRows();
   Visit(Place());
   DeleteVanished();
-  transaction.Commit(__FILE__, __LINE__);
+  transaction.Commit();
   return summary_;
 }
 
@@ -211,7 +211,7 @@ void Indexer::DeleteVanished() {
 void Indexer::LeaveAlone(const std::string& path, const std::string& reason) {
   const std::string message = util::MakePath(mountPoint_, path) + ": " + reason;
   if (path.empty()) {
-    throw util::Exception(message, __FILE__, __LINE__);
+    throw util::Exception(message);
   }
   summary_.unreadable.push_back(message);
   leftAlone_.push_back(path.ends_with('/') ? path.substr(0, path.size() - 1) : path);

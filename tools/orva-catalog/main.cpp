@@ -29,7 +29,7 @@ using namespace orva;
 std::string FindVolume(const std::string& mountPoint) {
   std::string volume = util::Path(mountPoint).Canonicalize();
   if (volume.empty() || !std::filesystem::is_directory(volume)) {
-    throw util::Exception(mountPoint + " is not a directory", __FILE__, __LINE__);
+    throw util::Exception(mountPoint + " is not a directory");
   }
   return volume;
 }
@@ -89,7 +89,7 @@ void Generate(const std::string& volume, const catalog::GeneratorPlan& plan) {
 
 void Restamp(const std::string& volume) {
   if (!std::filesystem::exists(core::GetCatalogPath(volume))) {
-    throw util::Exception(volume + " has no catalog", __FILE__, __LINE__);
+    throw util::Exception(volume + " has no catalog");
   }
   const auto database = catalog::OpenCatalog(volume);
   const long long count = catalog::Restamp(*database, std::time(nullptr));

@@ -82,8 +82,7 @@ std::optional<std::string> ReceiveLine(util::Socket& socket, Clock::time_point d
           ? util::FormatString("No answer from the notification service within %lld s",
                                static_cast<long long>(wait.count()))
           : util::FormatString("Fewer than %zu clients connected within %lld s", request.clients,
-                               static_cast<long long>(wait.count())),
-      __FILE__, __LINE__);
+                               static_cast<long long>(wait.count())));
 }
 
 } // namespace
@@ -95,15 +94,13 @@ std::string ControlAddress(const std::string& address) {
 std::size_t Ask(const std::string& address, const Request& request, std::chrono::seconds wait) {
   if (request.message.size() > MAXIMUM_QUEUED_BYTES) {
     throw util::Exception(util::FormatString("A message of %zu bytes is too long, %zu are allowed",
-                                             request.message.size(), MAXIMUM_QUEUED_BYTES),
-                          __FILE__, __LINE__);
+                                             request.message.size(), MAXIMUM_QUEUED_BYTES));
   }
   const auto deadline = Clock::now() + wait;
   util::ClientSocket socket(util::Socket::Address(ControlAddress(address)), true);
   if (!socket.IsOpen()) {
     throw util::Exception(
-        util::FormatString("No orva-notify serves %s: %s", address.c_str(), strerror(errno)),
-        __FILE__, __LINE__);
+        util::FormatString("No orva-notify serves %s: %s", address.c_str(), strerror(errno)));
   }
   if (!SendAll(socket, Encode(request), deadline)) {
     ThrowTooLate(request, wait);
@@ -113,7 +110,7 @@ std::size_t Ask(const std::string& address, const Request& request, std::chrono:
     ThrowTooLate(request, wait);
   }
   if (answer->empty()) {
-    throw util::Exception("The notification service hung up without an answer", __FILE__, __LINE__);
+    throw util::Exception("The notification service hung up without an answer");
   }
   return std::stoul(*answer);
 }

@@ -56,8 +56,7 @@ void ListeningSocket::Bind() {
   if (!isBound_ || listen(Descriptor(), SOMAXCONN) != 0) {
     const char* const reason =
         errno == EADDRINUSE ? "something else is there, perhaps another service" : strerror(errno);
-    throw util::Exception(util::FormatString("Cannot listen on %s: %s", address_.c_str(), reason),
-                          __FILE__, __LINE__);
+    throw util::Exception(util::FormatString("Cannot listen on %s: %s", address_.c_str(), reason));
   }
 }
 

@@ -29,7 +29,7 @@ std::string ReadFile(const std::string& name) {
   std::ifstream file(name, std::ios::binary);
   std::string content = ReadAll(file);
   if (!file) {
-    throw orva::util::Exception("Cannot read '" + name + "'", __FILE__, __LINE__);
+    throw orva::util::Exception("Cannot read '" + name + "'");
   }
   return content;
 }
