@@ -1,5 +1,6 @@
 #pragma once
 
+#include "orvautil/FileDescriptor.h"
 #include "orvautil/Socket.h"
 
 #include <cstddef>
@@ -19,8 +20,9 @@ constexpr std::size_t MAXIMUM_QUEUED_BYTES = std::size_t{64} * 1024 * 1024;
 /// when the client has disconnected.
 class Client : public util::Socket {
 public:
-  /// Takes over `descriptor`. `number` identifies the client in the output.
-  Client(int descriptor, unsigned number) : Socket(descriptor), number_(number) {}
+  /// `number` identifies the client in the output.
+  Client(util::FileDescriptor connection, unsigned number)
+      : Socket(connection.Release()), number_(number) {}
 
   unsigned Number() const noexcept { return number_; }
 

@@ -1,5 +1,6 @@
 #pragma once
 
+#include "orvautil/FileDescriptor.h"
 #include "orvautil/Socket.h"
 
 #include <chrono>
@@ -32,8 +33,7 @@ std::size_t Ask(const std::string& address, const Request& request, std::chrono:
 /// sends anything that is not a request.
 class ControlConnection : public util::Socket {
 public:
-  /// Takes over `descriptor`.
-  explicit ControlConnection(int descriptor) : Socket(descriptor) {}
+  explicit ControlConnection(util::FileDescriptor connection) : Socket(connection.Release()) {}
 
   /// Reads the available input.
   void ReadAvailable();

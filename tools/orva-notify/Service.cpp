@@ -14,6 +14,7 @@
 #include <cstring>
 #include <fstream>
 #include <iostream>
+#include <utility>
 
 namespace orva::notify {
 namespace {
@@ -115,7 +116,7 @@ void Service::Wait() {
 
 void Service::ReadRequests() {
   while (util::FileDescriptor connection = AcceptFrom(control_)) {
-    requests_.push_back(std::make_unique<ControlConnection>(connection.Release()));
+    requests_.push_back(std::make_unique<ControlConnection>(std::move(connection)));
   }
   for (const auto& request : requests_) {
     request->ReadAvailable();
@@ -142,7 +143,7 @@ void Service::FollowMounts() {
 
 void Service::AcceptClients() {
   while (util::FileDescriptor connection = AcceptFrom(notification_)) {
-    clients_.push_back(std::make_unique<Client>(connection.Release(), ++lastNumber_));
+    clients_.push_back(std::make_unique<Client>(std::move(connection), ++lastNumber_));
     Client& client = *clients_.back();
     Print(FormatString("client %u connected", client.Number()));
     for (const auto& [mountPoint, id] : volumes_) {
