@@ -44,7 +44,7 @@ private:
                                      "the other commands\nhand over, until SIGINT or SIGTERM");
     serve->add_flag("--watch", command_.watch,
                     "Also announce mounts and unmounts directly below /shares;\n"
-                    "a new client is first told of the volumes that are mounted");
+                    "a new client first receives the mounted volumes");
     serve->footer("Prints a line for each event.");
   }
 
@@ -77,8 +77,9 @@ private:
   }
 
   void AddDrop() {
-    drop_ = app_.add_subcommand("drop", "Close the connections of all clients; the service goes on "
-                                        "listening");
+    drop_ =
+        app_.add_subcommand("drop", "Close the connections of all clients; the service continues "
+                                    "to listen");
     AddRequestOptions(*drop_);
   }
 
