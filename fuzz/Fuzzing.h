@@ -5,9 +5,9 @@
 #include <string>
 #include <vector>
 
-// What the fuzz targets share. A target runs in a private root (scripts/fuzz). Linking this puts
-// another syslog in the place of the system's: lines are formatted, so that the sanitizers see
-// their arguments, and kept for the target.
+// What the fuzz targets share. A target runs in a private root (scripts/fuzz). Linking this
+// replaces the system's syslog: lines are formatted, so that the sanitizers see their arguments,
+// and kept for the target.
 
 /// The two functions of a target; the fuzzer calls them by these names.
 extern "C" int LLVMFuzzerInitialize(int* count, char*** arguments);
@@ -25,10 +25,10 @@ struct LogLine {
 /// What was logged since the last call; by one thread at a time.
 std::vector<LogLine> TakeLog();
 
-/// Gives the process a standard output of its own in memory, and empties that when called again.
+/// Makes standard output a file in memory, and empties that when called again.
 void ResetStandardOutput();
 
-/// Ends the process, which makes the input a finding, unless `holds`; `what` is what should.
+/// Unless `holds`, ends the process, which makes the input a finding. `what` says what should hold.
 void Require(bool holds, const char* what);
 
 } // namespace orva::fuzz

@@ -1,5 +1,5 @@
-// The bytes of a volume's catalog, through a whole merge into a merged database that is new each
-// time, out again, and through a second one.
+// The input is the catalog of a volume. It is merged into a new merged database, removed from it
+// and merged again.
 
 #include "Fuzzing.h"
 
@@ -7,6 +7,7 @@
 #include "PhotoDB.h"
 
 #include "orvautil/Core.h"
+#include "orvautil/FileDescriptor.h"
 
 #include <sqlite3.h>
 
@@ -36,14 +37,14 @@ std::string ReadFile(const std::string& path) {
   return {std::istreambuf_iterator<char>(file), {}};
 }
 
-/// Makes the database file hold these bytes, and takes away what SQLite left beside it.
+/// Replaces the content of a database file, and removes the files that SQLite left next to it.
 void WriteDatabase(const std::string& path, const void* data, std::size_t size) {
   for (const char* const suffix : {"-journal", "-wal", "-shm"}) {
     unlink((path + suffix).c_str());
   }
-  const int file = open(path.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0644);
-  Require(write(file, data, size) == static_cast<ssize_t>(size), "a file can be written");
-  close(file);
+  const util::FileDescriptor file(
+      open(path.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0644));
+  Require(write(file.Get(), data, size) == static_cast<ssize_t>(size), "a file can be written");
 }
 
 /// The merged database as other programs see it.
@@ -56,7 +57,7 @@ public:
     handle_.reset(handle);
   }
 
-  /// The rows of a query, the columns quoted, in the order of the texts.
+  /// The rows of a query as sorted texts, each column followed by "|".
   std::vector<std::string> Rows(const char* sql) const {
     std::vector<std::string> rows;
     const auto append = [](void* place, int count, char** values, char** /*names*/) {
@@ -69,7 +70,7 @@ public:
     };
     Require(sqlite3_exec(handle_.get(), sql, append, &rows, nullptr) == SQLITE_OK,
             "the merged database can be read");
-    std::sort(rows.begin(), rows.end());
+    std::ranges::sort(rows);
     return rows;
   }
 
@@ -124,7 +125,7 @@ void Examine(const Merged& merged) {
 }
 
 bool HasFailed(const std::vector<fuzz::LogLine>& log) {
-  return std::any_of(log.begin(), log.end(), [](const fuzz::LogLine& line) {
+  return std::ranges::any_of(log, [](const fuzz::LogLine& line) {
     return line.text.starts_with("Error that we will ignore ");
   });
 }

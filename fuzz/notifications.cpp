@@ -1,7 +1,7 @@
-// The bytes of a connection, up to the call of the state's handler: framing, validation, parsing,
-// the registry. The input's first byte decides in what pieces the others arrive; a byte of value 31
-// stands for many blanks, so that short inputs make messages of the greatest length and longer
-// ones.
+// The input is what a connection sends. It passes framing, validation, parsing and the registry, up
+// to the call of the state's handler. The first byte determines the pieces in which the others
+// arrive; a byte of value 31 stands for many blanks, so that short inputs make messages of the
+// maximum length and longer ones.
 
 #include "Fuzzing.h"
 
@@ -58,7 +58,7 @@ struct Event {
   bool operator==(const Event&) const = default;
 };
 
-/// A state that only takes down what happens.
+/// A state that only records the events.
 class Recorder : public dbmerger::State {
 public:
   explicit Recorder(std::vector<Event>& events) : events_(events) {}
@@ -78,8 +78,8 @@ private:
   std::vector<Event>& events_;
 };
 
-/// Bytes that arrive in pieces: the first of `first` bytes, the others of sizes that follow from
-/// it. 0 lets each read take all it can.
+/// Bytes that arrive in pieces: the first of `first` bytes, the others of sizes derived from it.
+/// With 0 each read takes all it can.
 class PiecewiseStream : public util::Stream {
 public:
   PiecewiseStream(std::string_view bytes, std::uint8_t first) : rest_(bytes), piece_(first) {}
@@ -103,7 +103,7 @@ private:
   unsigned piece_;
 };
 
-/// What came of a connection.
+/// The results of a connection.
 struct Outcome {
   std::vector<Event> events;
   std::vector<std::string> volumes; ///< mount points in the registry
@@ -147,23 +147,18 @@ bool IsMountPoint(const std::string& text) {
 
 void Examine(const Outcome& outcome, const std::vector<std::size_t>& lengths) {
   Require(!outcome.events.empty() && outcome.events.back() == Event{"Transcoded", "/shares/Good/"},
-          "a good message behind anything is handled");
+          "a good message after anything is handled");
   Require(outcome.events.size() <= lengths.size(), "a message is one event at most");
-  Require(std::all_of(outcome.events.begin(), outcome.events.end(),
-                      [](const Event& event) { return IsMountPoint(event.mountPoint); }),
+  Require(std::ranges::all_of(outcome.events, IsMountPoint, &Event::mountPoint),
           "an event names a mount point that ends in a separator");
-  const auto isError = [](const fuzz::LogLine& line) {
-    return line.priority == (LOG_LOCAL1 | LOG_ERR);
-  };
-  Require(std::count_if(outcome.log.begin(), outcome.log.end(), isError) <=
-              static_cast<std::ptrdiff_t>(lengths.size()),
+  Require(std::ranges::count(outcome.log, LOG_LOCAL1 | LOG_ERR, &fuzz::LogLine::priority) <=
+              std::ssize(lengths),
           "a message is one line about an error at most");
   const auto isTooLong = [](std::size_t length) {
     return length > util::MessageProcessor::MAXIMUM_MESSAGE_LENGTH;
   };
-  Require(std::count(outcome.log.begin(), outcome.log.end(), SKIPPED) ==
-              std::count_if(lengths.begin(), lengths.end(), isTooLong),
-          "every message that is too long is told of");
+  Require(std::ranges::count(outcome.log, SKIPPED) == std::ranges::count_if(lengths, isTooLong),
+          "every message that is too long is logged");
   for (auto volume = outcome.volumes.begin(); volume != outcome.volumes.end(); ++volume) {
     Require(IsMountPoint(*volume) && util::Path(*volume).Exists(), "a registered volume exists");
     Require(std::find(outcome.volumes.begin(), volume, *volume) == volume,
@@ -188,7 +183,7 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
     return 0;
   }
   const std::string_view input(reinterpret_cast<const char*>(data), size);
-  // The "x" ends a run of zeros, which could have begun a delimiter.
+  // The "x" ends a run of zeros, which could be the beginning of a delimiter.
   const std::string bytes = Expand(input.substr(1)) + "x" + DELIMITER + GOOD + DELIMITER;
 
   const Outcome inPieces = Receive(bytes, data[0]);

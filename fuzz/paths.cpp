@@ -1,5 +1,5 @@
-// The operations on paths, with three texts that the input gives line by line. They are asked about
-// a small tree of files in /tmp.
+// The operations on paths. The input is three texts, one a line; paths are resolved in a small tree
+// of files in /tmp.
 
 #include "Fuzzing.h"
 
@@ -31,7 +31,7 @@ std::string PercentEncode(const std::string& text) {
   for (const char c : text) {
     const auto byte = static_cast<unsigned char>(c);
     if (byte == 0) {
-      encoded += c; // what has no escape
+      encoded += c; // cannot be escaped
     } else {
       encoded += {'%', digits[byte / 16], digits[byte % 16]};
     }
@@ -43,8 +43,7 @@ void Decode(const std::string& text) {
   const std::string decoded = util::Decodestring(text);
   Require(decoded.size() <= text.size() && (text.size() - decoded.size()) % 2 == 0,
           "decoding replaces three characters by one");
-  Require(std::count(decoded.begin(), decoded.end(), '\0') ==
-              std::count(text.begin(), text.end(), '\0'),
+  Require(std::ranges::count(decoded, '\0') == std::ranges::count(text, '\0'),
           "decoding makes no NUL");
   Require(text.find('%') != std::string::npos || decoded == text,
           "what has no escape stays as it is");
@@ -70,10 +69,10 @@ void Join(const std::string& directory, const std::string& name) {
 void Strip(const std::string& path) {
   const std::string basic = Path(path).Basic();
   Require(path.starts_with(basic) && path.find_first_not_of('/', basic.size()) == std::string::npos,
-          "only trailing separators are taken away");
+          "only trailing separators are removed");
   Require(basic.empty() == path.empty() && (basic == "/" || !basic.ends_with('/')),
           "no trailing separator is left, except for the root");
-  Require(Path(basic).Basic() == basic, "taking away separators twice changes nothing");
+  Require(Path(basic).Basic() == basic, "removing separators twice changes nothing");
 }
 
 void Resolve(const std::string& path) {
@@ -111,7 +110,7 @@ void Order(const Texts& texts) {
     Require(!isLess(a, b) || !isLess(b, c) || isLess(a, c), "the order is transitive");
     Require(texts[a] == texts[b] || !texts[b].starts_with(texts[a]) || isLess(a, b),
             "a folder comes before what it holds");
-  } while (std::next_permutation(order.begin(), order.end()));
+  } while (std::ranges::next_permutation(order).found);
 }
 
 Texts SplitLines(const std::string& input) {

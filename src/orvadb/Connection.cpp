@@ -2,6 +2,8 @@
 
 #include "WorkLimit.h"
 
+#include "orvadb/ErrorMessage.h"
+
 #include "orvautil/FormatString.h"
 
 #include <sqlite3.h>
@@ -21,15 +23,28 @@ void Connection::CheckIn::operator()(sqlite3_stmt* statement) const noexcept {
 
 Connection::Connection(sqlite3* handle, int busyTimeout, long long bytes)
     : handle_(handle), busyTimeout_(busyTimeout),
-      workLimit_(std::make_unique<WorkLimit>(handle, bytes)) {}
+      workLimit_(std::make_unique<WorkLimit>(handle, bytes)) {
+  sqlite3_busy_timeout(handle_, busyTimeout_);
+}
 
 Connection::~Connection() = default;
+
+bool Connection::IsReadOnly() const noexcept {
+  return sqlite3_db_readonly(handle_, "main") == 1;
+}
 
 void Connection::SetFileSize(long long bytes) noexcept {
   workLimit_->SetFileSize(bytes);
 }
 
-Connection::CheckedOut Connection::CheckOut(const char* sql, const char* file, unsigned line) {
+Connection::CheckedOut Connection::CheckOut(const char* sql, const char* file, unsigned int line) {
+  // SQLite rolls back by itself after some failures. It would commit every later statement of the
+  // transaction's owner at once.
+  if (transaction_ != 0 && sqlite3_get_autocommit(handle_) != 0) {
+    throw ErrorMessage(util::FormatString("\"%s\" in a transaction that was rolled back: %s", sql,
+                                          failedStep_.c_str()),
+                       file, line);
+  }
   workLimit_->Restart();
   const auto kept = statements_.find(std::string_view(sql));
   Compiled& place = kept != statements_.end() ? kept->second : statements_[sql];
@@ -37,9 +52,10 @@ Connection::CheckedOut Connection::CheckOut(const char* sql, const char* file, u
   return {compiled.release(), CheckIn{&place}};
 }
 
-Connection::Compiled Connection::Compile(const char* sql, const char* file, unsigned line) const {
+Connection::Compiled Connection::Compile(const char* sql, const char* file,
+                                         unsigned int line) const {
   sqlite3_stmt* statement = nullptr;
-  // A virtual table would run a module's code on a stranger's data.
+  // A virtual table would run a module's code on untrusted data.
   const int code = sqlite3_prepare_v3(
       handle_, sql, -1, SQLITE_PREPARE_PERSISTENT | SQLITE_PREPARE_NO_VTAB, &statement, nullptr);
   Compiled compiled(statement);
@@ -49,15 +65,62 @@ Connection::Compiled Connection::Compile(const char* sql, const char* file, unsi
   return compiled;
 }
 
-std::string ErrorMessage(sqlite3* handle, const char* sql, const char* file, unsigned line) {
-  const int code = sqlite3_extended_errcode(handle);
-  // Nobody else interrupts.
-  const char* const reason = code == SQLITE_INTERRUPT
-                                 ? "more work than a database of this size can need"
-                                 : sqlite3_errmsg(handle);
-  // A name in a stranger's schema may be of any length, but no line of the system log may be.
-  return util::FormatString("%s:%u: %.500s (extended code %d) in \"%.500s\"", file, line, reason,
-                            code, sql);
+int Connection::Step(sqlite3_stmt* statement, const char* file, unsigned int line) {
+  const int code = sqlite3_step(statement);
+  if (code != SQLITE_ROW && code != SQLITE_DONE && failedStep_.empty()) {
+    failedStep_ = ErrorMessage(statement, file, line);
+  }
+  return code;
+}
+
+void Connection::Execute(sqlite3_stmt* statement, const char* file, unsigned int line) {
+  if (Step(statement, file, line) != SQLITE_DONE) {
+    throw ErrorMessage(statement, file, line);
+  }
+}
+
+void Connection::BeginTransaction(unsigned int busyTimeout, const char* file, unsigned int line) {
+  const CheckedOut begin = CheckOut(IsReadOnly() ? "BEGIN" : "BEGIN IMMEDIATE", file, line);
+  failedStep_.clear();
+  beforeCommit_.clear();
+  sqlite3_busy_timeout(handle_, static_cast<int>(busyTimeout));
+  try {
+    Execute(begin.get(), file, line);
+    transaction_ = ++transactions_;
+  } catch (...) {
+    sqlite3_busy_timeout(handle_, busyTimeout_);
+    throw;
+  }
+}
+
+void Connection::ExecuteBeforeCommit(const char* sql) {
+  beforeCommit_.push_back(sql);
+}
+
+void Connection::CommitTransaction(const char* file, unsigned int line) {
+  if (!failedStep_.empty()) {
+    throw ErrorMessage(
+        util::FormatString("not committed after a failed step: %s", failedStep_.c_str()), file,
+        line);
+  }
+  for (const char* const sql : beforeCommit_) {
+    Execute(CheckOut(sql, file, line).get(), file, line);
+  }
+  Execute(CheckOut("COMMIT", file, line).get(), file, line);
+  EndTransaction();
+}
+
+void Connection::RollBackTransaction() noexcept {
+  // SQLite may already have rolled back by itself.
+  if (sqlite3_get_autocommit(handle_) == 0) {
+    sqlite3_exec(handle_, "ROLLBACK", nullptr, nullptr, nullptr);
+  }
+  EndTransaction();
+}
+
+void Connection::EndTransaction() noexcept {
+  sqlite3_busy_timeout(handle_, busyTimeout_);
+  transaction_ = 0;
 }
 
 } // namespace orva::db

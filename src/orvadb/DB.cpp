@@ -3,6 +3,7 @@
 #include "DatabaseFile.h"
 
 #include "orvadb/Connection.h"
+#include "orvadb/ErrorMessage.h"
 #include "orvadb/Statement.h"
 
 #include "orvautil/FormatString.h"
@@ -20,27 +21,27 @@ namespace {
 /// Milliseconds. A reader of the database must not make a change of it fail.
 constexpr int BUSY_TIMEOUT = 1000;
 
-/// Keeps SQLite from counting every allocation under a lock; nobody reads the counts. Only before
-/// it is first used in the process.
+/// Keeps SQLite from counting every allocation under a lock: the counts are not used. Must run
+/// before SQLite is first used in the process.
 void ConfigureOnce() {
   static const int configured = sqlite3_config(SQLITE_CONFIG_MEMSTATUS, 0);
   static_cast<void>(configured);
 }
 
-/// Texts and rows of more bytes are read by nobody.
+/// Bytes of the longest text or row. Ours are far shorter.
 constexpr int LONGEST_VALUE = 16 << 20;
 
-/// Indices on one table, all of which each of its rows has to be entered in.
-constexpr std::size_t MOST_INDICES = 32;
+/// Most indexes on one table. Inserting a row updates them all.
+constexpr std::size_t MOST_INDEXES = 32;
 
 /// Runs one statement that has no result. Throws std::string.
 void Run(sqlite3* handle, const char* sql) {
   if (sqlite3_exec(handle, sql, nullptr, nullptr, nullptr) != SQLITE_OK) {
-    throw ErrorMessage(handle, sql, __FILE__, __LINE__);
+    throw ErrorMessage(handle, sql);
   }
 }
 
-/// A volume is whoever's plugged it in: nothing that its database brings along is run.
+/// Databases on volumes are untrusted: nothing that the schema defines is run.
 void DisableUntrustedFeatures(sqlite3* handle) {
   for (const auto& [option, value] :
        {std::pair(SQLITE_DBCONFIG_ENABLE_TRIGGER, 0), std::pair(SQLITE_DBCONFIG_ENABLE_VIEW, 0),
@@ -57,18 +58,18 @@ std::string Pragma(const char* pragma, const std::string& name) {
   const std::unique_ptr<char, decltype(&sqlite3_free)> sql(
       sqlite3_mprintf("PRAGMA %s(%Q)", pragma, name.c_str()), &sqlite3_free);
   if (!sql) {
-    throw util::FormatString("%s:%d: out of memory", __FILE__, __LINE__);
+    throw ErrorMessage("out of memory");
   }
   return sql.get();
 }
 
-/// Whether the text of a column's default is that of a number, a plain text or nothing.
+/// Whether a column's default, given as its SQL text, is a number, a plain text or absent.
 bool IsLiteral(const std::string& text) {
   return text.find_first_not_of("+-.0123456789") == std::string::npos || text == "NULL" ||
          (text.size() >= 2 && text.front() == '\'' && text.find('\'', 1) == text.size() - 1);
 }
 
-/// `path` as a URI that promises that nobody writes the file.
+/// `path` as a URI that promises SQLite that the file does not change.
 std::string ImmutableUri(const std::string& path) {
   std::string uri = "file:";
   for (const char byte : path) {
@@ -115,10 +116,9 @@ void DB::Open(std::string path, Access access, int busyTimeout, bool immutable) 
   path_ = std::move(path);
   try {
     if (code != SQLITE_OK) {
-      throw ErrorMessage(handle_, ("open '" + path_ + "'").c_str(), __FILE__, __LINE__);
+      throw ErrorMessage(handle_, ("open '" + path_ + "'").c_str());
     }
     connection_ = std::make_unique<Connection>(handle_, busyTimeout, size);
-    sqlite3_busy_timeout(handle_, busyTimeout);
     DisableUntrustedFeatures(handle_);
     if (access == Access::ReadWrite) {
       // A merge keeps its changes in memory until it commits, so that readers wait only then.
@@ -133,8 +133,8 @@ void DB::Open(std::string path, Access access, int busyTimeout, bool immutable) 
 void DB::Create(const std::string& path, const std::function<void()>& build) {
   const std::string unfinished = path + ".new";
   if (!RemoveDatabase(unfinished)) {
-    // It would be taken for what is built now.
-    throw util::FormatString("%s:%d: cannot remove '%s'", __FILE__, __LINE__, unfinished.c_str());
+    // What an earlier attempt left there must not become part of the new database.
+    throw ErrorMessage(util::FormatString("cannot remove '%s'", unfinished.c_str()));
   }
   try {
     Open(unfinished);
@@ -150,64 +150,70 @@ void DB::Create(const std::string& path, const std::function<void()>& build) {
 
 void DB::Close() {
   connection_.reset();
-  // The connection has no statements left, so that this cannot be refused.
+  // The connection has no statements left, so that SQLite closes it at once.
   sqlite3_close_v2(handle_);
   handle_ = nullptr;
   path_.clear();
 }
 
+Connection& DB::OpenConnection(const char* sql, const char* file, unsigned int line) const {
+  if (!connection_) {
+    throw ErrorMessage(util::FormatString("database not open in \"%s\"", sql), file, line);
+  }
+  return *connection_;
+}
+
 long long DB::MeasureFile() const {
-  const bool written = sqlite3_db_readonly(handle_, "main") == 0;
-  const long long size = CheckDatabaseFiles(path_, written);
+  const long long size = CheckDatabaseFiles(path_, !connection_->IsReadOnly());
   connection_->SetFileSize(size);
   return size;
 }
 
 void DB::RejectComputedColumns(const std::string& table) const {
-  const bool written = sqlite3_db_readonly(handle_, "main") == 0;
-  const auto refuse = [&](bool computed, const char* what) {
+  const bool written = !connection_->IsReadOnly();
+  const auto rejectIf = [&](bool computed, const char* what) {
     if (computed) {
-      throw util::FormatString("%s:%d: %s in table %.500s of '%s'", __FILE__, __LINE__, what,
-                               table.c_str(), path_.c_str());
+      throw ErrorMessage(
+          util::FormatString("%s in table %.500s of '%s'", what, table.c_str(), path_.c_str()));
     }
   };
   constexpr int virtualColumn = 2; // and above: stored ones
   constexpr int expression = -2;   // in the place of a column's number
 
   const std::string listColumns = Pragma("table_xinfo", table);
-  Statement column(*this, listColumns.c_str(), __FILE__, __LINE__);
-  while (column.Fetch(__FILE__, __LINE__)) {
-    refuse(column.GetInt(6) >= virtualColumn, "generated column");
-    refuse(written && !IsLiteral(column.GetText(4)), "default value that is no literal");
+  Statement column(*this, listColumns.c_str());
+  while (column.Fetch()) {
+    rejectIf(column.GetInt(6) >= virtualColumn, "generated column");
+    rejectIf(written && !IsLiteral(column.GetText(4)), "default value that is no literal");
   }
   if (!written) {
     return;
   }
-  std::vector<std::string> indices;
-  const std::string listIndices = Pragma("index_list", table);
-  Statement index(*this, listIndices.c_str(), __FILE__, __LINE__);
-  while (index.Fetch(__FILE__, __LINE__)) {
-    refuse(index.GetBool(4), "partial index");
-    indices.push_back(index.GetText(1));
-    refuse(indices.size() > MOST_INDICES, "more indices than a row is worth");
+  std::vector<std::string> indexes;
+  const std::string listIndexes = Pragma("index_list", table);
+  Statement index(*this, listIndexes.c_str());
+  while (index.Fetch()) {
+    rejectIf(index.GetBool(4), "partial index");
+    indexes.push_back(index.GetText(1));
+    rejectIf(indexes.size() > MOST_INDEXES, "more indices than a row is worth");
   }
-  for (const std::string& name : indices) {
+  for (const std::string& name : indexes) {
     const std::string listKeys = Pragma("index_xinfo", name);
-    Statement key(*this, listKeys.c_str(), __FILE__, __LINE__);
-    while (key.Fetch(__FILE__, __LINE__)) {
-      refuse(key.GetInt(1) == expression, "index on an expression");
+    Statement key(*this, listKeys.c_str());
+    while (key.Fetch()) {
+      rejectIf(key.GetInt(1) == expression, "index on an expression");
     }
   }
 }
 
 unsigned long long DB::RunningTransaction() const noexcept {
-  return connection_ ? connection_->transaction : 0;
+  return connection_ ? connection_->RunningTransaction() : 0;
 }
 
 void DB::CreateTransientIndex(const char* create, const char* drop, const char* file,
                               unsigned int line) const {
   Statement(*this, create, file, line).Execute(file, line);
-  connection_->beforeCommit.push_back(drop);
+  connection_->ExecuteBeforeCommit(drop);
 }
 
 long long DB::LastInsertId() const noexcept {

@@ -1,5 +1,8 @@
 #include "DatabaseFile.h"
 
+#include "orvadb/ErrorMessage.h"
+
+#include "orvautil/FileDescriptor.h"
 #include "orvautil/FormatString.h"
 
 #include <fcntl.h>
@@ -19,65 +22,50 @@ namespace {
 
 constexpr std::array<const char*, 3> LOG_SUFFIXES{"-journal", "-wal", "-shm"};
 
-/// A descriptor for as long as the scope lives; -1 when the file could not be opened.
-class Descriptor {
-public:
-  Descriptor(const std::string& path, int flags)
-      : descriptor_(open(path.c_str(), flags | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC)) {}
-  Descriptor(const Descriptor&) = delete;
-  Descriptor& operator=(const Descriptor&) = delete;
-  ~Descriptor() {
-    if (descriptor_ != -1) {
-      close(descriptor_);
-    }
-  }
+util::FileDescriptor OpenFile(const std::string& path, int flags) {
+  return util::FileDescriptor(open(path.c_str(), flags | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC));
+}
 
-  int Get() const noexcept { return descriptor_; }
-
-private:
-  int descriptor_;
+/// Size of a file that may have holes; zero when it does not exist.
+struct FileSize {
+  long long bytes = 0;
+  long long blocks = 0; ///< of 512 bytes, that are allocated
 };
 
-/// Bytes and 512-byte blocks of a file, none when it is not there.
-struct Extent {
-  long long size = 0;
-  long long blocks = 0;
-};
-
-/// What the regular file at `path` takes. One that is `written` must have no other name, which may
-/// be that of somebody else's.
-Extent RegularExtent(const std::string& path, bool written) {
+/// The size of the regular file at `path`. One that is `written` must have no second name, under
+/// which it may be somebody else's file.
+FileSize RegularFileSize(const std::string& path, bool written) {
   struct stat status {};
   if (lstat(path.c_str(), &status) != 0) {
     return {};
   }
   if (!S_ISREG(status.st_mode)) {
-    throw util::FormatString("%s:%d: '%s' is not a regular file", __FILE__, __LINE__, path.c_str());
+    throw ErrorMessage(util::FormatString("'%s' is not a regular file", path.c_str()));
   }
   if (written && status.st_nlink > 1) {
-    throw util::FormatString("%s:%d: '%s' has another name", __FILE__, __LINE__, path.c_str());
+    throw ErrorMessage(util::FormatString("'%s' has another name", path.c_str()));
   }
-  return {.size = status.st_size, .blocks = status.st_blocks};
+  return {.bytes = status.st_size, .blocks = status.st_blocks};
 }
 
-/// The size of a file, of which holes count for little: what bounds the work on a file is not to be
-/// had for nothing. A file system that compresses has few holes by this measure.
-long long SizeWithoutHoles(const Extent& extent) {
+/// The bytes of a file, with most of its holes left out: a sparse file must not raise the limits. A
+/// file that the file system compresses has fewer blocks than bytes, too, but not so few.
+long long BytesWithoutHoles(const FileSize& size) {
   constexpr long long blockSize = 512;
   constexpr long long mostFree = 4 << 20;
-  constexpr long long mostPerPlaced = 16;
-  return std::min(extent.size, mostFree + mostPerPlaced * blockSize * extent.blocks);
+  constexpr long long mostPerAllocated = 16;
+  return std::min(size.bytes, mostFree + mostPerAllocated * blockSize * size.blocks);
 }
 
 void Synchronise(const std::string& path, int flags, bool mayBeUnsupported) {
-  const Descriptor file(path, O_RDONLY | flags);
-  if (file.Get() == -1 || (fsync(file.Get()) != 0 && !(mayBeUnsupported && errno == EINVAL))) {
-    throw util::FormatString("%s:%d: cannot synchronise '%s': %s", __FILE__, __LINE__, path.c_str(),
-                             std::strerror(errno));
+  const util::FileDescriptor file = OpenFile(path, O_RDONLY | flags);
+  if (!file || (fsync(file.Get()) != 0 && !(mayBeUnsupported && errno == EINVAL))) {
+    throw ErrorMessage(
+        util::FormatString("cannot synchronise '%s': %s", path.c_str(), std::strerror(errno)));
   }
 }
 
-/// Returns whether nothing is there afterwards.
+/// Removes the file at `path`, if it exists. Returns whether none is left.
 bool Remove(const std::string& path) {
   return unlink(path.c_str()) == 0 || errno == ENOENT;
 }
@@ -93,33 +81,33 @@ bool RemoveLogs(const std::string& path) {
 } // namespace
 
 long long CheckDatabaseFiles(const std::string& path, bool written) {
-  const Extent database = RegularExtent(path, written);
-  Extent log;
+  const FileSize database = RegularFileSize(path, written);
+  FileSize log;
   for (const char* const suffix : LOG_SUFFIXES) {
-    // SQLite writes into some of these, and gives others the owner of the database, also where it
-    // only reads. Only the write-ahead log is part of what is read.
-    const Extent beside = RegularExtent(path + suffix, true);
-    log = suffix == std::string_view("-wal") ? beside : log;
+    // Even to read a database SQLite may write into these files or change their owner. Only the
+    // write-ahead log holds content of the database.
+    const FileSize size = RegularFileSize(path + suffix, true);
+    log = suffix == std::string_view("-wal") ? size : log;
   }
-  // Where neither takes any room, the file system does not tell.
+  // Some file systems do not count blocks.
   return database.blocks == 0 && log.blocks == 0
-             ? database.size + log.size
-             : SizeWithoutHoles(database) + SizeWithoutHoles(log);
+             ? database.bytes + log.bytes
+             : BytesWithoutHoles(database) + BytesWithoutHoles(log);
 }
 
 void CheckJournal(const std::string& path) {
-  // What ends in this belongs to a transaction over several databases, which we never make; when
-  // it has been undone, SQLite deletes the file whose name stands before.
+  // A journal that ends in this mark belongs to a transaction over several databases, which we
+  // never make. After undoing it SQLite deletes the file whose name precedes the mark.
   constexpr std::array<unsigned char, 8> superJournalMark{0xd9, 0xd5, 0x05, 0xf9,
                                                           0x20, 0xa1, 0x63, 0xd7};
   const std::string name = path + LOG_SUFFIXES.front();
-  const Descriptor journal(name, O_RDONLY);
+  const util::FileDescriptor journal = OpenFile(name, O_RDONLY);
   std::array<unsigned char, superJournalMark.size()> end{};
   constexpr auto length = static_cast<off_t>(superJournalMark.size());
-  const off_t begin = journal.Get() == -1 ? -1 : lseek(journal.Get(), -length, SEEK_END);
+  const off_t begin = journal ? lseek(journal.Get(), -length, SEEK_END) : -1;
   if (begin != -1 && pread(journal.Get(), end.data(), end.size(), begin) == length &&
       end == superJournalMark) {
-    throw util::FormatString("%s:%d: '%s' names another file", __FILE__, __LINE__, name.c_str());
+    throw ErrorMessage(util::FormatString("'%s' names another file", name.c_str()));
   }
 }
 
@@ -132,14 +120,13 @@ void PublishDatabase(const std::string& from, const std::string& to) {
   Synchronise(from, 0, false);
   CheckDatabaseFiles(to, true);
   if (!RemoveLogs(to)) {
-    throw util::FormatString("%s:%d: cannot remove what is left of '%s'", __FILE__, __LINE__,
-                             to.c_str());
+    throw ErrorMessage(util::FormatString("cannot remove what is left of '%s'", to.c_str()));
   }
   if (std::rename(from.c_str(), to.c_str()) != 0) {
-    throw util::FormatString("%s:%d: cannot rename '%s' to '%s': %s", __FILE__, __LINE__,
-                             from.c_str(), to.c_str(), std::strerror(errno));
+    throw ErrorMessage(util::FormatString("cannot rename '%s' to '%s': %s", from.c_str(),
+                                          to.c_str(), std::strerror(errno)));
   }
-  // Some file systems cannot synchronise a directory, and need not.
+  // Some file systems cannot synchronise a directory and do not need to.
   Synchronise(to.substr(0, to.rfind('/') + 1), O_DIRECTORY, true);
 }
 

@@ -1,8 +1,7 @@
 #include "orvadb/Statement.h"
 
 #include "orvadb/DB.h"
-
-#include "orvautil/FormatString.h"
+#include "orvadb/ErrorMessage.h"
 
 #include <sqlite3.h>
 
@@ -12,44 +11,18 @@ namespace orva::db {
 
 static_assert(Statement::ROW == SQLITE_ROW && Statement::DONE == SQLITE_DONE);
 
-namespace {
-
-Connection& OpenConnection(Connection* connection, sqlite3* handle, const char* sql,
-                           const char* file, unsigned int line) {
-  if (connection == nullptr) {
-    throw util::FormatString("%s:%u: database not open in \"%s\"", file, line, sql);
-  }
-  // SQLite rolls back by itself after some failures. What the transaction's owner still does would
-  // then be written at once, statement by statement.
-  if (connection->transaction != 0 && sqlite3_get_autocommit(handle) != 0) {
-    throw util::FormatString("%s:%u: \"%s\" in a transaction that was rolled back: %s", file, line,
-                             sql, connection->failedStep.c_str());
-  }
-  return *connection;
-}
-
-} // namespace
-
 Statement::Statement(const DB& db, const char* sql, const char* file, unsigned int line)
-    : db_(db), statement_(OpenConnection(db.connection_.get(), db.handle_, sql, file, line)
-                              .CheckOut(sql, file, line)) {}
+    : connection_(db.OpenConnection(sql, file, line)),
+      statement_(connection_.CheckOut(sql, file, line)) {}
 
 int Statement::Step(const char* file, unsigned int line) {
-  const int code = sqlite3_step(statement_.get());
-  if (code == SQLITE_ROW || code == SQLITE_DONE || code == SQLITE_OK) {
-    return code;
-  }
-  std::string& failedStep = db_.connection_->failedStep;
-  if (failedStep.empty()) {
-    failedStep = ErrorMessage(db_.handle_, sqlite3_sql(statement_.get()), file, line);
-  }
-  return code;
+  return connection_.Step(statement_.get(), file, line);
 }
 
 bool Statement::Fetch(const char* file, unsigned int line) {
   const int code = Step(file, line);
   if (code != ROW && code != DONE) {
-    throw ErrorMessage(db_.handle_, sqlite3_sql(statement_.get()), file, line);
+    throw ErrorMessage(statement_.get(), file, line);
   }
   return code == ROW;
 }
@@ -107,8 +80,8 @@ std::string Statement::GetText(int column) const {
 std::string_view Statement::GetTextView(int column) const {
   const unsigned char* const text = sqlite3_column_text(statement_.get(), column);
   if (text == nullptr) {
-    if (sqlite3_errcode(db_.handle_) == SQLITE_NOMEM) {
-      throw ErrorMessage(db_.handle_, sqlite3_sql(statement_.get()), __FILE__, __LINE__);
+    if (sqlite3_errcode(sqlite3_db_handle(statement_.get())) == SQLITE_NOMEM) {
+      throw ErrorMessage(statement_.get());
     }
     return {};
   }
@@ -126,7 +99,7 @@ bool Statement::GetBool(int column) const {
 
 void Statement::CheckBind(int code, const char* file, unsigned int line) const {
   if (code != SQLITE_OK) {
-    throw ErrorMessage(db_.handle_, sqlite3_sql(statement_.get()), file, line);
+    throw ErrorMessage(statement_.get(), file, line);
   }
 }
 

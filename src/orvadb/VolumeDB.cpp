@@ -2,6 +2,8 @@
 
 #include "DatabaseFile.h"
 
+#include "orvadb/ErrorMessage.h"
+
 #include "orvautil/Core.h"
 #include "orvautil/FormatString.h"
 #include "orvautil/Path.h"
@@ -16,8 +18,7 @@ namespace orva::db {
 
 namespace {
 
-/// Milliseconds. The indexer writes whole scans at once; a catalog that it is just writing is
-/// waited for.
+/// Milliseconds. The indexer writes a whole scan in one transaction, which the reads wait for.
 constexpr int CATALOG_BUSY_TIMEOUT = 5000;
 
 bool IsOnReadOnlyFileSystem(const std::string& path) {
@@ -25,8 +26,8 @@ bool IsOnReadOnlyFileSystem(const std::string& path) {
   return statvfs(path.c_str(), &status) == 0 && (status.f_flag & ST_RDONLY) != 0;
 }
 
-/// Whether the open file says that it is written with a write-ahead log. Read through SQLite's
-/// own descriptor: opening and closing another one would drop its locks.
+/// Whether the header of the open file asks for a write-ahead log. Reads through SQLite's own
+/// descriptor: closing another one on the file would drop SQLite's locks.
 bool IsInWalMode(sqlite3* handle) {
   sqlite3_file* file = nullptr;
   sqlite3_file_control(handle, "main", SQLITE_FCNTL_FILE_POINTER, &file);
@@ -44,18 +45,18 @@ bool IsInWalMode(sqlite3* handle) {
 VolumeDB::VolumeDB(const std::string& path, bool writable) : prefix_(path) {
   const std::string volume = util::Path(path).Canonicalize();
   if (volume.empty()) {
-    throw util::FormatString("%s:%d: there is no volume at '%s'", __FILE__, __LINE__, path.c_str());
+    throw ErrorMessage(util::FormatString("there is no volume at '%s'", path.c_str()));
   }
   const std::string catalog = core::GetCatalogPath(volume);
   const Access access = writable ? Access::ReadWrite : Access::ReadOnly;
   Open(catalog, access, CATALOG_BUSY_TIMEOUT, false);
   if (!writable && IsOnReadOnlyFileSystem(catalog) && IsInWalMode(Handle())) {
-    // SQLite cannot make the shared memory that a log needs here. Without a log to read,
-    // nobody can be writing either.
+    // SQLite cannot make the shared memory that a log needs here. Where there is no log to read,
+    // no other process can be writing either.
     if (!IsAbsentOrEmpty(catalog + "-wal")) {
-      throw util::FormatString("%s:%d: '%s' has a write-ahead log, which cannot be read on a "
-                               "read-only file system",
-                               __FILE__, __LINE__, catalog.c_str());
+      throw ErrorMessage(util::FormatString("'%s' has a write-ahead log, which cannot be read on a "
+                                            "read-only file system",
+                                            catalog.c_str()));
     }
     Open(catalog, access, CATALOG_BUSY_TIMEOUT, true);
   }

@@ -8,16 +8,16 @@ namespace orva::db {
 
 namespace {
 
-// Work is counted in steps of SQLite's machine; to fetch a page costs as much as some of them. What
-// a statement of ours needs for a row is a tenth of what it may.
+// Work is counted in steps of SQLite's virtual machine; a page fetched counts as some of them. The
+// limits are ten times what our statements need.
 constexpr int STEPS_PER_CHECK = 1'000;
 constexpr long long PAGE_COST = 20;
 constexpr long long LEAST_LIMIT = 10'000'000;
 constexpr long long LIMIT_PER_BYTE = 20;
-/// The file may not have these yet.
+/// Changed rows may not be in the file yet.
 constexpr long long LIMIT_PER_CHANGED_ROW = 2'000;
 
-/// Pages fetched since this was last asked.
+/// Pages fetched since the last call.
 long long TakeFetches(sqlite3* handle) noexcept {
   long long fetches = 0;
   for (const int counter : {SQLITE_DBSTATUS_CACHE_HIT, SQLITE_DBSTATUS_CACHE_MISS}) {

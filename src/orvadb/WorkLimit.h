@@ -4,9 +4,9 @@ struct sqlite3;
 
 namespace orva::db {
 
-/// Interrupts a statement when it works more than a database of its size can need: when the file
-/// was crafted so that a few pages make endless rows. Installs itself in a connection, and lives
-/// as long. On the connection's thread.
+/// Interrupts a statement that works more than a database of its size can need: in a crafted file a
+/// few pages may make endless rows. Installs itself in a connection for as long as it lives. On the
+/// connection's thread.
 class WorkLimit {
 public:
   /// For the connection `handle` to a database of `bytes` bytes.
@@ -17,7 +17,7 @@ public:
 
   void SetFileSize(long long bytes) noexcept { bytes_ = bytes; }
 
-  /// A statement begins.
+  /// A statement begins: counts its work from zero.
   void Restart() noexcept;
 
 private:
@@ -25,7 +25,7 @@ private:
 
   sqlite3* handle_;
   long long bytes_;
-  long long work_ = 0; ///< of the statement so far
+  long long work_ = 0; ///< of the current statement so far
 };
 
 } // namespace orva::db

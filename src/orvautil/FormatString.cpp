@@ -21,7 +21,7 @@ std::string FormatStringV(const char* format, std::va_list arguments) {
   const int length = std::vsnprintf(nullptr, 0, format, measured);
   va_end(measured);
   if (length < 0) {
-    throw Exception("Cannot format a message", __FILE__, __LINE__);
+    throw Exception("Cannot format a message");
   }
   std::string text(static_cast<std::size_t>(length), '\0');
   std::vsnprintf(text.data(), text.size() + 1, format, arguments);

@@ -26,14 +26,15 @@ namespace {
 /// Bytes read at once.
 constexpr std::size_t CHUNK_SIZE = 16384;
 
-/// Elements inside each other in the longest message, each of which takes at least "<a></a>". What
-/// goes deeper is no document, and the parser would need as much memory again to find that out.
+/// Depth to which elements can be nested in the longest message: each takes at least "<a></a>".
+/// Deeper nesting is ill-formed, but the parser would need as much memory again to find that out.
 constexpr std::size_t DEEPEST_NESTING = MessageProcessor::MAXIMUM_MESSAGE_LENGTH / 7;
 
-/// Bytes of a message that leaves the parser with no more memory than is good to keep.
+/// Bytes of the longest message after which the parser is used again. A longer one leaves it with
+/// much memory.
 constexpr unsigned long ORDINARY_LENGTH = 4096;
 
-/// A message that is no XML document we take.
+/// A message that is no acceptable XML document.
 class IllFormedMessage : public Exception {
   using Exception::Exception;
 };
@@ -47,8 +48,8 @@ public:
   void resetErrors() override {}
 };
 
-/// Parser for documents of strangers: no validation, nothing fetched, and no document type
-/// declaration, without which there are no entities to expand.
+/// Parser for untrusted documents: no validation, nothing fetched, and no document type
+/// declaration, so that there are no entities to expand.
 class MessageParser : public xercesc::XercesDOMParser {
 public:
   MessageParser() {
@@ -61,7 +62,7 @@ public:
   void doctypeDecl(const xercesc::DTDElementDecl& /*elementDecl*/, const XMLCh* /*publicId*/,
                    const XMLCh* /*systemId*/, bool /*hasInternalSubset*/,
                    bool /*hasExternalSubset*/) override {
-    throw IllFormedMessage("document type declaration refused", __FILE__, __LINE__);
+    throw IllFormedMessage("document type declaration refused");
   }
 
   void startDocument() override {
@@ -75,9 +76,9 @@ public:
                     const XMLSize_t attributeCount, const bool isEmpty,
                     const bool isRoot) override {
     if (depth_ == DEEPEST_NESTING) {
-      throw IllFormedMessage("more elements inside each other than can end", __FILE__, __LINE__);
+      throw IllFormedMessage("more elements inside each other than can end");
     }
-    ++depth_; // an empty element ends as well
+    ++depth_; // also for an empty element: endElement is called for it
     XercesDOMParser::startElement(elementDecl, uriId, prefix, attributes, attributeCount, isEmpty,
                                   isRoot);
   }
@@ -93,7 +94,7 @@ private:
   std::size_t depth_ = 0; ///< elements that have not ended
 };
 
-/// Keeps a parser in its place for as long as the scope lives.
+/// Provides a parser in `place` for as long as the scope lives.
 class ParserScope {
 public:
   explicit ParserScope(std::unique_ptr<xercesc::XercesDOMParser>& place) : place_(place) {
@@ -107,7 +108,7 @@ private:
   std::unique_ptr<xercesc::XercesDOMParser>& place_;
 };
 
-/// Ends a document's life.
+/// Releases a document.
 struct DocumentRelease {
   void operator()(xercesc::DOMDocument* document) const noexcept { document->release(); }
 };
@@ -123,7 +124,8 @@ void MessageProcessor::HandleError(int /*error*/, Stream& /*stream*/, const unsi
 
 void MessageProcessor::ReadMessages(Stream& stream) {
   const ParserScope parser(parser_);
-  const auto [delimiter, delimiterLength] = GetDelimiter();
+  const auto [delimiterBytes, delimiterLength] = GetDelimiter();
+  const Bytes delimiter(delimiterBytes, delimiterLength);
 
   std::array<unsigned char, CHUNK_SIZE> chunk{};
   buffer.clear();
@@ -132,45 +134,45 @@ void MessageProcessor::ReadMessages(Stream& stream) {
   while (const unsigned count = stream.Read(chunk.data(), chunk.size())) {
     buffer.insert(buffer.end(), chunk.begin(), chunk.begin() + count);
 
-    auto message = buffer.begin();
-    auto search = buffer.begin() + static_cast<std::ptrdiff_t>(searched);
+    Bytes rest(buffer); // after the last delimiter
+    Bytes unsearched = rest.subspan(searched);
     for (;;) {
-      const auto end = std::search(search, buffer.end(), delimiter, delimiter + delimiterLength);
-      const auto length = static_cast<unsigned long>(end - message);
-      // The bytes that may still turn out to begin a delimiter are no message yet.
-      const bool ended = end != buffer.end();
-      if (!skipping && length > MAXIMUM_MESSAGE_LENGTH + (ended ? 0 : delimiterLength - 1)) {
+      const auto found = std::ranges::search(unsearched, delimiter);
+      const bool ended = !found.empty();
+      const Bytes message(rest.begin(), found.begin());
+      // The last bytes may still turn out to begin a delimiter and then belong to no message.
+      if (!skipping &&
+          message.size() > MAXIMUM_MESSAGE_LENGTH + (ended ? 0 : delimiter.size() - 1)) {
         static_assert(MAXIMUM_MESSAGE_LENGTH == 65536);
-        GiveUp(MESSAGE_TOO_LONG, "message of more than 65536 bytes skipped", stream, nullptr, 0);
+        GiveUp(MESSAGE_TOO_LONG, "message of more than 65536 bytes skipped", stream, {});
         skipping = true;
       }
       if (!ended) {
         break;
       }
       if (!skipping) {
-        ProcessMessage(stream, std::to_address(message), length);
+        ProcessMessage(stream, message);
       }
       skipping = false;
-      message = search = end + static_cast<std::ptrdiff_t>(delimiterLength);
+      rest = unsearched = Bytes(found.end(), rest.end());
     }
 
-    const auto unsearched = std::min<std::ptrdiff_t>(
-        buffer.end() - search, static_cast<std::ptrdiff_t>(delimiterLength) - 1);
-    buffer.erase(buffer.begin(), skipping ? buffer.end() - unsearched : message);
-    searched = buffer.size() - static_cast<std::size_t>(unsearched);
+    const std::size_t unfinished = std::min(unsearched.size(), delimiter.size() - 1);
+    const std::size_t kept = skipping ? unfinished : rest.size();
+    buffer.erase(buffer.begin(), buffer.end() - static_cast<std::ptrdiff_t>(kept));
+    searched = kept - unfinished;
   }
 }
 
-void MessageProcessor::ProcessMessage(Stream& stream, const unsigned char* data,
-                                      unsigned long length) const {
+void MessageProcessor::ProcessMessage(Stream& stream, Bytes message) const {
   try {
-    if (IsValidMessage(std::string(data, data + length))) {
-      ParseMessage(stream, data, length);
+    if (IsValidMessage(std::string(message.begin(), message.end()))) {
+      ParseMessage(stream, message.data(), message.size());
     }
   } catch (const IllFormedMessage& exception) {
-    GiveUp(MESSAGE_ILL_FORMED, exception.what(), stream, data, length);
+    GiveUp(MESSAGE_ILL_FORMED, exception.what(), stream, message);
   } catch (...) {
-    GiveUp(MESSAGE_NOT_HANDLED, DescribeException(std::current_exception()), stream, data, length);
+    GiveUp(MESSAGE_NOT_HANDLED, DescribeException(std::current_exception()), stream, message);
   }
 }
 
@@ -180,16 +182,16 @@ void MessageProcessor::ParseMessage(Stream& stream, const unsigned char* data,
     parser_ = std::make_unique<MessageParser>();
   }
   spent_ = length > ORDINARY_LENGTH;
-  // It keeps what it made of an ill-formed message, one document for each.
+  // The parser keeps the unfinished document of every ill-formed message.
   parser_->resetDocumentPool();
   try {
     parser_->parse(xercesc::MemBufInputSource(data, length, "message"));
   } catch (const xercesc::SAXException& exception) {
-    throw IllFormedMessage(XMLCh2string(exception.getMessage()), __FILE__, __LINE__);
+    throw IllFormedMessage(XMLCh2string(exception.getMessage()));
   } catch (const xercesc::XMLException& exception) {
-    throw IllFormedMessage(XMLCh2string(exception.getMessage()), __FILE__, __LINE__);
+    throw IllFormedMessage(XMLCh2string(exception.getMessage()));
   } catch (const xercesc::DOMException& exception) {
-    throw IllFormedMessage(XMLCh2string(exception.getMessage()), __FILE__, __LINE__);
+    throw IllFormedMessage(XMLCh2string(exception.getMessage()));
   } catch (const xercesc::OutOfMemoryException&) {
     // The parser believes that it is still parsing and would refuse every further message.
     spent_ = true;
@@ -220,9 +222,9 @@ std::string MessageProcessor::DescribeException(const std::exception_ptr& except
 }
 
 void MessageProcessor::GiveUp(Error error, const std::string& reason, Stream& stream,
-                              const unsigned char* data, unsigned long length) const {
+                              Bytes message) const {
   syslog(LOG_LOCAL1 | LOG_ERR, "MessageProcessor:: %s", reason.c_str());
-  HandleError(error, stream, data, length);
+  HandleError(error, stream, message.data(), message.size());
 }
 
 } // namespace orva::util

@@ -32,10 +32,7 @@ std::string Path::Canonicalize() const {
 
 std::string Path::Basic() const {
   const std::size_t last = path_.find_last_not_of(SEPARATOR);
-  if (last == std::string::npos) {
-    return path_.substr(0, 1);
-  }
-  return path_.substr(0, last + 1);
+  return path_.substr(0, last == std::string::npos ? 1 : last + 1);
 }
 
 std::string MakePath(std::string_view directory, std::string_view name) {

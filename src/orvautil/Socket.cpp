@@ -5,7 +5,6 @@
 
 #include <poll.h>
 #include <sys/ioctl.h>
-#include <unistd.h>
 
 #include <cerrno>
 #include <cstddef>
@@ -15,19 +14,16 @@ namespace orva::util {
 
 Socket::Address::Address(const std::string& text) {
   if (text.size() < 2 || (text.front() != '/' && text.front() != '@')) {
-    throw Exception(
-        FormatString(
-            "Not a local socket address, which is the absolute path of a socket or @name: '%s'",
-            text.c_str()),
-        __FILE__, __LINE__);
+    throw Exception(FormatString(
+        "Not a local socket address, which is the absolute path of a socket or @name: '%s'",
+        text.c_str()));
   }
   const bool abstract = text.front() == '@';
   // A path needs room for its NUL; an abstract name has its NUL in front, in place of the '@'.
   const std::size_t size = abstract ? text.size() : text.size() + 1;
   if (size > sizeof address_.sun_path) {
     throw Exception(FormatString("Socket address of more than %zu bytes: '%s'",
-                                 sizeof address_.sun_path - (abstract ? 0 : 1), text.c_str()),
-                    __FILE__, __LINE__);
+                                 sizeof address_.sun_path - (abstract ? 0 : 1), text.c_str()));
   }
   address_.sun_family = AF_UNIX;
   std::memcpy(address_.sun_path, text.data(), text.size());
@@ -41,29 +37,22 @@ const sockaddr* Socket::Address::Get() const noexcept {
   return reinterpret_cast<const sockaddr*>(&address_);
 }
 
-Socket::~Socket() {
-  Socket::Close();
-}
-
 void Socket::Close() {
-  if (descriptor_ != -1) {
-    close(descriptor_);
-    descriptor_ = -1;
-  }
+  descriptor_.Reset();
 }
 
 bool Socket::IsDataAvailable(unsigned long long* count) {
-  pollfd ready{.fd = descriptor_, .events = POLLIN, .revents = 0};
+  pollfd ready{.fd = Descriptor(), .events = POLLIN, .revents = 0};
   int result = 0;
   do {
     result = poll(&ready, 1, 0);
   } while (result == -1 && errno == EINTR);
-  if (descriptor_ == -1 || result != 1) {
+  if (!IsOpen() || result != 1) {
     return false;
   }
   if (count != nullptr) {
     int bytes = 0;
-    *count = ioctl(descriptor_, FIONREAD, &bytes) == 0 ? static_cast<unsigned>(bytes) : 0;
+    *count = ioctl(Descriptor(), FIONREAD, &bytes) == 0 ? static_cast<unsigned>(bytes) : 0;
   }
   return true;
 }
@@ -71,7 +60,7 @@ bool Socket::IsDataAvailable(unsigned long long* count) {
 unsigned Socket::Read(void* data, unsigned size) {
   ssize_t count = 0;
   do {
-    count = recv(descriptor_, data, size, 0);
+    count = recv(Descriptor(), data, size, 0);
   } while (count == -1 && errno == EINTR);
   return count > 0 ? static_cast<unsigned>(count) : 0;
 }
@@ -80,7 +69,7 @@ unsigned Socket::Write(const void* data, unsigned size) {
   const auto* bytes = static_cast<const char*>(data);
   unsigned written = 0;
   while (written < size) {
-    const ssize_t count = send(descriptor_, bytes + written, size - written, MSG_NOSIGNAL);
+    const ssize_t count = send(Descriptor(), bytes + written, size - written, MSG_NOSIGNAL);
     if (count >= 0) {
       written += static_cast<unsigned>(count);
     } else if (errno != EINTR) {

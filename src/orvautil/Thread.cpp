@@ -10,14 +10,14 @@ Thread::~Thread() {
   try {
     Thread::Wait();
   } catch (...) {
-    // Whoever cares waits before. A thread that cannot be joined is left to itself.
+    // Owners wait before. A thread that cannot be joined is left running.
     thread_.detach();
   }
 }
 
 void Thread::Create(int stackMebibytes, unsigned flags, bool detached) {
   if (stackMebibytes <= 0 || flags != 0 || detached) {
-    throw Exception("A thread needs a stack, knows no flags and is joinable", __FILE__, __LINE__);
+    throw Exception("A thread needs a stack, knows no flags and is joinable");
   }
   boost::thread::attributes attributes;
   attributes.set_stack_size(static_cast<std::size_t>(stackMebibytes) << 20U);

@@ -16,17 +16,18 @@ namespace {
 constexpr XMLCh ASCII_END = 0x80;
 
 bool IsAscii(std::basic_string_view<XMLCh> text) {
-  return std::all_of(text.begin(), text.end(), [](XMLCh unit) { return unit < ASCII_END; });
+  return std::ranges::all_of(text, [](XMLCh unit) { return unit < ASCII_END; });
 }
 
 bool IsAscii(std::string_view text) {
-  return std::all_of(text.begin(), text.end(),
-                     [](char byte) { return static_cast<unsigned char>(byte) < ASCII_END; });
+  return std::ranges::all_of(
+      text, [](char byte) { return static_cast<unsigned char>(byte) < ASCII_END; });
 }
 
 } // namespace
 
-// Nearly all texts are ASCII, and making a transcoder takes longer than parsing a notification.
+// Nearly all texts are ASCII. They are converted without a transcoder, because making one takes
+// longer than parsing a notification.
 
 std::string XMLCh2string(const XMLCh* text) {
   if (text == nullptr) {
@@ -35,8 +36,8 @@ std::string XMLCh2string(const XMLCh* text) {
   const std::basic_string_view<XMLCh> units(text, xercesc::XMLString::stringLen(text));
   if (IsAscii(units)) {
     std::string ascii(units.size(), '\0');
-    std::transform(units.begin(), units.end(), ascii.begin(),
-                   [](XMLCh unit) { return static_cast<char>(unit); });
+    std::ranges::transform(units, ascii.begin(),
+                           [](XMLCh unit) { return static_cast<char>(unit); });
     return ascii;
   }
   const xercesc::TranscodeToStr utf8(text, "UTF-8");

@@ -46,7 +46,7 @@ thread_times thread_timer::Elapsed() const {
 std::string thread_timer::format(const thread_times& times) {
   constexpr long double second = 1'000'000'000.0L;
   const long long cpu = times.user + times.system;
-  // The two clocks tick differently; a thread is never shown busier than the time that passed.
+  // The two clocks tick differently; the processor's share is never more than 100 %.
   const long long wall = std::max(times.wall, cpu);
   const long double share =
       wall > 0 ? static_cast<long double>(cpu) / static_cast<long double>(wall) * 100 : 0;

@@ -4,6 +4,7 @@
 
 #include "FolderItemCmp.h"
 
+#include "orvadb/ErrorMessage.h"
 #include "orvadb/File.h"
 #include "orvadb/Folder.h"
 #include "orvadb/Statement.h"
@@ -38,8 +39,8 @@ public:
   void Take(const db::FolderItem& item, std::size_t more) {
     left_ -= static_cast<long long>(item.path.size() + item.name.size() + more);
     if (left_ < 0) {
-      throw util::FormatString("%s:%d: '%s' has more rows than a file of its size can hold",
-                               __FILE__, __LINE__, catalog_.GetPath().c_str());
+      throw db::ErrorMessage(util::FormatString(
+          "'%s' has more rows than a file of its size can hold", catalog_.GetPath().c_str()));
     }
   }
 
@@ -94,9 +95,8 @@ util::OwnerVector<db::Folder> ReadFolders(const std::string& volumeMountPoint,
   // The unary plus here and below keeps SQLite from an index on a flag.
   const std::string base = util::Path(volumeMountPoint).Basic();
   Statement query(catalog,
-                  "SELECT * FROM Folders where +isSystem = 0 AND +isBackup = 0 AND +isHidden = 0",
-                  __FILE__, __LINE__);
-  while (query.Step(__FILE__, __LINE__) == Statement::ROW) {
+                  "SELECT * FROM Folders where +isSystem = 0 AND +isBackup = 0 AND +isHidden = 0");
+  while (query.Step() == Statement::ROW) {
     folders.push_back(ReadItem<db::Folder>(query, base));
     memory.Take(*folders.back(), sizeof(db::Folder));
   }
@@ -117,10 +117,9 @@ util::OwnerVector<db::File> ReadChangedFiles(const std::string& volumeMountPoint
                   "f.isHidden,f.isSystem,f.isDeleted,f.status,t.lastUpdatedDate,f.ext,f.size from "
                   "Files f, Transcodings t WHERE f.id = t.sourceId AND t.lastUpdatedDate > ? AND "
                   "t.profile = 'cb62bbdd389b48898f2e5244977cb2c5' AND ((f.isDeleted = 0 and "
-                  "t.status = 1) OR (f.isDeleted = 1 and t.status = 0))",
-                  __FILE__, __LINE__);
-  query.BindTime(1, since, __FILE__, __LINE__);
-  while (query.Step(__FILE__, __LINE__) == Statement::ROW) {
+                  "t.status = 1) OR (f.isDeleted = 1 and t.status = 0))");
+  query.BindTime(1, since);
+  while (query.Step() == Statement::ROW) {
     auto file = ReadItem<db::File>(query, base);
     file->ext = query.GetTextView(12);
     file->size = query.GetInt64(13);
@@ -137,18 +136,16 @@ PhotoCounts CountPhotos(const std::string& /*volumeMountPoint*/, const db::Volum
   {
     Statement query(catalog,
                     "SELECT count(*) FROM Files WHERE category = 3 AND status = ? AND +isSystem = "
-                    "0 AND +isBackup = 0 AND +isHidden = 0 AND +isDeleted = 0",
-                    __FILE__, __LINE__);
-    query.BindInt64(1, TRANSCODED, __FILE__, __LINE__);
-    if (query.Step(__FILE__, __LINE__) == Statement::ROW) {
+                    "0 AND +isBackup = 0 AND +isHidden = 0 AND +isDeleted = 0");
+    query.BindInt64(1, TRANSCODED);
+    if (query.Step() == Statement::ROW) {
       counts.transcoded = query.GetInt(0);
     }
   }
   Statement query(catalog,
                   "SELECT count(*) FROM Files WHERE category = 3 AND +isSystem = 0 AND +isBackup "
-                  "= 0 AND +isHidden = 0 AND +isDeleted = 0",
-                  __FILE__, __LINE__);
-  if (query.Step(__FILE__, __LINE__) == Statement::ROW) {
+                  "= 0 AND +isHidden = 0 AND +isDeleted = 0");
+  if (query.Step() == Statement::ROW) {
     counts.total = query.GetInt(0);
   }
   return counts;

@@ -105,7 +105,7 @@ Applied ApplyCatalog(const PhotoDB& photos, const db::VolumeDB& catalog, const s
                      std::time_t since, const std::atomic<bool>& stopRequested) {
   // One view of the catalog for all three reads, let go before the writing begins, so that the
   // indexer is not kept waiting.
-  db::Transaction snapshot(catalog, CATALOG_BUSY_TIMEOUT, __FILE__, __LINE__);
+  db::Transaction snapshot(catalog, CATALOG_BUSY_TIMEOUT);
 
   thread_timer timer;
   const auto folders = ReadFolders(volume, catalog);
@@ -121,7 +121,7 @@ Applied ApplyCatalog(const PhotoDB& photos, const db::VolumeDB& catalog, const s
   const PhotoCounts counts = CountPhotos(volume, catalog);
   syslog(LOG_LOCAL1 | LOG_INFO, "Retrieved counts from the orva db for mountPoint %s in %s\n",
          volume.c_str(), Elapsed(timer).c_str());
-  snapshot.Commit(__FILE__, __LINE__);
+  snapshot.Commit();
 
   timer.Start();
   ApplyFolders(photos, volume, folders, stopRequested);
@@ -165,7 +165,7 @@ void DBMerger::MergeDB(const std::string& masterMountPoint, const std::string& v
     const db::VolumeDB catalog(volumeMountPoint, false);
     PhotoDB photos(masterMountPoint);
     photos.Init();
-    db::Transaction transaction(photos, MERGE_BUSY_TIMEOUT, __FILE__, __LINE__);
+    db::Transaction transaction(photos, MERGE_BUSY_TIMEOUT);
     const auto statistics = ReadStatistics(photos, volumeMountPoint);
     const Applied applied = ApplyCatalog(photos, catalog, volumeMountPoint,
                                          statistics->last_updated_time, stopRequested);
@@ -175,7 +175,7 @@ void DBMerger::MergeDB(const std::string& masterMountPoint, const std::string& v
     statistics->photos_xcoded = applied.counts.transcoded;
     statistics->photos_total = applied.counts.total;
     photos.UpdateStatistics(*statistics);
-    transaction.Commit(__FILE__, __LINE__);
+    transaction.Commit();
   } catch (const std::string& error) {
     syslog(LOG_LOCAL1 | LOG_ERR, "Error that we will ignore %s\n", error.c_str());
   }

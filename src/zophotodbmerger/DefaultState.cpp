@@ -9,10 +9,10 @@
 namespace orva::dbmerger {
 
 void DefaultState::handleVolumePlugged(VolumeInfo /*volume*/) {
-  syslog(LOG_LOCAL1 | LOG_INFO, "Default:: VolumePlugged %s", "");
+  syslog(LOG_LOCAL1 | LOG_INFO, "Default:: VolumePlugged ");
   VolumeInfoManager& registry = VolumeInfoManager::Instance();
   if (!registry.reelectMasterVolume()) {
-    syslog(LOG_LOCAL1 | LOG_INFO, "DefaultState:: We DO NOT have a master volume %s", "");
+    syslog(LOG_LOCAL1 | LOG_INFO, "DefaultState:: We DO NOT have a master volume ");
     return;
   }
   syslog(LOG_LOCAL1 | LOG_INFO, "We now have a master volume %s",
@@ -21,25 +21,25 @@ void DefaultState::handleVolumePlugged(VolumeInfo /*volume*/) {
 }
 
 void DefaultState::handleVolumeUnplugged(VolumeInfo /*volume*/) {
-  syslog(LOG_LOCAL1 | LOG_INFO, "Default:: Volumeunplugged, ignoring! %s", "");
+  syslog(LOG_LOCAL1 | LOG_INFO, "Default:: Volumeunplugged, ignoring! ");
 }
 
 void DefaultState::handleVolumeScanned(VolumeInfo volume) {
-  syslog(LOG_LOCAL1 | LOG_INFO, "Default:: Volume Scanned %s", "");
+  syslog(LOG_LOCAL1 | LOG_INFO, "Default:: Volume Scanned ");
   DefaultState::handlePictureTranscoded(std::move(volume));
 }
 
 // The volume of the event is not merged: its next batch or purge is.
 void DefaultState::handlePictureTranscoded(VolumeInfo /*volume*/) {
   if (!VolumeInfoManager::Instance().reelectMasterVolume()) {
-    syslog(LOG_LOCAL1 | LOG_INFO, "Staying in the Default state %s", "");
+    syslog(LOG_LOCAL1 | LOG_INFO, "Staying in the Default state ");
     return;
   }
   StateMachine::Instance().moveToScannedState();
 }
 
 void DefaultState::handleVolumePurged(VolumeInfo /*volume*/) {
-  syslog(LOG_LOCAL1 | LOG_INFO, "Default:: Volume purged - ignored! %s", "");
+  syslog(LOG_LOCAL1 | LOG_INFO, "Default:: Volume purged - ignored! ");
 }
 
 int DefaultState::getStateType() {

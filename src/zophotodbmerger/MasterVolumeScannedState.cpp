@@ -22,11 +22,11 @@ MasterVolumeScannedState::MasterVolumeScannedState() {
 }
 
 void MasterVolumeScannedState::handleVolumePlugged(VolumeInfo /*volume*/) {
-  syslog(LOG_LOCAL1 | LOG_INFO, "MasterVolumeScannedState:: VolumePlugged, ignoring! %s", "");
+  syslog(LOG_LOCAL1 | LOG_INFO, "MasterVolumeScannedState:: VolumePlugged, ignoring! ");
 }
 
 void MasterVolumeScannedState::handleVolumeUnplugged(VolumeInfo volume) {
-  syslog(LOG_LOCAL1 | LOG_INFO, "MasterVolumeScannedState:: Volumeunplugged %s", "");
+  syslog(LOG_LOCAL1 | LOG_INFO, "MasterVolumeScannedState:: Volumeunplugged ");
   VolumeInfoManager& registry = VolumeInfoManager::Instance();
   // When the master itself is gone this is the empty record, and the rows are removed from a
   // database that no volume holds.
@@ -34,7 +34,7 @@ void MasterVolumeScannedState::handleVolumeUnplugged(VolumeInfo volume) {
   owned.merger.stopRequested = true;
 
   if (registry.reelectMasterVolume()) {
-    syslog(LOG_LOCAL1 | LOG_INFO, "Moving to the scanned state since we can safely do so %s", "");
+    syslog(LOG_LOCAL1 | LOG_INFO, "Moving to the scanned state since we can safely do so ");
     // The blank at the end tells this line from those of the other states.
     syslog(LOG_LOCAL1 | LOG_INFO, "We now have a master volume %s ",
            registry.getMasterVolume().ToString().c_str());
@@ -43,7 +43,7 @@ void MasterVolumeScannedState::handleVolumeUnplugged(VolumeInfo volume) {
     return;
   }
   syslog(LOG_LOCAL1 | LOG_INFO,
-         "We do NOT have a master volume, so going back to the Default State %s", "");
+         "We do NOT have a master volume, so going back to the Default State ");
   StateMachine::Instance().fallBackToDefaultState();
 }
 

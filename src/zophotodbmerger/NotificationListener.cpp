@@ -83,19 +83,19 @@ Handler SelectHandler(const std::string& name, const xercesc::DOMNode& root, Vol
     return &State::handleVolumeUnplugged;
   }
   if (name == "Scanned") {
-    syslog(LOG_LOCAL1 | LOG_INFO, "%s:: Scanned", "");
+    syslog(LOG_LOCAL1 | LOG_INFO, ":: Scanned");
     return &State::handleVolumeScanned;
   }
   if (name == "TranscodedBatch") {
-    syslog(LOG_LOCAL1 | LOG_INFO, "%s:: Transcodedbatch ", "");
+    syslog(LOG_LOCAL1 | LOG_INFO, ":: Transcodedbatch ");
     return IsAcceptedBatch(root) ? &State::handlePictureTranscoded : nullptr;
   }
   if (name == "End") {
-    syslog(LOG_LOCAL1 | LOG_INFO, "%s:: End ", "");
+    syslog(LOG_LOCAL1 | LOG_INFO, ":: End ");
     return &State::handlePictureTranscoded;
   }
   if (name == "Purged") {
-    syslog(LOG_LOCAL1 | LOG_INFO, "%s:: Purged ", "");
+    syslog(LOG_LOCAL1 | LOG_INFO, ":: Purged ");
     return &State::handleVolumePurged;
   }
   return nullptr;

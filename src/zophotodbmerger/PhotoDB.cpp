@@ -117,8 +117,7 @@ PhotoDB::PhotoDB(const std::string& location, CacheUse cacheUse)
     util::Path(dbLocation).Create(DIRECTORY_PERMISSIONS);
     if (!ChangeDirectoryMode(dbLocation, EVERYBODY)) {
       throw util::Exception(
-          util::FormatString("Change permissions failed on dbLocation: '%s'", dbLocation.c_str()),
-          __FILE__, __LINE__);
+          util::FormatString("Change permissions failed on dbLocation: '%s'", dbLocation.c_str()));
     }
   }
   if (!IsDirectory(dbLocation)) {
@@ -149,8 +148,8 @@ void PhotoDB::Init() {
 }
 
 void PhotoDB::LoadStatus() {
-  Statement query(*this, "SELECT * FROM Status", __FILE__, __LINE__);
-  if (query.Fetch(__FILE__, __LINE__)) {
+  Statement query(*this, "SELECT * FROM Status");
+  if (query.Fetch()) {
     status.id = query.GetInt64(0);
     status.mc_version = query.GetText(1);
     status.mdate = query.GetInt(2);
@@ -162,55 +161,49 @@ void PhotoDB::LoadStatus() {
 void PhotoDB::CreateTables() {
   Statement(*this,
             "CREATE TABLE IF NOT EXISTS Status(id INTEGER PRIMARY KEY AUTOINCREMENT, mc_version "
-            "CHAR(16) NOT NULL, mdate INTEGER NOT NULL, desc CHAR(80), etype INTEGER)",
-            __FILE__, __LINE__)
-      .Execute(__FILE__, __LINE__);
+            "CHAR(16) NOT NULL, mdate INTEGER NOT NULL, desc CHAR(80), etype INTEGER)")
+      .Execute();
   Statement(*this,
             "CREATE TABLE IF NOT EXISTS Statistics(id INTEGER PRIMARY KEY AUTOINCREMENT, volume "
             "TEXT NOT NULL, photos_xcoded INTEGER NOT NULL, photos_total INTEGER NOT NULL, "
-            "last_updated_time INTEGER NOT NULL)",
-            __FILE__, __LINE__)
-      .Execute(__FILE__, __LINE__);
+            "last_updated_time INTEGER NOT NULL)")
+      .Execute();
 
   status.mc_version = "2.0";
   status.mdate = NEW_DATABASE_TIME;
   status.desc.clear();
   status.etype = 0;
   Statement insertStatus(*this,
-                         "INSERT INTO Status(mc_version, mdate, desc, etype) VALUES(?, ?, ?, ?)",
-                         __FILE__, __LINE__);
-  insertStatus.BindText(1, status.mc_version, __FILE__, __LINE__);
-  insertStatus.BindTime(2, status.mdate, __FILE__, __LINE__);
-  insertStatus.BindText(3, status.desc, __FILE__, __LINE__);
-  insertStatus.BindInt(4, status.etype, __FILE__, __LINE__);
-  insertStatus.Execute(__FILE__, __LINE__);
+                         "INSERT INTO Status(mc_version, mdate, desc, etype) VALUES(?, ?, ?, ?)");
+  insertStatus.BindText(1, status.mc_version);
+  insertStatus.BindTime(2, status.mdate);
+  insertStatus.BindText(3, status.desc);
+  insertStatus.BindInt(4, status.etype);
+  insertStatus.Execute();
 
   Statement(*this,
             "CREATE TABLE IF NOT EXISTS Folders(folder_id INTEGER PRIMARY KEY AUTOINCREMENT, "
             "parent_folder_id INTEGER NOT NULL, name TEXT NOT NULL, modified_date INTEGER NOT "
-            "NULL, volume TEXT NOT NULL)",
-            __FILE__, __LINE__)
-      .Execute(__FILE__, __LINE__);
+            "NULL, volume TEXT NOT NULL)")
+      .Execute();
 
   // The root folder, below which every volume hangs. It gets id 1 because the table is new;
   // DeleteVolumes counts on that.
   Statement insertRoot(
       *this,
-      "INSERT INTO Folders(parent_folder_id, name, modified_date, volume) VALUES(?, ?, ?, ?)",
-      __FILE__, __LINE__);
-  insertRoot.BindInt(1, -1, __FILE__, __LINE__);
-  insertRoot.BindText(2, "/shares/", __FILE__, __LINE__);
-  insertRoot.BindTime(3, 0, __FILE__, __LINE__);
-  insertRoot.BindText(4, "<DUMMY>", __FILE__, __LINE__);
-  insertRoot.Execute(__FILE__, __LINE__);
+      "INSERT INTO Folders(parent_folder_id, name, modified_date, volume) VALUES(?, ?, ?, ?)");
+  insertRoot.BindInt(1, -1);
+  insertRoot.BindText(2, "/shares/");
+  insertRoot.BindTime(3, 0);
+  insertRoot.BindText(4, "<DUMMY>");
+  insertRoot.Execute();
 
   Statement(*this,
             "CREATE TABLE IF NOT EXISTS Files(file_id INTEGER PRIMARY KEY AUTOINCREMENT, folder_id "
             "INTEGER NOT NULL, name TEXT NOT NULL, modified_date INTEGER NOT NULL, volume TEXT NOT "
             "NULL, created_date INTEGER NOT NULL, FOREIGN KEY(folder_id) REFERENCES "
-            "Folders(folder_id) ON DELETE CASCADE)",
-            __FILE__, __LINE__)
-      .Execute(__FILE__, __LINE__);
+            "Folders(folder_id) ON DELETE CASCADE)")
+      .Execute();
 }
 
 void PhotoDB::CreateIndices() {
@@ -219,7 +212,7 @@ void PhotoDB::CreateIndices() {
         "CREATE INDEX IF NOT EXISTS Folders_path ON Folders(name)",
         "CREATE INDEX IF NOT EXISTS Files_folderId ON Files(folder_id)",
         "CREATE INDEX IF NOT EXISTS Files_name ON Files(name)"}) {
-    Statement(*this, sql, __FILE__, __LINE__).Execute(__FILE__, __LINE__);
+    Statement(*this, sql).Execute();
   }
 }
 
@@ -234,19 +227,18 @@ void PhotoDB::Clear() {
 void PhotoDB::DumpTable(const std::string& /*table*/) const {}
 
 std::unique_ptr<Folder> PhotoDB::GetFolder(long long folderId) const {
-  Statement query(*this, "SELECT * FROM Folders WHERE folder_id = ?", __FILE__, __LINE__);
-  query.BindInt64(1, folderId, __FILE__, __LINE__);
-  return query.Fetch(__FILE__, __LINE__) ? ReadFolder(query) : nullptr;
+  Statement query(*this, "SELECT * FROM Folders WHERE folder_id = ?");
+  query.BindInt64(1, folderId);
+  return query.Fetch() ? ReadFolder(query) : nullptr;
 }
 
 std::unique_ptr<Folder> PhotoDB::GetFolder(const std::string& name,
                                            const std::string& volume) const {
   // The unary plus keeps SQLite from an index on the volume.
-  Statement query(*this, "SELECT * FROM Folders WHERE name = ? AND +volume = ?", __FILE__,
-                  __LINE__);
-  query.BindText(1, name, __FILE__, __LINE__);
-  query.BindText(2, volume, __FILE__, __LINE__);
-  return query.Fetch(__FILE__, __LINE__) ? ReadFolder(query) : nullptr;
+  Statement query(*this, "SELECT * FROM Folders WHERE name = ? AND +volume = ?");
+  query.BindText(1, name);
+  query.BindText(2, volume);
+  return query.Fetch() ? ReadFolder(query) : nullptr;
 }
 
 void PhotoDB::MergeCache::Forget() {
@@ -274,23 +266,23 @@ PhotoDB::MergeCache& PhotoDB::Cache() const {
 }
 
 long long PhotoDB::FindFolder(std::string_view path) const {
-  Statement query(*this, "select * FROM Folders where name = ?", __FILE__, __LINE__);
-  query.BindTextView(1, path, __FILE__, __LINE__);
-  return query.Fetch(__FILE__, __LINE__) ? query.GetInt64(0) : NO_FOLDER;
+  Statement query(*this, "select * FROM Folders where name = ?");
+  query.BindTextView(1, path);
+  return query.Fetch() ? query.GetInt64(0) : NO_FOLDER;
 }
 
 long long PhotoDB::FindFolder(std::string_view path, const std::string& volume) const {
-  Statement query(*this, "select * FROM Folders where name = ? and volume = ?", __FILE__, __LINE__);
-  query.BindTextView(1, path, __FILE__, __LINE__);
-  query.BindTextView(2, volume, __FILE__, __LINE__);
-  return query.Fetch(__FILE__, __LINE__) ? query.GetInt64(0) : NO_FOLDER;
+  Statement query(*this, "select * FROM Folders where name = ? and volume = ?");
+  query.BindTextView(1, path);
+  query.BindTextView(2, volume);
+  return query.Fetch() ? query.GetInt64(0) : NO_FOLDER;
 }
 
 void PhotoDB::AddFolder(std::string volume, db::Folder& folder) const {
   {
-    Statement query(*this, "SELECT * FROM Folders where name = ?", __FILE__, __LINE__);
-    query.BindTextView(1, folder.path, __FILE__, __LINE__);
-    if (query.Fetch(__FILE__, __LINE__)) {
+    Statement query(*this, "SELECT * FROM Folders where name = ?");
+    query.BindTextView(1, folder.path);
+    if (query.Fetch()) {
       return;
     }
   }
@@ -300,13 +292,12 @@ void PhotoDB::AddFolder(std::string volume, db::Folder& folder) const {
   }
   Statement insert(
       *this,
-      "INSERT INTO Folders(parent_folder_id, name, modified_date, volume) VALUES(?, ?, ?, ?)",
-      __FILE__, __LINE__);
-  insert.BindInt64(1, parentId, __FILE__, __LINE__);
-  insert.BindTextView(2, folder.path, __FILE__, __LINE__);
-  insert.BindTime(3, folder.lastModifiedDate, __FILE__, __LINE__);
-  insert.BindTextView(4, volume, __FILE__, __LINE__);
-  insert.Execute(__FILE__, __LINE__);
+      "INSERT INTO Folders(parent_folder_id, name, modified_date, volume) VALUES(?, ?, ?, ?)");
+  insert.BindInt64(1, parentId);
+  insert.BindTextView(2, folder.path);
+  insert.BindTime(3, folder.lastModifiedDate);
+  insert.BindTextView(4, volume);
+  insert.Execute();
 
   MergeCache& cache = Cache();
   if (cache.transaction != 0 && cache.firstOwnFolder == MergeCache::NONE) {
@@ -320,7 +311,7 @@ void PhotoDB::DeleteVolumes() const {
   Cache().Forget();
   for (const char* const sql : {"DELETE FROM Folders WHERE folder_id != 1", "DELETE FROM Files ",
                                 "DELETE FROM Statistics", "VACUUM"}) {
-    Statement(*this, sql, __FILE__, __LINE__).Execute(__FILE__, __LINE__);
+    Statement(*this, sql).Execute();
   }
 }
 
@@ -332,16 +323,16 @@ void PhotoDB::DeleteVolume(const std::string& volume) const {
   for (const char* const sql :
        {"UPDATE Statistics SET last_updated_time = 0 WHERE volume = ?",
         "DELETE FROM Files WHERE volume = ?", "DELETE FROM Folders WHERE volume = ?"}) {
-    Statement change(*this, sql, __FILE__, __LINE__);
-    change.BindText(1, volume, __FILE__, __LINE__);
-    change.Execute(__FILE__, __LINE__);
+    Statement change(*this, sql);
+    change.BindText(1, volume);
+    change.Execute();
   }
 }
 
 std::unique_ptr<File> PhotoDB::GetFile(long long fileId) const {
-  Statement query(*this, "SELECT * FROM Files WHERE file_id = ?", __FILE__, __LINE__);
-  query.BindInt64(1, fileId, __FILE__, __LINE__);
-  return query.Fetch(__FILE__, __LINE__) ? ReadFile(query) : nullptr;
+  Statement query(*this, "SELECT * FROM Files WHERE file_id = ?");
+  query.BindInt64(1, fileId);
+  return query.Fetch() ? ReadFile(query) : nullptr;
 }
 
 bool PhotoDB::IsFilePresent(const std::string& volume, const db::File& file,
@@ -355,12 +346,11 @@ bool PhotoDB::IsFilePresent(const std::string& volume, const db::File& file,
   {
     Statement query(*this,
                     "SELECT * FROM Files f, Folders o where f.folder_id = o.folder_id and f.name = "
-                    "? and o.name = ? and f.volume = ?",
-                    __FILE__, __LINE__);
-    query.BindTextView(1, file.name, __FILE__, __LINE__);
-    query.BindTextView(2, folderPath, __FILE__, __LINE__);
-    query.BindTextView(3, volume, __FILE__, __LINE__);
-    present = query.Fetch(__FILE__, __LINE__);
+                    "? and o.name = ? and f.volume = ?");
+    query.BindTextView(1, file.name);
+    query.BindTextView(2, folderPath);
+    query.BindTextView(3, volume);
+    present = query.Fetch();
     cost = query.TakeCost();
   }
   LearnNames(volume, cost);
@@ -388,9 +378,9 @@ void PhotoDB::LearnNames(const std::string& volume, int cost) const {
       std::clamp(static_cast<std::size_t>(cache.folderCost / costPerName), fewNames, mostNames);
   MergeCache::Names names;
   std::size_t bytes = 0;
-  Statement query(*this, "SELECT * FROM Files WHERE folder_id = ? ", __FILE__, __LINE__);
-  query.BindInt64(1, cache.folderId, __FILE__, __LINE__);
-  while (query.Fetch(__FILE__, __LINE__)) {
+  Statement query(*this, "SELECT * FROM Files WHERE folder_id = ? ");
+  query.BindInt64(1, cache.folderId);
+  while (query.Fetch()) {
     bytes += query.GetTextView(2).size();
     if (names.size() == limit || bytes > mostBytes) {
       return;
@@ -425,17 +415,15 @@ void PhotoDB::AddFile(const std::string& volume, db::File& file) const {
     return;
   }
 
-  Statement insert(*this,
-                   "INSERT INTO Files(folder_id, name, modified_date, volume, created_date) "
-                   "VALUES(?, ?, ?, ?, ?)",
-                   __FILE__, __LINE__);
-  insert.BindInt64(1, folderId, __FILE__, __LINE__);
-  insert.BindTextView(2, file.name, __FILE__, __LINE__);
-  insert.BindTime(3, file.lastModifiedDate, __FILE__, __LINE__);
-  insert.BindTextView(4, volume, __FILE__, __LINE__);
+  Statement insert(*this, "INSERT INTO Files(folder_id, name, modified_date, volume, created_date) "
+                          "VALUES(?, ?, ?, ?, ?)");
+  insert.BindInt64(1, folderId);
+  insert.BindTextView(2, file.name);
+  insert.BindTime(3, file.lastModifiedDate);
+  insert.BindTextView(4, volume);
   // To readers a photo was created when it was last modified.
-  insert.BindTime(5, file.lastModifiedDate, __FILE__, __LINE__);
-  insert.Execute(__FILE__, __LINE__);
+  insert.BindTime(5, file.lastModifiedDate);
+  insert.Execute();
 
   if (cache.names) {
     cache.names->insert(file.name);
@@ -456,9 +444,9 @@ void PhotoDB::DeleteFolder(const std::string& volume, db::Folder& folder) const 
   }
   for (const char* const sql :
        {"DELETE FROM Files WHERE folder_id = ?", "DELETE FROM Folders WHERE folder_id = ?"}) {
-    Statement change(*this, sql, __FILE__, __LINE__);
-    change.BindInt64(1, folderId, __FILE__, __LINE__);
-    change.Execute(__FILE__, __LINE__);
+    Statement change(*this, sql);
+    change.BindInt64(1, folderId);
+    change.Execute();
   }
 }
 
@@ -471,11 +459,10 @@ void PhotoDB::DeleteFile(const std::string& /*volume*/, db::File& file) const {
   }
   int cost = 0;
   {
-    Statement change(*this, "DELETE FROM Files WHERE name = ? and folder_id = ?", __FILE__,
-                     __LINE__);
-    change.BindTextView(1, file.name, __FILE__, __LINE__);
-    change.BindInt64(2, folderId, __FILE__, __LINE__);
-    change.Execute(__FILE__, __LINE__);
+    Statement change(*this, "DELETE FROM Files WHERE name = ? and folder_id = ?");
+    change.BindTextView(1, file.name);
+    change.BindInt64(2, folderId);
+    change.Execute();
     cost = change.TakeCost();
   }
   IndexForRemovals(cost);
@@ -494,39 +481,38 @@ void PhotoDB::IndexForRemovals(int cost) const {
     return;
   }
   if (cache.indexCost == 0) {
-    Statement query(*this, "SELECT max(file_id) FROM Files", __FILE__, __LINE__);
-    cache.indexCost = query.Fetch(__FILE__, __LINE__) ? query.GetInt64(0) * indexCostPerFile : 0;
+    Statement query(*this, "SELECT max(file_id) FROM Files");
+    cache.indexCost = query.Fetch() ? query.GetInt64(0) * indexCostPerFile : 0;
   }
   if (cache.removalCost >= cache.indexCost) {
     CreateTransientIndex("CREATE INDEX Files_merge ON Files(folder_id, name)",
-                         "DROP INDEX Files_merge", __FILE__, __LINE__);
+                         "DROP INDEX Files_merge");
     cache.indexed = true;
   }
 }
 
 void PhotoDB::GetFolderFiles(long long folderId, std::vector<File*>& files) const {
-  Statement query(*this, "SELECT * FROM Files WHERE folder_id = ? ", __FILE__, __LINE__);
-  query.BindInt64(1, folderId, __FILE__, __LINE__);
-  while (query.Fetch(__FILE__, __LINE__)) {
+  Statement query(*this, "SELECT * FROM Files WHERE folder_id = ? ");
+  query.BindInt64(1, folderId);
+  while (query.Fetch()) {
     HandOver(ReadFile(query), files);
   }
 }
 
 void PhotoDB::GetFolderFolders(long long parentId, const std::string& volume,
                                std::vector<Folder*>& folders) const {
-  Statement query(*this, "SELECT * FROM Folders WHERE parent_folder_id = ?  AND +volume = ?",
-                  __FILE__, __LINE__);
-  query.BindInt64(1, parentId, __FILE__, __LINE__);
-  query.BindText(2, volume, __FILE__, __LINE__);
-  while (query.Fetch(__FILE__, __LINE__)) {
+  Statement query(*this, "SELECT * FROM Folders WHERE parent_folder_id = ?  AND +volume = ?");
+  query.BindInt64(1, parentId);
+  query.BindText(2, volume);
+  while (query.Fetch()) {
     HandOver(ReadFolder(query), folders);
   }
 }
 
 std::unique_ptr<Statistics> PhotoDB::GetStatistics(std::string volume) const {
-  Statement query(*this, "SELECT * FROM Statistics WHERE volume = ?", __FILE__, __LINE__);
-  query.BindText(1, volume, __FILE__, __LINE__);
-  if (query.Step(__FILE__, __LINE__) != Statement::ROW) {
+  Statement query(*this, "SELECT * FROM Statistics WHERE volume = ?");
+  query.BindText(1, volume);
+  if (query.Step() != Statement::ROW) {
     return nullptr;
   }
   auto statistics = std::make_unique<Statistics>();
@@ -539,12 +525,10 @@ std::unique_ptr<Statistics> PhotoDB::GetStatistics(std::string volume) const {
 }
 
 void PhotoDB::InsertStatistics(const std::string& volume) {
-  Statement insert(*this,
-                   "INSERT INTO Statistics(volume, photos_xcoded, photos_total, "
-                   "last_updated_time) values (?, 0, 0, 0)",
-                   __FILE__, __LINE__);
-  insert.BindText(1, volume, __FILE__, __LINE__);
-  if (!IsSuccess(insert.Step(__FILE__, __LINE__))) {
+  Statement insert(*this, "INSERT INTO Statistics(volume, photos_xcoded, photos_total, "
+                          "last_updated_time) values (?, 0, 0, 0)");
+  insert.BindText(1, volume);
+  if (!IsSuccess(insert.Step())) {
     syslog(LOG_LOCAL1 | LOG_ERR, "Could not insert stats for %s ", volume.c_str());
   }
 }
@@ -552,13 +536,12 @@ void PhotoDB::InsertStatistics(const std::string& volume) {
 void PhotoDB::UpdateStatistics(const Statistics& stats) {
   Statement update(*this,
                    "UPDATE Statistics SET photos_xcoded = ?, photos_total = ?, last_updated_time = "
-                   "? where volume = ?",
-                   __FILE__, __LINE__);
-  update.BindInt64(1, stats.photos_xcoded, __FILE__, __LINE__);
-  update.BindInt64(2, stats.photos_total, __FILE__, __LINE__);
-  update.BindTime(3, stats.last_updated_time, __FILE__, __LINE__);
-  update.BindText(4, stats.volume, __FILE__, __LINE__);
-  const int code = update.Step(__FILE__, __LINE__);
+                   "? where volume = ?");
+  update.BindInt64(1, stats.photos_xcoded);
+  update.BindInt64(2, stats.photos_total);
+  update.BindTime(3, stats.last_updated_time);
+  update.BindText(4, stats.volume);
+  const int code = update.Step();
   if (!IsSuccess(code)) {
     syslog(LOG_LOCAL1 | LOG_ERR, "Could not update stats for %s. Return code %d",
            stats.volume.c_str(), code);
@@ -567,13 +550,12 @@ void PhotoDB::UpdateStatistics(const Statistics& stats) {
 
 void PhotoDB::UpdateStatus() const {
   Statement update(*this,
-                   "UPDATE Status SET mc_version = ?, mdate = ?, desc = ?, etype = ? WHERE id = 1",
-                   __FILE__, __LINE__);
-  update.BindText(1, status.mc_version, __FILE__, __LINE__);
-  update.BindTime(2, status.mdate, __FILE__, __LINE__);
-  update.BindText(3, status.desc, __FILE__, __LINE__);
-  update.BindInt(4, status.etype, __FILE__, __LINE__);
-  update.Execute(__FILE__, __LINE__);
+                   "UPDATE Status SET mc_version = ?, mdate = ?, desc = ?, etype = ? WHERE id = 1");
+  update.BindText(1, status.mc_version);
+  update.BindTime(2, status.mdate);
+  update.BindText(3, status.desc);
+  update.BindInt(4, status.etype);
+  update.Execute();
 }
 
 } // namespace orva::dbmerger

@@ -7,6 +7,7 @@ namespace orva::dbmerger {
 /// What the daemon does about an event depends on its state. A handler may make another state
 /// current; its own object then lives on until the next transition. On the listener's thread.
 /// Handlers catch nothing: what they throw leaves the state as it was.
+/// Log readers rely on the texts that the handlers log, also on blanks at their ends.
 class State {
 public:
   State() = default;

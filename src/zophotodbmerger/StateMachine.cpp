@@ -80,7 +80,7 @@ void StateMachine::setCurrentState(State* newState) {
 }
 
 void StateMachine::moveToScannedState() {
-  syslog(LOG_LOCAL1 | LOG_INFO, "Moving to the scanned state since we can safely do so %s", "");
+  syslog(LOG_LOCAL1 | LOG_INFO, "Moving to the scanned state since we can safely do so ");
   syslog(LOG_LOCAL1 | LOG_INFO, "We now have a master volume %s",
          VolumeInfoManager::Instance().getMasterVolume().ToString().c_str());
   setCurrentState(std::make_unique<MasterVolumeScannedState>().release());

@@ -45,7 +45,7 @@ void ListenUntilTheServiceEnds() {
   listener->Create(8, 0, false);
   notificationListener = std::move(listener);
   notificationListener->Wait();
-  syslog(LOG_LOCAL1 | LOG_INFO, "Returning from the %s", "wait");
+  syslog(LOG_LOCAL1 | LOG_INFO, "Returning from the wait");
 }
 
 } // namespace

@@ -20,10 +20,11 @@ struct StatementFinalizer {
   void operator()(sqlite3_stmt* statement) const noexcept;
 };
 
-/// What a DB keeps beside its handle for as long as that is open: its compiled statements, and
-/// what its running transaction has to remember. Belongs to the DB; used on its thread.
+/// What a DB keeps for as long as its handle is open: the compiled statements and the running
+/// transaction. Belongs to the DB; used on its thread. Failures are thrown as std::string with the
+/// caller's `file` and `line`.
 ///
-/// A statement in use is checked out, so that a second one with the same text is compiled anew;
+/// A statement in use is checked out, so that a second one with the same text is compiled again;
 /// used ones come back reset, without bindings and without a lock.
 class Connection {
 public:
@@ -36,37 +37,44 @@ public:
   };
   using CheckedOut = std::unique_ptr<sqlite3_stmt, CheckIn>;
 
-  /// Belongs to `handle`, which it does not own, on a database of `bytes` bytes.
+  /// Belongs to `handle`, which it does not own, on a database of `bytes` bytes. `busyTimeout` is
+  /// how long, in milliseconds, statements outside of transactions wait for other connections.
   Connection(sqlite3* handle, int busyTimeout, long long bytes);
   Connection(const Connection&) = delete;
   Connection& operator=(const Connection&) = delete;
   ~Connection();
 
-  /// Hands out the compiled form of `sql`; compiles it when none is kept or it is in use. Throws
-  /// std::string with `file` and `line`.
-  CheckedOut CheckOut(const char* sql, const char* file, unsigned line);
-
-  /// Busy time-out of the connection in milliseconds, while no transaction has its own.
-  int BusyTimeout() const noexcept { return busyTimeout_; }
+  bool IsReadOnly() const noexcept;
 
   /// The database turned out to have `bytes` bytes.
   void SetFileSize(long long bytes) noexcept;
 
-  /// First failed step since the running transaction began, as a message; empty when none.
-  std::string failedStep;
+  /// Hands out the compiled form of `sql`; compiles it when none is kept or it is in use. Throws
+  /// also when SQLite has rolled back the running transaction.
+  CheckedOut CheckOut(const char* sql, const char* file, unsigned int line);
 
-  /// Number of the running transaction; 0 while there is none. A number stands for one
-  /// transaction only.
-  unsigned long long transaction = 0;
+  /// Runs a statement to the next row or its end and returns SQLite's result code. After a failure
+  /// the running transaction cannot be committed.
+  int Step(sqlite3_stmt* statement, const char* file, unsigned int line);
 
-  /// Statements that the running transaction executes before it commits.
-  std::vector<const char*> beforeCommit;
+  /// Begins a transaction, as a writer where the connection can write. Its statements wait
+  /// `busyTimeout` milliseconds for other connections.
+  void BeginTransaction(unsigned int busyTimeout, const char* file, unsigned int line);
 
-  /// The number for a transaction that begins.
-  unsigned long long NextTransaction() noexcept { return ++transactions_; }
+  /// Number of the running transaction; 0 while there is none. Never the same for two.
+  unsigned long long RunningTransaction() const noexcept { return transaction_; }
+
+  /// Has the running transaction execute `sql`, a literal, before it commits.
+  void ExecuteBeforeCommit(const char* sql);
+
+  /// Commits the running transaction, which otherwise keeps running.
+  void CommitTransaction(const char* file, unsigned int line);
+
+  /// Ends the running transaction without its changes.
+  void RollBackTransaction() noexcept;
 
 private:
-  /// Lets a text be looked up without making a string of it.
+  /// Looks a text up without making a string of it.
   struct TextHash {
     using is_transparent = void;
     std::size_t operator()(std::string_view text) const noexcept {
@@ -74,18 +82,20 @@ private:
     }
   };
 
-  Compiled Compile(const char* sql, const char* file, unsigned line) const;
+  Compiled Compile(const char* sql, const char* file, unsigned int line) const;
+  void Execute(sqlite3_stmt* statement, const char* file, unsigned int line);
+  void EndTransaction() noexcept;
 
   sqlite3* handle_;
   int busyTimeout_;
   std::unique_ptr<WorkLimit> workLimit_;
-  unsigned long long transactions_ = 0;
-  /// By text, which every caller writes in full, so that they are few; null while in use.
+  /// By text. Callers write whole texts, so that there are few. Null while in use.
   std::unordered_map<std::string, Compiled, TextHash, std::equal_to<>> statements_;
-};
 
-/// The message of the last failure on `handle`: "file:line: SQLite's message (extended code
-/// N) in sql". A null handle is one that there was no memory for.
-std::string ErrorMessage(sqlite3* handle, const char* sql, const char* file, unsigned line);
+  unsigned long long transaction_ = 0;  ///< number of the running transaction, 0 for none
+  unsigned long long transactions_ = 0; ///< begun so far
+  std::string failedStep_; ///< message of the transaction's first failure; may be empty
+  std::vector<const char*> beforeCommit_;
+};
 
 } // namespace orva::db

@@ -30,9 +30,9 @@ public:
   virtual void UpdateStatus(const std::string& key, const std::string& value) const;
 
   /// Opens the file at `path` for reading and writing and creates it when there is none. A
-  /// connection that is already open is closed first. The file may be a stranger's: links are
-  /// not followed, anything other than a regular file is refused, its triggers, views and checks
-  /// do not run, and a statement that works out of proportion to its size fails. Throws
+  /// connection that is already open is closed first. The file is untrusted: links are not
+  /// followed, anything other than a regular file is refused, its triggers, views and checks do
+  /// not run, and a statement that works out of proportion to the file's size fails. Throws
   /// std::string.
   void Open(const std::string& path);
 
@@ -42,15 +42,19 @@ public:
   /// Path of the open file; empty while closed.
   const std::string& GetPath() const noexcept { return path_; }
 
-  /// Bytes of the open database with its log; its holes count for little. Statements may work as
-  /// much as that is worth from now on: a file that was waited for may have grown since it was
-  /// opened. Throws std::string.
+  /// The open connection, for Statement and Transaction; still owned by this object. While closed
+  /// throws std::string with the caller's `file` and `line` and the statement `sql`.
+  Connection& OpenConnection(const char* sql, const char* file, unsigned int line) const;
+
+  /// Bytes of the open database with its log; holes count for little. The limit of the statements'
+  /// work follows this size from now on: the file may have grown while another writer was waited
+  /// for. Throws std::string.
   long long MeasureFile() const;
 
   /// Makes sure that the values in `table` are those that were stored there: refuses generated
-  /// columns and, where the connection can write, computed defaults, indices on expressions or on
-  /// part of the rows, and very many indices, which a stranger may have made so dear that a row
-  /// takes minutes. A table that is not there has none. Throws std::string.
+  /// columns and, where the connection can write, computed defaults, indexes on expressions or on
+  /// part of the rows, and too many indexes. In an untrusted database these may be so expensive
+  /// that inserting a row takes minutes. A table that does not exist has none. Throws std::string.
   void RejectComputedColumns(const std::string& table) const;
 
 protected:
@@ -58,23 +62,25 @@ protected:
   enum class Access { ReadWrite, ReadOnly };
 
   /// Makes the database file at `path`, where there is none: `build` fills it through this
-  /// object, which is open meanwhile and closed afterwards. At every instant, whatever stops,
-  /// there is either nothing at `path` or all of it. Throws std::string, or what `build` throws.
+  /// object, which is open meanwhile and closed afterwards. After a crash at any moment there is
+  /// either no file at `path` or the whole database. Throws std::string, or what `build` throws.
   void Create(const std::string& path, const std::function<void()>& build);
 
   /// Open for derived classes: `busyTimeout` is in milliseconds; `immutable` promises that
-  /// nobody writes the file, which then is neither locked nor watched. Only ReadWrite creates.
+  /// nobody writes the file: SQLite then neither locks it nor checks it for changes. Only ReadWrite
+  /// creates.
   void Open(std::string path, Access access, int busyTimeout, bool immutable);
 
-  /// Number of the transaction that runs on the open connection, for what is known only as long
-  /// as it lasts; 0 while there is none, and never the same for two.
+  /// Number of the transaction that runs on the open connection; 0 while there is none. Never the
+  /// same for two, so that it tells whether knowledge about a transaction is still valid.
   unsigned long long RunningTransaction() const noexcept;
 
-  /// Makes an index in the running transaction, by `create`, and has it removed before the commit,
-  /// by `drop`, so that no other connection ever sees it. Both texts are literals. Throws
+  /// Executes `create` now, which makes an index in the running transaction, and `drop` before the
+  /// commit, so that no other connection ever sees the index. Both texts are literals. Throws
   /// std::string with the caller's `file` and `line`.
-  void CreateTransientIndex(const char* create, const char* drop, const char* file,
-                            unsigned int line) const;
+  void CreateTransientIndex(const char* create, const char* drop,
+                            const char* file = __builtin_FILE(),
+                            unsigned int line = __builtin_LINE()) const;
 
   /// Row id of the last row inserted.
   long long LastInsertId() const noexcept;
@@ -83,9 +89,6 @@ protected:
   sqlite3* Handle() const noexcept { return handle_; }
 
 private:
-  friend class Statement;
-  friend class Transaction;
-
   sqlite3* handle_ = nullptr; ///< owned; released by Close
   std::string path_;
   std::unique_ptr<Connection> connection_; ///< what belongs to the open handle; null while closed

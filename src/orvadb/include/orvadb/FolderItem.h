@@ -22,7 +22,7 @@ public:
   long long GetId() const override { return id; }
   std::string GetTableName() const override { return GetTableName(GetItemType()); }
 
-  /// Table that holds rows of the kind `itemType`; empty for a kind that there is not.
+  /// Table that holds rows of the kind `itemType`; empty for an unknown kind.
   static std::string GetTableName(int itemType);
 
   virtual std::time_t GetLastModifiedDate() const = 0;

@@ -12,11 +12,10 @@ class DB;
 
 /// One use of a prepared statement: construct, bind, then Execute or a loop of Step with the
 /// getters after each row, then destroy. Parameters count from 1, columns from 0. On the
-/// connection's thread. `file` and `line` are the caller's and only serve error messages;
+/// connection's thread. `file` and `line` are the caller's and only appear in error messages;
 /// failures are thrown as std::string.
 ///
-/// The compiled form is kept by the connection under the text: using the same text again does
-/// not compile again.
+/// The connection keeps the compiled form: using the same text again does not compile again.
 class Statement {
 public:
   static constexpr int ROW = 100;  ///< a row is ready
@@ -24,33 +23,38 @@ public:
 
   /// Prepares `sql` on `db`, which outlives the statement. The text must stay valid as long
   /// as the statement.
-  Statement(const DB& db, const char* sql, const char* file, unsigned int line);
+  Statement(const DB& db, const char* sql, const char* file = __builtin_FILE(),
+            unsigned int line = __builtin_LINE());
   Statement(const Statement&) = delete;
   Statement& operator=(const Statement&) = delete;
   ~Statement() = default;
 
   /// Runs to the next row or the end and returns SQLite's result code, throwing nothing: ROW,
   /// DONE, or another, after which the running transaction cannot be committed.
-  int Step(const char* file, unsigned int line);
+  int Step(const char* file = __builtin_FILE(), unsigned int line = __builtin_LINE());
 
-  /// Step for callers to whom any other code than ROW or DONE is a failure, which is thrown.
-  /// Returns whether a row is ready.
-  bool Fetch(const char* file, unsigned int line);
+  /// Step that throws on any other code than ROW or DONE. Returns whether a row is ready.
+  bool Fetch(const char* file = __builtin_FILE(), unsigned int line = __builtin_LINE());
 
   /// Runs to completion.
-  void Execute(const char* file, unsigned int line);
+  void Execute(const char* file = __builtin_FILE(), unsigned int line = __builtin_LINE());
 
-  void BindInt(int index, int value, const char* file, unsigned int line);
-  void BindInt64(int index, long long value, const char* file, unsigned int line);
+  void BindInt(int index, int value, const char* file = __builtin_FILE(),
+               unsigned int line = __builtin_LINE());
+  void BindInt64(int index, long long value, const char* file = __builtin_FILE(),
+                 unsigned int line = __builtin_LINE());
   /// Copies the text, NUL bytes included.
-  void BindText(int index, const std::string& value, const char* file, unsigned int line);
+  void BindText(int index, const std::string& value, const char* file = __builtin_FILE(),
+                unsigned int line = __builtin_LINE());
   /// Seconds since the epoch, stored as an integer.
-  void BindTime(int index, long value, const char* file, unsigned int line);
+  void BindTime(int index, long value, const char* file = __builtin_FILE(),
+                unsigned int line = __builtin_LINE());
 
-  /// BindText without the copy: the text must stay as it is for as long as the statement.
-  void BindTextView(int index, std::string_view value, const char* file, unsigned int line);
+  /// BindText without the copy: the text must stay as it is until the statement is destroyed.
+  void BindTextView(int index, std::string_view value, const char* file = __builtin_FILE(),
+                    unsigned int line = __builtin_LINE());
 
-  /// What the statement has cost since this was last asked, in steps of SQLite's machine.
+  /// Steps of SQLite's virtual machine that the statement has taken since the last call.
   int TakeCost() const;
 
   /// The low 32 bits of an integer column, with their sign.
@@ -59,7 +63,7 @@ public:
   bool IsNull(int column) const;
   /// The text with its NUL bytes; NULL gives the empty string.
   std::string GetText(int column) const;
-  /// The same where it lies: valid until the next step or getter of the column.
+  /// The same without a copy: valid until the next step or getter of the column.
   std::string_view GetTextView(int column) const;
   std::time_t GetTime(int column) const;
   /// True for a non-zero integer.
@@ -68,7 +72,7 @@ public:
 private:
   void CheckBind(int code, const char* file, unsigned int line) const;
 
-  const DB& db_;
+  Connection& connection_;
   Connection::CheckedOut statement_;
 };
 

@@ -2,6 +2,7 @@
 
 namespace orva::db {
 
+class Connection;
 class DB;
 
 /// A transaction as a scope: what was not committed when it ends is rolled back. On the
@@ -12,21 +13,20 @@ public:
   /// Begins on `db`, which outlives the transaction, at once as a writer where the connection
   /// can write. `busyTimeout` is how long, in milliseconds, the transaction's statements wait
   /// for other connections. Throws std::string with the caller's `file` and `line`.
-  Transaction(const DB& db, unsigned int busyTimeout, const char* file, unsigned int line);
+  Transaction(const DB& db, unsigned int busyTimeout, const char* file = __builtin_FILE(),
+              unsigned int line = __builtin_LINE());
   Transaction(const Transaction&) = delete;
   Transaction& operator=(const Transaction&) = delete;
   /// Rolls back unless committed.
   ~Transaction();
 
-  /// Makes the changes lasting. Throws std::string, and has changed nothing, when that fails or
+  /// Makes the changes permanent. Throws std::string, and has changed nothing, when that fails or
   /// when a step of a statement has failed since the beginning: what was read or written may
   /// then be incomplete.
-  void Commit(const char* file, unsigned int line);
+  void Commit(const char* file = __builtin_FILE(), unsigned int line = __builtin_LINE());
 
 private:
-  void End() noexcept;
-
-  const DB& db_;
+  Connection& connection_;
   bool open_ = true;
 };
 

@@ -9,7 +9,7 @@ class ClientSocket : public Socket {
 public:
   /// Connects to `address`, waiting for the service to accept. When that fails nothing is
   /// thrown and the socket is not open; errno then says why. `nonBlocking` asks for a
-  /// descriptor that does not wait, on which Read and Write take having to wait for the end.
+  /// descriptor that does not block: Read and Write then end where they would have to wait.
   ClientSocket(const Address& address, bool nonBlocking);
 };
 

@@ -6,8 +6,8 @@
 
 namespace orva::core {
 
-/// Address of the appliance's notification socket, as Socket::Address takes it. A copy for each
-/// source, so that it is there for the initialisers that follow it.
+/// Address of the appliance's notification socket, as Socket::Address takes it. Each source has its
+/// own copy, so that its static initialisers may use it.
 const std::string ORVA_NOTIFICATION_SOCKET = ORVA_CONFIG_NOTIFICATION_SOCKET;
 
 /// Folder of the product's own data on the volume at `mountPoint`; makes nothing.

@@ -8,9 +8,10 @@ namespace orva::util {
 /// A failure that ends the operation that met it; what() is the message for a person.
 class Exception : public std::runtime_error {
 public:
-  /// `file` and `line` name the place that throws; `file` must outlive the exception
-  /// (a string literal, `__FILE__`).
-  Exception(const std::string& message, const char* file, unsigned int line)
+  /// `file` and `line` name the place that throws; `file` must outlive the exception, as a literal
+  /// does.
+  explicit Exception(const std::string& message, const char* file = __builtin_FILE(),
+                     unsigned int line = __builtin_LINE())
       : std::runtime_error(message), file_(file), line_(line) {}
 
   const char* File() const noexcept { return file_; }

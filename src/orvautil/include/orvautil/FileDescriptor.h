@@ -6,7 +6,7 @@
 
 namespace orva::util {
 
-/// Owns a file descriptor and closes it; -1 is none. Not shared between threads.
+/// Owns a file descriptor and closes it; -1 stands for none. Not shared between threads.
 class FileDescriptor {
 public:
   FileDescriptor() noexcept = default;

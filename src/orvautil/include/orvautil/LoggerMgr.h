@@ -6,9 +6,8 @@
 
 namespace orva::util {
 
-/// The process's logging manager. Nothing is logged until somebody configures a logger, so
-/// that a program that never does pays nothing. Reached through Singleton<LoggerMgr>; the
-/// manager itself is not locked: configure it before other threads log.
+/// The process's logging manager. Nothing is logged until a logger is added. Reached through
+/// Singleton<LoggerMgr>; the manager itself is not locked: add loggers before other threads log.
 class LoggerMgr {
 public:
   using Logger = std::function<void(const std::string&)>;

@@ -9,7 +9,7 @@
 namespace orva::util {
 
 /// A vector of pointers that owns its elements: they are deleted, first to last, with it.
-/// Only what cannot lose an element is taken over from std::vector; the pointers may be
+/// Has only those operations of std::vector that cannot lose an element; the pointers may be
 /// reordered in place (std::sort). Null elements are allowed.
 template <typename T>
 class OwnerVector : private std::vector<T*> {
@@ -45,7 +45,7 @@ public:
     static_cast<void>(element.release());
   }
 
-  /// The elements as a plain vector, for operations that only look at them.
+  /// The elements as a plain vector, for operations that only read them.
   const std::vector<T*>& Elements() const noexcept { return *this; }
 
 private:

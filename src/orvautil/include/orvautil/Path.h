@@ -5,16 +5,16 @@
 
 namespace orva::util {
 
-/// A view of a path held by somebody else: the string must outlive the object.
+/// A view of a path: the string must outlive the object.
 class Path {
 public:
   explicit Path(const std::string& path) noexcept : path_(path) {}
   explicit Path(std::string&&) = delete;
 
-  /// True when there is something at the path, links followed.
+  /// True when something exists at the path, links followed.
   bool Exists() const;
 
-  /// Makes this one directory, none of its parents, with `permissions` less the process's
+  /// Makes this directory, but none of its parents, with `permissions` less the process's
   /// umask. Returns whether it was made.
   bool Create(unsigned permissions) const;
 
@@ -33,7 +33,7 @@ private:
 
 /// `directory` and `name` joined by exactly one separator, whether or not the one ends in some
 /// or the other begins with some. An empty directory gives the name alone, an empty name the
-/// directory with a separator behind it.
+/// directory followed by a separator.
 std::string MakePath(std::string_view directory, std::string_view name);
 
 } // namespace orva::util

@@ -1,5 +1,6 @@
 #pragma once
 
+#include "orvautil/FileDescriptor.h"
 #include "orvautil/Stream.h"
 
 #include <sys/socket.h>
@@ -9,14 +10,14 @@
 
 namespace orva::util {
 
-/// A local (AF_UNIX) stream socket; owns its descriptor. Interrupted system calls are retried.
+/// A local (AF_UNIX) stream socket. Interrupted system calls are retried.
 class Socket : public Stream {
 public:
   /// Address of a local socket.
   class Address {
   public:
     /// `text` is an absolute path, or '@' and a name for an abstract address. Throws Exception
-    /// when it is neither, or longer than the system can take.
+    /// when it is neither, or too long for the system.
     explicit Address(const std::string& text);
 
     const sockaddr* Get() const noexcept;
@@ -27,12 +28,10 @@ public:
     socklen_t length_ = 0;
   };
 
-  ~Socket() override;
-
   /// True exactly when the descriptor is not -1.
-  bool IsOpen() const override { return descriptor_ != -1; }
+  bool IsOpen() const override { return static_cast<bool>(descriptor_); }
   void Close() override;
-  /// Nothing is kept back, so there is nothing to do.
+  /// Does nothing: Write keeps nothing back.
   void Flush() override {}
   bool IsDataAvailable(unsigned long long* count) override;
   unsigned Read(void* data, unsigned size) override;
@@ -40,14 +39,14 @@ public:
   unsigned Write(const void* data, unsigned size) override;
 
   /// -1 while not connected. Still owned by the socket.
-  int Descriptor() const noexcept { return descriptor_; }
+  int Descriptor() const noexcept { return descriptor_.Get(); }
 
 protected:
   /// Takes over `descriptor`, -1 for none.
   explicit Socket(int descriptor) noexcept : descriptor_(descriptor) {}
 
 private:
-  int descriptor_;
+  FileDescriptor descriptor_;
 };
 
 } // namespace orva::util

@@ -15,15 +15,15 @@ public:
   /// Ends the stream; harmless when it has ended.
   virtual void Close() = 0;
 
-  /// Hands on what Write keeps back.
+  /// Sends what Write keeps back.
   virtual void Flush() = 0;
 
   /// True when a Read would not block; then `*count` (if not null) is the number of bytes that
-  /// are there, 0 at the end of the stream.
+  /// can be read, 0 at the end of the stream.
   virtual bool IsDataAvailable(unsigned long long* count) = 0;
 
   /// Waits for data and reads up to `size` bytes. Returns their number; 0 at the end of the
-  /// stream, which a peer that vanished and a failed read are as well.
+  /// stream, and also when the peer vanished or the read failed.
   virtual unsigned Read(void* data, unsigned size) = 0;
 
   /// Writes `size` bytes. Returns the number written; less than `size` when the stream ended.

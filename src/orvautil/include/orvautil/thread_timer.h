@@ -17,10 +17,10 @@ class thread_timer {
 public:
   thread_timer();
 
-  /// Starts again from now.
+  /// Starts again.
   void Start();
 
-  /// What has passed since the start.
+  /// The times since the start.
   thread_times Elapsed() const;
 
   /// The text that ends the merge's timing lines, such as
