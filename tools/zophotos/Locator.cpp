@@ -3,7 +3,6 @@
 #include "Failure.h"
 
 #include <algorithm>
-#include <array>
 #include <filesystem>
 #include <fstream>
 #include <string_view>
@@ -39,9 +38,9 @@ std::string FindDatabase() {
     ThrowNoDatabase(std::string(LOCATOR) + " cannot be read");
   }
   // Whoever wrote it: no path is longer.
-  std::array<char, 8192> text{};
-  file.read(text.data(), text.size());
-  std::string line(text.data(), static_cast<std::size_t>(file.gcount()));
+  std::string line(8192, '\0');
+  file.read(line.data(), static_cast<std::streamsize>(line.size()));
+  line.resize(static_cast<std::size_t>(file.gcount()));
   line.resize(std::min(line.size(), line.find('\n')));
   if (!line.starts_with(KEY)) {
     ThrowNoDatabase(std::string(LOCATOR) + " has no " + std::string(KEY) + " in its first line");

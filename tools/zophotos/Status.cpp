@@ -36,7 +36,7 @@ std::optional<Row> ReadRow(SQLite::Database& database) {
   if (!query.executeStep()) {
     return std::nullopt;
   }
-  return Row{query.getColumn(0).getString(), query.getColumn(1).getInt64()};
+  return Row{.version = query.getColumn(0).getString(), .stamp = query.getColumn(1).getInt64()};
 }
 
 /// The daemon, too, reads only a volume's first row.

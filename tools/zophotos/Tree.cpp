@@ -5,6 +5,7 @@
 #include <SQLiteCpp/Statement.h>
 
 #include <algorithm>
+#include <ranges>
 #include <string_view>
 #include <vector>
 
@@ -27,12 +28,11 @@ struct Node {
   bool isLast = false; ///< of its siblings
 };
 
-/// Whether `a` comes before `b` in a tree, where all that is in a folder follows it.
-bool ComesBefore(const StoredFolder& a, const StoredFolder& b) {
+/// Orders paths so that everything in a folder follows it directly: the separator sorts before all
+/// other characters.
+bool ComesBefore(const std::string& a, const std::string& b) {
   const auto rank = [](char byte) { return byte == '/' ? -1 : static_cast<unsigned char>(byte); };
-  return std::lexicographical_compare(
-      a.path.begin(), a.path.end(), b.path.begin(), b.path.end(),
-      [&rank](char left, char right) { return rank(left) < rank(right); });
+  return std::ranges::lexicographical_compare(a, b, {}, rank, rank);
 }
 
 std::vector<StoredFolder> ReadFolders(const std::string& path, const std::string& top) {
@@ -45,9 +45,10 @@ std::vector<StoredFolder> ReadFolders(const std::string& path, const std::string
   query.bind(2, EndOfFolder(top));
   std::vector<StoredFolder> folders;
   while (query.executeStep()) {
-    folders.push_back({query.getColumn(0).getString(), query.getColumn(1).getInt64()});
+    folders.push_back(
+        {.path = query.getColumn(0).getString(), .files = query.getColumn(1).getInt64()});
   }
-  std::sort(folders.begin(), folders.end(), ComesBefore);
+  std::ranges::sort(folders, ComesBefore, &StoredFolder::path);
   return folders;
 }
 
@@ -76,12 +77,12 @@ std::vector<Node> MakeTree(const std::vector<StoredFolder>& folders, const std::
   }
   // From the end, the first node of each depth that is met below a parent is its last child.
   std::vector<bool> hasLast;
-  std::for_each(nodes.rbegin(), nodes.rend(), [&hasLast](Node& node) {
+  for (Node& node : nodes | std::views::reverse) {
     const bool known = node.depth < hasLast.size() && hasLast[node.depth];
     node.isLast = !known;
     hasLast.resize(node.depth + 1, false);
     hasLast[node.depth] = true;
-  });
+  }
   return nodes;
 }
 

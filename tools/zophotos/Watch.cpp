@@ -54,7 +54,7 @@ struct Difference {
 /// A file on disk, whatever its name.
 using FileIdentity = std::tuple<dev_t, ino_t>;
 
-std::int64_t Ask(SQLite::Database& database, const char* sql) {
+std::int64_t Number(SQLite::Database& database, const char* sql) {
   return database.execAndGet(sql).getInt64();
 }
 
@@ -69,14 +69,16 @@ std::int64_t LastId(SQLite::Database& database, const char* table) {
 
 State ReadState(SQLite::Database& database) {
   State state;
-  state.folders = {Ask(database, "SELECT count(*) FROM Folders"), LastId(database, "Folders")};
-  state.files = {Ask(database, "SELECT count(*) FROM Files"), LastId(database, "Files")};
+  state.folders = {.count = Number(database, "SELECT count(*) FROM Folders"),
+                   .lastId = LastId(database, "Folders")};
+  state.files = {.count = Number(database, "SELECT count(*) FROM Files"),
+                 .lastId = LastId(database, "Files")};
   SQLite::Statement query(database, "SELECT volume, photos_xcoded, photos_total, last_updated_time "
                                     "FROM Statistics ORDER BY id DESC");
   while (query.executeStep()) {
-    state.volumes[query.getColumn(0).getString()] = {query.getColumn(1).getInt64(),
-                                                     query.getColumn(2).getInt64(),
-                                                     query.getColumn(3).getInt64()};
+    state.volumes[query.getColumn(0).getString()] = {.transcoded = query.getColumn(1).getInt64(),
+                                                     .total = query.getColumn(2).getInt64(),
+                                                     .mergedUpTo = query.getColumn(3).getInt64()};
   }
   return state;
 }
@@ -145,7 +147,7 @@ private:
   }
 
   static std::int64_t Version(SQLite::Database& database) {
-    return Ask(database, "PRAGMA data_version");
+    return Number(database, "PRAGMA data_version");
   }
 
   void Open(const std::string& path) {
