@@ -90,7 +90,7 @@ TEST_F(ZophotosCheck, FindsFilesWithoutAFolder) {
 TEST_F(ZophotosCheck, FindsFilesOfAnotherVolumeThanTheirFolder) {
   ExpectDamage(
       {"UPDATE Files SET volume = '/shares/B/' WHERE name = 'top.jpg'"},
-      "  files of another volume than their folder: 1\n"
+      "  files with another volume than their folder: 1\n"
       "    /shares/A/top.jpg, of /shares/B/ in a folder of /shares/A/\n",
       R"({"kind":"file_of_other_volume","count":1,"examples":["/shares/A/top.jpg, of /shares/B/ in a folder of /shares/A/"]})");
 }
@@ -98,7 +98,7 @@ TEST_F(ZophotosCheck, FindsFilesOfAnotherVolumeThanTheirFolder) {
 TEST_F(ZophotosCheck, FindsFoldersThatAreThereMoreThanOnce) {
   ExpectDamage({"INSERT INTO Folders(parent_folder_id, name, modified_date, volume) SELECT "
                 "parent_folder_id, name, 7, volume FROM Folders WHERE name = '/shares/B/Old/'"},
-               "  folders that are there more than once: 1\n    /shares/B/Old/, 2 times\n",
+               "  duplicate folders: 1\n    /shares/B/Old/, 2 times\n",
                R"({"kind":"duplicate_folder","count":1,"examples":["/shares/B/Old/, 2 times"]})");
 }
 
@@ -107,8 +107,7 @@ TEST_F(ZophotosCheck, FindsFilesThatAreThereMoreThanOnce) {
       "INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT folder_id, "
       "name, 7, volume, 8 FROM Files WHERE name = '1.jpg' LIMIT 1";
   ExpectDamage(
-      {insert, insert},
-      "  files that are there more than once: 1\n    /shares/B/Old/1.jpg, 3 times\n",
+      {insert, insert}, "  duplicate files: 1\n    /shares/B/Old/1.jpg, 3 times\n",
       R"({"kind":"duplicate_file","count":1,"examples":["/shares/B/Old/1.jpg, 3 times"]})");
 }
 
@@ -150,8 +149,8 @@ TEST_F(ZophotosCheck, AnUnpluggedVolumesStatisticsAreNoDamage) {
   const Outcome inText = Zophotos({"check"});
   EXPECT_EQ(0, inText.status);
   EXPECT_EQ(MERGED + " is sound\n"
-                     "Expected leftovers, no damage:\n"
-                     "  statistics of volumes that have nothing merged: 1\n"
+                     "Expected leftovers (not damage):\n"
+                     "  statistics of volumes without merged content: 1\n"
                      "    /shares/B/\n",
             inText.output);
   const Outcome inJson = Zophotos({"check", "--json"});
@@ -175,7 +174,7 @@ TEST_F(ZophotosCheck, FindsOverwrittenPages) {
     const Outcome outcome = OnCopy({"check"});
     EXPECT_EQ(1, outcome.status) << table;
     EXPECT_THAT(outcome.output, StartsWith(COPY + " is damaged\nDamage:\n")) << table;
-    EXPECT_THAT(outcome.output, HasSubstr("\n  faults in the file: ")) << table;
+    EXPECT_THAT(outcome.output, HasSubstr("\n  errors in the file: ")) << table;
     EXPECT_EQ("", outcome.error) << table;
     EXPECT_THAT(OnCopy({"check", "--json"}).output, HasSubstr(R"({"kind":"integrity","count":)"));
   }
@@ -192,7 +191,7 @@ TEST_F(ZophotosCheck, FindsAFileThatWasCutShort) {
   std::filesystem::resize_file(COPY, std::filesystem::file_size(COPY) - 5000);
   const Outcome outcome = OnCopy({"check"});
   EXPECT_EQ(1, outcome.status);
-  EXPECT_THAT(outcome.output, HasSubstr("\n  faults in the file: "));
+  EXPECT_THAT(outcome.output, HasSubstr("\n  errors in the file: "));
 }
 
 TEST_F(ZophotosCheck, TakesWhatCannotBeReadForAFaultAndForNothingElse) {
@@ -203,8 +202,8 @@ TEST_F(ZophotosCheck, TakesWhatCannotBeReadForAFaultAndForNothingElse) {
   }
   const Outcome outcome = OnCopy({"check"});
   EXPECT_EQ(1, outcome.status);
-  EXPECT_THAT(outcome.output, AllOf(HasSubstr("\n  faults in the file: "),
-                                    HasSubstr(", when looking for files without"),
+  EXPECT_THAT(outcome.output, AllOf(HasSubstr("\n  errors in the file: "),
+                                    HasSubstr(", while looking for files without"),
                                     Not(HasSubstr("files without a folder:"))));
 }
 
@@ -213,7 +212,7 @@ TEST_F(ZophotosCheck, FindsAFileThatIsNoDatabase) {
   Overwrite(0, "This is a letter and no data");
   const Outcome outcome = OnCopy({"check"});
   EXPECT_EQ(1, outcome.status);
-  EXPECT_EQ(COPY + " is damaged\nDamage:\n  faults in the file: 1\n    file is not a database\n",
+  EXPECT_EQ(COPY + " is damaged\nDamage:\n  errors in the file: 1\n    file is not a database\n",
             outcome.output);
 }
 
@@ -225,7 +224,7 @@ TEST_F(ZophotosCheck, FindsPagesThatNobodyUses) {
   }
   const Outcome outcome = OnCopy({"check"});
   EXPECT_EQ(1, outcome.status);
-  EXPECT_THAT(outcome.output, HasSubstr("\n  faults in the file: "));
+  EXPECT_THAT(outcome.output, HasSubstr("\n  errors in the file: "));
 }
 
 } // namespace

@@ -152,7 +152,7 @@ TEST_F(ZophotosWatch, TellsThatAnUnpluggedVolumeBeginsAnew) {
   const Database copy = Copy();
   Start({"--database", COPY});
   copy.Run("UPDATE Statistics SET last_updated_time = 0 WHERE volume = '/shares/B/'");
-  EXPECT_THAT(watch->ReadLine(), EndsWith("  /shares/B/ is to be merged from its beginning"));
+  EXPECT_THAT(watch->ReadLine(), EndsWith("  /shares/B/ will be merged from the beginning"));
 }
 
 TEST_F(ZophotosWatch, SaysNothingWhileNothingChanges) {
@@ -192,7 +192,7 @@ TEST_F(ZophotosWatch, TellsOnceThatTheDatabaseIsLost) {
   std::ofstream(LOCATOR) << "zophotos_db_path=\n";
   EXPECT_EQ(
       Next(),
-      R"("event":"lost","reason":"no merged database: /tmp/zophotodbmerger.conf names none at this moment"})");
+      R"("event":"lost","reason":"no merged database: /tmp/zophotodbmerger.conf names no database at the moment"})");
   AwaitLooks();
   std::ofstream(LOCATOR) << locator;
   EXPECT_EQ(Next(), OPENED_A);
@@ -202,8 +202,8 @@ TEST_F(ZophotosWatch, WaitsForADatabase) {
   const std::string locator = Appliance::Locator();
   fs::remove(LOCATOR);
   Start({});
-  EXPECT_THAT(first, EndsWith("  no merged database: there is no file /tmp/zophotodbmerger.conf, "
-                              "which the daemon writes when it starts"));
+  EXPECT_THAT(first, EndsWith("  no merged database: /tmp/zophotodbmerger.conf does not exist; "
+                              "the daemon creates it when it starts"));
   std::ofstream(LOCATOR) << locator;
   EXPECT_THAT(watch->ReadLine(), EndsWith("8 folders, 4 files"));
 }
@@ -235,7 +235,7 @@ TEST_F(ZophotosWatch, TellsOnceOfALockThatStays) {
   Start({"--json", "--database", COPY});
   copy.Run("BEGIN EXCLUSIVE");
   EXPECT_EQ(Next(), R"("event":"delayed","reason":")" + COPY +
-                        R"( is locked, as it is while a large merge is written; try again"})");
+                        R"( is locked, for example while a large merge commits; try again"})");
   AwaitLooks();
   copy.Run("DELETE FROM Files WHERE name = '1.jpg'");
   copy.Run("COMMIT");

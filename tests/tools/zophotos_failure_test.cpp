@@ -69,7 +69,7 @@ protected:
 };
 
 const std::string NO_FILE =
-    "there is no file /tmp/zophotodbmerger.conf, which the daemon writes when it starts";
+    "/tmp/zophotodbmerger.conf does not exist; the daemon creates it when it starts";
 
 TEST_F(ZophotosLocator, MayBeMissing) {
   ExpectNoDatabase(NO_FILE);
@@ -77,27 +77,26 @@ TEST_F(ZophotosLocator, MayBeMissing) {
 
 TEST_F(ZophotosLocator, MayNameNone) {
   Write("zophotos_db_path=\n");
-  ExpectNoDatabase("/tmp/zophotodbmerger.conf names none at this moment");
+  ExpectNoDatabase("/tmp/zophotodbmerger.conf names no database at the moment");
 }
 
 TEST_F(ZophotosLocator, MayBeMalformed) {
   for (const char* const text : {"", "\n", "nonsense\n", " zophotos_db_path=/x\n", "ZOPHOTOS"}) {
     Write(text);
-    ExpectNoDatabase("/tmp/zophotodbmerger.conf has no zophotos_db_path= in its first line");
+    ExpectNoDatabase("/tmp/zophotodbmerger.conf does not begin with zophotos_db_path=");
   }
 }
 
 TEST_F(ZophotosLocator, MayHaveANul) {
   for (const std::string& path : {std::string("\0", 1), std::string("/shares\0/x", 10)}) {
     Write("zophotos_db_path=" + path + "\n");
-    ExpectNoDatabase("/tmp/zophotodbmerger.conf has a NUL in its first line, which no path has");
+    ExpectNoDatabase("/tmp/zophotodbmerger.conf has a NUL byte in its first line");
   }
 }
 
 TEST_F(ZophotosLocator, MayBeNoFile) {
   const std::string reason =
-      "/tmp/zophotodbmerger.conf is not a regular file, so that the daemon does not "
-      "write it";
+      "/tmp/zophotodbmerger.conf is not a regular file, so the daemon does not write to it";
   fs::create_directory(LOCATOR);
   ExpectNoDatabase(reason);
   fs::remove(LOCATOR);
@@ -140,13 +139,13 @@ TEST(ZophotosUsage, IsToldFromFailure) {
       {{"status", "A"}, "A"},
       {{"find"}, "PATTERN is required"},
       {{"find", "a", "b"}, "b"},
-      {{"export"}, "takes one of --csv and --jsonl"},
-      {{"export", "--csv", "--jsonl"}, "takes one of --csv and --jsonl"},
-      {{"export", "--csv", "--json"}, "takes one of --csv and --jsonl"},
-      {{"find", "-0", "--json", "x"}, "takes one of --null and --json"},
-      {{"--json", "find", "--null", "x"}, "takes one of --null and --json"},
+      {{"export"}, "needs either --csv or --jsonl"},
+      {{"export", "--csv", "--jsonl"}, "needs either --csv or --jsonl"},
+      {{"export", "--csv", "--json"}, "needs either --csv or --jsonl"},
+      {{"find", "-0", "--json", "x"}, "--null and --json cannot be combined"},
+      {{"--json", "find", "--null", "x"}, "--null and --json cannot be combined"},
       {{"--database"}, "--database"},
-      {{"--database", "", "status"}, "it is empty"},
+      {{"--database", "", "status"}, "must not be empty"},
       {{"status", "check"}, "check"}};
   for (const auto& [arguments, message] : wrong) {
     SCOPED_TRACE(Text(arguments));
@@ -194,7 +193,7 @@ TEST_F(ZophotosFailure, OfATableThatIsMissing) {
   for (const char* const table : {"Status", "Statistics", "Folders", "Files"}) {
     Copy().Run("ALTER TABLE " + std::string(table) + " RENAME TO Other");
     const std::string message =
-        " is no merged photo database: it has no table " + std::string(table);
+        " is not a merged photo database: it has no table " + std::string(table);
     ExpectRefused(message);
     ExpectFailure(OnCopy({"check"}), 5, COPY + message);
   }
@@ -206,7 +205,7 @@ TEST_F(ZophotosFailure, OfAViewInPlaceOfATable) {
     copy.Run("ALTER TABLE Statistics RENAME TO Other");
     copy.Run("CREATE VIEW Statistics AS SELECT * FROM Other");
   }
-  ExpectRefused(" is no merged photo database: it has no table Statistics");
+  ExpectRefused(" is not a merged photo database: it has no table Statistics");
 }
 
 /// Half a character sorts by other bytes than those that it is read as.
@@ -222,7 +221,7 @@ TEST_F(ZophotosFailure, OfTextsInUtf16) {
   // "/shares/" and the second half of a pair.
   database.Run("INSERT INTO Folders(name) VALUES(CAST(x'2f007300680061007200650073002f0000dc2f00' "
                "AS TEXT))");
-  const std::string message = " is no merged photo database: its texts are in UTF-16le";
+  const std::string message = " is not a merged photo database: its text encoding is UTF-16le";
   ExpectRefused(message);
   ExpectFailure(OnCopy({"check"}), 5, COPY + message);
 }
@@ -230,7 +229,7 @@ TEST_F(ZophotosFailure, OfTextsInUtf16) {
 TEST_F(ZophotosFailure, OfAFileThatIsEmpty) {
   fs::create_directory("/tmp/copy");
   std::ofstream file(COPY);
-  ExpectRefused(" is no merged photo database: it has no table Status");
+  ExpectRefused(" is not a merged photo database: it has no table Status");
 }
 
 TEST_F(ZophotosFailure, OfAFileThatIsNoDatabase) {
@@ -259,7 +258,7 @@ TEST_F(ZophotosFailure, OfALockThatStays) {
   }
   for (std::size_t i = 0; i < programs.size(); ++i) {
     EXPECT_EQ("zophotos: " + COPY +
-                  " is locked, as it is while a large merge is written; try again",
+                  " is locked, for example while a large merge commits; try again",
               programs[i]->ReadLine());
     EXPECT_EQ("(end)", programs[i]->ReadLine());
     EXPECT_EQ(4, programs[i]->WaitForEnd()) << Text(COMMANDS[i]);
@@ -289,8 +288,8 @@ TEST_F(ZophotosFailure, OfAMergeThatWasInterrupted) {
   for (const Arguments& command : COMMANDS) {
     SCOPED_TRACE(Text(command));
     ExpectFailure(OnCopy(command), 4,
-                  COPY + " has a merge to take back that was interrupted; the daemon does so when "
-                         "it opens the database, and this program only reads");
+                  COPY + " has an interrupted merge to roll back; the daemon does that when it "
+                         "opens the database");
   }
   Program watch(ZophotosCommand({"--json", "--database", COPY, "watch"}));
   EXPECT_THAT(watch.ReadLine(), HasSubstr(R"("event":"delayed","reason":")" + COPY));
@@ -303,10 +302,10 @@ TEST_F(ZophotosFailure, OfADatabaseThatCannotBeReadWithoutWritingBesideIt) {
   Copy().Run("PRAGMA journal_mode = WAL");
   for (const Arguments& command : COMMANDS) {
     SCOPED_TRACE(Text(command));
-    ExpectFailure(OnCopy(command), 5,
-                  COPY +
-                      " has a write-ahead log, which the daemon's databases do not have: to read "
-                      "it would be to write beside it");
+    ExpectFailure(
+        OnCopy(command), 5,
+        COPY + " uses a write-ahead log, unlike the daemon's databases; reading it would create "
+               "files next to it");
   }
   EXPECT_FALSE(fs::exists(COPY + "-wal"));
   EXPECT_FALSE(fs::exists(COPY + "-shm"));
@@ -337,7 +336,7 @@ TEST_F(ZophotosFailure, OfAPlaceForAPrivateCopy) {
       SCOPED_TRACE(Text(command));
       ExpectFailure(OnCopy(command), 5,
                     std::string(fault) + " for a private copy of " + COPY +
-                        "; SQLITE_TMPDIR names another folder for it");
+                        "; set SQLITE_TMPDIR to another folder");
     }
   }
   unsetenv("SQLITE_TMPDIR");

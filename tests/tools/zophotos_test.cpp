@@ -220,7 +220,7 @@ TEST_F(ZophotosRemovedFolder, StandsInTheTree) {
 
 TEST_F(ZophotosRemovedFolder, LeavesNoDamage) {
   ExpectOutput(Zophotos({"check"}), MERGED + " is sound\n"
-                                             "Expected leftovers, no damage:\n"
+                                             "Expected leftovers (not damage):\n"
                                              "  folders whose parent folder was removed: 1\n"
                                              "    /shares/A/Pictures/Summer/\n");
 }

@@ -36,7 +36,7 @@ struct Finding {
 };
 
 constexpr Check INTEGRITY = {
-    "integrity", "faults in the file",
+    "integrity", "errors in the file",
     "SELECT integrity_check FROM pragma_integrity_check(1000) WHERE integrity_check != 'ok'"};
 
 constexpr Check DAMAGE[] = {
@@ -49,12 +49,12 @@ constexpr Check DAMAGE[] = {
      "SELECT 'file ' || f.file_id || ', ' || f.name || ', of ' || f.volume || ': no folder ' || "
      "f.folder_id FROM Files f WHERE NOT EXISTS (SELECT 1 FROM Folders o WHERE o.folder_id = "
      "f.folder_id)"},
-    {"file_of_other_volume", "files of another volume than their folder",
+    {"file_of_other_volume", "files with another volume than their folder",
      "SELECT o.name || f.name || ', of ' || f.volume || ' in a folder of ' || o.volume FROM Files f "
      "JOIN Folders o ON o.folder_id = f.folder_id WHERE f.volume != o.volume"},
-    {"duplicate_folder", "folders that are there more than once",
+    {"duplicate_folder", "duplicate folders",
      "SELECT name || ', ' || count(*) || ' times' FROM Folders GROUP BY name HAVING count(*) > 1"},
-    {"duplicate_file", "files that are there more than once",
+    {"duplicate_file", "duplicate files",
      "SELECT o.name || f.name || ', ' || count(*) || ' times' FROM Files f JOIN Folders o ON "
      "o.folder_id = f.folder_id GROUP BY f.folder_id, f.name, f.volume HAVING count(*) > 1"},
     {"duplicate_statistics", "volumes with more than one row of statistics",
@@ -62,9 +62,9 @@ constexpr Check DAMAGE[] = {
      "> 1"},
 };
 
-/// What the daemon's rules leave behind; doc/operations.md says when it goes.
+/// What the daemon leaves in the database by its rules. doc/operations.md says when it is removed.
 constexpr Check LEFTOVERS[] = {
-    {"statistics_without_content", "statistics of volumes that have nothing merged",
+    {"statistics_without_content", "statistics of volumes without merged content",
      "SELECT volume FROM Statistics s WHERE NOT EXISTS (SELECT 1 FROM Folders o WHERE o.volume = "
      "s.volume) ORDER BY volume"},
     {"folder_without_parent", "folders whose parent folder was removed",
@@ -88,7 +88,7 @@ void Run(SQLite::Database& database, Finding& finding, Finding& faults) {
     if (!IsDamage(error)) {
       throw;
     }
-    faults.Add(std::string(error.what()) + ", when looking for " + finding.check->title);
+    faults.Add(std::string(error.what()) + ", while looking for " + finding.check->title);
   }
 }
 
@@ -169,7 +169,7 @@ ExitStatus CheckDatabase(const std::string& path, Form form) {
   } else {
     std::cout << Printable(path) << (isSound ? " is sound\n" : " is damaged\n");
     PrintFindings("Damage:", report.damage);
-    PrintFindings("Expected leftovers, no damage:", report.leftovers);
+    PrintFindings("Expected leftovers (not damage):", report.leftovers);
   }
   return isSound ? ExitStatus::Success : ExitStatus::Negative;
 }

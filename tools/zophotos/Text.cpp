@@ -169,7 +169,7 @@ std::optional<std::string> IsoTime(std::int64_t seconds) {
   if (!IsInCalendar(seconds) || gmtime_r(&time, &fields) == nullptr) {
     return std::nullopt;
   }
-  // strftime's %Y has no leading zeros.
+  // %Y of strftime writes no leading zeros.
   std::array<char, 12> year{};
   std::snprintf(year.data(), year.size(), "%04d", fields.tm_year + 1900);
   return year.data() + Format("-%m-%dT%H:%M:%SZ", fields);

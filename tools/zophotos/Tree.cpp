@@ -18,14 +18,14 @@ struct StoredFolder {
   std::int64_t files;
 };
 
-/// A line of the tree, by a path that belongs to the list of folders. Folders that are only part of
-/// other folders' paths have one, too.
+/// A line of the tree. Its path points into the list of folders. A folder without a row, known only
+/// from paths below it, has a line, too.
 struct Node {
-  std::string_view path; ///< of the folder, or the beginning of another one
+  std::string_view path; ///< a folder's path, or the beginning of one
   std::size_t depth;
   std::int64_t files = 0;
   bool isStored = false;
-  bool isLast = false; ///< of its siblings
+  bool isLast = false; ///< the last one of its siblings
 };
 
 /// Orders paths so that everything in a folder follows it directly: the separator sorts before all
@@ -36,7 +36,7 @@ bool ComesBefore(const std::string& a, const std::string& b) {
 }
 
 std::vector<StoredFolder> ReadFolders(const std::string& path, const std::string& top) {
-  // Counting reads every file of a large library.
+  // Counting reads every file of a large library, which takes long.
   SQLite::Database database = CopyDatabase(path);
   SQLite::Statement query(database,
                           "SELECT name, (SELECT count(*) FROM Files f WHERE f.folder_id = "
@@ -52,7 +52,8 @@ std::vector<StoredFolder> ReadFolders(const std::string& path, const std::string
   return folders;
 }
 
-/// Adds the nodes for what `path` does not share with the open ones, and returns its own.
+/// Adds nodes for the components of `path` that are not open yet, and returns the last one. `open`
+/// holds the paths from the top to the current node.
 Node& AddPath(std::vector<Node>& nodes, std::vector<std::string_view>& open, std::string_view path,
               std::size_t topLength) {
   while (!open.empty() && !path.starts_with(open.back())) {
@@ -75,7 +76,7 @@ std::vector<Node> MakeTree(const std::vector<StoredFolder>& folders, const std::
     node.isStored = true;
     node.files += folder.files;
   }
-  // From the end, the first node of each depth that is met below a parent is its last child.
+  // Read from the end, the first node of a depth below a parent is the parent's last child.
   std::vector<bool> hasLast;
   for (Node& node : nodes | std::views::reverse) {
     const bool known = node.depth < hasLast.size() && hasLast[node.depth];
@@ -87,7 +88,7 @@ std::vector<Node> MakeTree(const std::vector<StoredFolder>& folders, const std::
 }
 
 void PrintText(const std::vector<Node>& nodes) {
-  std::vector<std::string> indents; // of what is below the open nodes
+  std::vector<std::string> indents; // one for each level above the node
   for (const Node& node : nodes) {
     indents.resize(node.depth);
     if (node.depth == 0) {
