@@ -1,4 +1,4 @@
-// The inspector beside the daemon at work: what a watch sees, and that nobody waits for a reader.
+// zophotos while the daemon merges: what a watch prints, and that readers do not block merges.
 
 #include "PeakMemory.h"
 #include "ZophotosTest.h"
@@ -27,9 +27,7 @@ using ::testing::EndsWith;
 using ::testing::HasSubstr;
 using ::testing::MatchesRegex;
 
-const std::string LOCATOR = "/tmp/zophotodbmerger.conf";
-
-/// How many times a process has waited for something.
+/// How many times a process has gone to sleep.
 long Waits(pid_t pid) {
   std::ifstream file("/proc/" + std::to_string(pid) + "/status");
   const std::string name = "voluntary_ctxt_switches:";
@@ -43,7 +41,7 @@ long Waits(pid_t pid) {
 
 class ZophotosWatch : public ZophotosTest {
 protected:
-  /// Starts a watch, and waits until it has seen the database.
+  /// Starts a watch and waits for its first line.
   void Start(const Arguments& options = {"--json"}) {
     Arguments arguments{"watch"};
     arguments.insert(arguments.end(), options.begin(), options.end());
@@ -51,9 +49,9 @@ protected:
     first = watch->ReadLine();
   }
 
-  /// Waits until the watch has looked several times, or has tried to.
+  /// Waits until the watch has looked, or tried to look, several times.
   void AwaitLooks() const {
-    // It sleeps between its looks, and in one that waits for a lock.
+    // It sleeps between two looks, and in a look that waits for a lock.
     const long enough = Waits(watch->Pid()) + 8;
     const auto end = std::chrono::steady_clock::now() + DEADLINE;
     while (Waits(watch->Pid()) < enough) {
@@ -73,8 +71,8 @@ protected:
     return event == std::string::npos ? line : line.substr(event);
   }
 
-  /// Reads "changed" lines until as many files and folders were removed; true when nothing else
-  /// has come.
+  /// Reads "changed" lines until these numbers of folders and files were removed. False after any
+  /// other line.
   bool AwaitRemoval(int folders, int files) {
     while (folders > 0 || files > 0) {
       const json line = json::parse(watch->ReadLine(), nullptr, false);
@@ -282,14 +280,14 @@ TEST_F(ZophotosWatch, MakesNoMergeFail) {
     for (const LogLine& line : appliance.Handle(TranscodedBatch(b.Path()))) {
       EXPECT_NE(Error("").priority, line.priority) << line.text;
     }
-    // While one has seen it, the others are still to look or just do.
+    // The other watches look at about the same time.
     const std::string transcoded = std::to_string(i * 50 + 1);
     EXPECT_THAT(watch->ReadLineWith("\"transcoded\":" + transcoded + ","),
                 HasSubstr(R"("files_added":50,)"));
   }
 }
 
-/// A merged database with more than what goes into a pipe.
+/// A merged database whose listing does not fit into a pipe.
 class ZophotosSlowReader : public ZophotosTest {
 protected:
   void SetUp() override {
@@ -316,7 +314,7 @@ TEST_F(ZophotosSlowReader, KeepsNoMergeFromCommitting) {
   Merge(b);
   EXPECT_THAT(MergedDatabase(a.Path()).Files(),
               ::testing::Contains("/shares/B/Old/late.jpg|7|7|/shares/B/"));
-  // They were all held up, and end with the state that they began with.
+  // The full pipe has blocked them all, and they print the state from before the merge.
   for (const auto& [program, rest] :
        std::vector<std::pair<Program*, int>>{{&slowCsv, PHOTOS + 4},
                                              {&slowLines, PHOTOS + 3},
@@ -324,19 +322,17 @@ TEST_F(ZophotosSlowReader, KeepsNoMergeFromCommitting) {
                                              {&slowList, PHOTOS - 1}}) {
     std::string output;
     program->ReadToEnd(output, output);
-    EXPECT_EQ(rest, std::count(output.begin(), output.end(), '\n'));
+    EXPECT_EQ(rest, std::ranges::count(output, '\n'));
     EXPECT_EQ(std::string::npos, output.find("late"));
     EXPECT_EQ(0, program->WaitForEnd());
   }
 }
 
 TEST_F(ZophotosSlowReader, HasItsPrivateCopyWhereItIsTold) {
-  Copy().Run("WITH RECURSIVE n(i) AS (SELECT 1 UNION ALL SELECT i + 1 FROM n WHERE i < 50000) "
-             "INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT 1, i, "
-             "1, 'x', 1 FROM n");
+  AddFiles(Copy(), 50'000, "1", "i");
   fs::create_directory("/tmp/space");
   setenv("SQLITE_TMPDIR", "/tmp/space", 1);
-  Program program(ZophotosCommand({"--database", COPY, "export", "--csv"}));
+  Program program(ZophotosCommand(OnCopyArguments({"export", "--csv"})));
   unsetenv("SQLITE_TMPDIR");
   program.ReadLine();
   std::string links;
@@ -348,31 +344,28 @@ TEST_F(ZophotosSlowReader, HasItsPrivateCopyWhereItIsTold) {
   EXPECT_THAT(links, ::testing::Not(HasSubstr(COPY)));
 }
 
-/// The peak of an export of the copy in KiB, while the last `rest` rows of it are not yet taken.
+/// The peak memory of an export of `rows` files in KiB, before its last `rest` rows are read.
 long PeakOfExport(const Database& copy, int rows, int rest) {
   copy.Run("DELETE FROM Files");
   copy.Run("DELETE FROM Folders WHERE folder_id != 1");
   copy.Run("WITH RECURSIVE n(i) AS (SELECT 2 UNION ALL SELECT i + 1 FROM n WHERE i < 101) INSERT "
            "INTO Folders(folder_id, parent_folder_id, name, modified_date, volume) SELECT i, 1, "
            "'/shares/A/' || i || '/', 1, '/shares/A/' FROM n");
-  copy.Run("WITH RECURSIVE n(i) AS (SELECT 1 UNION ALL SELECT i + 1 FROM n WHERE i < "
-           "CAST(? AS INTEGER)) INSERT INTO Files(folder_id, name, modified_date, volume, "
-           "created_date) SELECT 2 + i % 100, hex(i) || '.jpg', 1, '/shares/A/', 1 FROM n",
-           {std::to_string(rows)});
-  Program program(ZophotosCommand({"--database", COPY, "export", "--csv"}));
+  AddFiles(copy, rows, "2 + i % 100", "hex(i) || '.jpg'");
+  Program program(ZophotosCommand(OnCopyArguments({"export", "--csv"})));
   for (int i = 0; i < rows - rest; ++i) {
     program.ReadLine();
   }
   const long peak = PeakOf(program.Pid());
   std::string output;
   program.ReadToEnd(output, output);
-  EXPECT_EQ(rest + 1, std::count(output.begin(), output.end(), '\n'));
+  EXPECT_EQ(rest + 1, std::ranges::count(output, '\n'));
   EXPECT_EQ(0, program.WaitForEnd());
   return peak;
 }
 
 TEST_F(ZophotosSlowReader, HoldsUpAnExportOfConstantMemory) {
-  // What a sanitizer keeps of freed memory, to find uses of it, would be counted.
+  // The address sanitizer keeps freed memory, which would be counted.
   setenv("ASAN_OPTIONS", "quarantine_size_mb=0:thread_local_quarantine_size_kb=0", 1);
   const Database copy = Copy();
   // Both fill the caches of SQLite.

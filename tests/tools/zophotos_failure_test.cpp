@@ -1,5 +1,4 @@
-// When the inspector cannot do its work: its exit statuses and messages, and that it leaves all as
-// it was.
+// Exit statuses and messages of zophotos when it fails, and that it changes nothing.
 
 #include "ZophotosTest.h"
 
@@ -26,9 +25,7 @@ using ::testing::Lt;
 using ::testing::Not;
 using ::testing::SizeIs;
 
-const std::string LOCATOR = "/tmp/zophotodbmerger.conf";
-
-/// All commands that end by themselves.
+/// All commands except watch, which does not end by itself.
 const std::vector<Arguments> COMMANDS{{"status"},
                                       {"ls"},
                                       {"ls", "-l", "A"},
@@ -48,14 +45,13 @@ std::string Text(const Arguments& arguments) {
 }
 
 void ExpectFailure(const Outcome& outcome, int status, const std::string& message) {
-  EXPECT_EQ(status, outcome.status);
-  EXPECT_EQ("", outcome.output);
-  EXPECT_EQ("zophotos: " + message + "\n", outcome.error);
+  ExpectError(outcome, status, "zophotos: " + message + "\n");
 }
 
-/// The locator file of a daemon that does not run.
+/// The locator file, without a daemon.
 class ZophotosLocator : public ::testing::Test {
 protected:
+  void SetUp() override { fs::remove_all(LOCATOR); }
   void TearDown() override { fs::remove_all(LOCATOR); }
 
   static void Write(const std::string& text) { std::ofstream(LOCATOR) << text; }
@@ -68,11 +64,8 @@ protected:
   }
 };
 
-const std::string NO_FILE =
-    "/tmp/zophotodbmerger.conf does not exist; the daemon creates it when it starts";
-
 TEST_F(ZophotosLocator, MayBeMissing) {
-  ExpectNoDatabase(NO_FILE);
+  ExpectNoDatabase(LOCATOR + " does not exist; the daemon creates it when it starts");
 }
 
 TEST_F(ZophotosLocator, MayNameNone) {
@@ -129,7 +122,6 @@ TEST_F(ZophotosLocator, IsReadNoFurtherThanAPathCanBe) {
   EXPECT_THAT(outcome.error, AllOf(HasSubstr("/xxx"), SizeIs(Lt(10000))));
 }
 
-/// How the inspector is called wrongly, and what it says.
 TEST(ZophotosUsage, IsToldFromFailure) {
   const std::vector<std::pair<Arguments, std::string>> wrong{
       {{}, "A subcommand is required"},
@@ -177,13 +169,13 @@ TEST(ZophotosUsage, VersionIsTheProjects) {
 
 class ZophotosFailure : public ZophotosTest {
 protected:
-  /// Expects of the commands that print rows that they fail on the copy, which `check` may find
-  /// damaged.
-  static void ExpectRefused(const std::string& message) {
+  /// Expects that all commands fail on the copy.
+  static void ExpectAllFail(int status, const std::string& message,
+                            const std::string& except = "") {
     for (const Arguments& command : COMMANDS) {
-      if (command[0] != "check") {
+      if (command[0] != except) {
         SCOPED_TRACE(Text(command));
-        ExpectFailure(OnCopy(command), 5, COPY + message);
+        ExpectFailure(OnCopy(command), status, COPY + message);
       }
     }
   }
@@ -192,10 +184,7 @@ protected:
 TEST_F(ZophotosFailure, OfATableThatIsMissing) {
   for (const char* const table : {"Status", "Statistics", "Folders", "Files"}) {
     Copy().Run("ALTER TABLE " + std::string(table) + " RENAME TO Other");
-    const std::string message =
-        " is not a merged photo database: it has no table " + std::string(table);
-    ExpectRefused(message);
-    ExpectFailure(OnCopy({"check"}), 5, COPY + message);
+    ExpectAllFail(5, " is not a merged photo database: it has no table " + std::string(table));
   }
 }
 
@@ -205,12 +194,11 @@ TEST_F(ZophotosFailure, OfAViewInPlaceOfATable) {
     copy.Run("ALTER TABLE Statistics RENAME TO Other");
     copy.Run("CREATE VIEW Statistics AS SELECT * FROM Other");
   }
-  ExpectRefused(" is not a merged photo database: it has no table Statistics");
+  ExpectAllFail(5, " is not a merged photo database: it has no table Statistics");
 }
 
-/// Half a character sorts by other bytes than those that it is read as.
+// In UTF-16, half a surrogate pair sorts by other bytes than those that it is read as.
 TEST_F(ZophotosFailure, OfTextsInUtf16) {
-  fs::create_directory("/tmp/copy");
   const Database database(COPY, true);
   database.Run("PRAGMA encoding = 'UTF-16le'");
   for (const char* const table : {"Status(id)", "Statistics(id)", "Files(folder_id)",
@@ -218,24 +206,20 @@ TEST_F(ZophotosFailure, OfTextsInUtf16) {
                                   "modified_date INTEGER)"}) {
     database.Run("CREATE TABLE " + std::string(table));
   }
-  // "/shares/" and the second half of a pair.
+  // "/shares/" and the second half of a surrogate pair.
   database.Run("INSERT INTO Folders(name) VALUES(CAST(x'2f007300680061007200650073002f0000dc2f00' "
                "AS TEXT))");
-  const std::string message = " is not a merged photo database: its text encoding is UTF-16le";
-  ExpectRefused(message);
-  ExpectFailure(OnCopy({"check"}), 5, COPY + message);
+  ExpectAllFail(5, " is not a merged photo database: its text encoding is UTF-16le");
 }
 
 TEST_F(ZophotosFailure, OfAFileThatIsEmpty) {
-  fs::create_directory("/tmp/copy");
   std::ofstream file(COPY);
-  ExpectRefused(" is not a merged photo database: it has no table Status");
+  ExpectAllFail(5, " is not a merged photo database: it has no table Status");
 }
 
 TEST_F(ZophotosFailure, OfAFileThatIsNoDatabase) {
-  fs::create_directory("/tmp/copy");
   std::ofstream(COPY) << std::string(5000, 'x');
-  ExpectRefused(": file is not a database");
+  ExpectAllFail(5, ": file is not a database", "check");
 }
 
 TEST_F(ZophotosFailure, OfAColumnThatIsMissing) {
@@ -252,9 +236,8 @@ TEST_F(ZophotosFailure, OfALockThatStays) {
   const Database locked = Copy();
   locked.Run("BEGIN EXCLUSIVE");
   std::vector<std::unique_ptr<Program>> programs;
-  for (Arguments command : COMMANDS) { // all at once, since each of them waits
-    command.insert(command.begin(), {"--database", COPY});
-    programs.push_back(std::make_unique<Program>(ZophotosCommand(command)));
+  for (const Arguments& command : COMMANDS) { // all at once, because each of them waits
+    programs.push_back(std::make_unique<Program>(ZophotosCommand(OnCopyArguments(command))));
   }
   for (std::size_t i = 0; i < programs.size(); ++i) {
     EXPECT_EQ("zophotos: " + COPY +
@@ -269,7 +252,7 @@ TEST_F(ZophotosFailure, IsNotALockThatGoes) {
   const Database locked = Copy();
   for (const char* const command : {"status", "ls"}) {
     locked.Run("BEGIN EXCLUSIVE");
-    Program program(ZophotosCommand({"--database", COPY, command}));
+    Program program(ZophotosCommand(OnCopyArguments({command})));
     EXPECT_TRUE(AwaitSystemCall(program.Pid(), SYS_clock_nanosleep));
     locked.Run("COMMIT");
     EXPECT_THAT(program.ReadLineWith("A/"), Not(HasSubstr("(end)")));
@@ -285,13 +268,9 @@ TEST_F(ZophotosFailure, OfAMergeThatWasInterrupted) {
   CraftedJournal(pageSize, static_cast<std::uint32_t>(file.Size()) / pageSize,
                  {{1, file.Part(0, pageSize)}})
       .Save(COPY + "-journal");
-  for (const Arguments& command : COMMANDS) {
-    SCOPED_TRACE(Text(command));
-    ExpectFailure(OnCopy(command), 4,
-                  COPY + " has an interrupted merge to roll back; the daemon does that when it "
-                         "opens the database");
-  }
-  Program watch(ZophotosCommand({"--json", "--database", COPY, "watch"}));
+  ExpectAllFail(4, " has an interrupted merge to roll back; the daemon does that when it opens the "
+                   "database");
+  Program watch(ZophotosCommand(OnCopyArguments({"--json", "watch"})));
   EXPECT_THAT(watch.ReadLine(), HasSubstr(R"("event":"delayed","reason":")" + COPY));
   EXPECT_TRUE(fs::exists(COPY + "-journal"));
   EXPECT_EQ(std::vector<std::string>{"4"}, Database(COPY).Run("SELECT count(*) FROM Files"));
@@ -300,13 +279,9 @@ TEST_F(ZophotosFailure, OfAMergeThatWasInterrupted) {
 
 TEST_F(ZophotosFailure, OfADatabaseThatCannotBeReadWithoutWritingBesideIt) {
   Copy().Run("PRAGMA journal_mode = WAL");
-  for (const Arguments& command : COMMANDS) {
-    SCOPED_TRACE(Text(command));
-    ExpectFailure(
-        OnCopy(command), 5,
-        COPY + " uses a write-ahead log, unlike the daemon's databases; reading it would create "
-               "files next to it");
-  }
+  ExpectAllFail(5,
+                " uses a write-ahead log, unlike the daemon's databases; reading it would create "
+                "files next to it");
   EXPECT_FALSE(fs::exists(COPY + "-wal"));
   EXPECT_FALSE(fs::exists(COPY + "-shm"));
 }
@@ -322,10 +297,7 @@ TEST_F(ZophotosFailure, OfAnOutputThatCannotBeWritten) {
 }
 
 TEST_F(ZophotosFailure, OfAPlaceForAPrivateCopy) {
-  Copy().Run(
-      "WITH RECURSIVE n(i) AS (SELECT 1 UNION ALL SELECT i + 1 FROM n WHERE i < 100000) INSERT "
-      "INTO Files(folder_id, name, modified_date, volume, created_date) SELECT 1, i, 1, 'x', 1 "
-      "FROM n");
+  AddFiles(Copy(), 100'000, "1", "i");
   const Volume full("Full", "64k");
   const Volume closed("Closed", "64k,nr_inodes=1");
   for (const auto& [volume, fault] :
@@ -342,11 +314,12 @@ TEST_F(ZophotosFailure, OfAPlaceForAPrivateCopy) {
   unsetenv("SQLITE_TMPDIR");
 }
 
-/// All that is in the folder of a database: the bytes of its files and the times of their last
-/// changes.
-std::map<std::string, std::tuple<std::string, long, long, long, long>>
-Snapshot(const std::string& folder) {
-  std::map<std::string, std::tuple<std::string, long, long, long, long>> snapshot;
+/// Content, modification time and change time of a file.
+using FileState = std::tuple<std::string, long, long, long, long>;
+
+/// The states of a folder and of everything in it.
+std::map<std::string, FileState> Snapshot(const std::string& folder) {
+  std::map<std::string, FileState> snapshot;
   std::vector<std::string> paths = PathsBelow(folder);
   paths.push_back(folder);
   for (const std::string& path : paths) {
