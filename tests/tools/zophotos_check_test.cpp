@@ -78,7 +78,7 @@ TEST_F(ZophotosCheck, FindsFilesWithoutAFolder) {
       R"({"kind":"file_without_folder","count":1,"examples":["file 77, top.jpg, of /shares/A/: no folder 999"]})");
 }
 
-TEST_F(ZophotosCheck, FindsFilesOfAnotherVolumeThanTheirFolder) {
+TEST_F(ZophotosCheck, FindsFilesWithAnotherVolumeThanTheirFolder) {
   ExpectDamage(
       {"UPDATE Files SET volume = '/shares/B/' WHERE name = 'top.jpg'"},
       "  files with another volume than their folder: 1\n"
@@ -86,14 +86,14 @@ TEST_F(ZophotosCheck, FindsFilesOfAnotherVolumeThanTheirFolder) {
       R"({"kind":"file_of_other_volume","count":1,"examples":["/shares/A/top.jpg, of /shares/B/ in a folder of /shares/A/"]})");
 }
 
-TEST_F(ZophotosCheck, FindsFoldersThatAreThereMoreThanOnce) {
+TEST_F(ZophotosCheck, FindsDuplicateFolders) {
   ExpectDamage({"INSERT INTO Folders(parent_folder_id, name, modified_date, volume) SELECT "
                 "parent_folder_id, name, 7, volume FROM Folders WHERE name = '/shares/B/Old/'"},
                "  duplicate folders: 1\n    /shares/B/Old/, 2 times\n",
                R"({"kind":"duplicate_folder","count":1,"examples":["/shares/B/Old/, 2 times"]})");
 }
 
-TEST_F(ZophotosCheck, FindsFilesThatAreThereMoreThanOnce) {
+TEST_F(ZophotosCheck, FindsDuplicateFiles) {
   const std::string insert =
       "INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT folder_id, "
       "name, 7, volume, 8 FROM Files WHERE name = '1.jpg' LIMIT 1";
@@ -102,14 +102,14 @@ TEST_F(ZophotosCheck, FindsFilesThatAreThereMoreThanOnce) {
       R"({"kind":"duplicate_file","count":1,"examples":["/shares/B/Old/1.jpg, 3 times"]})");
 }
 
-TEST_F(ZophotosCheck, FindsVolumesWithMoreThanOneRowOfStatistics) {
+TEST_F(ZophotosCheck, FindsDuplicateStatistics) {
   ExpectDamage({"INSERT INTO Statistics(volume, photos_xcoded, photos_total, last_updated_time) "
                 "VALUES('/shares/B/', 0, 0, 0)"},
                "  volumes with more than one row of statistics: 1\n    /shares/B/, 2 times\n",
                R"({"kind":"duplicate_statistics","count":1,"examples":["/shares/B/, 2 times"]})");
 }
 
-TEST_F(ZophotosCheck, TellsOfEachKindThatItFinds) {
+TEST_F(ZophotosCheck, ReportsEachKindOfDamage) {
   const Database copy = Copy();
   copy.Run("DELETE FROM Status");
   copy.Run("UPDATE Files SET folder_id = 999 WHERE name = 'top.jpg'");
@@ -132,7 +132,7 @@ TEST_F(ZophotosCheck, ListsTwentyExamplesAndCountsTheRest) {
   EXPECT_EQ(20U, nlohmann::json::parse(inJson.output).at("damage").at(0).at("examples").size());
 }
 
-TEST_F(ZophotosCheck, AnUnpluggedVolumesStatisticsAreNoDamage) {
+TEST_F(ZophotosCheck, AcceptsTheStatisticsOfAnUnpluggedVolume) {
   appliance.Handle(Unplugged(b.Path()));
   ExpectOutput(Zophotos({"check"}), MERGED + " is sound\n"
                                              "Expected leftovers (not damage):\n"
@@ -146,7 +146,7 @@ TEST_F(ZophotosCheck, AnUnpluggedVolumesStatisticsAreNoDamage) {
           R"("sound":true,"damage":[],"leftovers":[{"kind":"statistics_without_content","count":1,"examples":["/shares/B/"]}])"));
 }
 
-TEST_F(ZophotosCheck, NamesInExamplesAreEscaped) {
+TEST_F(ZophotosCheck, EscapesNamesInExamples) {
   Copy().Run("UPDATE Files SET folder_id = 999, name = CAST(x'1b5bff' AS TEXT) WHERE name = "
              "'top.jpg'");
   EXPECT_THAT(OnCopy({"check"}).output, HasSubstr(R"(, \x1b[\xff, of)"));
@@ -171,7 +171,7 @@ TEST_F(ZophotosCheck, FindsAnOverwrittenSchema) {
   EXPECT_EQ(1, OnCopy({"check"}).status);
 }
 
-TEST_F(ZophotosCheck, FindsAFileThatWasCutShort) {
+TEST_F(ZophotosCheck, FindsATruncatedFile) {
   Copy();
   std::filesystem::resize_file(COPY, std::filesystem::file_size(COPY) - 5000);
   const Outcome outcome = OnCopy({"check"});
@@ -179,7 +179,7 @@ TEST_F(ZophotosCheck, FindsAFileThatWasCutShort) {
   EXPECT_THAT(outcome.output, HasSubstr("\n  errors in the file: "));
 }
 
-TEST_F(ZophotosCheck, TakesWhatCannotBeReadForAFaultAndForNothingElse) {
+TEST_F(ZophotosCheck, ReportsUnreadablePagesOnlyAsErrorsInTheFile) {
   Copy();
   const std::string page(4096, '\x5a');
   for (auto at = 4096; at < static_cast<int>(std::filesystem::file_size(COPY)); at += 4096) {
@@ -192,7 +192,7 @@ TEST_F(ZophotosCheck, TakesWhatCannotBeReadForAFaultAndForNothingElse) {
                                     Not(HasSubstr("files without a folder:"))));
 }
 
-TEST_F(ZophotosCheck, FindsAFileThatIsNoDatabase) {
+TEST_F(ZophotosCheck, FindsAFileThatIsNotADatabase) {
   Copy();
   Overwrite(0, "This is a letter and no data");
   ExpectOutput(OnCopy({"check"}),
@@ -200,7 +200,7 @@ TEST_F(ZophotosCheck, FindsAFileThatIsNoDatabase) {
                1);
 }
 
-TEST_F(ZophotosCheck, FindsPagesThatNobodyUses) {
+TEST_F(ZophotosCheck, FindsUnusedPages) {
   {
     const Database copy = Copy();
     copy.Run("PRAGMA writable_schema = ON");

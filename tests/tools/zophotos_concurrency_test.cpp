@@ -93,7 +93,7 @@ protected:
 const std::string OPENED_A =
     R"("event":"opened","database":"/shares/A//.zophotos/zophotos.db","folders":8,"files":4})";
 
-TEST_F(ZophotosWatch, BeginsWithTheDatabase) {
+TEST_F(ZophotosWatch, PrintsTheDatabaseFirst) {
   Start({});
   EXPECT_THAT(first,
               MatchesRegex("20[0-9-]+ [0-9:]+  watching " + MERGED + ": 8 folders, 4 files"));
@@ -101,7 +101,7 @@ TEST_F(ZophotosWatch, BeginsWithTheDatabase) {
   EXPECT_THAT(first, EndsWith("Z\"," + OPENED_A));
 }
 
-TEST_F(ZophotosWatch, TellsOfAMerge) {
+TEST_F(ZophotosWatch, ReportsAMerge) {
   Start();
   onB.AddFolder("New/", 5);
   onB.AddPhoto("New/1.jpg", 7, 3001);
@@ -112,7 +112,7 @@ TEST_F(ZophotosWatch, TellsOfAMerge) {
       R"("event":"changed","folders_added":1,"folders_removed":0,"files_added":2,"files_removed":0,"volumes":[{"volume":"/shares/B/","transcoded":3,"total":5,"merged_up_to":"1970-01-01T00:50:02Z"}]})");
 }
 
-TEST_F(ZophotosWatch, TellsOfAMergeInText) {
+TEST_F(ZophotosWatch, ReportsAMergeInText) {
   Start({});
   onB.AddFolder("New/", 5);
   onB.AddPhoto("Old/4.jpg", 7, 3002);
@@ -126,7 +126,7 @@ TEST_F(ZophotosWatch, TellsOfAMergeInText) {
   EXPECT_THAT(watch->ReadLine(), MatchesRegex(".*  -2 files; /shares/B/ 0 of 2 photos transcoded"));
 }
 
-TEST_F(ZophotosWatch, TellsOfWhatWentAndCameInOne) {
+TEST_F(ZophotosWatch, ReportsAdditionsAndRemovalsInOneLine) {
   Start();
   onB.AddPhoto("Old/4.jpg", 7, 3002);
   onB.DeletePhoto("Old/1.jpg", 3003);
@@ -134,26 +134,26 @@ TEST_F(ZophotosWatch, TellsOfWhatWentAndCameInOne) {
   EXPECT_THAT(Next(), HasSubstr(R"("files_added":1,"files_removed":1,)"));
 }
 
-TEST_F(ZophotosWatch, TellsOfAWriteThatChangesNothing) {
+TEST_F(ZophotosWatch, ReportsAWriteWithoutAdditionsOrRemovals) {
   Start({});
   Database(MERGED).Run("UPDATE Status SET mdate = 1001");
   EXPECT_THAT(watch->ReadLine(), EndsWith("  written, nothing added or removed"));
 }
 
-TEST_F(ZophotosWatch, TellsOfAnUnplug) {
+TEST_F(ZophotosWatch, ReportsAnUnpluggedVolume) {
   Start();
   appliance.Handle(Unplugged(b.Path()));
   EXPECT_TRUE(AwaitRemoval(2, 1));
 }
 
-TEST_F(ZophotosWatch, TellsThatAnUnpluggedVolumeBeginsAnew) {
+TEST_F(ZophotosWatch, ReportsThatAVolumeWillBeMergedFromTheBeginning) {
   const Database copy = Copy();
   Start({"--database", COPY});
   copy.Run("UPDATE Statistics SET last_updated_time = 0 WHERE volume = '/shares/B/'");
   EXPECT_THAT(watch->ReadLine(), EndsWith("  /shares/B/ will be merged from the beginning"));
 }
 
-TEST_F(ZophotosWatch, SaysNothingWhileNothingChanges) {
+TEST_F(ZophotosWatch, PrintsNothingWhileNothingChanges) {
   Start();
   MergedDatabase(a.Path()).Files();
   Zophotos({"check"});
@@ -184,7 +184,7 @@ TEST_F(ZophotosWatch, FollowsTheDatabaseToAnotherMaster) {
   EXPECT_THAT(Next(), HasSubstr(R"("folders_added":2,"folders_removed":0,"files_added":1,)"));
 }
 
-TEST_F(ZophotosWatch, TellsOnceThatTheDatabaseIsLost) {
+TEST_F(ZophotosWatch, ReportsOnceThatTheDatabaseIsLost) {
   Start();
   const std::string locator = Appliance::Locator();
   std::ofstream(LOCATOR) << "zophotos_db_path=\n";
@@ -206,7 +206,7 @@ TEST_F(ZophotosWatch, WaitsForADatabase) {
   EXPECT_THAT(watch->ReadLine(), EndsWith("8 folders, 4 files"));
 }
 
-TEST_F(ZophotosWatch, SeesAnotherFileInTheDatabasesPlace) {
+TEST_F(ZophotosWatch, DetectsAReplacedDatabaseFile) {
   Copy();
   Start({"--json", "--database", COPY});
   fs::rename(COPY, COPY + ".old");
@@ -218,7 +218,7 @@ TEST_F(ZophotosWatch, SeesAnotherFileInTheDatabasesPlace) {
   EXPECT_EQ(Next(), R"("event":"opened","database":")" + COPY + R"(","folders":8,"files":0})");
 }
 
-TEST_F(ZophotosWatch, TakesALockForNoNews) {
+TEST_F(ZophotosWatch, PrintsNothingForAShortLock) {
   const Database copy = Copy();
   Start({"--json", "--database", COPY});
   copy.Run("BEGIN EXCLUSIVE");
@@ -228,7 +228,7 @@ TEST_F(ZophotosWatch, TakesALockForNoNews) {
   EXPECT_THAT(Next(), HasSubstr(R"("files_removed":1)"));
 }
 
-TEST_F(ZophotosWatch, TellsOnceOfALockThatStays) {
+TEST_F(ZophotosWatch, ReportsALongLockOnce) {
   const Database copy = Copy();
   Start({"--json", "--database", COPY});
   copy.Run("BEGIN EXCLUSIVE");
@@ -240,7 +240,7 @@ TEST_F(ZophotosWatch, TellsOnceOfALockThatStays) {
   EXPECT_THAT(Next(), HasSubstr(R"("files_removed":1)"));
 }
 
-TEST_F(ZophotosWatch, CountsWhatCameAndWentBetweenTwoLooks) {
+TEST_F(ZophotosWatch, CountsAdditionsAndRemovalsBetweenTwoLooks) {
   const Database copy = Copy();
   Start({"--json", "--database", COPY});
   copy.Run("BEGIN");
@@ -251,7 +251,7 @@ TEST_F(ZophotosWatch, CountsWhatCameAndWentBetweenTwoLooks) {
   EXPECT_THAT(Next(), HasSubstr(R"("files_added":4,"files_removed":8)"));
 }
 
-TEST_F(ZophotosWatch, EndsBySignals) {
+TEST_F(ZophotosWatch, EndsOnSignals) {
   for (const int signal : {SIGINT, SIGTERM}) {
     Start();
     watch->Signal(signal);
@@ -259,7 +259,7 @@ TEST_F(ZophotosWatch, EndsBySignals) {
   }
 }
 
-TEST_F(ZophotosWatch, EndsWhenNobodyReadsItsLines) {
+TEST_F(ZophotosWatch, EndsWhenItsOutputIsClosed) {
   Start();
   watch->CloseOutput();
   onB.AddPhoto("Old/4.jpg", 7, 3002);
@@ -300,7 +300,7 @@ protected:
   static constexpr int PHOTOS = 4000;
 };
 
-TEST_F(ZophotosSlowReader, KeepsNoMergeFromCommitting) {
+TEST_F(ZophotosSlowReader, DoesNotBlockMerges) {
   Program slowCsv(ZophotosCommand({"export", "--csv"}));
   Program slowLines(ZophotosCommand({"export", "--jsonl"}));
   Program slowFind(ZophotosCommand({"find", "*"}));
@@ -328,7 +328,7 @@ TEST_F(ZophotosSlowReader, KeepsNoMergeFromCommitting) {
   }
 }
 
-TEST_F(ZophotosSlowReader, HasItsPrivateCopyWhereItIsTold) {
+TEST_F(ZophotosSlowReader, PutsThePrivateCopyInTheGivenFolder) {
   AddFiles(Copy(), 50'000, "1", "i");
   fs::create_directory("/tmp/space");
   setenv("SQLITE_TMPDIR", "/tmp/space", 1);
@@ -364,7 +364,7 @@ long PeakOfExport(const Database& copy, int rows, int rest) {
   return peak;
 }
 
-TEST_F(ZophotosSlowReader, HoldsUpAnExportOfConstantMemory) {
+TEST_F(ZophotosSlowReader, ExportsInConstantMemory) {
   // The address sanitizer keeps freed memory, which would be counted.
   setenv("ASAN_OPTIONS", "quarantine_size_mb=0:thread_local_quarantine_size_kb=0", 1);
   const Database copy = Copy();

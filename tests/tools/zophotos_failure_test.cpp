@@ -64,30 +64,30 @@ protected:
   }
 };
 
-TEST_F(ZophotosLocator, MayBeMissing) {
+TEST_F(ZophotosLocator, IsReportedIfMissing) {
   ExpectNoDatabase(LOCATOR + " does not exist; the daemon creates it when it starts");
 }
 
-TEST_F(ZophotosLocator, MayNameNone) {
+TEST_F(ZophotosLocator, IsReportedIfItNamesNoDatabase) {
   Write("zophotos_db_path=\n");
   ExpectNoDatabase("/tmp/zophotodbmerger.conf names no database at the moment");
 }
 
-TEST_F(ZophotosLocator, MayBeMalformed) {
+TEST_F(ZophotosLocator, IsReportedIfMalformed) {
   for (const char* const text : {"", "\n", "nonsense\n", " zophotos_db_path=/x\n", "ZOPHOTOS"}) {
     Write(text);
     ExpectNoDatabase("/tmp/zophotodbmerger.conf does not begin with zophotos_db_path=");
   }
 }
 
-TEST_F(ZophotosLocator, MayHaveANul) {
+TEST_F(ZophotosLocator, IsReportedIfItHasANul) {
   for (const std::string& path : {std::string("\0", 1), std::string("/shares\0/x", 10)}) {
     Write("zophotos_db_path=" + path + "\n");
     ExpectNoDatabase("/tmp/zophotodbmerger.conf has a NUL byte in its first line");
   }
 }
 
-TEST_F(ZophotosLocator, MayBeNoFile) {
+TEST_F(ZophotosLocator, IsReportedIfItIsNotARegularFile) {
   const std::string reason =
       "/tmp/zophotodbmerger.conf is not a regular file, so the daemon does not write to it";
   fs::create_directory(LOCATOR);
@@ -97,12 +97,12 @@ TEST_F(ZophotosLocator, MayBeNoFile) {
   ExpectNoDatabase(reason);
 }
 
-TEST_F(ZophotosLocator, MayNameWhatIsNotThere) {
+TEST_F(ZophotosLocator, MayNameAMissingDatabase) {
   Write("zophotos_db_path=/shares/Gone//.zophotos/zophotos.db\n");
   ExpectNoDatabase("/shares/Gone//.zophotos/zophotos.db does not exist");
 }
 
-TEST_F(ZophotosLocator, MayNameWhatIsNoFile) {
+TEST_F(ZophotosLocator, MayNameADirectoryOrADevice) {
   for (const char* const path : {"/shares", "/dev/null"}) {
     Write("zophotos_db_path=" + std::string(path));
     ExpectFailure(Zophotos({"status"}), 5, std::string(path) + " is not a regular file");
@@ -110,19 +110,19 @@ TEST_F(ZophotosLocator, MayNameWhatIsNoFile) {
   }
 }
 
-TEST_F(ZophotosLocator, CannotSayAnythingToTheTerminal) {
+TEST_F(ZophotosLocator, IsEscapedInMessages) {
   Write("zophotos_db_path=/x\x1b[2J\xff\u202e\r\n");
   ExpectNoDatabase(R"(/x\x1b[2J\xff\xe2\x80\xae\x0d does not exist)");
 }
 
-TEST_F(ZophotosLocator, IsReadNoFurtherThanAPathCanBe) {
+TEST_F(ZophotosLocator, IsNotReadToTheEndIfHuge) {
   Write("zophotos_db_path=/" + std::string(1 << 20, 'x'));
   const Outcome outcome = Zophotos({"status"});
   EXPECT_EQ(5, outcome.status);
   EXPECT_THAT(outcome.error, AllOf(HasSubstr("/xxx"), SizeIs(Lt(10000))));
 }
 
-TEST(ZophotosUsage, IsToldFromFailure) {
+TEST(ZophotosUsage, ErrorsHaveAStatusOfTheirOwn) {
   const std::vector<std::pair<Arguments, std::string>> wrong{
       {{}, "A subcommand is required"},
       {{"destroy"}, "destroy"},
@@ -148,7 +148,7 @@ TEST(ZophotosUsage, IsToldFromFailure) {
   }
 }
 
-TEST(ZophotosUsage, IsExplained) {
+TEST(ZophotosUsage, HelpNamesAllCommands) {
   for (const Arguments& arguments : {Arguments{"--help"}, Arguments{"-h"}}) {
     const Outcome help = Zophotos(arguments);
     EXPECT_EQ(0, help.status);
@@ -161,7 +161,7 @@ TEST(ZophotosUsage, IsExplained) {
   }
 }
 
-TEST(ZophotosUsage, VersionIsTheProjects) {
+TEST(ZophotosUsage, VersionIsThatOfTheProject) {
   const Outcome outcome = Zophotos({"--version"});
   EXPECT_EQ(0, outcome.status);
   EXPECT_EQ("zophotos " ZOPHOTOS_VERSION "\n", outcome.output);
@@ -181,14 +181,14 @@ protected:
   }
 };
 
-TEST_F(ZophotosFailure, OfATableThatIsMissing) {
+TEST_F(ZophotosFailure, MissingTableIsReported) {
   for (const char* const table : {"Status", "Statistics", "Folders", "Files"}) {
     Copy().Run("ALTER TABLE " + std::string(table) + " RENAME TO Other");
     ExpectAllFail(5, " is not a merged photo database: it has no table " + std::string(table));
   }
 }
 
-TEST_F(ZophotosFailure, OfAViewInPlaceOfATable) {
+TEST_F(ZophotosFailure, ViewInPlaceOfATableIsReported) {
   {
     const Database copy = Copy();
     copy.Run("ALTER TABLE Statistics RENAME TO Other");
@@ -198,7 +198,7 @@ TEST_F(ZophotosFailure, OfAViewInPlaceOfATable) {
 }
 
 // In UTF-16, half a surrogate pair sorts by other bytes than those that it is read as.
-TEST_F(ZophotosFailure, OfTextsInUtf16) {
+TEST_F(ZophotosFailure, Utf16TextsAreReported) {
   const Database database(COPY, true);
   database.Run("PRAGMA encoding = 'UTF-16le'");
   for (const char* const table : {"Status(id)", "Statistics(id)", "Files(folder_id)",
@@ -212,17 +212,17 @@ TEST_F(ZophotosFailure, OfTextsInUtf16) {
   ExpectAllFail(5, " is not a merged photo database: its text encoding is UTF-16le");
 }
 
-TEST_F(ZophotosFailure, OfAFileThatIsEmpty) {
+TEST_F(ZophotosFailure, EmptyFileIsReported) {
   std::ofstream file(COPY);
   ExpectAllFail(5, " is not a merged photo database: it has no table Status");
 }
 
-TEST_F(ZophotosFailure, OfAFileThatIsNoDatabase) {
+TEST_F(ZophotosFailure, FileThatIsNotADatabaseIsReported) {
   std::ofstream(COPY) << std::string(5000, 'x');
   ExpectAllFail(5, ": file is not a database", "check");
 }
 
-TEST_F(ZophotosFailure, OfAColumnThatIsMissing) {
+TEST_F(ZophotosFailure, MissingColumnIsReported) {
   Copy().Run("ALTER TABLE Files RENAME COLUMN name TO other");
   for (const Arguments& command : {Arguments{"find", "*"}, Arguments{"export", "--csv"},
                                    Arguments{"ls"}, Arguments{"check"}}) {
@@ -232,7 +232,7 @@ TEST_F(ZophotosFailure, OfAColumnThatIsMissing) {
   }
 }
 
-TEST_F(ZophotosFailure, OfALockThatStays) {
+TEST_F(ZophotosFailure, LongLockIsReported) {
   const Database locked = Copy();
   locked.Run("BEGIN EXCLUSIVE");
   std::vector<std::unique_ptr<Program>> programs;
@@ -248,7 +248,7 @@ TEST_F(ZophotosFailure, OfALockThatStays) {
   }
 }
 
-TEST_F(ZophotosFailure, IsNotALockThatGoes) {
+TEST_F(ZophotosFailure, ShortLockIsWaitedFor) {
   const Database locked = Copy();
   for (const char* const command : {"status", "ls"}) {
     locked.Run("BEGIN EXCLUSIVE");
@@ -260,7 +260,7 @@ TEST_F(ZophotosFailure, IsNotALockThatGoes) {
   }
 }
 
-TEST_F(ZophotosFailure, OfAMergeThatWasInterrupted) {
+TEST_F(ZophotosFailure, InterruptedMergeIsReported) {
   constexpr std::uint32_t pageSize = 4096;
   Copy();
   Bytes file = Bytes::Of(COPY);
@@ -277,7 +277,7 @@ TEST_F(ZophotosFailure, OfAMergeThatWasInterrupted) {
   EXPECT_EQ(0, OnCopy({"status"}).status);
 }
 
-TEST_F(ZophotosFailure, OfADatabaseThatCannotBeReadWithoutWritingBesideIt) {
+TEST_F(ZophotosFailure, WriteAheadLogIsReportedAndNotCreated) {
   Copy().Run("PRAGMA journal_mode = WAL");
   ExpectAllFail(5,
                 " uses a write-ahead log, unlike the daemon's databases; reading it would create "
@@ -286,7 +286,7 @@ TEST_F(ZophotosFailure, OfADatabaseThatCannotBeReadWithoutWritingBesideIt) {
   EXPECT_FALSE(fs::exists(COPY + "-shm"));
 }
 
-TEST_F(ZophotosFailure, OfAnOutputThatCannotBeWritten) {
+TEST_F(ZophotosFailure, UnwritableOutputIsReported) {
   std::vector<Arguments> commands = COMMANDS;
   commands.push_back({"watch"});
   commands.push_back({"--help"});
@@ -296,7 +296,7 @@ TEST_F(ZophotosFailure, OfAnOutputThatCannotBeWritten) {
   }
 }
 
-TEST_F(ZophotosFailure, OfAPlaceForAPrivateCopy) {
+TEST_F(ZophotosFailure, FailedPrivateCopyIsReported) {
   AddFiles(Copy(), 100'000, "1", "i");
   const Volume full("Full", "64k");
   const Volume closed("Closed", "64k,nr_inodes=1");
@@ -334,7 +334,7 @@ std::map<std::string, FileState> Snapshot(const std::string& folder) {
   return snapshot;
 }
 
-TEST_F(ZophotosFailure, OrNotLeavesTheDatabaseAsItWas) {
+TEST_F(ZophotosFailure, NoCommandChangesTheDatabase) {
   const auto before = Snapshot("/shares/A/.zophotos");
   for (const Arguments& command : COMMANDS) {
     EXPECT_EQ(0, Zophotos(command).status);
@@ -345,7 +345,7 @@ TEST_F(ZophotosFailure, OrNotLeavesTheDatabaseAsItWas) {
   EXPECT_EQ(before, Snapshot("/shares/A/.zophotos"));
 }
 
-TEST_F(ZophotosFailure, LeavesNothingInTheTemporaryFolder) {
+TEST_F(ZophotosFailure, NoCommandLeavesTemporaryFiles) {
   const auto before = PathsBelow("/tmp");
   for (const Arguments& command : COMMANDS) {
     Zophotos(command);

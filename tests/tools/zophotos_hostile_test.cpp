@@ -115,7 +115,7 @@ protected:
   }
 };
 
-TEST_F(ZophotosTerminal, TablesFitIt) {
+TEST_F(ZophotosTerminal, TablesFitTheTerminal) {
   for (const int columns : {20, 40, 60, 80, 120, 200}) {
     SCOPED_TRACE(columns);
     const Lines list = OnTerminal(columns, {"ls", "-l", "A"});
@@ -128,7 +128,7 @@ TEST_F(ZophotosTerminal, TablesFitIt) {
   }
 }
 
-TEST_F(ZophotosTerminal, TakesShortenedNamesBeforeFiguresAreLeftOut) {
+TEST_F(ZophotosTerminal, NamesAreShortenedBeforeNumbersAreCut) {
   const Lines status = OnTerminal(80, {"status"});
   ASSERT_EQ(14U, status.size());
   EXPECT_THAT(status[4], AllOf(HasSubstr("VOLUME"), HasSubstr("MERGED UP TO")));
@@ -137,17 +137,17 @@ TEST_F(ZophotosTerminal, TakesShortenedNamesBeforeFiguresAreLeftOut) {
   EXPECT_THAT(status[5], HasSubstr("/shares/A/ "));
 }
 
-TEST_F(ZophotosTerminal, ShowsBarsWhereThereIsRoomForThem) {
+TEST_F(ZophotosTerminal, BarsAreShownOnlyIfTheyFit) {
   EXPECT_THAT(OnTerminal(120, {"status"}).at(5), HasSubstr("██████████ 100 %"));
   EXPECT_THAT(OnTerminal(70, {"status"}).at(5), AllOf(Not(HasSubstr("█")), HasSubstr("100 %")));
 }
 
-TEST_F(ZophotosTerminal, TablesAreWholeWhereThereIsNone) {
+TEST_F(ZophotosTerminal, TablesAreNotShortenedWithoutATerminal) {
   EXPECT_THAT(OnCopy({"ls", "-l", "A"}).output,
               AllOf(HasSubstr("  " + std::string(100, 'l') + "/\n"), Not(HasSubstr("…"))));
 }
 
-TEST_F(ZophotosTerminal, ColumnsStandBelowEachOther) {
+TEST_F(ZophotosTerminal, ColumnsAreAligned) {
   const Lines list = OnTerminal(80, {"ls", "-l", "A"});
   const auto name = Columns(list.at(0).substr(0, list[0].find("NAME")));
   for (const std::string& line : {list.at(1), list.at(2), list.at(3), list.at(6)}) {
@@ -157,7 +157,7 @@ TEST_F(ZophotosTerminal, ColumnsStandBelowEachOther) {
   }
 }
 
-TEST_F(ZophotosTerminal, GetsNoControlCharactersFromNames) {
+TEST_F(ZophotosTerminal, NamesWriteNoControlCharacters) {
   const Database copy(COPY);
   // Escape sequences of 7 and 8 bits, line ends, delete, invisible characters and half a character.
   for (const char* const bytes : {"1b5d303b781b5c", "c29b326a", "0d0a0908", "7f", "e280a8",
@@ -232,7 +232,7 @@ protected:
   }
 };
 
-TEST_F(ZophotosHostile, PathsWithoutASeparatorAtTheirEndDoNoHarm) {
+TEST_F(ZophotosHostile, PathsWithoutATrailingSeparatorDoNoHarm) {
   Copy();
   for (const char* const path : {"", "/", "//", "x", "/shares", "/shares/A", "/shares/A/Pictures",
                                  "/shares/A//", "/shares/A//x", "/shares/A/Pictures/Summerhouse"}) {
@@ -281,7 +281,7 @@ TEST_F(ZophotosHostile, NumbersOutOfRangeDoNoHarm) {
   }
 }
 
-TEST_F(ZophotosHostile, IdsAtTheirEndDoNoHarm) {
+TEST_F(ZophotosHostile, LargestAndSmallestIdsDoNoHarm) {
   const Database copy = Copy();
   copy.Run("UPDATE Files SET folder_id = 9223372036854775807, file_id = 9223372036854775807 WHERE "
            "name = 'top.jpg'");
@@ -289,7 +289,7 @@ TEST_F(ZophotosHostile, IdsAtTheirEndDoNoHarm) {
   ExpectNoHarm();
 }
 
-TEST_F(ZophotosHostile, IdsThatGoBackAddNothing) {
+TEST_F(ZophotosHostile, DecreasingIdsAddNothing) {
   const Database copy = Copy();
   Program watch(ZophotosCommand(OnCopyArguments({"watch"})));
   EXPECT_THAT(watch.ReadLine(), HasSubstr("watching"));
@@ -297,7 +297,7 @@ TEST_F(ZophotosHostile, IdsThatGoBackAddNothing) {
   EXPECT_THAT(watch.ReadLine(), HasSubstr("  written, nothing added or removed"));
 }
 
-TEST_F(ZophotosHostile, NamesOfOtherTypesDoNoHarm) {
+TEST_F(ZophotosHostile, BlobsAsNamesDoNoHarm) {
   const Database copy = Copy();
   copy.Run("UPDATE Folders SET name = zeroblob(100), volume = x'ff00' WHERE name = '/shares/B/'");
   copy.Run("UPDATE Files SET name = zeroblob(3), volume = x'' WHERE name = 'top.jpg'");
