@@ -368,7 +368,7 @@ TEST_F(ZophotosSlowReader, ExportsInConstantMemory) {
   // The address sanitizer keeps freed memory, which would be counted.
   setenv("ASAN_OPTIONS", "quarantine_size_mb=0:thread_local_quarantine_size_kb=0", 1);
   const Database copy = Copy();
-  // Both fill the caches of SQLite.
+  // Both exports fill the caches of SQLite.
   const long some = PeakOfExport(copy, 100'000, 2500);
   const long many = PeakOfExport(copy, 200'000, 2500);
   unsetenv("ASAN_OPTIONS");

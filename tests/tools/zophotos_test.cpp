@@ -307,7 +307,7 @@ TEST_F(ZophotosFind, PrintsOneObjectPerLineInJson) {
       "\n");
 }
 
-/// Bytes that a file's name may have, in SQL and as they are.
+/// A file name with a control character and a byte that is not UTF-8, in SQL and as bytes.
 const std::string ODD_NAME_SQL = "CAST(x'780a1b5bff5c2e6a7067' AS TEXT)";
 const std::string ODD_NAME = "x\n\x1b[\xff\\.jpg";
 
@@ -332,7 +332,7 @@ TEST_F(ZophotosFind, EscapesInvisibleCharacters) {
     copy.Run("UPDATE Files SET name = ?1 WHERE name = 'top.jpg' OR name LIKE '%.x'", {name + ".x"});
     ExpectOutput(OnCopy({"find", "*.x"}), "/shares/A/" + escaped + ".x\n");
   }
-  // A family's joiners, the selector of a picture, and that of a Chinese character's form.
+  // A joiner in an emoji, and variation selectors of an emoji and of a Chinese character.
   for (const char* const name : {"👩‍👧.x", "❤️.x", "葛\U000E0100.x", "ü.x"}) {
     copy.Run("UPDATE Files SET name = ? WHERE name LIKE '%.x'", {name});
     ExpectOutput(OnCopy({"find", "*.x"}), "/shares/A/" + std::string(name) + "\n");

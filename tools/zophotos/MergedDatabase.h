@@ -19,8 +19,8 @@ namespace orva::zophotos {
 SQLite::Database OpenDatabase(const std::string& path);
 
 /// A private copy of the merged database at `path`, in a temporary file without a name that is
-/// removed with the connection. It is a consistent snapshot and does not block merges. Throws
-/// Failure or SQLite::Exception.
+/// removed with the connection. It is a consistent snapshot, and reading it does not block merges.
+/// Throws Failure or SQLite::Exception.
 SQLite::Database CopyDatabase(const std::string& path);
 
 /// One row of Walk: a folder, or a file in it. Valid during the call.

@@ -77,7 +77,7 @@ std::string Progress(const Volume& volume, int width) {
   }
   const auto done =
       static_cast<double>(std::clamp<std::int64_t>(volume.transcoded, 0, volume.total));
-  // Multiplied first: as a fraction, 0.29 is a little less than 29 / 100.
+  // Multiplied first, because the double 0.29 times 100 is less than 29.
   const auto part = [&](int whole) {
     return static_cast<int>(done * whole / static_cast<double>(volume.total));
   };

@@ -170,7 +170,7 @@ private:
            {"files", state_.files.count}});
   }
 
-  /// Prints once why the database cannot be read.
+  /// Prints once why the database is lost, and closes it.
   void Lose(const std::string& reason) {
     database_.reset();
     if (reason != loss_) {

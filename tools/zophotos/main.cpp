@@ -18,8 +18,8 @@ using namespace orva::zophotos;
 class Options {
 public:
   Options() {
-    app_.require_subcommand(0,
-                            1); // Parse reports a missing one, so that CLI11 names an unknown one
+    // None is allowed here so that CLI11 names an unknown command; Parse reports a missing one.
+    app_.require_subcommand(0, 1);
     app_.fallthrough();
     app_.set_version_flag("--version", "zophotos " ZOPHOTOS_VERSION);
     app_.add_option("--database", database_,
