@@ -1,5 +1,7 @@
 #include "ZophotosTest.h"
 
+#include "support/Programs.h"
+
 #include <cstdlib>
 #include <filesystem>
 #include <sstream>
@@ -9,7 +11,7 @@ namespace orva::test {
 namespace fs = std::filesystem;
 
 Arguments ZophotosCommand(Arguments arguments) {
-  arguments.insert(arguments.begin(), ZOPHOTOS);
+  arguments.insert(arguments.begin(), ProgramPath("zophotos"));
   return arguments;
 }
 

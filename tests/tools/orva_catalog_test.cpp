@@ -15,6 +15,7 @@
 #include "orvautil/Exception.h"
 
 #include "support/Program.h"
+#include "support/Programs.h"
 
 #include <gtest/gtest.h>
 
@@ -118,7 +119,7 @@ protected:
 
   /// Runs the program with both outputs in `output`; `arguments` go through the shell.
   static Outcome RunProgram(const std::string& arguments) {
-    return RunShell(std::string(ORVA_CATALOG_PROGRAM) + ' ' + arguments + " 2>&1");
+    return RunShell(test::ProgramPath("orva-catalog") + ' ' + arguments + " 2>&1");
   }
   static Outcome RunShell(const std::string& command) {
     return test::Run({"/bin/sh", "-c", command});
@@ -705,8 +706,8 @@ TEST_F(OrvaCatalog, TheProgramIndexesAndTellsWhatItDid) {
 TEST_F(OrvaCatalog, ProgressIsShownOnATerminalAndWipedAway) {
   Write("Pictures/a.jpg");
   const Outcome outcome =
-      RunShell("script --quiet --return --command '" ORVA_CATALOG_PROGRAM " index " +
-               volume_.native() + "' /dev/null");
+      RunShell("script --quiet --return --command '" + test::ProgramPath("orva-catalog") +
+               " index " + volume_.native() + "' /dev/null");
   EXPECT_EQ(outcome.status, 0);
   const std::string progress = "\r\033[K1 folders, 1 files, 1 photos\r\033[K";
   EXPECT_EQ(outcome.output.substr(0, progress.size() + volume_.native().size()),

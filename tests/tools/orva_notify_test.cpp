@@ -9,6 +9,7 @@
 #include "orvautil/Decodestring.h"
 
 #include "support/Program.h"
+#include "support/Programs.h"
 #include "system/Deadline.h"
 
 #include <gmock/gmock.h>
@@ -54,7 +55,7 @@ bool IsReadable(int descriptor, Clock::time_point deadline) {
 }
 
 Arguments Notify(Arguments arguments) {
-  arguments.insert(arguments.begin(), ORVA_NOTIFY_PROGRAM);
+  arguments.insert(arguments.begin(), test::ProgramPath("orva-notify"));
   return arguments;
 }
 
@@ -487,8 +488,8 @@ TEST_F(OrvaNotify, GoesOnWhenNobodyReadsItsLines) {
 }
 
 TEST_F(OrvaNotify, GoesOnWhenDescriptorsRunOut) {
-  service_ = std::make_unique<Program>(
-      Arguments{"/bin/sh", "-c", "ulimit -n 12; exec " ORVA_NOTIFY_PROGRAM " serve"});
+  service_ = std::make_unique<Program>(Arguments{
+      "/bin/sh", "-c", "ulimit -n 12; exec " + test::ProgramPath("orva-notify") + " serve"});
   ASSERT_EQ(service_->ReadLine(), "listening on " + ORVA_NOTIFICATION_SOCKET);
   {
     // The sanitizer opens a pipe when it first meets an object of a class: none may be new later.
