@@ -2,7 +2,7 @@
 
 namespace orva::bench {
 
-// What a merge asks a catalog, in the words of src/zophotodbmerger/CatalogReader.cpp.
+// The statements that a merge runs on a catalog, copied from src/zophotodbmerger/CatalogReader.cpp.
 
 inline constexpr char SELECT_FOLDERS[] =
     "SELECT * FROM Folders where +isSystem = 0 AND +isBackup = 0 AND +isHidden = 0";

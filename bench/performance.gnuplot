@@ -1,4 +1,5 @@
-# Time of a first merge against size, a panel for each shape. Run in the folder of performance.dat.
+# Plots the time of a first merge against size, one panel per shape. Run it in the folder of
+# performance.dat.
 set terminal pngcairo size 1200, 800 font "sans,11"
 set output "performance.png"
 set logscale xy

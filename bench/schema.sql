@@ -1,5 +1,5 @@
--- The merged database as a daemon makes it: tables, first rows, indices. The driver checks that the
--- texts are the daemon's.
+-- The merged database as the daemon creates it: tables, first rows, indexes. The driver compares the
+-- schema with the daemon's.
 CREATE TABLE Status(id INTEGER PRIMARY KEY AUTOINCREMENT, mc_version CHAR(16) NOT NULL, mdate INTEGER NOT NULL, desc CHAR(80), etype INTEGER);
 CREATE TABLE Statistics(id INTEGER PRIMARY KEY AUTOINCREMENT, volume TEXT NOT NULL, photos_xcoded INTEGER NOT NULL, photos_total INTEGER NOT NULL, last_updated_time INTEGER NOT NULL);
 INSERT INTO Status(mc_version, mdate, desc, etype) VALUES('2.0', 1000, '', 0);

@@ -32,7 +32,7 @@ using fuzz::Require;
 const std::string DELIMITER(4, '\0');
 const std::string GOOD = R"(<ORVANotification Name="End" MountPoint="/shares/Good"/>)";
 
-/// The bytes that an input stands for.
+/// The bytes that an input expands to.
 std::string Expand(std::string_view input) {
   constexpr char blanks = 31;
   constexpr std::size_t count = 4096;

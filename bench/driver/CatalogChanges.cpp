@@ -22,9 +22,9 @@ template <typename Change>
 void ChangeCatalog(const std::string& mountPoint, Change change) {
   const auto catalog = catalog::OpenCatalog(mountPoint);
   {
-    db::Transaction transaction(*catalog, catalog::BUSY_TIMEOUT, __FILE__, __LINE__);
+    db::Transaction transaction(*catalog, catalog::BUSY_TIMEOUT);
     change(*catalog, catalog::NextStamp(*catalog, std::time(nullptr)));
-    transaction.Commit(__FILE__, __LINE__);
+    transaction.Commit();
   }
   catalog::Checkpoint(*catalog);
 }

@@ -3,8 +3,8 @@
 #include <ctime>
 #include <string>
 
-// What the appliance's indexer does to the catalog of the volume at `mountPoint` between two
-// merges, each in one transaction. Failures are thrown as std::string.
+// Changes that the appliance's indexer makes to the catalog of the volume at `mountPoint` between
+// two merges. Each function writes in one transaction. Failures are thrown as std::string.
 namespace orva::bench {
 
 /// The newest stamp of a transcoding.
@@ -13,13 +13,13 @@ std::time_t NewestStamp(const std::string& mountPoint);
 /// Adds a folder with `files` rendered photos.
 void AppendBatch(const std::string& mountPoint, int files);
 
-/// All files are gone from the volume, their transcodings withdrawn.
+/// Marks all files deleted and withdraws their transcodings.
 void DeleteEveryFile(const std::string& mountPoint);
 
-/// All files are there again, their transcodings finished.
+/// Reverts DeleteEveryFile: all files exist, their transcodings are finished.
 void ReviveEveryFile(const std::string& mountPoint);
 
-/// All transcodings are made again.
+/// Gives every transcoding a new stamp, as if it had been made again.
 void RestampEveryFile(const std::string& mountPoint);
 
 } // namespace orva::bench

@@ -13,7 +13,7 @@ public:
     for (const char byte : text) {
       Add(static_cast<unsigned char>(byte));
     }
-    Add(0); // where one column ends and the next begins
+    Add(0); // the end of a column
   }
   std::uint64_t Value() const { return value_; }
 

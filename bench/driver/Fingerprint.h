@@ -5,8 +5,8 @@
 
 namespace orva::bench {
 
-/// What a merged database says, ids aside: of each table the number of rows and a sum over them
-/// that does not depend on their order; and its schema.
+/// The content of a merged database without its ids: for each table, and for the schema, the number
+/// of rows and a checksum that does not depend on their order.
 struct Fingerprint {
   struct Rows {
     std::uint64_t count = 0;

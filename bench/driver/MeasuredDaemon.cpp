@@ -23,7 +23,7 @@ MeasuredDaemon::MeasuredDaemon(const test::Volume& master, const test::Volume& l
     appliance_.Handle(test::Plugged(volume->Path()));
   }
   appliance_.Handle(test::Scanned(master.Path()));
-  // The peak starts anew at what the process has now.
+  // Resets the peak to the memory that the process has now.
   std::ofstream(ProcessFile(appliance_.Daemon().Pid(), "clear_refs")) << 5;
   idle_ = PeakMemory();
 }

@@ -8,8 +8,8 @@
 
 namespace orva::bench {
 
-/// A daemon in the scanned state, fresh, with the volume whose catalog it merges. Failures are
-/// thrown as std::exception.
+/// A newly started daemon in the scanned state, with the volume whose catalog it merges. Failures
+/// are thrown as std::exception.
 class MeasuredDaemon {
 public:
   /// `master` holds the merged database.
@@ -18,11 +18,11 @@ public:
   MeasuredDaemon(const MeasuredDaemon&) = delete;
   MeasuredDaemon& operator=(const MeasuredDaemon&) = delete;
 
-  /// Announces a batch and waits for its merge. Returns the seconds between the two; nothing when
-  /// it takes longer than `limit`, after which this daemon is of no use.
+  /// Announces a batch, waits for the end of its merge and returns the seconds in between. Returns
+  /// nothing when the merge takes longer than `limit`; this object cannot be used then.
   std::optional<double> Merge(std::chrono::seconds limit);
 
-  /// Bytes that the daemon's memory has had at its peak since it was idle, over what it had then.
+  /// The peak of the daemon's memory since it was idle, less its memory then, in bytes.
   double PeakOverIdle() const;
 
 private:

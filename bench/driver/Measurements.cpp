@@ -23,30 +23,31 @@ namespace orva::bench {
 namespace {
 
 constexpr int BATCH_SIZE = 100;
-/// The largest catalog whose deletion is repeated: each time all is merged again in between.
+/// The largest catalog whose deletion is measured more than once, as all files must be merged again
+/// in between.
 constexpr long long MOST_FILES_DELETED_AGAIN = 100'000;
-/// The one size of the shape that is there for the unchanged merge.
+/// The only size of the shape "folders", which measures the unchanged merge.
 constexpr long long MANY_FOLDERS = 100'000;
 
 catalog::GeneratorPlan PlanOf(const std::string& shape, long long files) {
   using catalog::Names;
   using catalog::Tree;
   if (shape == "unique") {
-    return {files, 100, Names::Unique, Tree::Flat};
+    return {.files = files, .perFolder = 100};
   }
   if (shape == "flat") {
-    return {files, files, Names::Unique, Tree::Flat};
+    return {.files = files, .perFolder = files};
   }
   if (shape == "deep") {
-    return {files, 20, Names::Unique, Tree::Deep};
+    return {.files = files, .perFolder = 20, .tree = Tree::Deep};
   }
   if (shape == "folders") {
-    return {files, 1, Names::Unique, Tree::Flat};
+    return {.files = files, .perFolder = 1};
   }
-  return {files, 1000, Names::Camera, Tree::Flat}; // camera, restamped
+  return {.files = files, .perFolder = 1000, .names = Names::Camera}; // camera, restamped
 }
 
-/// One catalog, from the first merge of its files to their deletion.
+/// The measurements of one catalog, from the first merge of its files to their deletion.
 class Case {
 public:
   Case(const Options& options, Results& results, std::string shape, long long files)
@@ -56,7 +57,7 @@ public:
     Generate();
     if (shape_ == "restamped" || shape_ == "folders") {
       MeasuredDaemon daemon(master_, library_);
-      Tell("merging");
+      Report("merging");
       if (!daemon.Merge(options_.limit)) {
         Add(FIRST_MERGE).gaveUp = true;
         return;
@@ -78,13 +79,13 @@ public:
 
 private:
   void Generate() const {
-    Tell("generating");
+    Report("generating");
     const auto database = catalog::OpenCatalog(library_.Path());
     catalog::Generate(*database, PlanOf(shape_, files_), std::time(nullptr));
     catalog::Checkpoint(*database);
   }
 
-  /// Whole catalogs into new databases, each time by a fresh daemon.
+  /// Merges the whole catalog into a new database, each time with a new daemon.
   bool FirstMerges() {
     Measurement memory{.what = PEAK_MEMORY, .shape = shape_, .files = files_};
     Measurement& merge = Add(FIRST_MERGE);
@@ -104,8 +105,8 @@ private:
     return done;
   }
 
-  /// All files once more into the folders that have them. The floor and the horizon, which do
-  /// not ask what is there, bring the same catalog into a new database.
+  /// Merges all files again into the folders that have them. The floor and the horizon do not look
+  /// for existing rows, so they merge the same catalog into a new database.
   bool MergesAgain() {
     MeasuredDaemon daemon(master_, library_);
     Measurement& merge = Add(FIRST_MERGE);
@@ -128,7 +129,7 @@ private:
     const Fingerprint rows = TakeFingerprint(DatabaseFile());
     if (rows.files.count != static_cast<std::uint64_t>(files_) ||
         rows != TakeFingerprint(FLOOR_DATABASE) || rows != TakeFingerprint(HORIZON_DATABASE)) {
-      throw std::runtime_error("the rows of " + shape_ + " differ");
+      throw std::runtime_error("daemon, floor and horizon wrote different rows for " + shape_);
     }
   }
 
@@ -177,10 +178,10 @@ private:
     });
   }
 
-  /// Calls `once` until it has succeeded `times` times, it fails or the budget is used up.
+  /// Calls `once` until it has succeeded `times` times, it fails, or the budget is used up.
   template <typename Once>
   bool Repeat(const Measurement& measurement, int times, Once once) const {
-    Tell(measurement.what);
+    Report(measurement.what);
     const auto begin = std::chrono::steady_clock::now();
     for (int i = 0; i < times; ++i) {
       if (!once()) {
@@ -206,9 +207,10 @@ private:
   void RequireFiles(long long files) const {
     db::DB database;
     database.Open(DatabaseFile());
-    db::Statement count(database, "SELECT count(*) FROM Files", __FILE__, __LINE__);
-    if (!count.Fetch(__FILE__, __LINE__) || count.GetInt64(0) != files) {
-      throw std::runtime_error("the files of " + shape_ + " are not what they should be");
+    db::Statement count(database, "SELECT count(*) FROM Files");
+    if (!count.Fetch() || count.GetInt64(0) != files) {
+      throw std::runtime_error("the merged database of " + shape_ + " does not have " +
+                               std::to_string(files) + " files");
     }
   }
 
@@ -217,7 +219,7 @@ private:
         Measurement{.what = what, .shape = shape_, .files = files_});
   }
 
-  void Tell(const std::string& what) const {
+  void Report(const std::string& what) const {
     std::cerr << shape_ << ' ' << files_ << ": " << what << '\n';
   }
 
@@ -232,7 +234,7 @@ private:
   Results& results_;
   const std::string shape_;
   const long long files_;
-  // The master is what no other is: larger than the shares root, which stands for election too.
+  // Larger than the shares root, which is a candidate for the election, too.
   const test::Volume master_{"Master", "150g"};
   const test::Volume library_{"Library", "50g"};
 };

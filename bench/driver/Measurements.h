@@ -5,9 +5,9 @@
 
 namespace orva::bench {
 
-/// Makes all the measurements, in a private root; tells on standard error what it is at. Throws
-/// std::exception or std::string, also when the daemon, the floor and the horizon do not come to
-/// the same rows.
+/// Makes all the measurements, in a private root, and reports progress on standard error. Throws
+/// std::exception or std::string, also when the daemon, the floor and the horizon write different
+/// rows.
 Results Measure(const Options& options);
 
 } // namespace orva::bench

@@ -11,7 +11,7 @@ using Times = std::vector<double>;
 /// The median; `values` is not empty.
 inline double Median(Times values) {
   const std::size_t middle = values.size() / 2;
-  std::sort(values.begin(), values.end());
+  std::ranges::sort(values);
   return values.size() % 2 == 1 ? values[middle] : (values[middle - 1] + values[middle]) / 2;
 }
 

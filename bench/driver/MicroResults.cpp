@@ -11,8 +11,8 @@ std::vector<MicroResult> ReadMicroResults(const std::string& path) {
   const std::string theirs = "/theirs_median";
   std::map<std::string, MicroResult> byName;
   std::ifstream file(path);
-  // "name",iterations,real_time,cpu_time,...: what the bench's own thread needs, however busy the
-  // machine is.
+  // "name",iterations,real_time,cpu_time,...: the processor time does not depend on the machine's
+  // load.
   for (std::string line; std::getline(file, line);) {
     std::istringstream fields(line);
     std::string name;

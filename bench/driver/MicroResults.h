@@ -7,8 +7,8 @@
 
 namespace orva::bench {
 
-/// Reads what the micro-benchmarks wrote as CSV: the medians of the benchmarks "WHAT/ours" and
-/// "WHAT/theirs". Without the file there are none.
+/// Reads the CSV output of the micro-benchmarks: the medians of the benchmarks "WHAT/ours" and
+/// "WHAT/theirs". Returns none when there is no file.
 std::vector<MicroResult> ReadMicroResults(const std::string& path);
 
 } // namespace orva::bench

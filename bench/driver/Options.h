@@ -1,7 +1,7 @@
 #pragma once
 
 #include <chrono>
-#include <stdexcept>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -12,15 +12,13 @@ struct Options {
   std::vector<long long> sizes{10'000, 100'000, 1'000'000}; ///< files of a catalog, ascending
   std::vector<std::string> shapes{"unique", "camera", "flat", "deep", "restamped", "folders"};
   int pairs = 5;
-  std::chrono::seconds limit{120};  ///< after which a merge is given up
-  std::chrono::seconds budget{120}; ///< after which one measurement makes no further pairs
+  std::chrono::seconds limit{120};  ///< a merge that takes longer is given up
+  std::chrono::seconds budget{120}; ///< after this time a measurement makes no further pairs
   std::string output = "build/bench";
-  bool help = false;
 };
 
-extern const char* const HELP;
-
-/// Throws std::invalid_argument with a message for the user.
-Options ParseOptions(const std::vector<std::string>& arguments);
+/// Reads the arguments that follow the program's name. Returns nothing when they ask for help or
+/// the version, which are then on standard output. Throws commandline::UsageError.
+std::optional<Options> ParseOptions(const std::vector<std::string>& arguments);
 
 } // namespace orva::bench

@@ -37,7 +37,7 @@ double RunProcess(const std::vector<std::string>& command, const std::string& ou
   waitpid(pid, &status, 0);
   const std::chrono::duration<double> elapsed = std::chrono::steady_clock::now() - begin;
   if (!WIFEXITED(status) || WEXITSTATUS(status) != 0) {
-    throw std::runtime_error(command.front() + " has failed");
+    throw std::runtime_error(command.front() + " failed");
   }
   return elapsed.count();
 }

@@ -5,8 +5,8 @@
 
 namespace orva::bench {
 
-/// Runs a program to its end, its standard output in the file `output`. Returns the seconds from
-/// before its start to after its end. Throws std::runtime_error unless it ends with status 0.
+/// Runs a program to its end, with its standard output in the file `output`. Returns the seconds
+/// from its start to its end. Throws std::runtime_error unless it exits with status 0.
 double RunProcess(const std::vector<std::string>& command, const std::string& output);
 
 } // namespace orva::bench

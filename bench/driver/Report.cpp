@@ -22,7 +22,7 @@ constexpr double FIXED_BYTES = 96 * MEBIBYTE;
 
 using Bound = Figure::Bound;
 
-/// Median of the ratios pair by pair.
+/// Median of the ratios of the pairs.
 std::optional<double> Ratio(const Times& over, const Times& under) {
   Times ratios;
   for (std::size_t i = 0; i < std::min(over.size(), under.size()); ++i) {
@@ -37,24 +37,22 @@ std::optional<double> MedianOf(const Times& times) {
 
 const Measurement* Find(const Results& results, const std::string& what, const std::string& shape,
                         long long files) {
-  for (const Measurement& measurement : results.measurements) {
-    if (measurement.what == what && measurement.shape == shape && measurement.files == files) {
-      return &measurement;
-    }
-  }
-  return nullptr;
+  const auto found = std::ranges::find_if(results.measurements, [&](const Measurement& measured) {
+    return measured.what == what && measured.shape == shape && measured.files == files;
+  });
+  return found == results.measurements.end() ? nullptr : &*found;
 }
 
-/// `figure` with its bound where that is `held`, else for the report only.
-Figure Bounded(Figure figure, bool held, Bound bound, double target) {
-  if (held) {
+/// `figure`, with the bound if it `applies`.
+Figure Bounded(Figure figure, bool applies, Bound bound, double target) {
+  if (applies) {
     figure.bound = bound;
     figure.target = target;
   }
   return figure;
 }
 
-/// The figures that one measurement gives by itself.
+/// Adds the figures of a single measurement.
 void AddFigures(std::vector<Figure>& figures, const Measurement& measured) {
   const auto figure = [&measured](std::string what, std::optional<double> value) {
     return Figure{.what = std::move(what),
@@ -90,7 +88,7 @@ void AddFigures(std::vector<Figure>& figures, const Measurement& measured) {
   }
 }
 
-/// How much longer the daemon takes for ten times the files.
+/// Adds how many times longer the daemon takes for ten times the files.
 void AddGrowth(std::vector<Figure>& figures, const Results& results, const Measurement& large) {
   const Measurement* const small = Find(results, large.what, large.shape, large.files / 10);
   if (small == nullptr || (large.what != FIRST_MERGE && large.what != DELETE_ALL)) {
@@ -157,7 +155,7 @@ std::string CountText(long long count) {
   return count == 0 ? "" : std::to_string(count);
 }
 
-/// What the machine says of its processor.
+/// The model of the machine's processor.
 std::string Processor() {
   std::ifstream file("/proc/cpuinfo");
   for (std::string line; std::getline(file, line);) {
@@ -247,7 +245,7 @@ void WriteList(std::ostream& out, const std::string& name, const std::vector<Ite
   out << "\n  ]";
 }
 
-/// A row of the table; the text columns to the left, the numbers to the right.
+/// A row of the table: text is aligned left, numbers are aligned right.
 template <typename... Cells>
 void WriteRow(std::ostream& out, int width, const std::string& what, const std::string& shape,
               const std::string& files, const Cells&... cells) {
@@ -275,8 +273,8 @@ std::vector<Figure> ComputeFigures(const Results& results) {
   for (const MicroResult& micro : results.micro) {
     AddMicro(figures, micro);
   }
-  std::stable_sort(figures.begin(), figures.end(), [](const Figure& a, const Figure& b) {
-    return std::pair(a.bound == Bound::None, a.what) < std::pair(b.bound == Bound::None, b.what);
+  std::ranges::stable_sort(figures, {}, [](const Figure& figure) {
+    return std::pair(figure.bound == Bound::None, figure.what);
   });
   return figures;
 }
@@ -291,10 +289,10 @@ void WriteTable(std::ostream& out, const std::vector<Figure>& figures, const Res
              figure.value ? Number(*figure.value) : "gave up", TargetText(figure), Verdict(figure),
              CountText(static_cast<long long>(figure.pairs)));
   }
-  out << "\nMedians in seconds, without the start of the process that floor, horizon and shell need.\n"
-         "Beside an unchanged merge and a batch stands, under FLOOR, the shell with the reader's "
-         "statements.\nNo further pairs are made after two minutes; more than 100000 files are "
-         "deleted once.\n\n";
+  out << "\nMedians in seconds. The time to start a process is subtracted from floor, horizon and\n"
+         "shell. For an unchanged merge and a batch, FLOOR is the shell with the reader's\n"
+         "statements. A measurement makes no further pairs after two minutes. The deletion of\n"
+         "more than 100000 files is measured once.\n\n";
   WriteRow(out, TIME_WIDTH, "WHAT", "SHAPE", "FILES", "DAEMON", "FLOOR", "HORIZON", "PAIRS");
   for (const Measurement& measured : results.measurements) {
     if (measured.what != PEAK_MEMORY) {

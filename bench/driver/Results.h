@@ -7,16 +7,16 @@
 
 namespace orva::bench {
 
-/// One thing measured on one catalog: values of the daemon and of what it is measured against,
-/// pair by pair. Seconds, but bytes for the memory.
+/// One quantity measured on one catalog: pairs of values, of the daemon and of what it is compared
+/// with. In seconds; memory in bytes.
 struct Measurement {
   std::string what; ///< one of the names below
   std::string shape;
   long long files = 0;
   Times daemon{};
-  Times floor{};       ///< or the shell with the reader's statements; empty where there is nothing
-  Times horizon{};     ///< empty where there is nothing
-  bool gaveUp = false; ///< the daemon has not come to an end within the limit
+  Times floor{};       ///< or the shell with the reader's statements; empty if not compared
+  Times horizon{};     ///< empty if not compared
+  bool gaveUp = false; ///< the daemon did not finish within the limit
 };
 
 inline const std::string FIRST_MERGE = "first merge";

@@ -19,15 +19,15 @@ const std::string SCHEMA = "bench/schema.sql";
 const std::string HORIZON_SCRIPT = "bench/horizon/merge.sql";
 const std::string READER_SCRIPT = "/tmp/reader.sql";
 
-/// Where the floor's lines go: a file in memory, as the daemon's.
+/// The floor's output: a file in memory, as the daemon's.
 const std::string LINES = "/tmp/floor.out";
 const std::string NOWHERE = "/dev/null";
 
-/// What `command` takes beyond `start`, which starts the same program for nothing.
+/// The time of `command` less that of `start`, which starts the same program and does no work.
 double Beyond(const std::vector<std::string>& start, const std::vector<std::string>& command,
               const std::string& output) {
   constexpr int STARTS = 5;
-  /// What is so short as this cannot be told from the start.
+  /// A shorter time cannot be distinguished from the start.
   constexpr double SHORTEST = 0.0001;
   Times starts;
   for (int i = 0; i < STARTS; ++i) {
@@ -36,7 +36,7 @@ double Beyond(const std::vector<std::string>& start, const std::vector<std::stri
   return std::max(RunProcess(command, output) - Median(starts), SHORTEST);
 }
 
-/// A value for the shell's parameters, as SQL.
+/// The shell's command that sets a parameter to `value`, an SQL expression.
 std::string Parameter(const std::string& name, const std::string& value) {
   return ".parameter set " + name + " " + value;
 }

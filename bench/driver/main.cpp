@@ -1,10 +1,12 @@
-// Measures the daemon beside what SQLite needs for the same work. Runs in a private root, started
-// by scripts/bench in the checkout.
+// Compares the daemon with what SQLite needs for the same work. scripts/bench starts it in a
+// private root, in the checkout.
 
 #include "Measurements.h"
 #include "MicroResults.h"
 #include "Options.h"
 #include "Report.h"
+
+#include "commandline/UsageError.h"
 
 #include <exception>
 #include <fstream>
@@ -32,14 +34,11 @@ void Run(const Options& options) {
 
 int main(int argc, char** argv) {
   try {
-    const Options options = ParseOptions(std::vector<std::string>(argv + 1, argv + argc));
-    if (options.help) {
-      std::cout << HELP;
-    } else {
-      Run(options);
+    if (const auto options = ParseOptions({argv + 1, argv + argc})) {
+      Run(*options);
     }
     return 0;
-  } catch (const std::invalid_argument& error) {
+  } catch (const orva::commandline::UsageError& error) {
     std::cerr << "bench: " << error.what() << "\nTry 'bench --help'.\n";
     return 2;
   } catch (const std::exception& error) {

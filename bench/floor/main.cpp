@@ -1,7 +1,7 @@
-// The floor: the least that a merge file by file can cost. A bare loop on SQLite's own interface
-// with the reader's statements, one sort, one INSERT kept for all files with their folder's id
-// remembered, and two written lines per file; it asks for nothing that is there already, so that it
-// only works on a new database.
+// The floor: the least work that a merge of single files can do. A loop on SQLite's C interface
+// runs the reader's statements, sorts the rows, inserts every file with one prepared statement, and
+// writes two lines per file. It keeps the id of the current folder. It does not look for existing
+// rows, so it works on a new database only.
 
 #include "ReaderStatements.h"
 
@@ -63,7 +63,7 @@ bool Step(const Statement& statement) {
   return code == SQLITE_ROW;
 }
 
-/// Runs a statement that is used again.
+/// Runs a statement and resets it for the next run.
 void Run(const Statement& statement) {
   Step(statement);
   sqlite3_reset(statement.get());
@@ -74,7 +74,7 @@ std::string Text(const Statement& row, int column) {
   return {text, static_cast<std::size_t>(sqlite3_column_bytes(row.get(), column))};
 }
 
-/// The text is there until the statement runs.
+/// `text` must live until the statement has run.
 void Bind(const Statement& statement, int index, const std::string& text) {
   Check(sqlite3_bind_text(statement.get(), index, text.data(), static_cast<int>(text.size()),
                           SQLITE_STATIC));
@@ -100,8 +100,7 @@ struct File {
 
 template <typename Item>
 void SortByPath(std::vector<Item>& items) {
-  std::sort(items.begin(), items.end(),
-            [](const Item& a, const Item& b) { return a.path < b.path; });
+  std::ranges::sort(items, {}, &Item::path);
 }
 
 std::vector<Folder> ReadFolders(const Database& catalog, const std::string& volume) {
@@ -133,7 +132,7 @@ sqlite3_int64 Count(const Statement& query) {
 
 using FolderIds = std::unordered_map<std::string, sqlite3_int64>;
 
-/// The path up to the last separator before `end`, that one included.
+/// The path up to and including the last separator before `end`.
 std::string Parent(const std::string& path, std::size_t end) {
   return path.substr(0, path.rfind('/', end) + 1);
 }
@@ -235,7 +234,7 @@ void Merge(const char* schema, const char* catalogPath, const char* mergedPath,
 
 int main(int argc, char** argv) {
   if (argc == 1) {
-    return 0; // what starting a process costs
+    return 0; // measures the start of the process
   }
   if (argc != 5) {
     std::cerr << "usage: floor SCHEMA CATALOG NEW-DATABASE MOUNT-POINT/\n";

@@ -1,8 +1,8 @@
--- The horizon: a whole catalog into a new merged database, as fast as SQLite moves rows from one
--- file into another. For the sqlite3 shell, started in the checkout with the new file as its
--- database and the parameters :catalog (path) and :volume (mount point with its separator).
--- The catalogs of the benchmark hold nothing that a merge leaves out but what the statement on
--- Files selects by itself.
+-- The horizon: merges a whole catalog into a new database as fast as SQLite copies rows from one file
+-- into another. For the sqlite3 shell, started in the checkout with the new file as its database and
+-- the parameters :catalog (path) and :volume (mount point with a trailing separator).
+-- The catalogs of the benchmark have no rows that a merge leaves out, except those that these
+-- statements leave out.
 PRAGMA cache_size = -65536;
 ATTACH :catalog AS catalog;
 BEGIN IMMEDIATE;

@@ -1,5 +1,5 @@
-// Notifications from one connection, handled in the scanned state, beside what Xerces needs to
-// parse the same documents with one kept parser, with the same lines to the log.
+// Compares handling notifications from one connection in the scanned state with parsing the same
+// documents by one Xerces parser, which is reused. Both write the same lines to the log.
 
 #include "Messages.h"
 #include "SocketPair.h"
@@ -8,6 +8,8 @@
 #include "NotificationListener.h"
 #include "State.h"
 #include "StateMachine.h"
+
+#include "orvautil/FileDescriptor.h"
 
 #include <benchmark/benchmark.h>
 
@@ -23,15 +25,16 @@
 #include <array>
 #include <memory>
 #include <string>
+#include <system_error>
 #include <thread>
 
 namespace orva::bench {
 namespace {
 
-/// Notifications handed over at once; they fit into the socket's buffer.
+/// Notifications sent at once; they fit into the socket's buffer.
 constexpr int MESSAGES = 500;
 
-/// The system log of the private root, which takes everything and keeps nothing.
+/// The system log of the private root. Reads and discards every message.
 class Drain {
 public:
   Drain() : socket_(socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0)) {
@@ -39,29 +42,28 @@ public:
     address.sun_family = AF_UNIX;
     std::string("/dev/log").copy(address.sun_path, sizeof address.sun_path - 1);
     unlink("/dev/log");
-    if (bind(socket_, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
+    if (bind(socket_.Get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
       throw std::system_error(errno, std::generic_category(), "/dev/log");
     }
     reader_ = std::jthread([this] {
       std::array<char, 4096> line;
-      while (recv(socket_, line.data(), line.size(), 0) > 0) {
+      while (recv(socket_.Get(), line.data(), line.size(), 0) > 0) {
       }
     });
   }
   Drain(const Drain&) = delete;
   Drain& operator=(const Drain&) = delete;
   ~Drain() {
-    shutdown(socket_, SHUT_RDWR);
-    reader_.join();
-    close(socket_);
+    shutdown(socket_.Get(),
+             SHUT_RDWR); // ends the reader, which is joined before the socket is closed
   }
 
 private:
-  int socket_; ///< owned
+  util::FileDescriptor socket_;
   std::jthread reader_;
 };
 
-/// A connection with `bytes` on their way, behind which it ends.
+/// A connection on which `bytes` were sent before it was closed.
 class Sent {
 public:
   explicit Sent(const std::string& bytes) {
@@ -77,7 +79,7 @@ private:
   test::SocketPair connection_;
 };
 
-/// The daemon's insides in the scanned state, and a log.
+/// The daemon's listener and state machine in the scanned state, and a system log.
 struct Scanned {
   Drain log;
   test::Volume master{"Master", "150g"};

@@ -1,5 +1,5 @@
-// A statement by the database layer, which compiles a text once, and by SQLite's own interface,
-// compiled each time it is used.
+// Compares a statement of the database layer, which compiles a text once, with one of SQLite's C
+// interface, compiled for each use.
 
 #include "orvadb/DB.h"
 #include "orvadb/Statement.h"
@@ -22,13 +22,13 @@ const char* const ROW = "INSERT INTO Folders(parent_folder_id, name, modified_da
 const char* const QUERY = "select * FROM Folders where name = ?";
 const std::string PATH = "/shares/A/Pictures/";
 
-/// A database in a file of its own, /tmp being in memory.
+/// A database in a file in /tmp, which is in memory.
 class OneFolder : public db::DB {
 public:
   OneFolder() {
     Open("/tmp/micro.db");
     for (const char* const sql : {"DROP TABLE IF EXISTS Folders", TABLE, INDEX, ROW}) {
-      db::Statement(*this, sql, __FILE__, __LINE__).Execute(__FILE__, __LINE__);
+      db::Statement(*this, sql).Execute();
     }
   }
 
@@ -38,9 +38,9 @@ public:
 void KeptStatement(benchmark::State& state) {
   const OneFolder database;
   while (state.KeepRunning()) {
-    db::Statement query(database, QUERY, __FILE__, __LINE__);
-    query.BindText(1, PATH, __FILE__, __LINE__);
-    if (!query.Fetch(__FILE__, __LINE__)) {
+    db::Statement query(database, QUERY);
+    query.BindText(1, PATH);
+    if (!query.Fetch()) {
       state.SkipWithError("no row");
     }
     benchmark::DoNotOptimize(query.GetInt64(0));

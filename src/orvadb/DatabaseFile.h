@@ -2,7 +2,7 @@
 
 #include <string>
 
-// The files of a database as files: the one at its path and those that SQLite keeps beside it.
+// The files of a database: the one at its path and those that SQLite keeps next to it.
 // Any thread. Failures are thrown as std::string.
 
 namespace orva::db {

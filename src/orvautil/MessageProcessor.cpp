@@ -137,9 +137,10 @@ void MessageProcessor::ReadMessages(Stream& stream) {
     Bytes rest(buffer); // after the last delimiter
     Bytes unsearched = rest.subspan(searched);
     for (;;) {
-      const auto found = std::ranges::search(unsearched, delimiter);
-      const bool ended = !found.empty();
-      const Bytes message(rest.begin(), found.begin());
+      const auto end =
+          std::search(unsearched.begin(), unsearched.end(), delimiter.begin(), delimiter.end());
+      const bool ended = end != unsearched.end();
+      const Bytes message(rest.begin(), end);
       // The last bytes may still turn out to begin a delimiter and then belong to no message.
       if (!skipping &&
           message.size() > MAXIMUM_MESSAGE_LENGTH + (ended ? 0 : delimiter.size() - 1)) {
@@ -154,7 +155,7 @@ void MessageProcessor::ReadMessages(Stream& stream) {
         ProcessMessage(stream, message);
       }
       skipping = false;
-      rest = unsearched = Bytes(found.end(), rest.end());
+      rest = unsearched = rest.subspan(message.size() + delimiter.size());
     }
 
     const std::size_t unfinished = std::min(unsearched.size(), delimiter.size() - 1);

@@ -24,12 +24,11 @@ using db::Statement;
 constexpr int ROOT_FOLDER_CATEGORY = 4;
 constexpr long long TRANSCODED = 3;
 
-/// What a list has room for from the beginning: nobody knows how long it gets before it is read.
+/// Items that a list has room for at first: its length is not known before it is read.
 constexpr std::size_t EXPECTED_ITEMS = 4096;
 
-/// The memory that the list read from a catalog may take: in a catalog that was crafted, a few
-/// pages may make up any number of rows. Made behind the first read of a transaction, when the
-/// catalog no longer grows under it.
+/// The memory that a list may take: in a crafted catalog a few pages may produce any number of
+/// rows. Made after the first read of a transaction, which no longer sees the catalog grow.
 class ListMemory {
 public:
   explicit ListMemory(const db::VolumeDB& catalog)
@@ -45,7 +44,7 @@ public:
   }
 
 private:
-  // The smallest row takes half of it.
+  // Twice what the smallest row takes in memory for each of its bytes in the file.
   static constexpr long long PER_BYTE = 20;
   static constexpr long long LEAST = 1 << 20;
 
@@ -53,7 +52,7 @@ private:
   long long left_;
 };
 
-/// The row that stands for the volume itself, which has none in its catalog.
+/// The row for the volume itself, which is not in its catalog.
 std::unique_ptr<db::Folder> RootFolder(const std::string& volumeMountPoint) {
   auto folder = std::make_unique<db::Folder>();
   folder->path = volumeMountPoint;
@@ -62,7 +61,7 @@ std::unique_ptr<db::Folder> RootFolder(const std::string& volumeMountPoint) {
   return folder;
 }
 
-/// Reads the columns that folders and files have in common. Their times are 32-bit integers to
+/// Reads the columns that folders and files have in common. Their times are 32-bit integers for
 /// every program of the appliance.
 template <typename Item>
 std::unique_ptr<Item> ReadItem(const Statement& row, const std::string& base) {
@@ -92,7 +91,7 @@ util::OwnerVector<db::Folder> ReadFolders(const std::string& volumeMountPoint,
   folders.reserve(EXPECTED_ITEMS);
   folders.push_back(RootFolder(volumeMountPoint));
 
-  // The unary plus here and below keeps SQLite from an index on a flag.
+  // The unary plus here and below keeps SQLite from using an index on a flag.
   const std::string base = util::Path(volumeMountPoint).Basic();
   Statement query(catalog,
                   "SELECT * FROM Folders where +isSystem = 0 AND +isBackup = 0 AND +isHidden = 0");
@@ -100,7 +99,7 @@ util::OwnerVector<db::Folder> ReadFolders(const std::string& volumeMountPoint,
     folders.push_back(ReadItem<db::Folder>(query, base));
     memory.Take(*folders.back(), sizeof(db::Folder));
   }
-  std::sort(folders.begin(), folders.end(), FolderItemCmp<db::FolderItem>());
+  std::ranges::sort(folders, FolderItemCmp<db::FolderItem>());
   return folders;
 }
 
@@ -126,7 +125,7 @@ util::OwnerVector<db::File> ReadChangedFiles(const std::string& volumeMountPoint
     memory.Take(*file, sizeof(db::File) + file->ext.size());
     files.push_back(std::move(file));
   }
-  std::sort(files.begin(), files.end(), FolderItemCmp<db::FolderItem>());
+  std::ranges::sort(files, FolderItemCmp<db::FolderItem>());
   return files;
 }
 

@@ -19,10 +19,10 @@ struct PhotoCounts {
   int total = 0;
 };
 
-// The three reads of a merge. Each takes the volume's mount point and its open catalog, makes
-// full paths from the catalog's relative ones, and leaves the catalog as it is. A list is sorted
-// by full path (FolderItemCmp). A step that fails ends a list; the transaction that the reads
-// stand in says so when it is committed. Throws std::string.
+// The three reads of a merge. Each takes the volume's mount point and its open catalog, and does
+// not change the catalog. Lists have full paths, made from the catalog's relative ones, and are
+// sorted by them (FolderItemCmp). A failed step ends a list early; committing the transaction of
+// the reads then fails. Throws std::string.
 
 /// The visible folders, deleted ones included, and a first one for the volume's root, whose path
 /// is the mount point as given.

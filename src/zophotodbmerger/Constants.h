@@ -6,8 +6,7 @@
 
 namespace orva::dbmerger {
 
-// Each source that includes this has copies of its own, which are therefore there for the static
-// initialisers behind the include.
+// Each source that includes this has its own copies, so that its static initialisers may use them.
 
 /// The locator file, which tells other programs where the merged database is, and its key.
 const std::string ZOPHOTODBMERGER_CONFIG_FILE_NAME = "/tmp/zophotodbmerger.conf";

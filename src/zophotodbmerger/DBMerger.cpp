@@ -94,7 +94,7 @@ std::time_t ApplyFiles(const PhotoDB& photos, const std::string& volume,
   return newest;
 }
 
-/// What a merge has to remember of a catalog.
+/// What a merge stores about a catalog that it has applied.
 struct Applied {
   std::time_t newest = 0; ///< time of the newest file applied
   PhotoCounts counts;
@@ -103,8 +103,8 @@ struct Applied {
 /// Reads what has changed in the catalog after `since` and applies it, folders before files.
 Applied ApplyCatalog(const PhotoDB& photos, const db::VolumeDB& catalog, const std::string& volume,
                      std::time_t since, const std::atomic<bool>& stopRequested) {
-  // One view of the catalog for all three reads, let go before the writing begins, so that the
-  // indexer is not kept waiting.
+  // One view of the catalog for all three reads. It ends before the writing begins, so that the
+  // indexer does not have to wait.
   db::Transaction snapshot(catalog, CATALOG_BUSY_TIMEOUT);
 
   thread_timer timer;

@@ -14,28 +14,27 @@ namespace orva::dbmerger {
 /// registered volumes. The owner sets `stopRequested` and waits before destroying it.
 class DBMerger final : public util::Thread {
 public:
-  /// Starts the thread, and returns when that has taken its copy of the registry. Throws what
-  /// Create throws.
+  /// Starts the thread, and returns when the thread has copied the registry. Throws what Create
+  /// throws.
   DBMerger();
 
   /// Logs the mount points that are registered when the merger is made.
   void Run() override;
 
-  // Of the operations' arguments the first is the mount point of the master, the second that of
-  // the volume. They throw what PhotoDB throws.
+  // These throw what PhotoDB throws.
 
   /// Merges what has changed in the volume's catalog since its last merge, in one transaction. A
   /// failure of the database layer is logged and leaves the merged database as it was.
   void MergeDB(const std::string& masterMountPoint, const std::string& volumeMountPoint);
 
-  /// Removes the volume's rows and merges its whole catalog anew.
+  /// Removes the volume's rows and merges its whole catalog.
   void ReMergeDB(const std::string& masterMountPoint, const std::string& volumeMountPoint);
 
   /// Removes the volume's rows.
   void RemoveVolume(const std::string& masterMountPoint, const std::string& volumeMountPoint);
 
-  /// Ends Run and the walks of MergeDB early, once and for all; any thread. A merge cut short
-  /// still commits: files that it has not reached may have to wait for a ReMergeDB.
+  /// Makes Run and MergeDB end early from now on; set by any thread. A merge that ends early still
+  /// commits: files that it has not reached may be missing until a ReMergeDB.
   std::atomic<bool> stopRequested{false};
 
 private:

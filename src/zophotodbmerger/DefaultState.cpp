@@ -29,7 +29,7 @@ void DefaultState::handleVolumeScanned(VolumeInfo volume) {
   DefaultState::handlePictureTranscoded(std::move(volume));
 }
 
-// The volume of the event is not merged: its next batch or purge is.
+// The volume of the event is merged only after its next batch or purge.
 void DefaultState::handlePictureTranscoded(VolumeInfo /*volume*/) {
   if (!VolumeInfoManager::Instance().reelectMasterVolume()) {
     syslog(LOG_LOCAL1 | LOG_INFO, "Staying in the Default state ");

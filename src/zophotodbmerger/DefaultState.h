@@ -4,7 +4,7 @@
 
 namespace orva::dbmerger {
 
-/// There is no master volume; the events that can bring one are watched.
+/// There is no master volume; plugged, scanned and transcoded events start an election.
 class DefaultState : public State {
 public:
   void handleVolumePlugged(VolumeInfo volume) override;

@@ -11,8 +11,8 @@ void MasterVolumePluggedState::handleVolumePlugged(VolumeInfo /*volume*/) {
   syslog(LOG_LOCAL1 | LOG_INFO, "MasterVolumePluggedState:: VolumePlugged, ignoring! ");
 }
 
-// Nothing was merged in this state, so there is nothing to remove. Also when another volume than
-// the master went away, the state moves on without waiting for a scan.
+// Nothing has been merged in this state, so there is nothing to remove. The state moves on without
+// waiting for a scan, also when the volume was not the master.
 void MasterVolumePluggedState::handleVolumeUnplugged(VolumeInfo /*volume*/) {
   syslog(LOG_LOCAL1 | LOG_INFO, "MasterVolumePluggedState:: Volumeunplugged ");
   if (VolumeInfoManager::Instance().reelectMasterVolume()) {
@@ -46,7 +46,7 @@ void MasterVolumePluggedState::handlePictureTranscoded(VolumeInfo /*volume*/) {
 }
 
 void MasterVolumePluggedState::handleVolumePurged(VolumeInfo /*volume*/) {
-  // The wording, known to log readers, denies the master that this state has.
+  // There is a master in this state. Log readers rely on the text, which says otherwise.
   syslog(LOG_LOCAL1 | LOG_INFO,
          "MasterVolumePluggedState:: We do not have a Master Volume, so volume purged - ignored ");
 }

@@ -4,8 +4,8 @@
 
 namespace orva::dbmerger {
 
-/// A master volume has been elected, but no merged database was opened on it yet: its scan, or a
-/// batch of pictures, is awaited.
+/// A master volume has been elected, but no merged database has been opened on it yet: that waits
+/// for a scan or a batch of pictures.
 class MasterVolumePluggedState : public State {
 public:
   void handleVolumePlugged(VolumeInfo volume) override;

@@ -28,14 +28,14 @@ void MasterVolumeScannedState::handleVolumePlugged(VolumeInfo /*volume*/) {
 void MasterVolumeScannedState::handleVolumeUnplugged(VolumeInfo volume) {
   syslog(LOG_LOCAL1 | LOG_INFO, "MasterVolumeScannedState:: Volumeunplugged ");
   VolumeInfoManager& registry = VolumeInfoManager::Instance();
-  // When the master itself is gone this is the empty record, and the rows are removed from a
-  // database that no volume holds.
+  // When the master itself was unplugged, the registry has the empty record: the rows are then
+  // removed from a database that is on no volume.
   owned.merger.RemoveVolume(registry.getMasterVolume().mountPoint, volume.mountPoint);
   owned.merger.stopRequested = true;
 
   if (registry.reelectMasterVolume()) {
     syslog(LOG_LOCAL1 | LOG_INFO, "Moving to the scanned state since we can safely do so ");
-    // The blank at the end tells this line from those of the other states.
+    // The blank at the end distinguishes this line from those of the other states.
     syslog(LOG_LOCAL1 | LOG_INFO, "We now have a master volume %s ",
            registry.getMasterVolume().ToString().c_str());
     StateMachine::Instance().setCurrentState(
@@ -47,7 +47,7 @@ void MasterVolumeScannedState::handleVolumeUnplugged(VolumeInfo volume) {
   StateMachine::Instance().fallBackToDefaultState();
 }
 
-// A scan by itself brings nothing: the volume is merged when its pictures are transcoded.
+// A scan changes nothing: the volume is merged when its pictures are transcoded.
 void MasterVolumeScannedState::handleVolumeScanned(VolumeInfo /*volume*/) {}
 
 void MasterVolumeScannedState::handlePictureTranscoded(VolumeInfo volume) {

@@ -21,7 +21,8 @@ public:
   int getStateType() override;
 
 private:
-  /// A merger that is stopped and joined with its owner, also with one whose constructor throws.
+  /// Stops and joins its merger when it is destroyed, also after the state's constructor has
+  /// thrown.
   struct JoinedMerger {
     DBMerger merger;
     JoinedMerger() = default;

@@ -35,15 +35,15 @@ public:
 
 using Handler = void (State::*)(VolumeInfo);
 
-/// Fills in the size of a plugged volume; one that cannot be asked keeps the values that no
-/// election accepts.
+/// Fills in the size of a plugged volume. When the file system does not tell, the record keeps the
+/// default size, which no election accepts.
 void MeasureVolume(VolumeInfo& volume) {
   struct statvfs status {};
   if (statvfs(volume.mountPoint.c_str(), &status) != 0) {
     return;
   }
   volume.capacity = static_cast<double>(std::uint64_t{status.f_blocks} * status.f_frsize);
-  // The free blocks are counted in the other block size; elections have always been held so.
+  // The free blocks are multiplied by the other block size: kept for compatibility.
   volume.used =
       volume.capacity - static_cast<double>(std::uint64_t{status.f_bfree} * status.f_bsize);
   syslog(LOG_LOCAL1 | LOG_INFO,
@@ -51,7 +51,7 @@ void MeasureVolume(VolumeInfo& volume) {
          volume.capacity, volume.used, volume.mountPoint.c_str());
 }
 
-/// The text of the last "profile" child of a batch; empty when there is none.
+/// The text of a batch's last "profile" child; empty when there is none.
 std::string LastProfile(const xercesc::DOMNode& root) {
   std::string profile;
   for (const xercesc::DOMNode* child = root.getFirstChild(); child != nullptr;
@@ -63,7 +63,7 @@ std::string LastProfile(const xercesc::DOMNode& root) {
   return profile;
 }
 
-/// Whether a batch is one of the profile that counts.
+/// Whether a batch is of the accepted profile, which is then logged.
 bool IsAcceptedBatch(const xercesc::DOMNode& root) {
   const std::string profile = LastProfile(root);
   if (profile != TRANSCODING_PROFILE) {
@@ -73,7 +73,7 @@ bool IsAcceptedBatch(const xercesc::DOMNode& root) {
   return true;
 }
 
-/// The handler for the kind of event, which is logged; null when there is nothing to handle.
+/// Logs the kind of event and returns its handler; null when there is nothing to handle.
 Handler SelectHandler(const std::string& name, const xercesc::DOMNode& root, VolumeInfo& volume) {
   if (name == "Plugged") {
     MeasureVolume(volume);
@@ -134,7 +134,7 @@ void Parsenotification(const xercesc::DOMNode& root) {
 void NotificationListener::Run() {
   const XMLPlatform platform;
   while (!stop) {
-    // The log's readers know these three lines by this name and these numbers.
+    // Log readers rely on the name and the number in each of these three lines.
     syslog(LOG_INFO, "%s:%d: Creating the notification socket %s",
            "src/zophotodbmerger/NotificationListener", 130, core::ORVA_NOTIFICATION_SOCKET.c_str());
     util::ClientSocket socket(util::Socket::Address(core::ORVA_NOTIFICATION_SOCKET), false);

@@ -15,7 +15,7 @@ public:
   /// service cannot be reached.
   void Run() override;
 
-  /// Whether the message names a notification at all.
+  /// Whether the message contains the name of a notification's element.
   bool IsValidMessage(const std::string& message) const override;
 
   /// Turns a notification into an event for the current state; any other document is logged.

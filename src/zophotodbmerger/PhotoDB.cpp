@@ -28,7 +28,8 @@ namespace {
 using db::Statement;
 
 constexpr unsigned DIRECTORY_PERMISSIONS = 0775;
-/// The programs that read the database are other users, and SQLite's readers write beside it.
+/// Programs that read the database run as other users, and SQLite makes files in the directory for
+/// readers, too.
 constexpr mode_t EVERYBODY = 0777;
 
 /// Stored in a new database's status row: a fixed placeholder, not the clock.
@@ -36,7 +37,7 @@ constexpr std::time_t NEW_DATABASE_TIME = 1000;
 
 constexpr long long NO_FOLDER = -1;
 
-/// Whether there is anything at `path`; a link is something, wherever it leads.
+/// Whether anything exists at `path`, links not followed.
 bool IsPresent(const std::string& path) {
   struct stat status {};
   return lstat(path.c_str(), &status) == 0;
@@ -47,7 +48,7 @@ bool IsDirectory(const std::string& path) {
   return lstat(path.c_str(), &status) == 0 && S_ISDIR(status.st_mode);
 }
 
-/// chmod that does not follow a link which has replaced the directory.
+/// chmod that does not follow a link in the directory's place.
 bool ChangeDirectoryMode(const std::string& path, mode_t mode) {
   return fchmodat(AT_FDCWD, path.c_str(), mode, AT_SYMLINK_NOFOLLOW) == 0;
 }
@@ -72,7 +73,7 @@ std::string FolderName(const std::string& path) {
   return path.substr(begin, end - begin);
 }
 
-// Times are 32-bit integers to every reader of the merged database.
+// Times are 32-bit integers for every reader of the merged database.
 
 std::unique_ptr<Folder> ReadFolder(const Statement& row) {
   auto folder = std::make_unique<Folder>();
@@ -101,7 +102,7 @@ bool IsSuccess(int code) {
   return code == 0 || code == Statement::ROW || code == Statement::DONE;
 }
 
-/// Appends `record` to a list of the caller, who owns it from then on.
+/// Appends `record` to a list of the caller, which then owns it.
 template <typename Record>
 void HandOver(std::unique_ptr<Record> record, std::vector<Record*>& records) {
   records.push_back(record.get());
@@ -187,8 +188,8 @@ void PhotoDB::CreateTables() {
             "NULL, volume TEXT NOT NULL)")
       .Execute();
 
-  // The root folder, below which every volume hangs. It gets id 1 because the table is new;
-  // DeleteVolumes counts on that.
+  // The root folder, the parent of every volume. It gets id 1 because the table is new;
+  // DeleteVolumes relies on that.
   Statement insertRoot(
       *this,
       "INSERT INTO Folders(parent_folder_id, name, modified_date, volume) VALUES(?, ?, ?, ?)");
@@ -218,7 +219,7 @@ void PhotoDB::CreateIndices() {
 
 void PhotoDB::Clear() {
   const std::string path = FilePath();
-  // Closed first: a file that SQLite has open is not taken away under it.
+  // SQLite must not have the file open when it is removed.
   Close();
   unlink(path.c_str());
   Open(path);
@@ -234,14 +235,14 @@ std::unique_ptr<Folder> PhotoDB::GetFolder(long long folderId) const {
 
 std::unique_ptr<Folder> PhotoDB::GetFolder(const std::string& name,
                                            const std::string& volume) const {
-  // The unary plus keeps SQLite from an index on the volume.
+  // The unary plus keeps SQLite from using an index on the volume.
   Statement query(*this, "SELECT * FROM Folders WHERE name = ? AND +volume = ?");
   query.BindText(1, name);
   query.BindText(2, volume);
   return query.Fetch() ? ReadFolder(query) : nullptr;
 }
 
-void PhotoDB::MergeCache::Forget() {
+void PhotoDB::MergeCache::Invalidate() {
   firstOwnFolder = NONE;
   folderId = NONE;
   names.reset();
@@ -253,7 +254,7 @@ void PhotoDB::MergeCache::EnterFolder(long long id, std::string_view path,
   folderPath = path;
   folderVolume = volume;
   folderCost = 0;
-  triedCost = 0;
+  costAtLastLoad = 0;
   names.reset();
 }
 
@@ -301,14 +302,14 @@ void PhotoDB::AddFolder(std::string volume, db::Folder& folder) const {
 
   MergeCache& cache = Cache();
   if (cache.transaction != 0 && cache.firstOwnFolder == MergeCache::NONE) {
-    // Ids only grow, so this one and all that follow are ours.
+    // Ids only grow, so every folder from this id on is inserted by this object.
     cache.firstOwnFolder = LastInsertId();
     cache.greatestPath.clear();
   }
 }
 
 void PhotoDB::DeleteVolumes() const {
-  Cache().Forget();
+  Cache().Invalidate();
   for (const char* const sql : {"DELETE FROM Folders WHERE folder_id != 1", "DELETE FROM Files ",
                                 "DELETE FROM Statistics", "VACUUM"}) {
     Statement(*this, sql).Execute();
@@ -316,10 +317,10 @@ void PhotoDB::DeleteVolumes() const {
 }
 
 void PhotoDB::DeleteVolume(const std::string& volume) const {
-  Cache().Forget();
-  // Nothing holds these together, so their order does: whatever stops between them leaves no file
-  // without a folder, which would never be found again, and a volume whose next merge begins anew
-  // and restores what is gone.
+  Cache().Invalidate();
+  // There is no transaction, so the order matters. After a crash between two of them no file has
+  // lost its folder, without which it would never be found again, and the volume's next merge
+  // starts from the beginning and restores what was removed.
   for (const char* const sql :
        {"UPDATE Statistics SET last_updated_time = 0 WHERE volume = ?",
         "DELETE FROM Files WHERE volume = ?", "DELETE FROM Folders WHERE volume = ?"}) {
@@ -353,29 +354,29 @@ bool PhotoDB::IsFilePresent(const std::string& volume, const db::File& file,
     present = query.Fetch();
     cost = query.TakeCost();
   }
-  LearnNames(volume, cost);
+  LoadNames(volume, cost);
   return present;
 }
 
 // SQLite looks for a file by its name alone, through all folders that have one of that name. Where
-// that is dear, knowing all the names of a folder is cheaper, unless the folder is large.
-void PhotoDB::LearnNames(const std::string& volume, int cost) const {
-  constexpr int dearCost = 40;
-  constexpr long long enoughCost = 4'000;
+// that is expensive, loading all names of a folder is cheaper, unless the folder is large.
+void PhotoDB::LoadNames(const std::string& volume, int cost) const {
+  constexpr int expensiveSearch = 40;
+  constexpr long long leastFolderCost = 4'000;
   constexpr int costPerName = 8;
-  constexpr std::size_t fewNames = 2'000;
+  constexpr std::size_t leastNames = 2'000;
   constexpr std::size_t mostNames = 200'000;
   constexpr std::size_t mostBytes = 64 << 20;
 
   MergeCache& cache = Cache();
   cache.folderCost += cost;
-  if (cacheUse_ == CacheUse::Bypass || cache.transaction == 0 || cost < dearCost ||
-      cache.folderCost < std::max(enoughCost, cache.triedCost * 2)) {
+  if (cacheUse_ == CacheUse::Bypass || cache.transaction == 0 || cost < expensiveSearch ||
+      cache.folderCost < std::max(leastFolderCost, cache.costAtLastLoad * 2)) {
     return;
   }
-  cache.triedCost = cache.folderCost;
+  cache.costAtLastLoad = cache.folderCost;
   const auto limit =
-      std::clamp(static_cast<std::size_t>(cache.folderCost / costPerName), fewNames, mostNames);
+      std::clamp(static_cast<std::size_t>(cache.folderCost / costPerName), leastNames, mostNames);
   MergeCache::Names names;
   std::size_t bytes = 0;
   Statement query(*this, "SELECT * FROM Files WHERE folder_id = ? ");
@@ -395,8 +396,8 @@ void PhotoDB::LearnNames(const std::string& volume, int cost) const {
 void PhotoDB::AddFile(const std::string& volume, db::File& file) const {
   const std::string_view folderPath = FolderPath(file.path);
   MergeCache& cache = Cache();
-  const bool asksAll = cacheUse_ == CacheUse::Bypass || cache.transaction == 0;
-  if (asksAll || cache.folderId == MergeCache::NONE || cache.folderPath != folderPath ||
+  const bool bypassed = cacheUse_ == CacheUse::Bypass || cache.transaction == 0;
+  if (bypassed || cache.folderId == MergeCache::NONE || cache.folderPath != folderPath ||
       cache.folderVolume != volume) {
     const long long found = FindFolder(folderPath, volume);
     if (found == NO_FOLDER) {
@@ -406,12 +407,12 @@ void PhotoDB::AddFile(const std::string& volume, db::File& file) const {
   }
   const long long folderId = cache.folderId;
 
-  // In a folder of our own there are only files that we added. When they came in the order of
-  // their paths, and are named as these say, a file that comes behind them all is new.
+  // A folder that this object inserted holds only files that it has added. When all of them are
+  // named as their paths say, a file whose path sorts after every path so far is new.
   const bool isNamedByPath = std::string_view(file.path).substr(folderPath.size()) == file.name;
   const bool isNew =
       folderId >= cache.firstOwnFolder && isNamedByPath && file.path > cache.greatestPath;
-  if ((asksAll || !isNew) && IsFilePresent(volume, file, folderPath)) {
+  if ((bypassed || !isNew) && IsFilePresent(volume, file, folderPath)) {
     return;
   }
 
@@ -421,7 +422,7 @@ void PhotoDB::AddFile(const std::string& volume, db::File& file) const {
   insert.BindTextView(2, file.name);
   insert.BindTime(3, file.lastModifiedDate);
   insert.BindTextView(4, volume);
-  // To readers a photo was created when it was last modified.
+  // For readers a photo was created when it was last modified.
   insert.BindTime(5, file.lastModifiedDate);
   insert.Execute();
 
@@ -429,7 +430,7 @@ void PhotoDB::AddFile(const std::string& volume, db::File& file) const {
     cache.names->insert(file.name);
   }
   if (!isNamedByPath) {
-    cache.Forget();
+    cache.Invalidate();
   } else if (file.path > cache.greatestPath) {
     cache.greatestPath = file.path;
   }
@@ -437,7 +438,7 @@ void PhotoDB::AddFile(const std::string& volume, db::File& file) const {
 
 void PhotoDB::DeleteFolder(const std::string& volume, db::Folder& folder) const {
   writeLine({"Deleting ", folder.path});
-  Cache().Forget();
+  Cache().Invalidate();
   const long long folderId = FindFolder(folder.path, volume);
   if (folderId != NO_FOLDER) {
     writeLine({"Found folder ", std::to_string(folderId), " for ", folder.path});
@@ -452,7 +453,7 @@ void PhotoDB::DeleteFolder(const std::string& volume, db::Folder& folder) const 
 
 void PhotoDB::DeleteFile(const std::string& /*volume*/, db::File& file) const {
   writeLine({"Deleting ", file.path});
-  Cache().Forget();
+  Cache().Invalidate();
   const long long folderId = FindFolder(FolderPath(file.path));
   if (folderId != NO_FOLDER) {
     writeLine({"Found parent folder ", std::to_string(folderId), " for ", file.path});
@@ -468,8 +469,8 @@ void PhotoDB::DeleteFile(const std::string& /*volume*/, db::File& file) const {
   IndexForRemovals(cost);
 }
 
-// SQLite removes a file by walking its folder. An index by folder and name pays for itself when
-// such walks have cost as much as it does.
+// SQLite removes a file by searching its whole folder. Once such searches have cost as much as an
+// index by folder and name, the index is made.
 void PhotoDB::IndexForRemovals(int cost) const {
   constexpr long long negligibleCost = 100'000;
   constexpr long long indexCostPerFile = 10;
@@ -517,7 +518,7 @@ std::unique_ptr<Statistics> PhotoDB::GetStatistics(std::string volume) const {
   }
   auto statistics = std::make_unique<Statistics>();
   statistics->volume = query.GetText(1);
-  // Counts are 32-bit integers to readers, although they are stored whole.
+  // Counts are 32-bit integers for readers, although all 64 bits are stored.
   statistics->photos_xcoded = query.GetInt(2);
   statistics->photos_total = query.GetInt(3);
   statistics->last_updated_time = query.GetTime(4);

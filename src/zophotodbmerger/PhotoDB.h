@@ -25,10 +25,10 @@ struct Folder;
 struct Statistics;
 
 /// The merged photo database: one SQLite file with the folders and photo files of all volumes.
-/// Made on the stack for one piece of work: construct, Init, operate, let go. One thread.
+/// Made on the stack for one piece of work: construct, Init, operate, destroy. One thread.
 ///
 /// Failures of the database layer pass through as std::string. Operations that change several
-/// rows are no transactions; who wants them whole begins one. The volume of an operation is the
+/// rows are not atomic, except in a transaction of the caller. The volume of an operation is the
 /// mount point of the volume that the row came from.
 class PhotoDB : public db::DB {
 public:
@@ -42,18 +42,19 @@ public:
     std::string message_;
   };
 
-  /// Whether a statement whose answer is known is asked all the same: for tests, which compare.
+  /// Bypass is for tests, which compare the results with and without the cache.
   enum class CacheUse { Normal, Bypass };
 
   /// Makes sure that the directory for the database exists at `location`; opens nothing. Throws
-  /// Error when there can be none, and util::Exception when a new one cannot be made accessible
-  /// to everybody.
+  /// Error when something else is in its place, and util::Exception when a new one cannot be made
+  /// accessible to everybody.
   explicit PhotoDB(const std::string& location, CacheUse cacheUse = CacheUse::Normal);
 
   /// Opens the database; creates it when there is none, else loads `status` from it.
   void Init();
 
-  /// Create the schema, with the status row and the root folder, in the open database. Init's.
+  /// Create the schema, with the status row and the root folder, in the open database. Called by
+  /// Init.
   void CreateTables();
   void CreateIndices();
 
@@ -117,15 +118,15 @@ public:
   void UpdateStatus() const;
 
 private:
-  /// What this object knows of the content in the running transaction, in which nobody else
-  /// writes. Every removal makes it forget.
+  /// What is known about the content in the running transaction, during which no other connection
+  /// writes. Every removal invalidates it.
   struct MergeCache {
     static constexpr long long NONE = std::numeric_limits<long long>::max();
 
-    unsigned long long transaction = 0; ///< the one that all this is about
+    unsigned long long transaction = 0; ///< the one that the cache is valid for
 
-    /// Folders with this id and above were inserted by this object since it last forgot, and hold
-    /// only files that it has added since.
+    /// Folders with this id and above were inserted by this object since the cache was last
+    /// invalidated, and hold only files that it has added since.
     long long firstOwnFolder = NONE;
     /// The greatest path of those files.
     std::string greatestPath;
@@ -135,20 +136,22 @@ private:
     std::string folderVolume;
     long long folderId = NONE;
 
-    /// What looking for files in it has cost, and had when its names were last wanted.
+    /// Cost of the searches for files in that folder, in all and up to the last attempt to load
+    /// its names.
     long long folderCost = 0;
-    long long triedCost = 0;
-    /// The names of all its files, once they are cache.
+    long long costAtLastLoad = 0;
+    /// The names of all its files, once they are loaded.
     using Names = std::unordered_set<std::string>;
     std::optional<Names> names;
 
-    /// What removing files has cost, and what an index for that would; 0 when not known yet.
+    /// Cost of the removals of files, and of making an index for them; 0 when not known yet.
     long long removalCost = 0;
     long long indexCost = 0;
     bool indexed = false;
 
-    /// Something was removed: only what it has cost stays cache.
-    void Forget();
+    /// Drops what is known about folders and files; the costs stay.
+    void Invalidate();
+    /// Makes this the folder of the last file added.
     void EnterFolder(long long id, std::string_view path, const std::string& volume);
   };
 
@@ -158,19 +161,19 @@ private:
   long long FindFolder(std::string_view path, const std::string& volume) const;
   bool IsFilePresent(const std::string& volume, const db::File& file,
                      std::string_view folderPath) const;
-  void LearnNames(const std::string& volume, int cost) const;
+  void LoadNames(const std::string& volume, int cost) const;
   void IndexForRemovals(int cost) const;
   MergeCache& Cache() const;
 
   std::string dbLocation; ///< the directory of the database file
 
 public:
-  /// Memory copy of the status row; who changes the content sets `mdate` before UpdateStatus.
+  /// The status row in memory. Set `mdate` before UpdateStatus when the content has changed.
   Status status;
 
 private:
   CacheUse cacheUse_;
-  mutable MergeCache cache_; ///< changes no answer, only what is asked for it
+  mutable MergeCache cache_; ///< changes no result, only the statements executed for it
 };
 
 } // namespace orva::dbmerger

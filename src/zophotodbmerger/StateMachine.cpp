@@ -16,7 +16,7 @@ namespace orva::dbmerger {
 
 namespace {
 
-/// Makes the shares root the place of the merged database for as long as there is no master.
+/// Prepares the merged database at the shares root, where it is while there is no master.
 void PrepareSharesRoot() {
   PhotoDB photos(SHARES_ROOT);
   photos.Init();
@@ -35,8 +35,8 @@ void PrepareSharesRoot() {
   VolumeInfoManager::Instance().addVolumeInfo(root);
 }
 
-/// One line about a state of the given type; `texts` is by type, and an unknown type has none.
-/// The address tells the objects of a type apart.
+/// Writes the text for the state's type and the state's address, which distinguishes states of one
+/// type. An unknown type has no line.
 void WriteStateLine(const std::vector<const char*>& texts, State& state) {
   const auto type = static_cast<std::size_t>(state.getStateType());
   if (type < texts.size()) {
@@ -69,7 +69,7 @@ void StateMachine::setCurrentState(State* newState) {
     WriteStateLine({"Deleting the default state ", "Deleting the plugged state ",
                     "Deleting the scanned state "},
                    *previousState);
-    // The vector lets an exception of the destructor pass, which std::unique_ptr would not.
+    // An exception of the destructor leaves the vector; std::unique_ptr would end the process.
     util::OwnerVector<State> finished;
     finished.push_back(std::move(previousState));
   }

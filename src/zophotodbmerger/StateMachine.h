@@ -16,9 +16,8 @@ public:
   /// The process's machine, made by the first call, which throws what the constructor throws.
   static StateMachine& Instance();
 
-  /// Starts in DefaultState, with nothing from an earlier run: empties the merged database at the
-  /// shares root, points the locator file there and registers the root as a volume. Throws what
-  /// PhotoDB throws.
+  /// Starts in DefaultState: empties the merged database at the shares root, points the locator
+  /// file there and registers the root as a volume. Throws what PhotoDB throws.
   StateMachine();
   StateMachine(const StateMachine&) = delete;
   StateMachine& operator=(const StateMachine&) = delete;
@@ -31,13 +30,13 @@ public:
   /// Never null; owned by the machine.
   State* getCurrentState() const noexcept { return currentState.get(); }
 
-  // The moves that several states make.
+  // Transitions that several states make.
 
   /// Logs the master that was elected and goes to a new MasterVolumeScannedState.
   void moveToScannedState();
 
-  /// There is no master left: prepares the shares root as at the start, and goes to a new
-  /// DefaultState.
+  /// Prepares the shares root as the constructor does and goes to a new DefaultState, because there
+  /// is no master left.
   void fallBackToDefaultState();
 
 private:

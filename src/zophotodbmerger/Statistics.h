@@ -6,7 +6,7 @@
 
 namespace orva::dbmerger {
 
-/// What the merged database keeps about one volume beside its content.
+/// What the merged database stores about one volume in addition to its folders and files.
 struct Statistics {
   std::string volume;                ///< its mount point
   std::int64_t photos_xcoded = 0;    ///< photos with a finished rendition

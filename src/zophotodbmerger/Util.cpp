@@ -2,6 +2,8 @@
 
 #include "Util.h"
 
+#include "orvautil/FileDescriptor.h"
+
 #include <fcntl.h>
 #include <poll.h>
 #include <sys/socket.h>
@@ -17,7 +19,7 @@ namespace {
 /// Milliseconds that a reader of standard output may pause before it loses lines.
 constexpr int STALLED_READER_TIMEOUT = 1000;
 
-/// Writes all of `text` in as few writes as the descriptor takes; a failure drops the rest.
+/// Writes all of `text`, with one write where possible. A failure drops the rest.
 void WriteAll(int descriptor, std::string_view text) {
   while (!text.empty()) {
     const ssize_t count = write(descriptor, text.data(), text.size());
@@ -38,30 +40,7 @@ bool IsWritable(int descriptor, int timeout) {
   return result == 1;
 }
 
-/// Writes to a pipe or a terminal through a description of our own: not to wait is a property of
-/// the description, and standard output's is shared with other processes. Where it cannot be had
-/// the reader is waited for.
-class NonBlockingOutput {
-public:
-  NonBlockingOutput() = default;
-  NonBlockingOutput(const NonBlockingOutput&) = delete;
-  NonBlockingOutput& operator=(const NonBlockingOutput&) = delete;
-  ~NonBlockingOutput() {
-    if (descriptor_ != -1) {
-      close(descriptor_);
-    }
-  }
-
-  ssize_t Write(std::string_view text) const {
-    return write(descriptor_ != -1 ? descriptor_ : STDOUT_FILENO, text.data(), text.size());
-  }
-
-private:
-  int descriptor_ =
-      open("/proc/self/fd/1", O_WRONLY | O_APPEND | O_NONBLOCK | O_NOCTTY | O_CLOEXEC);
-};
-
-/// Writes `text` by `writeSome`, which does not wait. A reader that pauses for too long loses the
+/// Writes `text` by `writeSome`, which does not block. A reader that pauses for too long loses the
 /// rest, and every line after it until it reads again.
 template <typename WriteSome>
 void WriteToReader(std::string_view text, WriteSome writeSome) {
@@ -82,14 +61,18 @@ void WriteToReader(std::string_view text, WriteSome writeSome) {
   }
 }
 
-/// Opens the locator file, making it when there is none; -1 when that cannot be. The directory is
-/// everybody's: what stands at the name may be a trap.
-int OpenLocatorFile() {
+/// Opens the locator file and creates it when there is none. Every user may write to the directory,
+/// so that anything may be at the name.
+util::FileDescriptor OpenLocatorFile() {
   const char* const path = ZOPHOTODBMERGER_CONFIG_FILE_NAME.c_str();
   constexpr int flags = O_WRONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC;
-  // Where files of others are protected, one that could also be made there cannot be opened.
-  const int descriptor = open(path, flags);
-  return descriptor == -1 && errno == ENOENT ? open(path, flags | O_CREAT, 0666) : descriptor;
+  // First without O_CREAT, which systems may refuse for an existing file of another user
+  // (fs.protected_regular).
+  util::FileDescriptor file(open(path, flags));
+  if (!file && errno == ENOENT) {
+    file.Reset(open(path, flags | O_CREAT, 0666));
+  }
+  return file;
 }
 
 } // namespace
@@ -113,28 +96,29 @@ void writeLine(std::initializer_list<std::string_view> pieces) {
       return send(STDOUT_FILENO, text.data(), text.size(), MSG_DONTWAIT | MSG_NOSIGNAL);
     });
   } else {
-    const NonBlockingOutput output;
-    WriteToReader(line, [&](std::string_view text) { return output.Write(text); });
+    // A pipe or terminal is opened again: O_NONBLOCK belongs to the open file description, which
+    // standard output shares with other processes. Where that fails, writing may block.
+    const util::FileDescriptor own(
+        open("/proc/self/fd/1", O_WRONLY | O_APPEND | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
+    const int output = own ? own.Get() : STDOUT_FILENO;
+    WriteToReader(line,
+                  [&](std::string_view text) { return write(output, text.data(), text.size()); });
   }
 }
 
 void updateLocatorFile(const std::string& mountPoint) {
-  const int descriptor = OpenLocatorFile();
-  if (descriptor == -1) {
-    return;
-  }
+  const util::FileDescriptor file = OpenLocatorFile();
   struct stat status {};
-  if (fstat(descriptor, &status) == 0 && S_ISREG(status.st_mode) && status.st_nlink == 1 &&
-      ftruncate(descriptor, 0) == 0) {
+  if (file && fstat(file.Get(), &status) == 0 && S_ISREG(status.st_mode) && status.st_nlink == 1 &&
+      ftruncate(file.Get(), 0) == 0) {
     std::string line = ZOPHOTOS_DB_PATH + "=";
     if (!mountPoint.empty()) {
-      // A mount point that ends in "/" gives two separators in a row; the programs that read the
-      // file expect them.
+      // A mount point that ends in "/" gives two separators in a row. Programs that read the file
+      // rely on them.
       line += mountPoint + "/.zophotos/zophotos.db";
     }
-    WriteAll(descriptor, line + "\n");
+    WriteAll(file.Get(), line + "\n");
   }
-  close(descriptor);
 }
 
 } // namespace orva::dbmerger

@@ -18,13 +18,13 @@ struct VolumeInfo {
   /// The record as text for the log, over several lines.
   std::string ToString() const;
 
-  /// A volume is its mount point, byte for byte; nothing else takes part.
+  /// Volumes are equal when their mount points are, byte for byte.
   friend bool operator==(const VolumeInfo& a, const VolumeInfo& b) {
     return a.mountPoint == b.mountPoint;
   }
 };
 
-/// The order of an election: the larger capacity first.
+/// The order of an election: larger capacities first.
 template <typename Volume>
 struct VolumeInfoComp {
   bool operator()(const Volume& a, const Volume& b) const { return a.capacity > b.capacity; }

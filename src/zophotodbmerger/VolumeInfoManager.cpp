@@ -10,14 +10,14 @@ namespace orva::dbmerger {
 
 namespace {
 
-/// Bytes that a master must have more of to hold the merged database: 200 MiB.
+/// A master must have more free bytes than this, for the merged database: 200 MiB.
 constexpr double MINIMUM_FREE_SPACE = 209715200.0;
 
-/// More than any appliance has. Every spelling of a path is a volume of its own, and nothing but
-/// the service's messages says how many there are.
+/// More than any appliance has. Every spelling of a path is a volume of its own, so that messages
+/// could name any number of volumes.
 constexpr std::size_t MOST_VOLUMES = 1000;
 
-/// Bytes of all mount points together, each of which may be as long as a path. Mergers copy them.
+/// Bytes of all mount points together. Each may be as long as a path, and mergers copy them all.
 constexpr std::size_t MOST_BYTES = 1 << 20;
 
 bool HasRoomFor(const VolumeInfo& added, const std::vector<VolumeInfo>& volumes) {
@@ -45,7 +45,7 @@ void VolumeInfoManager::addVolumeInfo(VolumeInfo& volume) {
            volume.mountPoint.c_str());
     return;
   }
-  if (std::find(volumes.begin(), volumes.end(), volume) != volumes.end()) {
+  if (std::ranges::find(volumes, volume) != volumes.end()) {
     return;
   }
   if (!HasRoomFor(volume, volumes)) {
@@ -60,17 +60,14 @@ void VolumeInfoManager::removeVolumeInfo(VolumeInfo& volume) {
   if (volume == masterVolume) {
     masterVolume = EmptyVolumeInfo;
   }
-  const auto found = std::find(volumes.begin(), volumes.end(), volume);
-  if (found != volumes.end()) {
-    volumes.erase(found);
-  }
+  std::erase(volumes, volume);
 }
 
 bool VolumeInfoManager::reelectMasterVolume() {
   if (masterVolume != EmptyVolumeInfo) {
     return true;
   }
-  std::sort(volumes.begin(), volumes.end(), VolumeInfoComp<VolumeInfo>());
+  std::ranges::sort(volumes, VolumeInfoComp<VolumeInfo>());
   for (const VolumeInfo& volume : volumes) {
     if (volume.capacity - volume.used > MINIMUM_FREE_SPACE && !volume.readOnly) {
       masterVolume = volume;

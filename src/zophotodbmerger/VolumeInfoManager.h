@@ -16,17 +16,17 @@ public:
   /// The process's registry, made by the first call.
   static VolumeInfoManager& Instance();
 
-  /// Registers a copy of `volume` when something exists at its mount point. A record that is
-  /// there already stays as it is, so the first event that names a volume fixes its capacity. More
-  /// than 1000 volumes, or than a mebibyte of mount points, are refused with a line in the log.
+  /// Registers a copy of `volume` when something exists at its mount point. An existing record
+  /// stays as it is, so that the first event that names a volume fixes its capacity. More than 1000
+  /// volumes, or than a mebibyte of mount points, are refused with a line in the log.
   void addVolumeInfo(VolumeInfo& volume);
 
-  /// Forgets `volume`, also as the master.
+  /// Removes `volume`, also as the master.
   void removeVolumeInfo(VolumeInfo& volume);
 
-  /// Keeps the master that there is; otherwise elects the largest writable volume with more than
-  /// 200 MiB free. Sorts the registry by capacity, the larger first. Returns whether there is a
-  /// master now.
+  /// Keeps an existing master; otherwise elects the largest writable volume with more than 200 MiB
+  /// free and sorts the registry by capacity, larger ones first. Returns whether there is a master
+  /// now.
   bool reelectMasterVolume();
 
   const std::vector<VolumeInfo>& getVolumes() const noexcept { return volumes; }

@@ -21,15 +21,15 @@ namespace {
 
 using namespace orva;
 
-/// Where a log file of the daemon's own would be. Nothing writes one.
+/// Path of a log file of the daemon's own, which is not written.
 const std::string ORVA_LOG_FILE = util::MakePath(
     core::GetORVA_HOME({'.', util::Path::GetNativePathSeparator()}), "zodbmerger.log");
 
 /// Deleted at the end of the process, when its thread has ended.
 std::unique_ptr<dbmerger::NotificationListener> notificationListener;
 
-/// Output that nobody reads must not end the daemon, and a socket or a database file must not be
-/// taken for a standard descriptor that was closed when the daemon started.
+/// A closed pipe as standard output must not end the daemon, and no socket or database file may get
+/// the number of a standard descriptor that was closed when the daemon started.
 void SecureStandardDescriptors() {
   std::signal(SIGPIPE, SIG_IGN);
   int descriptor = 0;
@@ -62,7 +62,7 @@ int main() {
     }
     std::exit(EXIT_FAILURE);
   } catch (...) {
-    // Nothing else can be told of: the process ends abnormally, but not with the platform up.
+    // Not a std::exception: terminate the XML platform, then abort.
     xercesc::XMLPlatformUtils::Terminate();
     throw;
   }

@@ -1,7 +1,6 @@
 #pragma once
 
-// What nearly every source of the daemon uses: the constants, of which each source has its own
-// copies, and the system's own headers.
+// What nearly every source of the daemon uses: the constants and common system headers.
 
 #include "Constants.h"
 

@@ -8,6 +8,7 @@
 #include "Appliance.h"
 #include "Expectations.h"
 #include "Messages.h"
+#include "support/Programs.h"
 #include "support/TestScale.h"
 
 #include <gtest/gtest.h>
@@ -26,16 +27,10 @@ namespace {
 namespace fs = std::filesystem;
 using notify::Event;
 
-#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
-constexpr bool SANITIZED = true;
-#else
-constexpr bool SANITIZED = false;
-#endif
-#if defined(__SANITIZE_THREAD__)
-constexpr std::size_t THREADS = 3; ///< one is the sanitizer's
-#else
-constexpr std::size_t THREADS = 2; ///< the main thread and the listener
-#endif
+/// The main thread and the listener; the thread sanitizer has one of its own.
+std::size_t ExpectedThreads() {
+  return ProgramSanitizer() == Sanitizer::Thread ? 3 : 2;
+}
 
 /// The event after which the daemon holds what it will hold.
 constexpr std::size_t SETTLED = 100;
@@ -56,11 +51,11 @@ std::uint64_t Seed() {
 }
 
 std::vector<std::string> DaemonEnvironment() {
-  if (SANITIZED) {
+  if (AreProgramsSanitized()) {
     return {};
   }
   // What a thread keeps for its next allocation counts as in use: it must not keep anything.
-  return {"LD_PRELOAD=" HEAP_PROBE_LIBRARY, "HEAP_PROBE=" + HEAP_FILE,
+  return {"LD_PRELOAD=" + ProgramPath("libheap_probe.so"), "HEAP_PROBE=" + HEAP_FILE,
           "GLIBC_TUNABLES=glibc.malloc.tcache_count=0"};
 }
 
@@ -542,7 +537,7 @@ protected:
   void ExpectTheSame(const Vitals& early, const Vitals& late) {
     EXPECT_EQ(early.descriptors, late.descriptors);
     EXPECT_LE(late.stacks, early.stacks + CACHED_STACKS);
-    if (!SANITIZED) {
+    if (!AreProgramsSanitized()) {
       EXPECT_LE(late.heap, early.heap + HEAP_SLACK);
       EXPECT_LE(late.resident, early.resident + RESIDENT_SLACK);
     }
@@ -562,7 +557,7 @@ protected:
     ReportFigure("endurance: events", std::to_string(events));
     ReportFigure("endurance: merges", std::to_string(merges_));
     tell("open descriptors", early.descriptors.size(), late.descriptors.size());
-    if (!SANITIZED) {
+    if (!AreProgramsSanitized()) {
       tell("bytes of heap in use", early.heap, late.heap);
       tell("KiB of resident memory", early.resident / 1024, late.resident / 1024);
     }
@@ -644,7 +639,7 @@ protected:
     // When it has come to the second, it has waited behind the first.
     appliance_->Barrier();
     appliance_->Barrier();
-    EXPECT_TRUE(AwaitThreads(appliance_->Daemon().Pid(), THREADS));
+    EXPECT_TRUE(AwaitThreads(appliance_->Daemon().Pid(), ExpectedThreads()));
     return VitalsOf(appliance_->Daemon().Pid());
   }
 

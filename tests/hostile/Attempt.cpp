@@ -2,6 +2,8 @@
 
 #include "Deadline.h"
 
+#include "support/Programs.h"
+
 #include "orvautil/FormatString.h"
 
 #include <fcntl.h>
@@ -57,7 +59,8 @@ private:
 
 /// The process, reporting into the writing end of a pipe; its lines go nowhere.
 pid_t Spawn(const std::vector<Operation>& operations, int report) {
-  std::vector<std::string> arguments{ATTEMPT};
+  const std::string program = ProgramPath("hostile_attempt");
+  std::vector<std::string> arguments{program};
   for (const Operation& operation : operations) {
     arguments.insert(arguments.end(), {operation.name, operation.master, operation.volume});
   }
@@ -72,9 +75,9 @@ pid_t Spawn(const std::vector<Operation>& operations, int report) {
   posix_spawn_file_actions_addopen(&actions, STDOUT_FILENO, "/dev/null", O_WRONLY, 0);
   posix_spawn_file_actions_adddup2(&actions, report, STDIN_FILENO);
   pid_t pid = -1;
-  const int code = posix_spawn(&pid, ATTEMPT, &actions, nullptr, pointers.data(), environ);
+  const int code = posix_spawn(&pid, program.c_str(), &actions, nullptr, pointers.data(), environ);
   posix_spawn_file_actions_destroy(&actions);
-  Check(code, ATTEMPT);
+  Check(code, program);
   return pid;
 }
 

@@ -5,6 +5,8 @@
 #include "Tree.h"
 #include "WriteWatch.h"
 
+#include "support/Programs.h"
+
 #include "orvautil/FormatString.h"
 
 #include <filesystem>
@@ -19,14 +21,14 @@ namespace fs = std::filesystem;
 const std::string ERROR_BEGINNING = "Error that we will ignore ";
 const int GOOD_FOLDERS = 3;
 
-#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
-constexpr long long MEMORY_SLACK = 1LL << 30U;
-constexpr long long MEMORY_PER_BYTE = 256;
-#else
-// The merged database's page cache is 64 MiB of it.
-constexpr long long MEMORY_SLACK = 128LL << 20U;
-constexpr long long MEMORY_PER_BYTE = 64;
-#endif
+/// How much more memory than for the good volume an attempt may take for `content` bytes.
+long long MemoryAllowance(long long content) {
+  if (AreProgramsSanitized()) {
+    return (1LL << 30U) + 256 * content;
+  }
+  // The merged database's page cache is 64 MiB of it.
+  return (128LL << 20U) + 64 * content;
+}
 
 bool IsError(const LogLine& line) {
   return line.priority == Error("").priority;
@@ -193,7 +195,7 @@ Attempt HostileTest::RunWatched(const std::vector<Operation>& operations) {
 
 void HostileTest::CheckMemory(const Attempt& attempt) const {
   const long long content = BytesOnMedium(VOLUME) + BytesOnMedium(MASTER);
-  EXPECT_LE(attempt.peakMemory, usualMemory_ + MEMORY_SLACK + MEMORY_PER_BYTE * content)
+  EXPECT_LE(attempt.peakMemory, usualMemory_ + MemoryAllowance(content))
       << content << " bytes are on the volume";
 }
 

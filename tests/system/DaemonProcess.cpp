@@ -1,6 +1,7 @@
 #include "DaemonProcess.h"
 
 #include "Deadline.h"
+#include "support/Programs.h"
 
 #include <fcntl.h>
 #include <poll.h>
@@ -49,9 +50,10 @@ DaemonProcess::DaemonProcess(std::string directory, std::string output,
   for (char** variable = environ; *variable != nullptr; ++variable) {
     variables.emplace_back(*variable);
   }
-  std::vector<std::string> arguments{DAEMON};
+  const std::string daemon = ProgramPath("zophotodbmerger");
+  std::vector<std::string> arguments{daemon};
   if (held) {
-    arguments = {"/bin/sh", "-c", "kill -STOP $$; exec \"$0\"", DAEMON};
+    arguments = {"/bin/sh", "-c", "kill -STOP $$; exec \"$0\"", daemon};
   }
   if (const char* launcher = std::getenv("ORVA_TEST_LAUNCHER")) {
     arguments.insert(arguments.begin(), launcher);
@@ -65,7 +67,7 @@ DaemonProcess::DaemonProcess(std::string directory, std::string output,
   const int code = posix_spawn(&pid_, arguments[0].c_str(), &actions, nullptr,
                                Pointers(arguments).data(), Pointers(variables).data());
   posix_spawn_file_actions_destroy(&actions);
-  Check(code, DAEMON);
+  Check(code, daemon);
   if (held) {
     waitpid(pid_, nullptr, WUNTRACED);
   }

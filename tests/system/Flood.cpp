@@ -1,5 +1,6 @@
 #include "Flood.h"
 
+#include "support/Programs.h"
 #include "support/TestScale.h"
 
 #include <algorithm>
@@ -53,7 +54,7 @@ void Flood::ExpectUnharmed(const std::string& flood) {
 void Flood::ExpectWithinBounds(const std::string& flood) {
   EXPECT_EQ(0, appliance.Service().Received()) << "the daemon has written to its peer";
   const long growth = memory_->Growth();
-  if (!isSanitized) {
+  if (!AreProgramsSanitized()) {
     EXPECT_GE(MOST_GROWTH, growth) << flood;
   }
   ReportFigure("KiB of memory that the daemon grew by at most under " + flood,

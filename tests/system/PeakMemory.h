@@ -24,12 +24,4 @@ private:
 /// KiB that the process `pid` has used at the most. Throws std::runtime_error.
 long PeakOf(pid_t pid);
 
-/// Whether the tests and the daemon are built with a sanitizer, which keeps freed memory.
-constexpr bool isSanitized =
-#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
-    true;
-#else
-    false;
-#endif
-
 } // namespace orva::test

@@ -1,5 +1,6 @@
 #include "Expectations.h"
 #include "Messages.h"
+#include "support/Programs.h"
 
 #include <cstdlib>
 #include <filesystem>
@@ -28,7 +29,7 @@ protected:
 
   static void Index(const Volume& volume) {
     const std::string command =
-        std::string(INDEXER) + " index '" + volume.Path() + "' >/tmp/indexer.out 2>&1";
+        ProgramPath("orva-catalog") + " index '" + volume.Path() + "' >/tmp/indexer.out 2>&1";
     ASSERT_EQ(0, std::system(command.c_str()));
   }
 

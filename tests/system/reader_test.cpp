@@ -4,6 +4,7 @@
 #include "Messages.h"
 #include "Tracer.h"
 
+#include "support/Programs.h"
 #include "support/TestScale.h"
 
 #include <fcntl.h>
@@ -35,16 +36,16 @@ public:
     posix_spawn_file_actions_init(&actions);
     posix_spawn_file_actions_adddup2(&actions, input[0], STDIN_FILENO);
     posix_spawn_file_actions_adddup2(&actions, output[1], STDOUT_FILENO);
-    std::array<std::string, 3> texts{READER, "/shares/A", "/shares/B/"};
+    std::array<std::string, 3> texts{ProgramPath("merged_reader"), "/shares/A", "/shares/B/"};
     std::array<char*, 4> arguments{texts[0].data(), texts[1].data(), texts[2].data(), nullptr};
-    const int code = posix_spawn(&pid_, READER, &actions, nullptr, arguments.data(), environ);
+    const int code = posix_spawn(&pid_, arguments[0], &actions, nullptr, arguments.data(), environ);
     posix_spawn_file_actions_destroy(&actions);
     close(input[0]);
     close(output[1]);
     input_ = input[1];
     output_ = output[0];
     if (code != 0) {
-      throw std::runtime_error(READER);
+      throw std::runtime_error(texts[0]);
     }
   }
   Reader(const Reader&) = delete;

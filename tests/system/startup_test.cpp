@@ -2,6 +2,8 @@
 #include "Expectations.h"
 #include "Messages.h"
 
+#include "support/Programs.h"
+
 #include "orvautil/Core.h"
 
 #include <sys/mount.h>
@@ -41,8 +43,8 @@ protected:
     if (const char* options = std::getenv("ASAN_OPTIONS")) {
       asan += std::string(":") + options;
     }
-    return appliance.Run(
-        {"LD_PRELOAD=" TERMINATE_PROBE_LIBRARY, "TERMINATE_PROBE=/tmp/terminations", asan});
+    return appliance.Run({"LD_PRELOAD=" + ProgramPath("libterminate_probe.so"),
+                          "TERMINATE_PROBE=/tmp/terminations", asan});
   }
 
   static int Terminations() {

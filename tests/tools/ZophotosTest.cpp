@@ -1,12 +1,17 @@
 #include "ZophotosTest.h"
 
+#include "support/Programs.h"
+
 #include <cstdlib>
 #include <filesystem>
+#include <sstream>
 
 namespace orva::test {
 
+namespace fs = std::filesystem;
+
 Arguments ZophotosCommand(Arguments arguments) {
-  arguments.insert(arguments.begin(), ZOPHOTOS);
+  arguments.insert(arguments.begin(), ProgramPath("zophotos"));
   return arguments;
 }
 
@@ -14,8 +19,58 @@ Outcome Zophotos(Arguments arguments, const std::string& output) {
   return Run(ZophotosCommand(std::move(arguments)), output);
 }
 
+Arguments OnCopyArguments(Arguments arguments) {
+  arguments.insert(arguments.begin(), {"--database", COPY});
+  return arguments;
+}
+
+Outcome OnCopy(Arguments arguments) {
+  return Zophotos(OnCopyArguments(std::move(arguments)));
+}
+
+void ExpectOutput(const Outcome& outcome, const std::string& output, int status) {
+  EXPECT_EQ(status, outcome.status);
+  EXPECT_EQ(output, outcome.output);
+  EXPECT_EQ("", outcome.error);
+}
+
+void ExpectError(const Outcome& outcome, int status, const std::string& error) {
+  EXPECT_EQ(status, outcome.status);
+  EXPECT_EQ("", outcome.output);
+  EXPECT_EQ(error, outcome.error);
+}
+
+Lines SplitLines(const std::string& text) {
+  std::istringstream stream(text);
+  Lines lines;
+  for (std::string line; std::getline(stream, line);) {
+    lines.push_back(line);
+  }
+  return lines;
+}
+
+void AddRows(const Database& copy, const std::string& folder, const std::string& file) {
+  copy.Run("INSERT INTO Folders(parent_folder_id, name, modified_date, volume) VALUES(1, " +
+           folder + ", 0, '/shares/A/')");
+  if (!file.empty()) {
+    copy.Run("INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT "
+             "max(folder_id), " +
+             file + ", 5, '/shares/A/', 6 FROM Folders");
+  }
+}
+
+void AddFiles(const Database& copy, int count, const std::string& folderId,
+              const std::string& name) {
+  copy.Run("WITH RECURSIVE n(i) AS (SELECT 1 UNION ALL SELECT i + 1 FROM n WHERE i < " +
+           std::to_string(count) +
+           ") INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT " +
+           folderId + ", " + name + ", 1, '/shares/A/', 1 FROM n");
+}
+
 void ZophotosTest::SetUp() {
   setenv("TZ", "UTC", 1);
+  fs::remove_all(fs::path(COPY).parent_path());
+  fs::create_directory(fs::path(COPY).parent_path());
   onA.AddFolder("Pictures/", 500);
   onA.AddFolder("Pictures/Summer/", 600);
   onA.AddPhoto("top.jpg", 1000, 2000);
@@ -45,14 +100,8 @@ void ZophotosTest::AddUntranscoded(Catalog& catalog, const std::string& path) {
 }
 
 Database ZophotosTest::Copy() {
-  std::filesystem::create_directories(std::filesystem::path(COPY).parent_path());
-  std::filesystem::copy_file(MERGED, COPY, std::filesystem::copy_options::overwrite_existing);
+  fs::copy_file(MERGED, COPY, fs::copy_options::overwrite_existing);
   return Database(COPY);
-}
-
-Outcome ZophotosTest::OnCopy(Arguments arguments, const std::string& output) {
-  arguments.insert(arguments.begin(), {"--database", COPY});
-  return Zophotos(std::move(arguments), output);
 }
 
 } // namespace orva::test

@@ -6,6 +6,8 @@
 #include "Options.h"
 #include "Sql.h"
 
+#include "commandline/UsageError.h"
+
 #include "orvadb/File.h"
 #include "orvadb/Folder.h"
 #include "orvadb/Transaction.h"
@@ -13,8 +15,10 @@
 
 #include "orvautil/Core.h"
 #include "orvautil/Exception.h"
+#include "orvautil/FileDescriptor.h"
 
 #include "support/Program.h"
+#include "support/Programs.h"
 
 #include <gtest/gtest.h>
 
@@ -31,6 +35,7 @@
 #include <limits>
 #include <memory>
 #include <string>
+#include <utility>
 #include <vector>
 
 namespace {
@@ -74,7 +79,7 @@ protected:
     fs::remove_all(base_, ignored);
   }
 
-  /// Writes a file of the volume with its folders, `content` bytes of any kind.
+  /// Writes a file with any bytes to the volume; creates its folders.
   void Write(const std::string& path, const std::string& content = "content") const {
     fs::create_directories((volume_ / path).parent_path());
     std::ofstream(volume_ / path) << content;
@@ -97,7 +102,7 @@ protected:
   Lines Query(const char* sql, int columns = 1) const { return Select(*Open(), sql, columns); }
   long long Number(const char* sql) const { return SelectNumber(*Open(), sql); }
 
-  /// What a merge reads that has seen everything up to `since`: "path|isDeleted|stamp".
+  /// What a merge reads that has read everything up to `since`: "path|isDeleted|stamp".
   Lines ChangedSince(std::time_t since) const {
     const auto database = Open();
     db::Statement statement(
@@ -105,11 +110,10 @@ protected:
         "SELECT f.path, f.isDeleted, t.lastUpdatedDate from Files f, Transcodings t "
         "WHERE f.id = t.sourceId AND t.lastUpdatedDate > ? "
         "AND t.profile = 'cb62bbdd389b48898f2e5244977cb2c5' AND "
-        "((f.isDeleted = 0 and t.status = 1) OR (f.isDeleted = 1 and t.status = 0)) ORDER BY 1",
-        __FILE__, __LINE__);
-    statement.BindTime(1, since, __FILE__, __LINE__);
+        "((f.isDeleted = 0 and t.status = 1) OR (f.isDeleted = 1 and t.status = 0)) ORDER BY 1");
+    statement.BindTime(1, since);
     Lines lines;
-    while (statement.Fetch(__FILE__, __LINE__)) {
+    while (statement.Fetch()) {
       lines.push_back(statement.GetText(0) + '|' + statement.GetText(1) + '|' +
                       statement.GetText(2));
     }
@@ -118,7 +122,7 @@ protected:
 
   /// Runs the program with both outputs in `output`; `arguments` go through the shell.
   static Outcome RunProgram(const std::string& arguments) {
-    return RunShell(std::string(ORVA_CATALOG_PROGRAM) + ' ' + arguments + " 2>&1");
+    return RunShell(test::ProgramPath("orva-catalog") + ' ' + arguments + " 2>&1");
   }
   static Outcome RunShell(const std::string& command) {
     return test::Run({"/bin/sh", "-c", command});
@@ -130,7 +134,7 @@ protected:
 
 // --- Names -------------------------------------------------------------------------------------
 
-TEST(OrvaCatalogNames, PhotosAreRecognisedByExtensionWhateverItsCase) {
+TEST(OrvaCatalogNames, PhotosAreRecognisedByExtensionInAnyCase) {
   for (const char* name : {"a.jpg", "a.JPG", "a.Jpeg", "a.jpeg", "a.png", "a.gif", "a.bmp", "a.tif",
                            "a.TIFF", "a.heic", "a.webp", "a.b.jpg"}) {
     EXPECT_EQ(catalog::CategoryOf(catalog::ExtensionOf(name)), 3) << name;
@@ -140,14 +144,14 @@ TEST(OrvaCatalogNames, PhotosAreRecognisedByExtensionWhateverItsCase) {
   }
 }
 
-TEST(OrvaCatalogNames, OtherKindsHaveCategoriesOfTheirOwn) {
+TEST(OrvaCatalogNames, OtherKindsHaveTheirOwnCategories) {
   EXPECT_EQ(catalog::CategoryOf("mp3"), catalog::MUSIC);
   EXPECT_EQ(catalog::CategoryOf("mov"), catalog::VIDEO);
   EXPECT_EQ(catalog::CategoryOf("txt"), catalog::OTHER);
   EXPECT_EQ(catalog::CategoryOf(""), catalog::OTHER);
 }
 
-TEST(OrvaCatalogNames, ABackupIsWhatItsOriginalWas) {
+TEST(OrvaCatalogNames, ABackupHasTheExtensionOfItsOriginal) {
   EXPECT_EQ(catalog::ExtensionOf("a.JPG~"), "jpg");
   EXPECT_EQ(catalog::ExtensionOf("a.jpg.bak"), "jpg");
   EXPECT_EQ(catalog::ExtensionOf("a.bak"), "");
@@ -169,19 +173,19 @@ TEST(OrvaCatalogNames, FlagsComeFromTheName) {
   EXPECT_EQ(FlagsOf("._a.jpg", {}), (Flags{.isHidden = true, .isSystem = true}));
 }
 
-TEST(OrvaCatalogNames, FlagsOfAFolderCountForWhatIsBelowIt) {
+TEST(OrvaCatalogNames, FlagsOfAFolderAreInheritedBelowIt) {
   const catalog::Flags folder = {.isBackup = true, .isHidden = true, .isSystem = true};
   EXPECT_EQ(catalog::FlagsOf("a.jpg", folder), folder);
 }
 
 // --- Schema ------------------------------------------------------------------------------------
 
-TEST_F(OrvaCatalog, LiesInTheProductsFolderOfTheVolume) {
+TEST_F(OrvaCatalog, IsInTheProductsFolderOfTheVolume) {
   Index();
   EXPECT_TRUE(fs::is_regular_file(volume_ / ".orva" / "orva.db"));
 }
 
-TEST_F(OrvaCatalog, FoldersBeginWithTheColumnsThatReadersTakeByPosition) {
+TEST_F(OrvaCatalog, FoldersBeginsWithTheColumnsThatReadersSelectByPosition) {
   Lines columns = Query("PRAGMA table_info(Folders)", 2);
   columns.resize(12);
   EXPECT_EQ(columns, (Lines{"0|id", "1|folderId", "2|path", "3|name", "4|category",
@@ -204,20 +208,20 @@ TEST_F(OrvaCatalog, ReadersSeeTheLastCompleteStateWhileARunWrites) {
   Write("a.jpg");
   Index();
   const auto writer = Open();
-  db::Transaction writing(*writer, 0, __FILE__, __LINE__);
+  db::Transaction writing(*writer, 0);
   catalog::Execute(*writer, "DELETE FROM Files");
 
   const db::VolumeDB reader(volume_.native(), false);
   {
-    const db::Transaction reading(reader, 0, __FILE__, __LINE__);
+    const db::Transaction reading(reader, 0);
     EXPECT_EQ(SelectNumber(reader, "SELECT count(*) FROM Files"), 1);
-    writing.Commit(__FILE__, __LINE__);
+    writing.Commit();
     EXPECT_EQ(SelectNumber(reader, "SELECT count(*) FROM Files"), 1);
   }
   EXPECT_EQ(SelectNumber(reader, "SELECT count(*) FROM Files"), 0);
 }
 
-TEST_F(OrvaCatalog, LeavesNoLogBehindThatAReadOnlyVolumeWouldNeed) {
+TEST_F(OrvaCatalog, LeavesNoLogThatAReadOnlyVolumeWouldNeed) {
   Write("a.jpg");
   ASSERT_EQ(RunProgram("index " + volume_.native()).status, 0);
   EXPECT_FALSE(fs::exists(volume_ / ".orva" / "orva.db-wal"));
@@ -230,7 +234,7 @@ TEST_F(OrvaCatalog, LeavesNoLogBehindThatAReadOnlyVolumeWouldNeed) {
   EXPECT_EQ(fs::file_size(volume_ / ".orva" / "orva.db-wal"), 0U);
 }
 
-TEST_F(OrvaCatalog, StampsAreTheTimeOfTheRunOrLaterThanAllBefore) {
+TEST_F(OrvaCatalog, StampsAreTheTimeOfTheRunOrLaterThanAllOthers) {
   const auto database = Open();
   EXPECT_EQ(catalog::NextStamp(*database, NOW), NOW);
   for (const char* sql : {"INSERT INTO Transcodings VALUES(1, 1, 'another', 1, 1700000000)",
@@ -324,11 +328,11 @@ TEST_F(OrvaCatalog, EntersFlagsFromNamesAndFromTheFoldersAbove) {
             (Lines{".hidden/Deep/a.jpg|0|1|0", "Old~/b.jpg|1|0|0", "Seen/._f.jpg|0|1|1",
                    "Seen/.d.jpg|0|1|0", "Seen/e.jpg~|1|0|0", "Seen/g.jpg|0|0|0",
                    "lost+found/c.jpg|0|0|1"}));
-  // All of them are photos and rendered; what becomes of them is the reader's decision.
+  // All of them are rendered photos; the reader decides which of them it takes.
   EXPECT_EQ(ChangedSince(0).size(), 7U);
 }
 
-TEST_F(OrvaCatalog, StoresNamesAsTheBytesThatTheyAre) {
+TEST_F(OrvaCatalog, StoresNamesAsBytes) {
   const std::string name = "caf\xe9 '\"\n\xff.jpg";
   Write("Dir\xe9/" + name);
   Index();
@@ -338,7 +342,7 @@ TEST_F(OrvaCatalog, StoresNamesAsTheBytesThatTheyAre) {
   EXPECT_EQ(Index(NOW + 10).added, 0);
 }
 
-TEST_F(OrvaCatalog, StoresTimesBeyond32BitsAsTheyAre) {
+TEST_F(OrvaCatalog, StoresTimesOfMoreThan32Bits) {
   Write("future.jpg");
   SetTime("future.jpg", 5'000'000'000);
   Write("past.jpg");
@@ -456,7 +460,7 @@ TEST_F(OrvaCatalog, AVanishedFolderIsMarkedWithEverythingBelowIt) {
             (Lines{"Pictures/2024/a.jpg|1|1700000010", "Pictures/b.jpg|1|1700000010"}));
 }
 
-TEST_F(OrvaCatalog, AFolderThatComesBackRevivesItsRowAndStampsItsFilesAnew) {
+TEST_F(OrvaCatalog, AFolderThatComesBackRevivesItsRowAndStampsItsFilesAgain) {
   Write("Pictures/a.jpg");
   SetTime("Pictures", NOW - 500);
   Index();
@@ -469,7 +473,7 @@ TEST_F(OrvaCatalog, AFolderThatComesBackRevivesItsRowAndStampsItsFilesAnew) {
   EXPECT_EQ(ChangedSince(NOW + 10), Lines{"Pictures/a.jpg|0|1700000020"});
 }
 
-TEST_F(OrvaCatalog, FilesThatOutlivedTheirFoldersRowAreStampedAnewWithIt) {
+TEST_F(OrvaCatalog, FilesOfAFolderMarkedDeletedAreStampedWhenItComesBack) {
   Write("Pictures/a.jpg");
   Write("Other/b.jpg");
   Index();
@@ -509,19 +513,18 @@ TEST_F(OrvaCatalog, AFileMayBecomeAFolder) {
 
 // --- Index: failures ---------------------------------------------------------------------------
 
-TEST_F(OrvaCatalog, WhatCannotBeReadIsNotTakenForDeleted) {
-  // Too deep to be opened by its path, which holds for the superuser as well.
+TEST_F(OrvaCatalog, UnreadableFoldersAreNotMarkedDeleted) {
+  // The path is too long to be opened, also for the superuser.
   const std::string name(250, 'd');
   std::string path;
-  const int start = open(".", O_PATH | O_DIRECTORY);
+  const util::FileDescriptor start(open(".", O_PATH | O_DIRECTORY | O_CLOEXEC));
   ASSERT_EQ(chdir(volume_.c_str()), 0);
   for (int depth = 0; depth < 17; ++depth) {
     ASSERT_EQ(mkdir(name.c_str(), 0700), 0);
     ASSERT_EQ(chdir(name.c_str()), 0);
     path += name + '/';
   }
-  ASSERT_EQ(fchdir(start), 0);
-  close(start);
+  ASSERT_EQ(fchdir(start.Get()), 0);
 
   const auto database = Open();
   db::File file;
@@ -609,7 +612,7 @@ TEST_F(OrvaCatalog, ADeepTreeIsEightWide) {
   EXPECT_EQ(Number("SELECT max(length(path) - length(replace(path, '/', ''))) FROM Folders"), 3);
 }
 
-TEST_F(OrvaCatalog, AFolderMayHoldThemAll) {
+TEST_F(OrvaCatalog, AFolderMayContainAllFiles) {
   const catalog::GeneratorPlan plan = {.files = 25, .perFolder = 1000};
   EXPECT_EQ(catalog::Generate(*Open(), plan, NOW), 1);
   EXPECT_EQ(Number("SELECT count(*) FROM Files WHERE folderId = 1"), 25);
@@ -629,7 +632,7 @@ TEST_F(OrvaCatalog, GeneratingReplacesTheContentAndIsRepeatable) {
   EXPECT_EQ(Number("SELECT min(lastUpdatedDate) FROM Transcodings"), NOW + 11);
 }
 
-TEST_F(OrvaCatalog, AGeneratedCatalogHasTheIndicesOfAnIndexedOne) {
+TEST_F(OrvaCatalog, AGeneratedCatalogHasTheIndexesOfAnIndexedOne) {
   const char* const schema = "SELECT sql FROM sqlite_schema WHERE sql IS NOT NULL ORDER BY name";
   const auto database = Open();
   const Lines indexed = Select(*database, schema, 1);
@@ -649,47 +652,73 @@ TEST_F(OrvaCatalog, RestampingStampsEveryTranscodingAndNothingElse) {
 // --- Command line ------------------------------------------------------------------------------
 
 TEST(OrvaCatalogOptions, AreRead) {
-  const catalog::Options options =
+  const auto options =
       catalog::ParseOptions({"generate", "/shares/Vol", "--files", "12", "--per-folder", "5",
                              "--names", "camera", "--tree", "deep"});
-  EXPECT_EQ(options.command, catalog::Command::Generate);
-  EXPECT_EQ(options.mountPoint, "/shares/Vol");
-  EXPECT_EQ(options.plan.files, 12);
-  EXPECT_EQ(options.plan.perFolder, 5);
-  EXPECT_EQ(options.plan.names, catalog::Names::Camera);
-  EXPECT_EQ(options.plan.tree, catalog::Tree::Deep);
-  EXPECT_EQ(catalog::ParseOptions({"generate", "/v", "--restamp"}).command,
+  ASSERT_TRUE(options);
+  EXPECT_EQ(options->command, catalog::Command::Generate);
+  EXPECT_EQ(options->mountPoint, "/shares/Vol");
+  EXPECT_EQ(options->plan.files, 12);
+  EXPECT_EQ(options->plan.perFolder, 5);
+  EXPECT_EQ(options->plan.names, catalog::Names::Camera);
+  EXPECT_EQ(options->plan.tree, catalog::Tree::Deep);
+  EXPECT_EQ(catalog::ParseOptions({"index", "/v"})->command, catalog::Command::Index);
+  EXPECT_EQ(catalog::ParseOptions({"generate", "/v", "--restamp"})->command,
             catalog::Command::Restamp);
-  EXPECT_EQ(catalog::ParseOptions({"generate", "/v", "--files", "1", "--restamp"}).command,
+  EXPECT_EQ(catalog::ParseOptions({"generate", "/v", "--files", "1", "--restamp"})->command,
             catalog::Command::Restamp);
+}
+
+TEST(OrvaCatalogOptions, AreDecimalAndTheLastOneCounts) {
+  const auto options =
+      catalog::ParseOptions({"generate", "/v", "--files=7", "--files", "010", "--per-folder",
+                             "1000000000", "--names", "unique", "--tree", "flat"});
+  ASSERT_TRUE(options);
+  EXPECT_EQ(options->plan.files, 10);
+  EXPECT_EQ(options->plan.perFolder, 1'000'000'000);
+  EXPECT_EQ(options->plan.names, catalog::Names::Unique);
+  EXPECT_EQ(options->plan.tree, catalog::Tree::Flat);
 }
 
 TEST(OrvaCatalogOptions, WrongUsageIsRefused) {
-  const std::vector<Lines> wrong = {
-      {},
-      {"scan", "/v"},
-      {"index"},
-      {"index", ""},
-      {"index", "--files"},
-      {"index", "/v", "/w"},
-      {"generate", "/v"},
-      {"generate", "/v", "--files"},
-      {"generate", "/v", "--files", "1", "--per-folder", "1", "--names", "camera"},
-      {"generate", "/v", "--files", "-1", "--restamp"},
-      {"generate", "/v", "--files", "1x", "--restamp"},
-      {"generate", "/v", "--files", "99999999999999999999", "--restamp"},
-      {"generate", "/v", "--per-folder", "0", "--restamp"},
-      {"generate", "/v", "--names", "none", "--restamp"},
-      {"generate", "/v", "--tree", "round", "--restamp"},
-      {"generate", "/v", "--colour", "red", "--restamp"},
-      {"generate", "/v", "stray", "--restamp"}};
-  for (const Lines& arguments : wrong) {
-    EXPECT_THROW(catalog::ParseOptions(arguments), catalog::UsageError)
-        << testing::PrintToString(arguments);
+  const std::vector<std::pair<Lines, std::string>> wrong = {
+      {{}, "A subcommand is required"},
+      {{"scan", "/v"}, "unexpected argument 'scan'"},
+      {{"index"}, "MOUNT is required"},
+      {{"index", ""}, "MOUNT: must not be empty"},
+      {{"index", "--files"}, "MOUNT is required"},
+      {{"index", "/v", "--files"}, "unexpected argument '--files'"},
+      {{"index", "/v", "/w"}, "unexpected argument '/w'"},
+      {{"generate", "/v"}, "--files is required"},
+      {{"generate", "/v", "--files"}, "--files: 1 required NUMBER missing"},
+      {{"generate", "/v", "--files=", "1", "--restamp"}, "--files= has no value"},
+      {{"generate", "/v", "--files", "1", "--per-folder", "1", "--names", "camera"},
+       "--tree is required"},
+      {{"generate", "/v", "--files", "-1", "--restamp"},
+       "--files: takes a number from 0 to 1000000000, not '-1'"},
+      {{"generate", "/v", "--files", "1x", "--restamp"},
+       "--files: takes a number from 0 to 1000000000, not '1x'"},
+      {{"generate", "/v", "--files", "0x10", "--restamp"},
+       "--files: takes a number from 0 to 1000000000, not '0x10'"},
+      {{"generate", "/v", "--files", "99999999999999999999", "--restamp"},
+       "--files: takes a number from 0 to 1000000000, not '99999999999999999999'"},
+      {{"generate", "/v", "--per-folder", "0", "--restamp"},
+       "--per-folder: takes a number from 1 to 1000000000, not '0'"},
+      {{"generate", "/v", "--names", "none", "--restamp"}, "--names: none not in {unique,camera}"},
+      {{"generate", "/v", "--tree", "round", "--restamp"}, "--tree: round not in {flat,deep}"},
+      {{"generate", "/v", "--colour", "red", "--restamp"}, "unexpected argument '--colour'"},
+      {{"generate", "/v", "stray", "--restamp"}, "unexpected argument 'stray'"}};
+  for (const auto& [arguments, message] : wrong) {
+    try {
+      catalog::ParseOptions(arguments);
+      ADD_FAILURE() << testing::PrintToString(arguments) << " accepted instead of: " << message;
+    } catch (const commandline::UsageError& error) {
+      EXPECT_EQ(error.what(), message);
+    }
   }
 }
 
-TEST_F(OrvaCatalog, TheProgramIndexesAndTellsWhatItDid) {
+TEST_F(OrvaCatalog, TheProgramIndexesAndPrintsWhatItChanged) {
   Write("Pictures/a.jpg");
   Write("b.txt");
   const Outcome first = RunProgram("index " + volume_.native());
@@ -702,11 +731,11 @@ TEST_F(OrvaCatalog, TheProgramIndexesAndTellsWhatItDid) {
                                               "0 changed, 1 deleted, 0 revived\n");
 }
 
-TEST_F(OrvaCatalog, ProgressIsShownOnATerminalAndWipedAway) {
+TEST_F(OrvaCatalog, ProgressIsShownOnATerminalAndErased) {
   Write("Pictures/a.jpg");
   const Outcome outcome =
-      RunShell("script --quiet --return --command '" ORVA_CATALOG_PROGRAM " index " +
-               volume_.native() + "' /dev/null");
+      RunShell("script --quiet --return --command '" + test::ProgramPath("orva-catalog") +
+               " index " + volume_.native() + "' /dev/null");
   EXPECT_EQ(outcome.status, 0);
   const std::string progress = "\r\033[K1 folders, 1 files, 1 photos\r\033[K";
   EXPECT_EQ(outcome.output.substr(0, progress.size() + volume_.native().size()),
@@ -723,13 +752,31 @@ TEST_F(OrvaCatalog, TheProgramGeneratesAndRestamps) {
   EXPECT_EQ(stamped.output, volume_.native() + ": stamped 25 transcodings anew\n");
 }
 
-TEST_F(OrvaCatalog, TheProgramsExitStatusTellsUsageFromFailure) {
-  const Outcome help = RunProgram("--help");
-  EXPECT_EQ(help.status, 0);
-  EXPECT_EQ(help.output, catalog::HELP);
+TEST_F(OrvaCatalog, HelpAndVersionGoToStandardOutput) {
+  const auto printed = [](const std::string& arguments) {
+    const Outcome outcome =
+        RunShell(std::string(ORVA_CATALOG_PROGRAM) + ' ' + arguments + " 2>/dev/null");
+    EXPECT_EQ(outcome.status, 0) << arguments;
+    return outcome.output;
+  };
+  const std::string help = printed("--help");
+  for (const char* const part : {"Fills the media catalog", "Usage: orva-catalog", "index",
+                                 "generate", "--help", "--version", "Exit status"}) {
+    EXPECT_NE(help.find(part), std::string::npos) << part;
+  }
+  EXPECT_EQ(printed("-h"), help);
+  const std::string generate = printed("generate --help");
+  for (const char* const part : {"Usage: orva-catalog generate", "MOUNT", "--files", "--per-folder",
+                                 "--names", "--tree", "--restamp"}) {
+    EXPECT_NE(generate.find(part), std::string::npos) << part;
+  }
+  EXPECT_EQ(printed("--version"), "orva-catalog " ORVA_CATALOG_VERSION "\n");
+}
+
+TEST_F(OrvaCatalog, TheExitStatusDistinguishesWrongUsageFromFailure) {
   const Outcome usage = RunProgram("index");
   EXPECT_EQ(usage.status, 2);
-  EXPECT_EQ(usage.output, "orva-catalog: index needs the mount point of a volume\n"
+  EXPECT_EQ(usage.output, "orva-catalog: MOUNT is required\n"
                           "Try 'orva-catalog --help'.\n");
   const Outcome absent = RunProgram("index /absent");
   EXPECT_EQ(absent.status, 1);
@@ -740,7 +787,7 @@ TEST_F(OrvaCatalog, TheProgramsExitStatusTellsUsageFromFailure) {
   EXPECT_FALSE(fs::exists(volume_ / ".orva"));
 }
 
-TEST_F(OrvaCatalog, AFileThatIsNoDatabaseIsAFailure) {
+TEST_F(OrvaCatalog, AFileThatIsNotADatabaseIsAFailure) {
   fs::create_directory(volume_ / ".orva");
   std::ofstream(volume_ / ".orva" / "orva.db") << std::string(4096, 'x');
   const Outcome outcome = RunProgram("index " + volume_.native());
@@ -748,7 +795,7 @@ TEST_F(OrvaCatalog, AFileThatIsNoDatabaseIsAFailure) {
   EXPECT_NE(outcome.output.find("file is not a database"), std::string::npos) << outcome.output;
 }
 
-TEST_F(OrvaCatalog, AHomeThatCannotBeMadeIsAFailure) {
+TEST_F(OrvaCatalog, AHomeThatCannotBeCreatedIsAFailure) {
   std::ofstream(volume_ / ".orva") << "a file";
   const Outcome outcome = RunProgram("index " + volume_.native());
   EXPECT_EQ(outcome.status, 1);

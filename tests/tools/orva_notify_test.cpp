@@ -1,3 +1,4 @@
+#include "commandline/UsageError.h"
 #include "orva-notify/Client.h"
 #include "orva-notify/CommandLine.h"
 #include "orva-notify/Control.h"
@@ -9,6 +10,7 @@
 #include "orvautil/Decodestring.h"
 
 #include "support/Program.h"
+#include "support/Programs.h"
 #include "system/Deadline.h"
 
 #include <gmock/gmock.h>
@@ -46,7 +48,7 @@ using testing::Pair;
 using Arguments = std::vector<std::string>;
 using Clock = std::chrono::steady_clock;
 
-/// Waits for `descriptor` to be readable; false when the deadline has passed.
+/// Waits until `descriptor` is readable. Returns false when the deadline has passed.
 bool IsReadable(int descriptor, Clock::time_point deadline) {
   const auto left = std::chrono::ceil<std::chrono::milliseconds>(deadline - Clock::now());
   pollfd ready{.fd = descriptor, .events = POLLIN, .revents = 0};
@@ -54,14 +56,14 @@ bool IsReadable(int descriptor, Clock::time_point deadline) {
 }
 
 Arguments Notify(Arguments arguments) {
-  arguments.insert(arguments.begin(), ORVA_NOTIFY_PROGRAM);
+  arguments.insert(arguments.begin(), test::ProgramPath("orva-notify"));
   return arguments;
 }
 
-/// What a command came to.
+/// The result of a command.
 struct Outcome {
   int status = 0;
-  std::string line; ///< the first that it printed
+  std::string line; ///< the first line of its output
 };
 
 Outcome RunNotify(const Arguments& arguments, const std::string& input = "/dev/null") {
@@ -70,7 +72,7 @@ Outcome RunNotify(const Arguments& arguments, const std::string& input = "/dev/n
   return {program.WaitForEnd(), line};
 }
 
-/// A client of the service, as the daemon is one.
+/// A client of the service, like the daemon.
 class Listener {
 public:
   Listener() : socket_(util::Socket::Address(ORVA_NOTIFICATION_SOCKET), false) {}
@@ -174,13 +176,13 @@ TEST(Notification, GivesATranscodedBatchItsProfile) {
             "<profile>cb62bbdd389b48898f2e5244977cb2c5</profile></ORVANotification>");
 }
 
-TEST(Notification, EncodesWhatXmlOrTheEncodingCouldMistake) {
+TEST(Notification, EncodesWhatIsSpecialInXmlOrInTheEncoding) {
   EXPECT_EQ(Compose(Event::End, "/shares/a b%41&<\">'+\n\xC3\xA4"),
             "<ORVANotification Name=\"End\" "
             "MountPoint=\"/shares/a%20b%2541%26%3C%22%3E%27%2B%0A%C3%A4\"/>");
 }
 
-TEST(Notification, EveryByteOfAMountPointComesBackDecoded) {
+TEST(Notification, EveryByteOfAMountPointIsDecodedAgain) {
   std::string mountPoint = "/";
   for (int byte = 1; byte < 256; ++byte) {
     mountPoint += static_cast<char>(byte);
@@ -202,53 +204,68 @@ TEST(CommandLine, KnowsEachEvent) {
       {"scanned", Event::Scanned}, {"transcoded", Event::TranscodedBatch},
       {"end", Event::End},         {"purged", Event::Purged}};
   for (const auto& [word, event] : words) {
-    const CommandLine command = ParseCommandLine({"send", word, "/shares/A"});
-    EXPECT_EQ(command.action, CommandLine::Action::Send);
-    EXPECT_EQ(command.event, event) << word;
-    EXPECT_EQ(command.mountPoint, "/shares/A");
+    const auto command = ParseCommandLine({"send", word, "/shares/A"});
+    ASSERT_TRUE(command) << word;
+    EXPECT_EQ(command->action, CommandLine::Action::Send);
+    EXPECT_EQ(command->event, event) << word;
+    EXPECT_EQ(command->mountPoint, "/shares/A");
   }
 }
 
-TEST(CommandLine, TakesOptionsBeforeAndBehindTheOperands) {
-  const CommandLine command =
-      ParseCommandLine({"send", "--clients", "3", "scanned", "", "--wait", "7"});
-  EXPECT_EQ(command.event, Event::Scanned);
-  EXPECT_EQ(command.mountPoint, "");
-  EXPECT_EQ(command.clients, 3U);
-  EXPECT_EQ(command.wait, std::chrono::seconds(7));
+TEST(CommandLine, TakesOptionsBeforeAndAfterTheOperands) {
+  const auto command = ParseCommandLine({"send", "--clients", "3", "scanned", "", "--wait", "7"});
+  ASSERT_TRUE(command);
+  EXPECT_EQ(command->event, Event::Scanned);
+  EXPECT_EQ(command->mountPoint, "");
+  EXPECT_EQ(command->clients, 3U);
+  EXPECT_EQ(command->wait, std::chrono::seconds(7));
 
-  const CommandLine raw = ParseCommandLine({"send", "--raw", "-"});
-  EXPECT_EQ(raw.event, std::nullopt);
-  EXPECT_EQ(raw.rawFile, "-");
-  EXPECT_EQ(raw.wait, std::chrono::seconds(10));
+  const auto raw = ParseCommandLine({"send", "--raw", "-"});
+  ASSERT_TRUE(raw);
+  EXPECT_EQ(raw->event, std::nullopt);
+  EXPECT_EQ(raw->rawFile, "-");
+  EXPECT_EQ(raw->wait, std::chrono::seconds(10));
 
-  EXPECT_TRUE(ParseCommandLine({"serve", "--watch"}).watch);
-  EXPECT_FALSE(ParseCommandLine({"serve"}).watch);
-  EXPECT_EQ(ParseCommandLine({"drop"}).action, CommandLine::Action::Drop);
-  EXPECT_EQ(ParseCommandLine({"send", "--help"}).action, CommandLine::Action::Help);
+  EXPECT_TRUE(ParseCommandLine({"serve", "--watch"})->watch);
+  EXPECT_FALSE(ParseCommandLine({"serve"})->watch);
+  EXPECT_EQ(ParseCommandLine({"serve"})->action, CommandLine::Action::Serve);
+  EXPECT_EQ(ParseCommandLine({"drop"})->action, CommandLine::Action::Drop);
+  EXPECT_EQ(ParseCommandLine({"send", "--help"}), std::nullopt);
+}
+
+TEST(CommandLine, TakesDecimalNumbersAndTheLastOneCounts) {
+  const auto command =
+      ParseCommandLine({"drop", "--clients=1", "--clients=0100000", "--wait", "010"});
+  ASSERT_TRUE(command);
+  EXPECT_EQ(command->clients, 100'000U);
+  EXPECT_EQ(command->wait, std::chrono::seconds(10));
 }
 
 TEST(CommandLine, SaysWhatIsWrong) {
   const std::vector<std::pair<Arguments, std::string>> wrong = {
-      {{}, "missing command"},
-      {{"listen"}, "unknown command 'listen'"},
-      {{"send"}, "send takes an event and a mount point, or --raw FILE"},
-      {{"send", "plugged"}, "send takes an event and a mount point, or --raw FILE"},
-      {{"send", "Plugged", "/shares/A"}, "unknown event 'Plugged'"},
+      {{}, "A subcommand is required"},
+      {{"listen"}, "unexpected argument 'listen'"},
+      {{"send"}, "send: takes an event and a mount point, or --raw FILE"},
+      {{"send", "plugged"}, "send: takes an event and a mount point, or --raw FILE"},
+      {{"send", "Plugged", "/shares/A"}, "EVENT: unknown event 'Plugged'"},
       {{"send", "plugged", "/a", "/b"}, "unexpected argument '/b'"},
-      {{"send", "--raw"}, "missing file after --raw"},
-      {{"send", "--raw", "f", "plugged"}, "unexpected argument 'plugged'"},
-      {{"send", "--watch", "plugged", "/a"}, "unknown option '--watch'"},
-      {{"serve", "--clients", "1"}, "unknown option '--clients'"},
+      {{"send", "--raw"}, "--raw: 1 required FILE missing"},
+      {{"send", "--raw", ""}, "--raw: must not be empty"},
+      {{"send", "--raw=", "f"}, "--raw= has no value"},
+      {{"send", "--raw", "f", "plugged"}, "--raw excludes EVENT"},
+      {{"send", "--watch", "plugged", "/a"}, "unexpected argument '--watch'"},
+      {{"serve", "--clients", "1"}, "unexpected argument '--clients'"},
       {{"serve", "all"}, "unexpected argument 'all'"},
-      {{"drop", "--clients", "2x"}, "--clients takes a number up to 100000, not '2x'"},
-      {{"drop", "--wait", "-1"}, "--wait takes a number up to 100000, not '-1'"},
-      {{"drop", "--wait", "100001"}, "--wait takes a number up to 100000, not '100001'"}};
+      {{"drop", "--clients"}, "--clients: 1 required NUMBER missing"},
+      {{"drop", "--clients", "2x"}, "--clients: takes a number from 0 to 100000, not '2x'"},
+      {{"drop", "--clients", "0x2"}, "--clients: takes a number from 0 to 100000, not '0x2'"},
+      {{"drop", "--wait", "-1"}, "--wait: takes a number from 0 to 100000, not '-1'"},
+      {{"drop", "--wait", "100001"}, "--wait: takes a number from 0 to 100000, not '100001'"}};
   for (const auto& [arguments, message] : wrong) {
     try {
       ParseCommandLine(arguments);
       ADD_FAILURE() << "accepted instead of: " << message;
-    } catch (const UsageError& error) {
+    } catch (const commandline::UsageError& error) {
       EXPECT_EQ(error.what(), message);
     }
   }
@@ -277,7 +294,7 @@ TEST(MountInfo, DecodesTheKernelsEscapes) {
                           Pair("/shares/tail\\04", 32)));
 }
 
-TEST(MountInfo, SeesTheMountOnTopAndNothingHidden) {
+TEST(MountInfo, HoldsTheTopMountAndNoHiddenOnes) {
   EXPECT_THAT(VolumesOf("31 1 0:6 / /shares/A rw - tmpfs x y\n"
                         "32 1 0:7 / /shares rw - tmpfs x y\n"
                         "33 32 0:8 / /shares/B rw - tmpfs x y\n"
@@ -285,19 +302,19 @@ TEST(MountInfo, SeesTheMountOnTopAndNothingHidden) {
               ElementsAre(Pair("/shares/B", 34)));
 }
 
-TEST(MountInfo, PassesOverWhatItCannotRead) {
+TEST(MountInfo, SkipsMalformedLines) {
   EXPECT_THAT(VolumesOf("\nnonsense\n31 1 0:6\n32 1 0:6 / /shares/A rw - tmpfs x y\n"),
               ElementsAre(Pair("/shares/A", 32)));
 }
 
-TEST(MountInfo, AnotherMountAtTheSamePlaceIsUnpluggedAndPlugged) {
+TEST(MountInfo, AnotherMountOnAMountPointIsUnpluggedAndPlugged) {
   const VolumeChanges changes = Compare({{"/shares/A", 1}, {"/shares/B", 2}, {"/shares/C", 3}},
                                         {{"/shares/B", 2}, {"/shares/C", 7}, {"/shares/D", 8}});
   EXPECT_THAT(changes.unplugged, ElementsAre("/shares/A", "/shares/C"));
   EXPECT_THAT(changes.plugged, ElementsAre("/shares/C", "/shares/D"));
 }
 
-TEST_F(OrvaNotify, SendsEachClientWhatItIsHanded) {
+TEST_F(OrvaNotify, SendsEveryMessageToEachClient) {
   Serve();
   Listener one;
   Listener two;
@@ -311,7 +328,7 @@ TEST_F(OrvaNotify, SendsEachClientWhatItIsHanded) {
   }
 }
 
-TEST_F(OrvaNotify, PrintsALineForWhatHappens) {
+TEST_F(OrvaNotify, PrintsALineForEachEvent) {
   Serve();
   Listener client;
   EXPECT_EQ(service_->ReadLine(), "client 1 connected");
@@ -352,16 +369,19 @@ TEST_F(OrvaNotify, SendFailsWhenNoServiceListens) {
                               ": No such file or directory");
 }
 
-TEST_F(OrvaNotify, WrongUsageIsToldFromFailure) {
+TEST_F(OrvaNotify, TheExitStatusDistinguishesWrongUsageFromFailure) {
   const Outcome wrong = RunNotify({"send", "exploded", "/shares/A"});
   EXPECT_EQ(wrong.status, 2);
-  EXPECT_EQ(wrong.line, "orva-notify: unknown event 'exploded'; orva-notify --help says more");
+  EXPECT_EQ(wrong.line, "orva-notify: EVENT: unknown event 'exploded'");
   const Outcome help = RunNotify({"--help"});
   EXPECT_EQ(help.status, 0);
   EXPECT_THAT(help.line, HasSubstr("notification service"));
+  const Outcome version = RunNotify({"--version"});
+  EXPECT_EQ(version.status, 0);
+  EXPECT_EQ(version.line, "orva-notify " ORVA_NOTIFY_VERSION);
 }
 
-TEST_F(OrvaNotify, WaitsForTheClientsItIsToldOf) {
+TEST_F(OrvaNotify, WaitsForTheGivenNumberOfClients) {
   Serve();
   Listener one;
   const Outcome tooFew =
@@ -379,7 +399,7 @@ TEST_F(OrvaNotify, WaitsForTheClientsItIsToldOf) {
   EXPECT_EQ(two.ReadMessage(), Compose(Event::Plugged, "/shares/A"));
 }
 
-TEST_F(OrvaNotify, DropClosesTheClientsAndGoesOnListening) {
+TEST_F(OrvaNotify, DropClosesTheClientsAndTheServiceListensOn) {
   Serve();
   Listener one;
   Listener two;
@@ -405,7 +425,7 @@ TEST_F(OrvaNotify, StopsCleanlyOnBothSignals) {
   }
 }
 
-TEST_F(OrvaNotify, TakesThePlaceOfAServiceThatWasKilled) {
+TEST_F(OrvaNotify, ReplacesTheSocketOfAServiceThatWasKilled) {
   Serve();
   service_->Signal(SIGKILL);
   EXPECT_EQ(service_->WaitForEnd(), 128 + SIGKILL);
@@ -414,7 +434,7 @@ TEST_F(OrvaNotify, TakesThePlaceOfAServiceThatWasKilled) {
   EXPECT_TRUE(Listener().IsConnected());
 }
 
-TEST_F(OrvaNotify, RefusesToServeBesideAnother) {
+TEST_F(OrvaNotify, FailsWhenAnotherServiceListens) {
   Serve();
   const Outcome second = RunNotify({"serve"});
   EXPECT_EQ(second.status, 1);
@@ -423,7 +443,7 @@ TEST_F(OrvaNotify, RefusesToServeBesideAnother) {
   EXPECT_EQ(RunNotify({"send", "end", "/shares/A"}).line, "sent to 1 client");
 }
 
-TEST_F(OrvaNotify, LeavesAFileThatIsNoSocketAlone) {
+TEST_F(OrvaNotify, DoesNotReplaceAFileThatIsNotASocket) {
   std::filesystem::create_directories(
       std::filesystem::path(ORVA_NOTIFICATION_SOCKET).parent_path());
   std::ofstream(ORVA_NOTIFICATION_SOCKET) << "precious";
@@ -463,7 +483,7 @@ TEST_F(OrvaNotify, RefusesAMessageThatIsTooLong) {
             "orva-notify: A message of 67108865 bytes is too long, 67108864 are allowed");
 }
 
-TEST_F(OrvaNotify, SurvivesARequestThatIsNone) {
+TEST_F(OrvaNotify, SurvivesMalformedRequests) {
   Serve();
   const std::vector<std::string> texts = {"hello\n", "send 0 99999999999\n", "send 0 1\nxy",
                                           std::string(64, 'x')};
@@ -478,7 +498,7 @@ TEST_F(OrvaNotify, SurvivesARequestThatIsNone) {
   EXPECT_EQ(RunNotify({"send", "end", "/shares/A"}).line, "sent to 0 clients");
 }
 
-TEST_F(OrvaNotify, GoesOnWhenNobodyReadsItsLines) {
+TEST_F(OrvaNotify, ContinuesWhenItsOutputIsClosed) {
   Serve();
   service_->CloseOutput();
   Listener client;
@@ -486,12 +506,13 @@ TEST_F(OrvaNotify, GoesOnWhenNobodyReadsItsLines) {
   EXPECT_EQ(RunNotify({"send", "end", "/shares/B"}).line, "sent to 1 client");
 }
 
-TEST_F(OrvaNotify, GoesOnWhenDescriptorsRunOut) {
-  service_ = std::make_unique<Program>(
-      Arguments{"/bin/sh", "-c", "ulimit -n 12; exec " ORVA_NOTIFY_PROGRAM " serve"});
+TEST_F(OrvaNotify, ContinuesWhenDescriptorsRunOut) {
+  service_ = std::make_unique<Program>(Arguments{
+      "/bin/sh", "-c", "ulimit -n 12; exec " + test::ProgramPath("orva-notify") + " serve"});
   ASSERT_EQ(service_->ReadLine(), "listening on " + ORVA_NOTIFICATION_SOCKET);
   {
-    // The sanitizer opens a pipe when it first meets an object of a class: none may be new later.
+    // The sanitizer opens a pipe when it checks the first object of a class. That must happen now,
+    // while there are free descriptors.
     const Listener first;
     EXPECT_EQ(RunNotify({"send", "end", "/shares/A"}).line, "sent to 1 client");
   }
@@ -517,20 +538,20 @@ TEST_F(OrvaNotify, AnnouncesMountsAndUnmountsBelowShares) {
   EXPECT_EQ(service_->ReadLineWith("seen"), "unplugged seen: /shares/My Photos");
 }
 
-TEST_F(OrvaNotify, TellsANewClientOfThePresentVolumesFirst) {
+TEST_F(OrvaNotify, AnnouncesMountedVolumesToANewClientFirst) {
   const Volume b("/shares/B");
   Serve({"--watch"});
   const Volume a("/shares/A");
   Listener client;
   EXPECT_EQ(RunNotify({"send", "scanned", "/shares/A"}).line, "sent to 1 client");
   std::vector<std::string> messages{client.ReadMessage(), client.ReadMessage()};
-  std::sort(messages.begin(), messages.end());
+  std::ranges::sort(messages);
   EXPECT_THAT(messages, ElementsAre(Compose(Event::Plugged, "/shares/A"),
                                     Compose(Event::Plugged, "/shares/B")));
   EXPECT_EQ(client.ReadMessage(), Compose(Event::Scanned, "/shares/A"));
 }
 
-TEST_F(OrvaNotify, AnnouncesAMountInPlaceOfAnother) {
+TEST_F(OrvaNotify, AnnouncesAMountOnTopOfAnother) {
   const Volume lower("/shares/A");
   Serve({"--watch"});
   Listener client;
@@ -540,7 +561,7 @@ TEST_F(OrvaNotify, AnnouncesAMountInPlaceOfAnother) {
   EXPECT_EQ(client.ReadMessage(), Compose(Event::Plugged, "/shares/A"));
 }
 
-TEST_F(OrvaNotify, SaysNothingOfMountsUnlessItWatches) {
+TEST_F(OrvaNotify, AnnouncesNoMountsWithoutWatch) {
   const Volume before("/shares/A");
   Serve();
   Listener client;

@@ -1,4 +1,4 @@
-// The inspector beside the daemon at work: what a watch sees, and that nobody waits for a reader.
+// zophotos while the daemon merges: what a watch prints, and that readers do not block merges.
 
 #include "PeakMemory.h"
 #include "ZophotosTest.h"
@@ -27,9 +27,7 @@ using ::testing::EndsWith;
 using ::testing::HasSubstr;
 using ::testing::MatchesRegex;
 
-const std::string LOCATOR = "/tmp/zophotodbmerger.conf";
-
-/// How many times a process has waited for something.
+/// How many times a process has gone to sleep.
 long Waits(pid_t pid) {
   std::ifstream file("/proc/" + std::to_string(pid) + "/status");
   const std::string name = "voluntary_ctxt_switches:";
@@ -43,7 +41,7 @@ long Waits(pid_t pid) {
 
 class ZophotosWatch : public ZophotosTest {
 protected:
-  /// Starts a watch, and waits until it has seen the database.
+  /// Starts a watch and waits for its first line.
   void Start(const Arguments& options = {"--json"}) {
     Arguments arguments{"watch"};
     arguments.insert(arguments.end(), options.begin(), options.end());
@@ -51,9 +49,9 @@ protected:
     first = watch->ReadLine();
   }
 
-  /// Waits until the watch has looked several times, or has tried to.
+  /// Waits until the watch has looked, or tried to look, several times.
   void AwaitLooks() const {
-    // It sleeps between its looks, and in one that waits for a lock.
+    // It sleeps between two looks, and in a look that waits for a lock.
     const long enough = Waits(watch->Pid()) + 8;
     const auto end = std::chrono::steady_clock::now() + DEADLINE;
     while (Waits(watch->Pid()) < enough) {
@@ -73,8 +71,8 @@ protected:
     return event == std::string::npos ? line : line.substr(event);
   }
 
-  /// Reads "changed" lines until as many files and folders were removed; true when nothing else
-  /// has come.
+  /// Reads "changed" lines until these numbers of folders and files were removed. False after any
+  /// other line.
   bool AwaitRemoval(int folders, int files) {
     while (folders > 0 || files > 0) {
       const json line = json::parse(watch->ReadLine(), nullptr, false);
@@ -95,7 +93,7 @@ protected:
 const std::string OPENED_A =
     R"("event":"opened","database":"/shares/A//.zophotos/zophotos.db","folders":8,"files":4})";
 
-TEST_F(ZophotosWatch, BeginsWithTheDatabase) {
+TEST_F(ZophotosWatch, PrintsTheDatabaseFirst) {
   Start({});
   EXPECT_THAT(first,
               MatchesRegex("20[0-9-]+ [0-9:]+  watching " + MERGED + ": 8 folders, 4 files"));
@@ -103,7 +101,7 @@ TEST_F(ZophotosWatch, BeginsWithTheDatabase) {
   EXPECT_THAT(first, EndsWith("Z\"," + OPENED_A));
 }
 
-TEST_F(ZophotosWatch, TellsOfAMerge) {
+TEST_F(ZophotosWatch, ReportsAMerge) {
   Start();
   onB.AddFolder("New/", 5);
   onB.AddPhoto("New/1.jpg", 7, 3001);
@@ -114,7 +112,7 @@ TEST_F(ZophotosWatch, TellsOfAMerge) {
       R"("event":"changed","folders_added":1,"folders_removed":0,"files_added":2,"files_removed":0,"volumes":[{"volume":"/shares/B/","transcoded":3,"total":5,"merged_up_to":"1970-01-01T00:50:02Z"}]})");
 }
 
-TEST_F(ZophotosWatch, TellsOfAMergeInText) {
+TEST_F(ZophotosWatch, ReportsAMergeInText) {
   Start({});
   onB.AddFolder("New/", 5);
   onB.AddPhoto("Old/4.jpg", 7, 3002);
@@ -128,7 +126,7 @@ TEST_F(ZophotosWatch, TellsOfAMergeInText) {
   EXPECT_THAT(watch->ReadLine(), MatchesRegex(".*  -2 files; /shares/B/ 0 of 2 photos transcoded"));
 }
 
-TEST_F(ZophotosWatch, TellsOfWhatWentAndCameInOne) {
+TEST_F(ZophotosWatch, ReportsAdditionsAndRemovalsInOneLine) {
   Start();
   onB.AddPhoto("Old/4.jpg", 7, 3002);
   onB.DeletePhoto("Old/1.jpg", 3003);
@@ -136,26 +134,26 @@ TEST_F(ZophotosWatch, TellsOfWhatWentAndCameInOne) {
   EXPECT_THAT(Next(), HasSubstr(R"("files_added":1,"files_removed":1,)"));
 }
 
-TEST_F(ZophotosWatch, TellsOfAWriteThatChangesNothing) {
+TEST_F(ZophotosWatch, ReportsAWriteWithoutAdditionsOrRemovals) {
   Start({});
   Database(MERGED).Run("UPDATE Status SET mdate = 1001");
   EXPECT_THAT(watch->ReadLine(), EndsWith("  written, nothing added or removed"));
 }
 
-TEST_F(ZophotosWatch, TellsOfAnUnplug) {
+TEST_F(ZophotosWatch, ReportsAnUnpluggedVolume) {
   Start();
   appliance.Handle(Unplugged(b.Path()));
   EXPECT_TRUE(AwaitRemoval(2, 1));
 }
 
-TEST_F(ZophotosWatch, TellsThatAnUnpluggedVolumeBeginsAnew) {
+TEST_F(ZophotosWatch, ReportsThatAVolumeWillBeMergedFromTheBeginning) {
   const Database copy = Copy();
   Start({"--database", COPY});
   copy.Run("UPDATE Statistics SET last_updated_time = 0 WHERE volume = '/shares/B/'");
-  EXPECT_THAT(watch->ReadLine(), EndsWith("  /shares/B/ is to be merged from its beginning"));
+  EXPECT_THAT(watch->ReadLine(), EndsWith("  /shares/B/ will be merged from the beginning"));
 }
 
-TEST_F(ZophotosWatch, SaysNothingWhileNothingChanges) {
+TEST_F(ZophotosWatch, PrintsNothingWhileNothingChanges) {
   Start();
   MergedDatabase(a.Path()).Files();
   Zophotos({"check"});
@@ -186,13 +184,13 @@ TEST_F(ZophotosWatch, FollowsTheDatabaseToAnotherMaster) {
   EXPECT_THAT(Next(), HasSubstr(R"("folders_added":2,"folders_removed":0,"files_added":1,)"));
 }
 
-TEST_F(ZophotosWatch, TellsOnceThatTheDatabaseIsLost) {
+TEST_F(ZophotosWatch, ReportsOnceThatTheDatabaseIsLost) {
   Start();
   const std::string locator = Appliance::Locator();
   std::ofstream(LOCATOR) << "zophotos_db_path=\n";
   EXPECT_EQ(
       Next(),
-      R"("event":"lost","reason":"no merged database: /tmp/zophotodbmerger.conf names none at this moment"})");
+      R"("event":"lost","reason":"no merged database: /tmp/zophotodbmerger.conf names no database at the moment"})");
   AwaitLooks();
   std::ofstream(LOCATOR) << locator;
   EXPECT_EQ(Next(), OPENED_A);
@@ -202,13 +200,13 @@ TEST_F(ZophotosWatch, WaitsForADatabase) {
   const std::string locator = Appliance::Locator();
   fs::remove(LOCATOR);
   Start({});
-  EXPECT_THAT(first, EndsWith("  no merged database: there is no file /tmp/zophotodbmerger.conf, "
-                              "which the daemon writes when it starts"));
+  EXPECT_THAT(first, EndsWith("  no merged database: /tmp/zophotodbmerger.conf does not exist; "
+                              "the daemon creates it when it starts"));
   std::ofstream(LOCATOR) << locator;
   EXPECT_THAT(watch->ReadLine(), EndsWith("8 folders, 4 files"));
 }
 
-TEST_F(ZophotosWatch, SeesAnotherFileInTheDatabasesPlace) {
+TEST_F(ZophotosWatch, DetectsAReplacedDatabaseFile) {
   Copy();
   Start({"--json", "--database", COPY});
   fs::rename(COPY, COPY + ".old");
@@ -220,7 +218,7 @@ TEST_F(ZophotosWatch, SeesAnotherFileInTheDatabasesPlace) {
   EXPECT_EQ(Next(), R"("event":"opened","database":")" + COPY + R"(","folders":8,"files":0})");
 }
 
-TEST_F(ZophotosWatch, TakesALockForNoNews) {
+TEST_F(ZophotosWatch, PrintsNothingForAShortLock) {
   const Database copy = Copy();
   Start({"--json", "--database", COPY});
   copy.Run("BEGIN EXCLUSIVE");
@@ -230,19 +228,19 @@ TEST_F(ZophotosWatch, TakesALockForNoNews) {
   EXPECT_THAT(Next(), HasSubstr(R"("files_removed":1)"));
 }
 
-TEST_F(ZophotosWatch, TellsOnceOfALockThatStays) {
+TEST_F(ZophotosWatch, ReportsALongLockOnce) {
   const Database copy = Copy();
   Start({"--json", "--database", COPY});
   copy.Run("BEGIN EXCLUSIVE");
   EXPECT_EQ(Next(), R"("event":"delayed","reason":")" + COPY +
-                        R"( is locked, as it is while a large merge is written; try again"})");
+                        R"( is locked, for example while a large merge commits; try again"})");
   AwaitLooks();
   copy.Run("DELETE FROM Files WHERE name = '1.jpg'");
   copy.Run("COMMIT");
   EXPECT_THAT(Next(), HasSubstr(R"("files_removed":1)"));
 }
 
-TEST_F(ZophotosWatch, CountsWhatCameAndWentBetweenTwoLooks) {
+TEST_F(ZophotosWatch, CountsAdditionsAndRemovalsBetweenTwoLooks) {
   const Database copy = Copy();
   Start({"--json", "--database", COPY});
   copy.Run("BEGIN");
@@ -253,7 +251,7 @@ TEST_F(ZophotosWatch, CountsWhatCameAndWentBetweenTwoLooks) {
   EXPECT_THAT(Next(), HasSubstr(R"("files_added":4,"files_removed":8)"));
 }
 
-TEST_F(ZophotosWatch, EndsBySignals) {
+TEST_F(ZophotosWatch, EndsOnSignals) {
   for (const int signal : {SIGINT, SIGTERM}) {
     Start();
     watch->Signal(signal);
@@ -261,7 +259,7 @@ TEST_F(ZophotosWatch, EndsBySignals) {
   }
 }
 
-TEST_F(ZophotosWatch, EndsWhenNobodyReadsItsLines) {
+TEST_F(ZophotosWatch, EndsWhenItsOutputIsClosed) {
   Start();
   watch->CloseOutput();
   onB.AddPhoto("Old/4.jpg", 7, 3002);
@@ -282,14 +280,14 @@ TEST_F(ZophotosWatch, MakesNoMergeFail) {
     for (const LogLine& line : appliance.Handle(TranscodedBatch(b.Path()))) {
       EXPECT_NE(Error("").priority, line.priority) << line.text;
     }
-    // While one has seen it, the others are still to look or just do.
+    // The other watches look at about the same time.
     const std::string transcoded = std::to_string(i * 50 + 1);
     EXPECT_THAT(watch->ReadLineWith("\"transcoded\":" + transcoded + ","),
                 HasSubstr(R"("files_added":50,)"));
   }
 }
 
-/// A merged database with more than what goes into a pipe.
+/// A merged database whose listing does not fit into a pipe.
 class ZophotosSlowReader : public ZophotosTest {
 protected:
   void SetUp() override {
@@ -302,7 +300,7 @@ protected:
   static constexpr int PHOTOS = 4000;
 };
 
-TEST_F(ZophotosSlowReader, KeepsNoMergeFromCommitting) {
+TEST_F(ZophotosSlowReader, DoesNotBlockMerges) {
   Program slowCsv(ZophotosCommand({"export", "--csv"}));
   Program slowLines(ZophotosCommand({"export", "--jsonl"}));
   Program slowFind(ZophotosCommand({"find", "*"}));
@@ -316,7 +314,7 @@ TEST_F(ZophotosSlowReader, KeepsNoMergeFromCommitting) {
   Merge(b);
   EXPECT_THAT(MergedDatabase(a.Path()).Files(),
               ::testing::Contains("/shares/B/Old/late.jpg|7|7|/shares/B/"));
-  // They were all held up, and end with the state that they began with.
+  // The full pipe has blocked them all, and they print the state from before the merge.
   for (const auto& [program, rest] :
        std::vector<std::pair<Program*, int>>{{&slowCsv, PHOTOS + 4},
                                              {&slowLines, PHOTOS + 3},
@@ -324,19 +322,17 @@ TEST_F(ZophotosSlowReader, KeepsNoMergeFromCommitting) {
                                              {&slowList, PHOTOS - 1}}) {
     std::string output;
     program->ReadToEnd(output, output);
-    EXPECT_EQ(rest, std::count(output.begin(), output.end(), '\n'));
+    EXPECT_EQ(rest, std::ranges::count(output, '\n'));
     EXPECT_EQ(std::string::npos, output.find("late"));
     EXPECT_EQ(0, program->WaitForEnd());
   }
 }
 
-TEST_F(ZophotosSlowReader, HasItsPrivateCopyWhereItIsTold) {
-  Copy().Run("WITH RECURSIVE n(i) AS (SELECT 1 UNION ALL SELECT i + 1 FROM n WHERE i < 50000) "
-             "INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT 1, i, "
-             "1, 'x', 1 FROM n");
+TEST_F(ZophotosSlowReader, PutsThePrivateCopyInTheGivenFolder) {
+  AddFiles(Copy(), 50'000, "1", "i");
   fs::create_directory("/tmp/space");
   setenv("SQLITE_TMPDIR", "/tmp/space", 1);
-  Program program(ZophotosCommand({"--database", COPY, "export", "--csv"}));
+  Program program(ZophotosCommand(OnCopyArguments({"export", "--csv"})));
   unsetenv("SQLITE_TMPDIR");
   program.ReadLine();
   std::string links;
@@ -348,34 +344,31 @@ TEST_F(ZophotosSlowReader, HasItsPrivateCopyWhereItIsTold) {
   EXPECT_THAT(links, ::testing::Not(HasSubstr(COPY)));
 }
 
-/// The peak of an export of the copy in KiB, while the last `rest` rows of it are not yet taken.
+/// The peak memory of an export of `rows` files in KiB, before its last `rest` rows are read.
 long PeakOfExport(const Database& copy, int rows, int rest) {
   copy.Run("DELETE FROM Files");
   copy.Run("DELETE FROM Folders WHERE folder_id != 1");
   copy.Run("WITH RECURSIVE n(i) AS (SELECT 2 UNION ALL SELECT i + 1 FROM n WHERE i < 101) INSERT "
            "INTO Folders(folder_id, parent_folder_id, name, modified_date, volume) SELECT i, 1, "
            "'/shares/A/' || i || '/', 1, '/shares/A/' FROM n");
-  copy.Run("WITH RECURSIVE n(i) AS (SELECT 1 UNION ALL SELECT i + 1 FROM n WHERE i < "
-           "CAST(? AS INTEGER)) INSERT INTO Files(folder_id, name, modified_date, volume, "
-           "created_date) SELECT 2 + i % 100, hex(i) || '.jpg', 1, '/shares/A/', 1 FROM n",
-           {std::to_string(rows)});
-  Program program(ZophotosCommand({"--database", COPY, "export", "--csv"}));
+  AddFiles(copy, rows, "2 + i % 100", "hex(i) || '.jpg'");
+  Program program(ZophotosCommand(OnCopyArguments({"export", "--csv"})));
   for (int i = 0; i < rows - rest; ++i) {
     program.ReadLine();
   }
   const long peak = PeakOf(program.Pid());
   std::string output;
   program.ReadToEnd(output, output);
-  EXPECT_EQ(rest + 1, std::count(output.begin(), output.end(), '\n'));
+  EXPECT_EQ(rest + 1, std::ranges::count(output, '\n'));
   EXPECT_EQ(0, program.WaitForEnd());
   return peak;
 }
 
-TEST_F(ZophotosSlowReader, HoldsUpAnExportOfConstantMemory) {
-  // What a sanitizer keeps of freed memory, to find uses of it, would be counted.
+TEST_F(ZophotosSlowReader, ExportsInConstantMemory) {
+  // The address sanitizer keeps freed memory, which would be counted.
   setenv("ASAN_OPTIONS", "quarantine_size_mb=0:thread_local_quarantine_size_kb=0", 1);
   const Database copy = Copy();
-  // Both fill the caches of SQLite.
+  // Both exports fill the caches of SQLite.
   const long some = PeakOfExport(copy, 100'000, 2500);
   const long many = PeakOfExport(copy, 200'000, 2500);
   unsetenv("ASAN_OPTIONS");

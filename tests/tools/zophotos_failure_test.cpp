@@ -1,5 +1,4 @@
-// When the inspector cannot do its work: its exit statuses and messages, and that it leaves all as
-// it was.
+// Exit statuses and messages of zophotos when it fails, and that it changes nothing.
 
 #include "ZophotosTest.h"
 
@@ -26,9 +25,7 @@ using ::testing::Lt;
 using ::testing::Not;
 using ::testing::SizeIs;
 
-const std::string LOCATOR = "/tmp/zophotodbmerger.conf";
-
-/// All commands that end by themselves.
+/// All commands except watch, which does not end by itself.
 const std::vector<Arguments> COMMANDS{{"status"},
                                       {"ls"},
                                       {"ls", "-l", "A"},
@@ -48,14 +45,13 @@ std::string Text(const Arguments& arguments) {
 }
 
 void ExpectFailure(const Outcome& outcome, int status, const std::string& message) {
-  EXPECT_EQ(status, outcome.status);
-  EXPECT_EQ("", outcome.output);
-  EXPECT_EQ("zophotos: " + message + "\n", outcome.error);
+  ExpectError(outcome, status, "zophotos: " + message + "\n");
 }
 
-/// The locator file of a daemon that does not run.
+/// The locator file, without a daemon.
 class ZophotosLocator : public ::testing::Test {
 protected:
+  void SetUp() override { fs::remove_all(LOCATOR); }
   void TearDown() override { fs::remove_all(LOCATOR); }
 
   static void Write(const std::string& text) { std::ofstream(LOCATOR) << text; }
@@ -68,36 +64,32 @@ protected:
   }
 };
 
-const std::string NO_FILE =
-    "there is no file /tmp/zophotodbmerger.conf, which the daemon writes when it starts";
-
-TEST_F(ZophotosLocator, MayBeMissing) {
-  ExpectNoDatabase(NO_FILE);
+TEST_F(ZophotosLocator, IsReportedIfMissing) {
+  ExpectNoDatabase(LOCATOR + " does not exist; the daemon creates it when it starts");
 }
 
-TEST_F(ZophotosLocator, MayNameNone) {
+TEST_F(ZophotosLocator, IsReportedIfItNamesNoDatabase) {
   Write("zophotos_db_path=\n");
-  ExpectNoDatabase("/tmp/zophotodbmerger.conf names none at this moment");
+  ExpectNoDatabase("/tmp/zophotodbmerger.conf names no database at the moment");
 }
 
-TEST_F(ZophotosLocator, MayBeMalformed) {
+TEST_F(ZophotosLocator, IsReportedIfMalformed) {
   for (const char* const text : {"", "\n", "nonsense\n", " zophotos_db_path=/x\n", "ZOPHOTOS"}) {
     Write(text);
-    ExpectNoDatabase("/tmp/zophotodbmerger.conf has no zophotos_db_path= in its first line");
+    ExpectNoDatabase("/tmp/zophotodbmerger.conf does not begin with zophotos_db_path=");
   }
 }
 
-TEST_F(ZophotosLocator, MayHaveANul) {
+TEST_F(ZophotosLocator, IsReportedIfItHasANul) {
   for (const std::string& path : {std::string("\0", 1), std::string("/shares\0/x", 10)}) {
     Write("zophotos_db_path=" + path + "\n");
-    ExpectNoDatabase("/tmp/zophotodbmerger.conf has a NUL in its first line, which no path has");
+    ExpectNoDatabase("/tmp/zophotodbmerger.conf has a NUL byte in its first line");
   }
 }
 
-TEST_F(ZophotosLocator, MayBeNoFile) {
+TEST_F(ZophotosLocator, IsReportedIfItIsNotARegularFile) {
   const std::string reason =
-      "/tmp/zophotodbmerger.conf is not a regular file, so that the daemon does not "
-      "write it";
+      "/tmp/zophotodbmerger.conf is not a regular file, so the daemon does not write to it";
   fs::create_directory(LOCATOR);
   ExpectNoDatabase(reason);
   fs::remove(LOCATOR);
@@ -105,12 +97,12 @@ TEST_F(ZophotosLocator, MayBeNoFile) {
   ExpectNoDatabase(reason);
 }
 
-TEST_F(ZophotosLocator, MayNameWhatIsNotThere) {
+TEST_F(ZophotosLocator, MayNameAMissingDatabase) {
   Write("zophotos_db_path=/shares/Gone//.zophotos/zophotos.db\n");
   ExpectNoDatabase("/shares/Gone//.zophotos/zophotos.db does not exist");
 }
 
-TEST_F(ZophotosLocator, MayNameWhatIsNoFile) {
+TEST_F(ZophotosLocator, MayNameADirectoryOrADevice) {
   for (const char* const path : {"/shares", "/dev/null"}) {
     Write("zophotos_db_path=" + std::string(path));
     ExpectFailure(Zophotos({"status"}), 5, std::string(path) + " is not a regular file");
@@ -118,20 +110,19 @@ TEST_F(ZophotosLocator, MayNameWhatIsNoFile) {
   }
 }
 
-TEST_F(ZophotosLocator, CannotSayAnythingToTheTerminal) {
+TEST_F(ZophotosLocator, IsEscapedInMessages) {
   Write("zophotos_db_path=/x\x1b[2J\xff\u202e\r\n");
   ExpectNoDatabase(R"(/x\x1b[2J\xff\xe2\x80\xae\x0d does not exist)");
 }
 
-TEST_F(ZophotosLocator, IsReadNoFurtherThanAPathCanBe) {
+TEST_F(ZophotosLocator, IsNotReadToTheEndIfHuge) {
   Write("zophotos_db_path=/" + std::string(1 << 20, 'x'));
   const Outcome outcome = Zophotos({"status"});
   EXPECT_EQ(5, outcome.status);
   EXPECT_THAT(outcome.error, AllOf(HasSubstr("/xxx"), SizeIs(Lt(10000))));
 }
 
-/// How the inspector is called wrongly, and what it says.
-TEST(ZophotosUsage, IsToldFromFailure) {
+TEST(ZophotosUsage, ErrorsHaveAStatusOfTheirOwn) {
   const std::vector<std::pair<Arguments, std::string>> wrong{
       {{}, "A subcommand is required"},
       {{"destroy"}, "destroy"},
@@ -140,13 +131,13 @@ TEST(ZophotosUsage, IsToldFromFailure) {
       {{"status", "A"}, "A"},
       {{"find"}, "PATTERN is required"},
       {{"find", "a", "b"}, "b"},
-      {{"export"}, "takes one of --csv and --jsonl"},
-      {{"export", "--csv", "--jsonl"}, "takes one of --csv and --jsonl"},
-      {{"export", "--csv", "--json"}, "takes one of --csv and --jsonl"},
-      {{"find", "-0", "--json", "x"}, "takes one of --null and --json"},
-      {{"--json", "find", "--null", "x"}, "takes one of --null and --json"},
+      {{"export"}, "needs either --csv or --jsonl"},
+      {{"export", "--csv", "--jsonl"}, "needs either --csv or --jsonl"},
+      {{"export", "--csv", "--json"}, "needs either --csv or --jsonl"},
+      {{"find", "-0", "--json", "x"}, "--null and --json cannot be combined"},
+      {{"--json", "find", "--null", "x"}, "--null and --json cannot be combined"},
       {{"--database"}, "--database"},
-      {{"--database", "", "status"}, "it is empty"},
+      {{"--database", "", "status"}, "must not be empty"},
       {{"status", "check"}, "check"}};
   for (const auto& [arguments, message] : wrong) {
     SCOPED_TRACE(Text(arguments));
@@ -157,7 +148,7 @@ TEST(ZophotosUsage, IsToldFromFailure) {
   }
 }
 
-TEST(ZophotosUsage, IsExplained) {
+TEST(ZophotosUsage, HelpNamesAllCommands) {
   for (const Arguments& arguments : {Arguments{"--help"}, Arguments{"-h"}}) {
     const Outcome help = Zophotos(arguments);
     EXPECT_EQ(0, help.status);
@@ -170,7 +161,7 @@ TEST(ZophotosUsage, IsExplained) {
   }
 }
 
-TEST(ZophotosUsage, VersionIsTheProjects) {
+TEST(ZophotosUsage, VersionIsThatOfTheProject) {
   const Outcome outcome = Zophotos({"--version"});
   EXPECT_EQ(0, outcome.status);
   EXPECT_EQ("zophotos " ZOPHOTOS_VERSION "\n", outcome.output);
@@ -178,40 +169,36 @@ TEST(ZophotosUsage, VersionIsTheProjects) {
 
 class ZophotosFailure : public ZophotosTest {
 protected:
-  /// Expects of the commands that print rows that they fail on the copy, which `check` may find
-  /// damaged.
-  static void ExpectRefused(const std::string& message) {
+  /// Expects that all commands fail on the copy.
+  static void ExpectAllFail(int status, const std::string& message,
+                            const std::string& except = "") {
     for (const Arguments& command : COMMANDS) {
-      if (command[0] != "check") {
+      if (command[0] != except) {
         SCOPED_TRACE(Text(command));
-        ExpectFailure(OnCopy(command), 5, COPY + message);
+        ExpectFailure(OnCopy(command), status, COPY + message);
       }
     }
   }
 };
 
-TEST_F(ZophotosFailure, OfATableThatIsMissing) {
+TEST_F(ZophotosFailure, MissingTableIsReported) {
   for (const char* const table : {"Status", "Statistics", "Folders", "Files"}) {
     Copy().Run("ALTER TABLE " + std::string(table) + " RENAME TO Other");
-    const std::string message =
-        " is no merged photo database: it has no table " + std::string(table);
-    ExpectRefused(message);
-    ExpectFailure(OnCopy({"check"}), 5, COPY + message);
+    ExpectAllFail(5, " is not a merged photo database: it has no table " + std::string(table));
   }
 }
 
-TEST_F(ZophotosFailure, OfAViewInPlaceOfATable) {
+TEST_F(ZophotosFailure, ViewInPlaceOfATableIsReported) {
   {
     const Database copy = Copy();
     copy.Run("ALTER TABLE Statistics RENAME TO Other");
     copy.Run("CREATE VIEW Statistics AS SELECT * FROM Other");
   }
-  ExpectRefused(" is no merged photo database: it has no table Statistics");
+  ExpectAllFail(5, " is not a merged photo database: it has no table Statistics");
 }
 
-/// Half a character sorts by other bytes than those that it is read as.
-TEST_F(ZophotosFailure, OfTextsInUtf16) {
-  fs::create_directory("/tmp/copy");
+// In UTF-16, half a surrogate pair sorts by other bytes than those that it is read as.
+TEST_F(ZophotosFailure, Utf16TextsAreReported) {
   const Database database(COPY, true);
   database.Run("PRAGMA encoding = 'UTF-16le'");
   for (const char* const table : {"Status(id)", "Statistics(id)", "Files(folder_id)",
@@ -219,27 +206,23 @@ TEST_F(ZophotosFailure, OfTextsInUtf16) {
                                   "modified_date INTEGER)"}) {
     database.Run("CREATE TABLE " + std::string(table));
   }
-  // "/shares/" and the second half of a pair.
+  // "/shares/" and the second half of a surrogate pair.
   database.Run("INSERT INTO Folders(name) VALUES(CAST(x'2f007300680061007200650073002f0000dc2f00' "
                "AS TEXT))");
-  const std::string message = " is no merged photo database: its texts are in UTF-16le";
-  ExpectRefused(message);
-  ExpectFailure(OnCopy({"check"}), 5, COPY + message);
+  ExpectAllFail(5, " is not a merged photo database: its text encoding is UTF-16le");
 }
 
-TEST_F(ZophotosFailure, OfAFileThatIsEmpty) {
-  fs::create_directory("/tmp/copy");
+TEST_F(ZophotosFailure, EmptyFileIsReported) {
   std::ofstream file(COPY);
-  ExpectRefused(" is no merged photo database: it has no table Status");
+  ExpectAllFail(5, " is not a merged photo database: it has no table Status");
 }
 
-TEST_F(ZophotosFailure, OfAFileThatIsNoDatabase) {
-  fs::create_directory("/tmp/copy");
+TEST_F(ZophotosFailure, FileThatIsNotADatabaseIsReported) {
   std::ofstream(COPY) << std::string(5000, 'x');
-  ExpectRefused(": file is not a database");
+  ExpectAllFail(5, ": file is not a database", "check");
 }
 
-TEST_F(ZophotosFailure, OfAColumnThatIsMissing) {
+TEST_F(ZophotosFailure, MissingColumnIsReported) {
   Copy().Run("ALTER TABLE Files RENAME COLUMN name TO other");
   for (const Arguments& command : {Arguments{"find", "*"}, Arguments{"export", "--csv"},
                                    Arguments{"ls"}, Arguments{"check"}}) {
@@ -249,28 +232,27 @@ TEST_F(ZophotosFailure, OfAColumnThatIsMissing) {
   }
 }
 
-TEST_F(ZophotosFailure, OfALockThatStays) {
+TEST_F(ZophotosFailure, LongLockIsReported) {
   const Database locked = Copy();
   locked.Run("BEGIN EXCLUSIVE");
   std::vector<std::unique_ptr<Program>> programs;
-  for (Arguments command : COMMANDS) { // all at once, since each of them waits
-    command.insert(command.begin(), {"--database", COPY});
-    programs.push_back(std::make_unique<Program>(ZophotosCommand(command)));
+  for (const Arguments& command : COMMANDS) { // all at once, because each of them waits
+    programs.push_back(std::make_unique<Program>(ZophotosCommand(OnCopyArguments(command))));
   }
   for (std::size_t i = 0; i < programs.size(); ++i) {
     EXPECT_EQ("zophotos: " + COPY +
-                  " is locked, as it is while a large merge is written; try again",
+                  " is locked, for example while a large merge commits; try again",
               programs[i]->ReadLine());
     EXPECT_EQ("(end)", programs[i]->ReadLine());
     EXPECT_EQ(4, programs[i]->WaitForEnd()) << Text(COMMANDS[i]);
   }
 }
 
-TEST_F(ZophotosFailure, IsNotALockThatGoes) {
+TEST_F(ZophotosFailure, ShortLockIsWaitedFor) {
   const Database locked = Copy();
   for (const char* const command : {"status", "ls"}) {
     locked.Run("BEGIN EXCLUSIVE");
-    Program program(ZophotosCommand({"--database", COPY, command}));
+    Program program(ZophotosCommand(OnCopyArguments({command})));
     EXPECT_TRUE(AwaitSystemCall(program.Pid(), SYS_clock_nanosleep));
     locked.Run("COMMIT");
     EXPECT_THAT(program.ReadLineWith("A/"), Not(HasSubstr("(end)")));
@@ -278,7 +260,7 @@ TEST_F(ZophotosFailure, IsNotALockThatGoes) {
   }
 }
 
-TEST_F(ZophotosFailure, OfAMergeThatWasInterrupted) {
+TEST_F(ZophotosFailure, InterruptedMergeIsReported) {
   constexpr std::uint32_t pageSize = 4096;
   Copy();
   Bytes file = Bytes::Of(COPY);
@@ -286,33 +268,25 @@ TEST_F(ZophotosFailure, OfAMergeThatWasInterrupted) {
   CraftedJournal(pageSize, static_cast<std::uint32_t>(file.Size()) / pageSize,
                  {{1, file.Part(0, pageSize)}})
       .Save(COPY + "-journal");
-  for (const Arguments& command : COMMANDS) {
-    SCOPED_TRACE(Text(command));
-    ExpectFailure(OnCopy(command), 4,
-                  COPY + " has a merge to take back that was interrupted; the daemon does so when "
-                         "it opens the database, and this program only reads");
-  }
-  Program watch(ZophotosCommand({"--json", "--database", COPY, "watch"}));
+  ExpectAllFail(4, " has an interrupted merge to roll back; the daemon does that when it opens the "
+                   "database");
+  Program watch(ZophotosCommand(OnCopyArguments({"--json", "watch"})));
   EXPECT_THAT(watch.ReadLine(), HasSubstr(R"("event":"delayed","reason":")" + COPY));
   EXPECT_TRUE(fs::exists(COPY + "-journal"));
   EXPECT_EQ(std::vector<std::string>{"4"}, Database(COPY).Run("SELECT count(*) FROM Files"));
   EXPECT_EQ(0, OnCopy({"status"}).status);
 }
 
-TEST_F(ZophotosFailure, OfADatabaseThatCannotBeReadWithoutWritingBesideIt) {
+TEST_F(ZophotosFailure, WriteAheadLogIsReportedAndNotCreated) {
   Copy().Run("PRAGMA journal_mode = WAL");
-  for (const Arguments& command : COMMANDS) {
-    SCOPED_TRACE(Text(command));
-    ExpectFailure(OnCopy(command), 5,
-                  COPY +
-                      " has a write-ahead log, which the daemon's databases do not have: to read "
-                      "it would be to write beside it");
-  }
+  ExpectAllFail(5,
+                " uses a write-ahead log, unlike the daemon's databases; reading it would create "
+                "files next to it");
   EXPECT_FALSE(fs::exists(COPY + "-wal"));
   EXPECT_FALSE(fs::exists(COPY + "-shm"));
 }
 
-TEST_F(ZophotosFailure, OfAnOutputThatCannotBeWritten) {
+TEST_F(ZophotosFailure, UnwritableOutputIsReported) {
   std::vector<Arguments> commands = COMMANDS;
   commands.push_back({"watch"});
   commands.push_back({"--help"});
@@ -322,11 +296,8 @@ TEST_F(ZophotosFailure, OfAnOutputThatCannotBeWritten) {
   }
 }
 
-TEST_F(ZophotosFailure, OfAPlaceForAPrivateCopy) {
-  Copy().Run(
-      "WITH RECURSIVE n(i) AS (SELECT 1 UNION ALL SELECT i + 1 FROM n WHERE i < 100000) INSERT "
-      "INTO Files(folder_id, name, modified_date, volume, created_date) SELECT 1, i, 1, 'x', 1 "
-      "FROM n");
+TEST_F(ZophotosFailure, FailedPrivateCopyIsReported) {
+  AddFiles(Copy(), 100'000, "1", "i");
   const Volume full("Full", "64k");
   const Volume closed("Closed", "64k,nr_inodes=1");
   for (const auto& [volume, fault] :
@@ -337,17 +308,18 @@ TEST_F(ZophotosFailure, OfAPlaceForAPrivateCopy) {
       SCOPED_TRACE(Text(command));
       ExpectFailure(OnCopy(command), 5,
                     std::string(fault) + " for a private copy of " + COPY +
-                        "; SQLITE_TMPDIR names another folder for it");
+                        "; set SQLITE_TMPDIR to another folder");
     }
   }
   unsetenv("SQLITE_TMPDIR");
 }
 
-/// All that is in the folder of a database: the bytes of its files and the times of their last
-/// changes.
-std::map<std::string, std::tuple<std::string, long, long, long, long>>
-Snapshot(const std::string& folder) {
-  std::map<std::string, std::tuple<std::string, long, long, long, long>> snapshot;
+/// Content, modification time and change time of a file.
+using FileState = std::tuple<std::string, long, long, long, long>;
+
+/// The states of a folder and of everything in it.
+std::map<std::string, FileState> Snapshot(const std::string& folder) {
+  std::map<std::string, FileState> snapshot;
   std::vector<std::string> paths = PathsBelow(folder);
   paths.push_back(folder);
   for (const std::string& path : paths) {
@@ -362,7 +334,7 @@ Snapshot(const std::string& folder) {
   return snapshot;
 }
 
-TEST_F(ZophotosFailure, OrNotLeavesTheDatabaseAsItWas) {
+TEST_F(ZophotosFailure, NoCommandChangesTheDatabase) {
   const auto before = Snapshot("/shares/A/.zophotos");
   for (const Arguments& command : COMMANDS) {
     EXPECT_EQ(0, Zophotos(command).status);
@@ -373,7 +345,7 @@ TEST_F(ZophotosFailure, OrNotLeavesTheDatabaseAsItWas) {
   EXPECT_EQ(before, Snapshot("/shares/A/.zophotos"));
 }
 
-TEST_F(ZophotosFailure, LeavesNothingInTheTemporaryFolder) {
+TEST_F(ZophotosFailure, NoCommandLeavesTemporaryFiles) {
   const auto before = PathsBelow("/tmp");
   for (const Arguments& command : COMMANDS) {
     Zophotos(command);

@@ -1,4 +1,4 @@
-// What the inspector prints of a sound database.
+// What zophotos prints of a sound database.
 
 #include "ZophotosTest.h"
 
@@ -19,33 +19,7 @@ class ZophotosTree : public ZophotosTest {};
 class ZophotosFind : public ZophotosTest {};
 class ZophotosExport : public ZophotosTest {};
 
-/// The command went well and printed this.
-void ExpectOutput(const Outcome& outcome, const std::string& output) {
-  EXPECT_EQ(0, outcome.status);
-  EXPECT_EQ(output, outcome.output);
-  EXPECT_EQ("", outcome.error);
-}
-
-/// The command found nothing, and said so.
-void ExpectNothing(const Outcome& outcome, const std::string& error) {
-  EXPECT_EQ(1, outcome.status);
-  EXPECT_EQ("", outcome.output);
-  EXPECT_EQ(error, outcome.error);
-}
-
-/// Adds a folder to a copy of the merged database, and a file into it unless that is empty. The
-/// texts are SQL expressions.
-void AddRows(const Database& copy, const std::string& folder, const std::string& file = "") {
-  copy.Run("INSERT INTO Folders(parent_folder_id, name, modified_date, volume) VALUES(1, " +
-           folder + ", 0, '/shares/A/')");
-  if (!file.empty()) {
-    copy.Run("INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT "
-             "max(folder_id), " +
-             file + ", 5, '/shares/A/', 6 FROM Folders");
-  }
-}
-
-TEST_F(ZophotosStatus, ShowsHowFarEachVolumeIs) {
+TEST_F(ZophotosStatus, ShowsTheProgressOfEachVolume) {
   ExpectOutput(Zophotos({"status"}),
                "Database  /shares/A//.zophotos/zophotos.db\n"
                "Version   2.0\n"
@@ -58,7 +32,7 @@ TEST_F(ZophotosStatus, ShowsHowFarEachVolumeIs) {
                "/shares/D/  ░░░░░░░░░░   0 %     0/1        1      0  -\n");
 }
 
-TEST_F(ZophotosStatus, IsOneObjectInJson) {
+TEST_F(ZophotosStatus, PrintsOneObjectInJson) {
   ExpectOutput(
       Zophotos({"status", "--json"}),
       R"({"database":"/shares/A//.zophotos/zophotos.db","version":"2.0",)"
@@ -81,7 +55,7 @@ TEST_F(ZophotosStatus, SaysWhenNoVolumeHasBeenMerged) {
   EXPECT_THAT(OnCopy({"--json", "status"}).output, HasSubstr(R"("volumes":[])"));
 }
 
-TEST_F(ZophotosStatus, RoundsPercentagesDownAndNoFurther) {
+TEST_F(ZophotosStatus, RoundsPercentagesDown) {
   const Database copy = Copy();
   for (const auto& [transcoded, total, percent] :
        std::vector<std::tuple<std::string, std::string, std::string>>{
@@ -97,26 +71,26 @@ TEST_F(ZophotosStatus, RoundsPercentagesDownAndNoFurther) {
   }
 }
 
-TEST_F(ZophotosStatus, ShowsWhatAnUnpluggedVolumeLeaves) {
+TEST_F(ZophotosStatus, KeepsTheStatisticsOfAnUnpluggedVolume) {
   appliance.Handle(Unplugged(b.Path()));
   EXPECT_THAT(Zophotos({"status"}).output,
               HasSubstr("/shares/B/  ███░░░░░░░  33 %     1/3        0      0  -\n"));
 }
 
-TEST_F(ZophotosStatus, TimesInTextAreLocal) {
+TEST_F(ZophotosStatus, PrintsLocalTimesInText) {
   setenv("TZ", "UTC-9", 1);
   EXPECT_THAT(Zophotos({"status"}).output, HasSubstr("Stamped   1970-01-01 09:16:40\n"));
   EXPECT_THAT(Zophotos({"status", "--json"}).output,
               HasSubstr(R"("stamped":"1970-01-01T00:16:40Z")"));
 }
 
-TEST_F(ZophotosStatus, LeavesOutAStatusRowThatIsMissing) {
+TEST_F(ZophotosStatus, AcceptsAMissingStatusRow) {
   Copy().Run("DELETE FROM Status");
   EXPECT_THAT(OnCopy({"status"}).output, HasSubstr("\nVersion   -\nStamped   -\n\nVOLUME"));
   EXPECT_THAT(OnCopy({"status", "--json"}).output, HasSubstr(R"("version":null,"stamped":null,)"));
 }
 
-TEST_F(ZophotosStatus, TimesThatNoCalendarHasAreNumbers) {
+TEST_F(ZophotosStatus, PrintsTimesOutsideTheCalendarAsNumbers) {
   const Database copy = Copy();
   for (const auto& [seconds, text] :
        {std::pair("-62135596800", "1-01-01 00:00:00"), std::pair("-62135596801", "-62135596801"),
@@ -127,35 +101,35 @@ TEST_F(ZophotosStatus, TimesThatNoCalendarHasAreNumbers) {
   }
 }
 
-TEST_F(ZophotosStatus, ReadsTheDatabaseThatItIsGiven) {
+TEST_F(ZophotosStatus, ReadsTheDatabaseGivenAsAnOption) {
   const Database copy = Copy();
   copy.Run("UPDATE Status SET mc_version = '7.5'");
-  std::filesystem::remove("/tmp/zophotodbmerger.conf");
+  std::filesystem::remove(LOCATOR);
   for (const Arguments& arguments :
        {Arguments{"--database", COPY, "status"}, Arguments{"status", "--database=" + COPY}}) {
     const Outcome outcome = Zophotos(arguments);
     EXPECT_EQ(0, outcome.status);
     EXPECT_THAT(outcome.output, StartsWith("Database  " + COPY + "\nVersion   7.5\n"));
   }
-  std::ofstream("/tmp/zophotodbmerger.conf") << "zophotos_db_path=" << MERGED << '\n';
+  std::ofstream(LOCATOR) << "zophotos_db_path=" << MERGED << '\n';
 }
 
-TEST_F(ZophotosList, BeginsAtTheSharesRoot) {
+TEST_F(ZophotosList, ListsTheSharesRootByDefault) {
   ExpectOutput(Zophotos({"ls"}), "A/\nB/\nC/\nD/\n");
 }
 
-TEST_F(ZophotosList, ShowsFoldersBeforeFiles) {
+TEST_F(ZophotosList, ListsFoldersBeforeFiles) {
   ExpectOutput(Zophotos({"ls", "A"}), "Pictures/\ntop.jpg\n");
 }
 
-TEST_F(ZophotosList, TakesAFolderInAnyForm) {
+TEST_F(ZophotosList, AcceptsAbsoluteAndRelativeFolders) {
   for (const char* const folder :
        {"A/Pictures", "A/Pictures/", "/shares/A/Pictures", "/shares/A/Pictures/"}) {
     ExpectOutput(Zophotos({"ls", folder}), "Summer/\nb.jpg\n");
   }
 }
 
-TEST_F(ZophotosList, AddsTimesNumbersAndVolumesToALongList) {
+TEST_F(ZophotosList, AddsTimesNumbersAndVolumesInLongForm) {
   ExpectOutput(Zophotos({"ls", "-l", "A/Pictures"}),
                "MODIFIED             FILES  VOLUME      NAME\n"
                "1970-01-01 00:10:00      1  /shares/A/  Summer/\n"
@@ -164,7 +138,7 @@ TEST_F(ZophotosList, AddsTimesNumbersAndVolumesToALongList) {
               HasSubstr("1970-01-01 00:00:00      0  /shares/B/  B/\n"));
 }
 
-TEST_F(ZophotosList, IsAnObjectALineInJson) {
+TEST_F(ZophotosList, PrintsOneObjectPerLineInJson) {
   const std::string lines =
       R"({"type":"folder","path":"/shares/A/Pictures/Summer/","volume":"/shares/A/","modified":"1970-01-01T00:10:00Z","files":1,"stored":true})"
       "\n"
@@ -174,12 +148,12 @@ TEST_F(ZophotosList, IsAnObjectALineInJson) {
   ExpectOutput(Zophotos({"ls", "-l", "A/Pictures", "--json"}), lines);
 }
 
-TEST_F(ZophotosList, SaysThatAFolderIsNotThere) {
-  ExpectNothing(Zophotos({"ls", "A/Pict"}), "zophotos: there is no folder /shares/A/Pict/\n");
-  ExpectNothing(Zophotos({"ls", "/elsewhere"}), "zophotos: there is no folder /elsewhere/\n");
+TEST_F(ZophotosList, ReportsAMissingFolder) {
+  ExpectError(Zophotos({"ls", "A/Pict"}), 1, "zophotos: there is no folder /shares/A/Pict/\n");
+  ExpectError(Zophotos({"ls", "/elsewhere"}), 1, "zophotos: there is no folder /elsewhere/\n");
 }
 
-TEST_F(ZophotosList, ShowsAnEmptyFolderAsEmpty) {
+TEST_F(ZophotosList, PrintsNothingForAnEmptyFolder) {
   ExpectOutput(Zophotos({"ls", "C"}), "");
   ExpectOutput(Zophotos({"ls", "C", "--json"}), "");
 }
@@ -206,11 +180,11 @@ TEST_F(ZophotosRemovedFolder, IsListedAsNotStored) {
               HasSubstr("-                        0              Pictures/\n"));
 }
 
-TEST_F(ZophotosRemovedFolder, CanBeLookedInto) {
+TEST_F(ZophotosRemovedFolder, CanBeListed) {
   ExpectOutput(Zophotos({"ls", "A/Pictures"}), "Summer/\n");
 }
 
-TEST_F(ZophotosRemovedFolder, StandsInTheTree) {
+TEST_F(ZophotosRemovedFolder, IsShownInTheTree) {
   ExpectOutput(Zophotos({"tree", "A"}), "/shares/A/  1 file\n"
                                         "└── Pictures/  (not stored)\n"
                                         "    └── Summer/  1 file\n");
@@ -218,14 +192,14 @@ TEST_F(ZophotosRemovedFolder, StandsInTheTree) {
                                                  "└── Summer/  1 file\n");
 }
 
-TEST_F(ZophotosRemovedFolder, LeavesNoDamage) {
+TEST_F(ZophotosRemovedFolder, IsNotDamage) {
   ExpectOutput(Zophotos({"check"}), MERGED + " is sound\n"
-                                             "Expected leftovers, no damage:\n"
+                                             "Expected leftovers (not damage):\n"
                                              "  folders whose parent folder was removed: 1\n"
                                              "    /shares/A/Pictures/Summer/\n");
 }
 
-TEST_F(ZophotosTree, ShowsAllFoldersWithTheirFiles) {
+TEST_F(ZophotosTree, ShowsAllFoldersWithTheirNumbersOfFiles) {
   ExpectOutput(Zophotos({"tree"}), "/shares/  0 files\n"
                                    "├── A/  1 file\n"
                                    "│   └── Pictures/  1 file\n"
@@ -236,7 +210,7 @@ TEST_F(ZophotosTree, ShowsAllFoldersWithTheirFiles) {
                                    "└── D/  0 files\n");
 }
 
-TEST_F(ZophotosTree, IsAnObjectALineInJson) {
+TEST_F(ZophotosTree, PrintsOneObjectPerLineInJson) {
   ExpectOutput(Zophotos({"--json", "tree", "/shares/A"}),
                R"({"path":"/shares/A/","depth":0,"files":1,"stored":true})"
                "\n"
@@ -246,7 +220,7 @@ TEST_F(ZophotosTree, IsAnObjectALineInJson) {
                "\n");
 }
 
-TEST_F(ZophotosTree, KeepsWhatIsInAFolderBelowIt) {
+TEST_F(ZophotosTree, PrintsSubfoldersDirectlyBelowTheirFolder) {
   onA.AddFolder("a/", 1);
   onA.AddFolder("a b/", 1);
   onA.AddFolder("a b/y/", 1);
@@ -263,17 +237,17 @@ TEST_F(ZophotosTree, KeepsWhatIsInAFolderBelowIt) {
                                         "└── a!/  0 files\n");
 }
 
-TEST_F(ZophotosTree, GoesByPathsAndNotByParents) {
+TEST_F(ZophotosTree, UsesPathsInsteadOfParentIds) {
   Copy().Run("UPDATE Folders SET parent_folder_id = 999 - folder_id");
   EXPECT_EQ(Zophotos({"tree"}).output, OnCopy({"tree"}).output);
   EXPECT_EQ(Zophotos({"ls", "A"}).output, OnCopy({"ls", "A"}).output);
 }
 
-TEST_F(ZophotosTree, SaysThatAFolderIsNotThere) {
-  ExpectNothing(Zophotos({"tree", "A/Pict"}), "zophotos: there is no folder /shares/A/Pict/\n");
+TEST_F(ZophotosTree, ReportsAMissingFolder) {
+  ExpectError(Zophotos({"tree", "A/Pict"}), 1, "zophotos: there is no folder /shares/A/Pict/\n");
 }
 
-TEST_F(ZophotosFind, LooksForAPatternWithoutWildcardsAnywhereInNames) {
+TEST_F(ZophotosFind, FindsTextWithoutWildcardsAnywhereInNames) {
   ExpectOutput(Zophotos({"find", "umm"}), "/shares/A/Pictures/Summer/\n");
   ExpectOutput(Zophotos({"find", ".jpg"}), "/shares/A/top.jpg\n"
                                            "/shares/A/Pictures/b.jpg\n"
@@ -281,44 +255,44 @@ TEST_F(ZophotosFind, LooksForAPatternWithoutWildcardsAnywhereInNames) {
                                            "/shares/B/Old/1.jpg\n");
 }
 
-TEST_F(ZophotosFind, ComparesWildcardsWithTheWholeName) {
+TEST_F(ZophotosFind, MatchesWildcardsWithTheWholeName) {
   ExpectOutput(Zophotos({"find", "[a-c].jp?"}), "/shares/A/Pictures/b.jpg\n"
                                                 "/shares/A/Pictures/Summer/a.jpg\n");
   ExpectOutput(Zophotos({"find", "S*r"}), "/shares/A/Pictures/Summer/\n");
 }
 
-TEST_F(ZophotosFind, ComparesAPatternWithASeparatorWithTheWholePath) {
+TEST_F(ZophotosFind, MatchesAPatternWithASeparatorWithTheWholePath) {
   ExpectOutput(Zophotos({"find", "/shares/*/Old/*"}), "/shares/B/Old/1.jpg\n");
   ExpectOutput(Zophotos({"find", "Pictures/S"}), "/shares/A/Pictures/Summer/\n"
                                                  "/shares/A/Pictures/Summer/a.jpg\n");
   EXPECT_EQ(1, Zophotos({"find", "Old/*"}).status);
 }
 
-TEST_F(ZophotosFind, IgnoresTheCaseOnlyWhenAsked) {
+TEST_F(ZophotosFind, IgnoresCaseOnlyOnRequest) {
   AddRows(Copy(), "'/shares/A/ÄÖ/'");
   EXPECT_EQ(1, OnCopy({"find", "TOP*"}).status);
   ExpectOutput(OnCopy({"find", "-i", "TOP*"}), "/shares/A/top.jpg\n");
   ExpectOutput(OnCopy({"find", "--ignore-case", "äö"}), "/shares/A/ÄÖ/\n");
 }
 
-TEST_F(ZophotosFind, AQuestionMarkIsACharacter) {
+TEST_F(ZophotosFind, MatchesAQuestionMarkWithOneCharacter) {
   AddRows(Copy(), "'/shares/A/ÄÖ/'");
   ExpectOutput(OnCopy({"find", "?Ö"}), "/shares/A/ÄÖ/\n");
   ExpectOutput(OnCopy({"find", "[Ä]?"}), "/shares/A/ÄÖ/\n");
 }
 
-TEST_F(ZophotosFind, MayBeginAPatternWithADash) {
+TEST_F(ZophotosFind, AcceptsAPatternThatBeginsWithADash) {
   AddRows(Copy(), "'/shares/A/-x/'");
   ExpectOutput(OnCopy({"find", "--", "-x"}), "/shares/A/-x/\n");
 }
 
-TEST_F(ZophotosFind, SaysNothingWhereNothingMatches) {
-  ExpectNothing(Zophotos({"find", "absent"}), "");
-  ExpectNothing(Zophotos({"find", "--json", "absent"}), "");
-  ExpectNothing(Zophotos({"find", "-0", "absent"}), "");
+TEST_F(ZophotosFind, PrintsNothingIfNothingMatches) {
+  ExpectError(Zophotos({"find", "absent"}), 1, "");
+  ExpectError(Zophotos({"find", "--json", "absent"}), 1, "");
+  ExpectError(Zophotos({"find", "-0", "absent"}), 1, "");
 }
 
-TEST_F(ZophotosFind, IsAnObjectALineInJson) {
+TEST_F(ZophotosFind, PrintsOneObjectPerLineInJson) {
   ExpectOutput(
       Zophotos({"find", "--json", "*r*"}),
       R"({"type":"folder","path":"/shares/","volume":"<DUMMY>","modified":"1970-01-01T00:00:00Z"})"
@@ -333,17 +307,17 @@ TEST_F(ZophotosFind, IsAnObjectALineInJson) {
       "\n");
 }
 
-/// Bytes that a file's name may have, in SQL and as they are.
+/// A file name with a control character and a byte that is not UTF-8, in SQL and as bytes.
 const std::string ODD_NAME_SQL = "CAST(x'780a1b5bff5c2e6a7067' AS TEXT)";
 const std::string ODD_NAME = "x\n\x1b[\xff\\.jpg";
 
-TEST_F(ZophotosFind, EscapesWhatATerminalOrALineCannotTake) {
+TEST_F(ZophotosFind, EscapesControlCharactersAndInvalidUtf8) {
   AddRows(Copy(), "'/shares/A/odd/'", ODD_NAME_SQL);
   ExpectOutput(OnCopy({"find", "x*"}), R"(/shares/A/odd/x\x0a\x1b[\xff\\.jpg)"
                                        "\n");
 }
 
-TEST_F(ZophotosFind, EscapesCharactersThatCannotBeSeen) {
+TEST_F(ZophotosFind, EscapesInvisibleCharacters) {
   const Database copy = Copy();
   const std::vector<std::pair<std::string, std::string>> names = {
       {"\u00AD", R"(\xc2\xad)"},
@@ -358,20 +332,20 @@ TEST_F(ZophotosFind, EscapesCharactersThatCannotBeSeen) {
     copy.Run("UPDATE Files SET name = ?1 WHERE name = 'top.jpg' OR name LIKE '%.x'", {name + ".x"});
     ExpectOutput(OnCopy({"find", "*.x"}), "/shares/A/" + escaped + ".x\n");
   }
-  // A family's joiners, the selector of a picture, and that of a Chinese character's form.
+  // A joiner in an emoji, and variation selectors of an emoji and of a Chinese character.
   for (const char* const name : {"👩‍👧.x", "❤️.x", "葛\U000E0100.x", "ü.x"}) {
     copy.Run("UPDATE Files SET name = ? WHERE name LIKE '%.x'", {name});
     ExpectOutput(OnCopy({"find", "*.x"}), "/shares/A/" + std::string(name) + "\n");
   }
 }
 
-TEST_F(ZophotosFind, PrintsPathsAsTheyAreWithANullBehind) {
+TEST_F(ZophotosFind, PrintsUnescapedPathsEndedByNul) {
   AddRows(Copy(), "'/shares/A/odd/'", ODD_NAME_SQL);
   ExpectOutput(OnCopy({"find", "-0", "x*"}), "/shares/A/odd/" + ODD_NAME + '\0');
   ExpectOutput(OnCopy({"find", "--null", "odd"}), std::string("/shares/A/odd/") + '\0');
 }
 
-TEST_F(ZophotosFind, GoesInTheOrderOfPaths) {
+TEST_F(ZophotosFind, OrdersResultsByPath) {
   const Database copy = Copy();
   AddRows(copy, "'/shares/A/z/'", "'2'");
   AddRows(copy, "'/shares/A/m/'", "'3'");
@@ -393,7 +367,7 @@ TEST_F(ZophotosExport, WritesCsvWithAHeading) {
       "\n");
 }
 
-TEST_F(ZophotosExport, WritesAnObjectALine) {
+TEST_F(ZophotosExport, WritesOneJsonObjectPerLine) {
   const Outcome outcome = Zophotos({"export", "--jsonl"});
   EXPECT_EQ(0, outcome.status);
   EXPECT_THAT(
@@ -406,7 +380,7 @@ TEST_F(ZophotosExport, WritesAnObjectALine) {
   EXPECT_EQ(outcome.output, Zophotos({"export", "--json"}).output);
 }
 
-TEST_F(ZophotosExport, QuotesWhatMeansSomethingInCsv) {
+TEST_F(ZophotosExport, QuotesSpecialCharactersInCsv) {
   const Database copy = Copy();
   copy.Run("DELETE FROM Files");
   AddRows(copy, "'/shares/A/1,\"/'", "'say \"hi\", you'");
@@ -421,7 +395,7 @@ TEST_F(ZophotosExport, QuotesWhatMeansSomethingInCsv) {
                                                 "\"/shares/A/4/n\uFFFD\rl" + rest);
 }
 
-TEST_F(ZophotosExport, EscapesWhatMeansSomethingInJson) {
+TEST_F(ZophotosExport, EscapesSpecialCharactersInJson) {
   const Database copy = Copy();
   copy.Run("DELETE FROM Files");
   AddRows(copy, "'/shares/A/1/'", ODD_NAME_SQL);
@@ -436,7 +410,7 @@ TEST_F(ZophotosExport, EscapesWhatMeansSomethingInJson) {
                                                   R"(\"l😀)" + rest);
 }
 
-TEST_F(ZophotosExport, LeavesOutTimesThatNoCalendarHas) {
+TEST_F(ZophotosExport, LeavesOutTimesOutsideTheCalendar) {
   const Database copy = Copy();
   copy.Run("UPDATE Files SET modified_date = -62135596800, created_date = 253402300799 WHERE name "
            "= 'top.jpg'");

@@ -15,21 +15,21 @@
 namespace orva::catalog {
 namespace {
 
-void MakeHome(const std::string& mountPoint) {
+void CreateHome(const std::string& mountPoint) {
   const std::string home = core::GetORVA_HOME(mountPoint);
   std::error_code error;
   std::filesystem::create_directory(home, error);
   if (error) {
-    throw util::Exception(home + ": " + error.message(), __FILE__, __LINE__);
+    throw util::Exception(home + ": " + error.message());
   }
 }
 
 } // namespace
 
 std::unique_ptr<db::VolumeDB> OpenCatalog(const std::string& mountPoint) {
-  MakeHome(mountPoint);
+  CreateHome(mountPoint);
   auto catalog = std::make_unique<db::VolumeDB>(mountPoint, true);
-  // Readers go on reading the last complete state while a run writes.
+  // Readers continue to see the last committed state while a run writes.
   SelectNumber(*catalog, "PRAGMA journal_mode = WAL");
   Execute(*catalog, "PRAGMA cache_size = -65536");
   CreateSchema(*catalog);
@@ -37,10 +37,10 @@ std::unique_ptr<db::VolumeDB> OpenCatalog(const std::string& mountPoint) {
 }
 
 void CreateSchema(const db::DB& catalog) {
-  db::Transaction transaction(catalog, BUSY_TIMEOUT, __FILE__, __LINE__);
+  db::Transaction transaction(catalog, BUSY_TIMEOUT);
   CreateTables(catalog);
-  CreateIndices(catalog);
-  transaction.Commit(__FILE__, __LINE__);
+  CreateIndexes(catalog);
+  transaction.Commit();
 }
 
 void CreateTables(const db::DB& catalog) {
@@ -81,7 +81,7 @@ void CreateTables(const db::DB& catalog) {
                    "lastUpdatedDate INTEGER NOT NULL)");
 }
 
-void CreateIndices(const db::DB& catalog) {
+void CreateIndexes(const db::DB& catalog) {
   Execute(catalog, "CREATE UNIQUE INDEX IF NOT EXISTS Folders_path ON Folders(path)");
   Execute(catalog, "CREATE INDEX IF NOT EXISTS Folders_folderId ON Folders(folderId)");
   Execute(catalog, "CREATE UNIQUE INDEX IF NOT EXISTS Files_path ON Files(path)");

@@ -10,32 +10,32 @@ class VolumeDB;
 } // namespace orva::db
 
 // The media catalog of a volume; doc/catalog.md describes it. Failures of the database are thrown
-// as std::string, others as orva::util::Exception. One thread for each connection.
+// as std::string, others as orva::util::Exception. Each connection belongs to one thread.
 namespace orva::catalog {
 
 /// How long a transaction waits for another indexer, in milliseconds.
 inline constexpr unsigned BUSY_TIMEOUT = 5000;
 
-/// Opens the catalog of the volume at `mountPoint` for writing, with its folder and schema, which
-/// are made where they are missing.
+/// Opens the catalog of the volume at `mountPoint` for writing. Creates its folder and its schema
+/// if they are missing.
 std::unique_ptr<db::VolumeDB> OpenCatalog(const std::string& mountPoint);
 
-/// Creates the tables and indices that are missing.
+/// Creates the tables and indexes that are missing.
 void CreateSchema(const db::DB& catalog);
 
-/// The two halves of CreateSchema: rows go in faster while the indices are not there.
+/// The two halves of CreateSchema: rows are inserted faster while there are no indexes.
 void CreateTables(const db::DB& catalog);
-void CreateIndices(const db::DB& catalog);
+void CreateIndexes(const db::DB& catalog);
 
-/// Drops the tables with everything in them.
+/// Drops the tables and their content.
 void DropTables(const db::DB& catalog);
 
-/// The stamp for changes made at `now`: later than every stamp in the catalog, even within one
-/// second or after the clock was set back, so that a reader that has seen all of those sees these.
+/// The stamp for changes made at `now`. It is later than every stamp in the catalog, also within
+/// one second and after the clock was set back: a reader looks for later stamps than it has seen.
 std::time_t NextStamp(const db::DB& catalog, std::time_t now);
 
-/// Moves what was committed from the write-ahead log into the catalog's file, unless a reader
-/// holds on to it: a volume that is made read only next is then readable without the log.
+/// Moves all commits from the write-ahead log into the catalog's file, unless a reader still needs
+/// the log. A volume that is mounted read-only afterwards can then be read without it.
 void Checkpoint(const db::DB& catalog);
 
 } // namespace orva::catalog

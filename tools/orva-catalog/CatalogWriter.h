@@ -8,10 +8,10 @@ class File;
 class Folder;
 } // namespace orva::db
 
-// Rows of a catalog. On the connection's thread; failures are thrown as std::string.
+// Writes rows of a catalog. On the connection's thread; failures are thrown as std::string.
 namespace orva::catalog {
 
-/// The transcoding profile whose renditions the photo database takes.
+/// The transcoding profile that the photo database reads.
 inline constexpr char PROFILE[] = "cb62bbdd389b48898f2e5244977cb2c5";
 
 /// Files.status and Folders.status.
@@ -20,15 +20,14 @@ enum ItemStatus : int { INDEXED = 1, RENDERED = 3 };
 /// Transcodings.status.
 enum TranscodingStatus : int { WITHDRAWN = 0, FINISHED = 1 };
 
-/// Writes the row `folder.id`, new or in the place of the old one; `folder.path` is relative to
-/// the volume and ends in "/".
+/// Inserts or replaces the row `folder.id`. `folder.path` is relative to the volume and ends in
+/// "/".
 void StoreFolder(const db::DB& catalog, const db::Folder& folder);
 
-/// Writes the row `file.id`, new or in the place of the old one; `file.path` is relative to the
-/// volume.
+/// Inserts or replaces the row `file.id`. `file.path` is relative to the volume.
 void StoreFile(const db::DB& catalog, const db::File& file);
 
-/// Writes the file's transcoding for PROFILE, new or in the place of the old one.
+/// Inserts or replaces the file's transcoding for PROFILE.
 void StoreTranscoding(const db::DB& catalog, long long fileId, TranscodingStatus status,
                       std::time_t stamp);
 

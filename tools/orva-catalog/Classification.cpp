@@ -16,37 +16,34 @@ constexpr std::array MUSIC_EXTENSIONS = {"aac"sv, "aif"sv, "aiff"sv, "flac"sv, "
 constexpr std::array VIDEO_EXTENSIONS = {"3gp"sv, "avi"sv,  "m2ts"sv, "m4v"sv, "mkv"sv,  "mov"sv,
                                          "mp4"sv, "mpeg"sv, "mpg"sv,  "mts"sv, "webm"sv, "wmv"sv};
 
-// What operating systems leave on a volume for themselves.
+// Files and folders that operating systems create on a volume.
 constexpr std::array SYSTEM_NAMES = {
     "$recycle.bin"sv,      ".ds_store"sv,   ".spotlight-v100"sv, ".trashes"sv,
     "albumartsmall.jpg"sv, "desktop.ini"sv, "lost+found"sv,      "system volume information"sv,
     "thumbs.db"sv};
 
-// Halves of files that some systems split in two; their names end like the original's.
+// Some systems store the second half of a file under its name with this prefix.
 constexpr std::string_view RESOURCE_PREFIX = "._";
 
 constexpr std::array BACKUP_SUFFIXES = {"~"sv, ".bak"sv};
 
 std::string LowerCase(std::string_view text) {
   std::string result(text);
-  std::transform(result.begin(), result.end(), result.begin(), [](char c) {
+  std::ranges::transform(result, result.begin(), [](char c) {
     return c >= 'A' && c <= 'Z' ? static_cast<char>(c - 'A' + 'a') : c;
   });
   return result;
 }
 
 bool Contains(const auto& list, std::string_view name) {
-  return std::find(list.begin(), list.end(), name) != list.end();
+  return std::ranges::find(list, name) != list.end();
 }
 
-/// The length of the suffix that makes a backup of `name` (in lower case); 0 when there is none.
+/// The length of the suffix that marks `name` (in lower case) as a backup; 0 when there is none.
 std::size_t BackupSuffix(std::string_view name) {
-  for (const std::string_view suffix : BACKUP_SUFFIXES) {
-    if (name.ends_with(suffix)) {
-      return suffix.size();
-    }
-  }
-  return 0;
+  const auto* const suffix = std::ranges::find_if(
+      BACKUP_SUFFIXES, [name](std::string_view candidate) { return name.ends_with(candidate); });
+  return suffix == BACKUP_SUFFIXES.end() ? 0 : suffix->size();
 }
 
 } // namespace
@@ -63,7 +60,7 @@ std::string ExtensionOf(std::string_view name) {
   std::string lower = LowerCase(name);
   lower.resize(lower.size() - BackupSuffix(lower));
   const std::size_t dot = lower.rfind('.');
-  // A leading dot hides a name, it does not begin an extension.
+  // A leading dot hides the file; it does not start an extension.
   return dot == std::string::npos || dot == 0 ? std::string() : lower.substr(dot + 1);
 }
 

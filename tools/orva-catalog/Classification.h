@@ -3,8 +3,8 @@
 #include <string>
 #include <string_view>
 
-// What a catalog says about a file or folder by its name alone. Names are byte strings; the case
-// of ASCII letters does not matter.
+// What a catalog derives from the name of a file or folder. Names are byte strings; the case of
+// ASCII letters does not matter.
 namespace orva::catalog {
 
 /// Folders.category and Files.category.
@@ -19,11 +19,11 @@ struct Flags {
   bool operator==(const Flags&) const = default;
 };
 
-/// The flags of something called `name` in a folder with the flags `folder`: what is below a
-/// hidden, backup or system folder is so too.
+/// The flags of a file or folder called `name` in a folder with the flags `folder`, which it
+/// inherits.
 Flags FlagsOf(std::string_view name, const Flags& folder);
 
-/// The extension in lower case, without its dot; that of a backup is the original's.
+/// The extension in lower case, without its dot. A backup has the extension of its original.
 std::string ExtensionOf(std::string_view name);
 
 /// The category of files with this extension (as ExtensionOf gives it).

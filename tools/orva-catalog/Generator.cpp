@@ -20,8 +20,8 @@ namespace {
 constexpr long long TREE_WIDTH = 8;
 constexpr std::time_t FIRST_MODIFIED = 1'500'000'000;
 
-/// Number of the folder (from 0) that contains folder `number`; -1 for the root of the volume.
-/// The folders of a tree are counted level by level.
+/// Number of the folder that contains folder `number`; -1 for the root of the volume. Folders are
+/// numbered from 0, level by level.
 long long ParentOf(long long number, Tree tree) {
   return tree == Tree::Flat ? -1 : number / TREE_WIDTH - 1;
 }
@@ -63,7 +63,7 @@ private:
     paths_.push_back(folder.path);
   }
 
-  /// Adds the photo `number` of the catalog, which is the one at `place` in its folder.
+  /// Adds photo `number` of the catalog, number `place` in its folder; both count from 0.
   void AddPhoto(long long folder, long long number, long long place) {
     db::File file;
     file.id = number + 1;
@@ -84,27 +84,27 @@ private:
   const db::DB& catalog_;
   const GeneratorPlan& plan_;
   const std::time_t stamp_;
-  std::vector<std::string> paths_; ///< of the folders, by number
+  std::vector<std::string> paths_; ///< of the folders, indexed by their number
 };
 
 } // namespace
 
 long long Generate(const db::DB& catalog, const GeneratorPlan& plan, std::time_t now) {
-  db::Transaction transaction(catalog, BUSY_TIMEOUT, __FILE__, __LINE__);
+  db::Transaction transaction(catalog, BUSY_TIMEOUT);
   const std::time_t stamp = NextStamp(catalog, now);
   DropTables(catalog);
   CreateTables(catalog);
   const long long folders = Generation(catalog, plan, stamp).Run();
-  CreateIndices(catalog);
-  transaction.Commit(__FILE__, __LINE__);
+  CreateIndexes(catalog);
+  transaction.Commit();
   return folders;
 }
 
 long long Restamp(const db::DB& catalog, std::time_t now) {
-  db::Transaction transaction(catalog, BUSY_TIMEOUT, __FILE__, __LINE__);
+  db::Transaction transaction(catalog, BUSY_TIMEOUT);
   Execute(catalog, "UPDATE Transcodings SET lastUpdatedDate = ?", NextStamp(catalog, now));
   const long long count = SelectNumber(catalog, "SELECT count(*) FROM Transcodings");
-  transaction.Commit(__FILE__, __LINE__);
+  transaction.Commit();
   return count;
 }
 

@@ -6,24 +6,24 @@ namespace orva::db {
 class DB;
 } // namespace orva::db
 
-// Catalogs of any size without a file on the volume. On the catalog's thread, each in one
-// transaction; failures are thrown as std::string.
+// Makes catalogs of any size for files that do not exist. Each function writes in one transaction,
+// on the catalog's thread; failures are thrown as std::string.
 namespace orva::catalog {
 
-/// What the photos of a generated catalog are called.
+/// The file names in a generated catalog.
 enum class Names {
-  Unique, ///< every photo differently
-  Camera, ///< the same in every folder, as cameras count them
+  Unique, ///< every photo has its own name
+  Camera, ///< every folder has the same names, numbered as cameras do
 };
 
-/// How the folders of a generated catalog lie.
+/// The folder tree of a generated catalog.
 enum class Tree {
-  Flat, ///< all directly below the root
-  Deep, ///< each with eight folders below it, with photos on every level
+  Flat, ///< all folders are directly below the root
+  Deep, ///< each folder contains eight more, and photos
 };
 
-/// The content of a generated catalog: `files` rendered photos, `perFolder` in each folder but
-/// the last.
+/// The content of a generated catalog: `files` rendered photos, `perFolder` of them in each folder;
+/// the last folder may have fewer.
 struct GeneratorPlan {
   long long files = 0;
   long long perFolder = 1; ///< at least 1
@@ -31,11 +31,11 @@ struct GeneratorPlan {
   Tree tree = Tree::Flat;
 };
 
-/// Replaces the content of `catalog` by what `plan` says. The same plan gives the same rows; only
-/// their stamp moves on. Returns the number of folders.
+/// Replaces the content of `catalog` by what `plan` says. The same plan gives the same rows, with a
+/// later stamp. Returns the number of folders.
 long long Generate(const db::DB& catalog, const GeneratorPlan& plan, std::time_t now);
 
-/// Stamps every transcoding anew, as if all had been rendered again. Returns their number.
+/// Gives every transcoding a new stamp, as if all had been rendered again. Returns their number.
 long long Restamp(const db::DB& catalog, std::time_t now);
 
 } // namespace orva::catalog

@@ -23,7 +23,7 @@
 namespace orva::catalog {
 namespace {
 
-/// True for the product's own folders in the root of a volume, which are no content.
+/// True for the product's own folders in the root of a volume, which are not indexed.
 bool IsProductData(const std::string& path) {
   return path == core::GetORVA_HOME("") || path == ".zophotos";
 }
@@ -35,26 +35,29 @@ Indexer::Indexer(const db::DB& catalog, std::string mountPoint, std::time_t now,
       progress_(std::move(progress)) {}
 
 IndexSummary Indexer::Run() {
-  db::Transaction transaction(catalog_, BUSY_TIMEOUT, __FILE__, __LINE__);
+  db::Transaction transaction(catalog_, BUSY_TIMEOUT);
   stamp_ = NextStamp(catalog_, now_);
   LoadRows();
   Visit(Place());
   DeleteVanished();
-  transaction.Commit(__FILE__, __LINE__);
+  transaction.Commit();
   return summary_;
 }
 
 void Indexer::LoadRows() {
   ForEachRow(catalog_, "SELECT path, id, lastModifiedDate, isDeleted FROM Folders",
              [this](const db::Statement& row) {
-               folders_.emplace(row.GetText(0), KnownFolder{row.GetInt64(1), row.GetTime(2),
-                                                            row.GetBool(3), false});
+               folders_.emplace(row.GetText(0), KnownFolder{.id = row.GetInt64(1),
+                                                            .lastModifiedDate = row.GetTime(2),
+                                                            .isDeleted = row.GetBool(3)});
                nextFolderId_ = std::max(nextFolderId_, row.GetInt64(1) + 1);
              });
   ForEachRow(catalog_, "SELECT path, id, lastModifiedDate, size, isDeleted FROM Files",
              [this](const db::Statement& row) {
-               files_.emplace(row.GetText(0), KnownFile{row.GetInt64(1), row.GetTime(2),
-                                                        row.GetInt64(3), row.GetBool(4), false});
+               files_.emplace(row.GetText(0), KnownFile{.id = row.GetInt64(1),
+                                                        .lastModifiedDate = row.GetTime(2),
+                                                        .size = row.GetInt64(3),
+                                                        .isDeleted = row.GetBool(4)});
                nextFileId_ = std::max(nextFileId_, row.GetInt64(1) + 1);
              });
 }
@@ -83,13 +86,12 @@ std::vector<Indexer::Entry> Indexer::List(const Place& place) {
     }
     iterator.increment(error);
   }
-  // A folder may go away meanwhile, and all that was in it; the volume itself must not.
+  // A folder may disappear during the run, with all that was in it; the volume must not.
   if (error && (error.value() != ENOENT || place.path.empty())) {
     LeaveAlone(place.path, error.message());
   }
 
-  std::sort(entries.begin(), entries.end(),
-            [](const Entry& a, const Entry& b) { return a.name < b.name; });
+  std::ranges::sort(entries, {}, &Entry::name);
   return entries;
 }
 
@@ -101,16 +103,19 @@ void Indexer::Examine(const std::string& path, const std::string& name,
       LeaveAlone(path, std::generic_category().message(errno));
     }
   } else if (S_ISDIR(found.st_mode) || S_ISREG(found.st_mode)) {
-    entries.push_back({name, S_ISDIR(found.st_mode), found.st_mtime, found.st_size});
+    entries.push_back({.name = name,
+                       .isFolder = S_ISDIR(found.st_mode),
+                       .lastModifiedDate = found.st_mtime,
+                       .size = found.st_size});
   }
 }
 
 Indexer::Place Indexer::UpdateFolder(const Place& parent, const Entry& entry) {
-  Place place{-1, parent.path + entry.name + '/', FlagsOf(entry.name, parent.flags), false};
+  Place place{.path = parent.path + entry.name + '/', .flags = FlagsOf(entry.name, parent.flags)};
   ++summary_.folders;
 
   const auto [position, isNew] = folders_.try_emplace(
-      place.path, KnownFolder{nextFolderId_, entry.lastModifiedDate, false, false});
+      place.path, KnownFolder{.id = nextFolderId_, .lastModifiedDate = entry.lastModifiedDate});
   KnownFolder& known = position->second;
   known.seen = true;
   place.id = known.id;
@@ -148,7 +153,8 @@ void Indexer::UpdateFile(const Place& folder, const Entry& entry) {
   }
 
   const auto [position, isNew] = files_.try_emplace(
-      file.path, KnownFile{nextFileId_, entry.lastModifiedDate, entry.size, false, false});
+      file.path,
+      KnownFile{.id = nextFileId_, .lastModifiedDate = entry.lastModifiedDate, .size = entry.size});
   KnownFile& known = position->second;
   known.seen = true;
   if (isNew) {
@@ -159,8 +165,8 @@ void Indexer::UpdateFile(const Place& folder, const Entry& entry) {
   } else if (known.lastModifiedDate != entry.lastModifiedDate || known.size != entry.size) {
     ++summary_.changed;
   } else if (!folder.revived) {
-    // What is in a folder that came back has left the photo database with it: such files are
-    // written again although nothing about them has changed.
+    // When a folder was deleted, its files left the photo database, too. When it comes back, they
+    // are written again although they have not changed.
     return;
   }
 
@@ -205,14 +211,14 @@ void Indexer::DeleteVanished() {
 void Indexer::LeaveAlone(const std::string& path, const std::string& reason) {
   const std::string message = util::MakePath(mountPoint_, path) + ": " + reason;
   if (path.empty()) {
-    throw util::Exception(message, __FILE__, __LINE__);
+    throw util::Exception(message);
   }
   summary_.unreadable.push_back(message);
   leftAlone_.push_back(path.ends_with('/') ? path.substr(0, path.size() - 1) : path);
 }
 
 bool Indexer::IsLeftAlone(const std::string& path) const {
-  return std::any_of(leftAlone_.begin(), leftAlone_.end(), [&path](const std::string& prefix) {
+  return std::ranges::any_of(leftAlone_, [&path](const std::string& prefix) {
     return path.starts_with(prefix) && (path.size() == prefix.size() || path[prefix.size()] == '/');
   });
 }

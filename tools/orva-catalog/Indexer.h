@@ -14,31 +14,31 @@ class DB;
 
 namespace orva::catalog {
 
-/// What a run found and did.
+/// What a run found and changed.
 struct IndexSummary {
   long long folders = 0; ///< on the volume
   long long files = 0;   ///< on the volume
   long long photos = 0;  ///< of the files
 
-  // Of the files, by this run.
+  // Numbers of files that this run changed.
   long long added = 0;
   long long changed = 0;
   long long deleted = 0;
   long long revived = 0;
 
-  /// A message for each folder or file that could not be read. What the catalog says about it and
-  /// what is below it was left alone: it is not known to be gone.
+  /// A message for each folder or file that could not be read. Its rows and those of what is below
+  /// it are unchanged, because it may still exist.
   std::vector<std::string> unreadable;
 };
 
-/// Brings the catalog of a volume up to date with what is on it: one object, one run, on the
-/// catalog's thread. Links are not followed; other file systems mounted below are.
+/// Brings the catalog of a volume up to date with the files on it. An object makes one run, on the
+/// catalog's thread. Links are not followed; file systems mounted below the volume are.
 class Indexer {
 public:
-  /// Told of the counts so far, folder by folder.
+  /// Called after each folder with the counts so far.
   using Progress = std::function<void(const IndexSummary&)>;
 
-  /// `catalog` is open for writing, has its schema, and outlives the indexer; `mountPoint` is the
+  /// `catalog` is open for writing, has its schema and outlives the indexer. `mountPoint` is the
   /// volume that it describes; `now` is the time of the run.
   Indexer(const db::DB& catalog, std::string mountPoint, std::time_t now, Progress progress = {});
 
@@ -47,32 +47,32 @@ public:
   IndexSummary Run();
 
 private:
-  /// What the catalog knew of a path, and what the run has found out.
+  /// What the catalog says about a path, and whether the run has seen it.
   struct KnownFolder {
-    long long id;
-    std::time_t lastModifiedDate;
-    bool isDeleted;
-    bool seen;
+    long long id = 0;
+    std::time_t lastModifiedDate = 0;
+    bool isDeleted = false;
+    bool seen = false;
   };
   struct KnownFile {
-    long long id;
-    std::time_t lastModifiedDate;
-    long long size;
-    bool isDeleted;
-    bool seen;
+    long long id = 0;
+    std::time_t lastModifiedDate = 0;
+    long long size = 0;
+    bool isDeleted = false;
+    bool seen = false;
   };
-  /// A name in a folder.
+  /// A file or folder found in a folder.
   struct Entry {
     std::string name;
-    bool isFolder;
-    std::time_t lastModifiedDate;
-    long long size;
+    bool isFolder = false;
+    std::time_t lastModifiedDate = 0;
+    long long size = 0;
   };
-  /// A folder that is being walked; the volume itself has no row and an empty path.
+  /// A folder that is being walked. The root of the volume has no row and an empty path.
   struct Place {
     long long id = -1;
     std::string path;
-    Flags flags;
+    Flags flags{};
     bool revived = false;
   };
 

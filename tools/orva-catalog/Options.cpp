@@ -1,131 +1,108 @@
 #include "Options.h"
 
-#include <algorithm>
-#include <charconv>
-#include <utility>
+#include "commandline/Parse.h"
 
 namespace orva::catalog {
 namespace {
 
-// More would only overflow the arithmetic; no volume comes near.
+using commandline::Decimal;
+
+// More would overflow the arithmetic; no volume has so many files.
 constexpr long long MAXIMUM_COUNT = 1'000'000'000;
 
-long long ParseCount(const std::string& option, const std::string& text, long long minimum) {
-  long long count = 0;
-  const char* const end = text.data() + text.size();
-  const auto [stop, error] = std::from_chars(text.data(), end, count);
-  if (error != std::errc() || stop != end || count < minimum || count > MAXIMUM_COUNT) {
-    throw UsageError(option + " takes a number from " + std::to_string(minimum) + " to " +
-                     std::to_string(MAXIMUM_COUNT) + ", not \"" + text + "\"");
+class Parser {
+public:
+  Parser() {
+    app_.require_subcommand(0, 1);
+    app_.fallthrough();
+    app_.set_version_flag("--version", "orva-catalog " ORVA_CATALOG_VERSION);
+    app_.option_defaults()->multi_option_policy(CLI::MultiOptionPolicy::TakeLast);
+    app_.footer(
+        "Exit status: 0 done; 1 failed, the catalog's content is unchanged; 2 wrong command "
+        "line.\nSee orva-catalog(1).");
+    AddIndex();
+    AddGenerate();
   }
-  return count;
-}
 
-template <typename Choice>
-Choice ParseChoice(const std::string& option, const std::string& text,
-                   std::pair<const char*, Choice> first, std::pair<const char*, Choice> second) {
-  if (text == first.first) {
-    return first.second;
+  std::optional<Options> Parse(const std::vector<std::string>& arguments) {
+    if (!commandline::Parse(app_, arguments)) {
+      return std::nullopt;
+    }
+    if (generate_->parsed()) {
+      options_.command = restamp_ ? Command::Restamp : Command::Generate;
+      options_.plan.names = names_ == "camera" ? Names::Camera : Names::Unique;
+      options_.plan.tree = tree_ == "deep" ? Tree::Deep : Tree::Flat;
+    }
+    return options_;
   }
-  if (text == second.first) {
-    return second.second;
-  }
-  throw UsageError(option + " takes " + first.first + " or " + second.first + ", not \"" + text +
-                   "\"");
-}
 
-void SetGenerateOption(GeneratorPlan& plan, const std::string& option, const std::string& value) {
-  if (option == "--files") {
-    plan.files = ParseCount(option, value, 0);
-  } else if (option == "--per-folder") {
-    plan.perFolder = ParseCount(option, value, 1);
-  } else if (option == "--names") {
-    plan.names =
-        ParseChoice<Names>(option, value, {"unique", Names::Unique}, {"camera", Names::Camera});
-  } else if (option == "--tree") {
-    plan.tree = ParseChoice<Tree>(option, value, {"flat", Tree::Flat}, {"deep", Tree::Deep});
-  } else {
-    throw UsageError("unknown option \"" + option + "\"");
+private:
+  void AddIndex() {
+    CLI::App* const index =
+        app_.add_subcommand("index", "Bring the catalog up to date with the files on the volume");
+    AddMountPoint(*index);
+    index->footer(
+        "New and changed photos get a finished transcoding. Files that are gone are marked "
+        "deleted.\nLinks are not followed. What is mounted below MOUNT belongs to the "
+        "volume.");
   }
-}
 
-/// Reads the options of generate, which follow the mount point.
-void ParseGenerate(const std::vector<std::string>& arguments, Options& options) {
-  std::vector<std::string> missing = {"--files", "--per-folder", "--names", "--tree"};
-  for (std::size_t i = 2; i < arguments.size(); ++i) {
-    const std::string& option = arguments[i];
-    if (option == "--restamp") {
-      options.command = Command::Restamp;
-      continue;
-    }
-    if (!option.starts_with("--")) {
-      throw UsageError("unexpected argument \"" + option + "\"");
-    }
-    if (i + 1 == arguments.size()) {
-      throw UsageError(option + " needs a value");
-    }
-    SetGenerateOption(options.plan, option, arguments[++i]);
-    std::erase(missing, option);
+  void AddGenerate() {
+    generate_ = app_.add_subcommand("generate",
+                                    "Replace the catalog's content by photos that need not exist");
+    AddMountPoint(*generate_);
+    const std::vector<CLI::Option*> plan{
+        generate_->add_option("--files", options_.plan.files, "Number of photos")
+            ->type_name("NUMBER")
+            ->transform(Decimal(0, MAXIMUM_COUNT)),
+        generate_->add_option("--per-folder", options_.plan.perFolder, "Photos in each folder")
+            ->type_name("NUMBER")
+            ->transform(Decimal(1, MAXIMUM_COUNT)),
+        generate_
+            ->add_option("--names", names_,
+                         "unique: every photo has its own name;\n"
+                         "camera: every folder has the same names, IMG_0001.JPG and so on")
+            ->option_text("unique|camera")
+            ->check(CLI::IsMember({"unique", "camera"})),
+        generate_
+            ->add_option("--tree", tree_,
+                         "flat: all folders are directly in the volume;\n"
+                         "deep: every folder contains eight more")
+            ->option_text("flat|deep")
+            ->check(CLI::IsMember({"flat", "deep"}))};
+    generate_->add_flag("--restamp", restamp_,
+                        "Keep the content; give every transcoding a new stamp");
+    generate_->footer("Without --restamp, all other options are required.");
+    generate_->callback([this, plan] {
+      const auto missing = std::ranges::find_if(
+          plan, [](const CLI::Option* option) { return option->count() == 0; });
+      if (!restamp_ && missing != plan.end()) {
+        throw CLI::RequiredError((*missing)->get_name());
+      }
+    });
   }
-  if (options.command == Command::Generate && !missing.empty()) {
-    throw UsageError("generate needs " + missing.front());
+
+  void AddMountPoint(CLI::App& command) {
+    command.add_option("MOUNT", options_.mountPoint, "Mount point of the volume")
+        ->required()
+        ->type_name("")
+        ->check(commandline::NotEmpty());
   }
-}
+
+  CLI::App app_{
+      "Fills the media catalog of a volume, as the appliance's indexer and transcoder do.",
+      "orva-catalog"};
+  CLI::App* generate_ = nullptr; // belongs to app_
+  Options options_;
+  std::string names_;
+  std::string tree_;
+  bool restamp_ = false;
+};
 
 } // namespace
 
-const char* const HELP =
-    R"(Usage: orva-catalog index MOUNT
-       orva-catalog generate MOUNT --files N --per-folder M
-                    --names unique|camera --tree flat|deep
-       orva-catalog generate MOUNT --restamp
-       orva-catalog --help
-
-Fills the media catalog of the volume mounted at MOUNT, as the appliance's indexer and
-transcoder do.
-
-index     walks the volume and brings the catalog up to date: new and changed photos
-          are entered with a finished transcoding, vanished ones are marked deleted.
-          Links are not followed; what is mounted below MOUNT belongs to the volume.
-generate  replaces the catalog's content by N photos that need not exist, M to a folder.
-  --names unique   every photo has a name of its own
-  --names camera   the same names in every folder: IMG_0001.JPG, IMG_0002.JPG, ...
-  --tree flat      all folders lie directly in the volume
-  --tree deep      every folder holds eight further ones
-  --restamp        leaves the content alone and stamps every transcoding anew
-
-Exit status: 0 when done, 1 after a failure, which leaves the catalog's content as it was,
-2 when the arguments make no sense.
-)";
-
-Options ParseOptions(const std::vector<std::string>& arguments) {
-  Options options;
-  if (std::find(arguments.begin(), arguments.end(), "--help") != arguments.end()) {
-    return options;
-  }
-  if (arguments.empty()) {
-    throw UsageError("index or generate?");
-  }
-
-  if (arguments[0] == "index") {
-    options.command = Command::Index;
-  } else if (arguments[0] == "generate") {
-    options.command = Command::Generate;
-  } else {
-    throw UsageError("unknown command \"" + arguments[0] + "\"");
-  }
-
-  if (arguments.size() < 2 || arguments[1].empty() || arguments[1].starts_with("--")) {
-    throw UsageError(arguments[0] + " needs the mount point of a volume");
-  }
-  options.mountPoint = arguments[1];
-
-  if (options.command == Command::Generate) {
-    ParseGenerate(arguments, options);
-  } else if (arguments.size() > 2) {
-    throw UsageError("unexpected argument \"" + arguments[2] + "\"");
-  }
-  return options;
+std::optional<Options> ParseOptions(const std::vector<std::string>& arguments) {
+  return Parser().Parse(arguments);
 }
 
 } // namespace orva::catalog

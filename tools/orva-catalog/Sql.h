@@ -8,8 +8,8 @@
 
 namespace orva::catalog {
 
-/// A statement's text together with the place that uses it, which error messages name. Made
-/// from a string literal on the spot, therefore not explicit.
+/// A statement's text and the place in the source that uses it, for error messages. Not explicit,
+/// so that a call can pass a string literal.
 struct Sql {
   Sql(const char* sql, const char* callersFile = __builtin_FILE(),
       unsigned callersLine = __builtin_LINE()) noexcept

@@ -3,6 +3,8 @@
 #include "Indexer.h"
 #include "Options.h"
 
+#include "commandline/UsageError.h"
+
 #include "orvadb/VolumeDB.h"
 
 #include "orvautil/Core.h"
@@ -23,16 +25,16 @@ namespace {
 
 using namespace orva;
 
-/// The volume's mount point without links; throws when it is no directory.
+/// The volume's mount point with all links resolved. Throws when it is not a directory.
 std::string FindVolume(const std::string& mountPoint) {
   std::string volume = util::Path(mountPoint).Canonicalize();
   if (volume.empty() || !std::filesystem::is_directory(volume)) {
-    throw util::Exception(mountPoint + " is not a directory", __FILE__, __LINE__);
+    throw util::Exception(mountPoint + " is not a directory");
   }
   return volume;
 }
 
-/// A line on the terminal that shows how far a run has come, gone again at its end.
+/// A line on the terminal that shows the progress of a run. It is erased at the end.
 class ProgressLine {
 public:
   ProgressLine() : isTerminal_(isatty(STDERR_FILENO) == 1) {}
@@ -87,7 +89,7 @@ void Generate(const std::string& volume, const catalog::GeneratorPlan& plan) {
 
 void Restamp(const std::string& volume) {
   if (!std::filesystem::exists(core::GetCatalogPath(volume))) {
-    throw util::Exception(volume + " has no catalog", __FILE__, __LINE__);
+    throw util::Exception(volume + " has no catalog");
   }
   const auto database = catalog::OpenCatalog(volume);
   const long long count = catalog::Restamp(*database, std::time(nullptr));
@@ -97,9 +99,6 @@ void Restamp(const std::string& volume) {
 
 void Run(const catalog::Options& options) {
   switch (options.command) {
-  case catalog::Command::Help:
-    std::cout << catalog::HELP;
-    break;
   case catalog::Command::Index:
     Index(FindVolume(options.mountPoint));
     break;
@@ -116,9 +115,11 @@ void Run(const catalog::Options& options) {
 
 int main(int argc, char** argv) {
   try {
-    Run(catalog::ParseOptions(std::vector<std::string>(argv + 1, argv + argc)));
+    if (const auto options = catalog::ParseOptions({argv + 1, argv + argc})) {
+      Run(*options);
+    }
     return 0;
-  } catch (const catalog::UsageError& error) {
+  } catch (const commandline::UsageError& error) {
     std::cerr << "orva-catalog: " << error.what() << "\nTry 'orva-catalog --help'.\n";
     return 2;
   } catch (const std::exception& error) {

@@ -23,10 +23,10 @@ void Client::Queue(const Message& message) {
 void Client::SendQueued() {
   while (IsOpen() && !queue_.empty()) {
     const std::string& first = *queue_.front();
-    const ssize_t count = send(Descriptor(), first.data() + takenOfFirst_,
-                               first.size() - takenOfFirst_, MSG_NOSIGNAL);
+    const ssize_t count =
+        send(Descriptor(), first.data() + sentOfFirst_, first.size() - sentOfFirst_, MSG_NOSIGNAL);
     if (count >= 0) {
-      Taken(static_cast<std::size_t>(count));
+      RemoveSent(static_cast<std::size_t>(count));
     } else if (IsTemporary(errno)) {
       return;
     } else {
@@ -35,12 +35,12 @@ void Client::SendQueued() {
   }
 }
 
-void Client::Taken(std::size_t count) {
+void Client::RemoveSent(std::size_t count) {
   queuedBytes_ -= count;
-  takenOfFirst_ += count;
-  if (takenOfFirst_ == queue_.front()->size()) {
+  sentOfFirst_ += count;
+  if (sentOfFirst_ == queue_.front()->size()) {
     queue_.pop_front();
-    takenOfFirst_ = 0;
+    sentOfFirst_ = 0;
   }
 }
 

@@ -1,5 +1,6 @@
 #pragma once
 
+#include "orvautil/FileDescriptor.h"
 #include "orvautil/Socket.h"
 
 #include <cstddef>
@@ -9,39 +10,40 @@
 
 namespace orva::notify {
 
-/// A message on its way, shared by the clients that it goes to.
+/// A queued message, shared by the clients that receive it.
 using Message = std::shared_ptr<const std::string>;
 
-/// Most bytes that are kept for a client that does not read them, and so the longest message.
+/// The limit of the bytes queued for a client that does not read, and thus of a message's length.
 constexpr std::size_t MAXIMUM_QUEUED_BYTES = std::size_t{64} * 1024 * 1024;
 
-/// The connection of a client, non-blocking, with what it has not taken yet. Closes itself when
-/// the client is found to be gone.
+/// The connection of a client, non-blocking, with the messages that are not sent yet. Closes itself
+/// when the client has disconnected.
 class Client : public util::Socket {
 public:
-  /// Takes over `descriptor`; `number` tells the client from others.
-  Client(int descriptor, unsigned number) : Socket(descriptor), number_(number) {}
+  /// `number` identifies the client in the output.
+  Client(util::FileDescriptor connection, unsigned number)
+      : Socket(connection.Release()), number_(number) {}
 
   unsigned Number() const noexcept { return number_; }
 
-  /// Bytes that wait for the client to read.
+  /// Number of bytes that are not sent yet.
   std::size_t QueuedBytes() const noexcept { return queuedBytes_; }
 
-  /// Puts `message` behind what waits and sends what the client takes.
+  /// Appends `message` to the queue and calls SendQueued().
   void Queue(const Message& message);
 
-  /// Sends as much of what waits as the client takes.
+  /// Sends as much of the queue as the client's buffer takes.
   void SendQueued();
 
-  /// Reads and forgets what the client says; nothing is expected but its end.
+  /// Reads and discards input, to notice when the client disconnects.
   void DiscardInput();
 
 private:
-  void Taken(std::size_t count);
+  void RemoveSent(std::size_t count);
 
   const unsigned number_;
   std::deque<Message> queue_;
-  std::size_t takenOfFirst_ = 0;
+  std::size_t sentOfFirst_ = 0;
   std::size_t queuedBytes_ = 0;
 };
 

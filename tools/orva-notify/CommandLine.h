@@ -4,7 +4,6 @@
 
 #include <chrono>
 #include <optional>
-#include <stdexcept>
 #include <string>
 #include <vector>
 
@@ -12,9 +11,9 @@ namespace orva::notify {
 
 /// What the user asked for.
 struct CommandLine {
-  enum class Action { Help, Serve, Send, Drop };
+  enum class Action { Serve, Send, Drop };
 
-  Action action = Action::Help;
+  Action action = Action::Serve;
   bool watch = false;            ///< Serve: announce mounts and unmounts too
   std::optional<Event> event;    ///< Send: nothing when the message comes from rawFile
   std::string mountPoint;        ///< Send: of the event
@@ -23,16 +22,8 @@ struct CommandLine {
   std::chrono::seconds wait{10}; ///< Send, Drop: how long the service may take
 };
 
-/// A command line that means nothing; what() says why.
-class UsageError : public std::runtime_error {
-public:
-  using std::runtime_error::runtime_error;
-};
-
-/// Reads the arguments, without the program's name. Throws UsageError.
-CommandLine ParseCommandLine(const std::vector<std::string>& arguments);
-
-/// The text of --help.
-extern const char* const HELP;
+/// Reads the arguments that follow the program's name. Returns nothing when they ask for help or
+/// the version, which are then on standard output. Throws commandline::UsageError.
+std::optional<CommandLine> ParseCommandLine(const std::vector<std::string>& arguments);
 
 } // namespace orva::notify

@@ -11,6 +11,7 @@
 #include <cerrno>
 #include <cstring>
 #include <sstream>
+#include <string_view>
 #include <vector>
 
 namespace orva::notify {
@@ -30,7 +31,7 @@ std::string Encode(const Request& request) {
          request.message;
 }
 
-/// Waits for `events` until `deadline`; false when that has passed.
+/// Waits for `events`. Returns false when `deadline` has passed.
 bool WaitFor(const util::Socket& socket, short events, Clock::time_point deadline) {
   for (;;) {
     const auto left = std::chrono::ceil<std::chrono::milliseconds>(deadline - Clock::now());
@@ -42,15 +43,13 @@ bool WaitFor(const util::Socket& socket, short events, Clock::time_point deadlin
   }
 }
 
-/// Sends `bytes`; false when the deadline has passed. A service that hangs up shows when its
-/// answer is read.
-bool SendAll(const util::Socket& socket, const std::string& bytes, Clock::time_point deadline) {
-  std::size_t sent = 0;
-  while (sent < bytes.size()) {
-    const ssize_t count =
-        send(socket.Descriptor(), bytes.data() + sent, bytes.size() - sent, MSG_NOSIGNAL);
+/// Sends `bytes`. Returns false when the deadline has passed. An error is left to ReceiveLine,
+/// which finds that the service has hung up.
+bool SendAll(const util::Socket& socket, std::string_view bytes, Clock::time_point deadline) {
+  while (!bytes.empty()) {
+    const ssize_t count = send(socket.Descriptor(), bytes.data(), bytes.size(), MSG_NOSIGNAL);
     if (count >= 0) {
-      sent += static_cast<std::size_t>(count);
+      bytes.remove_prefix(static_cast<std::size_t>(count));
     } else if (!IsTemporary(errno)) {
       return true;
     } else if (!WaitFor(socket, POLLOUT, deadline)) {
@@ -60,8 +59,8 @@ bool SendAll(const util::Socket& socket, const std::string& bytes, Clock::time_p
   return true;
 }
 
-/// The answer's line without its end; nothing when the deadline has passed. A service that hung
-/// up has answered with an empty line.
+/// The line of the answer, without its newline; nothing when the deadline has passed. The line is
+/// empty when the service has hung up.
 std::optional<std::string> ReceiveLine(util::Socket& socket, Clock::time_point deadline) {
   std::string line;
   char next = 0;
@@ -83,8 +82,7 @@ std::optional<std::string> ReceiveLine(util::Socket& socket, Clock::time_point d
           ? util::FormatString("No answer from the notification service within %lld s",
                                static_cast<long long>(wait.count()))
           : util::FormatString("Fewer than %zu clients connected within %lld s", request.clients,
-                               static_cast<long long>(wait.count())),
-      __FILE__, __LINE__);
+                               static_cast<long long>(wait.count())));
 }
 
 } // namespace
@@ -96,15 +94,13 @@ std::string ControlAddress(const std::string& address) {
 std::size_t Ask(const std::string& address, const Request& request, std::chrono::seconds wait) {
   if (request.message.size() > MAXIMUM_QUEUED_BYTES) {
     throw util::Exception(util::FormatString("A message of %zu bytes is too long, %zu are allowed",
-                                             request.message.size(), MAXIMUM_QUEUED_BYTES),
-                          __FILE__, __LINE__);
+                                             request.message.size(), MAXIMUM_QUEUED_BYTES));
   }
   const auto deadline = Clock::now() + wait;
   util::ClientSocket socket(util::Socket::Address(ControlAddress(address)), true);
   if (!socket.IsOpen()) {
     throw util::Exception(
-        util::FormatString("No orva-notify serves %s: %s", address.c_str(), strerror(errno)),
-        __FILE__, __LINE__);
+        util::FormatString("No orva-notify serves %s: %s", address.c_str(), strerror(errno)));
   }
   if (!SendAll(socket, Encode(request), deadline)) {
     ThrowTooLate(request, wait);
@@ -114,7 +110,7 @@ std::size_t Ask(const std::string& address, const Request& request, std::chrono:
     ThrowTooLate(request, wait);
   }
   if (answer->empty()) {
-    throw util::Exception("The notification service hung up without an answer", __FILE__, __LINE__);
+    throw util::Exception("The notification service hung up without an answer");
   }
   return std::stoul(*answer);
 }

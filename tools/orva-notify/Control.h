@@ -1,5 +1,6 @@
 #pragma once
 
+#include "orvautil/FileDescriptor.h"
 #include "orvautil/Socket.h"
 
 #include <chrono>
@@ -9,46 +10,45 @@
 
 namespace orva::notify {
 
-/// What the service is asked to do, on a socket of its own beside the clients'. A request goes
-/// over the wire as a line "send CLIENTS LENGTH" or "drop CLIENTS LENGTH" and LENGTH bytes of
-/// message; the answer is a line with the number of clients reached.
+/// A command to the service, on a separate control socket. It is sent as a line "send CLIENTS
+/// LENGTH" or "drop CLIENTS LENGTH" and LENGTH bytes of message. The answer is a line with the
+/// number of clients reached.
 struct Request {
   enum class Kind { Send, Drop };
 
   Kind kind = Kind::Send;
-  std::size_t clients = 0; ///< how many clients must be connected before it is done
-  std::string message;     ///< without the delimiter; empty for Drop
+  std::size_t clients = 0; ///< the service waits until so many clients are connected
+  std::string message{};   ///< without the delimiter; empty for Drop
 };
 
 /// Address of the control socket that belongs to the notification socket at `address`.
 std::string ControlAddress(const std::string& address);
 
-/// Has the service at the notification socket `address` do `request` and returns how many
-/// clients it reached. Throws util::Exception when no service listens, the message is too long,
-/// or no answer comes within `wait`.
+/// Sends `request` to the service of the notification socket `address`. Returns the number of
+/// clients reached. Throws util::Exception when no service listens, the message is too long, or
+/// there is no answer within `wait`.
 std::size_t Ask(const std::string& address, const Request& request, std::chrono::seconds wait);
 
-/// The service's end of one request, non-blocking. Closes itself when the other side is gone or
-/// says something that is no request.
+/// The service's end of one request, non-blocking. Closes itself when the other side disconnects or
+/// sends anything that is not a request.
 class ControlConnection : public util::Socket {
 public:
-  /// Takes over `descriptor`.
-  explicit ControlConnection(int descriptor) : Socket(descriptor) {}
+  explicit ControlConnection(util::FileDescriptor connection) : Socket(connection.Release()) {}
 
-  /// Reads what is there.
+  /// Reads the available input.
   void ReadAvailable();
 
   /// The request, once all of it has arrived.
   const std::optional<Request>& Received() const noexcept { return complete_; }
 
-  /// Answers that `count` clients were reached and closes the connection.
+  /// Answers that `count` clients were reached, then closes the connection.
   void Answer(std::size_t count);
 
 private:
   bool ReadHeader();
 
-  std::string input_;               ///< what has arrived and is not understood yet
-  std::optional<Request> arriving_; ///< once its header is understood
+  std::string input_;               ///< received, not parsed yet
+  std::optional<Request> arriving_; ///< once its header is parsed
   std::size_t length_ = 0;          ///< of its message
   std::optional<Request> complete_;
 };

@@ -24,7 +24,7 @@ bool IsSocket(const std::string& path) {
   return lstat(path.c_str(), &status) == 0 && S_ISSOCK(status.st_mode);
 }
 
-// What a service that was killed left behind refuses connections.
+// The socket of a service that was killed refuses connections.
 void RemoveStaleSocket(const std::string& path) {
   const util::ClientSocket probe(util::Socket::Address(path), true);
   if (!probe.IsOpen() && errno == ECONNREFUSED && IsSocket(path)) {
@@ -56,8 +56,7 @@ void ListeningSocket::Bind() {
   if (!isBound_ || listen(Descriptor(), SOMAXCONN) != 0) {
     const char* const reason =
         errno == EADDRINUSE ? "something else is there, perhaps another service" : strerror(errno);
-    throw util::Exception(util::FormatString("Cannot listen on %s: %s", address_.c_str(), reason),
-                          __FILE__, __LINE__);
+    throw util::Exception(util::FormatString("Cannot listen on %s: %s", address_.c_str(), reason));
   }
 }
 

@@ -7,18 +7,18 @@
 
 namespace orva::notify {
 
-/// A local socket that listens, non-blocking.
+/// A local socket that accepts connections, non-blocking.
 class ListeningSocket : public util::Socket {
 public:
-  /// Listens on `address`, a text for Socket::Address. Makes the directory of a path and takes
-  /// the place of a socket on which nobody listens any more. Throws util::Exception, also when
+  /// Listens on `address`, a text for Socket::Address. Creates the directory of a path, and
+  /// replaces a socket that no process listens on any more. Throws util::Exception, also when
   /// another process listens there, and std::filesystem::filesystem_error.
   explicit ListeningSocket(std::string address);
 
-  /// Takes the socket's file away.
+  /// Removes the socket's file.
   ~ListeningSocket() override;
 
-  /// The next connection that waits, non-blocking; none, with errno set, when there is none.
+  /// Accepts the next pending connection, non-blocking. Without one, returns none and sets errno.
   util::FileDescriptor Accept();
 
 private:

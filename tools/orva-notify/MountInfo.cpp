@@ -12,7 +12,7 @@ bool IsOctal(char c) {
   return c >= '0' && c <= '7';
 }
 
-// The kernel writes blanks, line ends and backslashes as a backslash and three octal digits.
+// The kernel writes spaces, tabs, newlines and backslashes as a backslash and three octal digits.
 std::string DecodeOctal(const std::string& text) {
   std::string decoded;
   for (std::size_t i = 0; i < text.size(); ++i) {
@@ -34,13 +34,25 @@ bool IsDirectlyBelowShares(const std::string& mountPoint) {
          mountPoint.find('/', start.size()) == std::string::npos;
 }
 
+/// The mount points of the mounts that are in `volumes` and not in `others`.
+std::vector<std::string> MountPointsOnlyIn(const Volumes& volumes, const Volumes& others) {
+  std::vector<std::string> mountPoints;
+  for (const auto& [mountPoint, id] : volumes) {
+    const auto other = others.find(mountPoint);
+    if (other == others.end() || other->second != id) {
+      mountPoints.push_back(mountPoint);
+    }
+  }
+  return mountPoints;
+}
+
 } // namespace
 
 Volumes ReadVolumes(std::istream& mountInfo) {
   Volumes volumes;
   std::string line;
   while (std::getline(mountInfo, line)) {
-    // Only blanks part the fields: the kernel leaves other white space in a name as it is.
+    // Fields are separated by spaces only: the kernel does not escape other white space.
     std::istringstream fields(line);
     int id = 0;
     std::string parent, device, root, mountPoint;
@@ -52,29 +64,16 @@ Volumes ReadVolumes(std::istream& mountInfo) {
     }
     mountPoint = DecodeOctal(mountPoint);
     if (mountPoint == SHARES) {
-      volumes.clear(); // what was mounted below is hidden now
+      volumes.clear(); // this mount hides those below the earlier one
     } else if (IsDirectlyBelowShares(mountPoint)) {
-      volumes[mountPoint] = id; // of several mounts on one place the last one is seen
+      volumes[mountPoint] = id; // the last of several mounts on one mount point is visible
     }
   }
   return volumes;
 }
 
 VolumeChanges Compare(const Volumes& before, const Volumes& now) {
-  VolumeChanges changes;
-  for (const auto& [mountPoint, id] : before) {
-    const auto found = now.find(mountPoint);
-    if (found == now.end() || found->second != id) {
-      changes.unplugged.push_back(mountPoint);
-    }
-  }
-  for (const auto& [mountPoint, id] : now) {
-    const auto found = before.find(mountPoint);
-    if (found == before.end() || found->second != id) {
-      changes.plugged.push_back(mountPoint);
-    }
-  }
-  return changes;
+  return {.unplugged = MountPointsOnlyIn(before, now), .plugged = MountPointsOnlyIn(now, before)};
 }
 
 } // namespace orva::notify

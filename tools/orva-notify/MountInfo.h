@@ -7,11 +7,11 @@
 
 namespace orva::notify {
 
-/// The mounted volumes: mount point to the identifier of what is mounted there.
+/// The mounted volumes: mount points with the identifiers of their mounts.
 using Volumes = std::map<std::string, int>;
 
-/// Reads a table in the format of /proc/self/mountinfo and returns the mount points directly
-/// below /shares that can be seen. Lines that cannot be read are passed over.
+/// Reads a table in the format of /proc/self/mountinfo. Returns the visible mount points directly
+/// below /shares. Malformed lines are skipped.
 Volumes ReadVolumes(std::istream& mountInfo);
 
 struct VolumeChanges {
@@ -19,8 +19,8 @@ struct VolumeChanges {
   std::vector<std::string> plugged;
 };
 
-/// What happened between two tables, in path order. A mount point at which something else is
-/// mounted now was unplugged and plugged.
+/// The changes between two tables, ordered by path. A mount point with another mount than before
+/// was unplugged and plugged.
 VolumeChanges Compare(const Volumes& before, const Volumes& now);
 
 } // namespace orva::notify

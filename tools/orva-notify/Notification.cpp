@@ -2,14 +2,15 @@
 
 #include <algorithm>
 #include <array>
+#include <string_view>
 
 namespace orva::notify {
 namespace {
 
 struct EventText {
   Event event;
-  const char* word; ///< on the command line
-  const char* name; ///< in the notification
+  std::string_view word; ///< on the command line
+  std::string_view name; ///< in the notification
 };
 
 constexpr std::array<EventText, 6> EVENT_TEXTS = {{
@@ -21,10 +22,8 @@ constexpr std::array<EventText, 6> EVENT_TEXTS = {{
     {Event::Purged, "purged", "Purged"},
 }};
 
-const char* NameOf(Event event) {
-  return std::find_if(EVENT_TEXTS.begin(), EVENT_TEXTS.end(),
-                      [event](const EventText& text) { return text.event == event; })
-      ->name;
+std::string_view NameOf(Event event) {
+  return std::ranges::find(EVENT_TEXTS, event, &EventText::event)->name;
 }
 
 bool IsPlain(char c) {
@@ -32,8 +31,7 @@ bool IsPlain(char c) {
          c == '-' || c == '.' || c == '_' || c == '~';
 }
 
-// Nothing that is left plain means anything to XML, so that the result can stand in an attribute
-// as it is.
+// The result contains no character that is special in XML and needs no escapes in an attribute.
 std::string PercentEncode(const std::string& text) {
   constexpr char DIGITS[] = "0123456789ABCDEF";
   std::string encoded;
@@ -51,16 +49,12 @@ std::string PercentEncode(const std::string& text) {
 } // namespace
 
 std::optional<Event> EventFromWord(const std::string& word) {
-  for (const auto& text : EVENT_TEXTS) {
-    if (word == text.word) {
-      return text.event;
-    }
-  }
-  return std::nullopt;
+  const auto* const text = std::ranges::find(EVENT_TEXTS, word, &EventText::word);
+  return text == EVENT_TEXTS.end() ? std::nullopt : std::optional(text->event);
 }
 
 std::string Compose(Event event, const std::string& mountPoint) {
-  const std::string start = std::string("<ORVANotification Name=\"") + NameOf(event) +
+  const std::string start = "<ORVANotification Name=\"" + std::string(NameOf(event)) +
                             "\" MountPoint=\"" + PercentEncode(mountPoint) + "\"";
   if (event == Event::TranscodedBatch) {
     return start + "><profile>" + TRANSCODING_PROFILE + "</profile></ORVANotification>";

@@ -5,20 +5,20 @@
 
 namespace orva::notify {
 
-/// What the appliance tells about a volume.
+/// The events of a volume that the appliance announces.
 enum class Event { Plugged, Unplugged, Scanned, TranscodedBatch, End, Purged };
 
-/// Identifier of the one transcoding profile that batches are announced for.
+/// Identifier of the only transcoding profile whose batches are announced.
 const std::string TRANSCODING_PROFILE = "cb62bbdd389b48898f2e5244977cb2c5";
 
-/// The event that a command line calls `word` ("plugged", "transcoded"); nothing for any other.
+/// The event for `word` of the command line ("plugged", "transcoded"); nothing for an unknown word.
 std::optional<Event> EventFromWord(const std::string& word);
 
-/// The XML document that announces `event` for the volume at `mountPoint`, any bytes, without
-/// the delimiter.
+/// The XML document that announces `event` of the volume at `mountPoint`, without the delimiter.
+/// The mount point may contain any bytes.
 std::string Compose(Event event, const std::string& mountPoint);
 
-/// `message` as it goes over the socket: followed by the delimiter, four zero bytes.
+/// `message` as it is sent over the socket: followed by the delimiter, four zero bytes.
 std::string Frame(const std::string& message);
 
 } // namespace orva::notify

@@ -14,6 +14,7 @@
 #include <cstring>
 #include <fstream>
 #include <iostream>
+#include <utility>
 
 namespace orva::notify {
 namespace {
@@ -26,12 +27,12 @@ void Print(const std::string& line) {
   std::cout << line << std::endl;
 }
 
-/// `text` fit for one line of a terminal.
+/// `text` shortened, with a dot for each byte that is not printable ASCII.
 std::string Printable(const std::string& text) {
   constexpr std::size_t MAXIMUM = 300;
   std::string line = text.substr(0, MAXIMUM);
-  std::replace_if(
-      line.begin(), line.end(), [](unsigned char c) { return c < 0x20 || c >= 0x7F; }, '.');
+  std::ranges::replace_if(
+      line, [](unsigned char c) { return c < 0x20 || c >= 0x7F; }, '.');
   return text.size() > MAXIMUM ? line + "..." : line;
 }
 
@@ -41,8 +42,7 @@ std::string CountOfClients(std::size_t count) {
 
 util::FileDescriptor CheckedDescriptor(int descriptor, const char* what) {
   if (descriptor == -1) {
-    throw util::Exception(FormatString("Cannot open %s: %s", what, strerror(errno)), __FILE__,
-                          __LINE__);
+    throw util::Exception(FormatString("Cannot open %s: %s", what, strerror(errno)));
   }
   return util::FileDescriptor(descriptor);
 }
@@ -58,7 +58,7 @@ util::FileDescriptor CatchStopSignals() {
 
 util::FileDescriptor OpenMountInfo(bool watch) {
   return watch ? CheckedDescriptor(open(MOUNT_INFO, O_RDONLY | O_CLOEXEC), MOUNT_INFO)
-               : util::FileDescriptor(-1);
+               : util::FileDescriptor();
 }
 
 template <typename Connection>
@@ -72,9 +72,8 @@ Service::Service(const std::string& address, bool watch)
     : address_(address), signals_(CatchStopSignals()), control_(ControlAddress(address)),
       notification_(address), mountInfo_(OpenMountInfo(watch)) {}
 
-// Each turn simply tries every descriptor. Requests are read first and done last, so that what
-// happened before a request, a client that connected or a volume that was mounted, is seen
-// before it.
+// Each turn tries every descriptor. Requests are read first and performed last: a client that
+// connected or a volume that was mounted before a request is thus handled before it.
 void Service::Run() {
   Print("listening on " + address_);
   while (!IsAskedToStop()) {
@@ -94,27 +93,30 @@ bool Service::IsAskedToStop() {
 }
 
 void Service::Wait() {
-  std::vector<pollfd> descriptors{{signals_.Get(), POLLIN, 0}, {mountInfo_.Get(), POLLPRI, 0}};
+  std::vector<pollfd> descriptors;
+  const auto add = [&descriptors](int descriptor, int events) {
+    descriptors.push_back({.fd = descriptor, .events = static_cast<short>(events), .revents = 0});
+  };
+  add(signals_.Get(), POLLIN);
+  add(mountInfo_.Get(), POLLPRI); // poll() ignores it when it is none
   if (!isFull_) {
-    descriptors.push_back({control_.Descriptor(), POLLIN, 0});
-    descriptors.push_back({notification_.Descriptor(), POLLIN, 0});
+    add(control_.Descriptor(), POLLIN);
+    add(notification_.Descriptor(), POLLIN);
   }
   for (const auto& client : clients_) {
-    const int events = client->QueuedBytes() > 0 ? POLLIN | POLLOUT : POLLIN;
-    descriptors.push_back({client->Descriptor(), static_cast<short>(events), 0});
+    add(client->Descriptor(), client->QueuedBytes() > 0 ? POLLIN | POLLOUT : POLLIN);
   }
   for (const auto& request : requests_) {
-    descriptors.push_back({request->Descriptor(), POLLIN, 0});
+    add(request->Descriptor(), POLLIN);
   }
   if (poll(descriptors.data(), descriptors.size(), -1) == -1 && errno != EINTR) {
-    throw util::Exception(FormatString("Cannot wait for clients: %s", strerror(errno)), __FILE__,
-                          __LINE__);
+    throw util::Exception(FormatString("Cannot wait for clients: %s", strerror(errno)));
   }
 }
 
 void Service::ReadRequests() {
   while (util::FileDescriptor connection = AcceptFrom(control_)) {
-    requests_.push_back(std::make_unique<ControlConnection>(connection.Release()));
+    requests_.push_back(std::make_unique<ControlConnection>(std::move(connection)));
   }
   for (const auto& request : requests_) {
     request->ReadAvailable();
@@ -122,7 +124,7 @@ void Service::ReadRequests() {
 }
 
 void Service::FollowMounts() {
-  if (mountInfo_.Get() == -1) {
+  if (!mountInfo_) {
     return;
   }
   std::ifstream table(MOUNT_INFO);
@@ -141,7 +143,7 @@ void Service::FollowMounts() {
 
 void Service::AcceptClients() {
   while (util::FileDescriptor connection = AcceptFrom(notification_)) {
-    clients_.push_back(std::make_unique<Client>(connection.Release(), ++lastNumber_));
+    clients_.push_back(std::make_unique<Client>(std::move(connection), ++lastNumber_));
     Client& client = *clients_.back();
     Print(FormatString("client %u connected", client.Number()));
     for (const auto& [mountPoint, id] : volumes_) {
@@ -218,7 +220,7 @@ void Service::ForgetClosed() {
 
 util::FileDescriptor Service::AcceptFrom(ListeningSocket& socket) {
   util::FileDescriptor connection = socket.Accept();
-  const bool isFull = connection.Get() == -1 && errno != EAGAIN;
+  const bool isFull = !connection && errno != EAGAIN;
   if (isFull && !isFull_) {
     Print(FormatString("cannot take another connection until one ends: %s", strerror(errno)));
   }

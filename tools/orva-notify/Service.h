@@ -13,16 +13,16 @@
 
 namespace orva::notify {
 
-/// The notification service: one thread, one loop, every descriptor non-blocking. Prints a line
-/// for whatever happens.
+/// The notification service: one thread, one loop, every descriptor non-blocking. Prints a line for
+/// each event.
 class Service {
 public:
-  /// Listens on `address`, for requests on the address that belongs to it, and from now on takes
-  /// SIGINT and SIGTERM as requests to stop. With `watch`, mounts and unmounts directly below
-  /// /shares are announced. Throws util::Exception and std::filesystem::filesystem_error.
+  /// Listens on `address` for clients and on ControlAddress(address) for requests. From now on,
+  /// SIGINT and SIGTERM stop the service. With `watch`, mounts and unmounts directly below /shares
+  /// are announced. Throws util::Exception and std::filesystem::filesystem_error.
   Service(const std::string& address, bool watch);
 
-  /// Serves until it is asked to stop.
+  /// Serves until SIGINT or SIGTERM.
   void Run();
 
 private:
@@ -43,14 +43,15 @@ private:
 
   const std::string address_;
   util::FileDescriptor signals_;
-  ListeningSocket control_; // first, so that a second service is refused before a client sees it
+  ListeningSocket
+      control_; // opened first: a second service fails before a client can connect to it
   ListeningSocket notification_;
-  util::FileDescriptor mountInfo_; ///< only waited for; none when mounts are not watched
+  util::FileDescriptor mountInfo_; ///< polled, not read; none when mounts are not watched
   Volumes volumes_;                ///< as announced
   std::vector<std::unique_ptr<Client>> clients_;
   std::vector<std::unique_ptr<ControlConnection>> requests_;
   unsigned lastNumber_ = 0;
-  bool isFull_ = false; ///< no descriptor is left for another connection
+  bool isFull_ = false; ///< there is no free descriptor for another connection
 };
 
 } // namespace orva::notify

@@ -1,3 +1,4 @@
+#include "commandline/UsageError.h"
 #include "orva-notify/CommandLine.h"
 #include "orva-notify/Control.h"
 #include "orva-notify/Service.h"
@@ -28,7 +29,7 @@ std::string ReadFile(const std::string& name) {
   std::ifstream file(name, std::ios::binary);
   std::string content = ReadAll(file);
   if (!file) {
-    throw orva::util::Exception("Cannot read '" + name + "'", __FILE__, __LINE__);
+    throw orva::util::Exception("Cannot read '" + name + "'");
   }
   return content;
 }
@@ -46,20 +47,18 @@ void PrintCount(const char* what, std::size_t count) {
 }
 
 void Send(const CommandLine& command) {
-  const Request request{Request::Kind::Send, command.clients, MessageOf(command)};
+  const Request request{
+      .kind = Request::Kind::Send, .clients = command.clients, .message = MessageOf(command)};
   PrintCount("sent to", Ask(ORVA_NOTIFICATION_SOCKET, request, command.wait));
 }
 
 void Drop(const CommandLine& command) {
-  const Request request{Request::Kind::Drop, command.clients, {}};
+  const Request request{.kind = Request::Kind::Drop, .clients = command.clients};
   PrintCount("dropped", Ask(ORVA_NOTIFICATION_SOCKET, request, command.wait));
 }
 
 void Execute(const CommandLine& command) {
   switch (command.action) {
-  case CommandLine::Action::Help:
-    std::cout << HELP;
-    break;
   case CommandLine::Action::Serve:
     Serve(command);
     break;
@@ -75,13 +74,15 @@ void Execute(const CommandLine& command) {
 } // namespace
 
 int main(int count, char* arguments[]) {
-  // A reader of our lines that goes away must not end the service.
+  // The service continues when its standard output is a pipe that was closed.
   std::signal(SIGPIPE, SIG_IGN);
   try {
-    Execute(ParseCommandLine({arguments + 1, arguments + count}));
+    if (const auto command = ParseCommandLine({arguments + 1, arguments + count})) {
+      Execute(*command);
+    }
     return EXIT_SUCCESS;
-  } catch (const UsageError& error) {
-    std::cerr << "orva-notify: " << error.what() << "; orva-notify --help says more\n";
+  } catch (const orva::commandline::UsageError& error) {
+    std::cerr << "orva-notify: " << error.what() << "\nTry 'orva-notify --help'.\n";
     return EXIT_USAGE;
   } catch (const std::exception& error) {
     std::cerr << "orva-notify: " << error.what() << '\n';

@@ -5,6 +5,7 @@
 #include <SQLiteCpp/Exception.h>
 #include <SQLiteCpp/Statement.h>
 
+#include <span>
 #include <vector>
 
 namespace orva::zophotos {
@@ -13,21 +14,18 @@ namespace {
 
 constexpr std::size_t MOST_EXAMPLES = 20;
 
-/// What to look for: each row of `sql` has one text, which describes one of what it finds.
-struct Question {
-  const char* kind;
-  const char* title;
+/// A check: each row of `sql` is one problem, described by one text.
+struct Check {
+  const char* kind;  ///< for programs
+  const char* title; ///< for people
   const char* sql;
 };
 
-/// One kind of thing that was found, and the first ones of it.
+/// The problems that a check found.
 struct Finding {
-  explicit Finding(const Question& question) : kind(question.kind), title(question.title) {}
-
-  std::string kind;  ///< for programs
-  std::string title; ///< for people
+  const Check* check;
   std::int64_t count = 0;
-  std::vector<std::string> examples;
+  std::vector<std::string> examples{}; ///< the first ones
 
   void Add(const std::string& example) {
     ++count;
@@ -37,11 +35,11 @@ struct Finding {
   }
 };
 
-constexpr Question INTEGRITY = {
-    "integrity", "faults in the file",
+constexpr Check INTEGRITY = {
+    "integrity", "errors in the file",
     "SELECT integrity_check FROM pragma_integrity_check(1000) WHERE integrity_check != 'ok'"};
 
-constexpr Question DAMAGE[] = {
+constexpr Check DAMAGE[] = {
     {"no_status", "status row missing",
      "SELECT 'Status' WHERE NOT EXISTS (SELECT 1 FROM Status WHERE id = 1)"},
     {"no_root", "root folder missing",
@@ -51,12 +49,12 @@ constexpr Question DAMAGE[] = {
      "SELECT 'file ' || f.file_id || ', ' || f.name || ', of ' || f.volume || ': no folder ' || "
      "f.folder_id FROM Files f WHERE NOT EXISTS (SELECT 1 FROM Folders o WHERE o.folder_id = "
      "f.folder_id)"},
-    {"file_of_other_volume", "files of another volume than their folder",
+    {"file_of_other_volume", "files with another volume than their folder",
      "SELECT o.name || f.name || ', of ' || f.volume || ' in a folder of ' || o.volume FROM Files f "
      "JOIN Folders o ON o.folder_id = f.folder_id WHERE f.volume != o.volume"},
-    {"duplicate_folder", "folders that are there more than once",
+    {"duplicate_folder", "duplicate folders",
      "SELECT name || ', ' || count(*) || ' times' FROM Folders GROUP BY name HAVING count(*) > 1"},
-    {"duplicate_file", "files that are there more than once",
+    {"duplicate_file", "duplicate files",
      "SELECT o.name || f.name || ', ' || count(*) || ' times' FROM Files f JOIN Folders o ON "
      "o.folder_id = f.folder_id GROUP BY f.folder_id, f.name, f.volume HAVING count(*) > 1"},
     {"duplicate_statistics", "volumes with more than one row of statistics",
@@ -64,9 +62,9 @@ constexpr Question DAMAGE[] = {
      "> 1"},
 };
 
-/// What the daemon's rules leave behind; doc/operations.md says when it goes.
-constexpr Question LEFTOVERS[] = {
-    {"statistics_without_content", "statistics of volumes that have nothing merged",
+/// What the daemon leaves in the database by its rules. doc/operations.md says when it is removed.
+constexpr Check LEFTOVERS[] = {
+    {"statistics_without_content", "statistics of volumes without merged content",
      "SELECT volume FROM Statistics s WHERE NOT EXISTS (SELECT 1 FROM Folders o WHERE o.volume = "
      "s.volume) ORDER BY volume"},
     {"folder_without_parent", "folders whose parent folder was removed",
@@ -79,11 +77,10 @@ struct Report {
   std::vector<Finding> leftovers;
 };
 
-/// Adds what the question finds to `finding`. What SQLite cannot read for it is one of the
-/// `faults`.
-void Ask(SQLite::Database& database, const Question& question, Finding& finding, Finding& faults) {
+/// Runs the check of `finding` and adds what it finds. An error in the file goes to `faults`.
+void Run(SQLite::Database& database, Finding& finding, Finding& faults) {
   try {
-    SQLite::Statement query(database, question.sql);
+    SQLite::Statement query(database, finding.check->sql);
     while (query.executeStep()) {
       finding.Add(query.getColumn(0).getString());
     }
@@ -91,17 +88,16 @@ void Ask(SQLite::Database& database, const Question& question, Finding& finding,
     if (!IsDamage(error)) {
       throw;
     }
-    faults.Add(std::string(error.what()) + ", when looking for " + question.title);
+    faults.Add(std::string(error.what()) + ", while looking for " + finding.check->title);
   }
 }
 
-template <typename Questions>
-std::vector<Finding> AskAll(SQLite::Database& database, const Questions& questions,
+std::vector<Finding> RunAll(SQLite::Database& database, std::span<const Check> checks,
                             Finding& faults) {
   std::vector<Finding> findings;
-  for (const Question& question : questions) {
-    Finding finding(question);
-    Ask(database, question, finding, faults);
+  for (const Check& check : checks) {
+    Finding finding{.check = &check};
+    Run(database, finding, faults);
     if (finding.count > 0) {
       findings.push_back(std::move(finding));
     }
@@ -111,12 +107,12 @@ std::vector<Finding> AskAll(SQLite::Database& database, const Questions& questio
 
 Report Examine(const std::string& path) {
   Report report;
-  Finding faults(INTEGRITY);
+  Finding faults{.check = &INTEGRITY};
   try {
     SQLite::Database database = CopyDatabase(path);
-    Ask(database, INTEGRITY, faults, faults);
-    report.damage = AskAll(database, DAMAGE, faults);
-    report.leftovers = AskAll(database, LEFTOVERS, faults);
+    Run(database, faults, faults);
+    report.damage = RunAll(database, DAMAGE, faults);
+    report.leftovers = RunAll(database, LEFTOVERS, faults);
   } catch (const SQLite::Exception& error) {
     if (!IsDamage(error)) {
       throw;
@@ -135,7 +131,7 @@ void PrintFindings(const std::string& heading, const std::vector<Finding>& findi
   }
   std::cout << heading << '\n';
   for (const Finding& finding : findings) {
-    std::cout << "  " << finding.title << ": " << finding.count << '\n';
+    std::cout << "  " << finding.check->title << ": " << finding.count << '\n';
     for (const std::string& example : finding.examples) {
       std::cout << "    " << Printable(example) << '\n';
     }
@@ -153,8 +149,9 @@ Json ToJson(const std::vector<Finding>& findings) {
     for (const std::string& example : finding.examples) {
       examples.push_back(ToUtf8(example));
     }
-    list.push_back(
-        {{"kind", finding.kind}, {"count", finding.count}, {"examples", std::move(examples)}});
+    list.push_back({{"kind", finding.check->kind},
+                    {"count", finding.count},
+                    {"examples", std::move(examples)}});
   }
   return list;
 }
@@ -172,7 +169,7 @@ ExitStatus CheckDatabase(const std::string& path, Form form) {
   } else {
     std::cout << Printable(path) << (isSound ? " is sound\n" : " is damaged\n");
     PrintFindings("Damage:", report.damage);
-    PrintFindings("Expected leftovers, no damage:", report.leftovers);
+    PrintFindings("Expected leftovers (not damage):", report.leftovers);
   }
   return isSound ? ExitStatus::Success : ExitStatus::Negative;
 }

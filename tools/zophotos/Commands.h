@@ -7,50 +7,50 @@
 
 namespace orva::zophotos {
 
-/// For people, or for programs: one JSON object, or one a line where a command lists.
+/// Text for people, or JSON for programs: one object, or one object per line from a list.
 enum class Form { Text, Json };
 
-/// The merged database's path as it is now, since it may move while a command runs.
+/// Returns the merged database's current path, which may change while a command runs.
 using FindPath = std::function<std::string()>;
 
-// The commands, one in a source of its own each. `path` is the merged database's. They print to
+// The commands. Each is in its own source. `path` is the path of the merged database. They print to
 // standard output, and throw Failure or SQLite::Exception.
 
-/// Where the database is, and how far each volume has come.
+/// Shows where the database is and the progress of each volume.
 ExitStatus ShowStatus(const std::string& path, Form form);
 
-/// What is in a folder, which may be named from the shares root on.
+/// Lists a folder. `folder` is absolute or relative to the shares root.
 ExitStatus ListFolder(const std::string& path, const std::string& folder, bool isLong, Form form);
 
-/// All folders below one, by their paths.
+/// Shows all folders below a folder, by their paths.
 ExitStatus ShowTree(const std::string& path, const std::string& folder, Form form);
 
-/// What FindItems looks for, and how it prints what it has found.
+/// What FindItems searches for, and how it prints the results.
 struct Search {
   std::string pattern;
   bool ignoreCase = false;
-  bool nullTerminated = false; ///< the bytes of each path as they are, with a NUL behind them
+  bool nullTerminated = false; ///< print the bytes of each path unchanged and a NUL after them
 };
 
-/// Files and folders by their names.
+/// Finds files and folders by their names.
 ExitStatus FindItems(const std::string& path, const Search& search, Form form);
 
-/// What is wrong with the database.
+/// Checks the database for damage.
 ExitStatus CheckDatabase(const std::string& path, Form form);
 
 enum class ExportFormat { Csv, JsonLines };
 
-/// Every file, with its full path.
+/// Prints every file with its full path.
 ExitStatus ExportFiles(const std::string& path, ExportFormat format);
 
-/// A line for each change, until the program is ended or nobody takes its lines. What is thrown by
-/// `findPath` is a change, too.
+/// Prints a line for each change until the output cannot be written. An exception from `findPath`
+/// is a change, too.
 ExitStatus WatchDatabase(const FindPath& findPath, Form form);
 
-/// `folder` as the database has it: from the shares root, with a separator at its end.
+/// The name of `folder` in the database: its absolute path with a separator at the end.
 std::string FolderPath(const std::string& folder);
 
-/// The first path behind all that are in the folder at `path`.
+/// The smallest text that sorts after all paths in the folder at `path`.
 std::string EndOfFolder(const std::string& path);
 
 } // namespace orva::zophotos

@@ -6,7 +6,7 @@ namespace orva::zophotos {
 
 namespace {
 
-/// A text as a CSV field. Always quoted, so that no name means anything to who reads it.
+/// A text as a CSV field. Always quoted, so that readers take no name for something else.
 std::string Quoted(const std::string& text) {
   std::string field = "\"";
   for (const char byte : ToUtf8(text)) {

@@ -5,18 +5,17 @@
 
 namespace orva::zophotos {
 
-/// What the program's exit status says; zophotos(1) promises the numbers.
+/// Exit statuses. zophotos(1) documents the numbers.
 enum class ExitStatus : int {
   Success = 0,
   Negative = 1,   ///< check found damage; ls, tree or find found nothing
-  Usage = 2,      ///< the command line was wrong
-  NoDatabase = 3, ///< there is no merged database now
-  Locked = 4,     ///< it cannot be read at this moment; trying again later helps
-  Failed = 5,     ///< anything else
+  Usage = 2,      ///< wrong command line
+  NoDatabase = 3, ///< there is no merged database at the moment
+  Locked = 4,     ///< it cannot be read at the moment; try again later
+  Failed = 5,     ///< any other error
 };
 
-/// Ends the command with a message for the user and an exit status. Who prints the message
-/// escapes it.
+/// Ends the command with a message for the user and an exit status. The message is not escaped yet.
 class Failure : public std::runtime_error {
 public:
   Failure(ExitStatus status, const std::string& message)

@@ -10,8 +10,8 @@ namespace orva::zophotos {
 
 namespace {
 
-/// Decides which paths a search is for: by the last component of a path, or by all of it where the
-/// pattern has a separator; a pattern without wildcards is looked for anywhere in it.
+/// Matches a pattern against the last component of a path, or against the whole path if the pattern
+/// has a separator. A pattern without wildcards matches anywhere in the text.
 class Matcher {
 public:
   Matcher(const std::string& pattern, bool ignoreCase)
@@ -21,7 +21,7 @@ public:
     UseUtf8(); // for fnmatch
   }
 
-  /// `path` is that of a file, or of a folder without its last separator.
+  /// `path` is the path of a file, or of a folder without the separator at its end.
   bool Matches(const std::string& path) const {
     const std::size_t name = wholePath_ ? 0 : path.rfind('/') + 1;
     return fnmatch(pattern_.c_str(), path.c_str() + name, flags_) == 0;

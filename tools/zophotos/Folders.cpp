@@ -11,7 +11,7 @@ std::string FolderPath(const std::string& folder) {
 }
 
 std::string EndOfFolder(const std::string& path) {
-  // The character behind the separator.
+  // '0' is the character after '/'.
   return path.substr(0, path.size() - 1) + "0";
 }
 

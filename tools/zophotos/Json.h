@@ -8,21 +8,21 @@
 
 namespace orva::zophotos {
 
-/// Members in the order in which they are given.
+/// Keeps the members in the order in which they are added.
 using Json = nlohmann::ordered_json;
 
-/// A time as programs get it; null where IsoTime has none.
+/// A time for programs; null if IsoTime returns nothing.
 inline Json JsonTime(std::int64_t seconds) {
   const auto text = IsoTime(seconds);
   return text ? Json(*text) : Json();
 }
 
-/// The stamp up to which a volume is merged; null for 0, which stands for none.
+/// The stamp up to which a volume is merged; null for 0, which means none.
 inline Json JsonStamp(std::int64_t seconds) {
   return seconds == 0 ? Json() : JsonTime(seconds);
 }
 
-/// Prints an object, whose texts are UTF-8, as one line.
+/// Prints an object as one line. Its texts must be UTF-8.
 inline void PrintLine(const Json& object) {
   std::cout << object.dump() << '\n';
 }

@@ -13,16 +13,16 @@ namespace {
 
 struct Entry {
   bool isFolder = false;
-  bool isStored = false; ///< false for a folder that is only part of other folders' paths
+  bool isStored = false; ///< false for a folder without a row, known from paths below it
   std::string path{};
-  std::string name{}; ///< last component; a folder's with its separator
+  std::string name{}; ///< last component; for a folder with its separator
   std::int64_t files = 0;
   std::int64_t modified = 0;
   std::string volume{};
 };
 
-/// The folders right below `folder`, by the paths of all below it: a removed folder may have left
-/// some. Goes from one to the next by the index, past what is in them.
+/// The folders directly in `folder`, taken from the paths of all folders below it, since a removed
+/// folder can leave subfolders. Uses the index to skip from one folder to the next.
 std::vector<Entry> ReadFolders(SQLite::Database& database, const std::string& folder) {
   SQLite::Statement query(database,
                           "SELECT name, modified_date, volume, (SELECT count(*) FROM Files f WHERE "
@@ -112,7 +112,7 @@ ExitStatus ListFolder(const std::string& path, const std::string& folder, bool i
   const std::string folderPath = FolderPath(folder);
   std::vector<Entry> entries;
   {
-    // A folder may hold most of a library, which has to be sorted.
+    // Sorting takes long for a folder that holds most of a library.
     SQLite::Database database = CopyDatabase(path);
     entries = ReadFolders(database, folderPath);
     ReadFiles(database, folderPath, entries);

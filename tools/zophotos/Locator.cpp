@@ -3,7 +3,6 @@
 #include "Failure.h"
 
 #include <algorithm>
-#include <array>
 #include <filesystem>
 #include <fstream>
 #include <string_view>
@@ -23,35 +22,34 @@ constexpr std::string_view KEY = "zophotos_db_path=";
 } // namespace
 
 std::string FindDatabase() {
-  // Anybody can make something there, and a FIFO would be waited for.
+  // Any user can create something in /tmp. Opening a FIFO would block.
   std::error_code error;
   const auto type = std::filesystem::status(LOCATOR, error).type();
   if (type == std::filesystem::file_type::not_found) {
-    ThrowNoDatabase(std::string("there is no file ") + LOCATOR +
-                    ", which the daemon writes when it starts");
+    ThrowNoDatabase(std::string(LOCATOR) + " does not exist; the daemon creates it when it starts");
   }
   if (type != std::filesystem::file_type::regular) {
     ThrowNoDatabase(std::string(LOCATOR) +
-                    " is not a regular file, so that the daemon does not write it");
+                    " is not a regular file, so the daemon does not write to it");
   }
   std::ifstream file(LOCATOR);
   if (!file) {
     ThrowNoDatabase(std::string(LOCATOR) + " cannot be read");
   }
-  // Whoever wrote it: no path is longer.
-  std::array<char, 8192> text{};
-  file.read(text.data(), text.size());
-  std::string line(text.data(), static_cast<std::size_t>(file.gcount()));
+  // No path is longer, so a huge file is not read to its end.
+  std::string line(8192, '\0');
+  file.read(line.data(), static_cast<std::streamsize>(line.size()));
+  line.resize(static_cast<std::size_t>(file.gcount()));
   line.resize(std::min(line.size(), line.find('\n')));
   if (!line.starts_with(KEY)) {
-    ThrowNoDatabase(std::string(LOCATOR) + " has no " + std::string(KEY) + " in its first line");
+    ThrowNoDatabase(std::string(LOCATOR) + " does not begin with " + std::string(KEY));
   }
   line.erase(0, KEY.size());
   if (line.empty()) {
-    ThrowNoDatabase(std::string(LOCATOR) + " names none at this moment");
+    ThrowNoDatabase(std::string(LOCATOR) + " names no database at the moment");
   }
   if (line.find('\0') != std::string::npos) {
-    ThrowNoDatabase(std::string(LOCATOR) + " has a NUL in its first line, which no path has");
+    ThrowNoDatabase(std::string(LOCATOR) + " has a NUL byte in its first line");
   }
   return line;
 }

@@ -4,8 +4,8 @@
 
 namespace orva::zophotos {
 
-/// Path of the merged database, as the daemon's locator file names it now. Throws Failure, which
-/// says why there is none.
+/// The path of the merged database that the daemon's locator file names at the moment. Throws
+/// Failure with the reason if there is none.
 std::string FindDatabase();
 
 } // namespace orva::zophotos

@@ -17,10 +17,10 @@ namespace orva::zophotos {
 
 namespace {
 
-/// Milliseconds that a lock is waited for: longer than a usual merge takes to commit.
+/// Milliseconds to wait for a lock: longer than a usual merge takes to commit.
 constexpr int BUSY_TIMEOUT = 5000;
 
-/// The database may have come with a volume from elsewhere: nothing that it brings along is run.
+/// Databases on volumes are untrusted: nothing that their schema defines may run.
 void DisableUntrustedFeatures(SQLite::Database& database) {
   for (const auto& [option, value] :
        {std::pair(SQLITE_DBCONFIG_ENABLE_VIEW, 0), std::pair(SQLITE_DBCONFIG_TRUSTED_SCHEMA, 0),
@@ -29,9 +29,9 @@ void DisableUntrustedFeatures(SQLite::Database& database) {
   }
 }
 
-/// Tables and texts as the daemon makes them. In UTF-16 texts are not ordered by their bytes.
+/// Requires the daemon's tables and text encoding. UTF-16 texts are not sorted by their bytes.
 void RequireMergedDatabase(SQLite::Database& database, const std::string& path) {
-  const std::string fault = path + " is no merged photo database: ";
+  const std::string fault = path + " is not a merged photo database: ";
   for (const char* const table : {"Status", "Statistics", "Folders", "Files"}) {
     if (!database.tableExists(table)) {
       throw Failure(ExitStatus::Failed, fault + "it has no table " + table);
@@ -39,12 +39,12 @@ void RequireMergedDatabase(SQLite::Database& database, const std::string& path) 
   }
   const std::string encoding = database.execAndGet("PRAGMA encoding").getString();
   if (encoding != "UTF-8") {
-    throw Failure(ExitStatus::Failed, fault + "its texts are in " + encoding);
+    throw Failure(ExitStatus::Failed, fault + "its text encoding is " + encoding);
   }
 }
 
-/// Whether the file's header says that it is written with a log. SQLite makes the log's files also
-/// for those who only read.
+/// Whether the file's header says that it uses a write-ahead log. SQLite creates the log's files
+/// even for connections that only read.
 bool HasWriteAheadLog(const std::string& path) {
   constexpr std::size_t readVersion = 19;
   constexpr char writeAheadLog = 2;
@@ -53,7 +53,8 @@ bool HasWriteAheadLog(const std::string& path) {
   return header.at(readVersion) == writeAheadLog;
 }
 
-/// What cannot be opened later is not this file.
+/// Reports a failure to open this file as Failure, so that Explain can take SQLITE_CANTOPEN for a
+/// failure to create the private copy.
 SQLite::Database Connect(const std::string& path) {
   try {
     return {path, SQLite::OPEN_READONLY, BUSY_TIMEOUT};
@@ -62,7 +63,7 @@ SQLite::Database Connect(const std::string& path) {
   }
 }
 
-/// Opens the file without a look at what is in it.
+/// Opens the file without checking its content.
 SQLite::Database OpenFile(const std::string& path) {
   std::error_code error;
   const auto type = std::filesystem::status(path, error).type();
@@ -74,17 +75,17 @@ SQLite::Database OpenFile(const std::string& path) {
                   path + (error ? ": " + error.message() : " is not a regular file"));
   }
   if (HasWriteAheadLog(path)) {
-    throw Failure(ExitStatus::Failed, path +
-                                          " has a write-ahead log, which the daemon's databases do "
-                                          "not have: to read it would be to write beside it");
+    throw Failure(ExitStatus::Failed,
+                  path + " uses a write-ahead log, unlike the daemon's databases; reading it would "
+                         "create files next to it");
   }
   SQLite::Database database = Connect(path);
   DisableUntrustedFeatures(database);
   return database;
 }
 
-/// Copies some MiB at a time, so that a merge can commit in between; the copying then begins anew.
-/// Where that happens too often it is done in one go.
+/// Copies a few MiB at a time, so that a merge can commit in between. SQLite then restarts the
+/// copy. After too many restarts it copies the rest in one step.
 void CopyPages(SQLite::Database& from, SQLite::Database& to) {
   constexpr int pages = 2048;
   constexpr int mostTries = 5;
@@ -101,8 +102,8 @@ void CopyPages(SQLite::Database& from, SQLite::Database& to) {
   }
 }
 
-/// Whether a journal waits to be played back. The exception of a copy has the extended code in
-/// place of the other.
+/// Whether a hot journal has to be rolled back. Exceptions of CopyPages have the extended code as
+/// their error code.
 bool IsInterruptedMerge(const SQLite::Exception& error) {
   return error.getExtendedErrorCode() == SQLITE_READONLY_ROLLBACK ||
          error.getErrorCode() == SQLITE_READONLY_ROLLBACK;
@@ -128,7 +129,7 @@ SQLite::Database CopyDatabase(const std::string& path) {
 }
 
 void Walk(SQLite::Database& copy, const std::function<void(const Item&)>& visit) {
-  // By the index on Folders.name; only the files of one folder are sorted at a time.
+  // Uses the index on Folders.name, so only the files of one folder are sorted at a time.
   SQLite::Statement query(copy,
                           "SELECT o.folder_id, o.name, f.name, o.volume, o.modified_date, "
                           "f.modified_date, f.created_date FROM Folders o LEFT JOIN Files f "
@@ -161,16 +162,15 @@ bool IsLocked(const SQLite::Exception& error) {
 std::string Explain(const SQLite::Exception& error, const std::string& path) {
   if (IsInterruptedMerge(error)) {
     return path +
-           " has a merge to take back that was interrupted; the daemon does so when it opens "
-           "the database, and this program only reads";
+           " has an interrupted merge to roll back; the daemon does that when it opens the database";
   }
   if (IsLocked(error)) {
-    return path + " is locked, as it is while a large merge is written; try again";
+    return path + " is locked, for example while a large merge commits; try again";
   }
   const int code = error.getErrorCode() & 0xFF;
   if (code == SQLITE_FULL || code == SQLITE_CANTOPEN) {
     return std::string(code == SQLITE_FULL ? "no space" : "no writable folder") +
-           " for a private copy of " + path + "; SQLITE_TMPDIR names another folder for it";
+           " for a private copy of " + path + "; set SQLITE_TMPDIR to another folder";
   }
   return path + ": " + error.what();
 }

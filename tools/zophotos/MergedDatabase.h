@@ -13,39 +13,38 @@ class Exception;
 
 namespace orva::zophotos {
 
-/// Opens the merged database at `path` to read it where it is. A statement on it keeps merges from
-/// committing for as long as it is unfinished, and a merge gives up after a second: what is read
-/// has to be little, and to be read whole before anything is printed. Throws Failure or
-/// SQLite::Exception.
+/// Opens the merged database at `path` to read it in place. An unfinished statement on it keeps
+/// merges from committing, and a merge gives up after a second. Read little, and finish reading
+/// before you print. Throws Failure or SQLite::Exception.
 SQLite::Database OpenDatabase(const std::string& path);
 
-/// A private copy of the merged database at `path`, in a temporary file that has no name and goes
-/// with the connection. It is one state of the database, and can be read at leisure. Throws
-/// Failure or SQLite::Exception.
+/// A private copy of the merged database at `path`, in a temporary file without a name that is
+/// removed with the connection. It is a consistent snapshot, and reading it does not block merges.
+/// Throws Failure or SQLite::Exception.
 SQLite::Database CopyDatabase(const std::string& path);
 
 /// One row of Walk: a folder, or a file in it. Valid during the call.
 struct Item {
   std::int64_t folderId;
   std::string folder;              ///< full path with its trailing separator
-  std::optional<std::string> file; ///< name of the file; nothing for a folder without files
-  std::string volume;              ///< the folder's
-  std::int64_t folderModified;     ///< seconds since the epoch, as all times
+  std::optional<std::string> file; ///< name of the file; empty for a folder without files
+  std::string volume;              ///< of the folder
+  std::int64_t folderModified;     ///< seconds since the epoch, like all times
   std::int64_t modified;           ///< of the file
   std::int64_t created;            ///< of the file
 };
 
-/// Calls `visit` for each file by its folder, and for each folder without files, in the order of
-/// their paths and in constant memory. On a copy. Throws SQLite::Exception.
+/// Calls `visit` for each file that has a folder and for each folder without files, ordered by
+/// folder and name, in constant memory. Throws SQLite::Exception.
 void Walk(SQLite::Database& copy, const std::function<void(const Item&)>& visit);
 
-/// What to tell the user of a failure of SQLite's while reading the database at `path`.
+/// The message for the user about an SQLite error while reading the database at `path`.
 std::string Explain(const SQLite::Exception& error, const std::string& path);
 
-/// Whether the file turned out to be no whole database.
+/// Whether the error means that the file is damaged or not a database.
 bool IsDamage(const SQLite::Exception& error);
 
-/// Whether the database can be read when somebody else is done with it.
+/// Whether the error is temporary: the database is locked, or the daemon has to roll a merge back.
 bool IsLocked(const SQLite::Exception& error);
 
 } // namespace orva::zophotos

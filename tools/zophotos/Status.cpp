@@ -30,16 +30,16 @@ struct Row {
   std::int64_t stamp = 0; ///< seconds since the epoch
 };
 
-/// Nothing where somebody has removed it.
+/// Nothing if there is no status row.
 std::optional<Row> ReadRow(SQLite::Database& database) {
   SQLite::Statement query(database, "SELECT mc_version, mdate FROM Status WHERE id = 1");
   if (!query.executeStep()) {
     return std::nullopt;
   }
-  return Row{query.getColumn(0).getString(), query.getColumn(1).getInt64()};
+  return Row{.version = query.getColumn(0).getString(), .stamp = query.getColumn(1).getInt64()};
 }
 
-/// The daemon, too, reads only a volume's first row.
+/// Reads only the first row of each volume, like the daemon.
 void ReadStatistics(SQLite::Database& database, Volumes& volumes) {
   SQLite::Statement query(database, "SELECT volume, photos_xcoded, photos_total, last_updated_time "
                                     "FROM Statistics ORDER BY id");
@@ -57,7 +57,7 @@ void ReadStatistics(SQLite::Database& database, Volumes& volumes) {
 Volumes ReadVolumes(SQLite::Database& database) {
   Volumes volumes;
   ReadStatistics(database, volumes);
-  // Folder 1 is the root, which belongs to none.
+  // Folder 1 is the shares root, which belongs to no volume.
   SQLite::Statement folders(
       database, "SELECT volume, count(*) FROM Folders WHERE folder_id != 1 GROUP BY volume");
   while (folders.executeStep()) {
@@ -70,14 +70,14 @@ Volumes ReadVolumes(SQLite::Database& database) {
   return volumes;
 }
 
-/// "█████░░░░░  50 %" with a bar of `width` columns; a dash where there are no photos.
+/// "█████░░░░░  50 %" with a bar of `width` columns; a dash if there are no photos.
 std::string Progress(const Volume& volume, int width) {
   if (volume.total <= 0) {
     return "-";
   }
   const auto done =
       static_cast<double>(std::clamp<std::int64_t>(volume.transcoded, 0, volume.total));
-  // Multiplied first: 29 of 100 as a fraction is a little less than 0.29.
+  // Multiplied first, because the double 0.29 times 100 is less than 29.
   const auto part = [&](int whole) {
     return static_cast<int>(done * whole / static_cast<double>(volume.total));
   };
@@ -86,7 +86,7 @@ std::string Progress(const Volume& volume, int width) {
   for (int i = 0; i < width; ++i) {
     bar += i < filled ? "█" : "░";
   }
-  // Rounded down: all is 100 %, and nothing else.
+  // Rounded down, so that only all photos are 100 %.
   const std::string percent = std::to_string(part(100));
   return bar + std::string(4 - percent.size(), ' ') + percent + " %";
 }
@@ -120,7 +120,7 @@ void PrintText(const std::string& path, const std::optional<Row>& row, const Vol
     return;
   }
   const auto width = TerminalWidth();
-  // Where the terminal is narrow, the figures are worth more than the bars.
+  // On a narrow terminal the numbers are more important than the bars.
   const Table table = MakeTable(volumes, 10);
   const bool fits = !width || table.NarrowestWidth() <= *width;
   (fits ? table : MakeTable(volumes, 0)).Print(std::cout, width);
@@ -145,7 +145,7 @@ void PrintJson(const std::string& path, const std::optional<Row>& row, const Vol
 } // namespace
 
 ExitStatus ShowStatus(const std::string& path, Form form) {
-  // Counting reads every row.
+  // Counting reads every row, which takes long.
   SQLite::Database database = CopyDatabase(path);
   (form == Form::Json ? PrintJson : PrintText)(path, ReadRow(database), ReadVolumes(database));
   return ExitStatus::Success;

@@ -12,7 +12,7 @@ namespace orva::zophotos {
 namespace {
 
 constexpr std::size_t GAP = 2;
-/// What is left of an elastic column at least.
+/// The smallest width of a shortened elastic column.
 constexpr std::size_t NARROWEST = 12;
 
 std::size_t Total(const std::vector<std::size_t>& widths) {
@@ -68,7 +68,7 @@ void Table::Print(std::ostream& stream, std::optional<std::size_t> width) const 
       line.append(GAP, ' ');
     }
     line.erase(line.find_last_not_of(' ') + 1);
-    // A figure that lost its end would look like another.
+    // A number without its end would look like another number, so the cut is marked.
     stream << (Width(line) <= limit ? line : std::string(Head(line, limit - 1)) + "…") << '\n';
   }
 }

@@ -8,7 +8,7 @@
 
 namespace orva::zophotos {
 
-/// Rows of printable texts in columns, which fit the terminal.
+/// Prints rows of printable texts in columns that fit the terminal.
 class Table {
 public:
   struct Column {
@@ -19,22 +19,22 @@ public:
 
   explicit Table(std::vector<Column> columns);
 
-  /// Adds a row with a text for each column.
+  /// Adds a row with one text per column.
   void AddRow(std::vector<std::string> cells);
 
-  /// Writes all rows below their headings, in no more than `width` columns: elastic columns give
-  /// way first, then the ends of the lines are left out.
+  /// Writes the headings and all rows, in at most `width` terminal columns. Shortens elastic
+  /// columns first, then cuts the ends of the lines.
   void Print(std::ostream& stream, std::optional<std::size_t> width) const;
 
-  /// Columns that Print needs at least to leave nothing else out.
+  /// The smallest width at which Print cuts no line.
   std::size_t NarrowestWidth() const;
 
 private:
-  /// Widths of the columns, of which elastic ones give way to come to `limit` in all.
+  /// Widths of the columns. Elastic columns shrink until the total is `limit`, if possible.
   std::vector<std::size_t> Widths(std::size_t limit) const;
 
   std::vector<Column> columns_;
-  std::vector<std::vector<std::string>> rows_; ///< the first one is the headings
+  std::vector<std::vector<std::string>> rows_; ///< the first row is the headings
 };
 
 } // namespace orva::zophotos

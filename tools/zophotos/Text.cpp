@@ -20,21 +20,23 @@ namespace {
 
 namespace utf = boost::locale::utf;
 
-/// Calls `onCharacter` with each code point and its bytes, and `onByte` with each byte that is part
-/// of none.
-template <typename OnCharacter, typename OnByte>
-void ForEachCharacter(std::string_view bytes, const OnCharacter& onCharacter,
-                      const OnByte& onByte) {
-  for (const char* next = bytes.begin(); next != bytes.end();) {
-    const char* const begin = next;
-    const utf::code_point point = utf::utf_traits<char>::decode(next, bytes.end());
-    if (utf::is_valid_codepoint(point)) {
-      onCharacter(point, {begin, next});
-    } else {
-      onByte(*begin);
-      next = std::next(begin);
-    }
+/// A code point and its bytes, or a single byte that is not UTF-8.
+struct Character {
+  utf::code_point point; ///< utf::illegal for such a byte
+  std::string_view bytes;
+};
+
+/// Removes the first character from `text`, which is not empty.
+Character TakeCharacter(std::string_view& text) {
+  const char* next = text.begin();
+  utf::code_point point = utf::utf_traits<char>::decode(next, text.end());
+  if (!utf::is_valid_codepoint(point)) {
+    point = utf::illegal;
+    next = std::next(text.begin());
   }
+  const std::string_view bytes(text.begin(), next);
+  text.remove_prefix(bytes.size());
+  return {.point = point, .bytes = bytes};
 }
 
 std::size_t CharacterWidth(utf::code_point point) {
@@ -45,29 +47,22 @@ std::size_t CharacterWidth(utf::code_point point) {
 
 /// The last characters that fit into `width` columns.
 std::string_view Tail(std::string_view printable, std::size_t width) {
-  std::size_t excess = Width(printable);
-  std::size_t begin = 0;
-  ForEachCharacter(
-      printable,
-      [&](utf::code_point point, std::string_view bytes) {
-        if (excess > width) {
-          excess -= CharacterWidth(point);
-          begin += bytes.size();
-        }
-      },
-      [](char) {});
-  return printable.substr(begin);
+  for (std::size_t columns = Width(printable); columns > width;) {
+    columns -= CharacterWidth(TakeCharacter(printable).point);
+  }
+  return printable;
 }
 
-/// Characters that cannot be seen, some of which have what is around them shown otherwise than it
-/// is written: those that Unicode calls default ignorable, without the joiners and variation
-/// selectors that scripts and emojis need.
-bool IsInvisible(utf::code_point point) {
+/// Whether a character is printable and visible. Characters that Unicode calls default ignorable
+/// are invisible, and some change how the characters around them are shown. Scripts and emojis
+/// need the joiners and variation selectors among them.
+bool IsVisible(utf::code_point point) {
   const auto has = [point](UProperty property) {
     return u_hasBinaryProperty(static_cast<UChar32>(point), property) != 0;
   };
-  return has(UCHAR_DEFAULT_IGNORABLE_CODE_POINT) && !has(UCHAR_JOIN_CONTROL) &&
-         !has(UCHAR_VARIATION_SELECTOR);
+  return std::iswprint(static_cast<std::wint_t>(point)) != 0 &&
+         (!has(UCHAR_DEFAULT_IGNORABLE_CODE_POINT) || has(UCHAR_JOIN_CONTROL) ||
+          has(UCHAR_VARIATION_SELECTOR));
 }
 
 bool IsInCalendar(std::int64_t seconds) {
@@ -91,60 +86,53 @@ void UseUtf8() {
 std::string ToUtf8(std::string_view bytes) {
   constexpr const char* replacement = "\uFFFD";
   std::string text;
-  ForEachCharacter(
-      bytes,
-      [&](utf::code_point point, std::string_view character) {
-        text += point == 0 ? replacement : character;
-      },
-      [&](char) { text += replacement; });
+  while (!bytes.empty()) {
+    const Character character = TakeCharacter(bytes);
+    const bool isText = character.point != 0 && character.point != utf::illegal;
+    text += isText ? character.bytes : replacement;
+  }
   return text;
 }
 
 std::string Printable(std::string_view bytes) {
   UseUtf8();
   std::string text;
-  const auto escape = [&text](char byte) {
-    std::array<char, 5> code{};
-    std::snprintf(code.data(), code.size(), "\\x%02x", static_cast<unsigned char>(byte));
-    text += code.data();
-  };
-  ForEachCharacter(
-      bytes,
-      [&](utf::code_point point, std::string_view character) {
-        if (point == '\\') {
-          text += "\\\\";
-        } else if (std::iswprint(static_cast<std::wint_t>(point)) != 0 && !IsInvisible(point)) {
-          text += character;
-        } else {
-          for (const char byte : character) {
-            escape(byte);
-          }
-        }
-      },
-      escape);
+  while (!bytes.empty()) {
+    const Character character = TakeCharacter(bytes);
+    if (character.point == '\\') {
+      text += "\\\\";
+    } else if (IsVisible(character.point)) {
+      text += character.bytes;
+    } else {
+      for (const char byte : character.bytes) {
+        std::array<char, 5> code{};
+        std::snprintf(code.data(), code.size(), "\\x%02x", static_cast<unsigned char>(byte));
+        text += code.data();
+      }
+    }
+  }
   return text;
 }
 
 std::size_t Width(std::string_view printable) {
   std::size_t columns = 0;
-  ForEachCharacter(
-      printable, [&](utf::code_point point, std::string_view) { columns += CharacterWidth(point); },
-      [](char) {});
+  while (!printable.empty()) {
+    columns += CharacterWidth(TakeCharacter(printable).point);
+  }
   return columns;
 }
 
 std::string_view Head(std::string_view printable, std::size_t width) {
   std::size_t columns = 0;
   std::size_t length = 0;
-  bool full = false;
-  ForEachCharacter(
-      printable,
-      [&](utf::code_point point, std::string_view bytes) {
-        columns += CharacterWidth(point);
-        full = full || columns > width;
-        length += full ? 0 : bytes.size();
-      },
-      [](char) {});
+  for (std::string_view rest = printable; !rest.empty();) {
+    const Character character = TakeCharacter(rest);
+    columns += CharacterWidth(character.point);
+    if (columns > width) {
+      break;
+    }
+    length += character.bytes.size();
+  }
   return printable.substr(0, length);
 }
 
@@ -181,7 +169,7 @@ std::optional<std::string> IsoTime(std::int64_t seconds) {
   if (!IsInCalendar(seconds) || gmtime_r(&time, &fields) == nullptr) {
     return std::nullopt;
   }
-  // strftime's %Y has no leading zeros.
+  // %Y of strftime writes no leading zeros.
   std::array<char, 12> year{};
   std::snprintf(year.data(), year.size(), "%04d", fields.tm_year + 1900);
   return year.data() + Format("-%m-%dT%H:%M:%SZ", fields);

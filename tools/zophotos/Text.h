@@ -8,26 +8,26 @@
 
 namespace orva::zophotos {
 
-/// Lets the C library know all characters, whatever the locale of the user does.
+/// Makes the C library handle all Unicode characters, independent of the user's locale.
 void UseUtf8();
 
-/// `bytes` for programs: what is not UTF-8, and NUL, becomes U+FFFD.
+/// `bytes` for programs: bytes that are not UTF-8, and NUL, become U+FFFD.
 std::string ToUtf8(std::string_view bytes);
 
-/// `bytes` for people: control characters, invisible ones, backslashes and what is not UTF-8 are
-/// escaped, so that a name can do nothing to a terminal.
+/// `bytes` for people: control characters, invisible characters, backslashes and bytes that are not
+/// UTF-8 are escaped, so that a name cannot control the terminal.
 std::string Printable(std::string_view bytes);
 
-/// Columns that a printable text takes on a terminal.
+/// The number of terminal columns that a printable text takes.
 std::size_t Width(std::string_view printable);
 
 /// The first characters of a printable text that fit into `width` columns.
 std::string_view Head(std::string_view printable, std::size_t width);
 
-/// A printable text in no more than `width` columns, its middle left out where it is longer.
+/// A printable text in at most `width` columns. The middle of a longer text is left out.
 std::string Shorten(const std::string& printable, std::size_t width);
 
-/// Columns of the terminal behind standard output; nothing when that is none.
+/// The width of the terminal at standard output; nothing if that is not a terminal.
 std::optional<std::size_t> TerminalWidth();
 
 /// "2026-11-21 09:15:00" in local time, for people; the number outside the years 1 to 9999.

@@ -5,6 +5,7 @@
 #include <SQLiteCpp/Statement.h>
 
 #include <algorithm>
+#include <ranges>
 #include <string_view>
 #include <vector>
 
@@ -17,26 +18,25 @@ struct StoredFolder {
   std::int64_t files;
 };
 
-/// A line of the tree, by a path that belongs to the list of folders. Folders that are only part of
-/// other folders' paths have one, too.
+/// A line of the tree. Its path points into the list of folders. A folder without a row, known only
+/// from paths below it, has a line, too.
 struct Node {
-  std::string_view path; ///< of the folder, or the beginning of another one
+  std::string_view path; ///< a folder's path, or the beginning of one
   std::size_t depth;
   std::int64_t files = 0;
   bool isStored = false;
-  bool isLast = false; ///< of its siblings
+  bool isLast = false; ///< the last one of its siblings
 };
 
-/// Whether `a` comes before `b` in a tree, where all that is in a folder follows it.
-bool ComesBefore(const StoredFolder& a, const StoredFolder& b) {
+/// Orders paths so that everything in a folder follows it directly: the separator sorts before all
+/// other characters.
+bool ComesBefore(const std::string& a, const std::string& b) {
   const auto rank = [](char byte) { return byte == '/' ? -1 : static_cast<unsigned char>(byte); };
-  return std::lexicographical_compare(
-      a.path.begin(), a.path.end(), b.path.begin(), b.path.end(),
-      [&rank](char left, char right) { return rank(left) < rank(right); });
+  return std::ranges::lexicographical_compare(a, b, {}, rank, rank);
 }
 
 std::vector<StoredFolder> ReadFolders(const std::string& path, const std::string& top) {
-  // Counting reads every file of a large library.
+  // Counting reads every file of a large library, which takes long.
   SQLite::Database database = CopyDatabase(path);
   SQLite::Statement query(database,
                           "SELECT name, (SELECT count(*) FROM Files f WHERE f.folder_id = "
@@ -45,13 +45,15 @@ std::vector<StoredFolder> ReadFolders(const std::string& path, const std::string
   query.bind(2, EndOfFolder(top));
   std::vector<StoredFolder> folders;
   while (query.executeStep()) {
-    folders.push_back({query.getColumn(0).getString(), query.getColumn(1).getInt64()});
+    folders.push_back(
+        {.path = query.getColumn(0).getString(), .files = query.getColumn(1).getInt64()});
   }
-  std::sort(folders.begin(), folders.end(), ComesBefore);
+  std::ranges::sort(folders, ComesBefore, &StoredFolder::path);
   return folders;
 }
 
-/// Adds the nodes for what `path` does not share with the open ones, and returns its own.
+/// Adds nodes for the components of `path` that are not open yet, and returns the last one. `open`
+/// holds the paths from the top to the current node.
 Node& AddPath(std::vector<Node>& nodes, std::vector<std::string_view>& open, std::string_view path,
               std::size_t topLength) {
   while (!open.empty() && !path.starts_with(open.back())) {
@@ -74,19 +76,19 @@ std::vector<Node> MakeTree(const std::vector<StoredFolder>& folders, const std::
     node.isStored = true;
     node.files += folder.files;
   }
-  // From the end, the first node of each depth that is met below a parent is its last child.
+  // Read from the end, the first node of a depth below a parent is the parent's last child.
   std::vector<bool> hasLast;
-  std::for_each(nodes.rbegin(), nodes.rend(), [&hasLast](Node& node) {
+  for (Node& node : nodes | std::views::reverse) {
     const bool known = node.depth < hasLast.size() && hasLast[node.depth];
     node.isLast = !known;
     hasLast.resize(node.depth + 1, false);
     hasLast[node.depth] = true;
-  });
+  }
   return nodes;
 }
 
 void PrintText(const std::vector<Node>& nodes) {
-  std::vector<std::string> indents; // of what is below the open nodes
+  std::vector<std::string> indents; // one for each level above the node
   for (const Node& node : nodes) {
     indents.resize(node.depth);
     if (node.depth == 0) {

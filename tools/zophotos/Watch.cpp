@@ -22,7 +22,7 @@ namespace orva::zophotos {
 
 namespace {
 
-/// How long a change may go unseen.
+/// The time between two looks.
 constexpr std::chrono::milliseconds INTERVAL(250);
 
 struct Progress {
@@ -33,13 +33,13 @@ struct Progress {
   bool operator==(const Progress&) const = default;
 };
 
-/// Rows of one table. Ids only grow, so that the last one given tells how many have come.
+/// The rows of a table. Ids only grow, so the difference of last ids is the number of added rows.
 struct Rows {
   std::int64_t count = 0;
   std::int64_t lastId = 0;
 };
 
-/// What two states of a database are compared by.
+/// The state of a database, as far as it is compared.
 struct State {
   Rows folders;
   Rows files;
@@ -51,16 +51,16 @@ struct Difference {
   std::int64_t removed = 0;
 };
 
-/// A file on disk, whatever its name.
+/// Identifies a file independent of its name.
 using FileIdentity = std::tuple<dev_t, ino_t>;
 
-std::int64_t Ask(SQLite::Database& database, const char* sql) {
+std::int64_t Number(SQLite::Database& database, const char* sql) {
   return database.execAndGet(sql).getInt64();
 }
 
-/// The last id that a row of the table was given, whether it is still there or not.
+/// The largest id ever given to a row of the table.
 std::int64_t LastId(SQLite::Database& database, const char* table) {
-  // Within bounds whose difference can be counted, whatever somebody has written there.
+  // The limits keep differences of untrusted values within 64 bits.
   SQLite::Statement query(database, "SELECT min(max(CAST(seq AS INTEGER), 0), 1 << 62) FROM "
                                     "sqlite_sequence WHERE name = ?");
   query.bind(1, table);
@@ -69,25 +69,27 @@ std::int64_t LastId(SQLite::Database& database, const char* table) {
 
 State ReadState(SQLite::Database& database) {
   State state;
-  state.folders = {Ask(database, "SELECT count(*) FROM Folders"), LastId(database, "Folders")};
-  state.files = {Ask(database, "SELECT count(*) FROM Files"), LastId(database, "Files")};
+  state.folders = {.count = Number(database, "SELECT count(*) FROM Folders"),
+                   .lastId = LastId(database, "Folders")};
+  state.files = {.count = Number(database, "SELECT count(*) FROM Files"),
+                 .lastId = LastId(database, "Files")};
   SQLite::Statement query(database, "SELECT volume, photos_xcoded, photos_total, last_updated_time "
                                     "FROM Statistics ORDER BY id DESC");
   while (query.executeStep()) {
-    state.volumes[query.getColumn(0).getString()] = {query.getColumn(1).getInt64(),
-                                                     query.getColumn(2).getInt64(),
-                                                     query.getColumn(3).getInt64()};
+    state.volumes[query.getColumn(0).getString()] = {.transcoded = query.getColumn(1).getInt64(),
+                                                     .total = query.getColumn(2).getInt64(),
+                                                     .mergedUpTo = query.getColumn(3).getInt64()};
   }
   return state;
 }
 
 Difference Compare(const Rows& before, const Rows& now) {
-  // Only a stranger gives ids that go back.
+  // Only in an untrusted database can ids become smaller.
   const auto added = std::max<std::int64_t>(now.lastId - before.lastId, 0);
   return {.added = added, .removed = std::max<std::int64_t>(before.count + added - now.count, 0)};
 }
 
-/// Adds the volumes that new rows belong to; of a merge all belong to one, so the first are enough.
+/// Adds the volumes of new rows. All rows of a merge have the same volume, so the first are enough.
 void AddVolumes(SQLite::Database& database, const char* newRowsSql, const Rows& before,
                 std::set<std::string>& volumes) {
   SQLite::Statement query(database, newRowsSql);
@@ -97,7 +99,7 @@ void AddVolumes(SQLite::Database& database, const char* newRowsSql, const Rows& 
   }
 }
 
-std::string Sign(const Difference& difference, const std::string& noun) {
+std::string Describe(const Difference& difference, const std::string& noun) {
   std::string text;
   if (difference.added != 0) {
     text += " +" + Count(difference.added, noun);
@@ -112,8 +114,8 @@ class Watch {
 public:
   Watch(const FindPath& findPath, Form form) : findPath_(findPath), form_(form) {}
 
-  /// Looks once, and prints what has changed since the last time. False when that cannot be
-  /// printed.
+  /// Looks once and prints what has changed since the last time. False if the output cannot be
+  /// written.
   bool Look() {
     try {
       const std::string path = findPath_();
@@ -145,7 +147,7 @@ private:
   }
 
   static std::int64_t Version(SQLite::Database& database) {
-    return Ask(database, "PRAGMA data_version");
+    return Number(database, "PRAGMA data_version");
   }
 
   void Open(const std::string& path) {
@@ -168,7 +170,7 @@ private:
            {"files", state_.files.count}});
   }
 
-  /// Tells once why nothing can be seen.
+  /// Prints once why the database is lost, and closes it.
   void Lose(const std::string& reason) {
     database_.reset();
     if (reason != loss_) {
@@ -177,7 +179,7 @@ private:
     }
   }
 
-  /// Tells once why a change that there may be cannot be seen yet.
+  /// Prints once why the database cannot be read at the moment.
   void Delay(const std::string& reason) {
     if (reason != delay_) {
       delay_ = reason;
@@ -209,12 +211,12 @@ private:
       }
       state_ = std::move(now);
     }
-    std::string text = Sign(folders, "folder") + Sign(files, "file");
+    std::string text = Describe(folders, "folder") + Describe(files, "file");
     Json volumes = Json::array();
     for (const std::string& volume : changed) {
       const Progress progress = state_.volumes[volume];
       text += "; " + Printable(volume) + " ";
-      text += progress.mergedUpTo == 0 ? "is to be merged from its beginning"
+      text += progress.mergedUpTo == 0 ? "will be merged from the beginning"
                                        : std::to_string(progress.transcoded) + " of " +
                                              Count(progress.total, "photo") + " transcoded";
       volumes.push_back({{"volume", ToUtf8(volume)},
@@ -246,11 +248,11 @@ private:
   Form form_;
   std::string path_;
   std::optional<FileIdentity> identity_;
-  std::optional<SQLite::Database> database_; ///< nothing while there is none
+  std::optional<SQLite::Database> database_; ///< empty while there is none
   std::int64_t version_ = 0;
   State state_;
-  std::string loss_;  ///< the reason that was printed last, until there is a database again
-  std::string delay_; ///< the same, until it can be read again
+  std::string loss_;  ///< the last reason that Lose printed; empty while there is a database
+  std::string delay_; ///< the last reason that Delay printed; empty while it can be read
 };
 
 } // namespace

@@ -18,25 +18,27 @@ using namespace orva::zophotos;
 class Options {
 public:
   Options() {
-    app_.require_subcommand(0, 1); // none is an error of ours, so that an unknown one is named
+    // None is allowed here so that CLI11 names an unknown command; Parse reports a missing one.
+    app_.require_subcommand(0, 1);
     app_.fallthrough();
     app_.set_version_flag("--version", "zophotos " ZOPHOTOS_VERSION);
     app_.add_option("--database", database_,
-                    "Read this database instead of the one that the daemon's locator file names")
+                    "Read this database instead of the one named by the daemon's locator file")
         ->type_name("FILE")
         ->check([](const std::string& path) {
-          return path.empty() ? std::string("it is empty") : std::string();
+          return path.empty() ? std::string("must not be empty") : std::string();
         });
-    app_.add_flag("--json", json_, "Print JSON: one object, or one a line from a list");
+    app_.add_flag("--json", json_, "Print JSON: one object, or one object per line");
     app_.failure_message([](const CLI::App* /*app*/, const CLI::Error& error) {
       return std::string("zophotos: ") + error.what() + "\nTry 'zophotos --help'.\n";
     });
-    app_.footer("Exit status: 0 all right; 1 damaged, or nothing found; 2 wrong command line; 3 no "
-                "database now;\n4 locked, try again; 5 anything else. See zophotos(1).");
+    app_.footer(
+        "Exit status: 0 success; 1 damaged, or nothing found; 2 wrong command line; 3 no database "
+        "now;\n4 locked, try again; 5 any other error. See zophotos(1).");
     AddCommands();
   }
 
-  /// Throws CLI::ParseError, for help, too.
+  /// Throws CLI::ParseError, also for --help and --version.
   void Parse(int argc, char** argv) {
     app_.parse(argc, argv);
     if (app_.get_subcommands().empty()) {
@@ -44,12 +46,12 @@ public:
     }
   }
 
-  /// Prints what a failed Parse is about; returns the exit status.
+  /// Prints the message or help of a CLI::ParseError and returns the exit status.
   ExitStatus Explain(const CLI::ParseError& error) const {
     return app_.exit(error) == 0 ? ExitStatus::Success : ExitStatus::Usage;
   }
 
-  /// Runs the command. Throws what it throws.
+  /// Runs the command. Throws Failure.
   ExitStatus Run() const {
     if (watch_->parsed()) {
       return WatchDatabase([this] { return FindPath(); }, OutputForm());
@@ -89,48 +91,50 @@ private:
   }
 
   void AddCommands() {
-    status_ = app_.add_subcommand("status", "Where the database is, and how far each volume is");
-    ls_ = app_.add_subcommand("ls", "What is in a folder");
-    ls_->add_flag("-l,--long", long_, "With times, numbers of files and volumes");
-    tree_ = app_.add_subcommand("tree", "All folders below one, with their numbers of files");
+    status_ = app_.add_subcommand("status", "Show the database and the progress of each volume");
+    ls_ = app_.add_subcommand("ls", "List a folder");
+    ls_->add_flag("-l,--long", long_, "Add times, numbers of files and volumes");
+    tree_ =
+        app_.add_subcommand("tree", "Show all folders below a folder, with their numbers of files");
     for (CLI::App* const command : {ls_, tree_}) {
-      command->add_option("FOLDER", folder_, "The folder, from /shares on")->default_str("/shares");
+      command->add_option("FOLDER", folder_, "The folder, absolute or relative to /shares")
+          ->default_str("/shares");
     }
-    find_ = app_.add_subcommand("find", "Files and folders by name");
+    find_ = app_.add_subcommand("find", "Find files and folders by name");
     find_
         ->add_option("PATTERN", search_.pattern,
-                     "A shell pattern for the name, or for the whole path when it has a /; without "
-                     "wildcards, a part of it")
+                     "Shell pattern for the name, or for the whole path if it has a /; without "
+                     "wildcards, text to find anywhere in it")
         ->required();
-    find_->add_flag("-i,--ignore-case", search_.ignoreCase, "Take A for a");
+    find_->add_flag("-i,--ignore-case", search_.ignoreCase, "Ignore case");
     find_->add_flag("-0,--null", search_.nullTerminated,
-                    "Print paths as they are, each with a NUL behind it");
+                    "Print paths unescaped, each followed by a NUL");
     find_->callback([this] {
       if (search_.nullTerminated && json_) {
-        throw CLI::ValidationError("find", "takes one of --null and --json");
+        throw CLI::ValidationError("find", "--null and --json cannot be combined");
       }
     });
-    check_ = app_.add_subcommand("check", "What is wrong with the database");
-    watch_ = app_.add_subcommand("watch", "A line for each change, until interrupted");
+    check_ = app_.add_subcommand("check", "Check the database for damage");
+    watch_ = app_.add_subcommand("watch", "Print a line for each change until interrupted");
     AddExport();
     for (CLI::App* const command : app_.get_subcommands({})) {
-      command->footer("Options of every command: zophotos --help");
+      command->footer("Options of all commands: zophotos --help");
     }
   }
 
   void AddExport() {
-    export_ = app_.add_subcommand("export", "Every file with its full path");
-    export_->add_flag("--csv", csv_, "Comma-separated values with a heading");
-    export_->add_flag("--jsonl", jsonLines_, "One JSON object a line; the same as --json");
+    export_ = app_.add_subcommand("export", "Print every file with its full path");
+    export_->add_flag("--csv", csv_, "Print comma-separated values with a line of headings");
+    export_->add_flag("--jsonl", jsonLines_, "Print one JSON object per line, like --json");
     export_->callback([this] {
       if (csv_ == (jsonLines_ || json_)) {
-        throw CLI::ValidationError("export", "takes one of --csv and --jsonl");
+        throw CLI::ValidationError("export", "needs either --csv or --jsonl");
       }
     });
   }
 
-  CLI::App app_{"Looks into the merged photo database. Only reads."};
-  CLI::App* status_ = nullptr; // they belong to app_
+  CLI::App app_{"Shows what is in the merged photo database. Never changes it."};
+  CLI::App* status_ = nullptr; // all of these are owned by app_
   CLI::App* ls_ = nullptr;
   CLI::App* tree_ = nullptr;
   CLI::App* find_ = nullptr;

@@ -23,10 +23,10 @@ public:
   /// Closes the connection.
   virtual ~DB();
 
-  /// A text that stands for the database; empty here.
+  /// A text that identifies the database; empty here.
   virtual std::string GetPrefix() const;
 
-  /// Told of a status to publish; does nothing here.
+  /// Publishes a status; does nothing here.
   virtual void UpdateStatus(const std::string& key, const std::string& value) const;
 
   /// Opens the file at `path` for reading and writing and creates it when there is none. A
@@ -67,12 +67,12 @@ protected:
   void Create(const std::string& path, const std::function<void()>& build);
 
   /// Open for derived classes: `busyTimeout` is in milliseconds; `immutable` promises that
-  /// nobody writes the file: SQLite then neither locks it nor checks it for changes. Only ReadWrite
-  /// creates.
+  /// the file does not change: SQLite then neither locks it nor checks it for changes. Only
+  /// ReadWrite creates.
   void Open(std::string path, Access access, int busyTimeout, bool immutable);
 
   /// Number of the transaction that runs on the open connection; 0 while there is none. Never the
-  /// same for two, so that it tells whether knowledge about a transaction is still valid.
+  /// same for two, so that a cache can be kept for one transaction.
   unsigned long long RunningTransaction() const noexcept;
 
   /// Executes `create` now, which makes an index in the running transaction, and `drop` before the

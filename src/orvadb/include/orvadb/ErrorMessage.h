@@ -15,7 +15,7 @@ std::string ErrorMessage(const std::string& reason, const char* file = __builtin
                          unsigned int line = __builtin_LINE());
 
 /// The last failure on `handle`: "file:line: SQLite's message (extended code N) in sql". A null
-/// handle stands for one that there was no memory for.
+/// handle means that there was no memory for one.
 std::string ErrorMessage(sqlite3* handle, const char* sql, const char* file = __builtin_FILE(),
                          unsigned int line = __builtin_LINE());
 

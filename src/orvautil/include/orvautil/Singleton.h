@@ -12,7 +12,7 @@ template <typename T>
 class Singleton {
 public:
   /// Returns the instance; T is default-constructed by the first call. Any thread.
-  /// Throws boost::thread_resource_error or boost::lock_error when the mutex fails it
+  /// Throws boost::thread_resource_error or boost::lock_error when locking fails
   /// (boost::mutex itself retries a lock that a signal interrupted), and what T throws.
   static T* Instance() {
     static boost::mutex mutex;

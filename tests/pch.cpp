@@ -1,0 +1,1 @@
+// Compiles the headers that most tests include; it holds nothing itself.

@@ -1,7 +1,0 @@
-# Tests of tools/orva-catalog, on real folders and real catalogs.
-add_private_root_test(orva_catalog_test
-  SOURCES ${CMAKE_CURRENT_LIST_DIR}/orva_catalog_test.cpp
-  LIBS orva_catalog_lib test_program)
-target_compile_definitions(orva_catalog_test PRIVATE
-  ORVA_CATALOG_PROGRAM="$<TARGET_FILE:orva-catalog>")
-add_dependencies(orva_catalog_test orva-catalog)
