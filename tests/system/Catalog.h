@@ -72,7 +72,7 @@ public:
   void Add(const FileRow& row);
   void Add(const TranscodingRow& row);
 
-  /// Adds a folder below the folder that its path names; that comes first.
+  /// Adds a folder, after the one that it is in.
   void AddFolder(const std::string& path, long modified = 0, CatalogFlags flags = {});
 
   /// Adds a photo whose transcoding was finished at `stamp`.
