@@ -170,7 +170,7 @@ TEST_F(UntrustedDatabaseTest, MoreIndicesThanARowIsWorthAreRefused) {
     EXPECT_EQ(Refusal(), "") << i;
     Made("CREATE INDEX i" + std::to_string(i) + " ON t(a)");
   }
-  EXPECT_THAT(Refusal(), HasSubstr("more indices than a row is worth"));
+  EXPECT_THAT(Refusal(), HasSubstr("too many indexes"));
 }
 
 TEST_F(UntrustedDatabaseTest, FileThatHasGrownMayTakeMoreWork) {
