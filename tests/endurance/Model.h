@@ -22,14 +22,14 @@ using Disks = std::map<std::string, std::unique_ptr<Disk>>;
 using Contents = std::map<std::string, Content>;
 
 /// What a notification comes to, as the log shows it.
-struct Outcome {
+struct Result {
   std::string mergedInto; ///< the master that a merge was announced with; empty when none was
   int merges = 0;         ///< merges that came to their end
   bool gaveUp = false;    ///< a merge failed and was ignored
   bool refused = false;   ///< the notification could not be handled
-  bool operator==(const Outcome&) const = default;
+  bool operator==(const Result&) const = default;
 };
-std::ostream& operator<<(std::ostream& stream, const Outcome& outcome);
+std::ostream& operator<<(std::ostream& stream, const Result& result);
 
 /// What the daemon should know and do: its rules about volumes, masters and states. The databases
 /// are told to it, and it says what a notification makes of them.
@@ -45,8 +45,8 @@ public:
   };
 
   /// Handles a notification for a volume, changing `databases` as it should.
-  Outcome Handle(notify::Event event, const std::string& mountPoint, Contents& databases,
-                 Circumstances circumstances);
+  Result Handle(notify::Event event, const std::string& mountPoint, Contents& databases,
+                Circumstances circumstances);
 
   enum class State { Default, Plugged, Scanned };
   State CurrentState() const { return state_; }
@@ -94,7 +94,7 @@ private:
   // While a notification is handled.
   Contents* databases_ = nullptr;
   Circumstances circumstances_;
-  Outcome outcome_;
+  Result result_;
 };
 
 /// Where the daemon puts a database of no place: its working directory.

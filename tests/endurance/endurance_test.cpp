@@ -79,22 +79,22 @@ std::string Difference(const std::vector<std::string>& expected,
 }
 
 /// What the lines of a notification say.
-Outcome Observe(const Log& lines) {
+Result Observe(const Log& lines) {
   const std::string at = " using master volume at ";
-  Outcome outcome;
+  Result result;
   int merged = 0;
   for (const LogLine& line : lines) {
     const std::size_t master = line.text.find(at);
     if (master != std::string::npos) {
-      outcome.mergedInto = line.text.substr(master + at.size());
+      result.mergedInto = line.text.substr(master + at.size());
     }
     merged +=
         line.text.starts_with("Merged ") && line.text.find(" files for ") != std::string::npos;
-    outcome.gaveUp = outcome.gaveUp || line.text.starts_with("Error that we will ignore ");
-    outcome.refused = outcome.refused || line.text.starts_with("MessageProcessor:: ");
+    result.gaveUp = result.gaveUp || line.text.starts_with("Error that we will ignore ");
+    result.refused = result.refused || line.text.starts_with("MessageProcessor:: ");
   }
-  outcome.merges = outcome.gaveUp ? 0 : merged;
-  return outcome;
+  result.merges = result.gaveUp ? 0 : merged;
+  return result;
 }
 
 /// A run of the daemon on an appliance whose disks come and go. After every event the daemon has to
@@ -345,8 +345,8 @@ protected:
     Note("nonsense of " + std::to_string(message.size()) + " bytes: " + message.substr(0, 60));
     appliance_->Service().Send(message);
     appliance_->Barrier();
-    const Outcome outcome = Observe(TakeLog());
-    EXPECT_EQ("", outcome.mergedInto);
+    const Result result = Observe(TakeLog());
+    EXPECT_EQ("", result.mergedInto);
     ExpectContents(contents_);
   }
 
@@ -441,8 +441,8 @@ protected:
     disturbance.during();
     appliance_->Barrier();
 
-    const Outcome outcome = Observe(TakeLog());
-    merges_ += outcome.merges;
+    const Result result = Observe(TakeLog());
+    merges_ += result.merges;
     if (disturbance.kind == Disturbance::PullOfTheMaster) {
       contents_ = ReadAll();
       return;
@@ -450,13 +450,13 @@ protected:
     // Who was faster shows only in what came of it.
     Model::Circumstances circumstances;
     if (disturbance.kind == Disturbance::Lock) {
-      circumstances.removalLocked = outcome.refused;
-      circumstances.mergeLocked = outcome.gaveUp;
+      circumstances.removalLocked = result.refused;
+      circumstances.mergeLocked = result.gaveUp;
     } else if (disturbance.kind == Disturbance::Pull) {
-      circumstances.readable = !outcome.gaveUp;
+      circumstances.readable = !result.gaveUp;
     }
     Contents expected = contents_;
-    EXPECT_EQ(model_.Handle(event, path + "/", expected, circumstances), outcome);
+    EXPECT_EQ(model_.Handle(event, path + "/", expected, circumstances), result);
     Expect(expected);
   }
   void Notify(Event event, const std::string& path) { Notify(event, path, Disturbance()); }

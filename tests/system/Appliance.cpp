@@ -53,12 +53,12 @@ void Appliance::StartWithOutput(const std::string& output) {
   Barrier();
 }
 
-DaemonProcess::End Appliance::Run(const std::vector<std::string>& environment) {
+int Appliance::Run(const std::vector<std::string>& environment) {
   daemon_ = std::make_unique<DaemonProcess>(DIRECTORY, OUTPUT, environment);
   return daemon_->AwaitEnd();
 }
 
-DaemonProcess::End Appliance::Shutdown() {
+int Appliance::Shutdown() {
   service_.Stop();
   return daemon_->AwaitEnd();
 }

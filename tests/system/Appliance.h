@@ -33,10 +33,10 @@ public:
   void StartWithOutput(const std::string& output);
 
   /// Starts the daemon where it is not expected to come so far, and waits for its end.
-  DaemonProcess::End Run(const std::vector<std::string>& environment = {});
+  int Run(const std::vector<std::string>& environment = {});
 
   /// Ends the notification service and waits for the daemon, which then ends by itself.
-  DaemonProcess::End Shutdown();
+  int Shutdown();
 
   /// True while a daemon runs.
   bool IsRunning() const { return daemon_ != nullptr && daemon_->IsRunning(); }

@@ -37,7 +37,7 @@ const Log REFUSED = {
 /// A daemon that tells how often the XML platform was terminated.
 class StartUp : public SystemTest {
 protected:
-  DaemonProcess::End RunProbed() {
+  int RunProbed() {
     // The sanitizer's runtime otherwise insists on being the first library.
     std::string asan = "ASAN_OPTIONS=verify_asan_link_order=0";
     if (const char* options = std::getenv("ASAN_OPTIONS")) {
