@@ -2,6 +2,7 @@
 
 #include "Flood.h"
 
+#include "orvautil/FileDescriptor.h"
 #include "support/TestScale.h"
 
 #include <arpa/inet.h>
@@ -47,29 +48,26 @@ std::string DeepestNesting(const std::string& head, const std::string& content,
   return head + Nested((LONGEST - head.size() - content.size() - tail.size()) / 7, content) + tail;
 }
 
-/// A file that says whether somebody has opened it.
+/// A file that knows whether it has been opened.
 class Decoy {
 public:
   explicit Decoy(const std::string& path) : events_(inotify_init1(IN_NONBLOCK | IN_CLOEXEC)) {
     std::ofstream(path) << "<!ENTITY decoy 'opened'>";
-    if (inotify_add_watch(events_, path.c_str(), IN_OPEN | IN_ACCESS) == -1) {
+    if (inotify_add_watch(events_.Get(), path.c_str(), IN_OPEN | IN_ACCESS) == -1) {
       throw std::system_error(errno, std::generic_category(), path);
     }
   }
-  Decoy(const Decoy&) = delete;
-  Decoy& operator=(const Decoy&) = delete;
-  ~Decoy() { close(events_); }
 
   bool WasOpened() const {
     std::array<char, 4096> event{};
-    return read(events_, event.data(), event.size()) > 0;
+    return read(events_.Get(), event.data(), event.size()) > 0;
   }
 
 private:
-  int events_; ///< owned
+  util::FileDescriptor events_;
 };
 
-/// A server on this machine that says whether somebody has connected to it.
+/// A server on this machine that knows whether a client has connected to it.
 class DecoyServer {
 public:
   DecoyServer() : listener_(socket(AF_INET, SOCK_STREAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0)) {
@@ -77,29 +75,23 @@ public:
     address.sin_family = AF_INET;
     address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
     socklen_t size = sizeof address;
-    if (bind(listener_, reinterpret_cast<const sockaddr*>(&address), size) != 0 ||
-        listen(listener_, SOMAXCONN) != 0 ||
-        getsockname(listener_, reinterpret_cast<sockaddr*>(&address), &size) != 0) {
+    if (bind(listener_.Get(), reinterpret_cast<const sockaddr*>(&address), size) != 0 ||
+        listen(listener_.Get(), SOMAXCONN) != 0 ||
+        getsockname(listener_.Get(), reinterpret_cast<sockaddr*>(&address), &size) != 0) {
       throw std::system_error(errno, std::generic_category(), "decoy server");
     }
     url_ = "http://127.0.0.1:" + std::to_string(ntohs(address.sin_port)) + "/decoy";
   }
-  DecoyServer(const DecoyServer&) = delete;
-  DecoyServer& operator=(const DecoyServer&) = delete;
-  ~DecoyServer() { close(listener_); }
 
   const std::string& Url() const { return url_; }
 
   bool WasConnected() const {
-    const int client = accept4(listener_, nullptr, nullptr, SOCK_CLOEXEC);
-    if (client != -1) {
-      close(client);
-    }
-    return client != -1;
+    const util::FileDescriptor client(accept4(listener_.Get(), nullptr, nullptr, SOCK_CLOEXEC));
+    return static_cast<bool>(client);
   }
 
 private:
-  int listener_; ///< owned
+  util::FileDescriptor listener_;
   std::string url_;
 };
 
