@@ -17,9 +17,9 @@ const std::string SHARES = "/shares";
 constexpr double SHARES_CAPACITY = 104857600000.0;
 constexpr double NEEDED_SPACE = 209715200.0;
 
-/// Where the daemon gives up a merge, and the notification is done.
+/// The daemon gives up a merge; the notification is handled.
 struct GivenUp {};
-/// Where the daemon gives up the notification.
+/// The daemon gives up the notification.
 struct Refused {};
 
 } // namespace
@@ -156,7 +156,7 @@ void Model::Merge(const std::string& mountPoint) {
     try {
       Open(Location(master_));
     } catch (const Refused&) {
-      // Without the directory it is no failure of the database.
+      // Without the directory the database has not failed.
       if (std::filesystem::exists(Location(master_) + "/.zophotos")) {
         throw GivenUp();
       }

@@ -64,8 +64,8 @@ private:
   long longestWait_ = 0;
 };
 
-/// Merges of B into A that are watched. B grows by folders of 500 photos, each with a stamp of its
-/// own.
+/// Merges of B into A while other programs read. B grows by folders of 500 photos, each with a
+/// stamp of its own.
 class Readers : public SystemTest {
 protected:
   void SetUp() override {
@@ -88,15 +88,15 @@ protected:
 
   void Merge() { appliance.Handle(TranscodedBatch(b.Path())); }
 
-  /// What a reader sees when all that there is in the catalog has been merged.
+  /// What a reader sees after the merge of the whole catalog.
   std::string Whole() const {
     const std::string photos = std::to_string(folders * PER_FOLDER);
     return photos + "|0|" + std::to_string(folders + 1) + "|" + photos + "|" + photos + "|" +
            std::to_string(folders);
   }
 
-  /// What a reader may see before a re-merge begins to add: the time set back, then no files, then
-  /// no folders either.
+  /// What a reader may see before a re-merge adds rows: first the time is reset, then there are no
+  /// files, then no folders.
   std::set<std::string> SetBack() const {
     const std::string photos = std::to_string(folders * PER_FOLDER);
     const std::string rest = std::to_string(folders + 1) + "|" + photos + "|" + photos + "|0";
@@ -110,7 +110,7 @@ protected:
   int folders = 0;
 };
 
-TEST_F(Readers, SeeOnlyWhatWasCommitted) {
+TEST_F(Readers, SeeOnlyCommittedData) {
   Grow(TestScale(10'000, 50'000));
   Merge();
   std::set<std::string> committed{Whole()};
@@ -141,7 +141,7 @@ TEST_F(Readers, SeeOnlyWhatWasCommitted) {
                std::to_string(reads));
 }
 
-/// The daemon is held before each of its effects, and somebody reads who does not wait.
+/// The daemon is held before each of its effects, and a reader reads without waiting for locks.
 TEST_F(Readers, WaitOnlyForTheCommit) {
   Grow(1000);
   Merge();
@@ -159,7 +159,7 @@ TEST_F(Readers, WaitOnlyForTheCommit) {
     }
   };
 
-  // What is read, with the number of effects at which it is, one behind the other.
+  // The results of the reads in their order, each with the number of effects it lasted.
   std::vector<std::pair<std::string, int>> phases;
   int added = 0;
   int readsBetweenAdds = 0;
@@ -196,7 +196,7 @@ TEST_F(Readers, WaitOnlyForTheCommit) {
   EXPECT_EQ(Whole(), phases[2].first);
 }
 
-TEST_F(Readers, TellHowLongTheyWaited) {
+TEST_F(Readers, ReportTheirLongestWait) {
   Grow(1'000);
   for (const int photos : {1'000, 50'000}) {
     long longest = 0;
