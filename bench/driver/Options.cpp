@@ -16,7 +16,7 @@ std::optional<Options> ParseOptions(const std::vector<std::string>& arguments) {
   CLI::App app("Compares the daemon with the floor and the horizon; doc/performance.md explains "
                "the figures.",
                "bench");
-  app.set_version_flag("--version", "bench " BENCH_VERSION);
+  app.set_version_flag("--version", "bench " PROGRAM_VERSION);
   app.add_flag("--quick", quick, "Leave out the catalogs of 1,000,000 files");
   app.add_option("--sizes", options.sizes, "Files of the catalogs (10000,100000,1000000)")
       ->option_text("N,...")

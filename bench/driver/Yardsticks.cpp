@@ -1,12 +1,16 @@
 #include "Yardsticks.h"
 
 #include "Median.h"
-#include "Process.h"
 #include "ReaderStatements.h"
 
+#include "support/Program.h"
+
 #include <algorithm>
+#include <chrono>
 #include <filesystem>
 #include <fstream>
+#include <stdexcept>
+#include <string>
 #include <vector>
 
 namespace orva::bench {
@@ -23,6 +27,20 @@ const std::string READER_SCRIPT = "/tmp/reader.sql";
 const std::string LINES = "/tmp/floor.out";
 const std::string NOWHERE = "/dev/null";
 
+/// The seconds from before the start of a program to after its end, with its standard output in the
+/// file `output`. Throws std::runtime_error unless it ends with status 0.
+double RunTime(const std::vector<std::string>& command, const std::string& output) {
+  constexpr std::chrono::hours LIMIT{24};
+  const auto begin = std::chrono::steady_clock::now();
+  test::Program program(command, {.output = output, .errors = test::Program::Errors::Inherited});
+  const int status = program.WaitForEnd(LIMIT);
+  const std::chrono::duration<double> elapsed = std::chrono::steady_clock::now() - begin;
+  if (status != 0) {
+    throw std::runtime_error(command.front() + " has failed");
+  }
+  return elapsed.count();
+}
+
 /// The time of `command` less that of `start`, which starts the same program and does no work.
 double Beyond(const std::vector<std::string>& start, const std::vector<std::string>& command,
               const std::string& output) {
@@ -31,9 +49,9 @@ double Beyond(const std::vector<std::string>& start, const std::vector<std::stri
   constexpr double SHORTEST = 0.0001;
   Times starts;
   for (int i = 0; i < STARTS; ++i) {
-    starts.push_back(RunProcess(start, NOWHERE));
+    starts.push_back(RunTime(start, NOWHERE));
   }
-  return std::max(RunProcess(command, output) - Median(starts), SHORTEST);
+  return std::max(RunTime(command, output) - Median(starts), SHORTEST);
 }
 
 /// The shell's command that sets a parameter to `value`, an SQL expression.

@@ -195,7 +195,7 @@ void DB::RejectComputedColumns(const std::string& table) const {
   while (index.Fetch()) {
     rejectIf(index.GetBool(4), "partial index");
     indexes.push_back(index.GetText(1));
-    rejectIf(indexes.size() > MOST_INDEXES, "more indices than a row is worth");
+    rejectIf(indexes.size() > MOST_INDEXES, "too many indexes");
   }
   for (const std::string& name : indexes) {
     const std::string listKeys = Pragma("index_xinfo", name);

@@ -76,7 +76,7 @@ public:
                     const XMLSize_t attributeCount, const bool isEmpty,
                     const bool isRoot) override {
     if (depth_ == DEEPEST_NESTING) {
-      throw IllFormedMessage("more elements inside each other than can end");
+      throw IllFormedMessage("elements nested too deeply");
     }
     ++depth_; // also for an empty element: endElement is called for it
     XercesDOMParser::startElement(elementDecl, uriId, prefix, attributes, attributeCount, isEmpty,

@@ -17,7 +17,7 @@ Thread::~Thread() {
 
 void Thread::Create(int stackMebibytes, unsigned flags, bool detached) {
   if (stackMebibytes <= 0 || flags != 0 || detached) {
-    throw Exception("A thread needs a stack, knows no flags and is joinable");
+    throw Exception("a thread needs a stack size, no flags, and must be joinable");
   }
   boost::thread::attributes attributes;
   attributes.set_stack_size(static_cast<std::size_t>(stackMebibytes) << 20U);

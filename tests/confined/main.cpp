@@ -1,127 +1,171 @@
-// confine COMMAND [ARGUMENT...]: becomes the command, confined as the daemon's unit says.
+// confine COMMAND [ARGUMENT...]: becomes the command, with the system call filters of the daemon's
+// unit.
 //
-// For the tests that start the daemon themselves, without a systemd. What is applied here is
-// applied as systemd does it; tests/package has the rest, under a real one. Linked statically, so
-// that what a test preloads into the daemon leaves it alone.
-#include "Filter.h"
-#include "Root.h"
-#include "Unit.h"
+// The tests that start the daemon without systemd can start it with this program (DaemonProcess.h),
+// and so run all of the daemon's code under the filters. It applies SystemCallFilter=,
+// RestrictAddressFamilies= and MemoryDenyWriteExecute= of the unit file. libseccomp adds
+// NoNewPrivileges=yes and SystemCallArchitectures=native. tests/package/inside covers the rest of
+// the unit under a real systemd: the capabilities, the read-only and inaccessible paths, the
+// namespaces.
+//
+// Linked statically, so that the libraries that a test preloads into the daemon do not affect it.
 
-#include <linux/capability.h>
-#include <sys/prctl.h>
-#include <sys/stat.h>
+#include <seccomp.h>
+#include <sys/mman.h>
+#include <sys/socket.h>
 #include <unistd.h>
 
-#include <array>
-#include <cstdlib>
+#include <cerrno>
+#include <cstdint>
+#include <cstring>
 #include <exception>
+#include <fstream>
 #include <iostream>
+#include <map>
+#include <memory>
 #include <set>
+#include <sstream>
 #include <stdexcept>
 #include <string>
-#include <string_view>
+#include <vector>
 
 namespace {
 
-using namespace orva::test;
+using Words = std::vector<std::string>;
+using Groups = std::map<std::string, Words>;
 
-/// How the service is run, which is the test's affair here.
-const std::set<std::string> RUN = {"ExecStart",      "Restart",          "RestartSec",
-                                   "Type",           "RuntimeDirectory", "WorkingDirectory",
-                                   "StandardOutput", "StandardError"};
-
-const std::set<std::string> APPLIED = {"CapabilityBoundingSet",
-                                       "InaccessiblePaths",
-                                       "LockPersonality",
-                                       "MemoryDenyWriteExecute",
-                                       "NoNewPrivileges",
-                                       "PrivateIPC",
-                                       "PrivateMounts",
-                                       "PrivateNetwork",
-                                       "PrivateTmp",
-                                       "ProtectHome",
-                                       "ProtectHostname",
-                                       "ProtectKernelTunables",
-                                       "ProtectSystem",
-                                       "ReadOnlyPaths",
-                                       "RestrictAddressFamilies",
-                                       "RestrictNamespaces",
-                                       "RestrictRealtime",
-                                       "RestrictSUIDSGID",
-                                       "SystemCallArchitectures",
-                                       "SystemCallFilter",
-                                       "UMask"};
-
-/// Follow from the capabilities and system calls that are left.
-const std::set<std::string> IMPLIED = {"ProtectClock", "ProtectKernelLogs", "ProtectKernelModules"};
-
-/// Control groups, a /dev and a /proc that a process cannot give itself, what comes at the end.
-const std::set<std::string> NOT_APPLIED = {
-    "DevicePolicy", "IPAddressDeny",        "KeyringMode", "PrivateDevices",
-    "ProcSubset",   "ProtectControlGroups", "ProtectProc", "RemoveIPC"};
-
-/// A setting that is new to the unit must not be believed to be applied.
-void CheckSettings(const Unit& unit) {
-  for (const std::string& name : unit.Names()) {
-    if (!RUN.contains(name) && !APPLIED.contains(name) && !IMPLIED.contains(name) &&
-        !NOT_APPLIED.contains(name)) {
-      throw std::runtime_error("nobody has said whether this applies " + name);
+/// The values of a setting of the unit, in their order.
+Words Values(const std::string& setting) {
+  std::ifstream file(UNIT);
+  Words values;
+  for (std::string line; std::getline(file, line);) {
+    if (line.starts_with(setting + "=")) {
+      values.push_back(line.substr(setting.size() + 1));
     }
   }
-  if (unit.Is("PrivateTmp") ||
-      unit.Words("SystemCallArchitectures") != std::vector<std::string>{"native"}) {
-    throw std::runtime_error("a setting has a value that is not applied");
+  if (values.empty()) {
+    throw std::runtime_error("there is no " + setting + "= in " UNIT);
+  }
+  return values;
+}
+
+void ExpectValue(const std::string& setting, const std::string& value) {
+  if (Values(setting) != Words{value}) {
+    throw std::runtime_error(setting + "= is not " + value);
   }
 }
 
-int Capability(const std::string& name) {
-  constexpr std::array<std::pair<std::string_view, int>, 4> CAPABILITIES = {
-      {{"CAP_CHOWN", CAP_CHOWN},
-       {"CAP_DAC_OVERRIDE", CAP_DAC_OVERRIDE},
-       {"CAP_FOWNER", CAP_FOWNER},
-       {"CAP_FSETID", CAP_FSETID}}};
-  for (const auto& [known, number] : CAPABILITIES) {
-    if (known == name) {
-      return number;
+/// Reads what `systemd-analyze syscall-filter` prints: the name of a group in the first column, its
+/// members indented below it.
+Groups ReadGroups() {
+  std::ifstream file(GROUPS);
+  Groups groups;
+  std::string group;
+  for (std::string line; std::getline(file, line);) {
+    std::string name;
+    std::istringstream(line) >> name;
+    if (line.starts_with('@')) {
+      group = name;
+    } else if (line.starts_with(' ') && !name.starts_with('#')) {
+      groups[group].push_back(name);
     }
   }
-  throw std::runtime_error("unknown capability " + name);
+  return groups;
 }
 
-/// The bounding set is what root has of its capabilities once it has become the command.
-void DropCapabilities(const Unit& unit) {
-  std::set<int> kept;
-  for (const std::string& name : unit.Words("CapabilityBoundingSet")) {
-    kept.insert(Capability(name));
+/// Adds the system call `name`, or those of the group `name`.
+void Expand(const Groups& groups, const std::string& name, std::set<std::string>& calls) {
+  if (!name.starts_with('@')) {
+    calls.insert(name);
+    return;
   }
-  for (int capability = 0; prctl(PR_CAPBSET_READ, capability) >= 0; ++capability) {
-    if (!kept.contains(capability) && prctl(PR_CAPBSET_DROP, capability) != 0) {
-      throw std::runtime_error("PR_CAPBSET_DROP");
+  for (const std::string& member : groups.at(name)) {
+    Expand(groups, member, calls);
+  }
+}
+
+/// The system calls that the unit allows. The first value of the setting is a list of allowed
+/// calls; the later ones add to it or, with a tilde, remove from it.
+std::set<std::string> AllowedCalls() {
+  const Groups groups = ReadGroups();
+  std::set<std::string> allowed;
+  Expand(groups, "@default", allowed);
+  for (const std::string& value : Values("SystemCallFilter")) {
+    const bool removes = value.starts_with('~');
+    std::istringstream words(value.substr(removes ? 1 : 0));
+    for (std::string word; words >> word;) {
+      std::set<std::string> calls;
+      Expand(groups, word, calls);
+      if (removes) {
+        std::erase_if(allowed, [&calls](const auto& call) { return calls.contains(call); });
+      } else {
+        allowed.merge(calls);
+      }
     }
   }
+  return allowed;
 }
 
-void Confine(const Unit& unit) {
-  CheckSettings(unit);
-  ConfineRoot(unit, KEPT);
-  umask(static_cast<mode_t>(std::stoul(unit.Words("UMask").at(0), nullptr, 8)));
-  DropCapabilities(unit);
-  if (unit.Is("NoNewPrivileges") && prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) != 0) {
-    throw std::runtime_error("PR_SET_NO_NEW_PRIVS");
+/// A filter of the kernel. A process may have several; the strictest result counts.
+class Filter {
+public:
+  /// `otherwise` is the action for calls without a rule.
+  explicit Filter(std::uint32_t otherwise) : context_(seccomp_init(otherwise), seccomp_release) {}
+
+  /// Adds a rule. Ignores calls that this architecture does not have.
+  void Add(std::uint32_t action, const std::string& call,
+           const std::vector<scmp_arg_cmp>& arguments = {}) {
+    const int number = seccomp_syscall_resolve_name(call.c_str());
+    if (number >= 0) {
+      Check(seccomp_rule_add_array(context_.get(), action, number,
+                                   static_cast<unsigned>(arguments.size()), arguments.data()));
+    }
   }
-  FilterSystemCalls(unit, GROUPS);
+
+  void Load() { Check(seccomp_load(context_.get())); }
+
+private:
+  static void Check(int result) {
+    if (result < 0) {
+      throw std::runtime_error(std::strerror(-result));
+    }
+  }
+
+  std::unique_ptr<void, decltype(&seccomp_release)> context_;
+};
+
+void FilterSystemCalls() {
+  ExpectValue("NoNewPrivileges", "yes");
+  ExpectValue("SystemCallArchitectures", "native");
+  // As systemd does: what looks at arguments returns an error, a call that is not allowed kills.
+  Filter restrictions(SCMP_ACT_ALLOW);
+  ExpectValue("RestrictAddressFamilies", "AF_UNIX");
+  restrictions.Add(SCMP_ACT_ERRNO(EAFNOSUPPORT), "socket", {{0, SCMP_CMP_NE, AF_UNIX, 0}});
+  ExpectValue("MemoryDenyWriteExecute", "yes");
+  constexpr std::uint64_t BOTH = PROT_WRITE | PROT_EXEC;
+  restrictions.Add(SCMP_ACT_ERRNO(EPERM), "mmap", {{2, SCMP_CMP_MASKED_EQ, BOTH, BOTH}});
+  for (const char* const call : {"mprotect", "pkey_mprotect"}) {
+    restrictions.Add(SCMP_ACT_ERRNO(EPERM), call, {{2, SCMP_CMP_MASKED_EQ, PROT_EXEC, PROT_EXEC}});
+  }
+  Filter list(SCMP_ACT_KILL_PROCESS);
+  for (const std::string& call : AllowedCalls()) {
+    list.Add(SCMP_ACT_ALLOW, call);
+  }
+  // The list last: it forbids to load another filter.
+  restrictions.Load();
+  list.Load();
 }
 
 } // namespace
 
 int main(int count, char* arguments[]) {
-  constexpr int FAILURE = 99; // the daemon knows no such status
+  constexpr int FAILURE = 99; // not a status of the daemon
   if (count < 2) {
     std::cerr << "usage: confine COMMAND [ARGUMENT...]\n";
     return FAILURE;
   }
   try {
-    Confine(Unit(UNIT));
+    FilterSystemCalls();
   } catch (const std::exception& error) {
     std::cerr << "confine: " << error.what() << '\n';
     return FAILURE;

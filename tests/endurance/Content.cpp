@@ -22,7 +22,7 @@ Fields Split(const std::string& row) {
   return fields;
 }
 
-/// The path of the folder that holds what is at `path`.
+/// The path of the folder of `path`.
 std::string ParentOf(const std::string& path) {
   return path.substr(0, path.rfind('/', path.size() - 2) + 1);
 }
@@ -100,7 +100,7 @@ void Content::AddFolder(const std::string& path, const std::string& modified,
   }
 }
 
-/// Subfolders stay, until the catalog says that they were deleted too.
+/// Subfolders stay until the catalog marks them as deleted, too.
 void Content::DeleteFolder(const std::string& path, const std::string& volume) {
   const auto found = folders_.find(path);
   if (found == folders_.end() || found->second.volume != volume) {

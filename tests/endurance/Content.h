@@ -8,31 +8,31 @@
 
 namespace orva::test {
 
-/// What a merged database holds, without ids and without the status row; and what the daemon's work
-/// makes of it, put as plainly as it can be.
+/// The content of a merged database without ids and without the status row, and a simple model of
+/// the daemon's changes to it.
 class Content {
 public:
-  /// A new database.
+  /// The content of a new database.
   Content();
 
-  /// The database at `location`; a new one's content when there is none.
+  /// The content of the database at `location`; that of a new one when there is none.
   static Content At(const std::string& location);
 
-  /// Applies the disk's catalog: what has changed since the last time, or, for a merger that was
-  /// told to stop, the counts alone.
+  /// Applies the changes of the disk's catalog since the last merge; only its counts when the
+  /// merger has been stopped.
   void Merge(const Disk& disk, bool stopped);
 
-  /// Takes the volume's rows and leaves its counts.
+  /// Removes the volume's rows, but not its counts.
   void RemoveVolume(const std::string& mountPoint);
 
-  /// The content as text, line by line, in order; of some volumes only when `of` names any.
+  /// The content as sorted lines of text; only for the volumes `of`, unless that is empty.
   std::vector<std::string> Lines(const std::vector<std::string>& of = {}) const;
 
   bool operator==(const Content&) const = default;
 
 private:
   struct Folder {
-    std::string parent; ///< its path; NOTHING when the row has gone
+    std::string parent; ///< its path; NOTHING when that row has been removed
     std::string modified;
     std::string volume;
     bool operator==(const Folder&) const = default;

@@ -224,7 +224,7 @@ void Disk::Rename(const std::string& folder) {
   }
 }
 
-/// Never the same twice on a disk; in no order.
+/// A name that is new on this disk, in no order.
 std::string Disk::NewName() {
   static const std::vector<std::string> STEMS{"a", "Summer ", "it's 50%", "\xc3\xa9t\xc3\xa9 ",
                                               "Z", "-",       "%s%n"};
@@ -232,7 +232,7 @@ std::string Disk::NewName() {
   return STEMS[static_cast<std::size_t>(names_ * 31) % STEMS.size()] + std::to_string(names_);
 }
 
-/// "" stands for the top of the disk.
+/// "" is the root of the disk.
 std::string Disk::AnyFolder(Random& random) const {
   std::vector<std::string> paths = Rows().Run("SELECT path FROM Folders ORDER BY id");
   paths.emplace_back();
@@ -244,7 +244,7 @@ std::string Disk::AnyPhoto(Random& random) const {
   return paths.empty() ? "no photo" : random.Of(paths);
 }
 
-/// Mostly later than every stamp before; sometimes not, and then a merge need not see it.
+/// Usually later than all stamps before; if not, a merge need not see the change.
 std::string Disk::Stamp(Random& random) {
   stamp_ += static_cast<long>(random.Below(3));
   return std::to_string(random.Chance(10) ? stamp_ - static_cast<long>(random.Below(50)) : stamp_);

@@ -9,49 +9,51 @@
 
 namespace orva::test {
 
-/// A volume that keeps what it holds while it is not plugged in: a tmpfs below /tmp/disks that is
-/// shown below /shares. Its catalog can be changed at any time, as if the disk had been elsewhere.
+/// A volume that keeps its content while it is not plugged in: a tmpfs below /tmp/disks, with a
+/// bind mount below /shares. Its catalog can be changed at any time, as if another machine had done
+/// it.
 class Disk {
 public:
-  /// Makes the disk with an empty catalog, not yet mounted. `size` as mount takes it ("150g").
+  /// Creates the disk with an empty catalog, not yet mounted. `size` as in mount(8) ("150g").
   Disk(std::string name, const std::string& size);
   Disk(const Disk&) = delete;
   Disk& operator=(const Disk&) = delete;
   ~Disk();
 
-  /// The place that a service names, without a trailing separator; there only while mounted.
+  /// The mount point as the notification service writes it, without a trailing separator.
   std::string Path() const { return "/shares/" + name_; }
-  /// The place as the daemon registers it.
+  /// The mount point as the daemon registers it.
   std::string MountPoint() const { return Path() + "/"; }
-  /// Where the same files are always to be found.
+  /// The place where its files can always be found.
   std::string Keeper() const { return "/tmp/disks/" + name_; }
 
   void Mount();
   bool IsMounted() const { return mounted_; }
 
-  /// Takes the file system away; its mount point stays behind, until Sweep.
+  /// Unmounts the disk; the directory of the mount point stays until Sweep.
   void Unmount();
-  /// Removes the mount point that Unmount has left, with what somebody put there since.
+  /// Removes the directory that Unmount has left, with its content.
   void Sweep() const;
 
-  /// Lets nobody, or everybody, write below Path. A disk that is mounted again is writable.
+  /// Makes the mount at Path read-only or writable. Mount makes it writable again.
   void SetReadOnly(bool readOnly);
   bool IsReadOnly() const { return readOnly_; }
 
-  /// What there is of a catalog.
+  /// The state of the catalog file.
   enum class CatalogState {
     Good,
     Absent, ///< cannot be opened
-    Broken, ///< can be opened and not be read
+    Broken, ///< can be opened, but not be read
   };
   CatalogState State() const { return state_; }
-  /// Takes the catalog away, breaks it in one of several ways, or puts it back.
+  /// Removes the catalog, breaks it in one of several ways, or restores it.
   void SetCatalogState(CatalogState state, Random& random);
 
-  /// The catalog. Only read while it is not good.
+  /// The catalog. Must not be written unless its state is Good.
   const Database& Rows() const { return catalog_->Rows(); }
 
-  /// Makes one change of a good catalog as an indexer would, or should not; returns what it was.
+  /// Makes a random change in a good catalog, also ones that no indexer should make. Returns its
+  /// description.
   std::string Change(Random& random);
 
 private:

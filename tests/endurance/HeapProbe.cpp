@@ -1,5 +1,5 @@
-// Preloaded into the daemon: whenever it is about to wait for the next bytes from its socket, tells
-// a file how many bytes of the heap are in use. The file is named by HEAP_PROBE.
+// Preloaded into the daemon: before each wait for bytes from its socket, writes the number of heap
+// bytes in use to the file that HEAP_PROBE names.
 
 #undef _FORTIFY_SOURCE // its headers define recv as well
 
@@ -14,7 +14,7 @@
 
 namespace {
 
-void TellHeap() {
+void WriteHeapSize() {
   const char* const path = std::getenv("HEAP_PROBE");
   if (path == nullptr) {
     return;
@@ -22,13 +22,13 @@ void TellHeap() {
   const std::string next = std::string(path) + ".next";
   const struct mallinfo2 heap = mallinfo2();
   std::ofstream(next) << heap.uordblks + heap.hblkhd;
-  std::rename(next.c_str(), path); // whoever reads finds a whole number
+  std::rename(next.c_str(), path); // a reader never sees half a number
 }
 
 } // namespace
 
 extern "C" ssize_t recv(int fd, void* buf, size_t n, int flags) {
-  TellHeap();
+  WriteHeapSize();
   static void* const next = dlsym(RTLD_NEXT, "recv");
   return reinterpret_cast<ssize_t (*)(int, void*, size_t, int)>(next)(fd, buf, n, flags);
 }

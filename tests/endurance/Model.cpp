@@ -17,23 +17,23 @@ const std::string SHARES = "/shares";
 constexpr double SHARES_CAPACITY = 104857600000.0;
 constexpr double NEEDED_SPACE = 209715200.0;
 
-/// Where the daemon gives up a merge, and the notification is done.
+/// The daemon gives up a merge; the notification is handled.
 struct GivenUp {};
-/// Where the daemon gives up the notification.
+/// The daemon gives up the notification.
 struct Refused {};
 
 } // namespace
 
-std::ostream& operator<<(std::ostream& stream, const Outcome& outcome) {
-  return stream << "merge into '" << outcome.mergedInto << "', done " << outcome.merges
-                << ", given up " << outcome.gaveUp << ", refused " << outcome.refused;
+std::ostream& operator<<(std::ostream& stream, const Result& result) {
+  return stream << "merge into '" << result.mergedInto << "', done " << result.merges
+                << ", given up " << result.gaveUp << ", refused " << result.refused;
 }
 
-Outcome Model::Handle(Event event, const std::string& mountPoint, Contents& databases,
-                      Circumstances circumstances) {
+Result Model::Handle(Event event, const std::string& mountPoint, Contents& databases,
+                     Circumstances circumstances) {
   databases_ = &databases;
   circumstances_ = circumstances;
-  outcome_ = {};
+  result_ = {};
   if (event == Event::Unplugged) {
     Unregister(mountPoint);
   } else {
@@ -42,9 +42,9 @@ Outcome Model::Handle(Event event, const std::string& mountPoint, Contents& data
   try {
     Dispatch(event, mountPoint);
   } catch (const Refused&) {
-    outcome_.refused = true;
+    result_.refused = true;
   }
-  return outcome_;
+  return result_;
 }
 
 void Model::Register(Event event, const std::string& mountPoint) {
@@ -108,7 +108,7 @@ void Model::Dispatch(Event event, const std::string& mountPoint) {
   } else if (state_ == State::Scanned && isWork && event != Event::Scanned) {
     Merge(mountPoint);
   } else if (state_ == State::Scanned && event == Event::Purged) {
-    outcome_.mergedInto = master_;
+    result_.mergedInto = master_;
     RemoveVolume(mountPoint);
     Merge(mountPoint);
   }
@@ -147,7 +147,7 @@ void Model::FallBack() {
 }
 
 void Model::Merge(const std::string& mountPoint) {
-  outcome_.mergedInto = master_;
+  result_.mergedInto = master_;
   try {
     const auto disk = disks_.find(mountPoint);
     if (disk == disks_.end() || !HasCatalog(*disk->second)) {
@@ -156,7 +156,7 @@ void Model::Merge(const std::string& mountPoint) {
     try {
       Open(Location(master_));
     } catch (const Refused&) {
-      // Without the directory it is no failure of the database.
+      // Without the directory the database has not failed.
       if (std::filesystem::exists(Location(master_) + "/.zophotos")) {
         throw GivenUp();
       }
@@ -167,9 +167,9 @@ void Model::Merge(const std::string& mountPoint) {
       throw GivenUp();
     }
     DatabaseOf(master_).Merge(*disk->second, stopped_);
-    outcome_.merges = 1;
+    result_.merges = 1;
   } catch (const GivenUp&) {
-    outcome_.gaveUp = true;
+    result_.gaveUp = true;
   }
 }
 

@@ -17,36 +17,36 @@ namespace orva::test {
 /// The disks of a run, by mount point.
 using Disks = std::map<std::string, std::unique_ptr<Disk>>;
 
-/// The merged databases by location: a disk's keeper, the shares root, or the daemon's directory,
-/// which stands in for a place that there is not.
+/// The merged databases by location: a disk's keeper, the shares root, or the daemon's working
+/// directory for a location that does not exist.
 using Contents = std::map<std::string, Content>;
 
-/// What a notification comes to, as the log shows it.
-struct Outcome {
+/// The result of a notification, as the log shows it.
+struct Result {
   std::string mergedInto; ///< the master that a merge was announced with; empty when none was
-  int merges = 0;         ///< merges that came to their end
+  int merges = 0;         ///< merges that were completed
   bool gaveUp = false;    ///< a merge failed and was ignored
   bool refused = false;   ///< the notification could not be handled
-  bool operator==(const Outcome&) const = default;
+  bool operator==(const Result&) const = default;
 };
-std::ostream& operator<<(std::ostream& stream, const Outcome& outcome);
+std::ostream& operator<<(std::ostream& stream, const Result& result);
 
-/// What the daemon should know and do: its rules about volumes, masters and states. The databases
-/// are told to it, and it says what a notification makes of them.
+/// A model of the daemon: its rules for volumes, masters and states, and what each notification
+/// changes in the merged databases.
 class Model {
 public:
   explicit Model(const Disks& disks) : disks_(disks) {}
 
-  /// What stood in the way of a notification.
+  /// What disturbed the handling of a notification.
   struct Circumstances {
-    bool removalLocked = false; ///< rows could not be removed because somebody read the database
-    bool mergeLocked = false;   ///< the same of a merge
-    std::optional<bool> readable{}; ///< whether a volume that was just pulled was read before
+    bool removalLocked = false;     ///< a reader kept rows from being removed
+    bool mergeLocked = false;       ///< a reader kept a merge from being written
+    std::optional<bool> readable{}; ///< whether a pulled volume was read before the pull
   };
 
-  /// Handles a notification for a volume, changing `databases` as it should.
-  Outcome Handle(notify::Event event, const std::string& mountPoint, Contents& databases,
-                 Circumstances circumstances);
+  /// Handles a notification for a volume, and changes `databases` as the daemon should.
+  Result Handle(notify::Event event, const std::string& mountPoint, Contents& databases,
+                Circumstances circumstances);
 
   enum class State { Default, Plugged, Scanned };
   State CurrentState() const { return state_; }
@@ -56,10 +56,10 @@ public:
   /// Where the master's database is.
   std::string MasterLocation() const { return Location(master_); }
 
-  /// What the locator file says.
+  /// The content of the locator file.
   const std::string& Locator() const { return locator_; }
 
-  /// Whether without this volume the shares root would be the master, once and for all.
+  /// Whether the shares root would become the master, and stay it, without this volume.
   bool KeepsTheSharesRootOut(const std::string& mountPoint) const;
 
 private:
@@ -88,16 +88,16 @@ private:
   std::vector<Record> volumes_;
   std::string master_;
   State state_ = State::Default;
-  bool stopped_ = false; ///< the merger has been told to stop
+  bool stopped_ = false; ///< the merger has been stopped
   std::string locator_ = "zophotos_db_path=/shares//.zophotos/zophotos.db\n";
 
   // While a notification is handled.
   Contents* databases_ = nullptr;
   Circumstances circumstances_;
-  Outcome outcome_;
+  Result result_;
 };
 
-/// Where the daemon puts a database of no place: its working directory.
+/// Where the daemon puts a database whose location does not exist: its working directory.
 inline const std::string NO_PLACE = "/tmp/daemon";
 
 } // namespace orva::test

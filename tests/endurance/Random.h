@@ -7,7 +7,7 @@
 
 namespace orva::test {
 
-/// The dice of a run: the same seed gives the same run.
+/// The random numbers of a run: the same seed gives the same run.
 class Random {
 public:
   explicit Random(std::uint64_t seed) : engine_(seed) {}

@@ -25,9 +25,9 @@ std::vector<std::string> Descriptors(pid_t process) {
   for (const auto& entry : fs::directory_iterator(Directory(process) + "/fd")) {
     std::error_code gone;
     const std::string target = fs::read_symlink(entry, gone).string();
-    // The heap probe is at work when it comes to that.
+    // The heap probe may have its file open.
     if (!gone && !target.starts_with(HEAP_FILE)) {
-      // Each connection is another socket: "socket:[123]"
+      // "socket:[123]": the number changes with each connection.
       targets.push_back(target.substr(0, target.find(":[")));
     }
   }
@@ -47,7 +47,7 @@ long Resident(pid_t process) {
   return 0;
 }
 
-/// "7f0000000000-7f0000800000 rw-p ..." of eight mebibytes
+/// Counts lines such as "7f0000000000-7f0000800000 rw-p ..." of 8 MiB.
 long Stacks(pid_t process) {
   constexpr unsigned long stackSize = 8UL << 20U;
   std::ifstream file(Directory(process) + "/maps");

@@ -7,21 +7,21 @@
 
 namespace orva::test {
 
-/// What a process holds at a moment.
+/// The resources that a process uses at one time.
 struct Vitals {
-  std::vector<std::string> descriptors; ///< what each is open on, in order
-  long heap = 0;                        ///< bytes in use, as the heap probe has told last
+  std::vector<std::string> descriptors; ///< the target of each, sorted
+  long heap = 0;                        ///< bytes in use, as the heap probe wrote last
   long resident = 0;                    ///< bytes of memory
-  long stacks = 0; ///< stacks of the size that the daemon gives its threads, also of ended ones
+  long stacks = 0; ///< thread stacks of the default size, also of threads that have ended
 };
 
-/// The vitals of the process. Throws std::runtime_error when there is none.
+/// The resources of the process. Throws std::runtime_error when there is none.
 Vitals VitalsOf(pid_t process);
 
-/// Waits until the process has that many threads; false after the deadline.
+/// Waits until the process has `count` threads; false after the deadline.
 bool AwaitThreads(pid_t process, std::size_t count);
 
-/// The file that the heap probe tells.
+/// The file that the heap probe writes.
 inline const std::string HEAP_FILE = "/tmp/heap";
 
 } // namespace orva::test

@@ -5,26 +5,25 @@
 
 namespace orva::test {
 
-/// What the daemon's listener would do with two mount points: "merge", "remerge", "remove",
-/// "init" (opens the merged database of the master) or "locate" (publishes it).
+/// What the daemon does with two mount points: "merge", "remerge", "remove", "init" (opens the
+/// merged database of the master) or "locate" (publishes it).
 struct Operation {
   std::string name;
   std::string master;
   std::string volume{};
 };
 
-/// Operations done one after the other by a process of their own, under watch, so that one that
-/// never ends, eats the memory or crashes is a failure of the test and nothing more.
+/// Operations that a watched process of their own does one after the other. If one of them never
+/// ends, uses too much memory or crashes, only the test fails.
 struct Attempt {
-  /// Why the process was ended from outside, or how else it ended badly; empty when it ended by
-  /// itself with all operations done.
+  /// Why the process was killed, or its exit status other than 0; empty when it did all operations.
   std::string trouble;
-  /// What left each operation that was done: empty, or the exception's type and beginning.
+  /// For each operation the type and the beginning of the exception that it threw; empty for none.
   std::vector<std::string> thrown;
   double seconds = 0;
-  long long peakMemory = 0; ///< bytes resident at most
+  long long peakMemory = 0; ///< bytes of resident memory
 
-  /// Runs the operations. Throws std::system_error when there can be no such process.
+  /// Runs the operations. Throws std::system_error when the process cannot be started.
   static Attempt Run(const std::vector<Operation>& operations);
 };
 

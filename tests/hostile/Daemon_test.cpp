@@ -1,5 +1,4 @@
-// The running daemon among hostile volumes: whatever one of them brings, the daemon goes on and
-// serves the others.
+// The running daemon with hostile volumes: it continues to serve the other volumes.
 
 #include "Catalog.h"
 #include "CraftedDatabase.h"
@@ -36,11 +35,11 @@ Log ErrorsIn(const Log& log) {
 class HostileSystem : public SystemTest {
 protected:
   HostileSystem() {
-    std::ofstream(VICTIM) << "dear content";
+    std::ofstream(VICTIM) << "precious content";
     photos.AddPhoto("a.jpg", 1000, 2000);
   }
 
-  /// Adds a photo to the good volume and expects a merge into the master to bring it.
+  /// Adds a photo to the good volume and expects that it is merged into the master.
   void ExpectGoodMergeInto(const Volume& master) {
     const std::string name = std::to_string(++photos_) + ".jpg";
     photos.AddPhoto(name, 1, 2000 + photos_);
@@ -58,7 +57,7 @@ private:
   int photos_ = 0;
 };
 
-TEST_F(HostileSystem, GoesOnAfterHostileCatalogs) {
+TEST_F(HostileSystem, ContinuesAfterHostileCatalogs) {
   appliance.Start();
   appliance.Handle(Plugged(good.Path()));
   appliance.Handle(Scanned(good.Path()));
@@ -90,13 +89,13 @@ TEST_F(HostileSystem, GoesOnAfterHostileCatalogs) {
   expectRefused(Purged(hostile.Path()));
 }
 
-/// The same with a merged database on the hostile volume, which becomes the master.
+/// The hostile volume has a merged database and becomes the master.
 class HostileMaster : public HostileSystem {
 protected:
   HostileMaster() { fs::create_directory(folder); }
 
-  /// Lets the daemon come to the hostile master, takes that away, and expects the other volume to
-  /// be served.
+  /// Lets the daemon elect the hostile volume, unplugs that, and expects that the other volume is
+  /// served.
   void ExpectTheNextMasterToWork() {
     appliance.Start();
     appliance.Handle(Plugged(hostile.Path()));
@@ -116,18 +115,18 @@ protected:
   const std::string database = folder + "/zophotos.db";
 };
 
-TEST_F(HostileMaster, OfGarbageIsLeftForTheNext) {
+TEST_F(HostileMaster, WithGarbageDoesNotHarmTheNextMaster) {
   std::ofstream(database) << std::string(4096, 'x');
   ExpectTheNextMasterToWork();
 }
 
-TEST_F(HostileMaster, WhoseJournalNamesAFileIsLeftForTheNext) {
+TEST_F(HostileMaster, WithAJournalThatNamesAFileDoesNotHarmTheNextMaster) {
   std::ofstream(database).flush();
   CraftedJournal(4096, 1, {}, VICTIM).Save(database + "-journal");
   ExpectTheNextMasterToWork();
 }
 
-TEST_F(HostileMaster, WhoseFolderLeadsElsewhereIsLeftForTheNext) {
+TEST_F(HostileMaster, WithALinkAsItsFolderDoesNotHarmTheNextMaster) {
   fs::remove(folder);
   fs::create_directory_symlink("/tmp", folder);
   ExpectTheNextMasterToWork();

@@ -1,11 +1,14 @@
-// Runs the operations on its command line (operation, master, volume, repeated) with the daemon's
-// classes. Writes to standard input, which is open for writing, a line with what each operation
-// threw, and at the end its peak memory.
+// Does operations with the daemon's own classes. The command line names them in threes (operation,
+// master, volume). Reports on standard output what each has thrown, a line each, and then the peak
+// of its memory. The lines that the daemon's classes print are dropped.
 
 #include "DBMerger.h"
 #include "PhotoDB.h"
 #include "Util.h"
 
+#include "orvautil/FileDescriptor.h"
+
+#include <fcntl.h>
 #include <unistd.h>
 
 #include <cstring>
@@ -41,9 +44,19 @@ std::string Thrown(const Action& action, const char* master, const char* volume)
   }
 }
 
-void Report(const std::string& line) {
+/// Takes standard output over for the report, and sends what is printed to /dev/null.
+util::FileDescriptor TakeStandardOutput() {
+  util::FileDescriptor report(dup(STDOUT_FILENO));
+  const util::FileDescriptor nowhere(open("/dev/null", O_WRONLY | O_CLOEXEC));
+  if (!report || dup2(nowhere.Get(), STDOUT_FILENO) == -1) {
+    _exit(2);
+  }
+  return report;
+}
+
+void Report(const util::FileDescriptor& report, const std::string& line) {
   const std::string whole = line + "\n";
-  if (write(STDIN_FILENO, whole.data(), whole.size()) != static_cast<ssize_t>(whole.size())) {
+  if (write(report.Get(), whole.data(), whole.size()) != static_cast<ssize_t>(whole.size())) {
     _exit(2);
   }
 }
@@ -62,6 +75,7 @@ long long PeakMemory() {
 } // namespace
 
 int main(int count, char** arguments) {
+  const util::FileDescriptor report = TakeStandardOutput();
   dbmerger::DBMerger merger;
   const std::map<std::string, Action> actions = {
       {"merge", [&](const auto& master, const auto& volume) { merger.MergeDB(master, volume); }},
@@ -73,9 +87,9 @@ int main(int count, char** arguments) {
       {"locate", [](const auto& master, const auto&) { dbmerger::updateLocatorFile(master); }},
   };
   for (int i = 1; i + 2 < count; i += 3) {
-    Report(Thrown(actions.at(arguments[i]), arguments[i + 1], arguments[i + 2]));
+    Report(report, Thrown(actions.at(arguments[i]), arguments[i + 1], arguments[i + 2]));
   }
   merger.stopRequested = true;
   merger.Wait();
-  Report("peak " + std::to_string(PeakMemory()));
+  Report(report, "peak " + std::to_string(PeakMemory()));
 }

@@ -454,9 +454,8 @@ TEST_F(MessageProcessorTest, ElementsNestedTooDeeplyAreRefusedBeforeTheMessageEn
   }
   Read(message + END + "<b/>" + END);
   EXPECT_THAT(processor.handled, ElementsAre("b"));
-  EXPECT_THAT(Logged(), ElementsAre(LogLine{
-                            LOG_LOCAL1 | LOG_ERR,
-                            "MessageProcessor:: more elements inside each other than can end"}));
+  EXPECT_THAT(Logged(), ElementsAre(LogLine{LOG_LOCAL1 | LOG_ERR,
+                                            "MessageProcessor:: elements nested too deeply"}));
 }
 
 TEST_F(MessageProcessorTest, ManyAttributesAreHandled) {

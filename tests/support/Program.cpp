@@ -1,7 +1,5 @@
 #include "Program.h"
 
-#include "system/Deadline.h"
-
 #include <fcntl.h>
 #include <poll.h>
 #include <spawn.h>
@@ -24,23 +22,29 @@ namespace {
 
 using Clock = std::chrono::steady_clock;
 
-/// Both ends of a pipe, of which the program gets the second one.
 struct Pipe {
-  Pipe() {
-    if (pipe2(ends.data(), O_CLOEXEC) != 0) {
-      throw std::system_error(errno, std::generic_category(), "pipe2");
-    }
-  }
-  Pipe(const Pipe&) = delete;
-  Pipe& operator=(const Pipe&) = delete;
-  ~Pipe() {
-    close(ends[0]);
-    close(ends[1]);
-  }
-  int TakeReadingEnd() { return std::exchange(ends[0], -1); }
-
-  std::array<int, 2> ends{};
+  util::FileDescriptor reader;
+  util::FileDescriptor writer;
 };
+
+Pipe MakePipe() {
+  std::array<int, 2> ends{};
+  if (pipe2(ends.data(), O_CLOEXEC) != 0) {
+    throw std::system_error(errno, std::generic_category(), "pipe2");
+  }
+  return {util::FileDescriptor(ends[0]), util::FileDescriptor(ends[1])};
+}
+
+/// The texts as the null-terminated array that exec takes.
+std::vector<char*> Pointers(std::vector<std::string>& texts) {
+  std::vector<char*> pointers;
+  pointers.reserve(texts.size() + 1);
+  for (std::string& text : texts) {
+    pointers.push_back(text.data());
+  }
+  pointers.push_back(nullptr);
+  return pointers;
+}
 
 /// Waits for one of `descriptors` to be readable; false when the deadline has passed.
 template <std::size_t size>
@@ -57,34 +61,53 @@ bool AwaitReadable(int descriptor, Clock::time_point deadline) {
 
 } // namespace
 
-Program::Program(Arguments arguments, const Streams& streams) {
-  Pipe output;
-  Pipe error;
-  std::vector<char*> pointers;
-  for (std::string& argument : arguments) {
-    pointers.push_back(argument.data());
+Program::Program(Arguments arguments, const Options& options) {
+  if (options.held) {
+    arguments.insert(arguments.begin(), {"/bin/sh", "-c", R"(kill -STOP $$; exec "$0" "$@")"});
   }
-  pointers.push_back(nullptr);
+  // Of two values of one name the first counts.
+  Arguments environment = options.environment;
+  for (char** variable = environ; *variable != nullptr; ++variable) {
+    environment.emplace_back(*variable);
+  }
+  const bool errorsApart = options.errors == Errors::Apart;
+  Pipe input = options.input.empty() ? MakePipe() : Pipe();
+  Pipe output = options.output.empty() ? MakePipe() : Pipe();
+  Pipe error = errorsApart ? MakePipe() : Pipe();
 
   posix_spawn_file_actions_t actions;
   posix_spawn_file_actions_init(&actions);
-  posix_spawn_file_actions_addopen(&actions, STDIN_FILENO, streams.input.c_str(), O_RDONLY, 0);
-  if (streams.output.empty()) {
-    posix_spawn_file_actions_adddup2(&actions, output.ends[1], STDOUT_FILENO);
+  if (options.input.empty()) {
+    posix_spawn_file_actions_adddup2(&actions, input.reader.Get(), STDIN_FILENO);
   } else {
-    posix_spawn_file_actions_addopen(&actions, STDOUT_FILENO, streams.output.c_str(),
-                                     O_WRONLY | O_NOCTTY, 0);
+    posix_spawn_file_actions_addopen(&actions, STDIN_FILENO, options.input.c_str(), O_RDONLY, 0);
   }
-  posix_spawn_file_actions_adddup2(&actions, streams.errorApart ? error.ends[1] : STDOUT_FILENO,
-                                   STDERR_FILENO);
-  const int code =
-      posix_spawn(&pid_, pointers.front(), &actions, nullptr, pointers.data(), environ);
+  if (options.output.empty()) {
+    posix_spawn_file_actions_adddup2(&actions, output.writer.Get(), STDOUT_FILENO);
+  } else {
+    posix_spawn_file_actions_addopen(&actions, STDOUT_FILENO, options.output.c_str(),
+                                     O_WRONLY | O_CREAT | O_TRUNC | O_NOCTTY, 0644);
+  }
+  if (options.errors != Errors::Inherited) {
+    posix_spawn_file_actions_adddup2(&actions, errorsApart ? error.writer.Get() : STDOUT_FILENO,
+                                     STDERR_FILENO);
+  }
+  if (!options.directory.empty()) {
+    posix_spawn_file_actions_addchdir_np(&actions, options.directory.c_str());
+  }
+  const int code = posix_spawnp(&pid_, arguments.front().c_str(), &actions, nullptr,
+                                Pointers(arguments).data(), Pointers(environment).data());
   posix_spawn_file_actions_destroy(&actions);
   if (code != 0) {
     throw std::system_error(code, std::generic_category(), arguments.front());
   }
-  output_ = streams.output.empty() ? output.TakeReadingEnd() : -1;
-  error_ = streams.errorApart ? error.TakeReadingEnd() : -1;
+  if (options.held) {
+    waitpid(pid_, nullptr, WUNTRACED);
+  }
+  handle_.Reset(static_cast<int>(syscall(SYS_pidfd_open, pid_, 0)));
+  input_ = std::move(input.writer);
+  output_ = std::move(output.reader);
+  error_ = std::move(error.reader);
 }
 
 Program::~Program() {
@@ -92,16 +115,10 @@ Program::~Program() {
     kill(pid_, SIGKILL);
     waitpid(pid_, nullptr, 0);
   }
-  CloseOutput();
-  close(error_);
 }
 
 void Program::Signal(int signal) const {
   kill(pid_, signal);
-}
-
-void Program::CloseOutput() {
-  close(std::exchange(output_, -1));
 }
 
 std::string Program::ReadLine() {
@@ -114,10 +131,10 @@ std::string Program::ReadLine() {
       rest_.erase(0, end + 1);
       return line;
     }
-    if (!AwaitReadable(output_, deadline)) {
+    if (!AwaitReadable(output_.Get(), deadline)) {
       return "(deadline)";
     }
-    const ssize_t size = read(output_, chunk.data(), chunk.size());
+    const ssize_t size = read(output_.Get(), chunk.data(), chunk.size());
     if (size <= 0) {
       return rest_.empty() ? "(end)" : std::exchange(rest_, {});
     }
@@ -137,12 +154,12 @@ void Program::ReadToEnd(std::string& output, std::string& error) {
   output += std::exchange(rest_, {});
   const auto deadline = Clock::now() + DEADLINE;
   const std::array<std::string*, 2> texts{&output, &error};
-  // poll passes over what is -1.
-  std::array<pollfd, 2> ends{pollfd{output_, POLLIN, 0}, pollfd{error_, POLLIN, 0}};
+  // poll ignores an entry of -1.
+  std::array<pollfd, 2> ends{pollfd{output_.Get(), POLLIN, 0}, pollfd{error_.Get(), POLLIN, 0}};
   std::array<char, 65536> chunk{};
   while (ends[0].fd != -1 || ends[1].fd != -1) {
     if (!AwaitReadable(ends, deadline)) {
-      throw std::runtime_error("the program has not come to its end");
+      throw std::runtime_error("the program has not closed its output");
     }
     for (std::size_t i = 0; i < ends.size(); ++i) {
       if (ends[i].revents != 0) {
@@ -154,20 +171,24 @@ void Program::ReadToEnd(std::string& output, std::string& error) {
   }
 }
 
-int Program::WaitForEnd() {
-  const int handle = static_cast<int>(syscall(SYS_pidfd_open, pid_, 0));
-  const bool hasEnded = AwaitReadable(handle, Clock::now() + DEADLINE);
-  close(handle);
-  int status = -1;
-  if (!hasEnded || waitpid(pid_, &status, 0) != pid_) {
-    return -1;
+bool Program::AwaitEnd(std::chrono::milliseconds time) const {
+  return AwaitReadable(handle_.Get(), Clock::now() + time);
+}
+
+int Program::WaitForEnd(std::chrono::milliseconds time) {
+  if (!AwaitEnd(time)) {
+    throw std::runtime_error("the program has not ended");
+  }
+  int status = 0;
+  if (waitpid(pid_, &status, 0) != pid_) {
+    throw std::system_error(errno, std::generic_category(), "waitpid");
   }
   pid_ = -1;
   return WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
 }
 
 Outcome Run(Program::Arguments arguments, const std::string& output) {
-  Program program(std::move(arguments), {.output = output, .errorApart = true});
+  Program program(std::move(arguments), {.output = output, .errors = Program::Errors::Apart});
   Outcome outcome;
   program.ReadToEnd(outcome.output, outcome.error);
   outcome.status = program.WaitForEnd();

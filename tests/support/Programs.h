@@ -9,8 +9,8 @@ namespace orva::test {
 /// itself. Throws std::runtime_error.
 const std::string& ProgramDirectory();
 
-/// The path of the program, or of the library to preload, `name` in that directory. Throws
-/// std::runtime_error when there is no such file.
+/// The path of the program or preloaded library `name` in that directory. Throws std::runtime_error
+/// when there is no such file.
 std::string ProgramPath(const std::string& name);
 
 /// The sanitizer that the programs under test were built with. A sanitized program uses more memory

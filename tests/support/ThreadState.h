@@ -12,8 +12,8 @@
 
 namespace orva::test {
 
-/// Waits until the thread `id` (as gettid gives it) of this process sleeps in a system call; false
-/// after the deadline, or when the thread has ended.
+/// Waits until the thread `id` (as gettid returns it) of this process sleeps in a system call;
+/// false after the deadline, or when the thread has ended.
 inline bool AwaitSleeping(pid_t id) {
   const auto end = std::chrono::steady_clock::now() + DEADLINE;
   while (std::chrono::steady_clock::now() < end) {

@@ -16,7 +16,7 @@ namespace orva::test {
 
 namespace {
 
-const std::string REFUSAL = "ERROR ! Node name = ";
+const std::string REJECTION = "ERROR ! Node name = ";
 const std::string BARRIER = "barrier";
 const std::string DIRECTORY = "/tmp/daemon";
 const std::string OUTPUT = "/tmp/daemon.out";
@@ -49,12 +49,12 @@ void Appliance::StartWithOutput(const std::string& output) {
   Barrier();
 }
 
-DaemonProcess::End Appliance::Run(const std::vector<std::string>& environment) {
+int Appliance::Run(const std::vector<std::string>& environment) {
   daemon_ = std::make_unique<DaemonProcess>(DIRECTORY, OUTPUT, environment);
   return daemon_->AwaitEnd();
 }
 
-DaemonProcess::End Appliance::Shutdown() {
+int Appliance::Shutdown() {
   service_.Stop();
   return daemon_->AwaitEnd();
 }
@@ -66,16 +66,16 @@ std::vector<LogLine> Appliance::Handle(const std::string& message) {
 }
 
 void Appliance::Barrier() {
-  const std::string refusal = SendBarrier();
-  if (!log_.Await(Error(refusal))) {
-    throw std::runtime_error("not logged: " + refusal);
+  const std::string line = SendBarrier();
+  if (!log_.Await(Error(line))) {
+    throw std::runtime_error("not logged: " + line);
   }
 }
 
 std::string Appliance::SendBarrier() {
   const std::string name = BARRIER + std::to_string(++barriers_);
   service_.Send("<" + name + " about=\"ORVANotification\"/>");
-  return REFUSAL + name;
+  return REJECTION + name;
 }
 
 std::chrono::milliseconds Appliance::HandleUntilSlept(Tracer& tracer, const std::string& message,
@@ -95,7 +95,7 @@ std::vector<LogLine> Appliance::TakeLog() {
   logTaken_ += fresh.size();
   std::vector<LogLine> taken;
   for (const LogLine& line : fresh) {
-    if (!line.text.starts_with(REFUSAL + BARRIER) &&
+    if (!line.text.starts_with(REJECTION + BARRIER) &&
         !line.text.starts_with("Iterating over mount point ")) {
       taken.push_back({line.priority, MaskTimes(line.text)});
     }

@@ -16,27 +16,27 @@ namespace orva::test {
 class Tracer;
 
 /// The appliance around the daemon: its system log, its notification service and the files that
-/// the daemon leaves, in the private root that the test runs in. A test makes volumes, starts
-/// the daemon, lets it handle messages and looks at what came of them.
+/// the daemon writes, in the private root of the test. A test creates volumes, starts the daemon,
+/// sends it messages and checks the results.
 class Appliance {
 public:
-  /// Brings up the log and the notification service. The daemon does not run yet.
+  /// Starts the log and the notification service. The daemon does not run yet.
   Appliance() = default;
 
   /// Starts the daemon and waits until it reads notifications. `environment` as DaemonProcess.
   void Start(const std::vector<std::string>& environment = {});
 
-  /// Prepares the daemon, which starts when it gets SIGCONT, and does not wait for it.
+  /// Prepares the daemon, which starts at SIGCONT. Does not wait for it.
   void Prepare();
 
-  /// Start with another file for standard output than TakeOutput reads.
+  /// Start, with standard output in another file than the one that TakeOutput reads.
   void StartWithOutput(const std::string& output);
 
-  /// Starts the daemon where it is not expected to come so far, and waits for its end.
-  DaemonProcess::End Run(const std::vector<std::string>& environment = {});
+  /// Starts a daemon that is not expected to read notifications, and waits for its end.
+  int Run(const std::vector<std::string>& environment = {});
 
-  /// Ends the notification service and waits for the daemon, which then ends by itself.
-  DaemonProcess::End Shutdown();
+  /// Ends the notification service and waits for the end of the daemon, which follows.
+  int Shutdown();
 
   /// True while a daemon runs.
   bool IsRunning() const { return daemon_ != nullptr && daemon_->IsRunning(); }
@@ -45,28 +45,28 @@ public:
   /// for it, as TakeLog does.
   std::vector<LogLine> Handle(const std::string& message);
 
-  /// Waits until the daemon has handled everything that was sent: queues a message with another
-  /// root element behind it and waits for the line that refuses it.
+  /// Waits until the daemon has handled everything that was sent: sends a message with another
+  /// root element and waits for the log line that rejects it.
   void Barrier();
 
-  /// Queues what Barrier waits for, and returns the text of the line that tells of it.
+  /// Sends the message of Barrier, and returns the text of the log line that rejects it.
   std::string SendBarrier();
 
-  /// Has the daemon, which `tracer` holds, handle `message` until it is about to have slept for as
-  /// long as `time`, or else to the end. Returns how long it sleeps by then.
+  /// Lets the daemon, which `tracer` holds, handle `message` until its sleeps add up to `time`, or
+  /// to the end of the message. Returns the sum of the sleeps, the one that begins included.
   std::chrono::milliseconds HandleUntilSlept(Tracer& tracer, const std::string& message,
                                              std::chrono::milliseconds time);
 
-  /// What was logged since the last call, without the refusals of Barrier and without the
-  /// merger thread's "Iterating over mount point" lines, which come at any time. Elapsed times
-  /// read TIME.
+  /// What was logged since the last call, without the lines of Barrier and without the merger
+  /// thread's "Iterating over mount point" lines, which come at any time. Elapsed times are
+  /// replaced by TIME.
   std::vector<LogLine> TakeLog();
 
-  /// What the daemon wrote to standard output since the last call. The addresses of objects
-  /// read ADDRESS.
+  /// What the daemon wrote to standard output since the last call. The addresses of objects are
+  /// replaced by ADDRESS.
   std::vector<std::string> TakeOutput();
 
-  /// Content of the locator file, to the last byte; "(absent)" when there is none.
+  /// All bytes of the locator file; "(absent)" when there is none.
   static std::string Locator();
 
   Syslog& Log() { return log_; }
@@ -96,11 +96,11 @@ public:
   /// "volume|photos_xcoded|photos_total|last_updated_time", by volume.
   std::vector<std::string> Statistics() const;
 
-  /// All of this, the schema and the status row without its time: what two databases with the same
-  /// content have in common.
+  /// All of these, the schema and the status row without its time. The same for databases with
+  /// equal content.
   std::vector<std::string> Content() const;
 
-  /// What SQLite finds wrong with the file.
+  /// The faults that SQLite finds in the file.
   std::vector<std::string> Faults() const;
 
   const Database& Rows() const { return database_; }

@@ -1,43 +1,32 @@
 #pragma once
 
-#include <sys/types.h>
+#include "support/Program.h"
 
-#include <iosfwd>
 #include <string>
 #include <vector>
 
 namespace orva::test {
 
-/// The daemon as a process of its own, with a fresh working directory and its standard output
-/// in a file. Killed when the object ends while it still runs.
+/// The daemon as a process of its own, with a new working directory and its standard output in a
+/// file. Killed when the object ends while it still runs.
 class DaemonProcess {
 public:
-  /// Starts the daemon in `directory`, which is made; `environment` ("NAME=value") comes on top
-  /// of the test's own. `output` is the file for its standard output. With `held` the process
-  /// waits for SIGCONT before it becomes the daemon. Where the test's environment names a program
-  /// as ORVA_TEST_LAUNCHER, that one becomes the daemon. Throws std::system_error.
+  /// Starts the daemon in `directory`, which is created; `environment` ("NAME=value") is added to
+  /// the test's own. `output` is the file for its standard output. With `held` the process waits
+  /// for SIGCONT before it becomes the daemon. If the test's environment names a program as
+  /// ORVA_TEST_LAUNCHER, that program starts the daemon. Throws std::system_error.
   DaemonProcess(std::string directory, std::string output,
                 const std::vector<std::string>& environment = {}, bool held = false);
-  DaemonProcess(const DaemonProcess&) = delete;
-  DaemonProcess& operator=(const DaemonProcess&) = delete;
-  ~DaemonProcess();
 
-  /// How a process has ended: by exit with a status, or by a signal.
-  struct End {
-    bool exited;
-    int value; ///< the exit status or the signal's number
-
-    bool operator==(const End&) const = default;
-  };
-
-  /// Waits for the daemon's end. Throws std::runtime_error after the deadline.
-  End AwaitEnd();
+  /// Waits for the daemon's end, and returns its status as Program does. Throws std::runtime_error
+  /// after the deadline.
+  int AwaitEnd() { return program_.WaitForEnd(); }
 
   /// The process, while it runs; -1 after its end.
-  pid_t Pid() const { return pid_; }
+  pid_t Pid() const { return program_.Pid(); }
 
   /// False once AwaitEnd has returned.
-  bool IsRunning() const { return pid_ != -1; }
+  bool IsRunning() const { return Pid() != -1; }
 
   /// What the daemon has written to its standard output, line by line.
   std::vector<std::string> StandardOutput() const;
@@ -47,19 +36,17 @@ public:
 
 private:
   std::string directory_;
-  std::string output_; ///< path of the file behind standard output
-  pid_t pid_ = -1;     ///< -1 when it has been waited for
-  int pidfd_ = -1;     ///< owned
+  std::string output_; ///< path of the file for standard output
+  Program program_;
 };
 
-/// An exit with `status`.
-constexpr DaemonProcess::End Exited(int status) {
-  return {true, status};
+/// The status of a program that has exited with `status`.
+constexpr int Exited(int status) {
+  return status;
 }
-/// An end by `signal`.
-constexpr DaemonProcess::End Killed(int signal) {
-  return {false, signal};
+/// The status of a program that `signal` has ended.
+constexpr int Killed(int signal) {
+  return 128 + signal;
 }
-std::ostream& operator<<(std::ostream& stream, const DaemonProcess::End& end);
 
 } // namespace orva::test

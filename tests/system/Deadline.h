@@ -4,8 +4,8 @@
 
 namespace orva::test {
 
-/// How long a test waits for what must happen. No test depends on how long it takes: only a
-/// broken daemon makes one wait this long.
+/// How long a test waits for an event that must happen. Only a broken daemon makes a test wait this
+/// long; no test depends on the time that an event takes.
 constexpr std::chrono::seconds DEADLINE{60};
 
 } // namespace orva::test

@@ -12,7 +12,7 @@ using ::testing::StartsWith;
 
 namespace {
 
-constexpr long MOST_GROWTH = 8192; ///< KiB
+constexpr long GROWTH_LIMIT = 8192; ///< KiB
 
 } // namespace
 
@@ -55,7 +55,7 @@ void Flood::ExpectWithinBounds(const std::string& flood) {
   EXPECT_EQ(0, appliance.Service().Received()) << "the daemon has written to its peer";
   const long growth = memory_->Growth();
   if (!AreProgramsSanitized()) {
-    EXPECT_GE(MOST_GROWTH, growth) << flood;
+    EXPECT_GE(GROWTH_LIMIT, growth) << flood;
   }
   ReportFigure("KiB of memory that the daemon grew by at most under " + flood,
                std::to_string(growth));

@@ -10,37 +10,37 @@
 
 namespace orva::test {
 
-/// Bytes of the longest message that is taken.
+/// Bytes of the longest message that the daemon accepts.
 constexpr std::size_t LONGEST = 65536;
 
-/// Zeros that end a message.
+/// Ends a message.
 inline const std::string DELIMITER(4, '\0');
 
-/// A notification that changes nothing, and what shows that it was handled.
+/// A notification that changes nothing, and the log of its handling.
 inline const std::string GOOD = Notification("Unplugged", "/shares/A");
 inline const Log HANDLED = {Info("Default:: Volumeunplugged, ignoring! ")};
 
-/// `head` and `tail` with as many of `piece` between them as make the longest message.
+/// `head` and `tail` with as many of `piece` between them as the longest message can hold.
 std::string Filled(const std::string& head, const std::string& piece, const std::string& tail);
 
-/// A running daemon that somebody wants to drown. A test ends with ExpectUnharmed, which holds
-/// what the daemon used meanwhile against what it may, or with its second half.
+/// A running daemon that gets very many or very large messages. A test ends with ExpectUnharmed, or
+/// with its second half, ExpectWithinBounds.
 class Flood : public SystemTest {
 protected:
   void SetUp() override;
 
-  /// Sends a message and expects that it is refused or ignored: with one line at most, of the
-  /// message processor. Returns the line's text; empty when there was none.
+  /// Sends a message and expects that the message processor rejects it with one line, or ignores
+  /// it. Returns the line's text; empty when there was none.
   std::string Refused(const std::string& message);
 
   /// Sends a message and expects it to be handled as GOOD is.
   void Handled(const std::string& message);
 
-  /// The next good message is handled, and all has stayed within bounds.
+  /// The next good message is handled, and ExpectWithinBounds holds.
   void ExpectUnharmed(const std::string& flood);
 
-  /// The daemon has written nothing to its peer, and its memory has stayed within 8 MiB of what it
-  /// used at the beginning. Reports the peak under `flood`.
+  /// The daemon has written nothing to its peer, and its memory has grown by at most 8 MiB since
+  /// the beginning. Reports the growth under the name `flood`.
   void ExpectWithinBounds(const std::string& flood);
 
 private:

@@ -1,7 +1,7 @@
 // Reads a merged database as other programs of the appliance do, in one transaction after the
-// other, until its standard input ends. Each read is a line on standard output: the microseconds
-// until the transaction had its lock, then what it saw of one volume: files, files without a
-// folder, folders, and the numbers of its statistics row.
+// other, until its standard input ends. Writes a line to standard output for each transaction: the
+// microseconds until it had its lock, then its numbers for one volume: files, files without a
+// folder, folders, and those of the statistics row.
 //
 //   merged_reader LOCATION VOLUME
 

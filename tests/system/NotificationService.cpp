@@ -23,8 +23,8 @@ namespace orva::test {
 NotificationService::NotificationService()
     : listener_(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0)) {
   const util::Socket::Address address(core::ORVA_NOTIFICATION_SOCKET);
-  if (listener_ == -1 || bind(listener_, address.Get(), address.Length()) != 0 ||
-      listen(listener_, SOMAXCONN) != 0) {
+  if (!listener_ || bind(listener_.Get(), address.Get(), address.Length()) != 0 ||
+      listen(listener_.Get(), SOMAXCONN) != 0) {
     throw std::system_error(errno, std::generic_category(), core::ORVA_NOTIFICATION_SOCKET);
   }
 }
@@ -34,27 +34,28 @@ NotificationService::~NotificationService() {
 }
 
 void NotificationService::AwaitClient() {
-  if (client_ != -1) {
+  if (client_) {
     return;
   }
-  pollfd waiting{listener_, POLLIN, 0};
+  pollfd waiting{listener_.Get(), POLLIN, 0};
   const auto deadline = std::chrono::milliseconds(DEADLINE).count();
   if (poll(&waiting, 1, static_cast<int>(deadline)) != 1) {
     throw std::runtime_error("no client has connected to the notification service");
   }
-  client_ = accept4(listener_, nullptr, nullptr, SOCK_CLOEXEC);
-  if (client_ == -1) {
+  client_.Reset(accept4(listener_.Get(), nullptr, nullptr, SOCK_CLOEXEC));
+  if (!client_) {
     throw std::system_error(errno, std::generic_category(), "accept4");
   }
   const timeval patience{.tv_sec = DEADLINE.count(), .tv_usec = 0};
-  setsockopt(client_, SOL_SOCKET, SO_SNDTIMEO, &patience, sizeof patience);
+  setsockopt(client_.Get(), SOL_SOCKET, SO_SNDTIMEO, &patience, sizeof patience);
 }
 
 void NotificationService::SendBytes(const std::string& bytes) {
   AwaitClient();
   std::size_t sent = 0;
   while (sent < bytes.size()) {
-    const ssize_t count = send(client_, bytes.data() + sent, bytes.size() - sent, MSG_NOSIGNAL);
+    const ssize_t count =
+        send(client_.Get(), bytes.data() + sent, bytes.size() - sent, MSG_NOSIGNAL);
     if (count == -1) {
       throw std::system_error(errno, std::generic_category(), "send");
     }
@@ -66,11 +67,12 @@ void NotificationService::Send(const std::string& message) {
   SendBytes(notify::Frame(message));
 }
 
-// Nothing tells that a queue has become empty, and a sleep would make a byte cost a time slice.
+// No event reports that a queue has become empty, and a sleep would take a time slice for each
+// byte.
 void NotificationService::AwaitConsumed() const {
   const auto deadline = std::chrono::steady_clock::now() + DEADLINE;
   int unread = 0;
-  while (ioctl(client_, SIOCOUTQ, &unread) == 0 && unread != 0) {
+  while (ioctl(client_.Get(), SIOCOUTQ, &unread) == 0 && unread != 0) {
     if (std::chrono::steady_clock::now() > deadline) {
       throw std::runtime_error("the client of the notification service does not read");
     }
@@ -81,13 +83,13 @@ void NotificationService::AwaitConsumed() const {
 void NotificationService::StopReading() {
   AwaitClient();
   const int smallest = 1;
-  setsockopt(client_, SOL_SOCKET, SO_RCVBUF, &smallest, sizeof smallest);
+  setsockopt(client_.Get(), SOL_SOCKET, SO_RCVBUF, &smallest, sizeof smallest);
 }
 
 int NotificationService::Received() {
   AwaitClient();
   int bytes = 0;
-  if (ioctl(client_, FIONREAD, &bytes) != 0) {
+  if (ioctl(client_.Get(), FIONREAD, &bytes) != 0) {
     throw std::system_error(errno, std::generic_category(), "FIONREAD");
   }
   return bytes;
@@ -95,21 +97,16 @@ int NotificationService::Received() {
 
 void NotificationService::CloseClient() {
   AwaitClient();
-  close(client_);
-  client_ = -1;
+  client_.Reset();
 }
 
 void NotificationService::Stop() {
   // The listener first: a client that sees its connection closed must not reach it again.
-  if (listener_ != -1) {
-    close(listener_);
+  if (listener_) {
+    listener_.Reset();
     unlink(core::ORVA_NOTIFICATION_SOCKET.c_str());
-    listener_ = -1;
   }
-  if (client_ != -1) {
-    close(client_);
-    client_ = -1;
-  }
+  client_.Reset();
 }
 
 } // namespace orva::test

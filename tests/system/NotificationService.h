@@ -1,13 +1,14 @@
 #pragma once
 
+#include "orvautil/FileDescriptor.h"
+
 #include <string>
 
 namespace orva::test {
 
-/// The appliance's notification service as a test plays it: listens on the notification socket
-/// and talks to one client at a time. The operations that talk take the next waiting client
-/// when there is none, and give up one that stops reading. Failures are thrown as
-/// std::runtime_error or std::system_error.
+/// The appliance's notification service: listens on the notification socket and serves one client
+/// at a time. Operations that need a client accept the next one when none is connected, and fail
+/// when it stops reading. Failures are thrown as std::runtime_error or std::system_error.
 class NotificationService {
 public:
   /// Starts to listen.
@@ -16,7 +17,7 @@ public:
   NotificationService& operator=(const NotificationService&) = delete;
   ~NotificationService();
 
-  /// Waits for a client to be there.
+  /// Waits until a client is connected.
   void AwaitClient();
 
   /// Sends the bytes as they are.
@@ -25,24 +26,24 @@ public:
   /// Sends one message, followed by the delimiter.
   void Send(const std::string& message);
 
-  /// Waits until the client has read all that was sent to it.
+  /// Waits until the client has read everything that was sent to it.
   void AwaitConsumed() const;
 
-  /// Reads nothing that the client writes, and lets it not be sent either.
+  /// Makes the receive buffer as small as possible, so that the client can hardly write.
   void StopReading();
 
-  /// How many bytes the client has written and nobody has read.
+  /// How many bytes the client has written; the service reads none of them.
   int Received();
 
-  /// Waits for a client and closes its connection; goes on listening.
+  /// Waits for a client and closes its connection; continues to listen.
   void CloseClient();
 
-  /// Ends the service: no further client can connect, the connection is closed.
+  /// Ends the service: closes the connection and accepts no further one.
   void Stop();
 
 private:
-  int listener_;    ///< owned; -1 when stopped
-  int client_ = -1; ///< owned; -1 while there is none
+  util::FileDescriptor listener_; ///< none when stopped
+  util::FileDescriptor client_;   ///< none while no client is connected
 };
 
 } // namespace orva::test

@@ -8,7 +8,7 @@ namespace orva::test {
 
 namespace {
 
-/// A number of KiB in a file such as /proc/PID/status.
+/// A field in KiB of a file such as /proc/PID/status.
 long ReadKibibytes(const std::string& path, const std::string& field) {
   std::ifstream file(path);
   for (std::string line; std::getline(file, line);) {
@@ -25,7 +25,7 @@ PeakMemory::PeakMemory(pid_t pid)
     : directory_("/proc/" + std::to_string(pid) + "/"),
       begin_(ReadKibibytes(directory_ + "status", "VmRSS")) {
   std::ofstream reset(directory_ + "clear_refs");
-  if (!(reset << "5" << std::flush)) { // the peak becomes what is used now
+  if (!(reset << "5" << std::flush)) { // resets the peak
     throw std::runtime_error("cannot reset the peak of " + directory_);
   }
 }

@@ -6,14 +6,14 @@
 
 namespace orva::test {
 
-/// How much more memory a process has used since this was made, at the most: its resident set, as
-/// the kernel keeps the peak of it. Failures are thrown as std::runtime_error.
+/// The growth of a process's memory: the peak of its resident set since this object was made.
+/// Failures are thrown as std::runtime_error.
 class PeakMemory {
 public:
-  /// Begins with what the process `pid` uses now.
+  /// Resets the peak of the process `pid` to what it uses now.
   explicit PeakMemory(pid_t pid);
 
-  /// KiB; 0 when it never used more.
+  /// KiB over the use at the beginning; 0 when the process never used more.
   long Growth() const;
 
 private:
@@ -21,7 +21,7 @@ private:
   long begin_;
 };
 
-/// KiB that the process `pid` has used at the most. Throws std::runtime_error.
+/// The peak of the process `pid` in KiB. Throws std::runtime_error.
 long PeakOf(pid_t pid);
 
 } // namespace orva::test

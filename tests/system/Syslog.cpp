@@ -19,7 +19,8 @@ namespace orva::test {
 
 namespace {
 
-const std::string MARK = "mark"; ///< no message of syslog: it has no priority
+/// Without a priority, so that it cannot be a message of syslog.
+const std::string MARK = "mark";
 
 sockaddr_un Address() {
   sockaddr_un address{};
@@ -56,30 +57,30 @@ LogLine Plain(const std::string& text) {
 
 Syslog::Syslog() : socket_(socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0)) {
   const sockaddr_un address = Address();
-  if (socket_ == -1 ||
-      bind(socket_, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
+  if (!socket_ ||
+      bind(socket_.Get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
     throw std::system_error(errno, std::generic_category(), "/dev/log");
   }
   collector_ = std::jthread([this] { Collect(); });
 }
 
 Syslog::~Syslog() {
-  shutdown(socket_, SHUT_RDWR); // ends the collector's recv
+  shutdown(socket_.Get(), SHUT_RDWR); // ends the collector's recv
   collector_.join();
-  close(socket_);
   unlink("/dev/log");
 }
 
 std::vector<LogLine> Syslog::Lines(std::size_t first) const {
-  const std::unique_lock lock = LockBehindAllSent();
+  const std::unique_lock lock = LockAfterAllSent();
   return {lines_.begin() + static_cast<std::ptrdiff_t>(std::min(first, lines_.size())),
           lines_.end()};
 }
 
-// A socket keeps the order of what is sent to it: when our mark has come, all before it has.
-std::unique_lock<std::mutex> Syslog::LockBehindAllSent() const {
+// A socket keeps the order of its datagrams: everything that was sent before the mark arrives
+// before it.
+std::unique_lock<std::mutex> Syslog::LockAfterAllSent() const {
   const sockaddr_un address = Address();
-  sendto(socket_, MARK.data(), MARK.size(), MSG_NOSIGNAL,
+  sendto(socket_.Get(), MARK.data(), MARK.size(), MSG_NOSIGNAL,
          reinterpret_cast<const sockaddr*>(&address), sizeof address);
   ++marksSent_;
   std::unique_lock lock(mutex_);
@@ -105,7 +106,7 @@ bool Syslog::Await(const LogLine& line) const {
 void Syslog::Collect() {
   std::array<char, 131072> datagram;
   for (;;) {
-    const ssize_t size = recv(socket_, datagram.data(), datagram.size(), 0);
+    const ssize_t size = recv(socket_.Get(), datagram.data(), datagram.size(), 0);
     if (size == -1 && errno == EINTR) {
       continue;
     }

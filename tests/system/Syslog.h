@@ -1,5 +1,7 @@
 #pragma once
 
+#include "orvautil/FileDescriptor.h"
+
 #include <condition_variable>
 #include <cstddef>
 #include <functional>
@@ -29,8 +31,8 @@ LogLine Error(const std::string& text);
 /// A message of LOG_INFO with no facility.
 LogLine Plain(const std::string& text);
 
-/// The system log of a private root: owns /dev/log and keeps what arrives there, in order. A
-/// thread of its own collects, so that no program ever waits for the test to read.
+/// The system log of a private root: owns /dev/log and keeps what arrives there, in order. A thread
+/// of its own reads, so that no program waits for the test.
 class Syslog {
 public:
   /// Binds /dev/log. Throws std::system_error.
@@ -41,10 +43,10 @@ public:
 
   using Condition = std::function<bool(const std::vector<LogLine>&)>;
 
-  /// All messages that were sent before this call, but for the `first` ones.
+  /// All messages that were sent before this call, without the `first` ones.
   std::vector<LogLine> Lines(std::size_t first = 0) const;
 
-  /// Waits until `condition` holds for all messages so far; false after the deadline.
+  /// Waits until `condition` holds for the messages received so far; false after the deadline.
   bool Await(const Condition& condition) const;
 
   /// Waits for a message with exactly this priority and text.
@@ -52,9 +54,9 @@ public:
 
 private:
   void Collect();
-  std::unique_lock<std::mutex> LockBehindAllSent() const;
+  std::unique_lock<std::mutex> LockAfterAllSent() const;
 
-  int socket_; ///< owned
+  util::FileDescriptor socket_;
   mutable std::mutex mutex_;
   mutable std::condition_variable arrived_;
   std::vector<LogLine> lines_; ///< guarded by mutex_

@@ -1,5 +1,5 @@
-// Preloaded into the daemon: tells a file when the XML platform is terminated, which leaves no
-// other trace. The file is named by TERMINATE_PROBE and gets one line for each call.
+// Preloaded into the daemon: appends a line to the file that TERMINATE_PROBE names whenever the
+// XML platform is terminated, which nothing else shows.
 
 #include <xercesc/util/PlatformUtils.hpp>
 
@@ -14,7 +14,7 @@ void XMLPlatformUtils::Terminate() {
   if (const char* path = std::getenv("TERMINATE_PROBE")) {
     std::ofstream(path, std::ios::app) << "terminated\n";
   }
-  // Whatever the compiler calls the function, the library behind us calls it the same.
+  // The next library has the function under the same mangled name.
   Dl_info self;
   if (dladdr(reinterpret_cast<void*>(&XMLPlatformUtils::Terminate), &self) != 0) {
     if (void* library = dlsym(RTLD_NEXT, self.dli_sname)) {

@@ -25,7 +25,7 @@ long Trace(__ptrace_request request, pid_t thread, long data = 0) {
   return ptrace(request, thread, nullptr, data);
 }
 
-/// Waits for a stop of `thread`, of any thread when it is 0, and returns what stopped it.
+/// Waits until `thread`, or any thread for 0, stops. Returns the reason.
 siginfo_t AwaitStop(pid_t thread) {
   siginfo_t stop{};
   while (waitid(thread == 0 ? P_ALL : P_PID, static_cast<id_t>(thread), &stop, WSTOPPED | __WALL) !=
@@ -37,12 +37,12 @@ siginfo_t AwaitStop(pid_t thread) {
   return stop;
 }
 
-/// The signal that a stopped thread is to get when it goes on; 0 when tracing stopped it.
+/// The signal to deliver when a stopped thread continues; 0 when tracing stopped it.
 int SignalOf(const siginfo_t& stop) {
   return stop.si_status == SYSTEM_CALL_STOP || (stop.si_status >> 8) != 0 ? 0 : stop.si_status;
 }
 
-/// Whether the stopped thread is about to make a call, and which.
+/// Whether the stopped thread is about to make a system call, which is then stored in `call`.
 bool IsEntry(pid_t thread, SystemCall& call) {
   struct __ptrace_syscall_info info {};
   if (ptrace(PTRACE_GET_SYSCALL_INFO, thread, sizeof info, &info) <= 0 ||
@@ -108,7 +108,7 @@ void Tracer::SeizeNewThreads() {
 }
 
 Tracer::~Tracer() {
-  // The first thread last: its end is told only when the others are gone.
+  // The first thread last: the kernel reports its end only after those of the others.
   for (const auto& [thread, held] : held_) {
     if (thread != process_) {
       Release(thread);
@@ -121,7 +121,7 @@ void Tracer::Release(pid_t thread) {
   if (held_[thread] && Trace(PTRACE_DETACH, thread) == 0) {
     return;
   }
-  // One that is killed in the meantime is no longer where it was stopped.
+  // A thread that is killed in the meantime is not where it was stopped.
   for (;;) {
     Trace(PTRACE_INTERRUPT, thread);
     siginfo_t state{};
@@ -151,10 +151,10 @@ void Tracer::RunUntil(const Condition& holds) {
   for (;;) {
     const siginfo_t stop = AwaitStop(0);
     const pid_t thread = stop.si_pid;
-    held_[thread] = false; // also of a thread that has just been made
+    held_[thread] = false; // also for a new thread
     if (stop.si_status >> 8 == PTRACE_EVENT_EXIT && thread == process_) {
       held_[thread] = true;
-      throw std::runtime_error("the traced process has come to its end");
+      throw std::runtime_error("the traced process has ended");
     }
     SystemCall call{};
     if (stop.si_status == SYSTEM_CALL_STOP && IsEntry(thread, call) && holds(call)) {

@@ -19,15 +19,15 @@ struct SystemCall {
   std::array<std::uint64_t, 6> arguments;
 };
 
-/// Whether a call may change a file or tell somebody something. Between two of these it makes no
-/// difference to the world where a process is.
+/// Whether a call may change a file or send something. Between two such calls nothing outside the
+/// process depends on how far the process has come.
 bool IsEffect(const SystemCall& call);
 
-/// Holds a process of the test's own at chosen system calls. Belongs to the thread that makes it.
-/// When the object ends the process goes on by itself, unless it has been killed.
+/// Holds a child process at chosen system calls. Only for the thread that makes it. When the object
+/// ends, the process continues, unless it has been killed.
 class Tracer {
 public:
-  /// Takes hold of all threads of the process. Throws std::system_error.
+  /// Stops all threads of the process. Throws std::system_error.
   explicit Tracer(pid_t process);
   Tracer(const Tracer&) = delete;
   Tracer& operator=(const Tracer&) = delete;
@@ -35,20 +35,20 @@ public:
 
   using Condition = std::function<bool(const SystemCall&)>;
 
-  /// Lets the process go on until a thread is about to make a call that `holds` accepts, and holds
-  /// that thread before it. Throws std::runtime_error when the process ends instead.
+  /// Lets the process run until a thread is about to make a call that `holds` accepts, and stops
+  /// that thread before the call. Throws std::runtime_error when the process ends instead.
   void RunUntil(const Condition& holds);
 
-  /// What a write or a send is about to pass on; empty for other calls.
+  /// The bytes that a write or a send is about to pass; empty for other calls.
   std::string Data(const SystemCall& call) const;
 
-  /// How long a sleep is about to take; nothing for other calls.
+  /// The duration of a sleep that is about to begin; 0 for other calls.
   std::chrono::nanoseconds Sleep(const SystemCall& call) const;
 
 private:
   void SeizeNewThreads();
   void Release(pid_t thread);
-  /// What the process has at an address.
+  /// The memory of the process at an address.
   std::string Memory(std::uint64_t address, std::size_t size) const;
 
   pid_t process_;

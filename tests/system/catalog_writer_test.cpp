@@ -22,8 +22,8 @@ using namespace std::chrono_literals;
 
 constexpr unsigned SEED = 20'081;
 
-/// The content of volume B's catalog at one time. Each generation has another folder, with other
-/// photos in it than the one before, and of another number; its number is their stamp.
+/// The content of volume B's catalog at one time. Each generation has a new folder with another
+/// number of photos; the number of the generation is their stamp.
 struct Generation {
   int number;
 
@@ -51,7 +51,7 @@ struct Generation {
   }
 };
 
-/// The indexer of B, which replaces one generation by the next in one transaction.
+/// The indexer of B. Replaces a generation by the next one in one transaction.
 class Indexer {
 public:
   Indexer(const Volume& volume, const std::string& journal) : catalog_(volume) {
@@ -62,7 +62,7 @@ public:
     Commit();
   }
 
-  /// Begins the transaction and writes all of it.
+  /// Begins the transaction and writes everything.
   void Write(const Generation& next) {
     const std::string stamp = std::to_string(next.number);
     const std::string former = Generation{next.number - 1}.Folder();
@@ -84,7 +84,7 @@ public:
 
   void Commit() { catalog_.Rows().Run("COMMIT"); }
 
-  /// Commits if nobody has to be waited for; whether it has.
+  /// Commits if it need not wait for a lock. Returns whether it did.
   bool TryCommit() {
     catalog_.Rows().Run("PRAGMA busy_timeout = 0");
     bool committed = true;
@@ -135,7 +135,7 @@ protected:
     return AwaitErrors();
   }
 
-  /// What has gone wrong until the daemon has handled everything.
+  /// The errors that are logged until the daemon has handled everything.
   Lines AwaitErrors() {
     appliance.Barrier();
     Lines errors;
@@ -167,7 +167,7 @@ TEST_P(CatalogWriter, ThatCommitsBetweenTwoReadsOfAMergeIsLeftForTheNext) {
       committed = indexer.TryCommit();
     }
     appliance.Barrier();
-    EXPECT_EQ(IsWal(), committed) << "only a log lets a writer pass a reader";
+    EXPECT_EQ(IsWal(), committed) << "only in WAL mode can a writer commit while a program reads";
     ExpectMerged({generation});
     if (!committed) {
       indexer.Commit();
@@ -218,7 +218,7 @@ TEST_P(CatalogWriter, ThatCommitsWhileMergesRunIsSeenAtOneOfItsCommits) {
 INSTANTIATE_TEST_SUITE_P(In, CatalogWriter, ::testing::Values("delete", "wal"),
                          [](const auto& tested) { return std::string(tested.param); });
 
-/// A writer that keeps everybody else out; a write-ahead log has no such writer.
+/// A writer that locks out all readers, which does not exist in WAL mode.
 class CatalogLocked : public CatalogWriter {
 protected:
   void SetUp() override {

@@ -1,4 +1,4 @@
-// How much arrives, and how it arrives.
+// Large amounts of bytes and messages, and unusual ways to send them.
 
 #include "Flood.h"
 
@@ -161,12 +161,12 @@ TEST_F(Flood, ConnectionsThatEndInsideAMessageLeaveNothingBehind) {
     appliance.Service().CloseClient();
   }
   appliance.Barrier();
-  // Two lines for each new connection, and none for what was cut off.
+  // Two lines for each new connection, and none for the incomplete messages.
   EXPECT_EQ(2U * static_cast<std::size_t>(connections), appliance.TakeLog().size());
   ExpectUnharmed("connections that end inside a message");
 }
 
-/// A spelling of `path` for each number, as long as it may be with `size` bytes.
+/// Another spelling of `path` for each number, of at most `size` bytes.
 std::string Spelling(std::string path, int number, std::size_t size) {
   for (int bits = number; bits > 0; bits /= 2) {
     path += bits % 2 == 0 ? "/." : "//.";
@@ -185,14 +185,14 @@ TEST_F(Flood, SpellingsOfAMountPointAreABoundedNumberOfVolumes) {
 }
 
 TEST_F(Flood, LongSpellingsOfAMountPointAreABoundedAmountOfMemory) {
-  constexpr std::size_t longest = PATH_MAX - 2; // and a "/" and an end
+  constexpr std::size_t longest = PATH_MAX - 2; // without the "/" and the null byte that are added
   const Volume a("A", "150g");
   appliance.Handle(Plugged(a.Path()));
   appliance.Handle(Scanned(a.Path()));
   for (int i = 0; i < 1'100; ++i) {
     appliance.Service().Send(Notification("Scanned", Spelling(a.Path(), i, longest)));
   }
-  // With each of these a new merger goes through all volumes.
+  // Each of these starts a new merger, which logs all volumes.
   const int mergers = TestScale(50, 1'000);
   for (int i = 0; i < mergers; ++i) {
     appliance.Service().Send(Unplugged("/shares/Other"));

@@ -1,7 +1,8 @@
-// What a message of the greatest length can hold.
+// Messages of up to the greatest length, with hostile content.
 
 #include "Flood.h"
 
+#include "orvautil/FileDescriptor.h"
 #include "support/TestScale.h"
 
 #include <arpa/inet.h>
@@ -36,40 +37,37 @@ std::string Repeated(const std::string& text, std::size_t count) {
   return repeated;
 }
 
-/// `count` elements inside each other, with `content` inside them all.
+/// `count` nested elements, with `content` in the innermost one.
 std::string Nested(std::size_t count, const std::string& content = "") {
   return Repeated("<a>", count) + content + Repeated("</a>", count);
 }
 
-/// As many elements inside each other as fit between `head` and `tail`.
+/// As many nested elements as fit between `head` and `tail`.
 std::string DeepestNesting(const std::string& head, const std::string& content,
                            const std::string& tail) {
   return head + Nested((LONGEST - head.size() - content.size() - tail.size()) / 7, content) + tail;
 }
 
-/// A file that says whether somebody has opened it.
+/// A file that knows whether it has been opened.
 class Decoy {
 public:
   explicit Decoy(const std::string& path) : events_(inotify_init1(IN_NONBLOCK | IN_CLOEXEC)) {
     std::ofstream(path) << "<!ENTITY decoy 'opened'>";
-    if (inotify_add_watch(events_, path.c_str(), IN_OPEN | IN_ACCESS) == -1) {
+    if (inotify_add_watch(events_.Get(), path.c_str(), IN_OPEN | IN_ACCESS) == -1) {
       throw std::system_error(errno, std::generic_category(), path);
     }
   }
-  Decoy(const Decoy&) = delete;
-  Decoy& operator=(const Decoy&) = delete;
-  ~Decoy() { close(events_); }
 
   bool WasOpened() const {
     std::array<char, 4096> event{};
-    return read(events_, event.data(), event.size()) > 0;
+    return read(events_.Get(), event.data(), event.size()) > 0;
   }
 
 private:
-  int events_; ///< owned
+  util::FileDescriptor events_;
 };
 
-/// A server on this machine that says whether somebody has connected to it.
+/// A server on this machine that knows whether a client has connected to it.
 class DecoyServer {
 public:
   DecoyServer() : listener_(socket(AF_INET, SOCK_STREAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0)) {
@@ -77,29 +75,23 @@ public:
     address.sin_family = AF_INET;
     address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
     socklen_t size = sizeof address;
-    if (bind(listener_, reinterpret_cast<const sockaddr*>(&address), size) != 0 ||
-        listen(listener_, SOMAXCONN) != 0 ||
-        getsockname(listener_, reinterpret_cast<sockaddr*>(&address), &size) != 0) {
+    if (bind(listener_.Get(), reinterpret_cast<const sockaddr*>(&address), size) != 0 ||
+        listen(listener_.Get(), SOMAXCONN) != 0 ||
+        getsockname(listener_.Get(), reinterpret_cast<sockaddr*>(&address), &size) != 0) {
       throw std::system_error(errno, std::generic_category(), "decoy server");
     }
     url_ = "http://127.0.0.1:" + std::to_string(ntohs(address.sin_port)) + "/decoy";
   }
-  DecoyServer(const DecoyServer&) = delete;
-  DecoyServer& operator=(const DecoyServer&) = delete;
-  ~DecoyServer() { close(listener_); }
 
   const std::string& Url() const { return url_; }
 
   bool WasConnected() const {
-    const int client = accept4(listener_, nullptr, nullptr, SOCK_CLOEXEC);
-    if (client != -1) {
-      close(client);
-    }
-    return client != -1;
+    const util::FileDescriptor client(accept4(listener_.Get(), nullptr, nullptr, SOCK_CLOEXEC));
+    return static_cast<bool>(client);
   }
 
 private:
-  int listener_; ///< owned
+  util::FileDescriptor listener_;
   std::string url_;
 };
 
@@ -192,8 +184,8 @@ TEST_F(HostileMessage, EveryOtherEncodingIsHandledOrRefused) {
   ExpectUnharmed("other encodings declared");
 }
 
-TEST_F(HostileMessage, TwoBytesForACharacterAreNoWayAround) {
-  // Seen as bytes it names a notification, seen as text it says so behind a comment.
+TEST_F(HostileMessage, AMessageInUtf16IsHandledOrRefused) {
+  // The comment has the root element's name in single bytes, the rest of the message is UTF-16.
   std::string wide = "\xfe\xff";
   for (const char c : "<!--" + std::string(1, '\1') + "-->" + START + "/>") {
     wide += c == '\1' ? std::string("ORVANotification") : std::string{'\0', c};
@@ -205,7 +197,7 @@ TEST_F(HostileMessage, TwoBytesForACharacterAreNoWayAround) {
 
 // --- Structure ---------------------------------------------------------------------------------
 
-TEST_F(HostileMessage, TheDeepestNestingHolds) {
+TEST_F(HostileMessage, TheDeepestNestingIsHandled) {
   Handled(DeepestNesting(START + ">", "", FINISH));
   Handled(DeepestNesting(START + ">", "text", FINISH));
   EXPECT_THAT(Refused(Filled(START + ">", "<a>", "")), Ne(""));
@@ -213,7 +205,7 @@ TEST_F(HostileMessage, TheDeepestNestingHolds) {
   ExpectUnharmed("the deepest nesting");
 }
 
-TEST_F(HostileMessage, TheDeepestNestingInAProfileHolds) {
+TEST_F(HostileMessage, TheDeepestNestingInAProfileIsHandled) {
   const std::string batch = R"(<ORVANotification Name="TranscodedBatch" MountPoint="/shares/A">)";
   const Log only{Info(":: Transcodedbatch ")};
   for (const std::string& text : {std::string(), std::string("0123"), Repeated("<b/>x", 2'000)}) {
@@ -221,14 +213,14 @@ TEST_F(HostileMessage, TheDeepestNestingInAProfileHolds) {
               appliance.Handle(DeepestNesting(batch + "<profile>", text, "</profile>" + FINISH)));
   }
   ExpectUnharmed("the deepest nesting in a profile");
-  // The text is found at the bottom, so that the batch counts.
+  // The text of the innermost element counts as the profile.
   const Log log = appliance.Handle(
       DeepestNesting(batch + "<profile>", notify::TRANSCODING_PROFILE, "</profile>" + FINISH));
   ASSERT_LE(2U, log.size());
   EXPECT_EQ(BatchLines(), Log(log.begin(), log.begin() + 2));
 }
 
-TEST_F(HostileMessage, ManyProfilesHold) {
+TEST_F(HostileMessage, ManyProfilesAreHandled) {
   const std::string batch = R"(<ORVANotification Name="TranscodedBatch" MountPoint="/shares/A">)";
   const Log only{Info(":: Transcodedbatch ")};
   EXPECT_EQ(only, appliance.Handle(Filled(batch, "<profile/>", FINISH)));
@@ -238,7 +230,7 @@ TEST_F(HostileMessage, ManyProfilesHold) {
   ExpectUnharmed("profiles");
 }
 
-/// Names that are all different.
+/// Generates names that are all different.
 class Names {
 public:
   /// "a", "b", ... "aa" and so on, with letters only.
@@ -254,7 +246,7 @@ private:
   int number_ = 0;
 };
 
-/// As many of `piece(name)` as fit between `head` and `tail`, each with another name.
+/// As many of `piece(name)` as fit between `head` and `tail`, each with a new name.
 template <typename Piece>
 std::string FilledWithNames(Names& names, const std::string& head, const std::string& tail,
                             Piece piece) {
@@ -268,7 +260,7 @@ std::string FilledWithNames(Names& names, const std::string& head, const std::st
   }
 }
 
-TEST_F(HostileMessage, TheMostAttributesHold) {
+TEST_F(HostileMessage, TheMostAttributesAreHandled) {
   const auto attribute = [](const std::string& name) { return " " + name + "=\"\""; };
   for (int i = 0; i < TestScale(3, 100); ++i) {
     Names names;
@@ -278,7 +270,7 @@ TEST_F(HostileMessage, TheMostAttributesHold) {
   ExpectUnharmed("the most attributes");
 }
 
-TEST_F(HostileMessage, TheMostElementsHold) {
+TEST_F(HostileMessage, TheMostElementsAreHandled) {
   for (int i = 0; i < TestScale(3, 100); ++i) {
     Names names;
     Handled(Filled(START + ">", "<a/>", FINISH));
@@ -288,7 +280,7 @@ TEST_F(HostileMessage, TheMostElementsHold) {
   ExpectUnharmed("the most elements");
 }
 
-TEST_F(HostileMessage, AllOfTheLargestHoldTogether) {
+TEST_F(HostileMessage, AllOfTheLargestAreHandledTogether) {
   for (int i = 0; i < TestScale(2, 20); ++i) {
     Names names;
     Handled(FilledWithNames(names, START, "/>",
@@ -312,7 +304,7 @@ TEST_F(HostileMessage, DuplicateAttributesAreRefused) {
   ExpectUnharmed("duplicate attributes");
 }
 
-TEST_F(HostileMessage, AMillionNamespacesHold) {
+TEST_F(HostileMessage, AMillionNamespacesAreHandled) {
   const int namespaces = TestScale(50'000, 1'000'000);
   Names names;
   int declared = 0;
@@ -325,7 +317,7 @@ TEST_F(HostileMessage, AMillionNamespacesHold) {
   ExpectUnharmed("a million namespaces");
 }
 
-TEST_F(HostileMessage, AMillionNamesHold) {
+TEST_F(HostileMessage, AMillionNamesAreHandled) {
   const int count = TestScale(50'000, 1'000'000);
   Names names;
   int used = 0;
@@ -338,7 +330,7 @@ TEST_F(HostileMessage, AMillionNamesHold) {
   ExpectUnharmed("a million names");
 }
 
-TEST_F(HostileMessage, HugeNamesHold) {
+TEST_F(HostileMessage, HugeNamesAreHandled) {
   const std::string name(60'000, 'n');
   Handled(START + " " + name + "=\"\"/>");
   Handled(START + "><" + name + "/>" + FINISH);
@@ -352,7 +344,7 @@ TEST_F(HostileMessage, HugeNamesHold) {
   ExpectUnharmed("huge names");
 }
 
-TEST_F(HostileMessage, WhatIsNoElementHolds) {
+TEST_F(HostileMessage, CommentsReferencesAndInstructionsAreHandled) {
   Handled(Filled(START + ">", "<?p i?>", FINISH));
   Handled(Filled(START + ">", "<![CDATA[]]>", FINISH));
   Handled(Filled(START + ">", "<![CDATA[x]]>y", FINISH));
@@ -368,9 +360,10 @@ TEST_F(HostileMessage, WhatIsNoElementHolds) {
   ExpectUnharmed("comments, references and instructions");
 }
 
-// --- Document types and what a document refers to ----------------------------------------------
+// --- Document types and references to other documents
+// ----------------------------------------------
 
-TEST_F(HostileMessage, EntitiesNeverGrow) {
+TEST_F(HostileMessage, EntitiesAreNotExpanded) {
   const std::string root =
       R"(<ORVANotification Name="Purged" MountPoint="&j;">&j;</ORVANotification>)";
   std::string bomb = R"(<!DOCTYPE ORVANotification [<!ENTITY a "aaaaaaaaaa">)";
@@ -392,11 +385,11 @@ TEST_F(HostileMessage, EntitiesNeverGrow) {
   for (const std::string& message : messages) {
     EXPECT_THAT(Refused(message), Ne(""));
   }
-  EXPECT_THAT(Refused(root), Ne("")); // without a declaration there is none such
+  EXPECT_THAT(Refused(root), Ne("")); // an entity without a declaration
   ExpectUnharmed("entities");
 }
 
-TEST_F(HostileMessage, NothingThatItRefersToIsOpened) {
+TEST_F(HostileMessage, NoReferenceIsOpened) {
   const Decoy file("/tmp/decoy");
   const DecoyServer server;
   for (const std::string& url : {std::string("/tmp/decoy"), std::string("file:///tmp/decoy"),
@@ -424,7 +417,7 @@ TEST_F(HostileMessage, NothingThatItRefersToIsOpened) {
 
 // --- Mount points ------------------------------------------------------------------------------
 
-/// What a Purged notification says about a mount point where there is nothing.
+/// The log of a Purged notification for a mount point that does not exist.
 Log NoPlace(const std::string& mountPoint) {
   return {Info(":: Purged "),
           Error("There is no filesystem location for the mountpoint " + mountPoint),
@@ -442,7 +435,7 @@ TEST_F(HostileMessage, AHugeMountPointIsOnlyText) {
 TEST_F(HostileMessage, AMountPointHasNoNul) {
   EXPECT_THAT(Refused(Notification("Purged", "/shares&#0;/A")), Ne(""));
   EXPECT_THAT(Refused(Notification("Purged", "/shares&#x0;/A")), Ne(""));
-  // An escape for it stays as it stands, so that nothing is cut off.
+  // Its percent escape is not decoded, so that the path is not cut off.
   EXPECT_EQ(NoPlace("/shares%00/A/"), appliance.Handle(Notification("Purged", "/shares%00/A")));
   ExpectUnharmed("NULs in mount points");
 }
@@ -465,14 +458,14 @@ TEST_F(HostileMessage, ALineFeedInAMountPointForgesNoLogMessage) {
     std::string escaped = forged;
     escaped.replace(escaped.find('\n'), 1, lineFeed);
     escaped.replace(escaped.find('<'), 1, "&lt;");
-    // One datagram each, whatever is in it: where a message begins is the log's to say.
+    // Each message is one datagram, whatever its content.
     EXPECT_EQ(NoPlace(forged + "/"), appliance.Handle(Notification("Purged", escaped)));
   }
   ExpectUnharmed("line feeds in mount points");
 }
 
-TEST_F(HostileMessage, DotsInAMountPointAreTakenAsTheyStand) {
-  // It exists, but it is another volume than the one that it leads to.
+TEST_F(HostileMessage, DotsInAMountPointAreNotResolved) {
+  // The path exists, but it counts as another volume than /shares.
   EXPECT_EQ((Log{Info(":: Purged "), Info("Default:: Volume purged - ignored! ")}),
             appliance.Handle(Notification("Purged", "/shares/../shares/./")));
   EXPECT_EQ(NoPlace("../../shares/x/"), appliance.Handle(Notification("Purged", "../../shares/x")));

@@ -13,7 +13,7 @@ namespace fs = std::filesystem;
 using ::testing::ElementsAre;
 using ::testing::IsEmpty;
 
-/// Volumes with real files, whose catalogs the indexer makes.
+/// Volumes with real files and catalogs of the indexer.
 class Indexing : public SystemTest {
 protected:
   void SetUp() override {
@@ -33,7 +33,7 @@ protected:
     ASSERT_EQ(0, std::system(command.c_str()));
   }
 
-  /// Indexes the volume and lets the daemon take the batch. No error may come of it.
+  /// Indexes the volume and lets the daemon merge it without an error.
   void IndexAndMerge(const Volume& volume) {
     ASSERT_NO_FATAL_FAILURE(Index(volume));
     for (const LogLine& line : appliance.Handle(TranscodedBatch(volume.Path()))) {
@@ -77,14 +77,14 @@ TEST_F(Indexing, ThePhotosOfAVolumeAreMergedWithTheirTimes) {
   EXPECT_THAT(Counts(), ElementsAre("/shares/A/|3|3"));
 }
 
-TEST_F(Indexing, WhatComesAndGoesBetweenTwoBatchesIsFollowed) {
+TEST_F(Indexing, ChangesBetweenTwoBatchesAreMerged) {
   MakeFile("/shares/A/Pictures/a.jpg");
   MakeFile("/shares/A/Pictures/b.jpg");
   MakeFile("/shares/A/Old/c.jpg");
   IndexAndMerge(a);
   ASSERT_EQ(3U, Files().size());
 
-  // All within the second of the first batch: nothing may be missed for that.
+  // All in the same second as the first batch, which must not hide anything.
   fs::remove("/shares/A/Pictures/b.jpg");
   fs::remove_all("/shares/A/Old");
   MakeFile("/shares/A/New/d.jpg");
@@ -101,7 +101,7 @@ TEST_F(Indexing, WhatComesAndGoesBetweenTwoBatchesIsFollowed) {
                                    "/shares/A/Pictures/a.jpg", "/shares/A/Pictures/b.jpg"));
 }
 
-TEST_F(Indexing, HiddenSystemAndBackupFilesAreTold) {
+TEST_F(Indexing, HiddenSystemAndBackupFilesAreDistinguished) {
   MakeFile("/shares/A/Pictures/.hidden.jpg");
   MakeFile("/shares/A/Pictures/a.jpg");
   MakeFile("/shares/A/Pictures/backup.jpg~");
@@ -124,7 +124,7 @@ TEST_F(Indexing, AReadOnlyVolumeWithItsCatalogIsMerged) {
   EXPECT_THAT(Files(), ElementsAre("/shares/B/b.jpg"));
 }
 
-TEST_F(Indexing, APurgedVolumeIsMergedAgainWhole) {
+TEST_F(Indexing, APurgedVolumeIsMergedAgainCompletely) {
   MakeFile("/shares/A/Pictures/a.jpg");
   IndexAndMerge(a);
   MergedDatabase(a.Path()).Rows().Run("DELETE FROM Files");

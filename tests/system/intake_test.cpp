@@ -20,11 +20,11 @@ const LogLine CREATING =
 const LogLine READING =
     Plain("src/zophotodbmerger/NotificationListener:137: Calling ReadMessage()");
 const std::string DELIMITER(4, '\0');
-/// A good notification and what shows that it was handled.
+/// A good notification, and the log of its handling.
 const std::string GOOD = Notification("Unplugged", "/shares/A");
 const Log HANDLED = {Info("Default:: Volumeunplugged, ignoring! ")};
 
-/// Bytes of the largest message that is taken.
+/// Bytes of the largest message that the daemon accepts.
 constexpr std::size_t LARGEST = 65536;
 
 /// A padded good notification of exactly `size` bytes.
@@ -41,8 +41,8 @@ protected:
     appliance.TakeLog();
   }
 
-  /// The message leaves one error line that the message processor writes, and the connection
-  /// stays good. Returns the line's text.
+  /// The message processor writes one error line for the message, and the connection stays open.
+  /// Returns the line's text.
   std::string RefusedByTheProcessor(const std::string& message) {
     const Log log = appliance.Handle(message);
     EXPECT_EQ(1U, log.size()) << ::testing::PrintToString(log);
@@ -55,7 +55,7 @@ protected:
     return log[0].text;
   }
 
-  /// The message is taken without a trace, and the connection stays good.
+  /// The message has no effect, and the connection stays open.
   void ExpectIgnored(const std::string& message) {
     EXPECT_THAT(appliance.Handle(message), IsEmpty());
     ExpectGood();
@@ -71,7 +71,7 @@ TEST_F(Intake, AnotherRootElementIsRefusedByName) {
   ExpectGood();
 }
 
-TEST_F(Intake, AnUnrelatedMessageIsDroppedUnread) {
+TEST_F(Intake, AnUnrelatedMessageIsDroppedWithoutALine) {
   ExpectIgnored("<Other/>");
   ExpectIgnored("no XML at all");
   ExpectIgnored("");
@@ -103,7 +103,7 @@ TEST_F(Intake, AMessageOverTheLargestSizeIsRefused) {
 TEST_F(Intake, AnEmptyOrAbsentMountPointIsRefused) {
   EXPECT_THAT(RefusedByTheProcessor(Plugged("")), HasSubstr("basic_string::at"));
   RefusedByTheProcessor(R"(<ORVANotification Name="Unplugged"/>)");
-  // Before the kind is looked at.
+  // Before the name is checked.
   RefusedByTheProcessor(Notification("Unknown", ""));
   RefusedByTheProcessor(TranscodedBatch(""));
 }
@@ -165,7 +165,7 @@ TEST_F(Intake, BothFormsOfAMountPointAreOneVolume) {
   const Volume a("A", "150g");
   appliance.Handle(Plugged(a.Path()));
   appliance.Handle(Plugged(a.MountPoint()));
-  // Had the second been another volume, it would be the successor of the first.
+  // If the second were another volume, it would be the successor of the first.
   const Log log = appliance.Handle(Unplugged(a.MountPoint()));
   EXPECT_EQ(Info("We now have a master volume " + SHARES_MASTER_TEXT), log.back());
 }
@@ -185,7 +185,7 @@ TEST_F(Intake, AFormatInAMountPointIsOnlyText) {
   ExpectGood();
 }
 
-TEST_F(Intake, AHandlerThatFailsEndsOnlyItsMessage) {
+TEST_F(Intake, AHandlerThatFailsAffectsOnlyItsMessage) {
   const auto fails = [this] { return appliance.Handle(End("/shares")).back(); };
   const LogLine unusable = Error("MessageProcessor:: Invalid DB location : '/shares/.zophotos'");
   const fs::path directory = "/shares/.zophotos";
@@ -200,7 +200,7 @@ TEST_F(Intake, AHandlerThatFailsEndsOnlyItsMessage) {
   EXPECT_EQ(unusable, fails());
   ExpectGood();
 
-  // The database layer throws a text.
+  // The database layer throws a std::string.
   fs::remove(directory);
   fs::create_directory(directory);
   std::ofstream(directory / "zophotos.db") << std::string(4096, 'x');
@@ -228,10 +228,10 @@ TEST_F(Intake, ManyClosedConnectionsAreMadeAgain) {
   EXPECT_EQ(expected, appliance.TakeLog());
 }
 
-TEST_F(Intake, BytesBehindTheLastDelimiterAreDroppedWithTheirConnection) {
+TEST_F(Intake, BytesAfterTheLastDelimiterAreDroppedWithTheirConnection) {
   appliance.Service().SendBytes(GOOD.substr(0, 30));
   appliance.Service().CloseClient();
-  // The rest must not be taken for the end of what came before.
+  // The rest must not complete the message of the first connection.
   appliance.Service().SendBytes(GOOD.substr(30) + DELIMITER);
   appliance.Service().Send(GOOD);
   appliance.Barrier();
@@ -249,13 +249,13 @@ TEST_F(Intake, ACompleteMessageWithoutItsDelimiterIsNotHandled) {
   EXPECT_EQ((Log{CREATING, READING}), appliance.TakeLog());
 }
 
-TEST_F(Intake, AnOversizedMessageIsForgottenWithItsConnection) {
+TEST_F(Intake, AnOversizedMessageIsDroppedWithItsConnection) {
   appliance.Service().SendBytes(std::string(2 * LARGEST, 'x'));
   appliance.Service().CloseClient();
   EXPECT_EQ(HANDLED.back(), appliance.Handle(GOOD).back());
 }
 
-TEST_F(Intake, AServiceThatStopsEndsTheDaemonWell) {
+TEST_F(Intake, WhenTheServiceStopsTheDaemonExitsWithStatusZero) {
   EXPECT_EQ(Exited(0), appliance.Shutdown());
   EXPECT_EQ(
       (Log{CREATING, Error("Unable to open socket (/run/orva/notification.sock)"),

@@ -21,45 +21,45 @@ namespace {
 using ::testing::Contains;
 using ::testing::IsEmpty;
 
-/// What a step of a life tells the daemon; the start of the daemon is a step as well.
+/// A step of a run: a message to the daemon. The start of the daemon is a step, too.
 struct Step {
   std::string name;
   std::string message; ///< empty for the start
   bool followsChanges = false;
 };
 
-/// What a kill can hit; the phases of a merge are those that its log lines tell apart.
-const Lines PHASES_OF_A_LIFE{"first merge",
-                             "first merge of B",
-                             "first merge of B, commit",
-                             "first merge of B, files",
-                             "first merge of B, folders",
-                             "first merge, commit",
-                             "first merge, files",
-                             "first merge, folders",
-                             "next merge",
-                             "next merge, commit",
-                             "next merge, files",
-                             "next merge, folders",
-                             "plug of A",
-                             "plug of B",
-                             "re-merge",
-                             "re-merge, commit",
-                             "re-merge, files",
-                             "re-merge, folders",
-                             "removal",
-                             "scan",
-                             "start",
-                             "start over an old database"};
+/// The phases in which a kill can come; the log lines of a merge separate its phases.
+const Lines PHASES_OF_A_RUN{"first merge",
+                            "first merge of B",
+                            "first merge of B, commit",
+                            "first merge of B, files",
+                            "first merge of B, folders",
+                            "first merge, commit",
+                            "first merge, files",
+                            "first merge, folders",
+                            "next merge",
+                            "next merge, commit",
+                            "next merge, files",
+                            "next merge, folders",
+                            "plug of A",
+                            "plug of B",
+                            "re-merge",
+                            "re-merge, commit",
+                            "re-merge, files",
+                            "re-merge, folders",
+                            "removal",
+                            "scan",
+                            "start",
+                            "start over an old database"};
 
-/// An instant at which a kill makes a difference: before the effect of this number in a step.
+/// The instant of a kill: before the effect of this number in a step.
 struct Instant {
   Step step;
-  bool old; ///< whether there is a database of an earlier life under the shares root
+  bool old; ///< whether the shares root has a database of an earlier run
   std::size_t effect;
 };
 
-/// What a life has left that a daemon or another program can see.
+/// Everything that a run has left and that a daemon or another program can see.
 Lines Observe() {
   EXPECT_THAT(MergedDatabase("/shares/A").Faults(), IsEmpty());
   EXPECT_THAT(MergedDatabase("/shares").Faults(), IsEmpty());
@@ -71,7 +71,7 @@ Lines Observe() {
   return seen;
 }
 
-/// The lines that only one of two lists has.
+/// The lines that are only in one of two lists.
 Lines Difference(Lines expected, Lines actual) {
   std::sort(expected.begin(), expected.end());
   std::sort(actual.begin(), actual.end());
@@ -81,16 +81,15 @@ Lines Difference(Lines expected, Lines actual) {
   return difference;
 }
 
-/// Nothing went wrong in a life.
+/// The run has logged no error.
 void ExpectNoErrors(Appliance& appliance) {
   for (const LogLine& line : appliance.TakeLog()) {
     EXPECT_NE(Error("").priority, line.priority) << line.text;
   }
 }
 
-/// What is on the volumes and who is told of it, from the first start of a daemon to the removal
-/// of a volume; the same for each life. The daemon of a life may be killed, and another one then
-/// goes through all of it again.
+/// A run is a fixed sequence of steps, from the first start of a daemon to the removal of a volume.
+/// The daemon of a run may be killed; another daemon then does the same steps again.
 class Kill : public ::testing::Test {
 protected:
   void SetUp() override {
@@ -112,7 +111,8 @@ protected:
     catalog.Rows().Run("COMMIT");
   }
 
-  /// New folders, a folder that grows, folders that go with their photos, and single ones that go.
+  /// Adds folders, adds photos to a folder, and deletes folders with their photos and single
+  /// photos.
   static void ChangeCatalog(Catalog& catalog) {
     catalog.Rows().Run("BEGIN");
     for (int i = 50; i < 55; ++i) {
@@ -150,8 +150,8 @@ protected:
     }
   }
 
-  /// An appliance on which no daemon has ever run; with `old` one ran long ago, when there was no
-  /// volume to be the master.
+  /// An appliance on which no daemon has run yet, or, with `old`, one whose shares root has the
+  /// database of an earlier run.
   std::unique_ptr<Appliance> NewAppliance(bool old) const {
     for (const char* const place : {"/shares/.zophotos", "/shares/A/.zophotos", "/tmp/daemon"}) {
       std::filesystem::remove_all(place);
@@ -164,7 +164,7 @@ protected:
     return std::make_unique<Appliance>();
   }
 
-  /// Runs a step with a traced daemon. Before each effect `holds` is asked with the phase.
+  /// Runs a step with a traced daemon. Calls `holds` with the phase before each effect.
   void Trace(Appliance& appliance, const Step& step,
              const std::function<bool(const std::string&)>& holds) const {
     if (step.followsChanges) {
@@ -188,7 +188,7 @@ protected:
         return false;
       }
       const std::string data = tracer.Data(call);
-      // A merger's own thread tells of the volumes at any time.
+      // The merger's own thread logs the volumes at any time.
       killed = data.find("Iterating over") == std::string::npos && holds(phase);
       for (const auto& [text, next] : PHASES) {
         if (call.number == SYS_sendto && data.find(text) != std::string::npos) {
@@ -213,8 +213,7 @@ protected:
     }
   }
 
-  /// Lives once through all steps, and the start a second time over what was left, and notes the
-  /// instants.
+  /// Records the instants of all steps, and those of another start over an existing database.
   void Record() {
     auto appliance = NewAppliance(false);
     for (const Step& step : steps) {
@@ -245,8 +244,8 @@ protected:
     return phases;
   }
 
-  /// The life of a daemon that is killed.
-  void LiveUntil(const Instant& instant) const {
+  /// The run of a daemon that is killed.
+  void RunUntil(const Instant& instant) const {
     const auto appliance = NewAppliance(instant.old);
     for (auto step = steps.begin(); !instant.old && step->name != instant.step.name; ++step) {
       RunStep(*appliance, *step);
@@ -254,14 +253,14 @@ protected:
     std::size_t effect = 0;
     Trace(*appliance, instant.step,
           [&](const std::string& /*phase*/) { return effect++ == instant.effect; });
-    // A daemon that had fewer effects this time is still there.
+    // The daemon still runs when it had fewer effects this time.
     kill(appliance->Daemon().Pid(), SIGKILL);
     EXPECT_EQ(Killed(SIGKILL), appliance->Daemon().AwaitEnd());
   }
 
-  /// The life of a daemon that finds whatever an earlier one has left. Returns what is there when
-  /// each volume has been merged, and at the end.
-  std::pair<Lines, Lines> LiveAgain() const {
+  /// The run of a daemon on the files that a killed one has left. Returns what can be seen after
+  /// the merges of both volumes, and at the end.
+  std::pair<Lines, Lines> RunAgain() const {
     ShowCatalogs("after");
     Appliance appliance;
     appliance.Start();
@@ -292,18 +291,18 @@ protected:
                                 {"removal", Unplugged(b.Path())}};
 
 private:
-  /// What is logged last in a phase, and the phase behind it.
+  /// The last log line of a phase, and the name of the next phase.
   const std::vector<std::pair<std::string, std::string>> PHASES{
       {"Retrieved counts", ", folders"}, {" folders for", ", files"}, {" files for", ", commit"}};
 };
 
-TEST_F(Kill, AtAnyInstantLosesNothingThatTheNextLifeDoesNotBringBack) {
+TEST_F(Kill, AtAnyInstantLosesNothingThatTheNextRunDoesNotRestore) {
   constexpr unsigned SEED = 471108;
   const int rounds = TestScale(1, 20);
 
   Record();
-  ASSERT_EQ(PHASES_OF_A_LIFE, Phases());
-  const auto [merged, end] = LiveAgain();
+  ASSERT_EQ(PHASES_OF_A_RUN, Phases());
+  const auto [merged, end] = RunAgain();
   EXPECT_THAT(Difference(merged, end), IsEmpty());
   EXPECT_THAT(merged, Contains("/shares/A/|1185|1185|2001"));
   EXPECT_THAT(merged, Contains("/shares/B/|285|285|2001"));
@@ -315,8 +314,8 @@ TEST_F(Kill, AtAnyInstantLosesNothingThatTheNextLifeDoesNotBringBack) {
       SCOPED_TRACE("seed " + std::to_string(SEED) + ", round " + std::to_string(round) +
                    ", killed before effect " + std::to_string(instant.effect) + " of " +
                    std::to_string(all.size()) + " in: " + phase);
-      LiveUntil(instant);
-      const auto [mergedAfter, endAfter] = LiveAgain();
+      RunUntil(instant);
+      const auto [mergedAfter, endAfter] = RunAgain();
       ASSERT_THAT(Difference(merged, mergedAfter), IsEmpty());
       ASSERT_THAT(Difference(merged, endAfter), IsEmpty());
     }

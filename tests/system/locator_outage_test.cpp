@@ -16,8 +16,8 @@ using ::testing::ElementsAre;
 
 const char* const LOCATOR = "/tmp/zophotodbmerger.conf";
 
-/// What keeps the locator from being written, and how it ends. Programs that look for the file in
-/// the meantime find `shown`.
+/// Keeps the locator from being written between `begin` and `end`. Meanwhile other programs read
+/// `shown`.
 struct Obstacle {
   const char* name;
   void (*begin)();
@@ -29,7 +29,7 @@ void RemoveLocator() {
   std::filesystem::remove_all(LOCATOR);
 }
 
-/// Puts another file system over the directory of the locator.
+/// Mounts another file system on the directory of the locator.
 void CoverDirectory(unsigned long flags, const char* options) {
   EXPECT_EQ(0, mount("cover", "/tmp", "tmpfs", flags, options));
 }
@@ -68,14 +68,14 @@ const std::vector<Obstacle> OBSTACLES{
      UncoverDirectory, ""},
 };
 
-/// gtest would print the bytes.
+/// Without this function gtest prints the bytes of the object.
 void PrintTo(const Obstacle& obstacle, std::ostream* stream) {
   *stream << obstacle.name;
 }
 
 class LocatorOutage : public SystemTest, public ::testing::WithParamInterface<Obstacle> {};
 
-TEST_P(LocatorOutage, IsSilentAndCostsNothingElse) {
+TEST_P(LocatorOutage, IsNotLoggedAndAffectsNothingElse) {
   appliance.Start();
   const Volume a("A", "150g");
   const Volume b("B", "1g");

@@ -16,9 +16,9 @@ const LogLine CREATING =
 const LogLine READING =
     Plain("src/zophotodbmerger/NotificationListener:137: Calling ReadMessage()");
 
-/// The life of a volume from its plug to its unplug, and the daemon's end: every line that goes
-/// to the system log and to standard output.
-TEST_F(SystemTest, TheWholeLogOfAShortLife) {
+/// All lines of the system log and of standard output, from the plugging of a volume to its
+/// unplugging and the end of the daemon.
+TEST_F(SystemTest, TheCompleteLogOfAShortRun) {
   Volume a("A", "150g");
   Catalog(a).AddPhoto("a.jpg", 1000, 2000);
   const LogLine plugged = PluggedLine(a);
@@ -96,7 +96,7 @@ TEST_F(SystemTest, EachMergerNamesTheRegisteredVolumes) {
   appliance.Handle(Plugged(a.Path()));
   appliance.Handle(Plugged(b.Path()));
   appliance.Handle(Scanned(a.Path()));
-  // The order of the registry: elected while it held A and the shares root; B came behind.
+  // The order of registration: A and the shares root before the election, B after it.
   const Log expected{Info("Iterating over mount point /shares/A/\n"),
                      Info("Iterating over mount point /shares\n"),
                      Info("Iterating over mount point /shares/B/\n")};
@@ -126,8 +126,8 @@ TEST_F(SystemTest, TheTimesOfAMergeAreInSecondsWithThreeDigits) {
             }));
 }
 
-/// Nobody needs to read what the daemon prints.
-TEST_F(SystemTest, AFullStandardOutputCostsOnlyTheLines) {
+/// The daemon does not depend on its standard output.
+TEST_F(SystemTest, AFullStandardOutputLosesOnlyItsLines) {
   appliance.StartWithOutput("/dev/full");
   const Volume a("A", "150g");
   Catalog(a).AddPhoto("a.jpg", 1000, 2000);

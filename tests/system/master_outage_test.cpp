@@ -31,13 +31,13 @@ constexpr double PAGE = 4096;
 
 const std::string IGNORED = "Error that we will ignore ";
 
-/// A line with the places in the sources that it names made out as PLACE.
+/// The line with the source files and lines that it names replaced by PLACE.
 LogLine MaskPlaces(const LogLine& line) {
   static const std::regex PLACE(R"((\.\./)*src/[A-Za-z/]+\.cpp:\d+)");
   return {line.priority, std::regex_replace(line.text, PLACE, "PLACE")};
 }
 
-/// The error lines among those of a log, without the places they name.
+/// The error lines of a log, with masked places.
 Lines Errors(const Log& log) {
   Lines errors;
   for (const LogLine& line : log) {
@@ -48,7 +48,7 @@ Lines Errors(const Log& log) {
   return errors;
 }
 
-/// Has the daemon handle `message`, and takes the places in the sources out of what it logs.
+/// Lets the daemon handle `message`. Returns the log with masked places.
 Log HandleMasked(Appliance& appliance, const std::string& message) {
   Log log;
   for (const LogLine& line : appliance.Handle(message)) {
@@ -57,11 +57,11 @@ Log HandleMasked(Appliance& appliance, const std::string& message) {
   return log;
 }
 
-/// Has the daemon handle `message` on a volume that is full, and then has a page more of room each
-/// time, until no error is logged. `check` is called with the log of each failure. Returns their
-/// number.
-int CountFailuresUntilThereIsRoom(Appliance& appliance, Volume& volume, const std::string& message,
-                                  const std::function<void(const Log&)>& check) {
+/// Lets the daemon handle `message` again and again until it logs no error: at first the volume is
+/// full, and each time it gets another page of space. Calls `check` with the log of each failure.
+/// Returns the number of failures.
+int CountFailuresUntilThereIsSpace(Appliance& appliance, Volume& volume, const std::string& message,
+                                   const std::function<void(const Log&)>& check) {
   const double used = volume.Used();
   int pages = 0;
   for (; !::testing::Test::HasFailure(); ++pages) {
@@ -77,12 +77,12 @@ int CountFailuresUntilThereIsRoom(Appliance& appliance, Volume& volume, const st
   return pages;
 }
 
-/// What SQLite says of a statement, as the database layer passes it on.
-std::string Refusal(const std::string& reason, const std::string& sql) {
+/// The text of an SQLite error, as the database layer throws it.
+std::string SqliteError(const std::string& reason, const std::string& sql) {
   return "PLACE: " + reason + " in \"" + sql + "\"";
 }
 
-/// The master A, on which A and B are merged, and something new on B. Then the master fails.
+/// Volumes A and B are merged into the master A, and B has new photos. Then the master fails.
 class MasterOutage : public SystemTest {
 protected:
   void SetUp() override {
@@ -110,21 +110,21 @@ protected:
     return merged.Content();
   }
 
-  /// What goes before the merge of B.
+  /// The lines before the merge of B.
   Log Announcement() const {
     return BatchLines() +
            Log{Info("MasterVolumeScannedState:: handlePictureTranscoded, doing merge for "
                     "mountPoint /shares/B/ using master volume at /shares/A/")};
   }
 
-  /// The lines of a merge that fails behind its `count` first ones.
+  /// The lines of a merge that fails after its first `count` lines.
   static Log BeginOfMerge(std::size_t count, int photos = 300) {
     Log lines = MergeLines("/shares/B/", 3, photos);
     lines.resize(count);
     return lines;
   }
 
-  /// A failed merge logs nothing but what it has come to, and its errors.
+  /// A failed merge logs only the steps that it has completed, and its errors.
   void ExpectBeginOfMerge(Log log, int photos) const {
     std::erase_if(log, [](const LogLine& line) { return line.priority == Error("").priority; });
     ASSERT_GE(log.size(), Announcement().size());
@@ -135,8 +135,8 @@ protected:
     return "|" + std::to_string(photos) + "|" + std::to_string(photos);
   }
 
-  /// Nothing was lost, nothing was left, and the next merge brings everything.
-  void ExpectMendedByTheNextMerge() {
+  /// The next merge merges everything, and leaves no other file.
+  void ExpectRepairedByTheNextMerge() {
     EXPECT_EQ(Announcement() + MergeLines("/shares/B/", 3, 300),
               appliance.Handle(TranscodedBatch(b.Path())));
     ExpectMerged();
@@ -164,26 +164,27 @@ const std::string READ_ONLY = "attempt to write a readonly database (extended co
 
 /// The error lines of a merge of B that fails in one of its statements.
 Lines FailedIn(const std::string& reason, const std::string& sql) {
-  return {IGNORED + Refusal(reason, sql) + "\n"};
+  return {IGNORED + SqliteError(reason, sql) + "\n"};
 }
 
-/// The statements of a merge that writes, in their order, with the error lines of each when the
-/// disk is full.
+/// The error lines when the disk is full, for each statement of a merge that writes, in their
+/// order.
 std::vector<Lines> FullDiskErrors() {
   const std::string update = "UPDATE Statistics SET photos_xcoded = ?, photos_total = ?, "
                              "last_updated_time = ? where volume = ?";
-  return {FailedIn(FULL, "INSERT INTO Folders(parent_folder_id, name, modified_date, volume) "
-                         "VALUES(?, ?, ?, ?)"),
-          FailedIn(FULL, "INSERT INTO Files(folder_id, name, modified_date, volume, created_date) "
-                         "VALUES(?, ?, ?, ?, ?)"),
-          FailedIn(FULL, "UPDATE Status SET mc_version = ?, mdate = ?, desc = ?, etype = ? WHERE "
-                         "id = 1"),
-          {"Could not update stats for /shares/B/. Return code 13",
-           IGNORED + "PLACE: not committed after a failed step: " + Refusal(FULL, update) + "\n"},
-          FailedIn(FULL, "COMMIT")};
+  return {
+      FailedIn(FULL, "INSERT INTO Folders(parent_folder_id, name, modified_date, volume) "
+                     "VALUES(?, ?, ?, ?)"),
+      FailedIn(FULL, "INSERT INTO Files(folder_id, name, modified_date, volume, created_date) "
+                     "VALUES(?, ?, ?, ?, ?)"),
+      FailedIn(FULL, "UPDATE Status SET mc_version = ?, mdate = ?, desc = ?, etype = ? WHERE "
+                     "id = 1"),
+      {"Could not update stats for /shares/B/. Return code 13",
+       IGNORED + "PLACE: not committed after a failed step: " + SqliteError(FULL, update) + "\n"},
+      FailedIn(FULL, "COMMIT")};
 }
 
-TEST_F(MasterOutage, AFullDiskFailsTheMergeUntilThereIsRoom) {
+TEST_F(MasterOutage, AFullDiskFailsTheMergeUntilThereIsSpace) {
   const int photos = TestScale(300, 5'000);
   onB.AddPhotos("New/", photos - 300, 2000, 300);
   const std::vector<Lines> possible = FullDiskErrors();
@@ -195,9 +196,9 @@ TEST_F(MasterOutage, AFullDiskFailsTheMergeUntilThereIsRoom) {
     ++failures[static_cast<std::size_t>(found - possible.begin())];
     ExpectBeginOfMerge(log, photos);
     EXPECT_EQ(before, Content());
-    EXPECT_EQ(used, a.Used()) << "something was left behind";
+    EXPECT_EQ(used, a.Used()) << "a failed merge has left something";
   };
-  const int pages = CountFailuresUntilThereIsRoom(appliance, a, TranscodedBatch(b.Path()), check);
+  const int pages = CountFailuresUntilThereIsSpace(appliance, a, TranscodedBatch(b.Path()), check);
   ExpectMerged(photos);
   EXPECT_THAT(failures, ElementsAre(Gt(0), Gt(0), ::testing::_, ::testing::_, Gt(0)));
   ReportFigure("merges that failed on a full disk, each with a page more than the last",
@@ -217,13 +218,13 @@ TEST_F(MasterOutage, AFullDiskFailsTheFirstMergeOfAVolume) {
   EXPECT_EQ(used, a.Used());
 
   a.Resize(1e9);
-  ExpectMendedByTheNextMerge();
+  ExpectRepairedByTheNextMerge();
   EXPECT_THAT(Errors(appliance.Handle(TranscodedBatch(c.Path()))), IsEmpty());
   EXPECT_THAT(MergedDatabase(a.Path()).Files(), Contains("/shares/C/c.jpg|1000|1000|/shares/C/"));
 }
 
-/// Removals are no transaction: one that fails may have set the volume back to be merged whole.
-TEST_F(MasterOutage, AFullDiskFailsTheRemovalUntilThereIsRoom) {
+/// A removal is not one transaction: if it fails, the time of the volume may already be reset.
+TEST_F(MasterOutage, AFullDiskFailsTheRemovalUntilThereIsSpace) {
   const double used = a.Used();
   const auto check = [&](const Log& log) {
     EXPECT_THAT(Errors(log), ElementsAre(AllOf(StartsWith("MessageProcessor:: PLACE: " + FULL),
@@ -232,9 +233,9 @@ TEST_F(MasterOutage, AFullDiskFailsTheRemovalUntilThereIsRoom) {
     EXPECT_THAT(merged.Faults(), IsEmpty());
     EXPECT_THAT(merged.Files(), SizeIs(200));
     EXPECT_THAT(merged.Statistics().at(1), StartsWith("/shares/B/" + Counts(100)));
-    EXPECT_EQ(used, a.Used()) << "something was left behind";
+    EXPECT_EQ(used, a.Used()) << "a failed merge has left something";
   };
-  EXPECT_GT(CountFailuresUntilThereIsRoom(appliance, a, Unplugged(b.Path()), check), 1);
+  EXPECT_GT(CountFailuresUntilThereIsSpace(appliance, a, Unplugged(b.Path()), check), 1);
   EXPECT_THAT(MergedDatabase(a.Path()).Files(), SizeIs(100));
   a.Resize(1e9);
   appliance.Handle(Plugged(b.Path()));
@@ -242,7 +243,7 @@ TEST_F(MasterOutage, AFullDiskFailsTheRemovalUntilThereIsRoom) {
   ExpectMerged();
 }
 
-TEST_F(MasterOutage, AFullDiskFailsTheReMergeUntilThereIsRoom) {
+TEST_F(MasterOutage, AFullDiskFailsTheReMergeUntilThereIsSpace) {
   const double used = a.Used();
   const auto check = [&](const Log& log) {
     // Either its removal has failed, or its merge.
@@ -252,9 +253,9 @@ TEST_F(MasterOutage, AFullDiskFailsTheReMergeUntilThereIsRoom) {
     const MergedDatabase merged(a.Path());
     EXPECT_THAT(merged.Faults(), IsEmpty());
     EXPECT_THAT(merged.Files(), AnyOf(SizeIs(200), SizeIs(100)));
-    EXPECT_EQ(used, a.Used()) << "something was left behind";
+    EXPECT_EQ(used, a.Used()) << "a failed merge has left something";
   };
-  EXPECT_GT(CountFailuresUntilThereIsRoom(appliance, a, Purged(b.Path()), check), 1);
+  EXPECT_GT(CountFailuresUntilThereIsSpace(appliance, a, Purged(b.Path()), check), 1);
   ExpectMerged();
 }
 
@@ -270,14 +271,14 @@ TEST_F(MasterOutage, AReadOnlyMasterFailsWhatWouldChangeIt) {
                                   EndsWith(" WHERE volume = ?\""))));
   }
   a.MakeWritable();
-  ExpectMendedByTheNextMerge();
+  ExpectRepairedByTheNextMerge();
 }
 
 /// Another program that uses the merged database while a merge runs.
 class MasterLocked : public MasterOutage, public ::testing::WithParamInterface<const char*> {
 protected:
-  /// Runs a merge of B against the lock, which is let go when the merge has waited for it for half
-  /// a second.
+  /// Runs a merge of B against the lock, which is released after the merge has waited for half a
+  /// second.
   Log HandleLockedForHalfASecond() {
     const MergedDatabase other(a.Path());
     Lock(other);
@@ -295,7 +296,7 @@ protected:
     other.Files();
   }
 
-  /// What a merge says of the lock.
+  /// The line of a merge that fails because of the lock.
   static std::string Line() {
     const std::string locked = IGNORED + "PLACE: " + LOCKED + " in \"";
     return locked + (GetParam() == READ_LOCK ? "COMMIT" : "PRAGMA cache_size = -65536") + "\"\n";
@@ -320,7 +321,7 @@ TEST_P(MasterLocked, ForFiveSecondsFailsFiveMerges) {
     }
     other.Rows().Run("COMMIT");
   }
-  ExpectMendedByTheNextMerge();
+  ExpectRepairedByTheNextMerge();
 }
 
 INSTANTIATE_TEST_SUITE_P(By, MasterLocked,
@@ -329,8 +330,8 @@ INSTANTIATE_TEST_SUITE_P(By, MasterLocked,
                            return tested.param == MasterLocked::READ_LOCK ? "AReader" : "AWriter";
                          });
 
-/// A disk that is full when the database is to be made on it.
-TEST_F(SystemTest, AFullDiskKeepsTheDatabaseFromBeingMadeUntilThereIsRoom) {
+/// A disk that is full when the daemon creates the database there.
+TEST_F(SystemTest, AFullDiskKeepsTheDatabaseFromBeingMadeUntilThereIsSpace) {
   appliance.Start();
   Volume a("A", "150g");
   Catalog(a).AddPhoto("a.jpg", 1000, 2000);
@@ -340,7 +341,7 @@ TEST_F(SystemTest, AFullDiskKeepsTheDatabaseFromBeingMadeUntilThereIsRoom) {
     EXPECT_EQ(SHARES_LOCATOR, Appliance::Locator());
     EXPECT_FALSE(HasMergedDatabase(a.Path()));
   };
-  EXPECT_GT(CountFailuresUntilThereIsRoom(appliance, a, Scanned(a.Path()), check), 5);
+  EXPECT_GT(CountFailuresUntilThereIsSpace(appliance, a, Scanned(a.Path()), check), 5);
   EXPECT_EQ("zophotos_db_path=/shares/A//.zophotos/zophotos.db\n", Appliance::Locator());
   a.Resize(1e9);
   EXPECT_THAT(Errors(appliance.Handle(TranscodedBatch(a.Path()))), IsEmpty());

@@ -11,13 +11,13 @@ namespace {
 using ::testing::ElementsAre;
 using ::testing::IsEmpty;
 
-/// What is written to standard output for a file that is added.
+/// The lines on standard output for a file that is added.
 Lines Added(const std::string& path, const std::string& mountPoint) {
   return {"Processing file " + path + " isdeleted=0 status = 3",
           "Adding file " + path + " for mount " + mountPoint};
 }
 
-/// A daemon in the scanned state, with volume A as the master and its catalog at hand.
+/// A daemon in the scanned state, with volume A as the master, and with its catalog.
 class Merge : public SystemTest {
 protected:
   void SetUp() override {
@@ -32,7 +32,7 @@ protected:
     catalog.AddPhoto("top.jpg", 1000, 2000);
   }
 
-  /// The lines of a merge of A behind what announces it.
+  /// The lines of a merge of A after those that announce it.
   static Log Announced(const Log& announcement, const std::string& work, int folders, int files) {
     return announcement +
            Log{Info("MasterVolumeScannedState:: " + work +
@@ -44,7 +44,7 @@ protected:
     return Announced(BatchLines(), "handlePictureTranscoded", folders, files);
   }
 
-  /// The first merge of what SetUp has put into the catalog.
+  /// Merges the content that SetUp has put into the catalog.
   void MergeFirst() {
     ASSERT_EQ(BatchMerged(3, 3), appliance.Handle(TranscodedBatch(a.Path())));
     appliance.TakeOutput();
@@ -60,7 +60,7 @@ protected:
                        "/shares/A/top.jpg|1000|1000|/shares/A/"};
 };
 
-TEST_F(Merge, TheFirstBringsInTheWholeVolumeInPathOrder) {
+TEST_F(Merge, TheFirstAddsTheWholeVolumeInPathOrder) {
   EXPECT_EQ(BatchMerged(3, 3), appliance.Handle(TranscodedBatch(a.Path())));
 
   Lines output = Added("/shares/A/Pictures/Summer/a.jpg", "/shares/A/");
@@ -88,7 +88,7 @@ TEST_F(Merge, AnEndMergesLikeABatch) {
   EXPECT_EQ(allFiles, MergedDatabase(a.Path()).Files());
 }
 
-TEST_F(Merge, AnIncrementalReadsOnlyWhatIsNewer) {
+TEST_F(Merge, AnIncrementalMergeReadsOnlyNewerChanges) {
   MergeFirst();
   catalog.AddFolder("New/", 700);
   catalog.AddPhoto("New/c.jpg", 1003, 2003);
@@ -116,7 +116,7 @@ TEST_F(Merge, AnUnchangedVolumeOnlyRefreshesItsCounts) {
 
 TEST_F(Merge, APurgeReadsTheWholeVolumeAgain) {
   MergeFirst();
-  // What the indexer forgot altogether leaves no trace for an incremental merge.
+  // An incremental merge cannot see rows that the indexer has removed.
   catalog.Rows().Run("DELETE FROM Files WHERE name = 'b.jpg'");
   catalog.Rows().Run("DELETE FROM Folders WHERE path = 'Pictures/Summer/'");
   EXPECT_EQ(Announced({Info(":: Purged ")}, "handleVolumePurged", 2, 2),
@@ -124,7 +124,7 @@ TEST_F(Merge, APurgeReadsTheWholeVolumeAgain) {
 
   const MergedDatabase merged(a.Path());
   EXPECT_THAT(merged.Folders(), ElementsAre(allFolders[0], allFolders[1], allFolders[2]));
-  EXPECT_THAT(merged.Files(), ElementsAre(allFiles[2])); // a.jpg has lost its folder
+  EXPECT_THAT(merged.Files(), ElementsAre(allFiles[2])); // the folder of a.jpg is gone
   EXPECT_THAT(merged.Statistics(), ElementsAre("/shares/A/|2|2|2002"));
 }
 
@@ -169,7 +169,7 @@ TEST_F(Merge, ADeletedFolderIsRemovedWithItsOwnFiles) {
   EXPECT_THAT(merged.Files(), ElementsAre(allFiles[1], allFiles[2]));
 }
 
-TEST_F(Merge, ADeletedFolderThatIsUnknownIsOnlyNamed) {
+TEST_F(Merge, AnUnknownDeletedFolderOnlyWritesItsLine) {
   catalog.DeleteFolder("Pictures/Summer/");
   catalog.DeletePhoto("Pictures/Summer/a.jpg", 1);
   EXPECT_EQ(BatchMerged(3, 3), appliance.Handle(TranscodedBatch(a.Path())));
@@ -193,7 +193,7 @@ TEST_F(Merge, HiddenAndBackupFilesAreMergedAndSystemFilesAreNot) {
   EXPECT_THAT(merged.Files(),
               ElementsAre(allFiles[0], allFiles[1], "/shares/A/Pictures/backup.jpg|1|1|/shares/A/",
                           "/shares/A/Pictures/hidden.jpg|2|2|/shares/A/", allFiles[2]));
-  // Neither counts as a photo, and the system file does not move the time.
+  // Neither counts as a photo, and the system file does not change the time.
   EXPECT_THAT(merged.Statistics(), ElementsAre("/shares/A/|3|3|3002"));
 }
 
@@ -205,7 +205,7 @@ TEST_F(Merge, ASystemFileIsReadAgainByTheNextMerge) {
   EXPECT_THAT(MergedDatabase(a.Path()).Statistics(), ElementsAre("/shares/A/|3|3|2002"));
 }
 
-TEST_F(Merge, HiddenBackupAndSystemFoldersStayOutWithWhatTheyHold) {
+TEST_F(Merge, HiddenBackupAndSystemFoldersAreNotMergedNorTheirContent) {
   catalog.AddFolder("Hidden/", 1, {.hidden = true});
   catalog.AddFolder("Backup/", 1, {.backup = true});
   catalog.AddFolder("System/", 1, {.system = true});
@@ -217,7 +217,7 @@ TEST_F(Merge, HiddenBackupAndSystemFoldersStayOutWithWhatTheyHold) {
   EXPECT_EQ(allFiles, merged.Files());
 }
 
-TEST_F(Merge, FilesWithoutAFinishedTranscodingOfTheProfileStayOut) {
+TEST_F(Merge, FilesWithoutAFinishedTranscodingOfTheProfileAreNotMerged) {
   catalog.AddPhoto("unfinished.jpg", 1, 3000);
   catalog.Rows().Run("UPDATE Transcodings SET status = 2 WHERE lastUpdatedDate = 3000");
   catalog.AddPhoto("other.jpg", 1, 3001);
@@ -226,7 +226,7 @@ TEST_F(Merge, FilesWithoutAFinishedTranscodingOfTheProfileStayOut) {
   EXPECT_EQ(allFiles, MergedDatabase(a.Path()).Files());
 }
 
-TEST_F(Merge, TheCountsTellRenderedPhotosAndAllPhotosApart) {
+TEST_F(Merge, TheCountsAreThoseOfRenderedPhotosAndOfAllPhotos) {
   catalog.AddPhoto("later.jpg", 1, 3000);
   catalog.Rows().Run("UPDATE Files SET status = 1 WHERE name = 'later.jpg'");
   catalog.AddPhoto("film.mov", 1, 3001);
@@ -268,8 +268,8 @@ TEST_F(Merge, SeveralVolumesShareTheMastersDatabase) {
   EXPECT_FALSE(HasMergedDatabase(b.Path()));
 }
 
-/// There is no folder /shares/Disks/ that its own could be in.
-TEST_F(Merge, AVolumeThatIsNotRightBelowTheSharesRootHasOnlyStatistics) {
+/// There is no parent folder /shares/Disks/ for the folder of the volume.
+TEST_F(Merge, AVolumeThatIsNotDirectlyBelowTheSharesRootHasOnlyStatistics) {
   MergeFirst();
   std::filesystem::create_directory("/shares/Disks");
   const Volume b("Disks/B", "1g");
@@ -283,7 +283,7 @@ TEST_F(Merge, AVolumeThatIsNotRightBelowTheSharesRootHasOnlyStatistics) {
   EXPECT_THAT(merged.Statistics(), ElementsAre("/shares/A/|3|3|2002", "/shares/Disks/B/|1|1|50"));
 }
 
-/// There is the folder of the volume that it is mounted on.
+/// The parent folder is on the volume that contains the mount point.
 TEST_F(Merge, AVolumeInsideAnotherIsMergedBelowIt) {
   MergeFirst();
   const Volume b("A/B", "1g");
@@ -319,7 +319,7 @@ TEST_F(Merge, AVolumeWithoutACatalogChangesNothing) {
   EXPECT_THAT(merged.Statistics(), ElementsAre("/shares/A/|3|3|2002"));
 }
 
-TEST_F(Merge, AFailureHalfWayKeepsNothingOfTheMerge) {
+TEST_F(Merge, AFailureInTheMiddleKeepsNothingOfTheMerge) {
   MergeFirst();
   catalog.AddFolder("New/", 700);
   catalog.AddPhoto("New/a.jpg", 1003, 2003);

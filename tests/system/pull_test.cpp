@@ -22,7 +22,7 @@ using ::testing::IsEmpty;
 using ::testing::SizeIs;
 using ::testing::StartsWith;
 
-/// How many instants of a merge go by from one at which a volume is pulled to the next.
+/// The distance between two instants of a merge at which a volume is pulled.
 const int STRIDE = TestScale(6, 1);
 
 Lines Errors(const Log& log) {
@@ -38,8 +38,8 @@ Lines Errors(const Log& log) {
 /// A daemon whose volumes are pulled while it merges.
 class Pull : public ::testing::Test {
 protected:
-  /// Runs a merge of B. Before its effect number `instant` on files or the log, `pull` is called;
-  /// false when there were fewer.
+  /// Runs a merge of B. Calls `pull` before its effect number `instant` on files or the log; false
+  /// when there are fewer effects.
   static bool MergeAndPull(Appliance& appliance, int instant, const std::function<void()>& pull) {
     {
       Tracer tracer(appliance.Daemon().Pid());
@@ -76,7 +76,7 @@ protected:
   }
 };
 
-TEST_F(Pull, OfTheMergedVolumeCostsAtMostItsMerge) {
+TEST_F(Pull, OfTheMergedVolumeLosesAtMostItsMerge) {
   Appliance appliance;
   appliance.Start();
   const Volume a("A", "150g");
@@ -115,7 +115,7 @@ TEST_F(Pull, OfTheMergedVolumeCostsAtMostItsMerge) {
                std::to_string(merged + failed - 1));
 }
 
-/// Shows a volume in a second place, where it stays when it is pulled.
+/// A second mount of a volume, which stays when the volume is pulled.
 class Kept {
 public:
   explicit Kept(const Volume& volume) {
@@ -126,7 +126,7 @@ public:
   Kept& operator=(const Kept&) = delete;
   ~Kept() { umount2(PATH, MNT_DETACH); }
 
-  /// Mounts the volume where it was before.
+  /// Mounts the volume at its old mount point.
   static void Return(const std::string& path) {
     mkdir(path.c_str(), 0755);
     mount(PATH, path.c_str(), nullptr, MS_BIND, nullptr);
@@ -135,7 +135,7 @@ public:
   static constexpr const char* PATH = "/tmp/kept";
 };
 
-/// Brings the volumes up with A as the master.
+/// Starts the daemon and plugs both volumes, with A as the master.
 void Begin(Appliance& appliance) {
   appliance.Start();
   for (const char* const message : {"/shares/A", "/shares/B"}) {
@@ -147,8 +147,8 @@ void Begin(Appliance& appliance) {
 
 class PullOfTheMaster : public Pull {
 protected:
-  /// Pulls A at an instant of the merge of B and follows what becomes of its database; false when
-  /// the merge had fewer instants.
+  /// Pulls A at an instant of the merge of B and checks its database afterwards; false when the
+  /// merge had fewer instants.
   bool PullAt(int instant) {
     for (const char* const place : {"/shares/.zophotos", "/tmp/daemon"}) {
       std::filesystem::remove_all(place);
@@ -178,8 +178,8 @@ protected:
   }
 
 private:
-  /// A merge into a volume that is gone cannot end well: what it has begun is taken back by the
-  /// next one who opens the database.
+  /// A merge into a volume that is gone fails: the next program that opens the database rolls it
+  /// back.
   void ExpectAllOrNothing(const Lines& errors, bool pulled) {
     const MergedDatabase merged(Kept::PATH);
     EXPECT_THAT(merged.Faults(), IsEmpty());
@@ -199,7 +199,7 @@ private:
     EXPECT_THAT(MergedDatabase("/shares").Files(), SizeIs(1000));
   }
 
-  /// The volume comes back to a new daemon, as the master that it was.
+  /// The volume is plugged again, and is the master of a new daemon.
   static void ExpectReturn() {
     Appliance appliance;
     Begin(appliance);
@@ -214,10 +214,10 @@ private:
   }
 
 protected:
-  int failures = 0; ///< merges that have told that they failed
+  int failures = 0; ///< merges that have logged their failure
 };
 
-TEST_F(PullOfTheMaster, LosesNothingThatItHeld) {
+TEST_F(PullOfTheMaster, LosesNothingFromItsDatabase) {
   int instant = 0;
   for (bool pulled = true; pulled; instant += pulled ? STRIDE : 0) {
     SCOPED_TRACE("pulled at instant " + std::to_string(instant));

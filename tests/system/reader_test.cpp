@@ -4,15 +4,9 @@
 #include "Messages.h"
 #include "Tracer.h"
 
+#include "support/Program.h"
 #include "support/Programs.h"
 #include "support/TestScale.h"
-
-#include <fcntl.h>
-#include <poll.h>
-#include <spawn.h>
-#include <sys/syscall.h>
-#include <sys/wait.h>
-#include <unistd.h>
 
 #include <algorithm>
 #include <array>
@@ -26,96 +20,52 @@ namespace {
 /// Another program, which reads the rows of B in the merged database on A all the time.
 class Reader {
 public:
-  Reader() {
-    std::array<int, 2> input{};
-    std::array<int, 2> output{};
-    if (pipe2(input.data(), O_CLOEXEC) != 0 || pipe2(output.data(), O_CLOEXEC) != 0) {
-      throw std::runtime_error("pipe2");
-    }
-    posix_spawn_file_actions_t actions;
-    posix_spawn_file_actions_init(&actions);
-    posix_spawn_file_actions_adddup2(&actions, input[0], STDIN_FILENO);
-    posix_spawn_file_actions_adddup2(&actions, output[1], STDOUT_FILENO);
-    std::array<std::string, 3> texts{ProgramPath("merged_reader"), "/shares/A", "/shares/B/"};
-    std::array<char*, 4> arguments{texts[0].data(), texts[1].data(), texts[2].data(), nullptr};
-    const int code = posix_spawn(&pid_, arguments[0], &actions, nullptr, arguments.data(), environ);
-    posix_spawn_file_actions_destroy(&actions);
-    close(input[0]);
-    close(output[1]);
-    input_ = input[1];
-    output_ = output[0];
-    if (code != 0) {
-      throw std::runtime_error(texts[0]);
-    }
-  }
-  Reader(const Reader&) = delete;
-  Reader& operator=(const Reader&) = delete;
-  ~Reader() {
-    Stop();
-    close(output_);
-  }
-
   /// Takes reads until one has seen `sight`. Throws std::runtime_error after the deadline.
   void Await(const std::string& sight) {
     const auto end = std::chrono::steady_clock::now() + DEADLINE;
     while (sights_.empty() || sights_.back() != sight) {
-      if (!TakeSome() || std::chrono::steady_clock::now() > end) {
+      if (!TakeOne() || std::chrono::steady_clock::now() > end) {
         throw std::runtime_error("the reader has not seen " + sight);
       }
     }
   }
 
-  /// Ends the program and takes its last reads. True when it has ended well.
-  bool Stop() {
-    if (pid_ == -1) {
-      return true;
+  /// Ends the program, takes its last reads, and returns its status.
+  int Stop() {
+    program_.CloseInput();
+    while (TakeOne()) {
     }
-    close(input_);
-    while (TakeSome()) {
-    }
-    int status = 0;
-    waitpid(pid_, &status, 0);
-    pid_ = -1;
-    return WIFEXITED(status) && WEXITSTATUS(status) == 0;
+    return program_.WaitForEnd();
   }
 
   /// What the reads saw, in their order.
   const Lines& Sights() const { return sights_; }
-  /// Microseconds that a read has waited at most.
+  /// The longest wait of a read, in microseconds.
   long LongestWait() const { return longestWait_; }
 
 private:
-  bool TakeSome() {
-    pollfd ready{output_, POLLIN, 0};
-    const auto deadline = std::chrono::milliseconds(DEADLINE).count();
-    if (poll(&ready, 1, static_cast<int>(deadline)) != 1) {
+  bool TakeOne() {
+    const std::string line = program_.ReadLine();
+    if (line == "(deadline)") {
       throw std::runtime_error("the reader does not read");
     }
-    std::array<char, 65536> bytes{};
-    const ssize_t size = read(output_, bytes.data(), bytes.size());
-    if (size <= 0) {
+    if (line == "(end)") {
       return false;
     }
-    rest_.append(bytes.data(), static_cast<std::size_t>(size));
-    for (auto end = rest_.find('\n'); end != std::string::npos; end = rest_.find('\n')) {
-      const auto bar = rest_.find('|');
-      longestWait_ = std::max(longestWait_, std::stol(rest_.substr(0, bar)));
-      sights_.push_back(rest_.substr(bar + 1, end - bar - 1));
-      rest_.erase(0, end + 1);
-    }
+    const auto bar = line.find('|');
+    longestWait_ = std::max(longestWait_, std::stol(line.substr(0, bar)));
+    sights_.push_back(line.substr(bar + 1));
     return true;
   }
 
-  pid_t pid_ = -1;
-  int input_ = -1;  ///< owned until Stop
-  int output_ = -1; ///< owned
-  std::string rest_;
+  Program program_{{ProgramPath("merged_reader"), "/shares/A", "/shares/B/"},
+                   {.input = "", .errors = Program::Errors::Inherited}};
   Lines sights_;
   long longestWait_ = 0;
 };
 
-/// Merges of B into A that are watched. B grows by folders of 500 photos, each with a stamp of its
-/// own.
+/// Merges of B into A while other programs read. B grows by folders of 500 photos, each with a
+/// stamp of its own.
 class Readers : public SystemTest {
 protected:
   void SetUp() override {
@@ -138,15 +88,15 @@ protected:
 
   void Merge() { appliance.Handle(TranscodedBatch(b.Path())); }
 
-  /// What a reader sees when all that there is in the catalog has been merged.
+  /// What a reader sees after the merge of the whole catalog.
   std::string Whole() const {
     const std::string photos = std::to_string(folders * PER_FOLDER);
     return photos + "|0|" + std::to_string(folders + 1) + "|" + photos + "|" + photos + "|" +
            std::to_string(folders);
   }
 
-  /// What a reader may see before a re-merge begins to add: the time set back, then no files, then
-  /// no folders either.
+  /// What a reader may see before a re-merge adds rows: first the time is reset, then there are no
+  /// files, then no folders.
   std::set<std::string> SetBack() const {
     const std::string photos = std::to_string(folders * PER_FOLDER);
     const std::string rest = std::to_string(folders + 1) + "|" + photos + "|" + photos + "|0";
@@ -160,7 +110,7 @@ protected:
   int folders = 0;
 };
 
-TEST_F(Readers, SeeOnlyWhatWasCommitted) {
+TEST_F(Readers, SeeOnlyCommittedData) {
   Grow(TestScale(10'000, 50'000));
   Merge();
   std::set<std::string> committed{Whole()};
@@ -181,7 +131,7 @@ TEST_F(Readers, SeeOnlyWhatWasCommitted) {
   }
   std::size_t reads = 0;
   for (Reader& reader : readers) {
-    EXPECT_TRUE(reader.Stop());
+    EXPECT_EQ(Exited(0), reader.Stop());
     for (const std::string& sight : reader.Sights()) {
       ASSERT_TRUE(committed.contains(sight)) << sight;
     }
@@ -191,7 +141,7 @@ TEST_F(Readers, SeeOnlyWhatWasCommitted) {
                std::to_string(reads));
 }
 
-/// The daemon is held before each of its effects, and somebody reads who does not wait.
+/// The daemon is held before each of its effects, and a reader reads without waiting for locks.
 TEST_F(Readers, WaitOnlyForTheCommit) {
   Grow(1000);
   Merge();
@@ -209,7 +159,7 @@ TEST_F(Readers, WaitOnlyForTheCommit) {
     }
   };
 
-  // What is read, with the number of effects at which it is, one behind the other.
+  // The results of the reads in their order, each with the number of effects it lasted.
   std::vector<std::pair<std::string, int>> phases;
   int added = 0;
   int readsBetweenAdds = 0;
@@ -246,7 +196,7 @@ TEST_F(Readers, WaitOnlyForTheCommit) {
   EXPECT_EQ(Whole(), phases[2].first);
 }
 
-TEST_F(Readers, TellHowLongTheyWaited) {
+TEST_F(Readers, ReportTheirLongestWait) {
   Grow(1'000);
   for (const int photos : {1'000, 50'000}) {
     long longest = 0;
@@ -258,7 +208,7 @@ TEST_F(Readers, TellHowLongTheyWaited) {
       reader.Await(before);
       Merge();
       reader.Await(Whole());
-      EXPECT_TRUE(reader.Stop());
+      EXPECT_EQ(Exited(0), reader.Stop());
       longest = std::max(longest, reader.LongestWait());
     }
     ReportFigure("longest wait of a reader in merges of " + std::to_string(photos) +

@@ -34,11 +34,11 @@ const Log REFUSED = {
     Info("src/zophotodbmerger/NotificationListener:154: NotificationListener exiting."),
     Info("Returning from the wait")};
 
-/// A daemon that tells how often the XML platform was terminated.
+/// A daemon that reports how often it terminates the XML platform.
 class StartUp : public SystemTest {
 protected:
-  DaemonProcess::End RunProbed() {
-    // The sanitizer's runtime otherwise insists on being the first library.
+  int RunProbed() {
+    // The address sanitizer's runtime otherwise requires to be the first library.
     std::string asan = "ASAN_OPTIONS=verify_asan_link_order=0";
     if (const char* options = std::getenv("ASAN_OPTIONS")) {
       asan += std::string(":") + options;
@@ -61,7 +61,7 @@ protected:
   }
 };
 
-TEST_F(StartUp, WithoutAServiceTheDaemonSaysSoAndEndsWell) {
+TEST_F(StartUp, WithoutAServiceTheDaemonLogsItAndExitsWithStatusZero) {
   appliance.Service().Stop();
   EXPECT_EQ(Exited(0), RunProbed());
   EXPECT_EQ(REFUSED, appliance.TakeLog());
@@ -126,7 +126,7 @@ TEST_F(StartUp, EmptiesTheDatabaseOfAnEarlierRun) {
               ElementsAre("1.7|kept|1"));
 }
 
-TEST_F(StartUp, WithoutTheSharesRootTheDatabaseIsAScratchOne) {
+TEST_F(StartUp, WithoutTheSharesRootTheDatabaseIsInTheWorkingDirectory) {
   fs::remove("/shares");
   appliance.Start();
   EXPECT_EQ(Log{Error("There is no filesystem location for the mountpoint /shares")} + CONNECTED,
@@ -136,16 +136,16 @@ TEST_F(StartUp, WithoutTheSharesRootTheDatabaseIsAScratchOne) {
   EXPECT_FALSE(fs::exists("/shares"));
 }
 
-TEST_F(StartUp, AnUnwritableSharesRootEndsItWithStatusOne) {
+TEST_F(StartUp, WithAReadOnlySharesRootTheDaemonExitsWithStatusOne) {
   ASSERT_EQ(0, mount("shares", "/shares", "tmpfs", MS_RDONLY, "size=1m"));
   EXPECT_EQ(Exited(1), RunProbed());
   EXPECT_THAT(appliance.TakeLog(), IsEmpty());
-  // The platform stays up on this way out.
+  // This exit does not terminate the platform.
   EXPECT_EQ(0, Terminations());
   EXPECT_EQ("(absent)", Appliance::Locator());
 }
 
-TEST_F(StartUp, AnUnusableLocationTerminatesTheXmlPlatformAndEndsItAbnormally) {
+TEST_F(StartUp, AnUnusableLocationTerminatesTheXmlPlatformAndAbortsTheDaemon) {
   MakeFile("/shares/.zophotos", "no directory");
   EXPECT_EQ(Killed(SIGABRT), RunProbed());
   EXPECT_EQ(1, Terminations());
@@ -161,7 +161,7 @@ TEST_F(StartUp, ALinkForTheDatabaseDirectoryIsAnUnusableLocation) {
   EXPECT_TRUE(fs::is_empty("/tmp/elsewhere"));
 }
 
-TEST_F(StartUp, ABrokenDatabaseTerminatesTheXmlPlatformAndEndsItAbnormally) {
+TEST_F(StartUp, ABrokenDatabaseTerminatesTheXmlPlatformAndAbortsTheDaemon) {
   ASSERT_EQ(0, mkdir("/shares/.zophotos", 0777));
   MakeFile("/shares/.zophotos/zophotos.db", std::string(4096, 'x'));
   EXPECT_EQ(Killed(SIGABRT), RunProbed());
@@ -187,13 +187,13 @@ TEST_F(StartUp, ALinkForTheLocatorIsNotFollowed) {
   EXPECT_EQ("precious", content);
 }
 
-TEST_F(StartUp, APipeForTheLocatorDoesNotBlockIt) {
+TEST_F(StartUp, APipeForTheLocatorDoesNotBlockTheDaemon) {
   ASSERT_EQ(0, mkfifo("/tmp/zophotodbmerger.conf", 0666));
   appliance.Start();
   EXPECT_EQ(CONNECTED, appliance.TakeLog());
 }
 
-TEST_F(StartUp, TheLocatorOfAnEarlierRunIsReplacedWhole) {
+TEST_F(StartUp, TheLocatorOfAnEarlierRunIsReplacedCompletely) {
   MakeFile("/tmp/zophotodbmerger.conf", std::string(4096, 'x'));
   appliance.Start();
   EXPECT_EQ(SHARES_LOCATOR, Appliance::Locator());

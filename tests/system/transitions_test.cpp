@@ -42,14 +42,13 @@ protected:
     appliance.TakeLog();
   }
 
-  /// Starts without the shares root, which then does not stand for election. Volumes bring it
-  /// into being.
+  /// Starts without the shares root, which then is no candidate. The first volume creates it.
   void StartWithoutShares() {
     fs::remove("/shares");
     StartUp();
   }
 
-  /// Handles a message of which only the effect matters.
+  /// Handles a message, and drops its log and output.
   void After(const std::string& message) {
     appliance.Handle(message);
     appliance.TakeOutput();
@@ -64,7 +63,7 @@ TEST_F(Transitions, DefaultPluggedWithAMasterGoesToPlugged) {
   EXPECT_EQ((Log{PluggedLine(a), Info("Default:: VolumePlugged "), Master(MasterText(a))}),
             appliance.Handle(Plugged(a.Path())));
   EXPECT_THAT(appliance.TakeOutput(), ElementsAre(TO_PLUGGED));
-  // The plugged state only waits: the database comes with the scan.
+  // The plugged state only waits: the scan creates the database.
   EXPECT_EQ(SHARES_LOCATOR, Appliance::Locator());
   EXPECT_FALSE(HasMergedDatabase(a.Path()));
 }
@@ -113,7 +112,7 @@ TEST_F(Transitions, DefaultUnpluggedStays) {
 TEST_F(Transitions, DefaultScannedWithAMasterGoesToScanned) {
   StartUp();
   const Volume a("A", "150g");
-  // A volume that nobody plugged is registered without its size: the shares root is elected.
+  // A volume is registered without its size before its plugging: the shares root is elected.
   EXPECT_EQ((Log{Info(":: Scanned"), Info("Default:: Volume Scanned "), MOVING,
                  Master(SHARES_MASTER_TEXT)}),
             appliance.Handle(Scanned(a.Path())));
@@ -240,7 +239,7 @@ TEST_F(Transitions, PluggedUnpluggedOfTheLastCandidateFallsBackToDefault) {
   EXPECT_EQ(LocatorOn("/shares"), Appliance::Locator());
 }
 
-TEST_F(Transitions, PluggedFallbackWithoutTheSharesRootUsesAScratchDatabase) {
+TEST_F(Transitions, PluggedFallbackWithoutTheSharesRootUsesADatabaseInTheWorkingDirectory) {
   StartWithoutShares();
   Volume a("A", "150g");
   After(Plugged(a.Path()));
@@ -303,7 +302,7 @@ TEST_F(Transitions, PluggedPurgedStays) {
   EXPECT_THAT(appliance.TakeOutput(), IsEmpty());
 }
 
-/// A plugged state that has lost its master: the fallback could not be made.
+/// A plugged state without a master: the fallback has failed.
 class PluggedWithoutMaster : public Transitions {
 protected:
   void SetUp() override {
@@ -341,7 +340,7 @@ TEST_F(PluggedWithoutMaster, TranscodedStays) {
   EXPECT_THAT(appliance.TakeOutput(), IsEmpty());
 }
 
-TEST_F(PluggedWithoutMaster, FallsBackAtTheNextUnplugThatCan) {
+TEST_F(PluggedWithoutMaster, FallsBackAtTheNextUnplugging) {
   fs::remove("/shares/.zophotos");
   EXPECT_EQ((Log{Info("MasterVolumePluggedState:: Volumeunplugged "),
                  Info("We do NOT have a master volume so we can go back to the Default State ")}),
@@ -349,7 +348,7 @@ TEST_F(PluggedWithoutMaster, FallsBackAtTheNextUnplugThatCan) {
   EXPECT_THAT(appliance.TakeOutput(), ElementsAre(DEFAULT_GONE, TO_DEFAULT));
 }
 
-// The scanned state; what its merges do is elsewhere.
+// The scanned state; merge_test.cpp tests its merges.
 
 TEST_F(Transitions, ScannedPluggedStays) {
   StartUp();
@@ -385,7 +384,7 @@ TEST_F(Transitions, ScannedUnpluggedOfAnotherVolumeRenewsTheState) {
   EXPECT_EQ(LocatorOn(a.MountPoint()), Appliance::Locator());
 }
 
-TEST_F(Transitions, ScannedUnpluggedOfTheMasterGoesOnWithItsSuccessor) {
+TEST_F(Transitions, ScannedUnpluggedOfTheMasterContinuesWithItsSuccessor) {
   StartUp();
   Volume a("A", "150g");
   const Volume b("B", "120g");

@@ -42,7 +42,7 @@ protected:
   const std::string rowB = "/shares/B/Pictures/b.jpg|1001|1001|/shares/B/";
 };
 
-TEST_F(Unplug, TakesAVolumesRowsAndKeepsItsCounts) {
+TEST_F(Unplug, RemovesAVolumesRowsAndKeepsItsCounts) {
   b.Unmount();
   appliance.Handle(Unplugged(b.Path()));
   const MergedDatabase merged(a.Path());
@@ -63,7 +63,7 @@ TEST_F(Unplug, AVolumeThatComesBackIsMergedFromTheBeginning) {
   EXPECT_THAT(merged.Statistics(), ElementsAre("/shares/A/|1|1|2000", "/shares/B/|1|1|2001"));
 }
 
-TEST_F(Unplug, OfAnUnknownVolumeTakesNothing) {
+TEST_F(Unplug, OfAnUnknownVolumeRemovesNothing) {
   appliance.Handle(Unplugged("/shares/Unknown"));
   const MergedDatabase merged(a.Path());
   EXPECT_THAT(merged.Files(), ElementsAre(rowA, rowB));
@@ -75,12 +75,13 @@ TEST_F(Unplug, OfTheMasterMovesTheDatabaseToItsSuccessor) {
   appliance.Handle(Unplugged(a.Path()));
   EXPECT_EQ("zophotos_db_path=/shares/B//.zophotos/zophotos.db\n", Appliance::Locator());
   {
-    // Nothing is merged again by the move itself.
+    // The move itself merges nothing.
     const MergedDatabase merged(b.Path());
     EXPECT_THAT(merged.Folders(), ElementsAre(ROOT_FOLDER));
     EXPECT_THAT(merged.Files(), IsEmpty());
   }
-  // The removal found no master to remove from: it was made in a scratch database.
+  // There was no master to remove the rows from: the removal went to a database in the working
+  // directory.
   EXPECT_TRUE(HasMergedDatabase(appliance.Daemon().Directory()));
 
   appliance.Handle(TranscodedBatch(b.Path()));
@@ -89,7 +90,7 @@ TEST_F(Unplug, OfTheMasterMovesTheDatabaseToItsSuccessor) {
   EXPECT_THAT(merged.Statistics(), ElementsAre("/shares/B/|1|1|2001"));
 }
 
-TEST_F(Unplug, OfTheMasterKeepsWhatItsSuccessorHeldFromEarlier) {
+TEST_F(Unplug, OfTheMasterKeepsTheEarlierContentOfItsSuccessor) {
   a.Unmount();
   appliance.Handle(Unplugged(a.Path()));
   appliance.Handle(TranscodedBatch(b.Path()));
@@ -114,10 +115,10 @@ TEST_F(Unplug, OfAllVolumesLeavesTheSharesRootAsTheMaster) {
   EXPECT_THAT(MergedDatabase("/shares").Files(), IsEmpty());
 }
 
-TEST_F(Unplug, TakesTheRowsEvenWhileSomebodyReads) {
+TEST_F(Unplug, RemovesTheRowsWhileAnotherProgramReads) {
   const MergedDatabase reader(a.Path());
   reader.Rows().Run("BEGIN");
-  reader.Files(); // holds a read lock that a writer has to wait for
+  reader.Files(); // holds a read lock, which a writer must wait for
   appliance.Service().Send(Unplugged(b.Path()));
   ASSERT_TRUE(appliance.Log().Await(Info("MasterVolumeScannedState:: Volumeunplugged ")));
   reader.Rows().Run("COMMIT");
@@ -125,7 +126,7 @@ TEST_F(Unplug, TakesTheRowsEvenWhileSomebodyReads) {
   EXPECT_THAT(MergedDatabase(a.Path()).Files(), ElementsAre(rowA));
 }
 
-/// A fallback with content: the shares root does not stand for election, and A is alone.
+/// A fallback with content: the shares root is no candidate, and A is the only volume.
 TEST_F(SystemTest, AFallbackEmptiesTheDatabaseUnderTheSharesRoot) {
   ASSERT_EQ(0, rmdir("/shares"));
   appliance.Start();
@@ -135,7 +136,7 @@ TEST_F(SystemTest, AFallbackEmptiesTheDatabaseUnderTheSharesRoot) {
   appliance.Handle(Scanned(a.Path()));
   appliance.Handle(TranscodedBatch(a.Path()));
   ASSERT_EQ(1U, MergedDatabase(a.Path()).Files().size());
-  // Content from long ago under the shares root.
+  // Content of an earlier run under the shares root.
   ASSERT_EQ(0, mkdir("/shares/.zophotos", 0777));
   std::filesystem::copy_file(a.Path() + "/.zophotos/zophotos.db", "/shares/.zophotos/zophotos.db");
   ASSERT_EQ(1U, MergedDatabase("/shares").Files().size());

@@ -749,13 +749,13 @@ TEST_F(OrvaCatalog, TheProgramGeneratesAndRestamps) {
   EXPECT_EQ(made.output, volume_.native() + ": generated 25 photos in 3 folders\n");
   const Outcome stamped = RunProgram("generate " + volume_.native() + " --restamp");
   EXPECT_EQ(stamped.status, 0);
-  EXPECT_EQ(stamped.output, volume_.native() + ": stamped 25 transcodings anew\n");
+  EXPECT_EQ(stamped.output, volume_.native() + ": stamped 25 transcodings again\n");
 }
 
 TEST_F(OrvaCatalog, HelpAndVersionGoToStandardOutput) {
   const auto printed = [](const std::string& arguments) {
     const Outcome outcome =
-        RunShell(std::string(ORVA_CATALOG_PROGRAM) + ' ' + arguments + " 2>/dev/null");
+        RunShell(test::ProgramPath("orva-catalog") + ' ' + arguments + " 2>/dev/null");
     EXPECT_EQ(outcome.status, 0) << arguments;
     return outcome.output;
   };
@@ -770,7 +770,7 @@ TEST_F(OrvaCatalog, HelpAndVersionGoToStandardOutput) {
                                  "--names", "--tree", "--restamp"}) {
     EXPECT_NE(generate.find(part), std::string::npos) << part;
   }
-  EXPECT_EQ(printed("--version"), "orva-catalog " ORVA_CATALOG_VERSION "\n");
+  EXPECT_EQ(printed("--version"), "orva-catalog " PROGRAM_VERSION "\n");
 }
 
 TEST_F(OrvaCatalog, TheExitStatusDistinguishesWrongUsageFromFailure) {

@@ -378,7 +378,7 @@ TEST_F(OrvaNotify, TheExitStatusDistinguishesWrongUsageFromFailure) {
   EXPECT_THAT(help.line, HasSubstr("notification service"));
   const Outcome version = RunNotify({"--version"});
   EXPECT_EQ(version.status, 0);
-  EXPECT_EQ(version.line, "orva-notify " ORVA_NOTIFY_VERSION);
+  EXPECT_EQ(version.line, "orva-notify " PROGRAM_VERSION);
 }
 
 TEST_F(OrvaNotify, WaitsForTheGivenNumberOfClients) {

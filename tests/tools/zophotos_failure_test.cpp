@@ -164,7 +164,7 @@ TEST(ZophotosUsage, HelpNamesAllCommands) {
 TEST(ZophotosUsage, VersionIsThatOfTheProject) {
   const Outcome outcome = Zophotos({"--version"});
   EXPECT_EQ(0, outcome.status);
-  EXPECT_EQ("zophotos " ZOPHOTOS_VERSION "\n", outcome.output);
+  EXPECT_EQ("zophotos " PROGRAM_VERSION "\n", outcome.output);
 }
 
 class ZophotosFailure : public ZophotosTest {

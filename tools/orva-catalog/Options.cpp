@@ -15,7 +15,7 @@ public:
   Parser() {
     app_.require_subcommand(0, 1);
     app_.fallthrough();
-    app_.set_version_flag("--version", "orva-catalog " ORVA_CATALOG_VERSION);
+    app_.set_version_flag("--version", "orva-catalog " PROGRAM_VERSION);
     app_.option_defaults()->multi_option_policy(CLI::MultiOptionPolicy::TakeLast);
     app_.footer(
         "Exit status: 0 done; 1 failed, the catalog's content is unchanged; 2 wrong command "

@@ -94,7 +94,7 @@ void Restamp(const std::string& volume) {
   const auto database = catalog::OpenCatalog(volume);
   const long long count = catalog::Restamp(*database, std::time(nullptr));
   catalog::Checkpoint(*database);
-  std::cout << volume << ": stamped " << count << " transcodings anew\n";
+  std::cout << volume << ": stamped " << count << " transcodings again\n";
 }
 
 void Run(const catalog::Options& options) {

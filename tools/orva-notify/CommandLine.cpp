@@ -14,7 +14,7 @@ public:
   Parser() {
     app_.require_subcommand(0, 1);
     app_.fallthrough();
-    app_.set_version_flag("--version", "orva-notify " ORVA_NOTIFY_VERSION);
+    app_.set_version_flag("--version", "orva-notify " PROGRAM_VERSION);
     app_.option_defaults()->multi_option_policy(CLI::MultiOptionPolicy::TakeLast);
     app_.footer("Exit status: 0 done; 1 failed (no service listens, too few clients); 2 wrong "
                 "command line.\nSee orva-notify(1).");

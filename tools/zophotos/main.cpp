@@ -3,12 +3,15 @@
 #include "MergedDatabase.h"
 #include "Text.h"
 
-#include <CLI/CLI.hpp>
+#include "commandline/Parse.h"
+
 #include <SQLiteCpp/Exception.h>
 
 #include <exception>
 #include <iostream>
 #include <string>
+#include <utility>
+#include <vector>
 
 namespace {
 
@@ -18,37 +21,24 @@ using namespace orva::zophotos;
 class Options {
 public:
   Options() {
-    // None is allowed here so that CLI11 names an unknown command; Parse reports a missing one.
     app_.require_subcommand(0, 1);
     app_.fallthrough();
-    app_.set_version_flag("--version", "zophotos " ZOPHOTOS_VERSION);
+    app_.set_version_flag("--version", "zophotos " PROGRAM_VERSION);
     app_.add_option("--database", database_,
                     "Read this database instead of the one named by the daemon's locator file")
         ->type_name("FILE")
-        ->check([](const std::string& path) {
-          return path.empty() ? std::string("must not be empty") : std::string();
-        });
+        ->check(orva::commandline::NotEmpty());
     app_.add_flag("--json", json_, "Print JSON: one object, or one object per line");
-    app_.failure_message([](const CLI::App* /*app*/, const CLI::Error& error) {
-      return std::string("zophotos: ") + error.what() + "\nTry 'zophotos --help'.\n";
-    });
     app_.footer(
         "Exit status: 0 success; 1 damaged, or nothing found; 2 wrong command line; 3 no database "
         "now;\n4 locked, try again; 5 any other error. See zophotos(1).");
     AddCommands();
   }
 
-  /// Throws CLI::ParseError, also for --help and --version.
-  void Parse(int argc, char** argv) {
-    app_.parse(argc, argv);
-    if (app_.get_subcommands().empty()) {
-      throw CLI::RequiredError::Subcommand(1);
-    }
-  }
-
-  /// Prints the message or help of a CLI::ParseError and returns the exit status.
-  ExitStatus Explain(const CLI::ParseError& error) const {
-    return app_.exit(error) == 0 ? ExitStatus::Success : ExitStatus::Usage;
+  /// Returns false when the arguments ask for help or the version, which are then on standard
+  /// output. Throws UsageError.
+  bool Parse(std::vector<std::string> arguments) {
+    return orva::commandline::Parse(app_, std::move(arguments));
   }
 
   /// Runs the command. Throws Failure.
@@ -133,7 +123,7 @@ private:
     });
   }
 
-  CLI::App app_{"Shows what is in the merged photo database. Never changes it."};
+  CLI::App app_{"Shows what is in the merged photo database. Never changes it.", "zophotos"};
   CLI::App* status_ = nullptr; // all of these are owned by app_
   CLI::App* ls_ = nullptr;
   CLI::App* tree_ = nullptr;
@@ -158,13 +148,13 @@ int Finish(ExitStatus status) {
   return static_cast<int>(status);
 }
 
-ExitStatus Run(int argc, char** argv) {
-  Options options;
+ExitStatus Run(std::vector<std::string> arguments) {
   try {
-    options.Parse(argc, argv);
-    return options.Run();
-  } catch (const CLI::ParseError& error) {
-    return options.Explain(error);
+    Options options;
+    return options.Parse(std::move(arguments)) ? options.Run() : ExitStatus::Success;
+  } catch (const orva::commandline::UsageError& error) {
+    std::cerr << "zophotos: " << Printable(error.what()) << "\nTry 'zophotos --help'.\n";
+    return ExitStatus::Usage;
   } catch (const Failure& failure) {
     std::cerr << "zophotos: " << Printable(failure.what()) << '\n';
     return failure.Status();
@@ -176,7 +166,7 @@ ExitStatus Run(int argc, char** argv) {
 int main(int argc, char** argv) {
   std::ios::sync_with_stdio(false);
   try {
-    return Finish(Run(argc, argv));
+    return Finish(Run({argv + 1, argv + argc}));
   } catch (const std::exception& error) {
     std::cerr << "zophotos: " << Printable(error.what()) << '\n';
     return static_cast<int>(ExitStatus::Failed);
