@@ -37,13 +37,12 @@ void FaultAllocator::Install() {
   methods.xMalloc = Allocate;
   methods.xRealloc = Reallocate;
   Check(sqlite3_config(SQLITE_CONFIG_MALLOC, &methods));
-  // No memory that a connection takes in one piece and then hands out itself.
   Check(sqlite3_config(SQLITE_CONFIG_LOOKASIDE, 0, 0));
 }
 
-FaultAllocator::FaultAllocator(int nth, bool forGood) : nth_(nth), forGood_(forGood) {
+FaultAllocator::FaultAllocator(int nth, bool permanent) : nth_(nth), permanent_(permanent) {
   if (current != nullptr) {
-    throw std::logic_error("two faulty allocators");
+    throw std::logic_error("two fault allocators");
   }
   current = this;
 }
@@ -54,7 +53,7 @@ FaultAllocator::~FaultAllocator() {
 
 bool FaultAllocator::Fails() noexcept {
   ++seen_;
-  const bool fails = seen_ == nth_ || (forGood_ && nth_ != 0 && seen_ > nth_);
+  const bool fails = seen_ == nth_ || (permanent_ && nth_ != 0 && seen_ > nth_);
   failed_ += fails ? 1 : 0;
   return fails;
 }

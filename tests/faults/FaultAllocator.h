@@ -2,16 +2,16 @@
 
 namespace orva::test {
 
-/// SQLite's memory with a fault in it, for as long as the object lives: its `nth` allocation from
-/// now (counted from 1; 0 for none) fails, and with `forGood` all that follow it. One at a time,
-/// on the thread that uses SQLite.
+/// Lets an allocation of SQLite's fail while the object lives: the `nth` from now (counted from 1;
+/// 0 for none) and, with `permanent`, all that follow. One object at a time, on the thread that
+/// uses SQLite.
 class FaultAllocator {
 public:
-  /// Puts itself between SQLite and its memory, and has SQLite ask for each piece singly. Before
-  /// SQLite is first used in the process; once.
+  /// Replaces SQLite's allocator and turns off its lookaside memory. Called once in the process,
+  /// before SQLite is used.
   static void Install();
 
-  FaultAllocator(int nth, bool forGood);
+  FaultAllocator(int nth, bool permanent);
   FaultAllocator(const FaultAllocator&) = delete;
   FaultAllocator& operator=(const FaultAllocator&) = delete;
   ~FaultAllocator();
@@ -25,7 +25,7 @@ public:
 
 private:
   int nth_;
-  bool forGood_;
+  bool permanent_;
   int seen_ = 0;
   int failed_ = 0;
 };

@@ -1,8 +1,8 @@
 #include "FaultTest.h"
 
+#include "Catalog.h"
 #include "Database.h"
 #include "PhotoDB.h"
-#include "TestCatalog.h"
 
 #include "support/TestScale.h"
 
@@ -36,59 +36,41 @@ std::string FolderPath(int folder) {
   return "2020-" + std::to_string(folder) + "/";
 }
 
-/// A photo's id in the catalog.
-int PhotoId(int folder, int photo) {
-  return folder * 100 + photo;
+std::string PhotoPath(int folder, int photo) {
+  return FolderPath(folder) + "IMG_" + std::to_string(photo) + ".jpg";
 }
 
-void AddPhoto(TestCatalog& catalog, int folder, int photo, long stamp) {
-  catalog.AddPhoto(PhotoId(folder, photo),
-                   FolderPath(folder) + "IMG_" + std::to_string(photo) + ".jpg", 1'000 + photo,
-                   stamp);
-}
-
-TestCatalog MakeCatalog(const std::string& volume) {
+Catalog MakeCatalog(const std::string& volume) {
   std::filesystem::remove_all(volume);
-  TestCatalog catalog(volume);
-  // The smallest pages, and every statement reads its own, so that there are more to be read.
+  Catalog catalog(volume);
+  // Small pages and a small cache, so that more pages are read.
   catalog.Rows().Run("PRAGMA default_cache_size = 1");
   catalog.Rows().Run("PRAGMA page_size = 512");
   catalog.Rows().Run("VACUUM");
   for (int folder = 1; folder <= FOLDERS; ++folder) {
-    catalog.AddFolder(folder, FolderPath(folder), 100 + folder);
+    catalog.AddFolder(FolderPath(folder), 100 + folder);
     for (int photo = 1; photo <= PHOTOS; ++photo) {
-      AddPhoto(catalog, folder, photo, 10'000 + PhotoId(folder, photo));
+      catalog.AddPhoto(PhotoPath(folder, photo), 1'000 + photo, 10'000 + folder * 100 + photo);
     }
   }
   return catalog;
 }
 
-/// What an indexer does between two merges: new photos, a new folder, photos and a folder gone.
-void Change(TestCatalog& catalog) {
-  catalog.AddFolder(FOLDERS + 1, FolderPath(FOLDERS + 1), 200);
+/// Changes of an indexer between two merges: new photos, a new folder, deleted photos and a folder.
+void Change(Catalog& catalog) {
+  catalog.AddFolder(FolderPath(FOLDERS + 1), 200);
   for (int photo = 1; photo <= PHOTOS; ++photo) {
-    AddPhoto(catalog, FOLDERS + 1, photo, 20'000 + photo);
-    catalog.DeletePhoto(PhotoId(1, photo), 20'100 + photo);
+    catalog.AddPhoto(PhotoPath(FOLDERS + 1, photo), 1'000 + photo, 20'000 + photo);
+    catalog.DeletePhoto(PhotoPath(1, photo), 20'100 + photo);
   }
-  AddPhoto(catalog, 2, PHOTOS + 1, 20'200);
-  catalog.DeletePhoto(PhotoId(3, 1), 20'201);
-  catalog.Rows().Run("UPDATE Folders SET isDeleted = 1 WHERE id = 1");
+  catalog.AddPhoto(PhotoPath(2, PHOTOS + 1), 1'000 + PHOTOS + 1, 20'200);
+  catalog.DeletePhoto(PhotoPath(3, 1), 20'201);
+  catalog.DeleteFolder(FolderPath(1));
 }
 
 std::string ReadFile(const std::filesystem::path& path) {
   std::ifstream file(path, std::ios::binary);
   return {std::istreambuf_iterator<char>(file), {}};
-}
-
-/// Lengthens `lines` by the rows of a query, or by its failure.
-void Append(Lines& lines, const Database& database, const std::string& sql) {
-  try {
-    for (const std::string& row : database.Run(sql)) {
-      lines.push_back(row);
-    }
-  } catch (const std::runtime_error& error) {
-    lines.emplace_back(error.what());
-  }
 }
 
 /// The lines that only one of two contents has: "- " of the first, "+ " of the second.
@@ -118,7 +100,7 @@ Lines Integrity() {
 
 FaultTest::FaultTest() {
   MakeDirectory(MASTER);
-  // Its thread is at its end before a test forks.
+  // The merger's thread must have ended before a test forks.
   merger.Wait();
 }
 
@@ -131,18 +113,8 @@ Lines FaultTest::Content() {
   if (!std::filesystem::exists(DATABASE)) {
     return NO_DATABASE;
   }
-  Lines content;
-  const Database database(DATABASE);
-  for (const char* const sql :
-       {"SELECT type, name, sql FROM sqlite_master ORDER BY name", "SELECT * FROM Status",
-        "SELECT volume, photos_xcoded, photos_total, last_updated_time FROM Statistics ORDER BY 1",
-        "SELECT f.name, coalesce(p.name, f.parent_folder_id), f.modified_date, f.volume FROM "
-        "Folders f LEFT JOIN Folders p ON p.folder_id = f.parent_folder_id ORDER BY 1, 4",
-        "SELECT coalesce(o.name, 'no folder: ') || f.name, f.modified_date, f.created_date, "
-        "f.volume FROM Files f LEFT JOIN Folders o ON o.folder_id = f.folder_id ORDER BY 1, 4"}) {
-    Append(content, database, sql);
-  }
-  return content;
+  const MergedDatabase database(MASTER);
+  return database.Rows().Run("SELECT mdate FROM Status") + database.Content();
 }
 
 FaultTest::Files FaultTest::TakeFiles() {
@@ -172,8 +144,8 @@ void FaultTest::Merge(const std::string& volume) {
   merger.MergeDB(MASTER, volume);
 }
 
-/// Looks up what the scenario leads to, from the files that are laid now. `volumes` are what a
-/// whole database holds afterwards; none when that is of no interest.
+/// Completes the scenario from the files that are there now. `volumes` are those of a complete
+/// database after it; none where that is not checked.
 FaultTest::Scenario FaultTest::Finish(Scenario scenario, const Lines& volumes) {
   scenario.files = TakeFiles();
   scenario.before = Content();
@@ -206,22 +178,22 @@ FaultTest::Scenario FaultTest::FirstMergeWithoutADatabase() {
   return scenario;
 }
 
-/// Merges both volumes, and then has the indexer change the catalog of the one.
-void FaultTest::LayMergedVolumes() {
+/// Merges both volumes and then changes the catalog of VOLUME.
+void FaultTest::MakeMergedVolumes() {
   MakeCatalog(OTHER);
-  TestCatalog catalog = MakeCatalog(VOLUME);
+  Catalog catalog = MakeCatalog(VOLUME);
   OutputOf([this] { Merge(OTHER); });
   OutputOf([this] { Merge(VOLUME); });
   Change(catalog);
 }
 
 FaultTest::Scenario FaultTest::LaterMerge() {
-  LayMergedVolumes();
+  MakeMergedVolumes();
   return Finish({.name = "a later merge", .operation = [this] { Merge(VOLUME); }, .throws = false},
                 {OTHER, VOLUME});
 }
 
-/// What the deletion of the volume may leave when only its first statements succeed.
+/// The contents after the first statements of the volume's deletion.
 std::vector<Lines> FaultTest::PartsOfADeletion() {
   std::vector<Lines> parts;
   const Files files = TakeFiles();
@@ -236,7 +208,7 @@ std::vector<Lines> FaultTest::PartsOfADeletion() {
 }
 
 FaultTest::Scenario FaultTest::ReMerge() {
-  LayMergedVolumes();
+  MakeMergedVolumes();
   return Finish({.name = "a re-merge",
                  .operation = [this] { merger.ReMergeDB(MASTER, VOLUME); },
                  .between = PartsOfADeletion()},
@@ -244,7 +216,7 @@ FaultTest::Scenario FaultTest::ReMerge() {
 }
 
 FaultTest::Scenario FaultTest::Removal() {
-  LayMergedVolumes();
+  MakeMergedVolumes();
   return Finish({.name = "a removal of a volume",
                  .operation = [this] { merger.RemoveVolume(MASTER, VOLUME); },
                  .between = PartsOfADeletion()},
@@ -258,7 +230,7 @@ FaultTest::Scenario FaultTest::Creation() {
 }
 
 FaultTest::Scenario FaultTest::Opening() {
-  LayMergedVolumes();
+  MakeMergedVolumes();
   return Finish({.name = "an opening",
                  .operation =
                      [] {
@@ -271,7 +243,7 @@ FaultTest::Scenario FaultTest::Opening() {
 }
 
 FaultTest::Scenario FaultTest::Clearing() {
-  LayMergedVolumes();
+  MakeMergedVolumes();
   const Files files = TakeFiles();
   std::vector<Lines> parts;
   for (const char* const sql : {"DELETE FROM Folders WHERE folder_id != 1", "DELETE FROM Files"}) {
@@ -297,7 +269,7 @@ void FaultTest::ExpectToSurvive(const Scenario& scenario, const std::vector<Faul
   int runs = 0;
   for (const Fault& fault : faults) {
     SCOPED_TRACE(scenario.name + ", " + fault.name);
-    const int made = Disturb(scenario, fault);
+    const int made = RunWith(scenario, fault);
     if (HasFailure()) {
       return;
     }
@@ -310,13 +282,13 @@ void FaultTest::ExpectToSurvive(const Scenario& scenario, const std::vector<Faul
   EXPECT_NE(0, runs);
 }
 
-/// Returns how many times the operation was run with the fault.
-int FaultTest::Disturb(const Scenario& scenario, const Fault& fault) {
-  constexpr int briefRuns = 10;
+/// Returns how often the operation was run with the fault.
+int FaultTest::RunWith(const Scenario& scenario, const Fault& fault) {
+  constexpr int shortRuns = 10;
   RestoreFiles(scenario.files);
   const int chances = Try(fault, 0, scenario.operation).tally.chances;
   EXPECT_EQ(scenario.after, Content());
-  const int step = TestScale(std::max(1, chances / briefRuns), 1);
+  const int step = TestScale(std::max(1, chances / shortRuns), 1);
   int runs = 0;
   for (int nth = 1; nth <= chances && !HasFailure(); nth += step) {
     SCOPED_TRACE("at opportunity " + std::to_string(nth) + " of " + std::to_string(chances));
@@ -359,7 +331,7 @@ void FaultTest::CheckOutcome(const Scenario& scenario, const Fault& fault, const
       << "from before: " << ::testing::PrintToString(Difference(scenario.before, content))
       << "\nfrom after: " << ::testing::PrintToString(Difference(scenario.after, content));
 
-  if (!fault.stopsProcess) {
+  if (!fault.endsProcess) {
     Lines complaints = outcome.thrown;
     complaints.insert(complaints.end(), outcome.logged.begin(), outcome.logged.end());
     EXPECT_LE(complaints.size(), 1U) << ::testing::PrintToString(complaints);
@@ -372,17 +344,17 @@ void FaultTest::CheckOutcome(const Scenario& scenario, const Fault& fault, const
   }
 
   RestoreFiles(left);
-  ExpectUndisturbed(scenario.operation, scenario.after);
+  ExpectSuccess(scenario.operation, scenario.after);
   if (content != scenario.before && !scenario.merged.empty()) {
     RestoreFiles(left);
-    ExpectUndisturbed([this] { Merge(VOLUME); }, scenario.merged);
+    ExpectSuccess([this] { Merge(VOLUME); }, scenario.merged);
   }
 }
 
-/// Runs an operation without a fault where there has been one.
-void FaultTest::ExpectUndisturbed(const Action& action, const Lines& content) {
-  const Fault none{.name = "none", .run = [](int /*nth*/, const Action& undisturbed) {
-                     undisturbed();
+/// Runs an operation without a fault after one with a fault.
+void FaultTest::ExpectSuccess(const Action& action, const Lines& content) {
+  const Fault none{.name = "none", .run = [](int /*nth*/, const Action& operation) {
+                     operation();
                      return Fault::Tally();
                    }};
   const Outcome outcome = Try(none, 0, action);

@@ -14,39 +14,39 @@ namespace orva::test {
 /// An operation on the merged database. Throws std::string as the database layer does.
 using Action = std::function<void()>;
 
-/// One way in which an operation is disturbed.
+/// A kind of fault.
 struct Fault {
-  /// How often there was an opportunity for the fault, and how often it came.
+  /// How many opportunities the fault had, and how often it occurred.
   struct Tally {
     int chances = 0;
     int faults = 0;
   };
 
-  std::string name; ///< as the figures call it
+  std::string name; ///< in the figures
   /// Runs the action with the fault at its `nth` opportunity, counted from 1; 0 is none.
   std::function<Tally(int nth, const Action& action)> run;
-  bool stopsProcess = false; ///< nobody is left to throw or to log
+  bool endsProcess = false; ///< so that nothing is thrown or logged
 };
 
-/// A test of what faults do to the merged database on /shares/Master/, of which /shares/Vol/ is one
-/// volume. An operation is run with a fault at every one of its opportunities (in the brief form:
+/// A test of faults in operations on the merged database on /shares/Master/, of which /shares/Vol/
+/// is one volume. An operation is run with a fault at each of its opportunities (in the short form
 /// at some, evenly spread), from the same files each time.
 class FaultTest : public DaemonLayerTest {
 protected:
   /// Every file in the database's directory by name; none when there is no directory.
   using Files = std::optional<std::map<std::string, std::string>>;
 
-  /// An operation and what may come of it.
+  /// An operation and its possible outcomes.
   struct Scenario {
-    std::string name; ///< as the figures call it: "a first merge"
+    std::string name; ///< in the figures: "a first merge"
     Action operation;
-    Files files{};                ///< what it finds
-    bool throws = true;           ///< otherwise each failure is one line of a failed merge
-    std::vector<Lines> between{}; ///< what it may leave, when it fails, but the following two
-    Lines before{};               ///< the content that it finds
-    Lines after{};                ///< the content that it leaves when nothing goes wrong
-    /// What the volume's next merge must lead to, unless nothing has changed; empty when that is
-    /// of no interest.
+    Files files{};                ///< the files before it
+    bool throws = true;           ///< otherwise a failure is logged as that of a merge
+    std::vector<Lines> between{}; ///< further contents that a failure may leave
+    Lines before{};               ///< the content before it
+    Lines after{};                ///< the content after it without a fault
+    /// The content after the volume's next merge, unless the content has not changed; empty where
+    /// that is not checked.
     Lines merged{};
   };
 
@@ -64,7 +64,7 @@ protected:
   Scenario Opening();
   Scenario Clearing();
 
-  /// Runs the scenario with the faults, and looks at what comes of each.
+  /// Runs the scenario with each fault and checks the outcomes.
   void ExpectToSurvive(const Scenario& scenario, const std::vector<Fault>& faults);
 
   /// Everything in the merged database but the ids of folders, files and statistics.
@@ -86,13 +86,13 @@ private:
   };
 
   void Merge(const std::string& volume);
-  void LayMergedVolumes();
+  void MakeMergedVolumes();
   static std::vector<Lines> PartsOfADeletion();
   Scenario Finish(Scenario scenario, const Lines& volumes);
   Outcome Try(const Fault& fault, int nth, const Action& action);
-  int Disturb(const Scenario& scenario, const Fault& fault);
+  int RunWith(const Scenario& scenario, const Fault& fault);
   void CheckOutcome(const Scenario& scenario, const Fault& fault, const Outcome& outcome);
-  void ExpectUndisturbed(const Action& action, const Lines& content);
+  void ExpectSuccess(const Action& action, const Lines& content);
 };
 
 } // namespace orva::test

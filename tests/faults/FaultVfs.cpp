@@ -22,11 +22,11 @@ std::string ContentOf(const std::string& path) {
   return {std::istreambuf_iterator<char>(file), {}};
 }
 
-/// A file of ours: SQLite gives room for this and, behind it, for the real file.
+/// Our file, followed by the real one in the memory that SQLite allocates.
 struct FaultFile : sqlite3_file {
   const char* path; ///< SQLite keeps it until the file is closed; null for a temporary file
-  /// The name of a new journal lasts with its content: SQLite synchronises its directory as well.
-  bool lastsWithItsName;
+  /// A sync also saves the name of a new journal: SQLite then syncs its directory.
+  bool syncsItsName;
 };
 
 const char* PathOf(sqlite3_file* file) {
@@ -83,7 +83,7 @@ int Sync(sqlite3_file* file, int flags) {
   }
   const int code = Real(file)->pMethods->xSync(Real(file), flags);
   current->Synced(PathOf(file));
-  if (static_cast<FaultFile*>(file)->lastsWithItsName) {
+  if (static_cast<FaultFile*>(file)->syncsItsName) {
     current->Synced(DirectoryOf(PathOf(file)).c_str());
   }
   return code;
@@ -142,7 +142,7 @@ int ShmUnmap(sqlite3_file* file, int remove) {
   return Real(file)->pMethods->xShmUnmap(Real(file), remove);
 }
 
-/// Without memory mapping, which reads and writes past us.
+/// Version 2, without memory mapping, which would bypass this file system.
 constexpr sqlite3_io_methods METHODS = {2,
                                         Close,
                                         Read,
@@ -172,7 +172,7 @@ int Open(sqlite3_vfs* vfs, const char* path, sqlite3_file* file, int flags, int*
   }
   current->Touching(path);
   static_cast<FaultFile*>(file)->path = path;
-  static_cast<FaultFile*>(file)->lastsWithItsName =
+  static_cast<FaultFile*>(file)->syncsItsName =
       (flags & SQLITE_OPEN_CREATE) != 0 &&
       (flags & (SQLITE_OPEN_MAIN_JOURNAL | SQLITE_OPEN_WAL)) != 0;
   const int code = Real(vfs)->xOpen(Real(vfs), path, Real(file), flags, outFlags);
@@ -209,7 +209,7 @@ int Sleep(sqlite3_vfs* /*vfs*/, int microseconds) {
 
 } // namespace
 
-/// The file system as SQLite knows it: the real one where nothing is said here.
+/// The registered file system: the real one but for some functions.
 struct FaultVfs::Registration {
   Registration() : real(sqlite3_vfs_find(nullptr)), vfs(*real) {
     vfs.zName = "faults";
@@ -234,7 +234,7 @@ struct FaultVfs::Registration {
 
 FaultVfs::FaultVfs(FaultPlan plan) : plan_(std::move(plan)) {
   if (current != nullptr) {
-    throw std::logic_error("two faulty file systems");
+    throw std::logic_error("two fault file systems");
   }
   registration_ = std::make_unique<Registration>();
   current = this;
@@ -257,12 +257,12 @@ bool FaultVfs::Fails(Request request, const char* path, const std::function<void
     return false;
   }
   ++seen_;
-  const bool fails = seen_ == plan_.nth || (plan_.forGood && plan_.nth != 0 && seen_ > plan_.nth);
+  const bool fails = seen_ == plan_.nth || (plan_.permanent && plan_.nth != 0 && seen_ > plan_.nth);
   if (fails && partly) {
     partly();
   }
   if (fails && plan_.effect != FaultPlan::Effect::Error) {
-    Stop();
+    Crash();
   }
   failed_ += fails ? 1 : 0;
   return fails;
@@ -315,17 +315,17 @@ void FaultVfs::Renamed(const char* from, const char* to) {
   }
 }
 
-void FaultVfs::Stop() const {
+void FaultVfs::Crash() const {
   for (const auto& [path, content] : files_) {
     if (path.find(plan_.lost) == std::string::npos) {
       *content = ContentOf(path);
     }
     std::filesystem::remove(path);
   }
-  for (const auto& [path, content] : plan_.takesNames ? lasting_ : files_) {
+  for (const auto& [path, content] : plan_.losesNames ? lasting_ : files_) {
     std::ofstream(path, std::ios::binary) << *content;
   }
-  _exit(STOPPED);
+  _exit(CRASHED);
 }
 
 } // namespace orva::test

@@ -9,37 +9,37 @@
 
 namespace orva::test {
 
-/// What is asked of the file system, by SQLite or by the daemon itself.
+/// A request to the file system, by SQLite or by the daemon itself.
 enum class Request { Open, Read, Write, Sync, Truncate, Size, Lock, Delete, Access, Rename };
 
-/// Which request of an operation goes wrong, and how.
+/// Which request of an operation fails, and how.
 struct FaultPlan {
   enum class Effect {
     Error,    ///< the request fails with `code`
-    Stop,     ///< the process ends there
+    Crash,    ///< the process ends there
     PowerLoss ///< the same, and files have the content that they had when last synced
   };
 
   std::string files;               ///< a part of the paths of the files concerned
   std::vector<Request> requests{}; ///< the kinds concerned
-  int nth = 0;                     ///< the one that goes wrong, counted from 1; 0 for none
+  int nth = 0;                     ///< the one that fails, counted from 1; 0 for none
   Effect effect = Effect::Error;
-  int code = 0;          ///< SQLite's result code for an Error
-  bool forGood = false;  ///< an Error of all that follow as well
-  int systemError = EIO; ///< errno of an Error, where the daemon asks past SQLite
-  std::string lost{};    ///< a part of the paths of the files whose content a PowerLoss takes
+  int code = 0;           ///< SQLite's result code for an Error
+  bool permanent = false; ///< an Error of all following requests too
+  int systemError = EIO;  ///< errno of an Error of the daemon's own requests
+  std::string lost{};     ///< a part of the paths of the files whose content a PowerLoss loses
   /// A PowerLoss undoes every creation, renaming and deletion since the directory was last synced.
-  bool takesNames = false;
+  bool losesNames = false;
 };
 
-/// SQLite's file system with a fault in it, for as long as the object lives: the default one of
-/// connections that are opened meanwhile, which must be closed before it ends. One at a time, on
-/// the thread that uses SQLite. A write that fails leaves its first half; waiting for a lock takes
-/// no time.
+/// SQLite's file system with a fault, for as long as the object lives: the default of connections
+/// that are opened in that time, which must be closed before the object ends. One object at a time,
+/// on the thread that uses SQLite. A write that fails writes its first half; waiting for a lock
+/// takes no time.
 class FaultVfs {
 public:
-  /// Exit status of a process that a plan has stopped.
-  static constexpr int STOPPED = 86;
+  /// Exit status of a process that a plan has ended.
+  static constexpr int CRASHED = 86;
 
   explicit FaultVfs(FaultPlan plan);
   FaultVfs(const FaultVfs&) = delete;
@@ -50,30 +50,30 @@ public:
   int Seen() const noexcept { return seen_; }
   int Failed() const noexcept { return failed_; }
 
-  /// Ends the process now, as the plan says how.
-  [[noreturn]] void Stop() const;
+  /// Ends the process now, with or without a loss of power according to the plan.
+  [[noreturn]] void Crash() const;
 
   // For the file system's side.
 
-  /// The one that lives; null when there is none.
+  /// The existing object; null when there is none.
   static FaultVfs* Current() noexcept;
 
-  /// Counts a request. Returns whether it has to fail; ends the process where the plan says so.
-  /// `partly` is what is done of it all the same in either case.
+  /// Counts a request. Returns whether it has to fail, or ends the process, according to the plan;
+  /// in both cases after `partly`, which does a part of the request.
   bool Fails(Request request, const char* path, const std::function<void()>& partly = {});
   /// The failure as a result code of SQLite's, and as an errno.
   int Code() const noexcept { return plan_.code; }
   int SystemError() const noexcept { return plan_.systemError; }
 
-  // Keep up what a power loss leaves of the files. Directories last at once.
-  void Touching(const char* path); ///< before the name may go to another file, or to none
+  // These record what a power loss leaves of the files. New directories are never lost.
+  void Touching(const char* path); ///< before a file is opened, replaced or removed
   void Opened(const char* path);
   void Synced(const char* path); ///< a file or a directory
   void Deleted(const char* path);
   void Renamed(const char* from, const char* to);
 
 private:
-  /// What a power loss leaves of the content of files.
+  /// The content of files after a power loss.
   using Files = std::map<std::string, std::shared_ptr<std::string>>;
 
   struct Registration;

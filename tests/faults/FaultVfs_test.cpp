@@ -36,8 +36,8 @@ protected:
 
   static std::vector<std::string> Rows() { return Database(PATH).Run("SELECT a FROM t"); }
 
-  /// Inserts a row in a process of its own, which ends at a request of a kind, or behind all of
-  /// them where the plan names none. Returns its exit status.
+  /// Inserts a row in a process of its own, which ends at a request of the plan, or after all of
+  /// them where the plan has none. Returns its exit status.
   static int InsertApart(const FaultPlan& plan,
                          const std::string& pragma = "PRAGMA synchronous = FULL") {
     const pid_t child = fork();
@@ -45,7 +45,7 @@ protected:
       const FaultVfs faults(plan);
       Insert(pragma);
       if (plan.nth == 0) {
-        faults.Stop();
+        faults.Crash();
       }
       _exit(0);
     }
@@ -54,7 +54,7 @@ protected:
     return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
   }
 
-  /// A loss of power at the first deletion.
+  /// A power loss at the first deletion.
   static FaultPlan LossOf(const std::string& files) {
     return {.files = PATH,
             .requests = {Request::Delete},
@@ -65,13 +65,13 @@ protected:
 
   static constexpr const char* PATH = "/tmp/test.db";
   inline static const FaultPlan LOSS_OF_NAMES = {
-      .files = PATH, .effect = Effect::PowerLoss, .takesNames = true};
+      .files = PATH, .effect = Effect::PowerLoss, .losesNames = true};
 };
 
 TEST_F(FaultVfsTest, WithoutAnErrorItOnlyCounts) {
   const FaultVfs faults({.files = "test.db", .requests = {Request::Open, Request::Delete}});
   Insert();
-  EXPECT_EQ(3, faults.Seen()); // the database and its journal, which goes at the end
+  EXPECT_EQ(3, faults.Seen()); // the database and its journal, and the deletion of the journal
   EXPECT_EQ(0, faults.Failed());
 }
 
@@ -84,13 +84,13 @@ TEST_F(FaultVfsTest, TheChosenRequestFailsOnce) {
   EXPECT_EQ(1, faults.Failed());
 }
 
-TEST_F(FaultVfsTest, TheRequestsThatFollowFailForGood) {
+TEST_F(FaultVfsTest, AllFollowingRequestsFailPermanently) {
   {
     const FaultVfs faults({.files = "test.db",
                            .requests = {Request::Lock},
                            .nth = 1,
                            .code = SQLITE_BUSY,
-                           .forGood = true});
+                           .permanent = true});
     EXPECT_THROW(Insert(), std::runtime_error);
     EXPECT_THROW(Insert(), std::runtime_error);
     EXPECT_GE(faults.Failed(), 2);
@@ -98,57 +98,57 @@ TEST_F(FaultVfsTest, TheRequestsThatFollowFailForGood) {
   EXPECT_NO_THROW(Insert());
 }
 
-TEST_F(FaultVfsTest, OtherFilesAreLeftAlone) {
+TEST_F(FaultVfsTest, OtherFilesAreNotAffected) {
   const FaultVfs faults(
       {.files = "other.db", .requests = {Request::Open}, .nth = 1, .code = SQLITE_CANTOPEN});
   EXPECT_NO_THROW(Insert());
   EXPECT_EQ(0, faults.Seen());
 }
 
-TEST_F(FaultVfsTest, AWriteThatIsStoppedLeavesItsFirstHalf) {
+TEST_F(FaultVfsTest, AWriteThatCrashesWritesItsFirstHalf) {
   const std::string journal = std::string(PATH) + "-journal";
   EXPECT_EQ(
-      FaultVfs::STOPPED,
+      FaultVfs::CRASHED,
       InsertApart(
-          {.files = journal, .requests = {Request::Write}, .nth = 1, .effect = Effect::Stop}));
+          {.files = journal, .requests = {Request::Write}, .nth = 1, .effect = Effect::Crash}));
   EXPECT_NE(0U, std::filesystem::file_size(journal));
 }
 
-// Where a transaction ends, with the deletion of its journal, all is written and synced.
+// When a transaction deletes its journal at its end, everything is written and synced.
 
-TEST_F(FaultVfsTest, APowerLossSparesWhatWasSynced) {
-  EXPECT_EQ(FaultVfs::STOPPED, InsertApart(LossOf("-journal")));
-  EXPECT_THAT(Rows(), IsEmpty()); // by the journal
+TEST_F(FaultVfsTest, APowerLossKeepsWhatWasSynced) {
+  EXPECT_EQ(FaultVfs::CRASHED, InsertApart(LossOf("-journal")));
+  EXPECT_THAT(Rows(), IsEmpty()); // rolled back by the journal
 }
 
-TEST_F(FaultVfsTest, APowerLossTakesWhatWasNotSynced) {
-  EXPECT_EQ(FaultVfs::STOPPED, InsertApart(LossOf("-journal"), "PRAGMA synchronous = OFF"));
-  EXPECT_THAT(Rows(), ElementsAre("1")); // no journal that says otherwise
+TEST_F(FaultVfsTest, APowerLossLosesWhatWasNotSynced) {
+  EXPECT_EQ(FaultVfs::CRASHED, InsertApart(LossOf("-journal"), "PRAGMA synchronous = OFF"));
+  EXPECT_THAT(Rows(), ElementsAre("1")); // without a journal
 }
 
-// Where it ends behind its last request, the journal is deleted, and the directory synced at the
-// most when the journal was made.
+// After its last request the journal is deleted, and the directory was synced at most when the
+// journal was created.
 
-TEST_F(FaultVfsTest, APowerLossTakesADeletionWhoseDirectoryWasNotSynced) {
-  EXPECT_EQ(FaultVfs::STOPPED, InsertApart(LOSS_OF_NAMES));
-  EXPECT_THAT(Rows(), IsEmpty()); // by the journal
+TEST_F(FaultVfsTest, APowerLossUndoesADeletionWhoseDirectoryWasNotSynced) {
+  EXPECT_EQ(FaultVfs::CRASHED, InsertApart(LOSS_OF_NAMES));
+  EXPECT_THAT(Rows(), IsEmpty()); // rolled back by the journal
 }
 
-TEST_F(FaultVfsTest, APowerLossSparesADeletionWhoseDirectoryWasSynced) {
-  EXPECT_EQ(FaultVfs::STOPPED, InsertApart(LOSS_OF_NAMES, "PRAGMA synchronous = EXTRA"));
+TEST_F(FaultVfsTest, APowerLossKeepsADeletionWhoseDirectoryWasSynced) {
+  EXPECT_EQ(FaultVfs::CRASHED, InsertApart(LOSS_OF_NAMES, "PRAGMA synchronous = EXTRA"));
   EXPECT_THAT(Rows(), ElementsAre("1"));
 }
 
-TEST_F(FaultVfsTest, APowerLossTakesACreationWhoseDirectoryWasNotSynced) {
-  for (const bool takesNames : {false, true}) {
+TEST_F(FaultVfsTest, APowerLossUndoesACreationWhoseDirectoryWasNotSynced) {
+  for (const bool losesNames : {false, true}) {
     const std::string journal = std::string(PATH) + "-journal";
     std::filesystem::remove(journal);
     FaultPlan plan = LOSS_OF_NAMES;
-    plan.takesNames = takesNames;
+    plan.losesNames = losesNames;
     plan.requests = {Request::Sync};
-    plan.nth = 1; // the journal's, whose first also is the directory's
-    EXPECT_EQ(FaultVfs::STOPPED, InsertApart(plan));
-    EXPECT_EQ(!takesNames, std::filesystem::exists(journal));
+    plan.nth = 1; // that of the journal, whose first one includes the directory
+    EXPECT_EQ(FaultVfs::CRASHED, InsertApart(plan));
+    EXPECT_EQ(!losesNames, std::filesystem::exists(journal));
   }
 }
 

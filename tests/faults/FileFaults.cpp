@@ -26,22 +26,21 @@ constexpr Kind KINDS[] = {
     {"full disk", Request::Write, SQLITE_FULL},
     {"failed sync", Request::Sync, SQLITE_IOERR_FSYNC},
     {"failed truncation", Request::Truncate, SQLITE_IOERR_TRUNCATE},
-    {"failed look at the size", Request::Size, SQLITE_IOERR_FSTAT},
+    {"failed size request", Request::Size, SQLITE_IOERR_FSTAT},
     {"failed lock", Request::Lock, SQLITE_IOERR_LOCK},
     {"lock held by another", Request::Lock, SQLITE_BUSY},
     {"failed deletion", Request::Delete, SQLITE_IOERR_DELETE},
-    {"failed look at a name", Request::Access, SQLITE_IOERR_ACCESS},
+    {"failed access check", Request::Access, SQLITE_IOERR_ACCESS},
     {"failed renaming", Request::Rename, SQLITE_IOERR},
 };
 
-/// What changes something on disk, so that it makes a difference whether the process has come past
-/// it.
+/// Requests that change something on disk.
 const std::vector<Request> CHANGES = {Request::Open,   Request::Write,    Request::Sync,
                                       Request::Delete, Request::Truncate, Request::Rename};
 
-/// What comes between two changes: a stop there leaves none of the change that follows, of a write
-/// not even its half.
-const std::vector<Request> LOOKS = {Request::Read, Request::Size, Request::Lock, Request::Access};
+/// Requests between two changes: a crash there leaves nothing of the next change, not even the
+/// first half of a write.
+const std::vector<Request> QUERIES = {Request::Read, Request::Size, Request::Lock, Request::Access};
 
 Fault::Tally Run(const FaultPlan& plan, const Action& action) {
   const FaultVfs faults(plan);
@@ -49,7 +48,7 @@ Fault::Tally Run(const FaultPlan& plan, const Action& action) {
   return {.chances = faults.Seen(), .faults = faults.Failed()};
 }
 
-/// Runs the action in a process of its own. The fault is that this was stopped.
+/// Runs the action in a process of its own. The fault is that the plan has ended it.
 Fault::Tally RunApart(const FaultPlan& plan, const Action& action) {
   const pid_t child = fork();
   if (child == 0) {
@@ -62,25 +61,25 @@ Fault::Tally RunApart(const FaultPlan& plan, const Action& action) {
   }
   int status = 0;
   if (child < 0 || waitpid(child, &status, 0) != child || !WIFEXITED(status) ||
-      (WEXITSTATUS(status) != 0 && WEXITSTATUS(status) != FaultVfs::STOPPED)) {
+      (WEXITSTATUS(status) != 0 && WEXITSTATUS(status) != FaultVfs::CRASHED)) {
     throw std::runtime_error("the process has ended with status " + std::to_string(status));
   }
-  return {.chances = 0, .faults = WEXITSTATUS(status) == FaultVfs::STOPPED ? 1 : 0};
+  return {.chances = 0, .faults = WEXITSTATUS(status) == FaultVfs::CRASHED ? 1 : 0};
 }
 
-Fault Error(const Kind& kind, const std::string& files, const std::string& place, bool forGood) {
-  return {.name = place + ": " + kind.name + (forGood ? ", for good" : ", once"),
+Fault Error(const Kind& kind, const std::string& files, const std::string& place, bool permanent) {
+  return {.name = place + ": " + kind.name + (permanent ? ", permanently" : ", once"),
           .run = [=](int nth, const Action& action) {
             return Run({.files = files,
                         .requests = {kind.request},
                         .nth = nth,
                         .code = kind.code,
-                        .forGood = forGood},
+                        .permanent = permanent},
                        action);
           }};
 }
 
-Fault Stop(const char* name, const FaultPlan& plan) {
+Fault Crash(const char* name, const FaultPlan& plan) {
   return {.name = name,
           .run =
               [=](int nth, const Action& action) {
@@ -88,7 +87,7 @@ Fault Stop(const char* name, const FaultPlan& plan) {
                 now.nth = nth;
                 return nth == 0 ? Run(now, action) : RunApart(now, action);
               },
-          .stopsProcess = true};
+          .endsProcess = true};
 }
 
 } // namespace
@@ -102,23 +101,24 @@ std::vector<Fault> FileErrors(const std::string& files, const std::string& place
   return faults;
 }
 
-std::vector<Fault> Stops(const std::string& files) {
+std::vector<Fault> Crashes(const std::string& files) {
   using Effect = FaultPlan::Effect;
   return {
-      Stop("stopped process", {.files = files, .requests = CHANGES, .effect = Effect::Stop}),
-      Stop("stopped process, between changes",
-           {.files = files, .requests = LOOKS, .effect = Effect::Stop}),
-      Stop("lost power", {.files = files, .requests = CHANGES, .effect = Effect::PowerLoss}),
-      Stop("lost power that spared the database",
-           {.files = files, .requests = CHANGES, .effect = Effect::PowerLoss, .lost = "-journal"}),
-      Stop("lost power that took names",
-           {.files = files, .requests = CHANGES, .effect = Effect::PowerLoss, .takesNames = true})};
+      Crash("crashed process", {.files = files, .requests = CHANGES, .effect = Effect::Crash}),
+      Crash("crashed process, between changes",
+            {.files = files, .requests = QUERIES, .effect = Effect::Crash}),
+      Crash("lost power", {.files = files, .requests = CHANGES, .effect = Effect::PowerLoss}),
+      Crash("lost power, database kept",
+            {.files = files, .requests = CHANGES, .effect = Effect::PowerLoss, .lost = "-journal"}),
+      Crash(
+          "lost power with names",
+          {.files = files, .requests = CHANGES, .effect = Effect::PowerLoss, .losesNames = true})};
 }
 
-void LosePowerBehind(const Action& action, const std::string& files) {
-  RunApart({.files = files, .effect = FaultPlan::Effect::PowerLoss, .takesNames = true}, [&] {
+void LosePowerAfter(const Action& action, const std::string& files) {
+  RunApart({.files = files, .effect = FaultPlan::Effect::PowerLoss, .losesNames = true}, [&] {
     action();
-    FaultVfs::Current()->Stop();
+    FaultVfs::Current()->Crash();
   });
 }
 

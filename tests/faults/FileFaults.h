@@ -7,16 +7,16 @@
 
 namespace orva::test {
 
-/// Errors of the file system on the files whose paths contain `files`: each kind once, and each
-/// for good, from an opportunity on. `place` is what the figures call the files.
+/// Errors of the file system on the files whose paths contain `files`: of each kind one that occurs
+/// once and one that is permanent. `place` names the files in the figures.
 std::vector<Fault> FileErrors(const std::string& files, const std::string& place);
 
-/// The end of the process, at a change or between two; the same with the loss of all content that
-/// was not synced, with the loss of that of the journals alone, and with that of all names besides.
-std::vector<Fault> Stops(const std::string& files);
+/// The end of the process, at a change or between two; the same with a loss of all content that was
+/// not synced, of that of the journals only, and of all names in addition.
+std::vector<Fault> Crashes(const std::string& files);
 
-/// Runs the action in a process of its own, which then loses power, with all content and all names
-/// that were not synced.
-void LosePowerBehind(const Action& action, const std::string& files);
+/// Runs the action in a process of its own, which then loses power and with it all content and
+/// names that were not synced.
+void LosePowerAfter(const Action& action, const std::string& files);
 
 } // namespace orva::test

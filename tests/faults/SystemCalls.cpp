@@ -1,5 +1,5 @@
-// What the daemon itself asks of the file system, past SQLite. The linker hands its calls to these
-// (--wrap), and no others: SQLite's library keeps its own.
+// The daemon's own requests to the file system, without SQLite. The linker replaces its calls by
+// these functions (--wrap); those of SQLite's library stay as they are.
 
 #include "FaultVfs.h"
 
@@ -12,7 +12,7 @@
 
 namespace orva::test {
 
-// By the names that the linker gives the real ones, and looks for.
+// The names that the linker uses.
 int RealRename(const char* from, const char* to) __asm__("__real_rename");
 int RealFsync(int descriptor) __asm__("__real_fsync");
 int RealUnlink(const char* path) __asm__("__real_unlink");
@@ -32,7 +32,7 @@ bool Fails(Request request, const std::string& path) {
   return true;
 }
 
-/// Tells the faults what is about to change.
+/// Announces a change of the file to the file system with the fault.
 void Touching(const char* path) {
   if (FaultVfs::Current() != nullptr) {
     FaultVfs::Current()->Touching(path);

@@ -1,4 +1,4 @@
-// The merged database where SQLite gets no memory.
+// Operations on the merged database when SQLite's allocations fail.
 
 #include "FaultAllocator.h"
 #include "FaultTest.h"
@@ -10,11 +10,11 @@
 namespace orva::test {
 namespace {
 
-Fault FailedAllocation(bool forGood) {
+Fault FailedAllocation(bool permanent) {
   return {.name = std::string("SQLite's memory: failed allocation") +
-                  (forGood ? ", for good" : ", once"),
+                  (permanent ? ", permanently" : ", once"),
           .run = [=](int nth, const Action& action) {
-            const FaultAllocator faults(nth, forGood);
+            const FaultAllocator faults(nth, permanent);
             action();
             return Fault::Tally{.chances = faults.Seen(), .faults = faults.Failed()};
           }};
@@ -43,7 +43,7 @@ TEST_F(AllocationFaultTest, ReMergeCanBeRepeatedByTheNextMerge) {
   ExpectToSurvive(ReMerge(), faults);
 }
 
-TEST_F(AllocationFaultTest, RemovalLeavesNothingBehindForEver) {
+TEST_F(AllocationFaultTest, RemovalIsRepairedByTheNextMerge) {
   ExpectToSurvive(Removal(), faults);
 }
 
@@ -59,7 +59,7 @@ TEST_F(AllocationFaultTest, RemovalOfAllVolumesCanBeRepeated) {
   ExpectToSurvive(Clearing(), faults);
 }
 
-// Bytes get an end when they are read as a text, for which there is no room behind 30 of them.
+// SQLite allocates memory to terminate bytes that are read as a text; 30 of them need more.
 TEST_F(AllocationFaultTest, FirstMergeOfTextsThatNeedMemoryIsAllOrNothing) {
   Scenario scenario = FirstMerge();
   scenario.name = "a first merge of texts stored as bytes";

@@ -1,4 +1,4 @@
-// The merged database where the file system under it, or under a volume's catalog, fails.
+// Operations on the merged database when requests for its files, or for a catalog, fail.
 
 #include "FaultVfs.h"
 #include "FileFaults.h"
@@ -18,14 +18,14 @@ const std::string CATALOG = "/shares/Vol/";
 
 class FileFaultTest : public FaultTest {
 protected:
-  /// A first creation where the database of before is gone, but neither its journal nor what an
-  /// earlier creation has left.
+  /// A first creation where the former database is missing, but its journal and the files of an
+  /// earlier creation are there.
   Scenario CreationAmongLeftovers() {
     const Scenario merge = LaterMerge();
-    const Fault stop = Stops(MERGED).front();
+    const Fault crash = Crashes(MERGED).front();
     const auto run = [&](int nth) {
       int chances = 0;
-      OutputOf([&] { chances = stop.run(nth, merge.operation).chances; });
+      OutputOf([&] { chances = crash.run(nth, merge.operation).chances; });
       return chances;
     };
     const int end = run(0);
@@ -44,8 +44,8 @@ protected:
     return scenario;
   }
 
-  /// Runs the scenario with a sync that its file system does not support: the last one, or one so
-  /// many before it.
+  /// Runs the scenario with a sync that the file system does not support: the last one or, with
+  /// `beforeLast`, an earlier one.
   static void FailUnsupported(const Scenario& scenario, int beforeLast) {
     FaultPlan plan{.files = MERGED, .requests = {Request::Sync}, .systemError = EINVAL};
     {
@@ -75,7 +75,7 @@ TEST_F(FileFaultTest, ReMergeCanBeRepeatedByTheNextMerge) {
   ExpectToSurvive(ReMerge(), FileErrors(MERGED, "merged database"));
 }
 
-TEST_F(FileFaultTest, RemovalLeavesNothingBehindForEver) {
+TEST_F(FileFaultTest, RemovalIsRepairedByTheNextMerge) {
   ExpectToSurvive(Removal(), FileErrors(MERGED, "merged database"));
 }
 
@@ -109,57 +109,57 @@ TEST_F(FileFaultTest, DatabaseThatCannotBeSyncedIsAFailure) {
   EXPECT_EQ(creation.before, Content());
 }
 
-// The process is stopped, or the appliance loses its power.
+// The process is killed, or the power fails.
 
-using StopTest = FileFaultTest;
+using CrashTest = FileFaultTest;
 
-TEST_F(StopTest, FirstMergeIsAllOrNothing) {
-  ExpectToSurvive(FirstMerge(), Stops(MERGED));
+TEST_F(CrashTest, FirstMergeIsAllOrNothing) {
+  ExpectToSurvive(FirstMerge(), Crashes(MERGED));
 }
 
-TEST_F(StopTest, FirstMergeWithoutADatabaseIsAllOrNothing) {
-  ExpectToSurvive(FirstMergeWithoutADatabase(), Stops(MERGED));
+TEST_F(CrashTest, FirstMergeWithoutADatabaseIsAllOrNothing) {
+  ExpectToSurvive(FirstMergeWithoutADatabase(), Crashes(MERGED));
 }
 
-TEST_F(StopTest, LaterMergeIsAllOrNothing) {
-  ExpectToSurvive(LaterMerge(), Stops(MERGED));
+TEST_F(CrashTest, LaterMergeIsAllOrNothing) {
+  ExpectToSurvive(LaterMerge(), Crashes(MERGED));
 }
 
-TEST_F(StopTest, ReMergeIsFinishedByTheNextMerge) {
-  ExpectToSurvive(ReMerge(), Stops(MERGED));
+TEST_F(CrashTest, ReMergeIsFinishedByTheNextMerge) {
+  ExpectToSurvive(ReMerge(), Crashes(MERGED));
 }
 
-TEST_F(StopTest, RemovalLeavesNothingBehindForEver) {
-  ExpectToSurvive(Removal(), Stops(MERGED));
+TEST_F(CrashTest, RemovalIsRepairedByTheNextMerge) {
+  ExpectToSurvive(Removal(), Crashes(MERGED));
 }
 
-TEST_F(StopTest, NewDatabaseIsCompleteOrNotThere) {
-  ExpectToSurvive(Creation(), Stops(MERGED));
+TEST_F(CrashTest, NewDatabaseIsCompleteOrNotThere) {
+  ExpectToSurvive(Creation(), Crashes(MERGED));
 }
 
-TEST_F(StopTest, NewDatabaseAmongLeftoversIsCompleteOrNotThere) {
-  ExpectToSurvive(CreationAmongLeftovers(), Stops(MERGED));
+TEST_F(CrashTest, NewDatabaseAmongLeftoversIsCompleteOrNotThere) {
+  ExpectToSurvive(CreationAmongLeftovers(), Crashes(MERGED));
 }
 
-TEST_F(StopTest, NewDatabaseLastsFromTheEndOfItsCreation) {
+TEST_F(CrashTest, NewDatabaseSurvivesAPowerLossAfterItsCreation) {
   const Scenario creation = Creation();
-  LosePowerBehind(creation.operation, MERGED);
+  LosePowerAfter(creation.operation, MERGED);
   EXPECT_EQ(creation.after, Content());
 }
 
-TEST_F(StopTest, RemovalOfAllVolumesCanBeRepeated) {
-  ExpectToSurvive(Clearing(), Stops(MERGED));
+TEST_F(CrashTest, RemovalOfAllVolumesCanBeRepeated) {
+  ExpectToSurvive(Clearing(), Crashes(MERGED));
 }
 
-// The volume's catalog cannot be read, or only half.
+// The volume's catalog cannot be read, or only a part of it.
 
 using CatalogFaultTest = FaultTest;
 
-TEST_F(CatalogFaultTest, FirstMergeTakesNoFailureForAnEmptyList) {
+TEST_F(CatalogFaultTest, FirstMergeDoesNotTakeAFailureForAnEmptyList) {
   ExpectToSurvive(FirstMerge(), FileErrors(CATALOG, "catalog"));
 }
 
-TEST_F(CatalogFaultTest, FirstMergeBesideALogTakesNoFailureForAnEmptyList) {
+TEST_F(CatalogFaultTest, FirstMergeWithALogDoesNotTakeAFailureForAnEmptyList) {
   Scenario scenario = FirstMerge();
   scenario.name = "a first merge beside a write-ahead log";
   const Database indexer(core::GetCatalogPath(VOLUME));
@@ -168,11 +168,11 @@ TEST_F(CatalogFaultTest, FirstMergeBesideALogTakesNoFailureForAnEmptyList) {
   ExpectToSurvive(scenario, FileErrors(CATALOG, "catalog"));
 }
 
-TEST_F(CatalogFaultTest, LaterMergeTakesNoFailureForAnEmptyList) {
+TEST_F(CatalogFaultTest, LaterMergeDoesNotTakeAFailureForAnEmptyList) {
   ExpectToSurvive(LaterMerge(), FileErrors(CATALOG, "catalog"));
 }
 
-TEST_F(CatalogFaultTest, ReMergeTakesNoFailureForAnEmptyList) {
+TEST_F(CatalogFaultTest, ReMergeDoesNotTakeAFailureForAnEmptyList) {
   ExpectToSurvive(ReMerge(), FileErrors(CATALOG, "catalog"));
 }
 

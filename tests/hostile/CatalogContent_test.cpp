@@ -1,5 +1,5 @@
-// Catalogs that SQLite finds nothing wrong with, and that are not what the indexer makes: other
-// objects in place of tables, other columns, other values, and far too much of it.
+// Catalogs that are valid for SQLite but not what the indexer makes: other objects in place of
+// tables, other columns, other values, and too many or too large ones.
 
 #include "HostileTest.h"
 
@@ -8,7 +8,7 @@
 namespace orva::test {
 namespace {
 
-/// A catalog with some photos, changed by these statements, and what may come of it.
+/// A catalog with some photos, changed by these statements, and the possible outcomes.
 struct Case {
   std::string name;
   std::vector<std::string> statements;
@@ -34,7 +34,7 @@ std::string Replaced(std::string text, const std::string& old, const std::string
   return text.replace(text.find(old), old.size(), by);
 }
 
-/// The Folders table anew, empty, with other columns.
+/// Replaces the Folders table by an empty one with other columns.
 std::vector<std::string> FoldersOf(const std::string& columns, std::vector<std::string> more = {}) {
   std::vector<std::string> statements{"DROP TABLE Folders",
                                       "CREATE TABLE Folders(" + columns + ")"};
@@ -42,31 +42,31 @@ std::vector<std::string> FoldersOf(const std::string& columns, std::vector<std::
   return statements;
 }
 
-/// Changes the text of a table in the schema and leaves its rows as they are.
+/// Changes the declaration of a table without its rows.
 std::vector<std::string> Redeclared(const std::string& table, const std::string& old,
                                     const std::string& by) {
   return {"PRAGMA writable_schema = ON", "UPDATE sqlite_schema SET sql = replace(sql, '" + old +
                                              "', '" + by + "') WHERE name = '" + table + "'"};
 }
 
-/// A folder of FoldersOf, without some column.
+/// Folders for a table of FoldersOf, without a value for the path.
 const std::string FOLDER_ROWS_BUT_PATH =
     "INSERT INTO Folders(id, folderId, name, category, lastModifiedDate, isBackup, isHidden, "
     "isSystem, isDeleted, status, lastUpdatedDate) " +
     Rows(100) + "SELECT x, -1, 'n', 4, 0, 0, 0, 0, 0, 0, 0 FROM n";
 
-/// Very many folders of one path, which are `deleted` or not.
+/// Very many folders with the same path, which are `deleted` or not.
 std::vector<std::string> FoldersOfOnePath(const std::string& deleted) {
   return {"INSERT INTO Folders " + Rows(TestScale(50'000, 1'000'000)) +
           "SELECT x + 10, -1, 'a/', 'a', 4, 0, 0, 0, 0, " + deleted + ", 0, 0 FROM n"};
 }
 
-/// Many rows of one file, and many transcodings of it with that `status`, beside some indices.
+/// Many rows of one file, and many transcodings of it with that `status`, with some indexes.
 std::vector<std::string> FilesTimesTranscodings(const std::string& status,
-                                                const std::vector<std::string>& indices = {}) {
+                                                const std::vector<std::string>& indexes = {}) {
   std::vector<std::string> statements{
       "DROP TABLE Files", "CREATE TABLE Files(" + Replaced(FILE_COLUMNS, " PRIMARY KEY", "") + ")"};
-  statements.insert(statements.end(), indices.begin(), indices.end());
+  statements.insert(statements.end(), indexes.begin(), indexes.end());
   statements.push_back("INSERT INTO Files " + Rows(30'000) +
                        "SELECT 1, -1, 'a.jpg', 'a.jpg', 3, 0, 0, 0, 0, 0, 3, 0, 'jpg', 0 FROM n");
   statements.push_back("INSERT INTO Transcodings " + Rows(30'000) +
@@ -76,12 +76,10 @@ std::vector<std::string> FilesTimesTranscodings(const std::string& status,
 }
 
 const std::string MEGABYTE = "hex(zeroblob(500000))";
-/// A second or two for the value of each row, in one call.
-const std::string DEAR_VALUE =
-    "instr(" + MEGABYTE + ", hex(zeroblob(200000)) || id || hex(zeroblob(200000)))";
+const std::string EXPENSIVE_VALUE = ExpensiveValue("id");
 
 const std::vector<Case> CASES = {
-    // Other objects than tables.
+    // Objects other than tables.
     {"FoldersAreAView",
      {"ALTER TABLE Folders RENAME TO Others", "CREATE VIEW Folders AS SELECT * FROM Others"},
      REFUSED},
@@ -111,11 +109,11 @@ const std::vector<Case> CASES = {
       "CREATE VIRTUAL TABLE Folders USING fts5(id, folderId, path, name, category, "
       "lastModifiedDate, isBackup, isHidden, isSystem, isDeleted, status, lastUpdatedDate)"},
      REFUSED},
-    {"TranscodingsAreATreeOfRectangles",
+    {"TranscodingsAreAnRTree",
      {"DROP TABLE Transcodings",
       "CREATE VIRTUAL TABLE Transcodings USING rtree(sourceId, status, lastUpdatedDate, +profile)"},
      REFUSED},
-    {"FoldersAreThePagesOfTheFile",
+    {"FoldersAreADbstatTable",
      {"DROP TABLE Folders", "CREATE VIRTUAL TABLE Folders USING dbstat"},
      REFUSED},
     {"TriggersInTheCatalog",
@@ -123,7 +121,7 @@ const std::vector<Case> CASES = {
       "CREATE TRIGGER b AFTER DELETE ON Files BEGIN DELETE FROM Folders; END"},
      MERGED_WELL},
 
-    // Columns that are computed.
+    // Computed columns.
     {"PathIsComputed",
      FoldersOf(Replaced(FOLDER_COLUMNS, "path TEXT", "path TEXT AS ('p' || id) VIRTUAL"),
                {FOLDER_ROWS_BUT_PATH}),
@@ -133,43 +131,45 @@ const std::vector<Case> CASES = {
                {FOLDER_ROWS_BUT_PATH}),
      REFUSED},
     {"PathTakesSecondsToCompute",
-     Redeclared("Folders", "path TEXT", "path TEXT AS (" + DEAR_VALUE + ") VIRTUAL"), REFUSED},
+     Redeclared("Folders", "path TEXT", "path TEXT AS (" + EXPENSIVE_VALUE + ") VIRTUAL"), REFUSED},
     {"PathIsStoredComputed",
      FoldersOf(Replaced(FOLDER_COLUMNS, "path TEXT", "path TEXT AS ('p' || id) STORED"),
                {FOLDER_ROWS_BUT_PATH}),
      REFUSED},
     {"FurtherColumnTakesSecondsToCompute",
      Redeclared("Folders", "lastUpdatedDate INTEGER",
-                "lastUpdatedDate INTEGER, more AS (" + DEAR_VALUE + ") VIRTUAL"),
+                "lastUpdatedDate INTEGER, more AS (" + EXPENSIVE_VALUE + ") VIRTUAL"),
      REFUSED},
     {"FlagTakesSecondsToCompute",
-     Redeclared("Files", "isHidden INTEGER", "isHidden INTEGER AS (" + DEAR_VALUE + ") VIRTUAL"),
+     Redeclared("Files", "isHidden INTEGER",
+                "isHidden INTEGER AS (" + EXPENSIVE_VALUE + ") VIRTUAL"),
      REFUSED},
     {"StatusOfTranscodingsTakesSecondsToCompute",
-     Redeclared("Transcodings", "status INTEGER", "status INTEGER AS (" + DEAR_VALUE + ") VIRTUAL"),
+     Redeclared("Transcodings", "status INTEGER",
+                "status INTEGER AS (" + EXPENSIVE_VALUE + ") VIRTUAL"),
      REFUSED},
 
-    // Rules that cost when they are asked.
+    // Checks, defaults and collations.
     {"ChecksThatTakeSeconds",
-     Redeclared("Folders", "path TEXT", "path TEXT CHECK (" + DEAR_VALUE + " >= 0)"), MERGED_WELL},
+     Redeclared("Folders", "path TEXT", "path TEXT CHECK (" + EXPENSIVE_VALUE + " >= 0)"),
+     MERGED_WELL},
     {"DefaultsThatTakeSeconds",
-     FoldersOf(FOLDER_COLUMNS + ", more DEFAULT (" + Replaced(DEAR_VALUE, "id", "1") + ")"),
-     EITHER},
+     FoldersOf(FOLDER_COLUMNS + ", more DEFAULT (" + ExpensiveValue("1") + ")"), EITHER},
     {"UnknownCollation", Redeclared("Transcodings", "profile TEXT", "profile TEXT COLLATE other"),
      REFUSED},
 
-    // What SQLite says about it would not fit into the log.
-    {"ErrorAsLongAsTheFileLikes",
+    // Error messages that are too long for the log.
+    {"ErrorWithALongTableName",
      {"PRAGMA writable_schema = ON",
       "UPDATE sqlite_schema SET name = printf('%.*c', 300000, 'x'), sql = 'CREATE TABLE (' WHERE "
       "name = 'Transcodings'"},
      REFUSED},
-    {"ErrorOfALongName",
+    {"ErrorWithALongColumnName",
      {"ALTER TABLE Folders ADD COLUMN more AS (1)",
       "ALTER TABLE Folders RENAME COLUMN isHidden TO \"" + std::string(300'000, 'x') + "\""},
      REFUSED},
 
-    // Other columns than there should be.
+    // Missing and additional columns.
     {"FolderColumnIsMissing", {"ALTER TABLE Folders DROP COLUMN isSystem"}, REFUSED},
     {"LastFolderColumnIsMissing", {"ALTER TABLE Folders DROP COLUMN lastUpdatedDate"}, MERGED_WELL},
     {"FileColumnIsMissing", {"ALTER TABLE Files DROP COLUMN size"}, REFUSED},
@@ -185,7 +185,7 @@ const std::vector<Case> CASES = {
                {"INSERT INTO Folders VALUES(1, -1, 'a/', 'a', 4, 11, 0, 0, 0, 0, 0, 0)"}),
      MERGED_WELL},
 
-    // Other values than there should be.
+    // Unexpected values.
     {"NullsEverywhere",
      {"INSERT INTO Folders DEFAULT VALUES", "INSERT INTO Files DEFAULT VALUES",
       "INSERT INTO Transcodings DEFAULT VALUES", "UPDATE Files SET path = NULL, name = NULL",
@@ -195,7 +195,7 @@ const std::vector<Case> CASES = {
      {"UPDATE Folders SET path = 'a' || char(0) || 'b/', name = char(0)",
       "UPDATE Files SET path = char(0) || path, name = char(0), ext = char(0)"},
      MERGED_WELL},
-    {"TextThatIsNoUtf8",
+    {"InvalidUtf8",
      {"UPDATE Folders SET path = CAST(x'fffe80c3' AS TEXT)",
       "UPDATE Files SET path = CAST(x'c0afed' AS TEXT), name = CAST(x'c0af' AS TEXT)"},
      MERGED_WELL},
@@ -217,18 +217,18 @@ const std::vector<Case> CASES = {
       "UPDATE Files SET lastModifiedDate = 4294967297, status = 4294967299",
       "UPDATE Transcodings SET lastUpdatedDate = 9223372036854775807"},
      MERGED_WELL},
-    {"PathsThatLeadElsewhere",
+    {"PathsOutsideTheVolume",
      {"UPDATE Folders SET path = '../Good/' || path", "UPDATE Files SET path = '/../../etc/passwd'",
       "INSERT INTO Folders(id, path, isBackup, isHidden, isSystem, isDeleted) VALUES(9, '../', 0, "
       "0, 0, 1), (10, '', 0, 0, 0, 1), (11, '/////', 0, 0, 0, 0)"},
      MERGED_WELL},
 
-    // Far too much of it.
+    // Too many and too large values.
     {"ManyFoldersOfOnePath", FoldersOfOnePath("0"), EITHER},
     {"ManyDeletedFoldersOfOnePath", FoldersOfOnePath("1"), EITHER},
     {"ProductOfFilesAndTranscodings", FilesTimesTranscodings("1"), REFUSED},
-    // Where the texts are compared before the ids are, and differ only at their ends.
-    {"ProductThatNeverMatches",
+    // With these indexes the texts are compared before the ids, and differ only at their ends.
+    {"ProductWithoutMatches",
      FilesTimesTranscodings("0", {"CREATE INDEX Files_id ON Files(id)",
                                   "CREATE INDEX Transcodings_source ON Transcodings(sourceId)"}),
      REFUSED},
@@ -246,8 +246,7 @@ const std::vector<Case> CASES = {
      {"ALTER TABLE Folders ADD COLUMN more",
       "UPDATE Folders SET more = zeroblob(" + std::to_string(64LL << 20U) + ") WHERE id = 1"},
      EITHER},
-    // Rows that end before their columns do: what is missing is the default of the column, which
-    // is in the file once.
+    // Rows without values for the last columns have their defaults, which are in the file once.
     {"LongDefaultInManyRows",
      {"DROP TABLE Folders", "CREATE TABLE Folders(id INTEGER PRIMARY KEY, folderId)",
       "INSERT INTO Folders " + Rows(100'000) + "SELECT x, -1 FROM n",
@@ -261,13 +260,13 @@ const std::vector<Case> CASES = {
       "ALTER TABLE Folders ADD COLUMN lastUpdatedDate"},
      REFUSED},
 
-    // Files of another make, with the same content.
+    // Other file formats with the same content.
     {"InUtf16", {}, MERGED_WELL},
     {"InSmallPages", {"PRAGMA page_size = 512", "VACUUM"}, MERGED_WELL},
     {"InLargePages", {"PRAGMA page_size = 65536", "VACUUM"}, MERGED_WELL},
-    {"InAFileThatShrinks", {"PRAGMA auto_vacuum = 1", "VACUUM"}, MERGED_WELL},
-    {"InAFileThatShrinksByAndBy", {"PRAGMA auto_vacuum = 2", "VACUUM"}, MERGED_WELL},
-    {"WithStatisticsThatLie",
+    {"WithFullAutoVacuum", {"PRAGMA auto_vacuum = 1", "VACUUM"}, MERGED_WELL},
+    {"WithIncrementalAutoVacuum", {"PRAGMA auto_vacuum = 2", "VACUUM"}, MERGED_WELL},
+    {"WithWrongStatistics",
      {"CREATE INDEX Transcodings_sourceId ON Transcodings(sourceId)", "ANALYZE",
       "UPDATE sqlite_stat1 SET stat = '1000000000 1'",
       "INSERT INTO sqlite_stat1 VALUES('Files', NULL, '99999999999999999999'), ('Folders', NULL, "
@@ -282,7 +281,7 @@ void PrintTo(const Case& tested, std::ostream* stream) {
 
 class CatalogContentTest : public HostileTest, public ::testing::WithParamInterface<Case> {};
 
-TEST_P(CatalogContentTest, Merge) {
+TEST_P(CatalogContentTest, IsMergedOrRefused) {
   std::filesystem::create_directories(core::GetORVA_HOME(VOLUME));
   if (GetParam().name == "InUtf16") {
     const Database catalog(CATALOG, true);
@@ -290,7 +289,7 @@ TEST_P(CatalogContentTest, Merge) {
     catalog.Run("CREATE TABLE Fixed(a)");
   }
   {
-    TestCatalog catalog(VOLUME);
+    Catalog catalog(VOLUME);
     AddPhotos(catalog);
   }
   {

@@ -1,5 +1,5 @@
-// A volume's catalog that is not what it should be as a file: not regular, cut, changed at random,
-// with a journal or a log that tells a tale.
+// Catalogs whose file is hostile: special, truncated or randomly changed files, and crafted
+// journals and logs.
 
 #include "HostileTest.h"
 #include "SpecialFile.h"
@@ -19,7 +19,7 @@ class CatalogFileTest : public HostileTest {
 protected:
   /// Makes a good catalog on the hostile volume, in pages of this size.
   static void MakeCatalog(const std::string& volume = VOLUME, int pageSize = 4096) {
-    TestCatalog catalog(volume);
+    Catalog catalog(volume);
     AddPhotos(catalog);
     catalog.Rows().Run("PRAGMA page_size = " + std::to_string(pageSize));
     catalog.Rows().Run("VACUUM");
@@ -40,20 +40,20 @@ protected:
 class SpecialCatalogTest : public CatalogFileTest,
                            public ::testing::WithParamInterface<SpecialKind> {};
 
-TEST_P(SpecialCatalogTest, CatalogIsNoRegularFile) {
+TEST_P(SpecialCatalogTest, CatalogThatIsNotARegularFileIsRefused) {
   MakeCatalog(DECOY);
   MakeCatalogFolder();
   const SpecialFile special(GetParam(), CATALOG, DECOY + ".orva/orva.db");
   EXPECT_EQ(Outcome::Refused, MergeHostileVolume());
 }
 
-TEST_P(SpecialCatalogTest, CatalogFolderIsNoFolder) {
+TEST_P(SpecialCatalogTest, CatalogFolderThatIsNotAFolderIsRefused) {
   MakeCatalog(DECOY);
   const SpecialFile special(GetParam(), core::GetORVA_HOME(VOLUME), DECOY + ".orva");
   EXPECT_EQ(Outcome::Refused, MergeHostileVolume());
 }
 
-TEST_P(SpecialCatalogTest, WhatLiesBesideTheCatalogIsNoRegularFile) {
+TEST_P(SpecialCatalogTest, LogThatIsNotARegularFileIsRefused) {
   MakeCatalog();
   SetWalMode();
   for (const char* const suffix : {"-journal", "-wal", "-shm"}) {
@@ -66,8 +66,8 @@ TEST_P(SpecialCatalogTest, WhatLiesBesideTheCatalogIsNoRegularFile) {
 INSTANTIATE_TEST_SUITE_P(Kinds, SpecialCatalogTest, ::testing::ValuesIn(SPECIAL_KINDS),
                          [](const auto& tested) { return NameOf(tested.param); });
 
-// The names of one file on one volume, which a program that may write only here can make.
-TEST_F(CatalogFileTest, SharedMemoryIsAnotherNameOfADearFile) {
+// Hard links, which a program that may write only here can make.
+TEST_F(CatalogFileTest, HardLinkAsTheSharedMemoryChangesNoOtherFile) {
   MakeCatalog();
   SetWalMode();
   fs::create_hard_link(VICTIM, CATALOG + "-shm");
@@ -75,14 +75,14 @@ TEST_F(CatalogFileTest, SharedMemoryIsAnotherNameOfADearFile) {
   EXPECT_NE(Outcome::Broken, MergeHostileVolume());
 }
 
-TEST_F(CatalogFileTest, JournalIsAnotherNameOfADearFile) {
+TEST_F(CatalogFileTest, HardLinkAsTheJournalChangesNoOtherFile) {
   MakeCatalog();
   fs::create_hard_link(VICTIM, CATALOG + "-journal");
   EXPECT_EQ(0, chown(CATALOG.c_str(), 1, 1));
   EXPECT_NE(Outcome::Broken, MergeHostileVolume());
 }
 
-TEST_F(CatalogFileTest, LogIsAnotherNameOfADearFile) {
+TEST_F(CatalogFileTest, HardLinkAsTheLogChangesNoOtherFile) {
   MakeCatalog();
   SetWalMode();
   fs::create_hard_link(VICTIM, CATALOG + "-wal");
@@ -90,7 +90,7 @@ TEST_F(CatalogFileTest, LogIsAnotherNameOfADearFile) {
   EXPECT_NE(Outcome::Broken, MergeHostileVolume());
 }
 
-TEST_F(CatalogFileTest, NothingThatIsADatabase) {
+TEST_F(CatalogFileTest, FilesThatAreNotDatabasesAreRefused) {
   MakeCatalogFolder();
   for (const std::string& content :
        {std::string("what is this"), std::string(100'000, 'x'), std::string(100'000, '\0'),
@@ -102,7 +102,7 @@ TEST_F(CatalogFileTest, NothingThatIsADatabase) {
   }
 }
 
-TEST_F(CatalogFileTest, EmptyFileWithAJournalKeepsIt) {
+TEST_F(CatalogFileTest, JournalOfAnEmptyFileIsNotPlayedBack) {
   MakeCatalog();
   const Bytes page = Page(1);
   Write(CATALOG, "");
@@ -123,7 +123,7 @@ TEST_F(CatalogFileTest, HotJournalIsNotPlayedBack) {
   }
 }
 
-TEST_F(CatalogFileTest, LogOfGarbageIsNoLog) {
+TEST_F(CatalogFileTest, GarbageLogIsIgnored) {
   MakeCatalog();
   SetWalMode();
   catalogHasWal = true;
@@ -139,7 +139,7 @@ TEST_F(CatalogFileTest, LogOfGarbageIsNoLog) {
   }
 }
 
-TEST_F(CatalogFileTest, LogThatClaimsAHugeDatabase) {
+TEST_F(CatalogFileTest, LogThatClaimsAHugeDatabaseIsRead) {
   MakeCatalog();
   SetWalMode();
   catalogHasWal = true;
@@ -149,7 +149,7 @@ TEST_F(CatalogFileTest, LogThatClaimsAHugeDatabase) {
   EXPECT_EQ(Outcome::Merged, MergeHostileVolume());
 }
 
-TEST_F(CatalogFileTest, CutAnywhere) {
+TEST_F(CatalogFileTest, TruncatedCatalogsAreMergedOrRefused) {
   constexpr std::size_t pageSize = 512;
   MakeCatalog(VOLUME, pageSize);
   const Bytes whole = Bytes::Of(CATALOG);
@@ -162,21 +162,7 @@ TEST_F(CatalogFileTest, CutAnywhere) {
   }
 }
 
-/// Changes some bytes: anywhere, or where a page keeps what leads elsewhere.
-void Mutate(Bytes& file, std::size_t pageSize, std::mt19937& random) {
-  const auto below = [&](std::size_t end) {
-    return std::uniform_int_distribution<std::size_t>(0, end - 1)(random);
-  };
-  const std::size_t changes = 1 + below(8);
-  for (std::size_t i = 0; i < changes; ++i) {
-    constexpr std::size_t headOfPage = 120;
-    const std::size_t page = below(file.Size() / pageSize) * pageSize;
-    const std::size_t offset = page + below(below(2) == 0 ? headOfPage : pageSize);
-    file[offset] = static_cast<std::uint8_t>(below(256));
-  }
-}
-
-TEST_F(CatalogFileTest, RandomBytesChanged) {
+TEST_F(CatalogFileTest, RandomlyChangedCatalogsAreMergedOrRefused) {
   constexpr std::size_t pageSize = 512;
   const unsigned mutants = TestScale(200U, 20'000U);
   MakeCatalog(VOLUME, pageSize);
@@ -193,7 +179,7 @@ TEST_F(CatalogFileTest, RandomBytesChanged) {
     fs::remove(CATALOG + "-shm");
     fs::remove(CATALOG + "-wal");
   }
-  // Mutants that are all refused, or all read, would not try much.
+  // If all mutants were refused, or all merged, the changes would test too little.
   EXPECT_LT(0U, merged);
   EXPECT_GT(mutants, merged);
   ReportFigure("mutants of a catalog merged, of them readable",

@@ -1,5 +1,4 @@
-// Catalogs whose pages are joined as SQLite never joins them: a small file that reads as a huge
-// one.
+// Catalogs in which several pages point to the same page: a small file that is read as a huge one.
 
 #include "HostileTest.h"
 
@@ -13,32 +12,27 @@ class CatalogPagesTest : public HostileTest {
 protected:
   CatalogPagesTest() { MakeCatalog(); }
 
-  /// Makes the catalog anew, with some photos.
+  /// Makes a new catalog with some photos.
   static void MakeCatalog() {
     std::filesystem::remove(CATALOG);
-    TestCatalog catalog(VOLUME);
+    Catalog catalog(VOLUME);
     AddPhotos(catalog);
-  }
-
-  static std::uint32_t RootOf(const std::string& name) {
-    return static_cast<std::uint32_t>(std::stoul(
-        Database(CATALOG).Run("SELECT rootpage FROM sqlite_schema WHERE name = ?", {name}).at(0)));
   }
 
   static void Run(const std::string& sql, const Database::Values& values = {}) {
     Database(CATALOG).Run(sql, values);
   }
 
-  /// Makes the rows of a table come again and again, 681 to the power of `levels` times.
+  /// Repeats the rows of a table, 681 to the power of `levels` times.
   static void Multiply(const std::string& table, unsigned levels) {
-    const std::uint32_t root = RootOf(table);
+    const std::uint32_t root = RootPage(CATALOG, table);
     CraftedDatabase catalog(CATALOG);
     catalog.Multiply(root, levels);
     catalog.Save();
   }
 };
 
-TEST_F(CatalogPagesTest, FoldersWithoutEnd) {
+TEST_F(CatalogPagesTest, EndlessFoldersAreMergedOrRefused) {
   for (const unsigned levels : {1U, 2U, 4U, 12U}) {
     SCOPED_TRACE(levels);
     MakeCatalog();
@@ -47,25 +41,25 @@ TEST_F(CatalogPagesTest, FoldersWithoutEnd) {
   }
 }
 
-TEST_F(CatalogPagesTest, HiddenFoldersWithoutEnd) {
+TEST_F(CatalogPagesTest, EndlessHiddenFoldersAreRefused) {
   Run("UPDATE Folders SET isHidden = 1");
   Multiply("Folders", 12);
   EXPECT_EQ(Outcome::Refused, MergeHostileVolume());
 }
 
-TEST_F(CatalogPagesTest, FilesWithoutEnd) {
+TEST_F(CatalogPagesTest, EndlessFilesAreRefused) {
   Multiply("Files", 12);
   EXPECT_EQ(Outcome::Refused, MergeHostileVolume());
 }
 
-// Files that no transcoding belongs to, so that nothing is read but counted.
-TEST_F(CatalogPagesTest, FilesToCountWithoutEnd) {
+// Files without transcodings are only counted.
+TEST_F(CatalogPagesTest, EndlessFilesToCountAreRefused) {
   Run("DELETE FROM Transcodings");
   Multiply("Files", 12);
   EXPECT_EQ(Outcome::Refused, MergeHostileVolume());
 }
 
-TEST_F(CatalogPagesTest, TranscodingsWithoutEnd) {
+TEST_F(CatalogPagesTest, EndlessTranscodingsAreRefused) {
   for (const std::string& profile :
        {std::string(notify::TRANSCODING_PROFILE), std::string("another")}) {
     SCOPED_TRACE(profile);
@@ -76,41 +70,41 @@ TEST_F(CatalogPagesTest, TranscodingsWithoutEnd) {
   }
 }
 
-TEST_F(CatalogPagesTest, EveryTableWithoutEnd) {
+TEST_F(CatalogPagesTest, EndlessTablesAreRefused) {
   Multiply("Folders", 12);
   Multiply("Files", 12);
   Multiply("Transcodings", 12);
   EXPECT_EQ(Outcome::Refused, MergeHostileVolume());
 }
 
-// What bounds the work in proportion to the file must not be had for nothing: a hole costs nothing.
-TEST_F(CatalogPagesTest, FoldersWithoutEndInAFileFullOfHoles) {
+// A sparse file must not raise the limits.
+TEST_F(CatalogPagesTest, EndlessFoldersInASparseFileAreRefused) {
   Multiply("Folders", 12);
   std::filesystem::resize_file(CATALOG, 1ULL << 40U);
   EXPECT_EQ(Outcome::Refused, MergeHostileVolume());
 }
 
-TEST_F(CatalogPagesTest, HiddenFoldersWithoutEndInAFileFullOfHoles) {
+TEST_F(CatalogPagesTest, EndlessHiddenFoldersInASparseFileAreRefused) {
   Run("UPDATE Folders SET isHidden = 1");
   Multiply("Folders", 12);
   std::filesystem::resize_file(CATALOG, 1ULL << 40U);
   EXPECT_EQ(Outcome::Refused, MergeHostileVolume());
 }
 
-TEST_F(CatalogPagesTest, HiddenFoldersWithoutEndBesideALogFullOfHoles) {
+TEST_F(CatalogPagesTest, EndlessHiddenFoldersWithASparseLogAreRefused) {
   Run("UPDATE Folders SET isHidden = 1");
   Multiply("Folders", 12);
   for (const char* const suffix : {"-journal", "-wal", "-shm"}) {
     SCOPED_TRACE(suffix);
     std::ofstream(CATALOG + suffix).flush();
     std::filesystem::resize_file(CATALOG + suffix, 1ULL << 40U);
-    catalogHasWal = true; // a log is one where the catalog does not say so, too
+    catalogHasWal = true; // SQLite looks at a log in every mode
     EXPECT_EQ(Outcome::Refused, MergeHostileVolume());
     std::filesystem::remove(CATALOG + suffix);
   }
 }
 
-TEST_F(CatalogPagesTest, HiddenFoldersWithoutEndInALogAboveAHole) {
+TEST_F(CatalogPagesTest, EndlessHiddenFoldersInTheLogOfASparseFileAreRefused) {
   Run("UPDATE Folders SET isHidden = 1");
   Run("PRAGMA journal_mode = WAL");
   Multiply("Folders", 12);
@@ -126,7 +120,7 @@ TEST_F(CatalogPagesTest, HiddenFoldersWithoutEndInALogAboveAHole) {
   EXPECT_EQ(Outcome::Refused, MergeHostileVolume());
 }
 
-TEST_F(CatalogPagesTest, FoldersWithoutEndInALogThatClaimsAHugeDatabase) {
+TEST_F(CatalogPagesTest, EndlessFoldersWithALogThatClaimsAHugeDatabaseAreRefused) {
   Run("UPDATE Folders SET isHidden = 1");
   Multiply("Folders", 12);
   Run("PRAGMA journal_mode = WAL");
@@ -137,18 +131,18 @@ TEST_F(CatalogPagesTest, FoldersWithoutEndInALogThatClaimsAHugeDatabase) {
   EXPECT_EQ(Outcome::Refused, MergeHostileVolume());
 }
 
-// A row of the schema that may come any number of times: that of an index without a text.
-TEST_F(CatalogPagesTest, SchemaWithoutEnd) {
+// The schema row of an index without SQL may be repeated.
+TEST_F(CatalogPagesTest, EndlessSchemaIsRefused) {
   Run("CREATE TABLE Last(a UNIQUE)");
   CraftedDatabase catalog(CATALOG);
   const std::uint32_t repeated = catalog.CopyOf(1);
   catalog.RepeatCell(repeated, catalog.Cells(repeated) - 1);
-  catalog.MultiplyBehind(1, repeated, 12);
+  catalog.MultiplyAfter(1, repeated, 12);
   catalog.Save();
   EXPECT_EQ(Outcome::Refused, MergeHostileVolume());
 }
 
-TEST_F(CatalogPagesTest, SchemaThatContainsItself) {
+TEST_F(CatalogPagesTest, SchemaThatContainsItselfIsRefused) {
   CraftedDatabase catalog(CATALOG);
   catalog.Multiply(1, 1);
   catalog.SetRightChild(1, 1);
@@ -156,8 +150,8 @@ TEST_F(CatalogPagesTest, SchemaThatContainsItself) {
   EXPECT_EQ(Outcome::Refused, MergeHostileVolume());
 }
 
-TEST_F(CatalogPagesTest, TableThatContainsItself) {
-  const std::uint32_t root = RootOf("Folders");
+TEST_F(CatalogPagesTest, TableThatContainsItselfIsRefused) {
+  const std::uint32_t root = RootPage(CATALOG, "Folders");
   CraftedDatabase catalog(CATALOG);
   catalog.Multiply(root, 1);
   catalog.SetRightChild(root, root);
@@ -165,13 +159,13 @@ TEST_F(CatalogPagesTest, TableThatContainsItself) {
   EXPECT_EQ(Outcome::Refused, MergeHostileVolume());
 }
 
-// One long path, in as many rows as there is room for: each with the same pages behind it.
-TEST_F(CatalogPagesTest, OneLongPathInAllRows) {
+// One long path in as many rows as fit on a page, which share its overflow pages.
+TEST_F(CatalogPagesTest, OneLongPathInAllFoldersIsRefused) {
   for (const unsigned levels : {0U, 1U, 12U}) {
     SCOPED_TRACE(levels);
     std::filesystem::remove(CATALOG);
-    TestCatalog(VOLUME).AddFolder(1, std::string(900'000, 'x') + "/");
-    const std::uint32_t root = RootOf("Folders");
+    Catalog(VOLUME).AddFolder(std::string(900'000, 'x') + "/");
+    const std::uint32_t root = RootPage(CATALOG, "Folders");
     CraftedDatabase catalog(CATALOG);
     catalog.RepeatCell(root, 0);
     if (levels > 0) {
@@ -182,11 +176,11 @@ TEST_F(CatalogPagesTest, OneLongPathInAllRows) {
   }
 }
 
-TEST_F(CatalogPagesTest, OneLongPathInAllFiles) {
+TEST_F(CatalogPagesTest, OneLongPathInAllFilesIsRefused) {
   std::filesystem::remove(CATALOG);
-  TestCatalog(VOLUME).AddPhoto(1, std::string(900'000, 'x'), 1, 1);
+  Catalog(VOLUME).AddPhoto(std::string(900'000, 'x'), 1, 1);
   for (const char* const table : {"Files", "Transcodings"}) {
-    const std::uint32_t root = RootOf(table);
+    const std::uint32_t root = RootPage(CATALOG, table);
     CraftedDatabase catalog(CATALOG);
     catalog.RepeatCell(root, 0);
     catalog.Save();
@@ -194,12 +188,12 @@ TEST_F(CatalogPagesTest, OneLongPathInAllFiles) {
   EXPECT_EQ(Outcome::Refused, MergeHostileVolume());
 }
 
-// Rows that are passed over, each with a megabyte to pass over.
-TEST_F(CatalogPagesTest, OneLongColumnInAllHiddenRows) {
+// Rows that are skipped, each with a megabyte to skip.
+TEST_F(CatalogPagesTest, OneLongPathInAllHiddenFoldersIsRefused) {
   std::filesystem::remove(CATALOG);
-  TestCatalog(VOLUME).Add(
+  Catalog(VOLUME).Add(
       FolderRow{.id = 1, .path = std::string(900'000, 'x') + "/", .isHidden = true});
-  const std::uint32_t root = RootOf("Folders");
+  const std::uint32_t root = RootPage(CATALOG, "Folders");
   CraftedDatabase catalog(CATALOG);
   catalog.RepeatCell(root, 0);
   catalog.Multiply(root, 12);

@@ -65,21 +65,12 @@ Bytes Bytes::Part(std::size_t offset, std::size_t size) const {
 
 CraftedDatabase::CraftedDatabase(const std::string& path)
     : path_(path), file_(Bytes::Of(path)), pageSize_(file_.Read(16, 2)) {
-  // A page of 65536 bytes does not fit its own field.
+  // 1 stands for 65536, which does not fit the field.
   pageSize_ = pageSize_ == 1 ? 65536 : pageSize_;
 }
 
 std::size_t CraftedDatabase::Header(std::uint32_t page) const {
   return Offset(page) + (page == 1 ? FILE_HEADER : 0);
-}
-
-std::uint32_t CraftedDatabase::FirstLeaf(std::uint32_t root) const {
-  std::uint32_t page = root;
-  while (file_.Read(Header(page), 1) == TABLE_INTERIOR) {
-    const std::uint32_t cell = file_.Read(Header(page) + INTERIOR_HEADER, 2);
-    page = file_.Read(Offset(page) + cell, 4);
-  }
-  return page;
 }
 
 std::uint32_t CraftedDatabase::Cells(std::uint32_t page) const {
@@ -102,10 +93,10 @@ void CraftedDatabase::RepeatCell(std::uint32_t page, std::uint32_t index) {
 }
 
 void CraftedDatabase::Multiply(std::uint32_t root, unsigned levels) {
-  MultiplyBehind(root, CopyOf(root), levels);
+  MultiplyAfter(root, CopyOf(root), levels);
 }
 
-void CraftedDatabase::MultiplyBehind(std::uint32_t root, std::uint32_t repeated, unsigned levels) {
+void CraftedDatabase::MultiplyAfter(std::uint32_t root, std::uint32_t repeated, unsigned levels) {
   const std::uint32_t original = CopyOf(root);
   std::uint32_t child = repeated;
   for (unsigned level = 1; level < levels; ++level) {
@@ -127,7 +118,7 @@ std::uint32_t CraftedDatabase::CopyOf(std::uint32_t page) {
     }
     return copy;
   }
-  // Behind a file's header the cells keep their places, and the page's header goes to the front.
+  // The cells keep their offsets, and the page's header moves to the beginning.
   for (std::size_t i = 0; i < pageSize_; ++i) {
     file_[Offset(copy) + i] = file_[Offset(page) + i];
   }
@@ -145,7 +136,7 @@ void CraftedDatabase::SetRightChild(std::uint32_t page, std::uint32_t child) {
 
 void CraftedDatabase::Save() {
   file_.Write(28, 4, Pages());
-  // The page count holds for this change of the file.
+  // The page count is valid for this change counter.
   file_.Write(92, 4, file_.Read(24, 4));
   file_.Save(path_);
 }
@@ -162,7 +153,7 @@ void CraftedDatabase::MakeInterior(std::uint32_t page, std::uint32_t first, std:
   const std::uint32_t otherCell = pageSize_ - 2 * cellSize;
   for (const auto& [cell, child] : {std::pair(firstCell, first), std::pair(otherCell, repeated)}) {
     file_.Write(Offset(page) + cell, 4, child);
-    file_.Write(Offset(page) + cell + 4, 1, 0x7f); // a key behind those that tests give
+    file_.Write(Offset(page) + cell + 4, 1, 0x7f); // a key after those that tests use
   }
   const std::size_t header = Header(page);
   const std::size_t pointers = header + INTERIOR_HEADER;

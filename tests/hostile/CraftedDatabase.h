@@ -34,38 +34,33 @@ private:
   std::vector<std::uint8_t> bytes_;
 };
 
-/// An SQLite file whose pages are patched behind SQLite's back. Pages count from 1.
+/// An SQLite file whose pages a test changes without SQLite. Pages count from 1.
 class CraftedDatabase {
 public:
-  /// Loads the file, which nobody has open and which has no log beside it.
+  /// Loads the file, which is not open and has no log.
   explicit CraftedDatabase(const std::string& path);
 
   std::uint32_t PageSize() const { return pageSize_; }
   std::uint32_t Pages() const { return static_cast<std::uint32_t>(file_.Size() / pageSize_); }
 
-  /// The leftmost leaf of the b-tree at `root`.
-  std::uint32_t FirstLeaf(std::uint32_t root) const;
-
   /// The number of cells on a b-tree page.
   std::uint32_t Cells(std::uint32_t page) const;
 
-  /// Makes a leaf show its cell `index` as often as a page can have cells, instead of all others.
+  /// Replaces the cells of a leaf by as many pointers to its cell `index` as fit.
   void RepeatCell(std::uint32_t page, std::uint32_t index);
 
-  /// Moves the content of the root page into new pages and puts `levels` levels of interior pages
-  /// above it, all cells of which point to the same child. The last child of the topmost level is
-  /// the original, so that the tree holds what it held, and all else over and over.
+  /// Puts `levels` levels of interior pages above the content of the root page. All cells of a
+  /// level point to the same page, so that the tree has its content many times over.
   void Multiply(std::uint32_t root, unsigned levels);
 
-  /// The same with the root's content first: `repeated`, a leaf page, comes over and over behind
-  /// it.
-  void MultiplyBehind(std::uint32_t root, std::uint32_t repeated, unsigned levels);
+  /// The same with the root's content once, followed by many times `repeated`, a leaf page.
+  void MultiplyAfter(std::uint32_t root, std::uint32_t repeated, unsigned levels);
 
-  /// A new page with a copy of another page's content, which on the first page begins behind the
+  /// A new page with a copy of another page's content, which on the first page begins after the
   /// file's header.
   std::uint32_t CopyOf(std::uint32_t page);
 
-  /// The page that the rightmost or `cell`th pointer of an interior page leads to.
+  /// Sets the rightmost pointer of an interior page.
   void SetRightChild(std::uint32_t page, std::uint32_t child);
 
   Bytes& File() { return file_; }
@@ -73,7 +68,7 @@ public:
   std::size_t Offset(std::uint32_t page) const { return std::size_t{page - 1} * pageSize_; }
   std::size_t Header(std::uint32_t page) const;
 
-  /// Writes the file back, with the header's page count set right.
+  /// Writes the file, with the right page count in its header.
   void Save();
 
 private:

@@ -44,15 +44,15 @@ Lines ErrorsIn(const Log& log) {
   return errors;
 }
 
-/// Whether a log ends with the lines of a good merge of the good volume.
+/// Whether a log ends with the lines of a successful merge of the good volume.
 bool EndsWithGoodMerge(const Log& log, int files) {
   const Log good = MergeLines(GOOD, GOOD_FOLDERS, files);
   return log.size() >= good.size() &&
          std::equal(good.begin(), good.end(), log.end() - static_cast<long>(good.size()));
 }
 
-/// All that the good volume and the daemon itself have in a merged database. Ids of rows that
-/// come after those of another volume are not the same.
+/// The rows of the good volume and of the daemon itself in a merged database. Without their ids,
+/// which depend on the rows of other volumes.
 Lines GoodContent(const std::string& location) {
   Lines content = MergedRows(location, "SELECT * FROM Status");
   for (const char* const sql :
@@ -62,15 +62,13 @@ Lines GoodContent(const std::string& location) {
         "'/shares/Good/') ORDER BY 1",
         "SELECT o.name || f.name, f.modified_date, f.created_date FROM Files f LEFT JOIN Folders "
         "o ON o.folder_id = f.folder_id WHERE f.volume = '/shares/Good/' ORDER BY 1"}) {
-    for (const std::string& row : MergedRows(location, sql)) {
-      content.push_back(row);
-    }
+    content = content + MergedRows(location, sql);
   }
   return content;
 }
 
-/// Rows that a merge of the hostile volume must not have brought.
-Lines StrangeRows(const std::string& location) {
+/// Rows that a merge of the hostile volume must not add.
+Lines UnexpectedRows(const std::string& location) {
   return MergedRows(location,
                     "SELECT name, volume FROM Folders WHERE volume NOT IN ('<DUMMY>', "
                     "'/shares/Good/') AND (volume != '/shares/Vol/' OR substr(name, 1, 12) != "
@@ -85,14 +83,14 @@ HostileTest::HostileTest() {
   for (const std::string& directory : {MASTER, VOLUME, SPARE, DECOY}) {
     MakeDirectory(directory);
   }
-  std::ofstream(VICTIM) << "dear content";
-  std::ofstream("/tmp/victim") << "dear content";
-  TestCatalog good(GOOD);
+  std::ofstream(VICTIM) << "content";
+  std::ofstream("/tmp/victim") << "content";
+  Catalog good(GOOD);
   AddPhotos(good);
   Attempt::Run({{"merge", MASTER, GOOD}});
   merged_ = Bytes::Of(MERGED);
 
-  good.AddPhoto(4, "a/new.jpg", 24, 400);
+  good.AddPhoto("a/new.jpg", 24, 400);
   usualMemory_ = Attempt::Run({{"merge", MASTER, GOOD}}).peakMemory;
   goodContent_ = GoodContent(MASTER);
   RestoreMaster();
@@ -119,7 +117,7 @@ HostileTest::Outcome HostileTest::MergeHostileVolume() {
   EXPECT_THAT(attempt.thrown, ::testing::ElementsAre("", ""));
   EXPECT_TRUE(EndsWithGoodMerge(log, 1)) << ::testing::PrintToString(log);
   EXPECT_EQ(goodContent_, GoodContent(MASTER));
-  EXPECT_THAT(StrangeRows(MASTER), ::testing::IsEmpty());
+  EXPECT_THAT(UnexpectedRows(MASTER), ::testing::IsEmpty());
   EXPECT_THAT(MergedRows(MASTER, "PRAGMA integrity_check"), ::testing::ElementsAre("ok"));
 
   const Lines errors = ErrorsIn(log);
@@ -160,9 +158,7 @@ std::vector<std::string> HostileTest::UseHostileMaster() {
     fs::remove(LOCATOR_PATH);
   }
 
-  std::vector<std::string> results = ErrorsIn(log);
-  results.insert(results.end(), attempt.thrown.begin(), attempt.thrown.end());
-  return results;
+  return ErrorsIn(log) + attempt.thrown;
 }
 
 void HostileTest::RestoreMaster() const {
@@ -203,12 +199,12 @@ void HostileTest::CheckMemory(const Attempt& attempt) const {
       << content << " bytes are on the volume";
 }
 
-void AddPhotos(TestCatalog& catalog) {
-  catalog.AddFolder(1, "a/", 11);
-  catalog.AddFolder(2, "a/b/", 12);
-  catalog.AddPhoto(1, "top.jpg", 21, 100);
-  catalog.AddPhoto(2, "a/one.jpg", 22, 300);
-  catalog.AddPhoto(3, "a/b/two.jpg", 23, 200);
+void AddPhotos(Catalog& catalog) {
+  catalog.AddFolder("a/", 11);
+  catalog.AddFolder("a/b/", 12);
+  catalog.AddPhoto("top.jpg", 21, 100);
+  catalog.AddPhoto("a/one.jpg", 22, 300);
+  catalog.AddPhoto("a/b/two.jpg", 23, 200);
 }
 
 void MakeCatalogFolder() {
@@ -224,6 +220,29 @@ long long BytesOnMedium(const std::string& path) {
     }
   }
   return bytes;
+}
+
+std::uint32_t RootPage(const std::string& database, const std::string& name) {
+  return static_cast<std::uint32_t>(std::stoul(
+      Database(database).Run("SELECT rootpage FROM sqlite_schema WHERE name = ?", {name}).at(0)));
+}
+
+void Mutate(Bytes& file, std::size_t pageSize, std::mt19937& random) {
+  const auto below = [&](std::size_t end) {
+    return std::uniform_int_distribution<std::size_t>(0, end - 1)(random);
+  };
+  const std::size_t changes = 1 + below(8);
+  for (std::size_t i = 0; i < changes; ++i) {
+    constexpr std::size_t headOfPage = 120;
+    const std::size_t page = below(file.Size() / pageSize) * pageSize;
+    const std::size_t offset = page + below(below(2) == 0 ? headOfPage : pageSize);
+    file[offset] = static_cast<std::uint8_t>(below(256));
+  }
+}
+
+std::string ExpensiveValue(const std::string& term) {
+  return "instr(hex(zeroblob(500000)), hex(zeroblob(200000)) || " + term +
+         " || hex(zeroblob(200000)))";
 }
 
 std::string Rows(int count) {

@@ -1,6 +1,5 @@
-// The merged database that a plugged volume brings along, when that becomes the master: SQLite's
-// own program in its schema, pages joined as SQLite never joins them, and a past that it would
-// have SQLite undo.
+// Hostile merged databases on a volume that becomes the master: with triggers, views and computed
+// values, with pages that several pages point to, and with crafted journals and logs.
 
 #include "HostileTest.h"
 #include "SpecialFile.h"
@@ -18,7 +17,7 @@ using ::testing::HasSubstr;
 using ::testing::SizeIs;
 using ::testing::StartsWith;
 
-/// A merged database, changed by these statements, and what may come of it.
+/// A merged database, changed by these statements, and the possible outcomes.
 struct Case {
   std::string name;
   std::vector<std::string> statements;
@@ -29,9 +28,7 @@ const auto WORKS = Case::Expected::Works;
 const auto REFUSED = Case::Expected::Refused;
 const auto EITHER = Case::Expected::Either;
 
-/// Seconds for one value, in one call.
-const std::string DEAR_VALUE =
-    "instr(hex(zeroblob(500000)), hex(zeroblob(200000)) || 'x' || hex(zeroblob(200000)))";
+const std::string EXPENSIVE_VALUE = ExpensiveValue("'x'");
 
 std::vector<std::string> TriggersOn(const std::string& table, const std::string& action) {
   std::vector<std::string> triggers;
@@ -54,17 +51,17 @@ std::vector<std::string> TriggersOnAll(const std::string& action,
   return first;
 }
 
-/// The Files table anew, empty, with `column` in place of its created_date, and `behind` it.
-std::vector<std::string> FilesWith(const std::string& column, const std::string& behind = "") {
+/// Replaces the Files table by an empty one with `column` instead of its created_date, and `more`.
+std::vector<std::string> FilesWith(const std::string& column, const std::string& more = "") {
   return {"DROP TABLE Files",
           "CREATE TABLE Files(file_id INTEGER PRIMARY KEY AUTOINCREMENT, folder_id INTEGER NOT "
           "NULL, name TEXT NOT NULL, modified_date INTEGER NOT NULL, volume TEXT NOT NULL, " +
-              column + behind + ")"};
+              column + more + ")"};
 }
 
 const std::string CREATED = "created_date INTEGER NOT NULL";
 
-std::vector<std::string> ManyIndices(int count) {
+std::vector<std::string> ManyIndexes(int count) {
   std::vector<std::string> statements{"BEGIN"};
   for (int i = 0; i < count; ++i) {
     statements.push_back("CREATE INDEX more" + std::to_string(i) + " ON Files(name)");
@@ -91,7 +88,7 @@ const std::vector<Case> CASES = {
      {"DROP TABLE Status", "CREATE VIEW Status(id, mc_version, mdate, desc, etype) AS " + ENDLESS +
                                "SELECT x, 'v', 1, 'd', 1 FROM n WHERE x < 0"},
      REFUSED},
-    {"ViewThatTakesWhatIsWritten",
+    {"ViewWithAnInsertTrigger",
      {"ALTER TABLE Files RENAME TO Others", "CREATE VIEW Files AS SELECT * FROM Others",
       "CREATE TRIGGER t INSTEAD OF INSERT ON Files BEGIN DELETE FROM Folders; END"},
      REFUSED},
@@ -99,18 +96,20 @@ const std::vector<Case> CASES = {
      {"DROP TABLE Files", "CREATE VIRTUAL TABLE Files USING fts5(file_id, folder_id, name, "
                           "modified_date, volume, created_date)"},
      REFUSED},
-    {"FoldersAreThePagesOfTheFile",
+    {"FoldersAreADbstatTable",
      {"DROP TABLE Folders", "CREATE VIRTUAL TABLE Folders USING dbstat"},
      REFUSED},
-    {"GeneratedColumn", FilesWith(CREATED, ", more AS (" + DEAR_VALUE + ")"), REFUSED},
-    {"StoredGeneratedColumn", FilesWith(CREATED, ", more AS (" + DEAR_VALUE + ") STORED"), REFUSED},
-    {"ChecksThatTakeSeconds", FilesWith(CREATED + " CHECK (" + DEAR_VALUE + " >= 0)"), WORKS},
-    {"DefaultsThatTakeSeconds", FilesWith(CREATED, ", more DEFAULT (" + DEAR_VALUE + ")"), REFUSED},
+    {"GeneratedColumn", FilesWith(CREATED, ", more AS (" + EXPENSIVE_VALUE + ")"), REFUSED},
+    {"StoredGeneratedColumn", FilesWith(CREATED, ", more AS (" + EXPENSIVE_VALUE + ") STORED"),
+     REFUSED},
+    {"ChecksThatTakeSeconds", FilesWith(CREATED + " CHECK (" + EXPENSIVE_VALUE + " >= 0)"), WORKS},
+    {"DefaultsThatTakeSeconds", FilesWith(CREATED, ", more DEFAULT (" + EXPENSIVE_VALUE + ")"),
+     REFUSED},
     {"IndexOnAnExpression", {"CREATE INDEX more ON Files(name || 'x')"}, REFUSED},
     {"IndexOnPartOfTheRows", {"CREATE INDEX more ON Files(name) WHERE length(name) > 1"}, REFUSED},
-    // References are not followed, whatever they ask for when a row goes.
-    {"ReferencesThatSetADearDefault",
-     {"CREATE TABLE Others(a DEFAULT (" + DEAR_VALUE +
+    // References are not followed, with any action for a deleted row.
+    {"ReferencesThatSetAnExpensiveDefault",
+     {"CREATE TABLE Others(a DEFAULT (" + EXPENSIVE_VALUE +
           ") REFERENCES Folders(folder_id) ON DELETE SET DEFAULT)",
       "INSERT INTO Others " + Rows(20) + "SELECT folder_id FROM Folders, n WHERE folder_id > 1"},
      WORKS},
@@ -152,15 +151,15 @@ const std::vector<Case> CASES = {
      {"INSERT INTO Status(mc_version, mdate) " + Rows(TestScale(100'000, 1'000'000)) +
       "SELECT 'x', 0 FROM n"},
      EITHER},
-    {"FoldersOfTheirOwn", {"UPDATE Folders SET parent_folder_id = folder_id"}, EITHER},
-    {"ManyIndices", ManyIndices(TestScale(500, 5'000)), EITHER},
+    {"FoldersThatAreTheirOwnParents", {"UPDATE Folders SET parent_folder_id = folder_id"}, EITHER},
+    {"ManyIndexes", ManyIndexes(TestScale(500, 5'000)), EITHER},
     {"RowsThatReplaceOthers", FilesWith("created_date INTEGER UNIQUE ON CONFLICT REPLACE"), EITHER},
 
     {"InAWriteAheadLog", {"PRAGMA journal_mode = WAL"}, WORKS},
     {"InSmallPages", {"PRAGMA page_size = 512", "VACUUM"}, WORKS},
     {"InLargePages", {"PRAGMA page_size = 65536", "VACUUM"}, WORKS},
-    {"InAFileThatShrinks", {"PRAGMA auto_vacuum = 1", "VACUUM"}, WORKS},
-    {"WithStatisticsThatLie",
+    {"WithAutoVacuum", {"PRAGMA auto_vacuum = 1", "VACUUM"}, WORKS},
+    {"WithWrongStatistics",
      {"ANALYZE", "UPDATE sqlite_stat1 SET stat = '1000000000 1000000000'"},
      WORKS},
 };
@@ -174,7 +173,7 @@ protected:
   /// Uses the master and expects everything to work.
   void ExpectUsable() { EXPECT_THAT(UseHostileMaster(), ElementsAre("", "", "", "", "", "")); }
 
-  /// Uses the master and expects that nothing but that can be done; each operation says so.
+  /// Uses the master and expects every operation on its database to fail.
   void ExpectRefused() {
     const auto results = UseHostileMaster();
     ASSERT_THAT(results, SizeIs(7));
@@ -190,16 +189,11 @@ protected:
       merged.Run(statement);
     }
   }
-
-  static std::uint32_t RootOf(const std::string& name) {
-    return static_cast<std::uint32_t>(std::stoul(
-        Database(MERGED).Run("SELECT rootpage FROM sqlite_schema WHERE name = ?", {name}).at(0)));
-  }
 };
 
 class MergedContentTest : public MergedDatabaseTest, public ::testing::WithParamInterface<Case> {};
 
-TEST_P(MergedContentTest, Master) {
+TEST_P(MergedContentTest, MasterWorksOrIsRefused) {
   Run(GetParam().statements);
   switch (GetParam().expected) {
   case Case::Expected::Works:
@@ -225,12 +219,12 @@ TEST_F(MergedDatabaseTest, TriggersWriteNothing) {
 
 // Pages.
 
-TEST_F(MergedDatabaseTest, RowsWithoutEnd) {
+TEST_F(MergedDatabaseTest, OperationsOnEndlessRowsEnd) {
   for (const char* const table : {"Status", "Statistics", "Folders", "Files", "sqlite_sequence"}) {
     for (const unsigned levels : {1U, 12U}) {
       SCOPED_TRACE(std::string(table) + " " + std::to_string(levels));
       RestoreMaster();
-      const std::uint32_t root = RootOf(table);
+      const std::uint32_t root = RootPage(MERGED, table);
       CraftedDatabase merged(MERGED);
       merged.Multiply(root, levels);
       merged.Save();
@@ -239,35 +233,35 @@ TEST_F(MergedDatabaseTest, RowsWithoutEnd) {
   }
 }
 
-TEST_F(MergedDatabaseTest, RowsWithoutEndAndNoIndices) {
+TEST_F(MergedDatabaseTest, OperationsOnEndlessRowsWithoutIndexesFail) {
   for (const char* const table : {"Folders", "Files"}) {
     SCOPED_TRACE(table);
     RestoreMaster();
     Run({"DROP INDEX Folders_folderId", "DROP INDEX Folders_path", "DROP INDEX Files_folderId",
          "DROP INDEX Files_name"});
-    const std::uint32_t root = RootOf(table);
+    const std::uint32_t root = RootPage(MERGED, table);
     CraftedDatabase merged(MERGED);
     merged.Multiply(root, 12);
     merged.Save();
-    // Rows that go twice show that the file is broken before they are too many.
+    // SQLite may notice repeated rows before they are too many.
     EXPECT_THAT(UseHostileMaster(),
                 Contains(::testing::AnyOf(HasSubstr("more work"), HasSubstr("malformed"))));
   }
 }
 
-TEST_F(MergedDatabaseTest, SchemaWithoutEnd) {
+TEST_F(MergedDatabaseTest, EndlessSchemaIsRefused) {
   Run({"CREATE TABLE Last(a UNIQUE)"});
   CraftedDatabase merged(MERGED);
   const std::uint32_t repeated = merged.CopyOf(1);
   merged.RepeatCell(repeated, merged.Cells(repeated) - 1);
-  merged.MultiplyBehind(1, repeated, 12);
+  merged.MultiplyAfter(1, repeated, 12);
   merged.Save();
   ExpectRefused();
 }
 
 // Files.
 
-TEST_F(MergedDatabaseTest, NothingThatIsADatabase) {
+TEST_F(MergedDatabaseTest, FilesThatAreNotDatabasesAreRefused) {
   for (const std::string& content : {std::string("what is this"), std::string(100'000, 'x'),
                                      std::string("SQLite format 3\0", 16)}) {
     SCOPED_TRACE(content.size());
@@ -276,7 +270,7 @@ TEST_F(MergedDatabaseTest, NothingThatIsADatabase) {
   }
 }
 
-TEST_F(MergedDatabaseTest, CutAnywhere) {
+TEST_F(MergedDatabaseTest, OperationsOnTruncatedDatabasesEnd) {
   const Bytes whole = Bytes::Of(MERGED);
   for (std::size_t size = 0; size < whole.Size(); size += 4096) {
     for (const std::size_t more : {0U, 1U, 4095U}) {
@@ -288,31 +282,25 @@ TEST_F(MergedDatabaseTest, CutAnywhere) {
   }
 }
 
-TEST_F(MergedDatabaseTest, RandomBytesChanged) {
+TEST_F(MergedDatabaseTest, OperationsOnRandomlyChangedDatabasesEnd) {
   const unsigned mutants = TestScale(50U, 5'000U);
   Run({"PRAGMA page_size = 512", "VACUUM"});
   const Bytes whole = Bytes::Of(MERGED);
   for (unsigned seed = 0; seed < mutants && !HasFailure(); ++seed) {
     SCOPED_TRACE("seed " + std::to_string(seed));
     std::mt19937 random(seed);
-    const auto below = [&](std::size_t end) {
-      return std::uniform_int_distribution<std::size_t>(0, end - 1)(random);
-    };
     RestoreMaster();
     Bytes mutant = whole;
-    for (std::size_t changes = 1 + below(8); changes > 0; --changes) {
-      mutant[below(mutant.Size() / 512) * 512 + below(below(2) == 0 ? 120 : 512)] =
-          static_cast<std::uint8_t>(below(256));
-    }
+    Mutate(mutant, 512, random);
     mutant.Save(MERGED);
     UseHostileMaster();
   }
   ReportFigure("mutants of a merged database used as the master's", std::to_string(mutants));
 }
 
-// What undoing a transaction touches beyond the database.
+// Rollback journals and logs.
 
-TEST_F(MergedDatabaseTest, JournalThatNamesAFileElsewhere) {
+TEST_F(MergedDatabaseTest, JournalDoesNotDeleteTheFileThatItNames) {
   const Bytes page = Bytes::Of(MERGED).Part(0, 4096);
   for (const std::string& victim :
        {VICTIM, std::string("/tmp/victim"), MASTER + "../Decoy/victim"}) {
@@ -330,8 +318,7 @@ TEST_F(MergedDatabaseTest, JournalThatNamesAFileElsewhere) {
   }
 }
 
-// The same, with something behind the name, where SQLite looks from the front.
-TEST_F(MergedDatabaseTest, JournalOfGarbage) {
+TEST_F(MergedDatabaseTest, JournalDoesNotEnlargeTheDatabase) {
   const Bytes page = Bytes::Of(MERGED).Part(0, 4096);
   for (const std::uint32_t pages : {0U, 1U, 1000U, 0x7fffffffU}) {
     SCOPED_TRACE(pages);
@@ -342,14 +329,14 @@ TEST_F(MergedDatabaseTest, JournalOfGarbage) {
   }
 }
 
-TEST_F(MergedDatabaseTest, JournalWhoseOwnerIsNotTheDatabases) {
+TEST_F(MergedDatabaseTest, HardLinkAsTheJournalChangesNoOtherFile) {
   fs::remove(MERGED + "-journal");
   fs::create_hard_link(VICTIM, MERGED + "-journal");
   ASSERT_EQ(0, chown(MERGED.c_str(), 1, 1));
   UseHostileMaster();
 }
 
-TEST_F(MergedDatabaseTest, LogOfAnotherDatabase) {
+TEST_F(MergedDatabaseTest, LogDoesNotEnlargeTheDatabase) {
   Run({"PRAGMA journal_mode = WAL"});
   Bytes page = Bytes::Of(MERGED).Part(0, 4096);
   page.Write(28, 4, 0x7fffffff);
@@ -362,12 +349,12 @@ TEST_F(MergedDatabaseTest, LogOfAnotherDatabase) {
   }
 }
 
-TEST_F(MergedDatabaseTest, AnotherNameOfADearFile) {
+TEST_F(MergedDatabaseTest, HardLinkAsTheDatabaseOrItsLogsChangesNoOtherFile) {
   for (const char* const suffix : {"", "-journal", "-wal", "-shm"}) {
     SCOPED_TRACE(suffix);
     RestoreMaster();
     Run({"PRAGMA journal_mode = WAL"});
-    // The database itself would have to be one to be written to.
+    // Only a valid database is written.
     const std::string name = MERGED + suffix;
     if (*suffix == '\0') {
       fs::copy_file(MERGED, DECOY + "other.db");

@@ -1,4 +1,4 @@
-// What stands at the names that the daemon writes to, and is no file of its own.
+// Special files and hard links at the names that the daemon writes to.
 
 #include "HostileTest.h"
 #include "SpecialFile.h"
@@ -16,7 +16,7 @@ using ::testing::StartsWith;
 
 class PlacesTest : public HostileTest, public ::testing::WithParamInterface<SpecialKind> {};
 
-TEST_P(PlacesTest, MergedDatabase) {
+TEST_P(PlacesTest, SpecialFileAsTheMergedDatabaseIsRefused) {
   fs::copy_file(MERGED, DECOY + "other.db");
   const SpecialFile special(GetParam(), MERGED, DECOY + "other.db");
   const auto results = UseHostileMaster();
@@ -24,7 +24,7 @@ TEST_P(PlacesTest, MergedDatabase) {
   EXPECT_THAT(results[0], StartsWith("Error that we will ignore "));
 }
 
-TEST_P(PlacesTest, BesideTheMergedDatabase) {
+TEST_P(PlacesTest, SpecialFileAsALogIsRefused) {
   for (const char* const suffix : {"-journal", "-wal", "-shm"}) {
     SCOPED_TRACE(suffix);
     const SpecialFile special(GetParam(), MERGED + suffix, VICTIM);
@@ -34,7 +34,7 @@ TEST_P(PlacesTest, BesideTheMergedDatabase) {
   }
 }
 
-TEST_P(PlacesTest, BesideAMergedDatabaseThatIsToBeMade) {
+TEST_P(PlacesTest, SpecialFileBesideANewDatabaseChangesNoOtherFile) {
   for (const char* const suffix :
        {"-journal", "-wal", "-shm", ".new", ".new-journal", ".new-wal", ".new-shm"}) {
     SCOPED_TRACE(suffix);
@@ -44,7 +44,7 @@ TEST_P(PlacesTest, BesideAMergedDatabaseThatIsToBeMade) {
   }
 }
 
-TEST_P(PlacesTest, FolderOfTheMergedDatabase) {
+TEST_P(PlacesTest, SpecialFileAsTheFolderIsRefused) {
   const std::string folder = MASTER + ".zophotos";
   fs::rename(folder, DECOY + "folder");
   const SpecialFile special(GetParam(), folder, DECOY + "folder");
@@ -57,7 +57,7 @@ TEST_P(PlacesTest, FolderOfTheMergedDatabase) {
   }
 }
 
-TEST_P(PlacesTest, Locator) {
+TEST_P(PlacesTest, SpecialFileAsTheLocatorIsIgnored) {
   const SpecialFile special(GetParam(), LOCATOR_PATH, VICTIM);
   EXPECT_THAT(UseHostileMaster(), Each(""));
 }
@@ -65,12 +65,12 @@ TEST_P(PlacesTest, Locator) {
 INSTANTIATE_TEST_SUITE_P(Kinds, PlacesTest, ::testing::ValuesIn(SPECIAL_KINDS),
                          [](const auto& tested) { return NameOf(tested.param); });
 
-TEST_F(HostileTest, LocatorIsAnotherNameOfADearFile) {
+TEST_F(HostileTest, HardLinkAsTheLocatorChangesNoOtherFile) {
   fs::create_hard_link("/tmp/victim", LOCATOR_PATH);
   EXPECT_THAT(UseHostileMaster(), Each(""));
 }
 
-TEST_F(HostileTest, NewMergedDatabaseIsAnotherNameOfADearFile) {
+TEST_F(HostileTest, HardLinkBesideANewDatabaseChangesNoOtherFile) {
   for (const char* const suffix :
        {".new", ".new-journal", ".new-wal", ".new-shm", "-journal", "-wal", "-shm"}) {
     SCOPED_TRACE(suffix);

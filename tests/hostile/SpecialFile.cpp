@@ -1,10 +1,11 @@
 #include "SpecialFile.h"
 
+#include "orvautil/FileDescriptor.h"
+
 #include <sys/mount.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/un.h>
-#include <unistd.h>
 
 #include <cerrno>
 #include <cstring>
@@ -31,10 +32,8 @@ void MakeSocket(const std::string& path) {
   sockaddr_un address{};
   address.sun_family = AF_UNIX;
   std::strncpy(address.sun_path, path.c_str(), sizeof address.sun_path - 1);
-  const int socket = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-  const int result = bind(socket, reinterpret_cast<const sockaddr*>(&address), sizeof address);
-  close(socket);
-  Check(result, path);
+  const util::FileDescriptor socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  Check(bind(socket.Get(), reinterpret_cast<const sockaddr*>(&address), sizeof address), path);
 }
 
 } // namespace

@@ -6,25 +6,24 @@
 
 namespace orva::test {
 
-/// What can stand at a name instead of a regular file. The links lead to a file that a test keeps
-/// elsewhere, to a device, and nowhere.
+/// What a path can name instead of a regular file. The links lead to another file, to a device, and
+/// to a missing file.
 enum class SpecialKind { Fifo, Socket, Directory, Device, Link, LinkToDevice, DanglingLink };
 
 const std::vector<SpecialKind> SPECIAL_KINDS = {
     SpecialKind::Fifo, SpecialKind::Socket,       SpecialKind::Directory,   SpecialKind::Device,
     SpecialKind::Link, SpecialKind::LinkToDevice, SpecialKind::DanglingLink};
 
-/// A word for the kind.
+/// Name of the kind.
 std::string NameOf(SpecialKind kind);
-/// The same for the names of tests.
+/// Prints the name.
 void PrintTo(SpecialKind kind, std::ostream* stream);
 
-/// Something of that kind at a path, for as long as the object lives. A device is one that the
-/// private root has, mounted there, since its own file system allows none.
+/// A special file at a path, for as long as the object lives. A device is a bind mount of one of
+/// the private root, whose file system allows no devices.
 class SpecialFile {
 public:
-  /// Puts it into the place of what is there; `target` is where a link leads. Throws
-  /// std::system_error.
+  /// Replaces what is at the path; a link leads to `target`. Throws std::system_error.
   SpecialFile(SpecialKind kind, std::string path, const std::string& target);
   SpecialFile(const SpecialFile&) = delete;
   SpecialFile& operator=(const SpecialFile&) = delete;

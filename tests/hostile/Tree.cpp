@@ -1,5 +1,6 @@
 #include "Tree.h"
 
+#include "orvautil/FileDescriptor.h"
 #include "orvautil/FormatString.h"
 
 #include <fcntl.h>
@@ -15,17 +16,17 @@ namespace {
 
 namespace fs = std::filesystem;
 
-/// Hash of what was written into a file; its holes are in its size.
+/// Hash of a file's data without its holes.
 std::size_t HashOf(const std::string& path) {
   constexpr std::size_t pieceSize = 1U << 20U;
   std::string piece(pieceSize, '\0');
   std::size_t hash = 0;
-  const int descriptor = open(path.c_str(), O_RDONLY | O_CLOEXEC);
+  const util::FileDescriptor file(open(path.c_str(), O_RDONLY | O_CLOEXEC));
   off_t begin = 0;
-  while ((begin = lseek(descriptor, begin, SEEK_DATA)) != -1) {
-    const off_t end = lseek(descriptor, begin, SEEK_HOLE);
+  while ((begin = lseek(file.Get(), begin, SEEK_DATA)) != -1) {
+    const off_t end = lseek(file.Get(), begin, SEEK_HOLE);
     while (begin < end) {
-      const ssize_t size = pread(descriptor, piece.data(), piece.size(), begin);
+      const ssize_t size = pread(file.Get(), piece.data(), piece.size(), begin);
       if (size <= 0) {
         break;
       }
@@ -34,7 +35,6 @@ std::size_t HashOf(const std::string& path) {
       begin += size;
     }
   }
-  close(descriptor);
   return hash;
 }
 

@@ -7,11 +7,11 @@
 
 namespace orva::test {
 
-/// What stands in some directories, down to the last byte: of each path the type, permissions,
-/// owner, links, size, time of the last change and a hash of the content (or the target of a link).
+/// The state of all files in some directories: of each path the type, permissions, owner, size,
+/// time of the last change and a hash of the content (or the target of a link).
 class Tree {
 public:
-  /// Which paths do not count.
+  /// Returns whether a path is left out.
   using Except = std::function<bool(const std::string& path)>;
 
   static Tree Of(const std::vector<std::string>& directories, const Except& except);

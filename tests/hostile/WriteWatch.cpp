@@ -25,14 +25,10 @@ WriteWatch::WriteWatch(const std::string& root, Except except)
   }
 }
 
-WriteWatch::~WriteWatch() {
-  close(inotify_);
-}
-
 void WriteWatch::Add(const std::string& directory) {
   constexpr std::uint32_t writes =
       IN_CLOSE_WRITE | IN_MODIFY | IN_CREATE | IN_DELETE | IN_MOVE | IN_ONLYDIR;
-  const int watch = inotify_add_watch(inotify_, directory.c_str(), writes);
+  const int watch = inotify_add_watch(inotify_.Get(), directory.c_str(), writes);
   if (watch == -1) {
     throw std::system_error(errno, std::generic_category(), directory);
   }
@@ -42,7 +38,7 @@ void WriteWatch::Add(const std::string& directory) {
 std::vector<std::string> WriteWatch::Take() {
   std::vector<std::string> writes;
   std::array<char, 65536> events;
-  for (ssize_t size = 0; (size = read(inotify_, events.data(), events.size())) > 0;) {
+  for (ssize_t size = 0; (size = read(inotify_.Get(), events.data(), events.size())) > 0;) {
     for (const char* at = events.data(); at < events.data() + size;) {
       inotify_event event{};
       std::memcpy(&event, at, sizeof event);

@@ -1,5 +1,7 @@
 #pragma once
 
+#include "orvautil/FileDescriptor.h"
+
 #include <functional>
 #include <map>
 #include <string>
@@ -7,17 +9,14 @@
 
 namespace orva::test {
 
-/// Sees every file in some directories that is opened for writing, made, removed or renamed while
-/// the object lives, also where that leaves no trace.
+/// Watches for files in some directories that are opened for writing, created, removed or renamed
+/// while the object lives.
 class WriteWatch {
 public:
   using Except = std::function<bool(const std::string& path)>;
 
-  /// Watches the directories that there are now below `root`. Throws std::system_error.
+  /// Watches `root` and the directories that are below it now. Throws std::system_error.
   WriteWatch(const std::string& root, Except except);
-  WriteWatch(const WriteWatch&) = delete;
-  WriteWatch& operator=(const WriteWatch&) = delete;
-  ~WriteWatch();
 
   /// The paths that were written since the last call, with what happened.
   std::vector<std::string> Take();
@@ -25,7 +24,7 @@ public:
 private:
   void Add(const std::string& directory);
 
-  int inotify_; ///< owned
+  util::FileDescriptor inotify_;
   Except except_;
   std::map<int, std::string> directories_; ///< by watch
 };

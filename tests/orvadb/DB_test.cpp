@@ -1,7 +1,11 @@
-#include "Raw.h"
+#include "TestDB.h"
+
+#include "system/Database.h"
 
 #include "orvadb/DB.h"
 #include "orvadb/Statement.h"
+
+#include "support/Thrown.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -17,9 +21,7 @@ namespace orva::db {
 namespace {
 
 namespace fs = std::filesystem;
-using test::Query;
-using test::Raw;
-
+using test::Database;
 using test::TestDB;
 using test::Thrown;
 using testing::AllOf;
@@ -59,16 +61,16 @@ TEST_F(DBTest, OpenCreatesAnEmptyDatabaseAndRemembersItsPath) {
   const TestDB db(path);
   EXPECT_EQ(db.GetPath(), path);
   EXPECT_TRUE(fs::is_regular_file(path));
-  Statement(db, "CREATE TABLE t(a)", __FILE__, __LINE__).Execute(__FILE__, __LINE__);
-  EXPECT_THAT(Query(Raw(path), "SELECT name FROM sqlite_master"), ElementsAre("t"));
+  Statement(db, "CREATE TABLE t(a)").Execute();
+  EXPECT_THAT(Database(path).Run("SELECT name FROM sqlite_master"), ElementsAre("t"));
 }
 
-TEST_F(DBTest, OpenKeepsWhatIsThere) {
-  Query(Raw(path), "CREATE TABLE t(a); INSERT INTO t VALUES('kept')");
+TEST_F(DBTest, OpenKeepsAnExistingDatabase) {
+  Database(path, true).exec("CREATE TABLE t(a); INSERT INTO t VALUES('kept')");
   EXPECT_THAT(TestDB(path).Rows("SELECT a FROM t"), ElementsAre("kept"));
 }
 
-TEST_F(DBTest, NamesThatMeanSomethingElsewhereArePlainFiles) {
+TEST_F(DBTest, NamesThatLookLikeUrisArePlainFiles) {
   for (const std::string name : {"a?mode=ro", "a#b", "a%41", "file:x", ":memory:", "\xff"}) {
     TestDB db("/tmp/db/" + name);
     db.Rows("CREATE TABLE t(a)");
@@ -79,13 +81,13 @@ TEST_F(DBTest, NamesThatMeanSomethingElsewhereArePlainFiles) {
 TEST_F(DBTest, OpenOnAnOpenObjectGivesAFreshConnectionOnTheNewFile) {
   TestDB db(path);
   db.Rows("CREATE TABLE t(a)");
-  Statement(db, "INSERT INTO t VALUES(1)", __FILE__, __LINE__).Execute(__FILE__, __LINE__);
+  Statement(db, "INSERT INTO t VALUES(1)").Execute();
   fs::remove(path);
   db.Open(path);
   EXPECT_THAT(db.Rows("SELECT name FROM sqlite_master"), IsEmpty());
   EXPECT_THAT(db.Compiled(), IsEmpty());
   EXPECT_TRUE(fs::exists(path));
-  EXPECT_THROW(Statement(db, "INSERT INTO t VALUES(1)", __FILE__, __LINE__), std::string);
+  EXPECT_THROW(Statement(db, "INSERT INTO t VALUES(1)"), std::string);
 }
 
 TEST_F(DBTest, OpenOnAnOpenObjectMayChangeTheFile) {
@@ -96,7 +98,7 @@ TEST_F(DBTest, OpenOnAnOpenObjectMayChangeTheFile) {
   EXPECT_THAT(db.Rows("SELECT name FROM sqlite_master"), IsEmpty());
 }
 
-TEST_F(DBTest, OpenTakesItsOwnPathOnceMore) {
+TEST_F(DBTest, OpenAcceptsItsOwnPath) {
   TestDB db(path);
   db.Rows("CREATE TABLE t(a)");
   db.Open(db.GetPath());
@@ -104,11 +106,11 @@ TEST_F(DBTest, OpenTakesItsOwnPathOnceMore) {
   EXPECT_THAT(db.Rows("SELECT name FROM sqlite_master"), ElementsAre("t"));
 }
 
-TEST_F(DBTest, CloseEndsTheConnectionAndIsHarmlessWhenClosed) {
+TEST_F(DBTest, CloseEndsTheConnectionAndMayBeRepeated) {
   TestDB db;
   db.Close();
   db.Open(path);
-  Statement(db, "CREATE TABLE t(a)", __FILE__, __LINE__).Execute(__FILE__, __LINE__);
+  Statement(db, "CREATE TABLE t(a)").Execute();
   db.Close();
   EXPECT_EQ(db.Handle(), nullptr);
   EXPECT_EQ(db.GetPath(), "");
@@ -127,11 +129,11 @@ int OpenFiles() {
   return count;
 }
 
-TEST_F(DBTest, NoFileStaysOpenBehindAnObject) {
+TEST_F(DBTest, OpenAndDestructionCloseEveryFile) {
   {
     TestDB db(path);
     db.Rows("CREATE TABLE t(a)");
-    Statement(db, "SELECT a FROM t", __FILE__, __LINE__).Step(__FILE__, __LINE__);
+    Statement(db, "SELECT a FROM t").Step();
     EXPECT_GT(OpenFiles(), 0);
     db.Open("/tmp/db/other.db");
   }
@@ -157,7 +159,7 @@ TEST_F(DBTest, TheMessageOfAFailedOpenNamesTheFileAndTheReason) {
 }
 
 TEST_F(DBTest, OpenFollowsNoLinkToAFile) {
-  Query(Raw(path), "CREATE TABLE t(a)");
+  Database(path, true).exec("CREATE TABLE t(a)");
   fs::create_symlink(path, "/tmp/db/link.db");
   EXPECT_THROW(TestDB("/tmp/db/link.db"), std::string);
 }
@@ -175,14 +177,14 @@ TEST_F(DBTest, OpenFollowsNoLinkToAFolder) {
   EXPECT_TRUE(fs::is_empty("/tmp/db/folder"));
 }
 
-TEST_F(DBTest, OpenRefusesWhatIsNoRegularFileWithoutWaiting) {
+TEST_F(DBTest, OpenRefusesSpecialFilesWithoutWaiting) {
   ASSERT_EQ(mkfifo("/tmp/db/fifo", 0666), 0);
   EXPECT_THAT(Thrown([] { TestDB("/tmp/db/fifo"); }), HasSubstr("'/tmp/db/fifo'"));
   EXPECT_THROW(TestDB("/tmp/db"), std::string);
   EXPECT_THROW(TestDB("/dev/null"), std::string);
 }
 
-TEST_F(DBTest, AFileThatIsNoDatabaseIsNotOpened) {
+TEST_F(DBTest, OpenRefusesAFileThatIsNotADatabase) {
   std::ofstream(path) << std::string(4096, 'x');
   EXPECT_THAT(Thrown([&] { const TestDB db(path); }),
               HasSubstr("file is not a database (extended code 26)"));
@@ -195,7 +197,7 @@ TEST_F(DBTest, KeepsTheDefaultJournalFullSynchronisationAndNoForeignKeys) {
   EXPECT_THAT(db.Rows("PRAGMA foreign_keys"), ElementsAre("0"));
 }
 
-TEST_F(DBTest, AConnectionWaitsForOthersFromTheBeginning) {
+TEST_F(DBTest, AConnectionWaitsASecondForLocks) {
   EXPECT_THAT(TestDB(path).Rows("PRAGMA busy_timeout"), ElementsAre("1000"));
 }
 
@@ -204,14 +206,11 @@ TEST_F(DBTest, AReadOnlyConnectionNeverCreatesAndNeverWrites) {
   EXPECT_THROW(db.Open(path, TestDB::Access::ReadOnly, 7, false), std::string);
   EXPECT_FALSE(fs::exists(path));
 
-  Query(Raw(path), "CREATE TABLE t(a)");
+  Database(path, true).exec("CREATE TABLE t(a)");
   db.Open(path, TestDB::Access::ReadOnly, 7, false);
   EXPECT_THAT(db.Rows("PRAGMA busy_timeout"), ElementsAre("7"));
-  EXPECT_THAT(
-      Thrown([&] {
-        Statement(db, "INSERT INTO t VALUES(1)", __FILE__, __LINE__).Execute(__FILE__, __LINE__);
-      }),
-      HasSubstr("attempt to write a readonly database"));
+  EXPECT_THAT(Thrown([&] { Statement(db, "INSERT INTO t VALUES(1)").Execute(); }),
+              HasSubstr("attempt to write a readonly database"));
 }
 
 } // namespace

@@ -12,7 +12,7 @@ static_assert(std::has_virtual_destructor_v<DBObject>);
 static_assert(std::is_base_of_v<DBObject, FolderItem>);
 static_assert(std::is_abstract_v<FolderItem>);
 
-TEST(FolderItem, ANewObjectIsNoRowYet) {
+TEST(FolderItem, ANewObjectIsNotARow) {
   const Folder folder;
   EXPECT_EQ(folder.id, -1);
   EXPECT_EQ(folder.folderId, -1);

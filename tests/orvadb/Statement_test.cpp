@@ -1,7 +1,11 @@
-#include "Raw.h"
+#include "TestDB.h"
+
+#include "system/Database.h"
 
 #include "orvadb/Connection.h"
 #include "orvadb/Statement.h"
+
+#include "support/Thrown.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -16,15 +20,13 @@ namespace orva::db {
 namespace {
 
 namespace fs = std::filesystem;
-using test::Query;
-using test::Raw;
-
+using test::Database;
 using test::TestDB;
 using test::Thrown;
-using test::Try;
 using testing::ElementsAre;
 using testing::IsEmpty;
 using testing::SizeIs;
+using testing::StartsWith;
 
 /// A database with a table of one column.
 class StatementTest : public testing::Test {
@@ -36,9 +38,9 @@ protected:
     db.Rows("CREATE TABLE t(a)");
   }
 
-  Statement Make(const char* sql) const { return {db, sql, __FILE__, __LINE__}; }
+  Statement Make(const char* sql) const { return {db, sql}; }
 
-  void Execute(const char* sql) const { Make(sql).Execute(__FILE__, __LINE__); }
+  void Execute(const char* sql) const { Make(sql).Execute(); }
 
   /// Runs of each compiled statement of the connection.
   std::vector<int> Runs() const {
@@ -56,29 +58,29 @@ protected:
 TEST_F(StatementTest, StepGivesRowsAndThenDone) {
   db.Rows("INSERT INTO t VALUES(1), (2)");
   Statement select = Make("SELECT a FROM t ORDER BY a");
-  EXPECT_EQ(select.Step(__FILE__, __LINE__), 100);
+  EXPECT_EQ(select.Step(), 100);
   EXPECT_EQ(select.GetInt(0), 1);
-  EXPECT_EQ(select.Step(__FILE__, __LINE__), 100);
+  EXPECT_EQ(select.Step(), 100);
   EXPECT_EQ(select.GetInt(0), 2);
-  EXPECT_EQ(select.Step(__FILE__, __LINE__), 101);
+  EXPECT_EQ(select.Step(), 101);
 }
 
 TEST_F(StatementTest, StepReturnsTheCodeOfAFailureAndThrowsNothing) {
   db.Rows("CREATE UNIQUE INDEX i ON t(a); INSERT INTO t VALUES(1)");
-  EXPECT_EQ(Make("INSERT INTO t VALUES(1)").Step(__FILE__, __LINE__), SQLITE_CONSTRAINT);
+  EXPECT_EQ(Make("INSERT INTO t VALUES(1)").Step(), SQLITE_CONSTRAINT);
 }
 
-TEST_F(StatementTest, FetchTellsWhetherARowIsReady) {
+TEST_F(StatementTest, FetchReturnsWhetherARowIsReady) {
   db.Rows("INSERT INTO t VALUES(1)");
   Statement select = Make("SELECT a FROM t");
-  EXPECT_TRUE(select.Fetch(__FILE__, __LINE__));
-  EXPECT_FALSE(select.Fetch(__FILE__, __LINE__));
+  EXPECT_TRUE(select.Fetch());
+  EXPECT_FALSE(select.Fetch());
 }
 
 TEST_F(StatementTest, ExecuteRunsToCompletion) {
   db.Rows("CREATE TABLE u(a); INSERT INTO t VALUES(1), (2), (3)");
   Execute("INSERT INTO u SELECT a FROM t RETURNING a");
-  EXPECT_THAT(Query(Raw(path), "SELECT a FROM u"), ElementsAre("1", "2", "3"));
+  EXPECT_THAT(Database(path).Run("SELECT a FROM u"), ElementsAre("1", "2", "3"));
 }
 
 // Errors.
@@ -93,6 +95,12 @@ TEST_F(StatementTest, AnErrorCarriesPlaceMessageExtendedCodeAndSql) {
   EXPECT_EQ(Thrown([&] { again.Fetch("Caller.cpp", 34); }), expected);
 }
 
+TEST_F(StatementTest, AnErrorNamesTheCallersPlaceByDefault) {
+  const auto prepare = [&] { const Statement statement(db, "SELEKT"); };
+  const std::string place = __FILE__ + (":" + std::to_string(__LINE__ - 1)) + ": ";
+  EXPECT_THAT(Thrown(prepare), StartsWith(place));
+}
+
 TEST_F(StatementTest, SqlThatCannotBePreparedIsThrown) {
   EXPECT_EQ(Thrown([&] { Statement(db, "SELECT nonsense FROM t", "Caller.cpp", 5); }),
             "Caller.cpp:5: no such column: nonsense (extended code 1) in "
@@ -102,7 +110,7 @@ TEST_F(StatementTest, SqlThatCannotBePreparedIsThrown) {
   EXPECT_THAT(db.Compiled(), IsEmpty());
 }
 
-TEST_F(StatementTest, BindingAParameterThatIsNotThereIsThrown) {
+TEST_F(StatementTest, BindingAMissingParameterIsThrown) {
   Statement select = Make("SELECT ?");
   const std::string expected =
       "Caller.cpp:9: column index out of range (extended code 25) in \"SELECT ?\"";
@@ -123,24 +131,24 @@ TEST_F(StatementTest, AFailedExecuteLeavesTheTextUsable) {
 
 TEST_F(StatementTest, ParametersCountFromOneAndColumnsFromZero) {
   Statement select = Make("SELECT ?, ?, ?, ?");
-  select.BindInt(1, -5, __FILE__, __LINE__);
-  select.BindInt64(2, 1LL << 40, __FILE__, __LINE__);
-  select.BindText(3, "text", __FILE__, __LINE__);
-  select.BindTime(4, 1L << 33, __FILE__, __LINE__);
-  ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
+  select.BindInt(1, -5);
+  select.BindInt64(2, 1LL << 40);
+  select.BindText(3, "text");
+  select.BindTime(4, 1L << 33);
+  ASSERT_TRUE(select.Fetch());
   EXPECT_EQ(select.GetInt(0), -5);
   EXPECT_EQ(select.GetInt64(1), 1LL << 40);
   EXPECT_EQ(select.GetText(2), "text");
   EXPECT_EQ(select.GetTime(3), 1L << 33);
 }
 
-TEST_F(StatementTest, TheLimitsOfIntegersPass) {
+TEST_F(StatementTest, TheLimitsOfIntegersAreKept) {
   Statement select = Make("SELECT ?, ?, ?, ?");
-  select.BindInt(1, std::numeric_limits<int>::min(), __FILE__, __LINE__);
-  select.BindInt64(2, std::numeric_limits<long long>::min(), __FILE__, __LINE__);
-  select.BindInt64(3, std::numeric_limits<long long>::max(), __FILE__, __LINE__);
-  select.BindTime(4, -1, __FILE__, __LINE__);
-  ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
+  select.BindInt(1, std::numeric_limits<int>::min());
+  select.BindInt64(2, std::numeric_limits<long long>::min());
+  select.BindInt64(3, std::numeric_limits<long long>::max());
+  select.BindTime(4, -1);
+  ASSERT_TRUE(select.Fetch());
   EXPECT_EQ(select.GetInt(0), std::numeric_limits<int>::min());
   EXPECT_EQ(select.GetInt64(1), std::numeric_limits<long long>::min());
   EXPECT_EQ(select.GetInt64(2), std::numeric_limits<long long>::max());
@@ -149,7 +157,7 @@ TEST_F(StatementTest, TheLimitsOfIntegersPass) {
 
 TEST_F(StatementTest, GetIntGivesTheLow32BitsWithTheirSign) {
   Statement select = Make("SELECT 4294967297, 2147483648, -4294967298, 4294967296");
-  ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
+  ASSERT_TRUE(select.Fetch());
   EXPECT_EQ(select.GetInt(0), 1);
   EXPECT_EQ(select.GetInt(1), std::numeric_limits<int>::min());
   EXPECT_EQ(select.GetInt(2), -2);
@@ -158,7 +166,7 @@ TEST_F(StatementTest, GetIntGivesTheLow32BitsWithTheirSign) {
 
 TEST_F(StatementTest, GetBoolIsTrueForAnyNonZeroInteger) {
   Statement select = Make("SELECT 0, 1, -1, 4294967296, NULL");
-  ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
+  ASSERT_TRUE(select.Fetch());
   EXPECT_FALSE(select.GetBool(0));
   EXPECT_TRUE(select.GetBool(1));
   EXPECT_TRUE(select.GetBool(2));
@@ -168,26 +176,26 @@ TEST_F(StatementTest, GetBoolIsTrueForAnyNonZeroInteger) {
 
 TEST_F(StatementTest, TimesAndIntegersAreStoredAsIntegersAndTextsAsTexts) {
   Statement select = Make("SELECT typeof(?), typeof(?), typeof(?), typeof(?)");
-  select.BindInt(1, 1, __FILE__, __LINE__);
-  select.BindInt64(2, 1, __FILE__, __LINE__);
-  select.BindTime(3, 1, __FILE__, __LINE__);
-  select.BindText(4, "1", __FILE__, __LINE__);
-  ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
+  select.BindInt(1, 1);
+  select.BindInt64(2, 1);
+  select.BindTime(3, 1);
+  select.BindText(4, "1");
+  ASSERT_TRUE(select.Fetch());
   EXPECT_EQ(select.GetText(0), "integer");
   EXPECT_EQ(select.GetText(1), "integer");
   EXPECT_EQ(select.GetText(2), "integer");
   EXPECT_EQ(select.GetText(3), "text");
 }
 
-TEST_F(StatementTest, TextsAreBoundWhole) {
+TEST_F(StatementTest, TextsAreBoundWithTheirNulBytes) {
   const std::string zeros("a\0b\0", 4);
   {
     Statement insert = Make("INSERT INTO t VALUES(?)");
-    insert.BindText(1, zeros, __FILE__, __LINE__);
-    insert.Execute(__FILE__, __LINE__);
+    insert.BindText(1, zeros);
+    insert.Execute();
   }
   Statement select = Make("SELECT a, hex(a) FROM t");
-  ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
+  ASSERT_TRUE(select.Fetch());
   EXPECT_EQ(select.GetText(0), zeros);
   EXPECT_EQ(select.GetText(1), "61006200");
 }
@@ -195,17 +203,17 @@ TEST_F(StatementTest, TextsAreBoundWhole) {
 TEST_F(StatementTest, BindTextCopiesTheText) {
   Statement select = Make("SELECT ?");
   std::string text(1000, 'x');
-  select.BindText(1, text, __FILE__, __LINE__);
+  select.BindText(1, text);
   text.assign(1000, 'y');
-  ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
+  ASSERT_TRUE(select.Fetch());
   EXPECT_EQ(select.GetText(0), std::string(1000, 'x'));
 }
 
 TEST_F(StatementTest, AnEmptyTextIsATextAndNullReadsAsEmpty) {
   Statement select = Make("SELECT typeof(?), ?, NULL");
-  select.BindText(1, "", __FILE__, __LINE__);
-  select.BindText(2, "", __FILE__, __LINE__);
-  ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
+  select.BindText(1, "");
+  select.BindText(2, "");
+  ASSERT_TRUE(select.Fetch());
   EXPECT_EQ(select.GetText(0), "text");
   EXPECT_EQ(select.GetText(1), "");
   EXPECT_EQ(select.GetText(2), "");
@@ -213,16 +221,16 @@ TEST_F(StatementTest, AnEmptyTextIsATextAndNullReadsAsEmpty) {
   EXPECT_EQ(select.GetTime(2), 0);
 }
 
-TEST_F(StatementTest, BytesThatAreNoUtf8PassAsTheyAre) {
+TEST_F(StatementTest, InvalidUtf8IsKept) {
   Statement select = Make("SELECT ?");
-  select.BindText(1, "\xff\xc3/\x80", __FILE__, __LINE__);
-  ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
+  select.BindText(1, "\xff\xc3/\x80");
+  ASSERT_TRUE(select.Fetch());
   EXPECT_EQ(select.GetText(0), "\xff\xc3/\x80");
 }
 
 TEST_F(StatementTest, NumbersReadAsTexts) {
   Statement select = Make("SELECT 42");
-  ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
+  ASSERT_TRUE(select.Fetch());
   EXPECT_EQ(select.GetText(0), "42");
 }
 
@@ -238,21 +246,21 @@ TEST_F(StatementTest, TheSameTextIsCompiledOnce) {
   EXPECT_THAT(db.Rows("SELECT count(*) FROM t"), ElementsAre("5"));
 }
 
-TEST_F(StatementTest, ATextInUseIsCompiledAnew) {
+TEST_F(StatementTest, ATextInUseIsCompiledAgain) {
   db.Rows("INSERT INTO t VALUES(1), (2)");
   {
     Statement outer = Make("SELECT a FROM t ORDER BY a");
-    ASSERT_TRUE(outer.Fetch(__FILE__, __LINE__));
+    ASSERT_TRUE(outer.Fetch());
     {
       Statement inner = Make("SELECT a FROM t ORDER BY a");
-      ASSERT_TRUE(inner.Fetch(__FILE__, __LINE__));
+      ASSERT_TRUE(inner.Fetch());
       EXPECT_THAT(db.Compiled(), SizeIs(2));
       EXPECT_EQ(inner.GetInt(0), 1);
-      ASSERT_TRUE(outer.Fetch(__FILE__, __LINE__));
+      ASSERT_TRUE(outer.Fetch());
       EXPECT_EQ(outer.GetInt(0), 2);
       EXPECT_EQ(inner.GetInt(0), 1);
     }
-    EXPECT_FALSE(outer.Fetch(__FILE__, __LINE__));
+    EXPECT_FALSE(outer.Fetch());
   }
   EXPECT_THAT(db.Compiled(), SizeIs(1));
   Execute("SELECT a FROM t ORDER BY a");
@@ -260,10 +268,10 @@ TEST_F(StatementTest, ATextInUseIsCompiledAnew) {
 }
 
 TEST_F(StatementTest, TheOuterUseOfATextMayEndBeforeTheInner) {
-  auto outer = std::make_unique<Statement>(db, "SELECT 1", __FILE__, __LINE__);
-  auto inner = std::make_unique<Statement>(db, "SELECT 1", __FILE__, __LINE__);
+  auto outer = std::make_unique<Statement>(db, "SELECT 1");
+  auto inner = std::make_unique<Statement>(db, "SELECT 1");
   outer.reset();
-  EXPECT_TRUE(inner->Fetch(__FILE__, __LINE__));
+  EXPECT_TRUE(inner->Fetch());
   {
     const Statement third = Make("SELECT 1");
     EXPECT_THAT(db.Compiled(), SizeIs(2));
@@ -275,31 +283,32 @@ TEST_F(StatementTest, TheOuterUseOfATextMayEndBeforeTheInner) {
 TEST_F(StatementTest, AUsedStatementKeepsNoBindings) {
   {
     Statement select = Make("SELECT typeof(?)");
-    select.BindText(1, "bound", __FILE__, __LINE__);
-    ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
+    select.BindText(1, "bound");
+    ASSERT_TRUE(select.Fetch());
   }
   Statement select = Make("SELECT typeof(?)");
-  ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
+  ASSERT_TRUE(select.Fetch());
   EXPECT_EQ(select.GetText(0), "null");
   EXPECT_THAT(db.Compiled(), SizeIs(1));
 }
 
 TEST_F(StatementTest, AUsedStatementHoldsNoLock) {
   db.Rows("INSERT INTO t VALUES(1), (2)");
-  const Raw other(path);
+  SQLite::Database other(path, SQLite::OPEN_READWRITE);
   {
     Statement select = Make("SELECT a FROM t");
-    ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
-    EXPECT_EQ(Try(other, "INSERT INTO t VALUES(3)"), SQLITE_BUSY) << "a reader keeps writers out";
+    ASSERT_TRUE(select.Fetch());
+    EXPECT_EQ(other.tryExec("INSERT INTO t VALUES(3)"), SQLITE_BUSY)
+        << "a reader keeps writers out";
   }
-  EXPECT_EQ(Try(other, "INSERT INTO t VALUES(3)"), SQLITE_OK);
+  EXPECT_EQ(other.tryExec("INSERT INTO t VALUES(3)"), SQLITE_OK);
 }
 
 TEST_F(StatementTest, AUsedStatementStartsAgainFromTheBeginning) {
   db.Rows("INSERT INTO t VALUES(1), (2)");
   for (int i = 0; i < 2; ++i) {
     Statement select = Make("SELECT a FROM t ORDER BY a");
-    ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
+    ASSERT_TRUE(select.Fetch());
     EXPECT_EQ(select.GetInt(0), 1);
   }
 }
@@ -309,23 +318,23 @@ TEST_F(StatementTest, KeptStatementsFollowTheSchema) {
   Execute("ALTER TABLE t ADD COLUMN b DEFAULT 7");
   db.Rows("INSERT INTO t(a) VALUES(1)");
   Statement select = Make("SELECT * FROM t");
-  ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
+  ASSERT_TRUE(select.Fetch());
   EXPECT_EQ(select.GetInt(1), 7);
 }
 
-TEST_F(StatementTest, KeptStatementsDoNotHinderDroppingTheirTable) {
+TEST_F(StatementTest, KeptStatementsDoNotPreventDroppingTheirTable) {
   Execute("SELECT * FROM t");
   Execute("DROP TABLE t");
   // Compiled again for the new schema, which has no such table: the step fails.
   Statement select = Make("SELECT * FROM t");
-  EXPECT_EQ(select.Step(__FILE__, __LINE__), SQLITE_ERROR);
+  EXPECT_EQ(select.Step(), SQLITE_ERROR);
 }
 
-TEST_F(StatementTest, KeptStatementsDoNotHinderVacuum) {
+TEST_F(StatementTest, KeptStatementsDoNotPreventVacuum) {
   db.Rows("INSERT INTO t VALUES(1), (2)");
   {
     Statement select = Make("SELECT a FROM t");
-    ASSERT_TRUE(select.Fetch(__FILE__, __LINE__)); // and left unfinished
+    ASSERT_TRUE(select.Fetch()); // and left unfinished
   }
   Execute("INSERT INTO t VALUES(3)");
   EXPECT_NO_THROW(Execute("VACUUM"));
@@ -336,9 +345,9 @@ TEST_F(StatementTest, KeptStatementsDoNotHinderVacuum) {
 
 TEST_F(StatementTest, KeptStatementsFollowTheSchemaOfAnotherProgram) {
   Execute("SELECT * FROM t");
-  Query(Raw(path), "DROP TABLE t; CREATE TABLE t(x, y); INSERT INTO t VALUES(8, 9)");
+  Database(path).exec("DROP TABLE t; CREATE TABLE t(x, y); INSERT INTO t VALUES(8, 9)");
   Statement select = Make("SELECT * FROM t");
-  ASSERT_TRUE(select.Fetch(__FILE__, __LINE__));
+  ASSERT_TRUE(select.Fetch());
   EXPECT_EQ(select.GetInt(1), 9);
 }
 

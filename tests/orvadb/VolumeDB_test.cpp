@@ -1,7 +1,11 @@
-#include "Raw.h"
+#include "TestDB.h"
+
+#include "system/Database.h"
 
 #include "orvadb/Statement.h"
 #include "orvadb/VolumeDB.h"
+
+#include "support/Thrown.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -20,16 +24,14 @@ namespace orva::db {
 namespace {
 
 namespace fs = std::filesystem;
-using test::Query;
-using test::Raw;
-
+using test::Database;
 using test::Thrown;
 using testing::AllOf;
 using testing::ElementsAre;
 using testing::HasSubstr;
 using testing::IsEmpty;
 
-/// A catalog whose connection a test may look at.
+/// A catalog with rows as texts.
 class Catalog : public VolumeDB {
 public:
   using VolumeDB::Handle;
@@ -37,8 +39,8 @@ public:
 
   std::vector<std::string> Rows(const char* sql) const {
     std::vector<std::string> rows;
-    Statement select(*this, sql, __FILE__, __LINE__);
-    while (select.Fetch(__FILE__, __LINE__)) {
+    Statement select(*this, sql);
+    while (select.Fetch()) {
       rows.push_back(select.GetText(0));
     }
     return rows;
@@ -90,7 +92,7 @@ protected:
 
   /// Writes a catalog that holds the text `kept`.
   static void WriteCatalog(const std::string& path) {
-    Query(Raw(path), "CREATE TABLE t(a); INSERT INTO t VALUES('kept')");
+    Database(path, true).exec("CREATE TABLE t(a); INSERT INTO t VALUES('kept')");
   }
 
   const std::string volume = "/shares/Vol";
@@ -115,13 +117,13 @@ TEST_F(VolumeDBTest, ThePrefixIsTheMountPointAsItWasGiven) {
   EXPECT_EQ(db.GetPath(), catalog);
 }
 
-TEST_F(VolumeDBTest, ForReadingItNeverCreates) {
+TEST_F(VolumeDBTest, OpeningForReadingCreatesNothing) {
   EXPECT_THAT(Thrown([&] { Catalog(volume, false); }),
               AllOf(HasSubstr("unable to open database file"), HasSubstr(catalog)));
   EXPECT_TRUE(fs::is_empty(home));
 }
 
-TEST_F(VolumeDBTest, ForReadingItNeverWrites) {
+TEST_F(VolumeDBTest, OpeningForReadingWritesNothing) {
   WriteCatalog(catalog);
   const Catalog db(volume, false);
   EXPECT_THAT(Thrown([&] { db.Rows("DELETE FROM t"); }),
@@ -129,12 +131,12 @@ TEST_F(VolumeDBTest, ForReadingItNeverWrites) {
   EXPECT_THAT(FilesIn(home), ElementsAre("orva.db"));
 }
 
-TEST_F(VolumeDBTest, ForWritingItCreatesTheFileButNotItsFolder) {
+TEST_F(VolumeDBTest, OpeningForWritingCreatesTheFileButNotItsFolder) {
   {
     const Catalog db(volume, true);
     db.Rows("CREATE TABLE t(a)");
   }
-  EXPECT_THAT(Query(Raw(catalog), "SELECT name FROM sqlite_master"), ElementsAre("t"));
+  EXPECT_THAT(Database(catalog).Run("SELECT name FROM sqlite_master"), ElementsAre("t"));
   fs::remove_all(home);
   EXPECT_THROW(Catalog(volume, true), std::string);
   EXPECT_FALSE(fs::exists(home));
@@ -146,7 +148,7 @@ TEST_F(VolumeDBTest, ACatalogThatIsBeingWrittenIsWaitedFor) {
   EXPECT_THAT(Catalog(volume, true).Rows("PRAGMA busy_timeout"), ElementsAre("5000"));
 }
 
-TEST_F(VolumeDBTest, AVolumeThatIsNotThereIsAnError) {
+TEST_F(VolumeDBTest, AMissingVolumeIsAnError) {
   EXPECT_THAT(Thrown([] { Catalog("/shares/None/", false); }), HasSubstr("'/shares/None/'"));
   EXPECT_THROW(Catalog("/shares/None", true), std::string);
   EXPECT_THROW(Catalog("", false), std::string);
@@ -163,7 +165,7 @@ TEST_F(VolumeDBTest, AMountPointMayBeALink) {
   EXPECT_EQ(db.GetPrefix(), "/shares/Link/");
 }
 
-TEST_F(VolumeDBTest, BelowTheMountPointNoLinkIsFollowed) {
+TEST_F(VolumeDBTest, LinksBelowTheMountPointAreNotFollowed) {
   WriteCatalog("/tmp/elsewhere.db");
   fs::create_symlink("/tmp/elsewhere.db", catalog);
   EXPECT_THROW(Catalog(volume, false), std::string);
@@ -176,7 +178,7 @@ TEST_F(VolumeDBTest, BelowTheMountPointNoLinkIsFollowed) {
   EXPECT_THROW(Catalog(volume, false), std::string);
 }
 
-TEST_F(VolumeDBTest, WhatIsNoRegularFileIsRefusedWithoutWaiting) {
+TEST_F(VolumeDBTest, SpecialFilesAreRefusedWithoutWaiting) {
   ASSERT_EQ(mkfifo(catalog.c_str(), 0666), 0);
   EXPECT_THROW(Catalog(volume, false), std::string);
   EXPECT_THROW(Catalog(volume, true), std::string);
@@ -194,23 +196,23 @@ TEST_F(VolumeDBTest, AnEmptyFileIsACatalogWithoutTables) {
 
 TEST_F(VolumeDBTest, ALogOfARunningWriterIsReadWithTheCatalog) {
   WriteCatalog(catalog);
-  const Raw indexer(catalog);
-  Query(indexer, "PRAGMA journal_mode = WAL; INSERT INTO t VALUES('logged')");
+  Database indexer(catalog, true);
+  indexer.exec("PRAGMA journal_mode = WAL; INSERT INTO t VALUES('logged')");
   EXPECT_THAT(Catalog(volume, false).Rows("SELECT a FROM t"), ElementsAre("kept", "logged"));
-  Query(indexer, "INSERT INTO t VALUES('later')");
+  indexer.exec("INSERT INTO t VALUES('later')");
   EXPECT_THAT(Catalog(volume, false).Rows("SELECT a FROM t"),
               ElementsAre("kept", "logged", "later"));
 }
 
-// Read-only file systems, by the name of the volume.
+// Read-only file systems, with volumes of different names.
 
 class ReadOnlyVolumeTest : public testing::TestWithParam<std::string> {
 protected:
   /// Writes a catalog that holds the text `kept`, with the journal `mode`.
   void WriteCatalog(const std::string& mode) const {
-    const Raw indexer(catalog);
-    Query(indexer, "PRAGMA journal_mode = " + mode);
-    Query(indexer, "CREATE TABLE t(a); INSERT INTO t VALUES('kept')");
+    Database indexer(catalog, true);
+    indexer.exec("PRAGMA journal_mode = " + mode);
+    indexer.exec("CREATE TABLE t(a); INSERT INTO t VALUES('kept')");
   }
 
   const std::string point = "/shares/" + GetParam();
@@ -247,9 +249,9 @@ TEST_P(ReadOnlyVolumeTest, ACatalogWhoseLogIsEmptyIsRead) {
 
 TEST_P(ReadOnlyVolumeTest, ACatalogWithALogToReadIsAnError) {
   {
-    const Raw indexer(catalog);
-    sqlite3_db_config(indexer, SQLITE_DBCONFIG_NO_CKPT_ON_CLOSE, 1, nullptr);
-    Query(indexer, "PRAGMA journal_mode = WAL; CREATE TABLE t(a); INSERT INTO t VALUES('kept')");
+    Database indexer(catalog, true);
+    sqlite3_db_config(indexer.getHandle(), SQLITE_DBCONFIG_NO_CKPT_ON_CLOSE, 1, nullptr);
+    indexer.exec("PRAGMA journal_mode = WAL; CREATE TABLE t(a); INSERT INTO t VALUES('kept')");
   }
   ASSERT_GT(fs::file_size(catalog + "-wal"), 0U);
   volume.MakeReadOnly();
@@ -263,7 +265,7 @@ TEST_P(ReadOnlyVolumeTest, AnAbsentCatalogIsAnError) {
   EXPECT_THROW(Catalog(point, true), std::string);
 }
 
-TEST_P(ReadOnlyVolumeTest, AWritableVolumeOfThatNameIsReadAndWritten) {
+TEST_P(ReadOnlyVolumeTest, AWritableVolumeIsReadAndWritten) {
   WriteCatalog("WAL");
   EXPECT_THAT(Catalog(point, false).Rows("SELECT a FROM t"), ElementsAre("kept"));
   Catalog(point, true).Rows("INSERT INTO t VALUES('more')");

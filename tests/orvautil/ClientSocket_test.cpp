@@ -46,7 +46,7 @@ TEST(ClientSocket, IsNotInheritedByPrograms) {
   std::filesystem::remove("/run/orva/inherit.sock");
 }
 
-TEST(ClientSocket, WaitsInReadUnlessAskedNotTo) {
+TEST(ClientSocket, ReadWaitsUnlessTheSocketIsNonBlocking) {
   const Listener service = test::ListenAtPath("/run/orva/block.sock");
   const Socket::Address address("/run/orva/block.sock");
   EXPECT_EQ(fcntl(ClientSocket(address, false).Descriptor(), F_GETFL) & O_NONBLOCK, 0);
@@ -57,7 +57,7 @@ TEST(ClientSocket, WaitsInReadUnlessAskedNotTo) {
   std::filesystem::remove("/run/orva/block.sock");
 }
 
-TEST(ClientSocket, WithoutAServiceItIsNotOpen) {
+TEST(ClientSocket, IsNotOpenWithoutAService) {
   errno = 0;
   ClientSocket client(Socket::Address("/run/orva/absent.sock"), false);
   EXPECT_EQ(errno, ENOENT);
@@ -67,7 +67,7 @@ TEST(ClientSocket, WithoutAServiceItIsNotOpen) {
   EXPECT_EQ(client.Read(&byte, 1), 0U);
 }
 
-TEST(ClientSocket, WhereNobodyListensAnyMoreItIsNotOpen) {
+TEST(ClientSocket, IsNotOpenAfterTheServiceHasGone) {
   { const Listener service = test::ListenAtPath("/run/orva/left.sock"); }
   errno = 0;
   const ClientSocket client(Socket::Address("/run/orva/left.sock"), false);
@@ -76,13 +76,13 @@ TEST(ClientSocket, WhereNobodyListensAnyMoreItIsNotOpen) {
   std::filesystem::remove("/run/orva/left.sock");
 }
 
-TEST(ClientSocket, WhereAFileIsItIsNotOpen) {
+TEST(ClientSocket, IsNotOpenAtAnythingButAService) {
   std::ofstream("/tmp/no-socket") << "x";
   EXPECT_FALSE(ClientSocket(Socket::Address("/tmp/no-socket"), false).IsOpen());
   EXPECT_FALSE(ClientSocket(Socket::Address("@nobody"), false).IsOpen());
 }
 
-TEST(ClientSocket, AFailedConnectionLeavesNoDescriptorBehind) {
+TEST(ClientSocket, AFailedConnectionClosesItsDescriptor) {
   const int before = dup(0);
   close(before);
   { const ClientSocket client(Socket::Address("/run/orva/absent.sock"), false); }

@@ -8,7 +8,7 @@
 namespace orva::core {
 namespace {
 
-TEST(Core, NotificationSocketIsAnAddressThatASocketTakes) {
+TEST(Core, NotificationSocketIsAValidAddress) {
   EXPECT_EQ(ORVA_NOTIFICATION_SOCKET, "/run/orva/notification.sock");
   EXPECT_NO_THROW(util::Socket::Address{ORVA_NOTIFICATION_SOCKET});
 }
@@ -23,7 +23,7 @@ TEST(Core, CatalogIsAFileInTheHome) {
   EXPECT_EQ(GetCatalogPath("/shares/Vol/"), "/shares/Vol/.orva/orva.db");
 }
 
-TEST(Core, AskingForPathsMakesNothing) {
+TEST(Core, PathsAreNotCreated) {
   std::filesystem::create_directory("/tmp/volume");
   GetORVA_HOME("/tmp/volume");
   GetCatalogPath("/tmp/volume");

@@ -6,12 +6,12 @@
 
 namespace orva::test {
 
-/// What an owning container holds; a derived object tells when it is deleted.
+/// An element of an owning container.
 struct Element {
   virtual ~Element() noexcept(false) = default;
 };
 
-/// Writes its name into a list when it is deleted through its base.
+/// Appends its name to a list when it is deleted.
 struct Named : Element {
   Named(std::vector<std::string>& list, const char* itsName) : deleted(list), name(itsName) {}
   ~Named() override { deleted.push_back(name); }
@@ -20,7 +20,7 @@ struct Named : Element {
   std::string name;
 };
 
-/// The same, and throws then.
+/// The same, and then throws.
 struct Throwing : Named {
   using Named::Named;
   ~Throwing() noexcept(false) override { throw std::runtime_error(name); }

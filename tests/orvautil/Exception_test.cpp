@@ -13,10 +13,16 @@ TEST(Exception, IsCaughtAsAStandardExceptionWithItsMessage) {
   }
 }
 
-TEST(Exception, NamesThePlaceThatThrew) {
+TEST(Exception, NamesTheSourceLineThatThrew) {
   const Exception exception("the message", "Place.cpp", 42);
   EXPECT_STREQ(exception.File(), "Place.cpp");
   EXPECT_EQ(exception.Line(), 42U);
+}
+
+TEST(Exception, NamesItsOwnSourceLineByDefault) {
+  const Exception exception("the message");
+  EXPECT_STREQ(exception.File(), __FILE__);
+  EXPECT_EQ(exception.Line(), __LINE__ - 2U);
 }
 
 } // namespace

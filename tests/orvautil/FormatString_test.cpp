@@ -14,11 +14,11 @@ TEST(FormatString, WritesWhatPrintfWrites) {
             "name:-7:   2.2 1099511627776%");
 }
 
-TEST(FormatString, AnEmptyTextIsPossible) {
+TEST(FormatString, TheTextMayBeEmpty) {
   EXPECT_EQ(FormatString("%s", ""), "");
 }
 
-TEST(FormatString, NoTextIsTooLong) {
+TEST(FormatString, TheTextMayBeLong) {
   const std::string text(1'000'000, 'x');
   EXPECT_EQ(FormatString("<%s>", text.c_str()), '<' + text + '>');
 }

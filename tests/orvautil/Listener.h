@@ -2,8 +2,9 @@
 
 #include "SocketPair.h"
 
+#include "orvautil/FileDescriptor.h"
+
 #include <sys/socket.h>
-#include <unistd.h>
 
 #include <cerrno>
 #include <string>
@@ -14,23 +15,21 @@ namespace orva::test {
 /// A service that listens at a local address.
 class Listener {
 public:
-  /// Binds to `address` with the address made here, not by the class under test, and listens.
+  /// Listens at `address`, which was not made by the class under test.
   explicit Listener(const sockaddr_un& address, socklen_t length)
       : descriptor_(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0)) {
     const auto* const plain = reinterpret_cast<const sockaddr*>(&address);
-    if (descriptor_ == -1 || bind(descriptor_, plain, length) != 0 || listen(descriptor_, 8) != 0) {
+    if (!descriptor_ || bind(descriptor_.Get(), plain, length) != 0 ||
+        listen(descriptor_.Get(), 8) != 0) {
       throw std::system_error(errno, std::generic_category(), "listen");
     }
   }
-  Listener(const Listener&) = delete;
-  Listener& operator=(const Listener&) = delete;
-  ~Listener() { close(descriptor_); }
 
   /// Waits for a client; its connection's descriptor goes to the caller.
-  int Accept() const { return accept4(descriptor_, nullptr, nullptr, SOCK_CLOEXEC); }
+  int Accept() const { return accept4(descriptor_.Get(), nullptr, nullptr, SOCK_CLOEXEC); }
 
 private:
-  int descriptor_; ///< owned
+  util::FileDescriptor descriptor_;
 };
 
 /// Listens at a path.

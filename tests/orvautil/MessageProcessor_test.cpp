@@ -1,5 +1,4 @@
 #include "Listener.h"
-#include "Platform.h"
 #include "SocketPair.h"
 
 #include "orvautil/ClientSocket.h"
@@ -7,6 +6,7 @@
 #include "orvautil/MessageProcessor.h"
 #include "orvautil/Xml.h"
 
+#include "support/XmlPlatform.h"
 #include "system/Syslog.h"
 
 #include <gmock/gmock.h>
@@ -44,7 +44,7 @@ using testing::StartsWith;
 const std::string END(4, '\0');
 constexpr auto LIMIT = MessageProcessor::MAXIMUM_MESSAGE_LENGTH;
 
-/// Notes what it is handed. Messages that hold "drop" are not valid.
+/// Records its calls. Messages that contain "drop" are not valid.
 class Recorder : public MessageProcessor {
 public:
   bool IsValidMessage(const std::string& message) const override {
@@ -78,19 +78,19 @@ public:
   std::size_t Capacity() const { return buffer.capacity(); }
   bool Stopped() const { return stop; }
 
-  std::function<void()> thrower;            ///< what a message <throw/> leads to
-  mutable std::vector<std::string> looked;  ///< what IsValidMessage was asked about
+  std::function<void()> thrower;            ///< called for a message <throw/>
+  mutable std::vector<std::string> looked;  ///< arguments of IsValidMessage
   mutable std::vector<std::string> handled; ///< names of the root elements
-  mutable std::vector<std::string> bytes;   ///< what was handed with them
+  mutable std::vector<std::string> bytes;   ///< their messages
   mutable std::vector<const Stream*> streams;
   mutable std::vector<std::pair<int, std::string>> errors;
-  mutable std::size_t largest = 0; ///< the buffer's, at any call
+  mutable std::size_t largest = 0; ///< capacity of the buffer at any call
 };
 
 /// A processor, its system log and the XML platform.
 class MessageProcessorTest : public testing::Test {
 protected:
-  /// Hands the processor what `chunks` hold, each in a read of its own, and then the end.
+  /// Lets the processor read the `chunks`, each in a read of its own, and then the end.
   void ReadChunks(const std::vector<std::string>& chunks) {
     SocketPair pair(SOCK_SEQPACKET);
     std::jthread writer([&] {
@@ -102,7 +102,7 @@ protected:
     processor.ReadMessages(pair.near);
   }
 
-  /// Hands the processor `bytes` in reads as large as it likes.
+  /// Lets the processor read `bytes` in reads of any size, and then the end.
   void Read(const std::string& bytes) {
     SocketPair pair;
     std::jthread writer([&] {
@@ -113,21 +113,13 @@ protected:
   }
 
   /// Everything that was logged so far.
-  std::vector<LogLine> Logged() {
-    const LogLine barrier{LOG_USER | LOG_DEBUG, "barrier " + std::to_string(++barriers_)};
-    ::syslog(barrier.priority, "%s", barrier.text.c_str());
-    EXPECT_TRUE(log_.Await(barrier));
-    auto lines = log_.Lines();
-    std::erase_if(lines, [](const LogLine& line) { return line.text.starts_with("barrier "); });
-    return lines;
-  }
+  std::vector<LogLine> Logged() const { return log_.Lines(); }
 
   Recorder processor;
 
 private:
-  test::Platform platform_;
+  test::XmlPlatform platform_;
   test::Syslog log_;
-  int barriers_ = 0;
 };
 
 /// A well-formed message of `length` bytes with the root element `name`.
@@ -145,7 +137,7 @@ TEST_F(MessageProcessorTest, CutsTheStreamAtTheDelimiter) {
   EXPECT_THAT(Logged(), IsEmpty());
 }
 
-TEST_F(MessageProcessorTest, HandsTheStreamItReadsFromToTheHandler) {
+TEST_F(MessageProcessorTest, PassesItsStreamToTheHandler) {
   SocketPair pair;
   const std::string bytes = "<a/>" + END;
   pair.far.Write(bytes.data(), static_cast<unsigned>(bytes.size()));
@@ -227,7 +219,7 @@ TEST_F(MessageProcessorTest, ManyMessagesAreHandledInOrder) {
   EXPECT_EQ(processor.handled, names);
 }
 
-TEST_F(MessageProcessorTest, BetweenDelimitersInARowAreEmptyMessages) {
+TEST_F(MessageProcessorTest, ConsecutiveDelimitersEncloseEmptyMessages) {
   Read("<a/>" + END + END + END + "<drop/>" + END);
   EXPECT_THAT(processor.looked, ElementsAre("<a/>", "", "", "<drop/>"));
 }
@@ -243,7 +235,7 @@ TEST_F(MessageProcessorTest, TheFirstFourOfFiveZerosAreTheDelimiter) {
   EXPECT_THAT(processor.handled, ElementsAre("a", "c"));
 }
 
-TEST_F(MessageProcessorTest, AMessageBehindASurplusZeroIsIllFormedAndTheNextIsHandled) {
+TEST_F(MessageProcessorTest, AMessageAfterASurplusZeroIsIllFormedAndTheNextIsHandled) {
   Read("<a/>" + END + std::string(1, '\0') + "<b/>" + END + "<c/>" + END);
   EXPECT_THAT(processor.handled, ElementsAre("a", "c"));
   EXPECT_THAT(processor.errors, ElementsAre(Pair(MessageProcessor::MESSAGE_ILL_FORMED,
@@ -258,7 +250,7 @@ TEST_F(MessageProcessorTest, AnInvalidMessageIsDroppedSilently) {
   EXPECT_THAT(Logged(), IsEmpty());
 }
 
-TEST_F(MessageProcessorTest, BytesBehindTheLastDelimiterAreDropped) {
+TEST_F(MessageProcessorTest, BytesAfterTheLastDelimiterAreDropped) {
   Read("<a/>" + END + "<b/>");
   EXPECT_THAT(processor.looked, ElementsAre("<a/>"));
   Read("<c/>" + END);
@@ -266,7 +258,7 @@ TEST_F(MessageProcessorTest, BytesBehindTheLastDelimiterAreDropped) {
   EXPECT_THAT(processor.handled, ElementsAre("a", "c"));
 }
 
-TEST_F(MessageProcessorTest, APartOfADelimiterAtTheEndIsNone) {
+TEST_F(MessageProcessorTest, APartialDelimiterAtTheEndIsDropped) {
   Read("<a/>" + std::string(3, '\0'));
   EXPECT_THAT(processor.looked, IsEmpty());
   Read(std::string(1, '\0') + "<drop/>" + END);
@@ -280,7 +272,7 @@ TEST_F(MessageProcessorTest, AnEmptyOrEndedStreamHasNoMessages) {
   EXPECT_THAT(processor.looked, IsEmpty());
 }
 
-TEST_F(MessageProcessorTest, APeerThatResetsEndsTheStream) {
+TEST_F(MessageProcessorTest, AResetByThePeerEndsTheStream) {
   SocketPair pair;
   const std::string bytes = "<a/>" + END + "<b/>";
   pair.far.Write(bytes.data(), static_cast<unsigned>(bytes.size()));
@@ -291,7 +283,7 @@ TEST_F(MessageProcessorTest, APeerThatResetsEndsTheStream) {
   EXPECT_THAT(Logged(), IsEmpty());
 }
 
-TEST_F(MessageProcessorTest, TheStopFlagIsClearAndTheBufferEmptyAtFirst) {
+TEST_F(MessageProcessorTest, TheStopFlagIsInitiallyClearAndTheBufferEmpty) {
   EXPECT_FALSE(processor.Stopped());
   EXPECT_EQ(processor.Capacity(), 0U);
 }
@@ -301,7 +293,7 @@ TEST_F(MessageProcessorTest, TheStopFlagIsClearAndTheBufferEmptyAtFirst) {
 const LogLine TOO_LONG{LOG_LOCAL1 | LOG_ERR,
                        "MessageProcessor:: message of more than 65536 bytes skipped"};
 
-TEST_F(MessageProcessorTest, AMessageOfTheGreatestLengthIsHandled) {
+TEST_F(MessageProcessorTest, AMessageOfTheMaximumLengthIsHandled) {
   Read(MessageOf("a", LIMIT) + END + "<b/>" + END);
   EXPECT_THAT(processor.handled, ElementsAre("a", "b"));
   EXPECT_EQ(processor.bytes.front().size(), 65536U);
@@ -316,7 +308,7 @@ TEST_F(MessageProcessorTest, AMessageOfOneByteMoreIsSkippedAndTheNextHandled) {
   EXPECT_THAT(Logged(), ElementsAre(TOO_LONG));
 }
 
-/// `message` and the bytes behind it, with reads that end at each place of the delimiter.
+/// `message` and another one, in reads of which one ends `split` bytes into the delimiter.
 std::vector<std::string> ChunksAround(const std::string& message, std::size_t split) {
   const std::string stream = message + END + "<b/>" + END;
   std::vector<std::string> chunks;
@@ -327,7 +319,7 @@ std::vector<std::string> ChunksAround(const std::string& message, std::size_t sp
   return chunks;
 }
 
-TEST_F(MessageProcessorTest, TheGreatestLengthDoesNotCountASplitDelimiter) {
+TEST_F(MessageProcessorTest, TheMaximumLengthDoesNotCountASplitDelimiter) {
   for (std::size_t split = 0; split <= END.size(); ++split) {
     processor.handled.clear();
     ReadChunks(ChunksAround(MessageOf("a", LIMIT), split));
@@ -348,7 +340,7 @@ TEST_F(MessageProcessorTest, ASkippedMessageEndsAtASplitDelimiter) {
   }
 }
 
-TEST_F(MessageProcessorTest, ALongMessageIsReportedOnceThoughItsZerosAreNoDelimiter) {
+TEST_F(MessageProcessorTest, ALongMessageWithRunsOfZerosIsReportedOnce) {
   std::string message;
   while (message.size() < 4 * LIMIT) {
     message += "xx" + std::string(3, '\0');
@@ -365,7 +357,7 @@ TEST_F(MessageProcessorTest, EachLongMessageIsReported) {
   EXPECT_THAT(Logged(), ElementsAre(TOO_LONG, TOO_LONG, TOO_LONG));
 }
 
-TEST_F(MessageProcessorTest, AStreamWithoutDelimitersCostsBoundedMemory) {
+TEST_F(MessageProcessorTest, AStreamWithoutDelimitersUsesBoundedMemory) {
   SocketPair pair;
   std::jthread writer([&] {
     const std::string block(1 << 20, 'x');
@@ -435,7 +427,7 @@ TEST_F(MessageProcessorTest, EveryDocumentTypeDeclarationIsRefused) {
                 {LOG_LOCAL1 | LOG_ERR, "MessageProcessor:: document type declaration refused"}));
 }
 
-TEST_F(MessageProcessorTest, WhatADocumentMayHoldBesideElementsIsHarmless) {
+TEST_F(MessageProcessorTest, CommentsInstructionsAndNamespacesAreAccepted) {
   Read("<?xml version='1.0' encoding='UTF-8'?><?pi data?><!-- c --><a/><?pi?><!-- c -->" + END +
        "<b xmlns:x='urn:x' x:c='&lt;&#65;'><![CDATA[<&]]></b>" + END +
        "<c xmlns:i='http://www.w3.org/2001/XMLSchema-instance' "
@@ -445,7 +437,7 @@ TEST_F(MessageProcessorTest, WhatADocumentMayHoldBesideElementsIsHarmless) {
   EXPECT_THAT(Logged(), IsEmpty());
 }
 
-TEST_F(MessageProcessorTest, TheDeepestNestingThatFitsIsHandled) {
+TEST_F(MessageProcessorTest, TheDeepestPossibleNestingIsHandled) {
   std::string message;
   for (unsigned long i = 0; i < LIMIT / 7; ++i) {
     message.insert(0, "<a>");
@@ -455,7 +447,7 @@ TEST_F(MessageProcessorTest, TheDeepestNestingThatFitsIsHandled) {
   EXPECT_THAT(processor.handled, ElementsAre("a", "b"));
 }
 
-TEST_F(MessageProcessorTest, NestingThatCannotEndIsRefusedBeforeItsEnd) {
+TEST_F(MessageProcessorTest, ElementsNestedTooDeeplyAreRefusedBeforeTheMessageEnds) {
   std::string message;
   while (message.size() < LIMIT / 2) {
     message += "<a>";
@@ -475,7 +467,7 @@ TEST_F(MessageProcessorTest, ManyAttributesAreHandled) {
   EXPECT_THAT(processor.handled, ElementsAre("a", "b"));
 }
 
-// Exceptions out of the handler.
+// Exceptions from the handler.
 
 TEST_F(MessageProcessorTest, AStandardExceptionEndsItsMessageOnly) {
   processor.thrower = [] { throw std::runtime_error("broken handler"); };
@@ -487,7 +479,7 @@ TEST_F(MessageProcessorTest, AStandardExceptionEndsItsMessageOnly) {
               ElementsAre(LogLine{LOG_LOCAL1 | LOG_ERR, "MessageProcessor:: broken handler"}));
 }
 
-/// An exception and what its line must say.
+/// An exception and the text of its line in the log.
 struct Thrown {
   const char* name;
   std::function<void()> thrower;
@@ -518,7 +510,7 @@ struct Unknown {};
 INSTANTIATE_TEST_SUITE_P(
     Handler, MessageProcessorThrownTest,
     testing::Values(
-        Thrown{"OurException", [] { throw Exception("ours", __FILE__, __LINE__); }, "ours"},
+        Thrown{"OurException", [] { throw Exception("ours"); }, "ours"},
         Thrown{"BadAlloc", [] { throw std::bad_alloc(); }, std::bad_alloc().what()},
         Thrown{"PercentSign", [] { throw std::runtime_error("100%s %n"); }, "100%s %n"},
         Thrown{"String", [] { throw std::string("a database failure"); }, "a database failure"},
@@ -548,7 +540,7 @@ TEST_F(MessageProcessorTest, TheBaseIgnoresErrors) {
   EXPECT_THAT(processor.errors, IsEmpty());
 }
 
-TEST_F(MessageProcessorTest, AFaultyConnectionDoesNotSpoilTheNext) {
+TEST_F(MessageProcessorTest, AFaultyConnectionDoesNotAffectTheNext) {
   processor.thrower = [] { throw std::runtime_error("broken handler"); };
   Read("<throw/>" + END + MessageOf("long", LIMIT + 50));
   processor.handled.clear();

@@ -14,7 +14,7 @@ namespace {
 
 namespace fs = std::filesystem;
 
-/// Paths that are there.
+/// Paths of each kind.
 class PathOnDisk : public testing::Test {
 protected:
   PathOnDisk() {
@@ -43,21 +43,21 @@ unsigned Permissions(const std::string& path) {
   return static_cast<unsigned>(fs::status(path).permissions());
 }
 
-TEST_F(PathOnDisk, ExistsIsTrueForWhateverIsThere) {
+TEST_F(PathOnDisk, ExistsIsTrueForFilesFoldersAndLinksToThem) {
   EXPECT_TRUE(Exists("/tmp/path/folder"));
   EXPECT_TRUE(Exists("/tmp/path/folder/"));
   EXPECT_TRUE(Exists("/tmp/path/file"));
   EXPECT_TRUE(Exists("/tmp/path/link"));
 }
 
-TEST_F(PathOnDisk, ExistsIsFalseForWhatIsNot) {
+TEST_F(PathOnDisk, ExistsIsFalseForMissingPathsAndDanglingLinks) {
   EXPECT_FALSE(Exists("/tmp/path/none"));
   EXPECT_FALSE(Exists("/tmp/path/dangling"));
   EXPECT_FALSE(Exists("/tmp/path/file/below"));
   EXPECT_FALSE(Exists(""));
 }
 
-TEST_F(PathOnDisk, ExistsLooksEachTimeThroughTheCallersString) {
+TEST_F(PathOnDisk, ExistsLooksAtTheFileSystemEachTime) {
   const std::string text = "/tmp/path/later";
   const Path path(text);
   EXPECT_FALSE(path.Exists());
@@ -81,7 +81,7 @@ TEST_F(PathOnDisk, CreateMakesNoParents) {
   EXPECT_FALSE(fs::exists("/tmp/path/none"));
 }
 
-TEST_F(PathOnDisk, CreateTakesNothingThatIsThereAlready) {
+TEST_F(PathOnDisk, CreateFailsForAPathThatExists) {
   fs::permissions("/tmp/path/folder", fs::perms{0700});
   EXPECT_FALSE(Create("/tmp/path/folder", 0775));
   EXPECT_FALSE(Create("/tmp/path/file", 0775));
@@ -98,7 +98,7 @@ TEST_F(PathOnDisk, CanonicalizeGivesTheAbsolutePathWithoutLinksDotsOrTrailingSep
   EXPECT_EQ(Canonicalize("/"), "/");
 }
 
-TEST_F(PathOnDisk, CanonicalizeStartsARelativePathInTheWorkingDirectory) {
+TEST_F(PathOnDisk, CanonicalizeResolvesARelativePathInTheWorkingDirectory) {
   const fs::path before = fs::current_path();
   fs::current_path("/tmp/path");
   EXPECT_EQ(Canonicalize("folder/"), "/tmp/path/folder");
@@ -106,7 +106,7 @@ TEST_F(PathOnDisk, CanonicalizeStartsARelativePathInTheWorkingDirectory) {
   fs::current_path(before);
 }
 
-TEST_F(PathOnDisk, CanonicalizeOfNothingIsEmpty) {
+TEST_F(PathOnDisk, CanonicalizeOfAMissingPathIsEmpty) {
   EXPECT_EQ(Canonicalize("/tmp/path/none"), "");
   EXPECT_EQ(Canonicalize("/tmp/path/dangling"), "");
   EXPECT_EQ(Canonicalize("DUMMY_MOUNT_POINT"), "");
@@ -138,12 +138,12 @@ TEST(MakePath, JoinsWithExactlyOneSeparator) {
   EXPECT_EQ(MakePath("/shares/Vol//", "//Pictures"), "/shares/Vol/Pictures");
 }
 
-TEST(MakePath, KeepsWhatIsInsideAndBehind) {
+TEST(MakePath, KeepsInnerAndTrailingSeparators) {
   EXPECT_EQ(MakePath("/shares/Vol/", "Pictures/"), "/shares/Vol/Pictures/");
   EXPECT_EQ(MakePath("/shares//Vol", "a//b//"), "/shares//Vol/a//b//");
 }
 
-TEST(MakePath, BelowTheRoot) {
+TEST(MakePath, AddsNoSeparatorBelowTheRoot) {
   EXPECT_EQ(MakePath("/", "shares"), "/shares");
   EXPECT_EQ(MakePath("/", "/"), "/");
 }

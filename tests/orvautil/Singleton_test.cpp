@@ -14,7 +14,7 @@ namespace {
 struct Counted {
   Counted() {
     for (int i = 0; i < 1000; ++i) {
-      std::this_thread::yield(); // lets the others come, who must wait
+      std::this_thread::yield(); // lets the other threads come, which must wait
     }
     ++made;
   }
@@ -51,7 +51,7 @@ struct FailsAtFirst {
   inline static int attempts = 0;
 };
 
-TEST(Singleton, AFailedCreationPassesOnAndIsTriedAgain) {
+TEST(Singleton, AFailedCreationThrowsAndIsRepeated) {
   EXPECT_THROW(Singleton<FailsAtFirst>::Instance(), std::runtime_error);
   FailsAtFirst* const instance = Singleton<FailsAtFirst>::Instance();
   EXPECT_NE(instance, nullptr);

@@ -29,7 +29,7 @@ using test::SocketPair;
 static_assert(std::is_base_of_v<Stream, Socket>);
 static_assert(!std::is_copy_constructible_v<Socket>);
 
-/// The address as the system gets it.
+/// An address as the system calls get it.
 struct Bytes {
   explicit Bytes(const std::string& text) : address(text) {
     std::memcpy(&system, address.Get(), address.Length());
@@ -42,7 +42,7 @@ struct Bytes {
   sockaddr_un system{};
 };
 
-TEST(SocketAddress, AnAbsolutePathIsTakenWithItsEnd) {
+TEST(SocketAddress, AnAbsolutePathIncludesItsTerminator) {
   const Bytes bytes("/run/orva/notification.sock");
   EXPECT_EQ(bytes.system.sun_family, AF_UNIX);
   EXPECT_EQ(bytes.Path(), std::string("/run/orva/notification.sock", 28));
@@ -54,7 +54,7 @@ TEST(SocketAddress, AnAtSignMakesAnAbstractName) {
   EXPECT_EQ(bytes.Path(), std::string("\0orva", 5));
 }
 
-TEST(SocketAddress, TheLongestTextsThatTheSystemTakes) {
+TEST(SocketAddress, TheLongestTextsThatTheSystemAllowsAreTaken) {
   EXPECT_EQ(Bytes('/' + std::string(106, 'p')).Path(),
             '/' + std::string(106, 'p') + std::string(1, '\0'));
   EXPECT_EQ(Bytes('@' + std::string(107, 'n')).Path(),
@@ -67,7 +67,7 @@ TEST(SocketAddress, LongerTextsAreExceptions) {
   EXPECT_THROW(Socket::Address('/' + std::string(100'000, 'p')), Exception);
 }
 
-TEST(SocketAddress, TextsThatAreNoAddressAreExceptions) {
+TEST(SocketAddress, TextsThatAreNotAddressesAreExceptions) {
   for (const std::string text : {"", "/", "@", "relative/path", "notification.sock", " /run/x"}) {
     EXPECT_THROW(Socket::Address{text}, Exception) << text;
   }
@@ -82,11 +82,11 @@ TEST(Socket, IsOpenExactlyWhileItHasADescriptor) {
   EXPECT_FALSE(PairEnd(-1).IsOpen());
 }
 
-TEST(Socket, CloseIsHarmlessWhenClosed) {
+TEST(Socket, CloseMayBeRepeated) {
   SocketPair pair;
   const int descriptor = pair.near.Descriptor();
   pair.near.Close();
-  // Whoever is given the number next keeps it.
+  // Another owner of the same number keeps it.
   const int other = dup2(pair.far.Descriptor(), descriptor);
   pair.near.Close();
   EXPECT_NE(fcntl(other, F_GETFD), -1);
@@ -103,7 +103,7 @@ TEST(Socket, TheDestructorClosesTheDescriptor) {
   EXPECT_EQ(fcntl(descriptor, F_GETFD), -1);
 }
 
-TEST(Socket, ReadGivesWhatIsThereUpToItsSize) {
+TEST(Socket, ReadReturnsAvailableBytesUpToItsSize) {
   SocketPair pair;
   ASSERT_EQ(pair.far.Write("abcdef", 6), 6U);
   char data[16] = {};
@@ -119,7 +119,7 @@ TEST(Socket, ReadAtTheEndOfTheStreamIsZero) {
   EXPECT_EQ(pair.near.Read(&byte, 1), 0U);
 }
 
-TEST(Socket, ReadFromAPeerThatResetIsZero) {
+TEST(Socket, ReadAfterAResetByThePeerIsZero) {
   SocketPair pair;
   ASSERT_EQ(pair.near.Write("unread", 6), 6U);
   pair.far.Close(); // with bytes unread, which the system calls a reset
@@ -151,8 +151,8 @@ TEST(Socket, WriteWritesEverythingToASlowReader) {
   EXPECT_EQ(received, sent.size());
 }
 
-TEST(Socket, WriteToAVanishedPeerIsShortAndRaisesNoSignal) {
-  ASSERT_EQ(std::signal(SIGPIPE, SIG_DFL), SIG_DFL) << "the signal must be deadly here";
+TEST(Socket, WriteToAClosedPeerIsShortAndRaisesNoSignal) {
+  ASSERT_EQ(std::signal(SIGPIPE, SIG_DFL), SIG_DFL) << "the default action ends the process";
   SocketPair pair;
   pair.far.Close();
   EXPECT_EQ(pair.near.Write("abc", 3), 0U);
@@ -197,7 +197,7 @@ void InstallInterruption() {
   sigaction(SIGUSR1, &action, nullptr);
 }
 
-TEST(Socket, AnInterruptedReadGoesOnWaiting) {
+TEST(Socket, AnInterruptedReadContinues) {
   InstallInterruption();
   interruptions = 0;
   SocketPair pair;
@@ -221,7 +221,7 @@ TEST(Socket, AnInterruptedReadGoesOnWaiting) {
   EXPECT_EQ(byte, 'x');
 }
 
-TEST(Socket, AnInterruptedWriteGoesOnWaiting) {
+TEST(Socket, AnInterruptedWriteContinues) {
   InstallInterruption();
   interruptions = 0;
   SocketPair pair;

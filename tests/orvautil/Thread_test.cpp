@@ -13,7 +13,7 @@
 namespace orva::util {
 namespace {
 
-/// Counts its runs, notes where they happen, and may be held up.
+/// Counts its runs, records the thread that runs it, and can be held up.
 class Worker : public Thread {
 public:
   ~Worker() override { Wait(); }
@@ -36,7 +36,7 @@ public:
   std::atomic<int> runs = 0;
 };
 
-TEST(Thread, CreateRunsTheBodyOnceOnAThreadOfItsOwn) {
+TEST(Thread, CreateRunsTheBodyOnceOnANewThread) {
   Worker worker;
   worker.gate.count_down();
   worker.Create(8, 0, false);
@@ -55,7 +55,7 @@ TEST(Thread, CreateDoesNotWaitForTheBodyAndWaitDoes) {
   EXPECT_EQ(worker.runs, 1);
 }
 
-TEST(Thread, TheStackHasTheSizeAskedFor) {
+TEST(Thread, TheStackHasTheRequestedSize) {
   Worker worker;
   worker.gate.count_down();
   worker.Create(64, 0, false);
@@ -73,7 +73,7 @@ TEST(Thread, WaitReturnsAtOnceWhenThereIsNothingToWaitFor) {
   EXPECT_EQ(worker.runs, 1);
 }
 
-TEST(Thread, ArgumentsThatMeanNothingAreRefusedAndStartNothing) {
+TEST(Thread, InvalidArgumentsAreRefusedAndStartNothing) {
   Worker worker;
   worker.gate.count_down();
   EXPECT_THROW(worker.Create(0, 0, false), Exception);

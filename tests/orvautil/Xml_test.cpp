@@ -1,6 +1,6 @@
-#include "Platform.h"
-
 #include "orvautil/Xml.h"
+
+#include "support/XmlPlatform.h"
 
 #include <gtest/gtest.h>
 
@@ -35,7 +35,7 @@ private:
 
 class Xml : public testing::Test {
 private:
-  test::Platform platform_;
+  test::XmlPlatform platform_;
 };
 
 TEST_F(Xml, TextBecomesUtf8) {
@@ -44,12 +44,12 @@ TEST_F(Xml, TextBecomesUtf8) {
   EXPECT_EQ(XMLCh2string(u"\U0001f4f7"), "\xf0\x9f\x93\xb7");
 }
 
-TEST_F(Xml, NoTextIsEmpty) {
+TEST_F(Xml, NullIsAnEmptyText) {
   EXPECT_EQ(XMLCh2string(nullptr), "");
   EXPECT_EQ(XMLCh2string(u""), "");
 }
 
-TEST_F(Xml, LongTextIsWhole) {
+TEST_F(Xml, LongTextsAreConvertedCompletely) {
   EXPECT_EQ(XMLCh2string(std::u16string(100'000, u'\u20ac').c_str()).size(), 300'000U);
 }
 
@@ -68,7 +68,7 @@ TEST_F(Xml, AttributeValuesAreUtf8WithReferencesResolved) {
   EXPECT_EQ(attributes.Value("n\xc3\xa9"), "x & \xe2\x82\xac");
 }
 
-TEST_F(Xml, AttributeNamesAreCaseSensitiveAndWhole) {
+TEST_F(Xml, AttributeNamesMustMatchCompletely) {
   const Attributes attributes("<a Name='x'/>");
   EXPECT_EQ(attributes.Value("name"), "");
   EXPECT_EQ(attributes.Value("Nam"), "");

@@ -14,7 +14,7 @@ long long ProcessorTime(const thread_times& times) {
   return times.user + times.system;
 }
 
-/// Works until `timer`, started on this thread, shows this much processor time.
+/// Uses the processor until `timer`, started on this thread, shows this much processor time.
 void Work(const thread_timer& timer, long long nanoseconds) {
   while (ProcessorTime(timer.Elapsed()) < nanoseconds) {
   }

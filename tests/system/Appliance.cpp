@@ -1,6 +1,7 @@
 #include "Appliance.h"
 
 #include "Database.h"
+#include "Expectations.h"
 #include "Tracer.h"
 #include "orvautil/Core.h"
 
@@ -19,11 +20,6 @@ const std::string REJECTION = "ERROR ! Node name = ";
 const std::string BARRIER = "barrier";
 const std::string DIRECTORY = "/tmp/daemon";
 const std::string OUTPUT = "/tmp/daemon.out";
-
-std::string MaskTimes(const std::string& text) {
-  static const std::regex TIME(R"(\d+\.\d{3} W   \d+\.\d{3} U   \d+\.\d{3} S   \d+\.\d%)");
-  return std::regex_replace(text, TIME, "TIME");
-}
 
 std::string MaskAddresses(const std::string& text) {
   static const std::regex ADDRESS("0x[0-9a-f]+");

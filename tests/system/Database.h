@@ -1,18 +1,18 @@
 #pragma once
 
-#include <memory>
+#include <SQLiteCpp/SQLiteCpp.h>
+
 #include <string>
 #include <vector>
 
-struct sqlite3;
-
 namespace orva::test {
 
-/// A database file as other programs see it, over SQLite's own interface. Failures are thrown
-/// as std::runtime_error.
-class Database {
+/// A database file as other programs see it. Failures are thrown as SQLite::Exception, which is a
+/// std::runtime_error.
+class Database : public SQLite::Database {
 public:
-  /// Opens the file at `path`, which must exist unless `create` is set.
+  /// Opens the file at `path`, which must exist unless `create` is set. Waits up to a minute for
+  /// locks.
   explicit Database(const std::string& path, bool create = false);
 
   using Values = std::vector<std::string>;
@@ -20,12 +20,6 @@ public:
   /// Runs one statement with the values bound to its parameters, as texts that the columns'
   /// affinities convert. Returns the rows, the columns of each joined by '|'.
   std::vector<std::string> Run(const std::string& sql, const Values& values = {}) const;
-
-private:
-  struct Closer {
-    void operator()(sqlite3* handle) const;
-  };
-  std::unique_ptr<sqlite3, Closer> handle_;
 };
 
 } // namespace orva::test

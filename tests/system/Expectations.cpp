@@ -2,15 +2,25 @@
 
 #include "orvautil/FormatString.h"
 
+#include <regex>
 #include <sstream>
 
 namespace orva::test {
 
-std::string MasterText(const Volume& volume) {
+std::string MaskTimes(const std::string& text) {
+  static const std::regex TIME(R"(\d+\.\d{3} W   \d+\.\d{3} U   \d+\.\d{3} S   \d+\.\d%)");
+  return std::regex_replace(text, TIME, "TIME");
+}
+
+std::string MasterText(const std::string& mountPoint, double capacity, double used) {
   std::ostringstream text;
-  text << "\nMountPoint: " << volume.MountPoint() << "\nCapacity: " << volume.Capacity()
-       << "M\nUsed: " << volume.Used() << "M\nPhotoDB size: 1\nReadOnly: 0\n";
+  text << "\nMountPoint: " << mountPoint << "\nCapacity: " << capacity << "M\nUsed: " << used
+       << "M\nPhotoDB size: 1\nReadOnly: 0\n";
   return text.str();
+}
+
+std::string MasterText(const Volume& volume) {
+  return MasterText(volume.MountPoint(), volume.Capacity(), volume.Used());
 }
 
 LogLine PluggedLine(const Volume& volume) {

@@ -10,9 +10,8 @@
 
 namespace orva::test {
 
-/// A test of the running daemon. When the test ends and the daemon still runs, its service is
-/// stopped, and the daemon must end well: so every test also checks that nothing was broken on
-/// the way (and the sanitizers have their say).
+/// A test of the running daemon. At the end its service is stopped, and a daemon that still runs
+/// must exit without an error, which includes those that a sanitizer reports.
 class SystemTest : public ::testing::Test {
 protected:
   void TearDown() override {
@@ -27,14 +26,20 @@ protected:
 using Log = std::vector<LogLine>;
 using Lines = std::vector<std::string>;
 
-/// Several pieces of a log, one behind the other.
-inline Log operator+(Log first, const Log& second) {
+/// A list that is followed by another one.
+template <typename Item>
+std::vector<Item> operator+(std::vector<Item> first, const std::vector<Item>& second) {
   first.insert(first.end(), second.begin(), second.end());
   return first;
 }
 
-/// The text of a volume as the master in a log line. Taken while it stands at what the daemon
-/// saw when the volume was plugged.
+/// A line of the log with TIME in place of an elapsed time.
+std::string MaskTimes(const std::string& text);
+
+/// The text of a master in a log line; sizes in bytes.
+std::string MasterText(const std::string& mountPoint, double capacity, double used = 0);
+
+/// The same for a volume whose sizes are still those that the daemon saw when it was plugged.
 std::string MasterText(const Volume& volume);
 
 /// The text of the shares root as the master.
@@ -49,7 +54,7 @@ inline Log BatchLines() {
   return {Info(":: Transcodedbatch "), Info("Profile ==> cb62bbdd389b48898f2e5244977cb2c5 ==> \n")};
 }
 
-/// The lines of a merge that goes through: `folders` with the root row, `files` as read.
+/// The lines of a merge that succeeds: `folders` with the root row, `files` as read.
 Log MergeLines(const std::string& mountPoint, int folders, int files);
 
 const std::string SHARES_LOCATOR = "zophotos_db_path=/shares//.zophotos/zophotos.db\n";

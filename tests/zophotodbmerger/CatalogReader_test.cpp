@@ -1,7 +1,7 @@
 #include "CatalogReader.h"
 
+#include "Catalog.h"
 #include "FolderItemCmp.h"
-#include "TestCatalog.h"
 
 #include "orvadb/File.h"
 #include "orvadb/Folder.h"
@@ -20,7 +20,7 @@ using ::testing::ElementsAre;
 using ::testing::IsEmpty;
 
 constexpr const char* MOUNT_POINT = "/shares/Vol/";
-constexpr const char* MORE_THAN_32_BITS = "4294967301"; // 2^32 + 5
+constexpr long MORE_THAN_32_BITS = 4294967301; // 2^32 + 5
 
 class CatalogReaderTest : public ::testing::Test {
 protected:
@@ -34,7 +34,7 @@ protected:
 
   PhotoCounts Count() const { return CountPhotos(MOUNT_POINT, db::VolumeDB(MOUNT_POINT, false)); }
 
-  TestCatalog catalog{MOUNT_POINT};
+  Catalog catalog{MOUNT_POINT};
 };
 
 template <typename Item>
@@ -46,7 +46,7 @@ std::vector<std::string> Paths(const util::OwnerVector<Item>& items) {
   return paths;
 }
 
-TEST_F(CatalogReaderTest, EmptyCatalogYieldsTheRootAlone) {
+TEST_F(CatalogReaderTest, EmptyCatalogHasOnlyTheRoot) {
   const auto folders = ReadFolders();
   ASSERT_EQ(1U, folders.size());
   const db::Folder& root = *folders.front();
@@ -67,7 +67,7 @@ TEST_F(CatalogReaderTest, EmptyCatalogYieldsTheRootAlone) {
 }
 
 TEST_F(CatalogReaderTest, RootKeepsTheMountPointAsGiven) {
-  catalog.AddFolder(1, "Pictures/");
+  catalog.AddFolder("Pictures/");
   EXPECT_THAT(Paths(ReadFolders("/shares/Vol//")),
               ElementsAre("/shares/Vol//", "/shares/Vol/Pictures/"));
   EXPECT_THAT(Paths(ReadFolders("/shares/Vol")),
@@ -104,9 +104,9 @@ TEST_F(CatalogReaderTest, EveryColumnOfAFolderIsRead) {
 }
 
 TEST_F(CatalogReaderTest, InvisibleFoldersAreLeftOut) {
-  catalog.Add(FolderRow{.id = 1, .path = "backup/", .isBackup = true});
-  catalog.Add(FolderRow{.id = 2, .path = "hidden/", .isHidden = true});
-  catalog.Add(FolderRow{.id = 3, .path = "system/", .isSystem = true});
+  catalog.AddFolder("backup/", 0, {.backup = true});
+  catalog.AddFolder("hidden/", 0, {.hidden = true});
+  catalog.AddFolder("system/", 0, {.system = true});
   EXPECT_THAT(Paths(ReadFolders()), ElementsAre("/shares/Vol/"));
 }
 
@@ -115,13 +115,13 @@ TEST_F(CatalogReaderTest, DeletedFoldersAreRead) {
   EXPECT_THAT(Paths(ReadFolders()), ElementsAre("/shares/Vol/", "/shares/Vol/deleted/"));
 }
 
-TEST_F(CatalogReaderTest, FolderComesBeforeAllThatItHolds) {
-  catalog.AddFolder(1, "b/c/d/");
-  catalog.AddFolder(2, "b/c/");
-  catalog.AddFolder(3, "\xC3\xA9/");
-  catalog.AddFolder(4, "b-1/");
-  catalog.AddFolder(5, "b/");
-  catalog.AddFolder(6, "B/");
+TEST_F(CatalogReaderTest, FolderComesBeforeItsContent) {
+  catalog.AddFolder("b/c/d/");
+  catalog.AddFolder("b/c/");
+  catalog.AddFolder("\xC3\xA9/");
+  catalog.AddFolder("b-1/");
+  catalog.AddFolder("b/");
+  catalog.AddFolder("B/");
   EXPECT_THAT(Paths(ReadFolders()),
               ElementsAre("/shares/Vol/", "/shares/Vol/B/", "/shares/Vol/b-1/", "/shares/Vol/b/",
                           "/shares/Vol/b/c/", "/shares/Vol/b/c/d/", "/shares/Vol/\xC3\xA9/"));
@@ -139,9 +139,9 @@ TEST_F(CatalogReaderTest, FurtherColumnsOfAFolderAreIgnored) {
   EXPECT_EQ(0, folders[1]->fileCount);
 }
 
-TEST_F(CatalogReaderTest, FolderTimesAre32BitsWithTheirSign) {
-  catalog.Rows().Run("INSERT INTO Folders VALUES(1, -1, 'a/', 'a', 4, ?, 0, 0, 0, 0, 0, ?)",
-                     {MORE_THAN_32_BITS, "2147483648"});
+TEST_F(CatalogReaderTest, FolderTimesAreSigned32BitNumbers) {
+  catalog.Add(FolderRow{
+      .path = "a/", .lastModifiedDate = MORE_THAN_32_BITS, .lastUpdatedDate = 2147483648});
   const auto folders = ReadFolders();
   ASSERT_EQ(2U, folders.size());
   EXPECT_EQ(5, folders[1]->lastModifiedDate);
@@ -182,10 +182,8 @@ TEST_F(CatalogReaderTest, EveryColumnOfAFileIsRead) {
   EXPECT_EQ(6'000'000'000, file.size);
 }
 
-TEST_F(CatalogReaderTest, FileTimesAre32BitsWithTheirSign) {
-  catalog.Rows().Run("INSERT INTO Files VALUES(1, -1, 'a', 'a', 3, ?, 0, 0, 0, 0, 3, 0, '', 0)",
-                     {MORE_THAN_32_BITS});
-  catalog.Add(TranscodingRow{.sourceId = 1, .lastUpdatedDate = 2147483648});
+TEST_F(CatalogReaderTest, FileTimesAreSigned32BitNumbers) {
+  catalog.AddPhoto("a", MORE_THAN_32_BITS, 2147483648);
   const auto files = ReadChangedFiles(0);
   ASSERT_EQ(1U, files.size());
   EXPECT_EQ(5, files.front()->lastModifiedDate);
@@ -193,27 +191,27 @@ TEST_F(CatalogReaderTest, FileTimesAre32BitsWithTheirSign) {
 }
 
 TEST_F(CatalogReaderTest, OnlyTranscodingsStrictlyAfterTheTimeAreRead) {
-  catalog.AddPhoto(1, "a", 0, 99);
-  catalog.AddPhoto(2, "b", 0, 100);
-  catalog.AddPhoto(3, "c", 0, 101);
+  catalog.AddPhoto("a", 0, 99);
+  catalog.AddPhoto("b", 0, 100);
+  catalog.AddPhoto("c", 0, 101);
   EXPECT_THAT(Paths(ReadChangedFiles(100)), ElementsAre("/shares/Vol/c"));
 }
 
 TEST_F(CatalogReaderTest, FirstReadHasEveryTranscodingAfterTheEpoch) {
-  catalog.AddPhoto(1, "a", 0, 0);
-  catalog.AddPhoto(2, "b", 0, 1);
-  catalog.AddPhoto(3, "c", 0, 2'000'000'000);
+  catalog.AddPhoto("a", 0, 0);
+  catalog.AddPhoto("b", 0, 1);
+  catalog.AddPhoto("c", 0, 2'000'000'000);
   EXPECT_THAT(Paths(ReadChangedFiles(0)), ElementsAre("/shares/Vol/b", "/shares/Vol/c"));
 }
 
 TEST_F(CatalogReaderTest, TimeOfAReadIsComparedIn64Bits) {
-  catalog.AddPhoto(1, "a", 0, 5'000'000'000);
-  catalog.AddPhoto(2, "b", 0, 5'000'000'001);
+  catalog.AddPhoto("a", 0, 5'000'000'000);
+  catalog.AddPhoto("b", 0, 5'000'000'001);
   EXPECT_THAT(Paths(ReadChangedFiles(5'000'000'000)), ElementsAre("/shares/Vol/b"));
 }
 
-TEST_F(CatalogReaderTest, OnlyTheFixedProfileCounts) {
-  catalog.AddPhoto(1, "a", 0, 10);
+TEST_F(CatalogReaderTest, OnlyTranscodingsOfTheProfileAreRead) {
+  catalog.AddPhoto("a", 0, 10);
   catalog.Add(FileRow{.id = 2, .path = "b"});
   catalog.Add(TranscodingRow{
       .sourceId = 2, .lastUpdatedDate = 10, .profile = "cb62bbdd389b48898f2e5244977cb2c6"});
@@ -221,7 +219,7 @@ TEST_F(CatalogReaderTest, OnlyTheFixedProfileCounts) {
   EXPECT_THAT(Paths(ReadChangedFiles(0)), ElementsAre("/shares/Vol/a"));
 }
 
-TEST_F(CatalogReaderTest, FinishedOnesOfPresentFilesAndWithdrawnOnesOfDeletedFilesAreRead) {
+TEST_F(CatalogReaderTest, FinishedTranscodingsOfPresentFilesAndWithdrawnOnesOfDeletedFilesAreRead) {
   for (const bool deleted : {false, true}) {
     for (const long status : {-1, 0, 1, 2, 3}) {
       const long id = 10 * static_cast<long>(deleted) + status + 2;
@@ -236,7 +234,7 @@ TEST_F(CatalogReaderTest, FinishedOnesOfPresentFilesAndWithdrawnOnesOfDeletedFil
   EXPECT_FALSE(files[1]->isDeleted);
 }
 
-TEST_F(CatalogReaderTest, FlagsAndCategoryDoNotKeepAFileBack) {
+TEST_F(CatalogReaderTest, FilesOfAnyFlagsAndCategoryAreRead) {
   catalog.Add(FileRow{.id = 1, .path = "backup", .isBackup = true});
   catalog.Add(FileRow{.id = 2, .path = "hidden", .isHidden = true});
   catalog.Add(FileRow{.id = 3, .path = "song", .category = 1});
@@ -248,26 +246,26 @@ TEST_F(CatalogReaderTest, FlagsAndCategoryDoNotKeepAFileBack) {
                                                       "/shares/Vol/song", "/shares/Vol/system"));
 }
 
-TEST_F(CatalogReaderTest, FileComesOncePerTranscoding) {
-  catalog.AddPhoto(1, "a", 0, 10);
+TEST_F(CatalogReaderTest, FileIsReadOncePerTranscoding) {
+  catalog.AddPhoto("a", 0, 10);
   catalog.Add(TranscodingRow{.sourceId = 1, .lastUpdatedDate = 20});
   EXPECT_THAT(Paths(ReadChangedFiles(0)), ElementsAre("/shares/Vol/a", "/shares/Vol/a"));
 }
 
 TEST_F(CatalogReaderTest, FilesAreSortedByFullPath) {
-  catalog.AddPhoto(1, "b/z.jpg", 0, 10);
-  catalog.AddPhoto(2, "b.jpg", 0, 10);
-  catalog.AddPhoto(3, "\xC3\xA9.jpg", 0, 10);
-  catalog.AddPhoto(4, "b/a.jpg", 0, 10);
-  catalog.AddPhoto(5, "Z.jpg", 0, 10);
+  catalog.AddPhoto("b/z.jpg", 0, 10);
+  catalog.AddPhoto("b.jpg", 0, 10);
+  catalog.AddPhoto("\xC3\xA9.jpg", 0, 10);
+  catalog.AddPhoto("b/a.jpg", 0, 10);
+  catalog.AddPhoto("Z.jpg", 0, 10);
   EXPECT_THAT(Paths(ReadChangedFiles(0)),
               ElementsAre("/shares/Vol/Z.jpg", "/shares/Vol/b.jpg", "/shares/Vol/b/a.jpg",
                           "/shares/Vol/b/z.jpg", "/shares/Vol/\xC3\xA9.jpg"));
 }
 
 TEST_F(CatalogReaderTest, NullTextsReadAsEmpty) {
-  catalog.Rows().Run("INSERT INTO Files VALUES(1, -1, 'a', NULL, 3, 0, 0, 0, 0, 0, 3, 0, NULL, 0)");
-  catalog.Add(TranscodingRow{.sourceId = 1, .lastUpdatedDate = 10});
+  catalog.AddPhoto("a", 0, 10);
+  catalog.Rows().Run("UPDATE Files SET name = NULL, ext = NULL");
   const auto files = ReadChangedFiles(0);
   ASSERT_EQ(1U, files.size());
   EXPECT_EQ("", files.front()->name);
@@ -281,21 +279,20 @@ TEST_F(CatalogReaderTest, EmptyCatalogCountsZero) {
 }
 
 TEST_F(CatalogReaderTest, PhotosOfStatusThreeCountAsTranscoded) {
-  long id = 0;
   for (const long status : {0, 1, 2, 3, 3, 4}) {
-    catalog.Add(FileRow{.id = ++id, .status = status});
+    catalog.Add(FileRow{.status = status});
   }
   EXPECT_EQ(2, Count().transcoded);
   EXPECT_EQ(6, Count().total);
 }
 
 TEST_F(CatalogReaderTest, OnlyVisiblePresentPhotosAreCounted) {
-  catalog.Add(FileRow{.id = 1});
-  catalog.Add(FileRow{.id = 2, .category = 2});
-  catalog.Add(FileRow{.id = 3, .isBackup = true});
-  catalog.Add(FileRow{.id = 4, .isHidden = true});
-  catalog.Add(FileRow{.id = 5, .isSystem = true});
-  catalog.Add(FileRow{.id = 6, .isDeleted = true});
+  catalog.Add(FileRow{});
+  catalog.Add(FileRow{.category = 2});
+  catalog.Add(FileRow{.isBackup = true});
+  catalog.Add(FileRow{.isHidden = true});
+  catalog.Add(FileRow{.isSystem = true});
+  catalog.Add(FileRow{.isDeleted = true});
   EXPECT_EQ(1, Count().transcoded);
   EXPECT_EQ(1, Count().total);
 }
@@ -312,16 +309,16 @@ TEST_F(CatalogReaderTest, MissingTableIsThrown) {
   EXPECT_THROW(Count(), std::string);
 }
 
-TEST_F(CatalogReaderTest, BrokenRowEndsTheListAndItsTransaction) {
-  catalog.AddFolder(1, "a/");
-  catalog.AddFolder(2, "b/");
-  catalog.AddFolder(3, "c/");
+TEST_F(CatalogReaderTest, UnreadableRowEndsTheListAndFailsItsTransaction) {
+  catalog.AddFolder("a/");
+  catalog.AddFolder("b/");
+  catalog.AddFolder("c/");
   catalog.Rows().Run("UPDATE Folders SET name = zeroblob(20000000) WHERE id = 3");
   const db::VolumeDB connection(MOUNT_POINT, false);
-  db::Transaction transaction(connection, 1000, __FILE__, __LINE__);
+  db::Transaction transaction(connection, 1000);
   EXPECT_THAT(Paths(dbmerger::ReadFolders(MOUNT_POINT, connection)),
               ElementsAre("/shares/Vol/", "/shares/Vol/a/", "/shares/Vol/b/"));
-  EXPECT_THROW(transaction.Commit(__FILE__, __LINE__), std::string);
+  EXPECT_THROW(transaction.Commit(), std::string);
 }
 
 TEST(FolderItemCmp, PathComesBeforeAllLongerPathsThatBeginWithIt) {
@@ -335,7 +332,7 @@ TEST(FolderItemCmp, PathComesBeforeAllLongerPathsThatBeginWithIt) {
   EXPECT_FALSE(before(&shorter, &shorter));
 }
 
-TEST(FolderItemCmp, BytesAreUnsigned) {
+TEST(FolderItemCmp, BytesAreComparedAsUnsigned) {
   const dbmerger::FolderItemCmp<db::FolderItem> before;
   db::Folder ascii;
   db::Folder accented;

@@ -107,7 +107,7 @@ TEST_F(DiffFolderTest, EmptyCatalogListMakesEveryMergedFolderRemoved) {
   EXPECT_THAT(Names(result.common), IsEmpty());
 }
 
-TEST_F(DiffFolderTest, EveryFolderGoesToTheSideThatHasIt) {
+TEST_F(DiffFolderTest, FoldersAreAssignedToTheSideThatHasThem) {
   for (const char* const name : {"a", "c", "d", "f"}) {
     merged.push_back(MergedFolder(1, name));
   }
@@ -207,7 +207,7 @@ TEST_F(DiffFileTest, EmptyCatalogListMakesEveryMergedFileRemoved) {
   EXPECT_THAT(Names(result.added), IsEmpty());
 }
 
-TEST_F(DiffFileTest, FileOnBothSidesIsNoDifferenceWhateverItsDates) {
+TEST_F(DiffFileTest, FileOnBothSidesIsNoDifferenceWithAnyDates) {
   merged.push_back(MergedFile(1, "a.jpg"));
   catalog.push_back(CatalogItem<db::File>("a.jpg", 987654));
   Diff();
@@ -215,7 +215,7 @@ TEST_F(DiffFileTest, FileOnBothSidesIsNoDifferenceWhateverItsDates) {
   EXPECT_THAT(Names(result.removed), IsEmpty());
 }
 
-TEST_F(DiffFileTest, EveryFileGoesToTheSideThatHasIt) {
+TEST_F(DiffFileTest, FilesAreAssignedToTheSideThatHasThem) {
   for (const char* const name : {"a", "c", "cc", "e"}) {
     merged.push_back(MergedFile(1, name));
   }
@@ -227,7 +227,7 @@ TEST_F(DiffFileTest, EveryFileGoesToTheSideThatHasIt) {
   EXPECT_THAT(Names(result.added), ElementsAre("b", "d"));
 }
 
-TEST_F(DiffFileTest, NewRecordIsCreatedWhenItWasModified) {
+TEST_F(DiffFileTest, CreationDateOfANewRecordIsItsModificationDate) {
   catalog.push_back(CatalogItem<db::File>("a.jpg", 1234));
   Diff();
   ASSERT_EQ(1U, result.added.size());

@@ -16,7 +16,7 @@ TEST(Constants, NameTheMergedDatabaseFile) {
   EXPECT_STREQ("zophotos.db", PHOTO_DB_NAME);
 }
 
-TEST(Constants, KeepBothSeparators) {
+TEST(Constants, HaveBothSeparators) {
   EXPECT_EQ("/", NATIVE_PATH_SEPARATOR);
   EXPECT_EQ("\\", OTHER_PATH_SEPARATOR);
 }

@@ -1,9 +1,9 @@
 #include "DaemonLayerTest.h"
 
+#include "Catalog.h"
 #include "DBMerger.h"
 #include "Deadline.h"
 #include "PhotoDB.h"
-#include "TestCatalog.h"
 #include "VolumeInfoManager.h"
 
 #include <fstream>
@@ -23,7 +23,7 @@ using ::testing::IsEmpty;
 const std::string MASTER = "/shares/Master/";
 const std::string VOLUME = "/shares/Vol/";
 
-/// A value that is longer than any that is read: a row that has it cannot be.
+/// A value that is too long to be read, so that its row cannot be read either.
 const std::string UNREADABLE = "zeroblob(20000000)";
 
 class DBMergerTest : public DaemonLayerTest {
@@ -49,27 +49,27 @@ protected:
 
   /// Two folders with three photos.
   void AddPhotos() {
-    catalog.AddFolder(1, "a/", 11);
-    catalog.AddFolder(2, "a/b/", 12);
-    catalog.AddPhoto(1, "top.jpg", 21, 100);
-    catalog.AddPhoto(2, "a/one.jpg", 22, 300);
-    catalog.AddPhoto(3, "a/b/two.jpg", 23, 200);
+    catalog.AddFolder("a/", 11);
+    catalog.AddFolder("a/b/", 12);
+    catalog.AddPhoto("top.jpg", 21, 100);
+    catalog.AddPhoto("a/one.jpg", 22, 300);
+    catalog.AddPhoto("a/b/two.jpg", 23, 200);
   }
 
-  /// The one line of a merge that was given up, without its beginning.
+  /// The only error in the log: that of a failed merge, without its beginning.
   std::string FailureOfTheMerge() {
     const std::string beginning = "Error that we will ignore ";
     Log lines = Logged();
     std::erase_if(lines, [](const LogLine& line) { return line.priority == Info("").priority; });
     if (lines.size() != 1 || lines[0].priority != Error("").priority ||
         !lines[0].text.starts_with(beginning) || !lines[0].text.ends_with('\n')) {
-      throw std::logic_error("not the one line of a failed merge: " +
+      throw std::logic_error("not the only error of a failed merge: " +
                              ::testing::PrintToString(lines));
     }
     return lines[0].text.substr(beginning.size());
   }
 
-  TestCatalog catalog{VOLUME};
+  Catalog catalog{VOLUME};
   DBMerger merger;
 };
 
@@ -97,14 +97,14 @@ TEST_F(DaemonLayerTest, MergerLogsTheRegisteredMountPoints) {
                                                 Info("Iterating over mount point /shares/c/\n")));
 }
 
-TEST_F(DaemonLayerTest, MergerWithoutVolumesEndsSilentlyAndMakesTheRegistry) {
+TEST_F(DaemonLayerTest, MergerWithoutVolumesEndsSilentlyAndCreatesTheRegistry) {
   DBMerger merger;
   EXPECT_NE(nullptr, VolumeInfoManager::instance);
   merger.Wait();
   EXPECT_THAT(LoggedByAllThreads(), IsEmpty());
 }
 
-TEST_F(DaemonLayerTest, MergerHasItsCopyOfTheRegistryWhenItIsMade) {
+TEST_F(DaemonLayerTest, MergerCopiesTheRegistryWhenItIsCreated) {
   VolumeInfo volume{.mountPoint = MakeDirectory("/shares/a/")};
   VolumeInfoManager::Instance().addVolumeInfo(volume);
   DBMerger merger;
@@ -115,7 +115,7 @@ TEST_F(DaemonLayerTest, MergerHasItsCopyOfTheRegistryWhenItIsMade) {
 
 // Merges.
 
-TEST_F(DBMergerTest, FirstMergeBringsEverything) {
+TEST_F(DBMergerTest, FirstMergeAddsEverything) {
   AddPhotos();
   EXPECT_EQ(Adding("/shares/Vol/a/b/two.jpg") + Adding("/shares/Vol/a/one.jpg") +
                 Adding("/shares/Vol/top.jpg"),
@@ -132,7 +132,7 @@ TEST_F(DBMergerTest, FirstMergeBringsEverything) {
 }
 
 TEST_F(DBMergerTest, TranscodingAtTheEpochIsNotNew) {
-  catalog.AddPhoto(1, "a.jpg", 0, 0);
+  catalog.AddPhoto("a.jpg", 0, 0);
   EXPECT_EQ("", Merge());
   EXPECT_THAT(MergedStatistics(MASTER), ElementsAre("/shares/Vol/|1|1|0"));
 }
@@ -141,8 +141,8 @@ TEST_F(DBMergerTest, LaterMergeReadsOnlyWhatChangedSince) {
   AddPhotos();
   Merge();
   Logged();
-  catalog.AddPhoto(4, "a/new.jpg", 24, 301);
-  catalog.AddPhoto(5, "a/same second.jpg", 25, 300);
+  catalog.AddPhoto("a/new.jpg", 24, 301);
+  catalog.AddPhoto("a/same second.jpg", 25, 300);
   EXPECT_EQ(Adding("/shares/Vol/a/new.jpg"), Merge());
   EXPECT_EQ(MergeLines(VOLUME, 3, 1), Logged());
   EXPECT_THAT(MergedFiles(MASTER), ElementsAre("/shares/Vol/a/b/two.jpg", "/shares/Vol/a/new.jpg",
@@ -155,7 +155,7 @@ TEST_F(DBMergerTest, UnchangedMergeRefreshesTheCountsOnly) {
   Merge();
   Logged();
   catalog.Add(FileRow{.id = 9, .path = "unfinished.jpg", .status = 1});
-  catalog.AddFolder(3, "new/");
+  catalog.AddFolder("new/");
   EXPECT_EQ("", Merge());
   EXPECT_EQ(MergeLines(VOLUME, 4, 0), Logged());
   EXPECT_THAT(MergedStatistics(MASTER), ElementsAre("/shares/Vol/|3|4|300"));
@@ -163,10 +163,10 @@ TEST_F(DBMergerTest, UnchangedMergeRefreshesTheCountsOnly) {
               ElementsAre("1"));
 }
 
-TEST_F(DBMergerTest, DeletedFileIsRemovedAndMovesTheTime) {
+TEST_F(DBMergerTest, DeletedFileIsRemovedAndAdvancesTheTime) {
   AddPhotos();
   Merge();
-  catalog.DeletePhoto(2, 400);
+  catalog.DeletePhoto("a/one.jpg", 400);
   const std::string path = "/shares/Vol/a/one.jpg";
   EXPECT_EQ(Processing(path, true) + "Removing file " + path + " for mount /shares/Vol/\n" +
                 "Deleting " + path + "\nFound parent folder 3 for " + path + "\n",
@@ -175,18 +175,18 @@ TEST_F(DBMergerTest, DeletedFileIsRemovedAndMovesTheTime) {
   EXPECT_THAT(MergedStatistics(MASTER), ElementsAre("/shares/Vol/|2|2|400"));
 }
 
-TEST_F(DBMergerTest, DeletedFileThatWasNeverMergedMovesTheTimeAsWell) {
+TEST_F(DBMergerTest, DeletedFileThatWasNeverMergedAdvancesTheTime) {
   AddPhotos();
-  catalog.DeletePhoto(2, 400);
+  catalog.DeletePhoto("a/one.jpg", 400);
   Merge();
   EXPECT_THAT(MergedFiles(MASTER), ElementsAre("/shares/Vol/a/b/two.jpg", "/shares/Vol/top.jpg"));
   EXPECT_THAT(MergedStatistics(MASTER), ElementsAre("/shares/Vol/|2|2|400"));
 }
 
-TEST_F(DBMergerTest, DeletedFolderGoesWithItsFiles) {
+TEST_F(DBMergerTest, DeletedFolderIsRemovedWithItsFiles) {
   AddPhotos();
   Merge();
-  catalog.Rows().Run("UPDATE Folders SET isDeleted = 1 WHERE path = 'a/b/'");
+  catalog.DeleteFolder("a/b/");
   EXPECT_EQ("Deleting /shares/Vol/a/b/\nFound folder 4 for /shares/Vol/a/b/\n", Merge());
   EXPECT_THAT(MergedFolders(MASTER),
               ElementsAre("/shares/Vol/|/shares/Vol/", "/shares/Vol/a/|/shares/Vol/"));
@@ -194,36 +194,33 @@ TEST_F(DBMergerTest, DeletedFolderGoesWithItsFiles) {
 }
 
 TEST_F(DBMergerTest, SystemFilesAreSkippedAndReadAgain) {
-  catalog.Add(FileRow{.id = 1, .path = "system.jpg", .name = "system.jpg", .isSystem = true});
-  catalog.Add(TranscodingRow{.sourceId = 1, .lastUpdatedDate = 500});
+  catalog.AddPhoto("system.jpg", 0, 500, {.system = true});
   const std::string line = Processing("/shares/Vol/system.jpg");
   EXPECT_EQ(line, Merge());
   EXPECT_THAT(MergedFiles(MASTER), IsEmpty());
   EXPECT_THAT(MergedStatistics(MASTER), ElementsAre("/shares/Vol/|0|0|0"));
   EXPECT_EQ(line, Merge());
-  EXPECT_EQ(Joined(MergeLines(VOLUME, 1, 1), MergeLines(VOLUME, 1, 1)), Logged());
+  EXPECT_EQ(MergeLines(VOLUME, 1, 1) + MergeLines(VOLUME, 1, 1), Logged());
 }
 
 TEST_F(DBMergerTest, HiddenAndBackupFilesAreMerged) {
-  catalog.Add(FileRow{.id = 1, .path = "backup.jpg", .name = "backup.jpg", .isBackup = true});
-  catalog.Add(FileRow{.id = 2, .path = "hidden.jpg", .name = "hidden.jpg", .isHidden = true});
-  catalog.Add(TranscodingRow{.sourceId = 1, .lastUpdatedDate = 10});
-  catalog.Add(TranscodingRow{.sourceId = 2, .lastUpdatedDate = 20});
+  catalog.AddPhoto("backup.jpg", 0, 10, {.backup = true});
+  catalog.AddPhoto("hidden.jpg", 0, 20, {.hidden = true});
   Merge();
   EXPECT_THAT(MergedFiles(MASTER), ElementsAre("/shares/Vol/backup.jpg", "/shares/Vol/hidden.jpg"));
   EXPECT_THAT(MergedStatistics(MASTER), ElementsAre("/shares/Vol/|0|0|20"));
 }
 
-TEST_F(DBMergerTest, FilesOfInvisibleFoldersAreLeftOutButMoveTheTime) {
-  catalog.Add(FolderRow{.id = 1, .path = "hidden/", .name = "hidden", .isHidden = true});
-  catalog.AddPhoto(1, "hidden/a.jpg", 0, 10);
+TEST_F(DBMergerTest, FilesOfInvisibleFoldersAreLeftOutButAdvanceTheTime) {
+  catalog.AddFolder("hidden/", 0, {.hidden = true});
+  catalog.AddPhoto("hidden/a.jpg", 0, 10);
   EXPECT_EQ(Adding("/shares/Vol/hidden/a.jpg"), Merge());
   EXPECT_THAT(MergedFiles(MASTER), IsEmpty());
   EXPECT_THAT(MergedStatistics(MASTER), ElementsAre("/shares/Vol/|1|1|10"));
 }
 
 TEST_F(DBMergerTest, FileWithTwoTranscodingsIsAddedOnce) {
-  catalog.AddPhoto(1, "a.jpg", 0, 10);
+  catalog.AddPhoto("a.jpg", 0, 10);
   catalog.Add(TranscodingRow{.sourceId = 1, .lastUpdatedDate = 30});
   EXPECT_EQ(Adding("/shares/Vol/a.jpg") + Adding("/shares/Vol/a.jpg"), Merge());
   EXPECT_THAT(MergedFiles(MASTER), ElementsAre("/shares/Vol/a.jpg"));
@@ -231,29 +228,27 @@ TEST_F(DBMergerTest, FileWithTwoTranscodingsIsAddedOnce) {
 }
 
 TEST_F(DBMergerTest, TimeNeverMovesBackwards) {
-  catalog.Rows().Run("INSERT INTO Files VALUES(1, -1, 'a.jpg', 'a.jpg', 3, 0, 0, 0, 0, 0, 3, 0, "
-                     "'jpg', 1)");
   // Read as 32 bits, this is long before the epoch.
-  catalog.Add(TranscodingRow{.sourceId = 1, .lastUpdatedDate = 2147483648});
+  catalog.AddPhoto("a.jpg", 0, 2147483648);
   Merge();
   EXPECT_THAT(MergedFiles(MASTER), ElementsAre("/shares/Vol/a.jpg"));
   EXPECT_THAT(MergedStatistics(MASTER), ElementsAre("/shares/Vol/|1|1|0"));
 }
 
-TEST_F(DBMergerTest, MergeLeavesTheTimeOfTheStatusAsItWas) {
+TEST_F(DBMergerTest, MergeDoesNotChangeTheTimeOfTheStatus) {
   AddPhotos();
   Merge();
   MergedRows(MASTER, "UPDATE Status SET mdate = 4242, desc = 'text'");
-  catalog.AddPhoto(9, "new.jpg", 0, 900);
+  catalog.AddPhoto("new.jpg", 0, 900);
   Merge();
   EXPECT_THAT(MergedRows(MASTER, "SELECT * FROM Status"), ElementsAre("1|2.0|4242|text|0"));
 }
 
-TEST_F(DBMergerTest, VolumesAreMergedSideBySide) {
+TEST_F(DBMergerTest, SeveralVolumesAreMerged) {
   AddPhotos();
   Merge();
-  TestCatalog other("/shares/Other/");
-  other.AddPhoto(1, "x.jpg", 0, 50);
+  Catalog other("/shares/Other/");
+  other.AddPhoto("x.jpg", 0, 50);
   OutputOf([&] { merger.MergeDB(MASTER, "/shares/Other/"); });
   EXPECT_THAT(MergedFiles(MASTER), ElementsAre("/shares/Other/x.jpg", "/shares/Vol/a/b/two.jpg",
                                                "/shares/Vol/a/one.jpg", "/shares/Vol/top.jpg"));
@@ -261,7 +256,7 @@ TEST_F(DBMergerTest, VolumesAreMergedSideBySide) {
               ElementsAre("/shares/Other/|1|1|50", "/shares/Vol/|3|3|300"));
 }
 
-TEST_F(DBMergerTest, CatalogIsLeftAsItIs) {
+TEST_F(DBMergerTest, CatalogIsNotChanged) {
   AddPhotos();
   const auto before = catalog.Rows().Run("PRAGMA data_version");
   Merge();
@@ -277,10 +272,10 @@ TEST_F(DBMergerTest, StoppedMergeCommitsTheCountsAndAnUnchangedTime) {
   EXPECT_THAT(MergedFolders(MASTER), IsEmpty());
   EXPECT_THAT(MergedFiles(MASTER), IsEmpty());
   EXPECT_THAT(MergedStatistics(MASTER), ElementsAre("/shares/Vol/|3|3|0"));
-  EXPECT_TRUE(merger.stopRequested) << "it is never cleared";
+  EXPECT_TRUE(merger.stopRequested) << "the merger does not clear it";
 }
 
-// Volumes anew and away.
+// Re-merges and removals.
 
 TEST_F(DBMergerTest, ReMergeStartsFromTheBeginning) {
   AddPhotos();
@@ -314,14 +309,14 @@ TEST_F(DBMergerTest, FailedReMergeLeavesTheVolumeEmptyAndItsTimeZero) {
   EXPECT_THAT(MergedStatistics(MASTER), ElementsAre("/shares/Vol/|3|3|0"));
 }
 
-TEST_F(DBMergerTest, FailedDeletionOfAReMergePasses) {
+TEST_F(DBMergerTest, FailedDeletionInAReMergeIsThrown) {
   AddPhotos();
   Merge();
   MergedRows(MASTER, "DROP TABLE Statistics");
   EXPECT_THROW(ReMerge(), std::string);
 }
 
-TEST_F(DBMergerTest, RemovedVolumeLeavesItsCounts) {
+TEST_F(DBMergerTest, RemovedVolumeKeepsItsCounts) {
   AddPhotos();
   Merge();
   Logged();
@@ -332,7 +327,7 @@ TEST_F(DBMergerTest, RemovedVolumeLeavesItsCounts) {
   EXPECT_THAT(Logged(), IsEmpty());
 }
 
-TEST_F(DBMergerTest, RemovalFromTheEmptyVolumeTouchesNoVolume) {
+TEST_F(DBMergerTest, RemovalWithoutAMasterChangesNoVolume) {
   AddPhotos();
   Merge();
   Logged();
@@ -343,7 +338,7 @@ TEST_F(DBMergerTest, RemovalFromTheEmptyVolumeTouchesNoVolume) {
   EXPECT_THAT(Logged(), IsEmpty());
 }
 
-TEST_F(DBMergerTest, FailedRemovalPasses) {
+TEST_F(DBMergerTest, FailedRemovalIsThrown) {
   PhotoDB(MASTER).Init();
   MergedRows(MASTER, "DROP TABLE Files");
   EXPECT_THROW(merger.RemoveVolume(MASTER, VOLUME), std::string);
@@ -351,7 +346,7 @@ TEST_F(DBMergerTest, FailedRemovalPasses) {
 
 // Failures.
 
-/// A merge that the merged database refuses in the middle, in each of SQLite's ways.
+/// A merge in which an insertion fails, with each of SQLite's ways to resolve a conflict.
 class RefusedMergeTest : public DBMergerTest, public ::testing::WithParamInterface<const char*> {};
 
 TEST_P(RefusedMergeTest, LeavesEverythingAsBefore) {
@@ -364,10 +359,10 @@ TEST_P(RefusedMergeTest, LeavesEverythingAsBefore) {
                          GetParam() + ", volume, created_date)");
   MergedRows(MASTER, "INSERT INTO Files SELECT * FROM Stored");
   const Lines before = MergedContent(MASTER);
-  catalog.AddFolder(3, "c/");
-  catalog.AddPhoto(4, "c/a.jpg", 31, 400);
-  catalog.AddPhoto(5, "c/m.jpg", 31, 401);
-  catalog.AddPhoto(6, "c/z.jpg", 33, 402);
+  catalog.AddFolder("c/");
+  catalog.AddPhoto("c/a.jpg", 31, 400);
+  catalog.AddPhoto("c/m.jpg", 31, 401);
+  catalog.AddPhoto("c/z.jpg", 33, 402);
 
   EXPECT_EQ(Adding("/shares/Vol/c/a.jpg") + Adding("/shares/Vol/c/m.jpg"), Merge());
 
@@ -393,7 +388,7 @@ TEST_F(DBMergerTest, FailedStatisticsFailTheMerge) {
   MergedRows(MASTER, "INSERT INTO Statistics VALUES(9, '/shares/Other/', 0, 0, 400)");
   MergedRows(MASTER, "CREATE UNIQUE INDEX refuse ON Statistics(last_updated_time)");
   const Lines before = MergedContent(MASTER);
-  catalog.AddPhoto(4, "new.jpg", 0, 400);
+  catalog.AddPhoto("new.jpg", 0, 400);
   Merge();
   Log errors = Logged();
   std::erase_if(errors, [](const LogLine& line) { return line.priority == Info("").priority; });
@@ -469,7 +464,7 @@ TEST_F(DBMergerTest, CatalogThatStaysLockedFailsTheMerge) {
   EXPECT_EQ(before, MergedContent(MASTER));
 }
 
-/// True when somebody is changing the merged database.
+/// True while another connection changes the merged database.
 bool IsBeingMerged(const Database& merged) {
   try {
     merged.Run("BEGIN IMMEDIATE");
@@ -481,7 +476,7 @@ bool IsBeingMerged(const Database& merged) {
 }
 
 /// Commits the catalog once the merge has begun.
-std::thread CommitDuringTheMerge(const TestCatalog& catalog) {
+std::thread CommitDuringTheMerge(const Catalog& catalog) {
   return std::thread([&catalog] {
     const Database merged(MergedDatabasePath(MASTER));
     merged.Run("PRAGMA busy_timeout = 0");
@@ -493,11 +488,11 @@ std::thread CommitDuringTheMerge(const TestCatalog& catalog) {
   });
 }
 
-TEST_F(DBMergerTest, CatalogThatIsJustWrittenIsWaitedFor) {
+TEST_F(DBMergerTest, CatalogThatIsBeingWrittenIsWaitedFor) {
   AddPhotos();
   PhotoDB(MASTER).Init();
   catalog.Rows().Run("BEGIN EXCLUSIVE");
-  catalog.AddPhoto(4, "just.jpg", 0, 400);
+  catalog.AddPhoto("just.jpg", 0, 400);
   std::thread indexer = CommitDuringTheMerge(catalog);
   Merge();
   indexer.join();
@@ -505,12 +500,12 @@ TEST_F(DBMergerTest, CatalogThatIsJustWrittenIsWaitedFor) {
   EXPECT_EQ(4U, MergedFiles(MASTER).size());
 }
 
-TEST_F(DBMergerTest, CatalogThatGrowsWhileItIsWaitedForIsReadWhole) {
+TEST_F(DBMergerTest, CatalogThatGrowsWhileItIsWaitedForIsReadCompletely) {
   AddPhotos();
   PhotoDB(MASTER).Init();
   catalog.Rows().Run("BEGIN EXCLUSIVE");
   for (int i = 10; i < 10'010; ++i) {
-    catalog.AddPhoto(i, "photo" + std::to_string(i), 0, 400);
+    catalog.AddPhoto("photo" + std::to_string(i), 0, 400);
   }
   std::thread indexer = CommitDuringTheMerge(catalog);
   Merge();
@@ -519,29 +514,29 @@ TEST_F(DBMergerTest, CatalogThatGrowsWhileItIsWaitedForIsReadWhole) {
   EXPECT_EQ(10'003U, MergedFiles(MASTER).size());
 }
 
-TEST_F(DBMergerTest, ReaderOfTheMergedDatabaseIsNoObstacleToTheNextMerge) {
+TEST_F(DBMergerTest, ReaderOfTheMergedDatabaseDoesNotPreventTheNextMerge) {
   AddPhotos();
   Merge();
   Logged();
   const Database reader(MergedDatabasePath(MASTER));
   EXPECT_THAT(reader.Run("SELECT count(*) FROM Files"), ElementsAre("3"));
-  catalog.AddPhoto(4, "new.jpg", 0, 400);
+  catalog.AddPhoto("new.jpg", 0, 400);
   Merge();
   EXPECT_EQ(MergeLines(VOLUME, 3, 1), Logged());
   EXPECT_THAT(reader.Run("SELECT count(*) FROM Files"), ElementsAre("4"));
 }
 
-TEST_F(DBMergerTest, UnusableMasterPasses) {
+TEST_F(DBMergerTest, UnusableMasterIsThrown) {
   AddPhotos();
   std::ofstream(MASTER + ".zophotos") << "in the way";
   EXPECT_EQ("Invalid DB location : '/shares/Master/.zophotos'",
-            ThrownBy<PhotoDB::Error>([&] { Merge(); }).Message());
+            Thrown<PhotoDB::Error>([&] { Merge(); }).Message());
   EXPECT_THROW(ReMerge(), PhotoDB::Error);
   EXPECT_THROW(merger.RemoveVolume(MASTER, VOLUME), PhotoDB::Error);
   EXPECT_THAT(Logged(), IsEmpty());
 }
 
-TEST_F(DBMergerTest, MergesGoOnAfterAFailure) {
+TEST_F(DBMergerTest, MergeSucceedsAfterAFailedOne) {
   AddPhotos();
   std::ofstream(MASTER + ".zophotos") << "in the way";
   EXPECT_THROW(Merge(), PhotoDB::Error);

@@ -1,48 +1,26 @@
 #include "DaemonLayerTest.h"
 
-#include "Database.h"
-
 #include <sys/stat.h>
-#include <syslog.h>
 
-#include <fstream>
-#include <iterator>
-#include <regex>
-#include <stdexcept>
+#include <cerrno>
+#include <system_error>
 
 namespace orva::test {
 
-namespace {
-
-const std::string MERGER_THREAD_LINE = "Iterating over mount point ";
-
-std::string MaskTimes(const std::string& text) {
-  static const std::regex time(R"(\d+\.\d{3} W   \d+\.\d{3} U   \d+\.\d{3} S   \d+\.\d%)");
-  return std::regex_replace(text, time, "TIME");
-}
-
-} // namespace
-
 Log DaemonLayerTest::Logged() {
   Log lines = LoggedByAllThreads();
-  std::erase_if(lines,
-                [](const LogLine& line) { return line.text.starts_with(MERGER_THREAD_LINE); });
+  std::erase_if(lines, [](const LogLine& line) {
+    return line.text.starts_with("Iterating over mount point ");
+  });
   return lines;
 }
 
 Log DaemonLayerTest::LoggedByAllThreads() {
-  // Messages arrive in order: when this one is there, all that was logged before is.
-  const LogLine mark = Info("mark " + std::to_string(++marks_));
-  syslog(mark.priority, "%s", mark.text.c_str());
-  if (!log_.Await(mark)) {
-    throw std::runtime_error("the system log does not answer");
+  Log lines = log_.Lines(taken_);
+  taken_ += lines.size();
+  for (LogLine& line : lines) {
+    line.text = MaskTimes(line.text);
   }
-  const Log all = log_.Lines();
-  Log lines;
-  for (; all[taken_] != mark; ++taken_) {
-    lines.push_back({all[taken_].priority, MaskTimes(all[taken_].text)});
-  }
-  ++taken_;
   return lines;
 }
 
@@ -68,20 +46,12 @@ dbmerger::VolumeInfo Record(const std::string& mountPoint, double capacity, doub
           .readOnly = readOnly};
 }
 
-std::string Locator() {
-  std::ifstream file("/tmp/zophotodbmerger.conf", std::ios::binary);
-  if (!file) {
-    return "(absent)";
-  }
-  return {std::istreambuf_iterator<char>(file), {}};
-}
-
 std::string MergedDatabasePath(const std::string& location) {
   return location + "/.zophotos/zophotos.db";
 }
 
 Lines MergedRows(const std::string& location, const std::string& sql) {
-  return Database(MergedDatabasePath(location)).Run(sql);
+  return MergedDatabase(location).Rows().Run(sql);
 }
 
 Lines MergedFolders(const std::string& location) {
@@ -95,8 +65,7 @@ Lines MergedFiles(const std::string& location) {
 }
 
 Lines MergedStatistics(const std::string& location) {
-  return MergedRows(location, "SELECT volume, photos_xcoded, photos_total, last_updated_time FROM "
-                              "Statistics ORDER BY volume");
+  return MergedDatabase(location).Statistics();
 }
 
 Lines MergedContent(const std::string& location) {
@@ -109,20 +78,6 @@ Lines MergedContent(const std::string& location) {
     }
   }
   return content;
-}
-
-Log MergeLines(const std::string& mountPoint, int folders, int files) {
-  const std::string place = mountPoint + " in TIME\n";
-  return {Info("Retrieved changed folders list for " + place),
-          Info("Retrieved " + std::to_string(files) + " changed files list for " + place),
-          Info("Retrieved counts from the orva db for mountPoint " + place),
-          Info("Merged " + std::to_string(folders) + " folders for " + place),
-          Info("Merged " + std::to_string(files) + " files for " + place)};
-}
-
-Log Joined(Log first, const Log& second) {
-  first.insert(first.end(), second.begin(), second.end());
-  return first;
 }
 
 } // namespace orva::test

@@ -1,19 +1,14 @@
 #pragma once
 
-#include "Syslog.h"
+#include "Expectations.h"
 #include "VolumeInfo.h"
 
-#include <gmock/gmock.h>
-#include <gtest/gtest.h>
+#include "support/Thrown.h"
 
 #include <filesystem>
 #include <string>
-#include <vector>
 
 namespace orva::test {
-
-using Log = std::vector<LogLine>;
-using Lines = std::vector<std::string>;
 
 /// A test of the daemon's own classes in this process, which has a private root, and so the
 /// singletons and the system log, to itself.
@@ -29,7 +24,6 @@ protected:
 private:
   Syslog log_;
   std::size_t taken_ = 0;
-  int marks_ = 0;
 };
 
 /// What `action` writes to standard output.
@@ -45,17 +39,6 @@ std::string OutputOf(Action action) {
   return ::testing::internal::GetCapturedStdout();
 }
 
-/// What `action` throws as Thrown; a failure of the test when it throws nothing.
-template <typename Thrown, typename Action>
-Thrown ThrownBy(Action action) {
-  try {
-    action();
-  } catch (const Thrown& thrown) {
-    return thrown;
-  }
-  throw std::logic_error("nothing was thrown");
-}
-
 /// Makes a directory, with its parents, and returns its path.
 std::string MakeDirectory(const std::string& path);
 
@@ -65,15 +48,6 @@ unsigned ModeOf(const std::string& path);
 /// A record of a volume with `free` bytes.
 dbmerger::VolumeInfo Record(const std::string& mountPoint, double capacity, double free,
                             bool readOnly = false);
-
-/// The record that stands for the shares root, as text.
-inline const std::string SHARES_MASTER_TEXT = "\nMountPoint: /shares\nCapacity: 1.04858e+11M\n"
-                                              "Used: 100M\nPhotoDB size: 1\nReadOnly: 0\n";
-
-/// Content of the locator file, to the last byte; "(absent)" when there is none.
-std::string Locator();
-
-const std::string SHARES_LOCATOR = "zophotos_db_path=/shares//.zophotos/zophotos.db\n";
 
 /// The path of the merged database at a location.
 std::string MergedDatabasePath(const std::string& location);
@@ -89,11 +63,5 @@ Lines MergedFiles(const std::string& location);
 Lines MergedStatistics(const std::string& location);
 /// Every row of every table.
 Lines MergedContent(const std::string& location);
-
-/// The lines of a merge that goes through: `folders` with the root row, `files` as read.
-Log MergeLines(const std::string& mountPoint, int folders, int files);
-
-/// Several pieces of a log, one behind the other.
-Log Joined(Log first, const Log& second);
 
 } // namespace orva::test

@@ -25,12 +25,12 @@ TEST_F(DefaultStateTest, PluggedElectsAndWaitsForTheScan) {
   EXPECT_EQ("/shares/Vol/", Master());
   EXPECT_THAT(Logged(), ElementsAre(Info("Default:: VolumePlugged "),
                                     Info("We now have a master volume " +
-                                         MasterText("/shares/Vol/", "1.5e+11"))));
-  EXPECT_EQ(SHARES_LOCATOR, Locator());
+                                         MasterText("/shares/Vol/", LARGE))));
+  EXPECT_EQ(SHARES_LOCATOR, Appliance::Locator());
   EXPECT_FALSE(std::filesystem::exists("/shares/Vol/.zophotos"));
 }
 
-TEST_F(DefaultStateTest, PluggedWithoutACandidateStays) {
+TEST_F(DefaultStateTest, PluggedWithoutACandidateKeepsTheState) {
   ForgetSharesRoot();
   Register("/shares/Vol/", 1.0);
   EXPECT_EQ("", Plugged("/shares/Vol/"));
@@ -49,7 +49,7 @@ TEST_F(DefaultStateTest, SharesRootIsElectedBeforeASmallerVolume) {
                                     Info("We now have a master volume " + SHARES_MASTER_TEXT)));
 }
 
-TEST_F(DefaultStateTest, MasterThatIsThereIsKept) {
+TEST_F(DefaultStateTest, ElectedMasterIsKept) {
   Register("/shares/Vol/", SMALL);
   ForgetSharesRoot();
   ASSERT_TRUE(Registry().reelectMasterVolume());
@@ -59,7 +59,7 @@ TEST_F(DefaultStateTest, MasterThatIsThereIsKept) {
   EXPECT_EQ("/shares/Vol/", Master());
 }
 
-TEST_F(DefaultStateTest, UnpluggedIsIgnoredAlsoWhenAVolumeCouldBeElected) {
+TEST_F(DefaultStateTest, UnpluggedIsIgnoredEvenIfAVolumeCouldBeElected) {
   Register("/shares/Vol/", LARGE);
   EXPECT_EQ("", Unplugged("/shares/Other/"));
   EXPECT_EQ(State::DEFAULT, CurrentType());
@@ -67,7 +67,7 @@ TEST_F(DefaultStateTest, UnpluggedIsIgnoredAlsoWhenAVolumeCouldBeElected) {
   EXPECT_THAT(Logged(), ElementsAre(Info("Default:: Volumeunplugged, ignoring! ")));
 }
 
-TEST_F(DefaultStateTest, PurgedIsIgnoredAlsoWhenAVolumeCouldBeElected) {
+TEST_F(DefaultStateTest, PurgedIsIgnoredEvenIfAVolumeCouldBeElected) {
   Register("/shares/Vol/", LARGE);
   EXPECT_EQ("", Purged("/shares/Vol/"));
   EXPECT_EQ(State::DEFAULT, CurrentType());
@@ -75,19 +75,19 @@ TEST_F(DefaultStateTest, PurgedIsIgnoredAlsoWhenAVolumeCouldBeElected) {
   EXPECT_THAT(Logged(), ElementsAre(Info("Default:: Volume purged - ignored! ")));
 }
 
-TEST_F(DefaultStateTest, ScannedGoesStraightToTheScannedState) {
+TEST_F(DefaultStateTest, ScannedElectsAndMovesToTheScannedState) {
   Register("/shares/Vol/", LARGE);
   EXPECT_EQ("Setting the current to scanned state", Scanned("/shares/Vol/").substr(0, 36));
   EXPECT_EQ(State::MASTER_VOLUME_SCANNED, CurrentType());
   EXPECT_THAT(Logged(), ElementsAre(Info("Default:: Volume Scanned "),
                                     Info("Moving to the scanned state since we can safely do so "),
                                     Info("We now have a master volume " +
-                                         MasterText("/shares/Vol/", "1.5e+11"))));
-  EXPECT_EQ("zophotos_db_path=/shares/Vol//.zophotos/zophotos.db\n", Locator());
-  EXPECT_THAT(MergedFolders("/shares/Vol"), IsEmpty()) << "the scan itself brings nothing";
+                                         MasterText("/shares/Vol/", LARGE))));
+  EXPECT_EQ("zophotos_db_path=/shares/Vol//.zophotos/zophotos.db\n", Appliance::Locator());
+  EXPECT_THAT(MergedFolders("/shares/Vol"), IsEmpty()) << "a scan merges nothing";
 }
 
-TEST_F(DefaultStateTest, ScannedWithoutACandidateStays) {
+TEST_F(DefaultStateTest, ScannedWithoutACandidateKeepsTheState) {
   ForgetSharesRoot();
   EXPECT_EQ("", Scanned("/shares/Vol/"));
   EXPECT_EQ(State::DEFAULT, CurrentType());
@@ -95,15 +95,15 @@ TEST_F(DefaultStateTest, ScannedWithoutACandidateStays) {
                                     Info("Staying in the Default state ")));
 }
 
-TEST_F(DefaultStateTest, TranscodedBeginsWithTheElection) {
+TEST_F(DefaultStateTest, TranscodedElectsAndMovesToTheScannedState) {
   EXPECT_EQ("Setting the current to scanned state", Transcoded("/shares/Vol/").substr(0, 36));
   EXPECT_EQ(State::MASTER_VOLUME_SCANNED, CurrentType());
   EXPECT_THAT(Logged(), ElementsAre(Info("Moving to the scanned state since we can safely do so "),
                                     Info("We now have a master volume " + SHARES_MASTER_TEXT)));
-  EXPECT_EQ("zophotos_db_path=/shares/.zophotos/zophotos.db\n", Locator());
+  EXPECT_EQ("zophotos_db_path=/shares/.zophotos/zophotos.db\n", Appliance::Locator());
 }
 
-TEST_F(DefaultStateTest, TranscodedWithoutACandidateStays) {
+TEST_F(DefaultStateTest, TranscodedWithoutACandidateKeepsTheState) {
   ForgetSharesRoot();
   EXPECT_EQ("", Transcoded("/shares/Vol/"));
   EXPECT_EQ(State::DEFAULT, CurrentType());
@@ -114,10 +114,10 @@ TEST_F(DefaultStateTest, UnusableMasterKeepsTheStateAndTheElection) {
   Register("/shares/Vol/", LARGE);
   std::ofstream("/shares/Vol/.zophotos") << "in the way";
   EXPECT_EQ("Invalid DB location : '/shares/Vol/.zophotos'",
-            ThrownBy<dbmerger::PhotoDB::Error>([&] { Scanned("/shares/Vol/"); }).Message());
+            Thrown<dbmerger::PhotoDB::Error>([&] { Scanned("/shares/Vol/"); }).Message());
   EXPECT_EQ(State::DEFAULT, CurrentType());
   EXPECT_EQ("/shares/Vol/", Master());
-  EXPECT_EQ(SHARES_LOCATOR, Locator());
+  EXPECT_EQ(SHARES_LOCATOR, Appliance::Locator());
 }
 
 } // namespace

@@ -23,7 +23,7 @@ protected:
     Logged();
   }
 
-  /// Takes the master away, and all that could follow it.
+  /// Removes the master and every volume that could replace it.
   void ForgetEverything() const {
     ForgetSharesRoot();
     Forget("/shares/Vol/");
@@ -48,17 +48,17 @@ TEST_F(MasterVolumePluggedStateTest, PurgedIsIgnored) {
                                          "Volume, so volume purged - ignored ")));
 }
 
-TEST_F(MasterVolumePluggedStateTest, ScannedMovesOn) {
+TEST_F(MasterVolumePluggedStateTest, ScannedMovesToTheScannedState) {
   EXPECT_NE("", Scanned("/shares/Vol/"));
   EXPECT_EQ(State::MASTER_VOLUME_SCANNED, CurrentType());
   EXPECT_THAT(Logged(), ElementsAre(Info("MasterVolumePluggedState:: VolumeScanned "), MOVING,
                                     Info("We now have a master volume " +
-                                         MasterText("/shares/Vol/", "1.5e+11"))));
-  EXPECT_EQ("zophotos_db_path=/shares/Vol//.zophotos/zophotos.db\n", Locator());
+                                         MasterText("/shares/Vol/", LARGE))));
+  EXPECT_EQ("zophotos_db_path=/shares/Vol//.zophotos/zophotos.db\n", Appliance::Locator());
   EXPECT_THAT(MergedFolders("/shares/Vol"), IsEmpty());
 }
 
-TEST_F(MasterVolumePluggedStateTest, ScannedWithoutAMasterStays) {
+TEST_F(MasterVolumePluggedStateTest, ScannedWithoutAMasterKeepsTheState) {
   ForgetEverything();
   EXPECT_EQ("", Scanned("/shares/Vol/"));
   EXPECT_EQ(State::MASTER_VOLUME_PLUGGED, CurrentType());
@@ -68,15 +68,15 @@ TEST_F(MasterVolumePluggedStateTest, ScannedWithoutAMasterStays) {
                                "Volume Scanned - ignored ")));
 }
 
-TEST_F(MasterVolumePluggedStateTest, TranscodedMovesOn) {
+TEST_F(MasterVolumePluggedStateTest, TranscodedMovesToTheScannedState) {
   EXPECT_NE("", Transcoded("/shares/Vol/"));
   EXPECT_EQ(State::MASTER_VOLUME_SCANNED, CurrentType());
   EXPECT_THAT(Logged(), ElementsAre(Info("MasterVolumePluggedState:: Transcoded batch "), MOVING,
                                     Info("We now have a master volume " +
-                                         MasterText("/shares/Vol/", "1.5e+11"))));
+                                         MasterText("/shares/Vol/", LARGE))));
 }
 
-TEST_F(MasterVolumePluggedStateTest, TranscodedWithoutAMasterStays) {
+TEST_F(MasterVolumePluggedStateTest, TranscodedWithoutAMasterKeepsTheState) {
   ForgetEverything();
   EXPECT_EQ("", Transcoded("/shares/Vol/"));
   EXPECT_EQ(State::MASTER_VOLUME_PLUGGED, CurrentType());
@@ -86,22 +86,22 @@ TEST_F(MasterVolumePluggedStateTest, TranscodedWithoutAMasterStays) {
                                "picture transcoded - ignored ")));
 }
 
-TEST_F(MasterVolumePluggedStateTest, UnpluggedOtherVolumeMovesOn) {
+TEST_F(MasterVolumePluggedStateTest, UnpluggedOtherVolumeMovesToTheScannedState) {
   EXPECT_NE("", Unplugged("/shares/Other/"));
   EXPECT_EQ(State::MASTER_VOLUME_SCANNED, CurrentType());
   EXPECT_THAT(Logged(), ElementsAre(Info("MasterVolumePluggedState:: Volumeunplugged "), MOVING,
                                     Info("We now have a master volume " +
-                                         MasterText("/shares/Vol/", "1.5e+11"))));
-  EXPECT_EQ("zophotos_db_path=/shares/Vol//.zophotos/zophotos.db\n", Locator());
+                                         MasterText("/shares/Vol/", LARGE))));
+  EXPECT_EQ("zophotos_db_path=/shares/Vol//.zophotos/zophotos.db\n", Appliance::Locator());
 }
 
-TEST_F(MasterVolumePluggedStateTest, UnpluggedMasterIsFollowedByAnother) {
+TEST_F(MasterVolumePluggedStateTest, UnpluggedMasterIsReplacedByAnother) {
   Register("/shares/Next/", MIDDLE);
   Forget("/shares/Vol/");
   Unplugged("/shares/Vol/");
   EXPECT_EQ(State::MASTER_VOLUME_SCANNED, CurrentType());
   EXPECT_EQ("/shares/Next/", Master());
-  EXPECT_EQ("zophotos_db_path=/shares/Next//.zophotos/zophotos.db\n", Locator());
+  EXPECT_EQ("zophotos_db_path=/shares/Next//.zophotos/zophotos.db\n", Appliance::Locator());
 }
 
 TEST_F(MasterVolumePluggedStateTest, UnpluggedMasterWithoutASuccessorFallsBack) {
@@ -115,7 +115,7 @@ TEST_F(MasterVolumePluggedStateTest, UnpluggedMasterWithoutASuccessorFallsBack) 
                           Info("We do NOT have a master volume so we can go back to the Default "
                                "State ")));
   EXPECT_THAT(MergedFolders("/shares"), IsEmpty());
-  EXPECT_EQ(SHARES_LOCATOR, Locator());
+  EXPECT_EQ(SHARES_LOCATOR, Appliance::Locator());
   ASSERT_EQ(1U, Registry().getVolumes().size());
   EXPECT_EQ(SHARES_MASTER_TEXT, Registry().getVolumes()[0].ToString());
 }
@@ -127,14 +127,14 @@ TEST_F(MasterVolumePluggedStateTest, SharesRootIsElectedAfterAFallback) {
   Scanned("/shares/Small/");
   EXPECT_EQ(State::MASTER_VOLUME_SCANNED, CurrentType());
   EXPECT_EQ("/shares", Master());
-  EXPECT_EQ("zophotos_db_path=/shares/.zophotos/zophotos.db\n", Locator());
+  EXPECT_EQ("zophotos_db_path=/shares/.zophotos/zophotos.db\n", Appliance::Locator());
 }
 
 TEST_F(MasterVolumePluggedStateTest, UnusableMasterKeepsTheState) {
   std::ofstream("/shares/Vol/.zophotos") << "in the way";
   EXPECT_THROW(Scanned("/shares/Vol/"), dbmerger::PhotoDB::Error);
   EXPECT_EQ(State::MASTER_VOLUME_PLUGGED, CurrentType());
-  EXPECT_EQ(SHARES_LOCATOR, Locator());
+  EXPECT_EQ(SHARES_LOCATOR, Appliance::Locator());
 }
 
 TEST_F(MasterVolumePluggedStateTest, FailedFallbackKeepsTheState) {

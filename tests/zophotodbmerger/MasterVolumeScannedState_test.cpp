@@ -1,8 +1,8 @@
 #include "StatesTest.h"
 
+#include "Catalog.h"
 #include "MasterVolumeScannedState.h"
 #include "PhotoDB.h"
-#include "TestCatalog.h"
 
 #include <fstream>
 
@@ -17,7 +17,7 @@ using ::testing::IsEmpty;
 const LogLine UNPLUGGED = Info("MasterVolumeScannedState:: Volumeunplugged ");
 const LogLine MOVING = Info("Moving to the scanned state since we can safely do so ");
 
-/// The working state, with the volume "/shares/Vol/" as the master.
+/// The scanned state, with the volume "/shares/Vol/" as the master.
 class MasterVolumeScannedStateTest : public StatesTest {
 protected:
   MasterVolumeScannedStateTest() {
@@ -34,9 +34,9 @@ protected:
 };
 
 /// A catalog with one photo.
-TestCatalog MakeCatalog(const std::string& mountPoint) {
-  TestCatalog catalog(mountPoint);
-  catalog.AddPhoto(1, "a.jpg", 10, 100);
+Catalog MakeCatalog(const std::string& mountPoint) {
+  Catalog catalog(mountPoint);
+  catalog.AddPhoto("a.jpg", 10, 100);
   return catalog;
 }
 
@@ -44,28 +44,28 @@ TEST_F(MasterVolumeScannedStateTest, HasTypeTwo) {
   EXPECT_EQ(2, CurrentType());
 }
 
-TEST_F(MasterVolumeScannedStateTest, HasCreatedTheDatabaseAndPublishedIt) {
+TEST_F(MasterVolumeScannedStateTest, CreatesTheDatabaseAndPublishesIt) {
   EXPECT_THAT(MergedRows("/shares/Vol", "SELECT mdate FROM Status"), ElementsAre("1000"));
-  EXPECT_EQ("zophotos_db_path=/shares/Vol//.zophotos/zophotos.db\n", Locator());
+  EXPECT_EQ("zophotos_db_path=/shares/Vol//.zophotos/zophotos.db\n", Appliance::Locator());
 }
 
 TEST_F(StatesTest, ScannedStateWithoutAMasterNamesTheEmptyVolume) {
   std::filesystem::current_path(MakeDirectory("/tmp/scratch"));
   const dbmerger::MasterVolumeScannedState state;
-  EXPECT_EQ("zophotos_db_path=DUMMY_MOUNT_POINT/.zophotos/zophotos.db\n", Locator());
+  EXPECT_EQ("zophotos_db_path=DUMMY_MOUNT_POINT/.zophotos/zophotos.db\n", Appliance::Locator());
   EXPECT_TRUE(std::filesystem::exists("/tmp/scratch/.zophotos/zophotos.db"));
 }
 
-TEST_F(StatesTest, ScannedStateThatCannotBeMadeJoinsItsMerger) {
+TEST_F(StatesTest, ScannedStateWhoseConstructionFailsJoinsItsMerger) {
   std::filesystem::remove_all("/shares/.zophotos");
   std::ofstream("/shares/.zophotos") << "in the way";
   ASSERT_TRUE(Registry().reelectMasterVolume());
   EXPECT_THROW(dbmerger::MasterVolumeScannedState(), PhotoDB::Error);
-  EXPECT_EQ(SHARES_LOCATOR, Locator());
+  EXPECT_EQ(SHARES_LOCATOR, Appliance::Locator());
   EXPECT_EQ(State::DEFAULT, CurrentType());
 }
 
-TEST_F(MasterVolumeScannedStateTest, OpensADatabaseThatIsThere) {
+TEST_F(MasterVolumeScannedStateTest, OpensAnExistingDatabase) {
   MergedRows("/shares/Vol", "INSERT INTO Folders VALUES(2, 1, '/shares/x/', 0, '/shares/x/')");
   { const dbmerger::MasterVolumeScannedState state; }
   EXPECT_THAT(MergedFolders("/shares/Vol"), ElementsAre("/shares/x/|/shares/x/"));
@@ -78,7 +78,7 @@ TEST_F(MasterVolumeScannedStateTest, PluggedIsIgnored) {
   EXPECT_THAT(Logged(), ElementsAre(Info("MasterVolumeScannedState:: VolumePlugged, ignoring! ")));
 }
 
-TEST_F(MasterVolumeScannedStateTest, ScannedDoesNothingAndSaysNothing) {
+TEST_F(MasterVolumeScannedStateTest, ScannedChangesAndLogsNothing) {
   MakeCatalog("/shares/Vol/");
   State* const before = &Current();
   EXPECT_EQ("", Scanned("/shares/Vol/"));
@@ -91,23 +91,23 @@ TEST_F(MasterVolumeScannedStateTest, TranscodedMergesTheVolume) {
   MakeCatalog("/shares/Other/");
   Transcoded("/shares/Other/");
   EXPECT_THAT(MergedFiles("/shares/Vol"), ElementsAre("/shares/Other/a.jpg"));
-  EXPECT_EQ(Joined({Merging("handlePictureTranscoded", "/shares/Other/")},
-                   MergeLines("/shares/Other/", 1, 1)),
+  EXPECT_EQ(Log{Merging("handlePictureTranscoded", "/shares/Other/")} +
+                MergeLines("/shares/Other/", 1, 1),
             Logged());
   EXPECT_EQ(State::MASTER_VOLUME_SCANNED, CurrentType());
 }
 
-TEST_F(MasterVolumeScannedStateTest, PurgedMergesTheVolumeAnew) {
-  const TestCatalog catalog = MakeCatalog("/shares/Other/");
+TEST_F(MasterVolumeScannedStateTest, PurgedReMergesTheVolume) {
+  const Catalog catalog = MakeCatalog("/shares/Other/");
   Transcoded("/shares/Other/");
   Logged();
-  // Only a merge from the beginning notices this one.
+  // Only a re-merge notices this change.
   catalog.Rows().Run("UPDATE Files SET path = 'b.jpg', name = 'b.jpg'");
   Purged("/shares/Other/");
   EXPECT_THAT(MergedFiles("/shares/Vol"), ElementsAre("/shares/Other/b.jpg"));
-  EXPECT_EQ(
-      Joined({Merging("handleVolumePurged", "/shares/Other/")}, MergeLines("/shares/Other/", 1, 1)),
-      Logged());
+  EXPECT_EQ(Log{Merging("handleVolumePurged", "/shares/Other/")} +
+                MergeLines("/shares/Other/", 1, 1),
+            Logged());
 }
 
 TEST_F(MasterVolumeScannedStateTest, UnpluggedOtherVolumeIsRemovedAndTheStateReplaced) {
@@ -129,20 +129,20 @@ TEST_F(MasterVolumeScannedStateTest, UnpluggedOtherVolumeIsRemovedAndTheStateRep
   EXPECT_THAT(MergedFiles("/shares/Vol"), ElementsAre("/shares/Vol/a.jpg"));
   EXPECT_THAT(MergedStatistics("/shares/Vol"),
               ElementsAre("/shares/Other/|1|1|0", "/shares/Vol/|1|1|100"));
-  EXPECT_EQ("zophotos_db_path=/shares/Vol//.zophotos/zophotos.db\n", Locator());
+  EXPECT_EQ("zophotos_db_path=/shares/Vol//.zophotos/zophotos.db\n", Appliance::Locator());
   EXPECT_THAT(Logged(), ElementsAre(UNPLUGGED, MOVING,
                                     Info("We now have a master volume " +
-                                         MasterText("/shares/Vol/", "1.5e+11") + " ")));
+                                         MasterText("/shares/Vol/", LARGE) + " ")));
 }
 
-TEST_F(MasterVolumeScannedStateTest, MergesGoOnAfterAnUnplug) {
+TEST_F(MasterVolumeScannedStateTest, MergesContinueAfterAnUnplug) {
   MakeCatalog("/shares/Vol/");
   Unplugged("/shares/Other/");
   Transcoded("/shares/Vol/");
   EXPECT_THAT(MergedFiles("/shares/Vol"), ElementsAre("/shares/Vol/a.jpg"));
 }
 
-TEST_F(MasterVolumeScannedStateTest, ReplacedStateAppliesNothingAnymore) {
+TEST_F(MasterVolumeScannedStateTest, ReplacedStateMergesNothing) {
   MakeCatalog("/shares/Vol/");
   State& replaced = Current();
   Unplugged("/shares/Other/");
@@ -150,7 +150,7 @@ TEST_F(MasterVolumeScannedStateTest, ReplacedStateAppliesNothingAnymore) {
   EXPECT_THAT(MergedFiles("/shares/Vol"), IsEmpty());
 }
 
-TEST_F(MasterVolumeScannedStateTest, UnpluggedMasterIsFollowedByAnother) {
+TEST_F(MasterVolumeScannedStateTest, UnpluggedMasterIsReplacedByAnother) {
   MakeCatalog("/shares/Vol/");
   Transcoded("/shares/Vol/");
   Register("/shares/Next/", MIDDLE);
@@ -161,14 +161,14 @@ TEST_F(MasterVolumeScannedStateTest, UnpluggedMasterIsFollowedByAnother) {
 
   EXPECT_EQ(State::MASTER_VOLUME_SCANNED, CurrentType());
   EXPECT_EQ("/shares/Next/", Master());
-  EXPECT_EQ("zophotos_db_path=/shares/Next//.zophotos/zophotos.db\n", Locator());
+  EXPECT_EQ("zophotos_db_path=/shares/Next//.zophotos/zophotos.db\n", Appliance::Locator());
   EXPECT_THAT(MergedFolders("/shares/Next"), IsEmpty());
   EXPECT_THAT(MergedFiles("/shares/Vol"), ElementsAre("/shares/Vol/a.jpg"))
       << "the rows are removed from the database of the empty volume";
   EXPECT_TRUE(std::filesystem::exists("/tmp/scratch/.zophotos/zophotos.db"));
   EXPECT_THAT(Logged(), ElementsAre(UNPLUGGED, MOVING,
                                     Info("We now have a master volume " +
-                                         MasterText("/shares/Next/", "1.2e+11") + " ")));
+                                         MasterText("/shares/Next/", MIDDLE) + " ")));
 }
 
 TEST_F(MasterVolumeScannedStateTest, UnpluggedMasterWithoutASuccessorFallsBack) {
@@ -182,7 +182,7 @@ TEST_F(MasterVolumeScannedStateTest, UnpluggedMasterWithoutASuccessorFallsBack) 
               ElementsAre(UNPLUGGED, Info("We do NOT have a master volume, so going back to the "
                                           "Default State ")));
   EXPECT_THAT(MergedFolders("/shares"), IsEmpty());
-  EXPECT_EQ(SHARES_LOCATOR, Locator());
+  EXPECT_EQ(SHARES_LOCATOR, Appliance::Locator());
   ASSERT_EQ(1U, Registry().getVolumes().size());
   EXPECT_EQ(SHARES_MASTER_TEXT, Registry().getVolumes()[0].ToString());
 }
@@ -198,7 +198,7 @@ TEST_F(MasterVolumeScannedStateTest, FailedRemovalKeepsTheStateAndItsMerger) {
   EXPECT_THAT(MergedFiles("/shares/Vol"), ElementsAre("/shares/Vol/a.jpg"));
 }
 
-TEST_F(MasterVolumeScannedStateTest, FailureBehindTheRemovalLeavesTheMergerStopped) {
+TEST_F(MasterVolumeScannedStateTest, FailureAfterTheRemovalLeavesTheMergerStopped) {
   MakeCatalog("/shares/Vol/");
   Register("/shares/Next/", MIDDLE);
   std::ofstream("/shares/Next/.zophotos") << "in the way";
@@ -214,7 +214,7 @@ TEST_F(MasterVolumeScannedStateTest, FailureBehindTheRemovalLeavesTheMergerStopp
   EXPECT_THAT(MergedStatistics("/shares/Next"), ElementsAre("/shares/Vol/|1|1|0"));
 }
 
-TEST_F(MasterVolumeScannedStateTest, UnusableMasterPassesFromAMerge) {
+TEST_F(MasterVolumeScannedStateTest, UnusableMasterIsThrownFromAMerge) {
   MakeCatalog("/shares/Vol/");
   std::filesystem::remove_all("/shares/Vol/.zophotos");
   std::ofstream("/shares/Vol/.zophotos") << "in the way";

@@ -1,6 +1,5 @@
-// What PhotoDB does not ask because it knows the answer must show in nothing but time: the same
-// operations, once with the shortcuts and once with every statement asked, give the same rows with
-// the same ids.
+// PhotoDB's cache saves statements and changes nothing else: the same operations with the cache and
+// without it give the same rows with the same ids.
 
 #include "PhotoDB.h"
 
@@ -84,10 +83,10 @@ protected:
   static void Run(const std::vector<Operation>& operations, bool commit = true) {
     testing::internal::CaptureStdout(); // the lines about single files
     RunOn(CACHED, PhotoDB::CacheUse::Normal, operations, commit);
-    const std::string knowing = testing::internal::GetCapturedStdout();
+    const std::string cached = testing::internal::GetCapturedStdout();
     testing::internal::CaptureStdout();
     RunOn(UNCACHED, PhotoDB::CacheUse::Bypass, operations, commit);
-    EXPECT_EQ(testing::internal::GetCapturedStdout(), knowing);
+    EXPECT_EQ(testing::internal::GetCapturedStdout(), cached);
   }
 
   static void ExpectSameRows() {
@@ -105,29 +104,28 @@ protected:
   }
 
   static bool HasTransientIndex(PhotoDB& photos) {
-    Statement query(photos, "SELECT 1 FROM sqlite_master WHERE name = 'Files_merge'", __FILE__,
-                    __LINE__);
-    return query.Fetch(__FILE__, __LINE__);
+    Statement query(photos, "SELECT 1 FROM sqlite_master WHERE name = 'Files_merge'");
+    return query.Fetch();
   }
 
   static void RunOn(const std::string& location, PhotoDB::CacheUse cacheUse,
                     const std::vector<Operation>& operations, bool commit) {
     PhotoDB photos(location, cacheUse);
     photos.Init();
-    Transaction transaction(photos, 1000, __FILE__, __LINE__);
+    Transaction transaction(photos, 1000);
     for (const Operation& operation : operations) {
       operation(photos);
     }
     if (commit) {
-      transaction.Commit(__FILE__, __LINE__);
+      transaction.Commit();
     }
   }
 
-  static constexpr const char* CACHED = "/tmp/knowing";
-  static constexpr const char* UNCACHED = "/tmp/cacheUse";
+  static constexpr const char* CACHED = "/tmp/cached";
+  static constexpr const char* UNCACHED = "/tmp/uncached";
 };
 
-/// A source of catalogs and mutations, the same for the same seed.
+/// A source of random merges, the same for the same seed.
 class Source {
 public:
   explicit Source(unsigned seed) : random_(seed) {}
@@ -147,7 +145,7 @@ public:
     return path;
   }
 
-  /// One merge: usually in the order of the paths, as a merge goes, but not always.
+  /// One merge, usually in the order of the paths, as the daemon merges, but not always.
   std::vector<Operation> Merge() {
     const std::string volume = Volume();
     std::vector<std::pair<std::string, Operation>> folders{{volume, AddFolder(volume, volume)}};
@@ -160,7 +158,7 @@ public:
     for (std::size_t count = Below(40); count > 0; --count) {
       const std::string name = "f" + std::to_string(Below(6));
       const std::string path = Folder(volume) + name;
-      // A stranger's catalog may name a file otherwise than its path does.
+      // A catalog may name a file differently from its path.
       const std::string catalogName = Below(15) == 0 ? "f" + std::to_string(Below(6)) : name;
       const std::string fileVolume = Below(20) == 0 ? Volume() : volume;
       files.emplace_back(path, Below(4) == 0 ? DeleteFile(fileVolume, path, catalogName)
@@ -218,14 +216,14 @@ TEST_F(MergeCacheTest, SeveralTransactionsOfOneObjectGiveTheSameRows) {
       photos.Init();
       for (int merge = 0; merge < 8; ++merge) {
         std::optional<Transaction> transaction;
-        if (source.Below(6) != 0) { // else every statement is a transaction of its own
-          transaction.emplace(photos, 1000U, __FILE__, static_cast<unsigned>(__LINE__));
+        if (source.Below(6) != 0) { // otherwise each statement is a transaction of its own
+          transaction.emplace(photos, 1000U);
         }
         for (const Operation& operation : source.Merge()) {
           operation(photos);
         }
         if (transaction && source.Commits()) {
-          transaction->Commit(__FILE__, __LINE__);
+          transaction->Commit();
         }
       }
     }
@@ -234,7 +232,7 @@ TEST_F(MergeCacheTest, SeveralTransactionsOfOneObjectGiveTheSameRows) {
   }
 }
 
-TEST_F(MergeCacheTest, AFileNamedOtherwiseThanItsPathIsFoundByItsName) {
+TEST_F(MergeCacheTest, AFileWhoseNameDiffersFromItsPathIsFoundByItsName) {
   const std::string volume = "/shares/A/";
   Run({AddFolder(volume, volume), AddFile(volume, volume + "a", "z"),
        AddFile(volume, volume + "z", "z"), AddFile(volume, volume + "zz", "y"),
@@ -244,35 +242,35 @@ TEST_F(MergeCacheTest, AFileNamedOtherwiseThanItsPathIsFoundByItsName) {
               testing::ElementsAre("z", "y"));
 }
 
-TEST_F(MergeCacheTest, AFolderThatWasRolledBackIsForgotten) {
+TEST_F(MergeCacheTest, AFolderThatWasRolledBackIsRemovedFromTheCache) {
   const std::string volume = "/shares/A/";
   PhotoDB photos(CACHED);
   photos.Init();
   {
-    const Transaction rolledBack(photos, 1000, __FILE__, __LINE__);
+    const Transaction rolledBack(photos, 1000);
     AddFolder(volume, volume)(photos);
     AddFile(volume, volume + "a", "a")(photos);
   }
-  Transaction transaction(photos, 1000, __FILE__, __LINE__);
+  Transaction transaction(photos, 1000);
   AddFile(volume, volume + "b", "b")(photos);
-  transaction.Commit(__FILE__, __LINE__);
+  transaction.Commit();
   EXPECT_THAT(Rows(CACHED, "SELECT * FROM Files"), testing::IsEmpty());
 }
 
-TEST_F(MergeCacheTest, WhatOthersAddBetweenTwoTransactionsIsSeen) {
+TEST_F(MergeCacheTest, RowsThatOthersAddBetweenTransactionsAreSeen) {
   const std::string volume = "/shares/A/";
   PhotoDB photos(CACHED);
   photos.Init();
   {
-    Transaction transaction(photos, 1000, __FILE__, __LINE__);
+    Transaction transaction(photos, 1000);
     AddFolder(volume, volume)(photos);
     AddFile(volume, volume + "a", "a")(photos);
-    transaction.Commit(__FILE__, __LINE__);
+    transaction.Commit();
   }
   RunOn(CACHED, PhotoDB::CacheUse::Bypass, {AddFile(volume, volume + "b", "b")}, true);
-  Transaction transaction(photos, 1000, __FILE__, __LINE__);
+  Transaction transaction(photos, 1000);
   AddFile(volume, volume + "b", "b")(photos);
-  transaction.Commit(__FILE__, __LINE__);
+  transaction.Commit();
   EXPECT_THAT(Rows(CACHED, "SELECT name FROM Files"), testing::ElementsAre("a", "b"));
 }
 
@@ -302,12 +300,12 @@ TEST_F(MergeCacheTest, NamesThatManyFoldersShareAreAddedOnce) {
   EXPECT_THAT(Rows(CACHED, "SELECT count(*) FROM Files"), testing::ElementsAre("7000"));
 }
 
-TEST_F(MergeCacheTest, KnownNamesAreForgottenWhenAFileIsRemoved) {
+TEST_F(MergeCacheTest, NamesAreRemovedFromTheCacheWithTheirFile) {
   Run(Camera(1000, 1030));
   std::vector<Operation> operations = Camera(1000, 1030);
   const std::string volume = "/shares/A/";
   const std::string path = volume + "199/IMG_1010";
-  // Behind the last folder's files, when all its names are known.
+  // After the last folder's files, when the cache has all its names.
   operations.push_back(DeleteFile(volume, path, "IMG_1010"));
   operations.push_back(AddFile(volume, path, "IMG_1010"));
   operations.push_back(AddFile(volume, path, "IMG_1010"));
@@ -352,7 +350,7 @@ TEST_F(FlatFolderTest, ManyRemovalsLeaveTheSameRowsAndNoIndex) {
   EXPECT_THAT(Rows(CACHED, "SELECT count(*) FROM Files"), testing::ElementsAre("1501"));
 }
 
-TEST_F(FlatFolderTest, AHandfulOfRemovalsMakesNoIndex) {
+TEST_F(FlatFolderTest, FewRemovalsCreateNoIndex) {
   std::vector<Operation> operations = Removals(3);
   bool indexed = false;
   operations.emplace_back([&](PhotoDB& photos) { indexed = indexed || HasTransientIndex(photos); });
@@ -361,7 +359,7 @@ TEST_F(FlatFolderTest, AHandfulOfRemovalsMakesNoIndex) {
   ExpectSameRows();
 }
 
-TEST_F(FlatFolderTest, ARollbackTakesTheIndexWithIt) {
+TEST_F(FlatFolderTest, ARollbackRemovesTheIndex) {
   Run(Removals(FILES / 2), false);
   ExpectSameRows();
   EXPECT_THAT(Rows(CACHED, "SELECT count(*) FROM Files"), testing::ElementsAre("3000"));

@@ -4,8 +4,9 @@
 #include "NotificationListener.h"
 #include "NotificationService.h"
 #include "PhotoDB.h"
-#include "TestCatalog.h"
 #include "Volume.h"
+
+#include "support/XmlPlatform.h"
 
 #include "orvautil/ClientSocket.h"
 #include "orvautil/Core.h"
@@ -16,7 +17,6 @@
 #include <xercesc/dom/DOMElement.hpp>
 #include <xercesc/framework/MemBufInputSource.hpp>
 #include <xercesc/parsers/XercesDOMParser.hpp>
-#include <xercesc/util/PlatformUtils.hpp>
 
 #include <fstream>
 #include <stdexcept>
@@ -31,15 +31,17 @@ using ::testing::ElementsAre;
 using ::testing::IsEmpty;
 using ::testing::StartsWith;
 
-class XMLPlatform {
-public:
-  XMLPlatform() { xercesc::XMLPlatformUtils::Initialize(); }
-  XMLPlatform(const XMLPlatform&) = delete;
-  XMLPlatform& operator=(const XMLPlatform&) = delete;
-  ~XMLPlatform() { xercesc::XMLPlatformUtils::Terminate(); }
-};
+/// Parses a message and passes its root element to the listener.
+void Notify(const NotificationListener& listener, const std::string& message) {
+  const XmlPlatform platform;
+  xercesc::XercesDOMParser parser;
+  parser.parse(xercesc::MemBufInputSource(reinterpret_cast<const XMLByte*>(message.data()),
+                                          message.size(), "message"));
+  util::ClientSocket unused(util::Socket::Address("@nobody"), false);
+  listener.HandleMessage(unused, nullptr, 0, *parser.getDocument()->getDocumentElement());
+}
 
-/// A state that tells what it is handed.
+/// A state that records its events.
 class RecordingState final : public State {
 public:
   void handleVolumePlugged(VolumeInfo volume) override { Note("plugged", std::move(volume)); }
@@ -61,8 +63,7 @@ private:
   }
 };
 
-/// A listener that is handed parsed documents, before a state that records the events. The shares
-/// root is not registered.
+/// A listener with a state that records the events. The shares root is not registered.
 class NotificationTest : public StatesTest {
 protected:
   NotificationTest() {
@@ -73,15 +74,7 @@ protected:
     MakeDirectory("/shares/Vol");
   }
 
-  /// Parses a message and hands its root element to the listener.
-  void Notify(const std::string& message) const {
-    const XMLPlatform platform;
-    xercesc::XercesDOMParser parser;
-    parser.parse(xercesc::MemBufInputSource(reinterpret_cast<const XMLByte*>(message.data()),
-                                            message.size(), "message"));
-    util::ClientSocket unused(util::Socket::Address("@nobody"), false);
-    listener.HandleMessage(unused, nullptr, 0, *parser.getDocument()->getDocumentElement());
-  }
+  void Notify(const std::string& message) const { test::Notify(listener, message); }
 
   void NotifyBatch(const std::string& children) const {
     Notify(Notification("TranscodedBatch", "/shares/Vol", children));
@@ -99,8 +92,7 @@ protected:
   NotificationListener listener;
 };
 
-const LogLine BATCH = Info(":: Transcodedbatch ");
-const LogLine ACCEPTED = Info("Profile ==> cb62bbdd389b48898f2e5244977cb2c5 ==> \n");
+const LogLine BATCH = BatchLines().front();
 
 TEST(NotificationListener, MessageThatMentionsTheRootElementIsValid) {
   const NotificationListener listener;
@@ -123,7 +115,7 @@ TEST_F(NotificationTest, OtherRootElementIsRefused) {
   EXPECT_THAT(Registered(), IsEmpty());
 }
 
-TEST_F(NotificationTest, RootElementIsComparedWhole) {
+TEST_F(NotificationTest, RootElementMustMatchCompletely) {
   Notify("<ORVANotifications Name=\"Scanned\" MountPoint=\"/shares/Vol\"/>");
   Notify("<x:ORVANotification Name=\"Scanned\" MountPoint=\"/shares/Vol\"/>");
   EXPECT_THAT(Logged(), ElementsAre(Error("ERROR ! Node name = ORVANotifications"),
@@ -153,7 +145,7 @@ TEST_F(NotificationTest, PluggedVolumeIsMeasured) {
                                "capacity_used is 1048576.000000 for mountPoint /shares/Tmp/")));
 }
 
-TEST_F(NotificationTest, PluggedReadOnlyVolumeIsTakenAsWritable) {
+TEST_F(NotificationTest, PluggedReadOnlyVolumeIsRegisteredAsWritable) {
   Volume volume("Tmp", "300m");
   volume.MakeReadOnly();
   Notify(test::Plugged("/shares/Tmp"));
@@ -161,7 +153,7 @@ TEST_F(NotificationTest, PluggedReadOnlyVolumeIsTakenAsWritable) {
   EXPECT_FALSE(Registry().getVolumes()[0].readOnly);
 }
 
-TEST_F(NotificationTest, PluggedVolumeThatIsNotThereIsAnEventAllTheSame) {
+TEST_F(NotificationTest, PluggedVolumeWithoutADirectoryIsStillAnEvent) {
   Notify(test::Plugged("/shares/Gone"));
   EXPECT_THAT(state->events, ElementsAre("plugged /shares/Gone/"));
   EXPECT_EQ(1.0, state->volumes[0].capacity);
@@ -173,7 +165,7 @@ TEST_F(NotificationTest, PluggedVolumeThatIsNotThereIsAnEventAllTheSame) {
 
 // The other events.
 
-TEST_F(NotificationTest, UnpluggedVolumeIsForgottenSilently) {
+TEST_F(NotificationTest, UnpluggedVolumeIsRemovedSilently) {
   Register("/shares/Vol/", LARGE);
   ASSERT_TRUE(Registry().reelectMasterVolume());
   Notify(test::Unplugged("/shares/Vol"));
@@ -201,7 +193,7 @@ TEST_F(NotificationTest, PurgedVolumeIsRegisteredUnmeasured) {
   EXPECT_THAT(Logged(), ElementsAre(Info(":: Purged ")));
 }
 
-TEST_F(NotificationTest, FirstEventFixesTheCapacity) {
+TEST_F(NotificationTest, FirstEventDeterminesTheCapacity) {
   const Volume volume("Tmp", "300m");
   Notify(test::Scanned("/shares/Tmp"));
   Notify(test::Plugged("/shares/Tmp"));
@@ -234,7 +226,7 @@ TEST_F(NotificationTest, BatchOfTheAcceptedProfileIsHandled) {
   NotifyBatch(ProfileElement(notify::TRANSCODING_PROFILE));
   EXPECT_THAT(state->events, ElementsAre("transcoded /shares/Vol/"));
   EXPECT_THAT(Registered(), ElementsAre("/shares/Vol/"));
-  EXPECT_THAT(Logged(), ElementsAre(BATCH, ACCEPTED));
+  EXPECT_EQ(BatchLines(), Logged());
 }
 
 TEST_F(NotificationTest, ProfileIsFoundAmongOtherChildren) {
@@ -245,7 +237,7 @@ TEST_F(NotificationTest, ProfileIsFoundAmongOtherChildren) {
 
 TEST_F(NotificationTest, LastProfileDecides) {
   NotifyBatch(ProfileElement("other") + ProfileElement(notify::TRANSCODING_PROFILE));
-  EXPECT_THAT(Logged(), ElementsAre(BATCH, ACCEPTED));
+  EXPECT_EQ(BatchLines(), Logged());
   EXPECT_THAT(state->events, ElementsAre("transcoded /shares/Vol/"));
   NotifyBatch(ProfileElement(notify::TRANSCODING_PROFILE) + ProfileElement("other"));
   NotifyBatch(ProfileElement(notify::TRANSCODING_PROFILE) + "<profile/>");
@@ -297,7 +289,7 @@ TEST_F(NotificationTest, EncodedSeparatorAtTheEndIsOne) {
   EXPECT_THAT(state->events, ElementsAre("scanned /shares/Vol/"));
 }
 
-TEST_F(NotificationTest, MalformedEscapesStayAsTheyStand) {
+TEST_F(NotificationTest, MalformedEscapesAreKept) {
   Notify(Notification("Unplugged", "/shares/100%"));
   Notify(Notification("Unplugged", "/shares/%zz%4"));
   Notify(Notification("Unplugged", "/shares/a%00b"));
@@ -305,7 +297,7 @@ TEST_F(NotificationTest, MalformedEscapesStayAsTheyStand) {
                                          "unplugged /shares/a%00b/"));
 }
 
-TEST_F(NotificationTest, CharactersOutsideAsciiComeAsUtf8) {
+TEST_F(NotificationTest, CharactersOutsideAsciiAreUtf8) {
   MakeDirectory("/shares/\xC3\xA4");
   Notify(Notification("Scanned", "/shares/&#228;"));
   EXPECT_THAT(Registered(), ElementsAre("/shares/\xC3\xA4/"));
@@ -328,18 +320,11 @@ TEST_F(NotificationTest, EmptyMountPointIsOutOfRange) {
 
 // The machine.
 
-TEST_F(DaemonLayerTest, NotificationMakesTheMachineWhenThereIsNone) {
-  const XMLPlatform platform;
+TEST_F(DaemonLayerTest, NotificationCreatesTheMachineWhenThereIsNone) {
   MakeDirectory("/shares/Vol");
-  xercesc::XercesDOMParser parser;
-  const std::string message = test::Unplugged("/shares/Vol");
-  parser.parse(xercesc::MemBufInputSource(reinterpret_cast<const XMLByte*>(message.data()),
-                                          message.size(), "message"));
-  util::ClientSocket unused(util::Socket::Address("@nobody"), false);
-  NotificationListener().HandleMessage(unused, nullptr, 0,
-                                       *parser.getDocument()->getDocumentElement());
+  Notify(NotificationListener(), test::Unplugged("/shares/Vol"));
   EXPECT_NE(nullptr, dbmerger::StateMachine::instance);
-  EXPECT_EQ(SHARES_LOCATOR, Locator());
+  EXPECT_EQ(SHARES_LOCATOR, Appliance::Locator());
   EXPECT_THAT(Logged(), ElementsAre(Info("Default:: Volumeunplugged, ignoring! ")));
 }
 
@@ -382,7 +367,7 @@ TEST_F(NotificationTest, ListenerHandlesMessagesInOrderAndReconnects) {
                           READING, CREATING, CANNOT_OPEN, EXITING));
 }
 
-TEST_F(NotificationTest, MessageThatFailsEndsAloneWithItsLine) {
+TEST_F(NotificationTest, FailedMessageIsLoggedAndTheNextIsHandled) {
   NotificationService service;
   listener.Create(8, 0, false);
   service.Send(Notification("Plugged", ""));
@@ -398,7 +383,7 @@ TEST_F(NotificationTest, MessageThatFailsEndsAloneWithItsLine) {
   EXPECT_EQ(Info(":: Scanned"), lines[3]);
 }
 
-TEST_F(StatesTest, UnusableMasterIsTheTextOfTheMessagesFailure) {
+TEST_F(StatesTest, UnusableMasterIsLoggedAsTheFailureOfTheMessage) {
   MakeDirectory("/shares/Vol");
   std::filesystem::remove_all("/shares/.zophotos");
   std::ofstream("/shares/.zophotos") << "in the way";

@@ -32,7 +32,7 @@ const std::string LOCATION = "/shares/Vol";
 const std::string DIRECTORY = LOCATION + "/.zophotos";
 const std::string VOLUME = "/shares/Vol/";
 
-/// A location that is there, without a database.
+/// An existing location without a database.
 class PhotoDBLocationTest : public DaemonLayerTest {
 protected:
   PhotoDBLocationTest() { MakeDirectory(LOCATION); }
@@ -80,8 +80,8 @@ protected:
     });
   }
 
-  /// Makes every change fail that would give a second row of `table` the same value there.
-  void RefuseTwice(const std::string& table, const std::string& column) const {
+  /// Makes every change fail that would give two rows of `table` the same value in `column`.
+  void RefuseDuplicates(const std::string& table, const std::string& column) const {
     Rows("CREATE UNIQUE INDEX refuse ON " + table + "(" + column + ")");
   }
 
@@ -90,7 +90,7 @@ protected:
 
 // The location.
 
-TEST_F(PhotoDBLocationTest, NewDirectoryIsOpenToEverybodyWhateverTheUmask) {
+TEST_F(PhotoDBLocationTest, NewDirectoryIsWritableByEverybodyWithAnyUmask) {
   const mode_t mask = umask(0077);
   PhotoDB photos(LOCATION);
   umask(mask);
@@ -106,7 +106,7 @@ TEST_F(PhotoDBLocationTest, ExistingDirectoryKeepsItsMode) {
   EXPECT_TRUE(std::filesystem::exists(MergedDatabasePath(LOCATION)));
 }
 
-TEST_F(PhotoDBLocationTest, FormsOfTheSameDirectoryAreOneLocation) {
+TEST_F(PhotoDBLocationTest, DifferentPathsOfADirectoryAreOneLocation) {
   std::filesystem::create_directory_symlink(LOCATION, "/shares/Link");
   for (const char* const form : {"/shares/Vol", "/shares/Vol/", "/shares/Vol//", "/shares/./Vol/.",
                                  "/shares/Vol/../Vol", "/shares/Link"}) {
@@ -116,7 +116,7 @@ TEST_F(PhotoDBLocationTest, FormsOfTheSameDirectoryAreOneLocation) {
   }
 }
 
-TEST_F(PhotoDBLocationTest, MissingLocationKeepsAScratchDatabaseInTheWorkingDirectory) {
+TEST_F(PhotoDBLocationTest, MissingLocationHasItsDatabaseInTheWorkingDirectory) {
   std::filesystem::current_path(MakeDirectory("/tmp/scratch"));
   PhotoDB photos("DUMMY_MOUNT_POINT");
   photos.Init();
@@ -127,7 +127,7 @@ TEST_F(PhotoDBLocationTest, MissingLocationKeepsAScratchDatabaseInTheWorkingDire
 TEST_F(PhotoDBLocationTest, FileInTheDirectorysPlaceIsAnUnusableLocation) {
   std::ofstream(DIRECTORY) << "in the way";
   EXPECT_EQ("Invalid DB location : '/shares/Vol/.zophotos'",
-            ThrownBy<PhotoDB::Error>([] { PhotoDB photos(LOCATION); }).Message());
+            Thrown<PhotoDB::Error>([] { PhotoDB photos(LOCATION); }).Message());
 }
 
 TEST_F(PhotoDBLocationTest, LinkInTheDirectorysPlaceIsAnUnusableLocation) {
@@ -135,11 +135,11 @@ TEST_F(PhotoDBLocationTest, LinkInTheDirectorysPlaceIsAnUnusableLocation) {
   chmod("/shares/Elsewhere", 0700);
   std::filesystem::create_directory_symlink("/shares/Elsewhere", DIRECTORY);
   EXPECT_EQ("Invalid DB location : '/shares/Vol/.zophotos'",
-            ThrownBy<PhotoDB::Error>([] { PhotoDB photos(LOCATION); }).Message());
+            Thrown<PhotoDB::Error>([] { PhotoDB photos(LOCATION); }).Message());
   EXPECT_EQ(0700U, ModeOf("/shares/Elsewhere"));
 }
 
-TEST_F(PhotoDBLocationTest, LinkToNowhereInTheDirectorysPlaceIsAnUnusableLocation) {
+TEST_F(PhotoDBLocationTest, DanglingLinkInTheDirectorysPlaceIsAnUnusableLocation) {
   std::filesystem::create_directory_symlink("/shares/Nowhere", DIRECTORY);
   EXPECT_THROW(PhotoDB photos(LOCATION), PhotoDB::Error);
   EXPECT_FALSE(std::filesystem::exists("/shares/Nowhere"));
@@ -149,10 +149,10 @@ TEST_F(PhotoDBLocationTest, UnusableLocationIsNoStandardException) {
   EXPECT_FALSE((std::is_base_of_v<std::exception, PhotoDB::Error>));
 }
 
-TEST_F(PhotoDBLocationTest, DirectoryThatCannotBeMadeIsAnException) {
+TEST_F(PhotoDBLocationTest, DirectoryThatCannotBeCreatedIsAnException) {
   ASSERT_EQ(0, mount("volume", LOCATION.c_str(), "tmpfs", MS_RDONLY, nullptr));
   EXPECT_STREQ("Change permissions failed on dbLocation: '/shares/Vol/.zophotos'",
-               ThrownBy<util::Exception>([] { PhotoDB photos(LOCATION); }).what());
+               Thrown<util::Exception>([] { PhotoDB photos(LOCATION); }).what());
 }
 
 TEST_F(PhotoDBLocationTest, LinkInTheFilesPlaceIsRefused) {
@@ -250,7 +250,7 @@ TEST_F(PhotoDBTest, ExistingDatabaseWithoutAStatusRowLeavesTheRecordUnset) {
 TEST_F(PhotoDBTest, ExistingFileWithoutAStatusTableIsThrown) {
   Rows("DROP TABLE Status");
   PhotoDB again(LOCATION);
-  EXPECT_THAT(ThrownBy<std::string>([&] { again.Init(); }), HasSubstr("SELECT * FROM Status"));
+  EXPECT_THAT(Thrown([&] { again.Init(); }), HasSubstr("SELECT * FROM Status"));
 }
 
 TEST_F(PhotoDBLocationTest, FileThatIsNoDatabaseIsThrown) {
@@ -322,13 +322,13 @@ TEST_F(PhotoDBTest, UnknownFolderIsNull) {
   EXPECT_FALSE(photos.GetFolder("/shares/", VOLUME)) << "the root is of another volume";
 }
 
-TEST_F(PhotoDBTest, TopFolderOfAVolumeHangsBelowTheRoot) {
+TEST_F(PhotoDBTest, TopFolderOfAVolumeIsAChildOfTheRoot) {
   AddFolder("/shares/Vol/", VOLUME, 1234);
   EXPECT_THAT(Rows("SELECT * FROM Folders WHERE folder_id != 1"),
               ElementsAre("2|1|/shares/Vol/|1234|/shares/Vol/"));
 }
 
-TEST_F(PhotoDBTest, FolderHangsBelowItsParent) {
+TEST_F(PhotoDBTest, FolderIsAChildOfItsParent) {
   AddFolder("/shares/Vol/");
   AddFolder("/shares/Vol/Pictures/", VOLUME, 1234);
   const auto folder = photos.GetFolder("/shares/Vol/Pictures/", VOLUME);
@@ -347,7 +347,7 @@ TEST_F(PhotoDBTest, FolderIsAddedOnce) {
   EXPECT_THAT(Rows("SELECT modified_date FROM Folders WHERE folder_id != 1"), ElementsAre("1"));
 }
 
-TEST_F(PhotoDBTest, FolderThatIsThereUnderAnotherVolumeIsNotAdded) {
+TEST_F(PhotoDBTest, FolderOfAnotherVolumeIsNotAddedAgain) {
   AddFolder("/shares/Vol/", "/shares/Other/");
   AddFolder("/shares/Vol/", VOLUME);
   EXPECT_THAT(MergedFolders(LOCATION), ElementsAre("/shares/Vol/|/shares/Other/"));
@@ -366,14 +366,14 @@ TEST_F(PhotoDBTest, FolderWithoutItsParentIsSilentlyLeftOut) {
   EXPECT_THAT(Logged(), IsEmpty());
 }
 
-TEST_F(PhotoDBTest, OddFolderPathsAreLeftOut) {
+TEST_F(PhotoDBTest, FolderPathsWithoutAParentAreLeftOut) {
   for (const char* const path : {"", "/", "a", "a/", "//"}) {
     AddFolder(path);
     EXPECT_THAT(MergedFolders(LOCATION), IsEmpty()) << '"' << path << '"';
   }
 }
 
-TEST_F(PhotoDBTest, FolderPathWithoutATrailingSeparatorHasItsParentAsWell) {
+TEST_F(PhotoDBTest, FolderPathWithoutATrailingSeparatorHasTheSameParent) {
   AddFolder("/shares/Vol");
   EXPECT_THAT(Rows("SELECT parent_folder_id, name FROM Folders WHERE folder_id != 1"),
               ElementsAre("1|/shares/Vol"));
@@ -393,7 +393,7 @@ TEST_F(PhotoDBTest, FolderNameIsTheTextBetweenTheLastTwoSeparators) {
   }
 }
 
-TEST_F(PhotoDBTest, FolderNamesWithoutASeparatorDoNoHarm) {
+TEST_F(PhotoDBTest, FolderNamesWithoutASeparatorAreRead) {
   AddFolder("/shares/Vol/");
   for (const char* const path : {"", "a"}) {
     Database(MergedDatabasePath(LOCATION))
@@ -404,7 +404,7 @@ TEST_F(PhotoDBTest, FolderNamesWithoutASeparatorDoNoHarm) {
   }
 }
 
-TEST_F(PhotoDBTest, TimeOfAFolderIsStoredWholeAndReadIn32Bits) {
+TEST_F(PhotoDBTest, TimeOfAFolderIsStoredIn64BitsAndReadIn32) {
   AddFolder("/shares/Vol/", VOLUME, 4294967301);
   EXPECT_THAT(Rows("SELECT modified_date FROM Folders WHERE folder_id = 2"),
               ElementsAre("4294967301"));
@@ -428,7 +428,7 @@ TEST_F(PhotoDBTest, SubfoldersAreThoseOfOneVolume) {
   EXPECT_THAT(names, ElementsAre("/shares/Vol/", "/shares/Third/", "/shares/Vol/a/"));
 }
 
-TEST_F(PhotoDBTest, DeletedFolderTakesItsOwnFilesButNotItsSubfolders) {
+TEST_F(PhotoDBTest, DeletedFolderIsRemovedWithItsFilesButNotItsSubfolders) {
   AddFolder("/shares/Vol/");
   AddFolder("/shares/Vol/a/");
   AddFolder("/shares/Vol/a/b/");
@@ -443,7 +443,7 @@ TEST_F(PhotoDBTest, DeletedFolderTakesItsOwnFilesButNotItsSubfolders) {
               ElementsAre("/shares/Vol/a/b/stay.jpg", "/shares/Vol/keep.jpg"));
 }
 
-TEST_F(PhotoDBTest, UnknownFolderIsDeletedWithoutEffect) {
+TEST_F(PhotoDBTest, DeletionOfAnUnknownFolderHasNoEffect) {
   AddFolder("/shares/Vol/");
   AddFile("/shares/Vol/", "a.jpg");
   const Lines before = MergedContent(LOCATION);
@@ -455,7 +455,7 @@ TEST_F(PhotoDBTest, UnknownFolderIsDeletedWithoutEffect) {
 
 // Files.
 
-TEST_F(PhotoDBTest, FileIsCreatedWhenItWasModified) {
+TEST_F(PhotoDBTest, CreationDateOfAFileIsItsModificationDate) {
   AddFolder("/shares/Vol/");
   AddFile("/shares/Vol/", "a.jpg", VOLUME, 1234);
   EXPECT_THAT(Rows("SELECT * FROM Files"), ElementsAre("1|2|a.jpg|1234|/shares/Vol/|1234"));
@@ -510,7 +510,7 @@ TEST_F(PhotoDBTest, FileWithoutItsFolderIsSilentlyLeftOut) {
   EXPECT_THAT(Logged(), IsEmpty());
 }
 
-TEST_F(PhotoDBTest, NamesWithQuotesAreNames) {
+TEST_F(PhotoDBTest, NamesMayContainQuotes) {
   AddFolder("/shares/Vol/");
   AddFolder("/shares/Vol/it's \"x\"; --/");
   AddFile("/shares/Vol/it's \"x\"; --/", "' OR 1 = 1.jpg");
@@ -536,7 +536,7 @@ TEST_F(PhotoDBTest, FilesOfAFolderAreAppended) {
   EXPECT_THAT(names, ElementsAre("three.jpg", "one.jpg", "two.jpg"));
 }
 
-TEST_F(PhotoDBTest, FileIsDeletedWhateverTheVolume) {
+TEST_F(PhotoDBTest, FileIsDeletedForAnyVolume) {
   AddFolder("/shares/Vol/");
   AddFile("/shares/Vol/", "a.jpg");
   AddFile("/shares/Vol/", "b.jpg");
@@ -554,7 +554,7 @@ TEST_F(PhotoDBTest, OnlyTheFileOfThatFolderIsDeleted) {
   EXPECT_THAT(MergedFiles(LOCATION), ElementsAre("/shares/Vol/a/a.jpg"));
 }
 
-TEST_F(PhotoDBTest, FileOfAnUnknownFolderIsDeletedWithoutEffect) {
+TEST_F(PhotoDBTest, DeletionOfAFileInAnUnknownFolderHasNoEffect) {
   AddFolder("/shares/Vol/");
   AddFile("/shares/Vol/", "a.jpg");
   EXPECT_EQ("Deleting /shares/Gone/a.jpg\n", DeleteFile("/shares/Gone/", "a.jpg"));
@@ -564,7 +564,7 @@ TEST_F(PhotoDBTest, FileOfAnUnknownFolderIsDeletedWithoutEffect) {
 
 // Volumes.
 
-TEST_F(PhotoDBTest, DeletedVolumeKeepsItsCountsAndStartsFromTheBeginning) {
+TEST_F(PhotoDBTest, DeletedVolumeKeepsItsCountsAndItsTimeIsZero) {
   AddFolder("/shares/Vol/");
   AddFolder("/shares/Other/", "/shares/Other/");
   AddFile("/shares/Vol/", "a.jpg");
@@ -603,29 +603,27 @@ TEST_F(PhotoDBTest, DeletionOfAllVolumesCompactsTheFile) {
   EXPECT_LT(std::filesystem::file_size(MergedDatabasePath(LOCATION)), 100'000U);
 }
 
-TEST_F(PhotoDBTest, FailedDeletionsPassOn) {
+TEST_F(PhotoDBTest, FailedDeletionsAreThrown) {
   AddFolder("/shares/Vol/");
   Rows("DROP TABLE Files");
   EXPECT_THROW(DeleteFile("/shares/Vol/", "a.jpg"), std::string);
   EXPECT_THROW(DeleteFolder("/shares/Vol/"), std::string);
-  EXPECT_THAT(ThrownBy<std::string>([&] { photos.DeleteVolumes(); }),
-              HasSubstr("no such table: Files"));
+  EXPECT_THAT(Thrown([&] { photos.DeleteVolumes(); }), HasSubstr("no such table: Files"));
 }
 
-TEST_F(PhotoDBTest, FailureInTheMiddleLeavesWhatWasDoneBefore) {
+TEST_F(PhotoDBTest, FailedDeletionKeepsItsFirstSteps) {
   AddFolder("/shares/Vol/");
   AddFile("/shares/Vol/", "a.jpg");
   photos.InsertStatistics(VOLUME);
   photos.UpdateStatistics({VOLUME, 3, 4, 500});
   Rows("ALTER TABLE Folders RENAME TO Away");
-  EXPECT_THAT(ThrownBy<std::string>([&] { photos.DeleteVolume(VOLUME); }),
-              HasSubstr("no such table: Folders"));
+  EXPECT_THAT(Thrown([&] { photos.DeleteVolume(VOLUME); }), HasSubstr("no such table: Folders"));
   EXPECT_THAT(Rows("SELECT name FROM Files"), IsEmpty());
   EXPECT_THAT(Rows("SELECT name FROM Away"), ElementsAre("/shares/", "/shares/Vol/"));
   EXPECT_THAT(MergedStatistics(LOCATION), ElementsAre("/shares/Vol/|3|4|0"));
 }
 
-TEST_F(PhotoDBTest, VolumeWhoseDeletionFailsAtOnceStartsFromTheBeginningAllTheSame) {
+TEST_F(PhotoDBTest, TimeOfAVolumeIsZeroEvenIfItsDeletionFails) {
   AddFolder("/shares/Vol/");
   photos.InsertStatistics(VOLUME);
   photos.UpdateStatistics({VOLUME, 3, 4, 500});
@@ -635,15 +633,15 @@ TEST_F(PhotoDBTest, VolumeWhoseDeletionFailsAtOnceStartsFromTheBeginningAllTheSa
   EXPECT_THAT(MergedStatistics(LOCATION), ElementsAre("/shares/Vol/|3|4|0"));
 }
 
-TEST_F(PhotoDBTest, FailedAddsPassOn) {
+TEST_F(PhotoDBTest, FailedAdditionsAreThrown) {
   AddFolder("/shares/Vol/");
   AddFile("/shares/Vol/", "a.jpg");
-  RefuseTwice("Files", "volume");
-  EXPECT_THAT(ThrownBy<std::string>([&] { AddFile("/shares/Vol/", "b.jpg"); }),
+  RefuseDuplicates("Files", "volume");
+  EXPECT_THAT(Thrown([&] { AddFile("/shares/Vol/", "b.jpg"); }),
               HasSubstr("UNIQUE constraint failed"));
 }
 
-TEST_F(PhotoDBTest, FailedReadsPassOn) {
+TEST_F(PhotoDBTest, FailedReadsAreThrown) {
   Rows("ALTER TABLE Folders RENAME TO Stored");
   Rows("CREATE VIEW Folders AS SELECT folder_id, parent_folder_id, name, abs(-9223372036854775807 "
        "- 1) AS modified_date, volume FROM Stored");
@@ -698,7 +696,7 @@ TEST_F(PhotoDBTest, StatisticsAreThoseOfTheVolume) {
   EXPECT_EQ(7, statistics->last_updated_time);
 }
 
-TEST_F(PhotoDBTest, CountsAreStoredWholeAndReadIn32Bits) {
+TEST_F(PhotoDBTest, CountsAreStoredIn64BitsAndReadIn32) {
   photos.InsertStatistics(VOLUME);
   photos.UpdateStatistics({VOLUME, 2147483648, 4294967301, 5'000'000'000});
   EXPECT_THAT(MergedStatistics(LOCATION),
@@ -706,7 +704,7 @@ TEST_F(PhotoDBTest, CountsAreStoredWholeAndReadIn32Bits) {
   const auto statistics = photos.GetStatistics(VOLUME);
   EXPECT_EQ(-2147483648L, statistics->photos_xcoded);
   EXPECT_EQ(5, statistics->photos_total);
-  EXPECT_EQ(5'000'000'000, statistics->last_updated_time) << "a time is read whole";
+  EXPECT_EQ(5'000'000'000, statistics->last_updated_time) << "a time is read in 64 bits";
 }
 
 TEST_F(PhotoDBTest, UpdateWithoutARowChangesAndLogsNothing) {
@@ -718,7 +716,7 @@ TEST_F(PhotoDBTest, UpdateWithoutARowChangesAndLogsNothing) {
 
 TEST_F(PhotoDBTest, FailedInsertOfStatisticsIsLoggedOnly) {
   photos.InsertStatistics("/shares/Other/");
-  RefuseTwice("Statistics", "photos_total");
+  RefuseDuplicates("Statistics", "photos_total");
   photos.InsertStatistics(VOLUME);
   EXPECT_THAT(Logged(), ElementsAre(Error("Could not insert stats for /shares/Vol/ ")));
   EXPECT_THAT(MergedStatistics(LOCATION), ElementsAre("/shares/Other/|0|0|0"));
@@ -728,7 +726,7 @@ TEST_F(PhotoDBTest, FailedUpdateOfStatisticsIsLoggedOnly) {
   photos.InsertStatistics(VOLUME);
   photos.InsertStatistics("/shares/Other/");
   photos.UpdateStatistics({"/shares/Other/", 1, 2, 3});
-  RefuseTwice("Statistics", "last_updated_time");
+  RefuseDuplicates("Statistics", "last_updated_time");
   photos.UpdateStatistics({VOLUME, 1, 2, 3});
   EXPECT_THAT(Logged(),
               ElementsAre(Error("Could not update stats for /shares/Vol/. Return code 19")));
@@ -746,7 +744,7 @@ TEST_F(PhotoDBTest, StatisticsWithoutATableAreThrown) {
   EXPECT_THAT(Logged(), IsEmpty());
 }
 
-TEST_F(PhotoDBTest, StatusIsWrittenToTheFirstRowWhateverItsId) {
+TEST_F(PhotoDBTest, StatusIsWrittenToTheFirstRowForAnyId) {
   Rows("INSERT INTO Status(mc_version, mdate, desc, etype) VALUES('old', 1, 'second', 2)");
   ASSERT_EQ(-1, photos.status.id);
   photos.status.mdate = 5'000'000'000;
@@ -759,9 +757,9 @@ TEST_F(PhotoDBTest, StatusIsWrittenToTheFirstRowWhateverItsId) {
 
 TEST_F(PhotoDBTest, FailedUpdateOfTheStatusIsThrownAndNamesThePlaceInThisLayer) {
   Rows("INSERT INTO Status(mc_version, mdate) VALUES('other', 1)");
-  RefuseTwice("Status", "mc_version");
+  RefuseDuplicates("Status", "mc_version");
   photos.status.mc_version = "other";
-  EXPECT_THAT(ThrownBy<std::string>([&] { photos.UpdateStatus(); }),
+  EXPECT_THAT(Thrown([&] { photos.UpdateStatus(); }),
               ::testing::AllOf(StartsWith("src/zophotodbmerger/PhotoDB.cpp:"),
                                HasSubstr("UNIQUE constraint failed")));
 }

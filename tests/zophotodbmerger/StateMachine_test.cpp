@@ -23,7 +23,7 @@ using ::testing::IsEmpty;
 
 using StateMachineTest = DaemonLayerTest;
 
-/// A state of any type that tells of its end.
+/// A state of any type that records its destruction.
 class ProbeState final : public DefaultState {
 public:
   ProbeState(int type, Lines& ended, bool throws = false)
@@ -64,7 +64,7 @@ TEST_F(StateMachineTest, StartsInDefaultStateSilently) {
 
 TEST_F(StateMachineTest, StartPointsTheLocatorAtTheSharesRoot) {
   const StateMachine machine;
-  EXPECT_EQ("zophotos_db_path=/shares//.zophotos/zophotos.db\n", Locator());
+  EXPECT_EQ("zophotos_db_path=/shares//.zophotos/zophotos.db\n", Appliance::Locator());
 }
 
 TEST_F(StateMachineTest, StartRegistersTheSharesRoot) {
@@ -80,7 +80,7 @@ TEST_F(StateMachineTest, StartRegistersTheSharesRoot) {
   EXPECT_EQ("DUMMY_MOUNT_POINT", VolumeInfoManager::Instance().getMasterVolume().mountPoint);
 }
 
-TEST_F(StateMachineTest, StartCreatesTheMergedDatabaseAndStampsIt) {
+TEST_F(StateMachineTest, StartCreatesTheMergedDatabaseAndSetsItsTime) {
   const std::time_t before = std::time(nullptr);
   const StateMachine machine;
   const std::time_t after = std::time(nullptr);
@@ -94,7 +94,7 @@ TEST_F(StateMachineTest, StartCreatesTheMergedDatabaseAndStampsIt) {
               ElementsAre("1|-1|/shares/|0|<DUMMY>"));
 }
 
-TEST_F(StateMachineTest, StartKeepsNothingOfAnEarlierRun) {
+TEST_F(StateMachineTest, StartRemovesTheRowsOfAnEarlierRun) {
   PhotoDB("/shares").Init();
   for (const char* const sql :
        {"INSERT INTO Folders VALUES(2, 1, '/shares/Vol/', 0, '/shares/Vol/')",
@@ -111,28 +111,28 @@ TEST_F(StateMachineTest, StartKeepsNothingOfAnEarlierRun) {
               ElementsAre("3.0|kept"));
 }
 
-TEST_F(StateMachineTest, StartWithoutTheSharesRootGoesOnWithAnEmptyRegistry) {
+TEST_F(StateMachineTest, StartWithoutTheSharesRootHasAnEmptyRegistry) {
   std::filesystem::remove("/shares");
   std::filesystem::current_path(MakeDirectory("/tmp/scratch"));
   const StateMachine machine;
   EXPECT_THAT(Logged(),
               ElementsAre(Error("There is no filesystem location for the mountpoint /shares")));
   EXPECT_THAT(VolumeInfoManager::Instance().getVolumes(), IsEmpty());
-  EXPECT_EQ(SHARES_LOCATOR, Locator());
+  EXPECT_EQ(SHARES_LOCATOR, Appliance::Locator());
   EXPECT_TRUE(std::filesystem::exists("/tmp/scratch/.zophotos/zophotos.db"));
   EXPECT_FALSE(std::filesystem::exists("/shares"));
 }
 
-TEST_F(StateMachineTest, UnusableSharesRootLetsNoMachineBeMade) {
+TEST_F(StateMachineTest, UnusableSharesRootPreventsTheMachine) {
   std::ofstream("/shares/.zophotos") << "in the way";
   EXPECT_EQ("Invalid DB location : '/shares/.zophotos'",
-            ThrownBy<PhotoDB::Error>([] { StateMachine::Instance(); }).Message());
+            Thrown<PhotoDB::Error>([] { StateMachine::Instance(); }).Message());
   EXPECT_EQ(nullptr, StateMachine::instance);
-  EXPECT_EQ("(absent)", Locator());
+  EXPECT_EQ("(absent)", Appliance::Locator());
   EXPECT_EQ(nullptr, VolumeInfoManager::instance);
 }
 
-TEST_F(StateMachineTest, InstanceIsMadeOnFirstUseAndStays) {
+TEST_F(StateMachineTest, InstanceIsCreatedOnceOnFirstUse) {
   EXPECT_EQ(nullptr, StateMachine::instance);
   StateMachine* const made = &StateMachine::Instance();
   EXPECT_EQ(made, StateMachine::instance);
@@ -150,7 +150,7 @@ TEST_F(StateMachineTest, FirstTransitionPrintsOnlyTheNewState) {
   EXPECT_EQ(plugged, machine.getCurrentState());
 }
 
-TEST_F(StateMachineTest, LaterTransitionsPrintTheStateReplacedOneBefore) {
+TEST_F(StateMachineTest, LaterTransitionsPrintTheDeletedStateToo) {
   Lines ended;
   StateMachine machine;
   const std::string start = Address(machine.getCurrentState());
@@ -201,7 +201,7 @@ TEST_F(StateMachineTest, StateOfAnUnknownTypeHasNoLines) {
   EXPECT_THAT(ended, ElementsAre("end of 0", "end of 3", "end of -1"));
 }
 
-TEST_F(StateMachineTest, EndOfAStateThatThrowsPassesAndFreesBoth) {
+TEST_F(StateMachineTest, DestructorOfAStateThatThrowsReleasesBothStates) {
   Lines ended;
   StateMachine machine;
   Set(machine, std::make_unique<ProbeState>(1, ended, true).release());
@@ -209,8 +209,8 @@ TEST_F(StateMachineTest, EndOfAStateThatThrowsPassesAndFreesBoth) {
   Set(machine, current);
   std::string thrown;
   OutputOf([&] {
-    thrown = ThrownBy<std::string>(
-        [&] { machine.setCurrentState(std::make_unique<ProbeState>(0, ended).release()); });
+    thrown =
+        Thrown([&] { machine.setCurrentState(std::make_unique<ProbeState>(0, ended).release()); });
   });
   EXPECT_EQ("the end failed", thrown);
   EXPECT_THAT(ended, ElementsAre("end of 1", "end of 0"));
@@ -220,7 +220,7 @@ TEST_F(StateMachineTest, EndOfAStateThatThrowsPassesAndFreesBoth) {
   EXPECT_EQ("Setting the current to plugged state" + Address(next) + "\n", Set(machine, next));
 }
 
-// The moves that states share.
+// Transitions that several states make.
 
 TEST_F(StateMachineTest, FallbackPreparesTheSharesRootAgain) {
   StateMachine& machine = StateMachine::Instance();
@@ -238,7 +238,7 @@ TEST_F(StateMachineTest, FallbackPreparesTheSharesRootAgain) {
   EXPECT_EQ(State::DEFAULT, machine.getCurrentState()->getStateType());
   EXPECT_THAT(MergedFolders("/shares"), IsEmpty());
   EXPECT_GE(std::stol(MergedRows("/shares", "SELECT mdate FROM Status").at(0)), before);
-  EXPECT_EQ(SHARES_LOCATOR, Locator());
+  EXPECT_EQ(SHARES_LOCATOR, Appliance::Locator());
   ASSERT_EQ(1U, VolumeInfoManager::Instance().getVolumes().size());
   EXPECT_EQ(SHARES_MASTER_TEXT, VolumeInfoManager::Instance().getVolumes()[0].ToString());
   EXPECT_THAT(Logged(), IsEmpty());
@@ -254,7 +254,7 @@ TEST_F(StateMachineTest, FailedFallbackKeepsTheState) {
   EXPECT_EQ(plugged, machine.getCurrentState());
 }
 
-TEST_F(StateMachineTest, MoveToScannedStateTellsTheMaster) {
+TEST_F(StateMachineTest, MoveToScannedStateLogsTheMaster) {
   StateMachine& machine = StateMachine::Instance();
   ASSERT_TRUE(VolumeInfoManager::Instance().reelectMasterVolume());
   EXPECT_EQ("Setting the current to scanned state",

@@ -28,18 +28,18 @@ protected:
     Registry().addVolumeInfo(volume);
   }
 
-  /// Forgets a volume, as a notification does before the state hears of it.
+  /// Removes a volume from the registry, as a notification does before the state gets the event.
   void Forget(const std::string& mountPoint) const {
     dbmerger::VolumeInfo volume{.mountPoint = mountPoint};
     Registry().removeVolumeInfo(volume);
   }
 
-  /// Leaves nothing in the registry that could be elected.
+  /// Removes the shares root, which could be elected, from the registry.
   void ForgetSharesRoot() const { Forget("/shares"); }
 
   using Handler = void (dbmerger::State::*)(dbmerger::VolumeInfo);
 
-  /// Hands an event to the current state. Returns its standard output.
+  /// Passes an event to the current state. Returns its standard output.
   std::string Handle(Handler handler, const std::string& mountPoint) const {
     return OutputOf([&] { (Current().*handler)(dbmerger::VolumeInfo{.mountPoint = mountPoint}); });
   }
@@ -67,11 +67,5 @@ protected:
 constexpr double LARGE = 150e9;
 constexpr double MIDDLE = 120e9;
 constexpr double SMALL = 1e9;
-
-/// The master's record as text, for a volume that Register made.
-inline std::string MasterText(const std::string& mountPoint, const std::string& capacity) {
-  return "\nMountPoint: " + mountPoint + "\nCapacity: " + capacity +
-         "M\nUsed: 0M\nPhotoDB size: 1\nReadOnly: 0\n";
-}
 
 } // namespace orva::test

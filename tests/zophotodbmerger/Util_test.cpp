@@ -2,6 +2,8 @@
 
 #include "Util.h"
 
+#include "orvautil/FileDescriptor.h"
+
 #include <fcntl.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -11,6 +13,7 @@
 #include <csignal>
 #include <fstream>
 #include <thread>
+#include <utility>
 
 namespace orva::test {
 namespace {
@@ -18,6 +21,7 @@ namespace {
 using dbmerger::updateLocatorFile;
 using dbmerger::writeLine;
 using ::testing::IsEmpty;
+using util::FileDescriptor;
 
 const std::string LOCATOR_PATH = "/tmp/zophotodbmerger.conf";
 
@@ -33,33 +37,33 @@ std::string Content(const std::string& path) {
 
 TEST_F(LocatorTest, NamesTheDatabaseOfTheMountPoint) {
   updateLocatorFile("/shares/Vol");
-  EXPECT_EQ("zophotos_db_path=/shares/Vol/.zophotos/zophotos.db\n", Locator());
+  EXPECT_EQ("zophotos_db_path=/shares/Vol/.zophotos/zophotos.db\n", Appliance::Locator());
 }
 
-TEST_F(LocatorTest, TakesTheMountPointAsItStands) {
+TEST_F(LocatorTest, UsesTheMountPointUnchanged) {
   updateLocatorFile("/shares/Vol/");
-  EXPECT_EQ("zophotos_db_path=/shares/Vol//.zophotos/zophotos.db\n", Locator());
+  EXPECT_EQ("zophotos_db_path=/shares/Vol//.zophotos/zophotos.db\n", Appliance::Locator());
 }
 
-TEST_F(LocatorTest, EmptyMountPointLeavesTheKeyAlone) {
+TEST_F(LocatorTest, EmptyMountPointLeavesOnlyTheKey) {
   updateLocatorFile("");
-  EXPECT_EQ("zophotos_db_path=\n", Locator());
+  EXPECT_EQ("zophotos_db_path=\n", Appliance::Locator());
 }
 
 TEST_F(LocatorTest, ShorterLineReplacesALongerOne) {
   updateLocatorFile("/shares/A rather long name of a volume/");
   updateLocatorFile("/shares/V/");
-  EXPECT_EQ("zophotos_db_path=/shares/V//.zophotos/zophotos.db\n", Locator());
+  EXPECT_EQ("zophotos_db_path=/shares/V//.zophotos/zophotos.db\n", Appliance::Locator());
 }
 
 TEST_F(LocatorTest, FileOfAnotherUserIsWritten) {
   std::ofstream(LOCATOR_PATH) << "theirs";
   ASSERT_EQ(0, chown(LOCATOR_PATH.c_str(), 1, 1));
   updateLocatorFile("/shares/Vol/");
-  EXPECT_EQ("zophotos_db_path=/shares/Vol//.zophotos/zophotos.db\n", Locator());
+  EXPECT_EQ("zophotos_db_path=/shares/Vol//.zophotos/zophotos.db\n", Appliance::Locator());
 }
 
-TEST_F(LocatorTest, LinkInItsPlaceIsLeftAlone) {
+TEST_F(LocatorTest, LinkInItsPlaceIsNotFollowed) {
   std::ofstream("/tmp/precious") << "keep";
   std::filesystem::create_symlink("/tmp/precious", LOCATOR_PATH);
   updateLocatorFile("/shares/Vol/");
@@ -67,55 +71,50 @@ TEST_F(LocatorTest, LinkInItsPlaceIsLeftAlone) {
   EXPECT_TRUE(std::filesystem::is_symlink(LOCATOR_PATH));
 }
 
-TEST_F(LocatorTest, LinkToNowhereInItsPlaceCreatesNothing) {
+TEST_F(LocatorTest, DanglingLinkInItsPlaceCreatesNothing) {
   std::filesystem::create_symlink("/tmp/nowhere", LOCATOR_PATH);
   updateLocatorFile("/shares/Vol/");
   EXPECT_FALSE(std::filesystem::exists("/tmp/nowhere"));
 }
 
-TEST_F(LocatorTest, DirectoryInItsPlaceIsPassedOver) {
+TEST_F(LocatorTest, DirectoryInItsPlaceIsIgnored) {
   MakeDirectory(LOCATOR_PATH);
   updateLocatorFile("/shares/Vol/");
   EXPECT_TRUE(std::filesystem::is_empty(LOCATOR_PATH));
 }
 
-TEST_F(LocatorTest, PipeThatNobodyReadsIsNotWaitedFor) {
+TEST_F(LocatorTest, PipeWithoutAReaderIsNotWaitedFor) {
   ASSERT_EQ(0, mkfifo(LOCATOR_PATH.c_str(), 0666));
   updateLocatorFile("/shares/Vol/");
   EXPECT_TRUE(std::filesystem::is_fifo(LOCATOR_PATH));
 }
 
-TEST_F(LocatorTest, PipeThatIsReadGetsNothing) {
+TEST_F(LocatorTest, PipeWithAReaderGetsNothing) {
   ASSERT_EQ(0, mkfifo(LOCATOR_PATH.c_str(), 0666));
-  const int reader = open(LOCATOR_PATH.c_str(), O_RDONLY | O_NONBLOCK);
-  ASSERT_NE(-1, reader);
+  const FileDescriptor reader(open(LOCATOR_PATH.c_str(), O_RDONLY | O_NONBLOCK));
+  ASSERT_TRUE(reader);
   updateLocatorFile("/shares/Vol/");
   std::array<char, 64> bytes{};
-  EXPECT_EQ(0, read(reader, bytes.data(), bytes.size())) << "no writer is left, nothing was said";
-  close(reader);
+  EXPECT_EQ(0, read(reader.Get(), bytes.data(), bytes.size())) << "nothing was written";
 }
 
 /// Standard output as something else for a scope.
 class Redirected {
 public:
-  /// Takes over `descriptor`; -1 closes standard output.
-  explicit Redirected(int descriptor) {
-    if (descriptor == -1) {
-      close(STDOUT_FILENO);
+  /// Standard output is closed where there is no `descriptor`.
+  explicit Redirected(FileDescriptor descriptor) {
+    if (descriptor) {
+      dup2(descriptor.Get(), STDOUT_FILENO);
     } else {
-      dup2(descriptor, STDOUT_FILENO);
-      close(descriptor);
+      close(STDOUT_FILENO);
     }
   }
   Redirected(const Redirected&) = delete;
   Redirected& operator=(const Redirected&) = delete;
-  ~Redirected() {
-    dup2(original_, STDOUT_FILENO);
-    close(original_);
-  }
+  ~Redirected() { dup2(original_.Get(), STDOUT_FILENO); }
 
 private:
-  int original_ = dup(STDOUT_FILENO);
+  FileDescriptor original_{dup(STDOUT_FILENO)};
 };
 
 struct Pipe {
@@ -124,23 +123,28 @@ struct Pipe {
     if (pipe(ends.data()) != 0) {
       throw std::system_error(errno, std::generic_category(), "pipe");
     }
-    reader = ends[0];
-    writer = ends[1];
+    reader.Reset(ends[0]);
+    writer.Reset(ends[1]);
   }
 
-  int reader;
-  int writer;
+  FileDescriptor reader;
+  FileDescriptor writer;
 };
 
-/// What can be read without waiting.
-std::string Drain(int reader) {
-  fcntl(reader, F_SETFL, O_NONBLOCK);
+/// Everything that can be read until the end.
+std::string ReadAll(const FileDescriptor& reader) {
   std::string text;
   std::array<char, 65536> bytes{};
-  for (ssize_t count = 0; (count = read(reader, bytes.data(), bytes.size())) > 0;) {
+  for (ssize_t count = 0; (count = read(reader.Get(), bytes.data(), bytes.size())) > 0;) {
     text.append(bytes.data(), static_cast<std::size_t>(count));
   }
   return text;
+}
+
+/// Everything that can be read without waiting.
+std::string Drain(const FileDescriptor& reader) {
+  fcntl(reader.Get(), F_SETFL, O_NONBLOCK);
+  return ReadAll(reader);
 }
 
 TEST(WriteLine, JoinsThePiecesIntoOneLine) {
@@ -153,67 +157,60 @@ TEST(WriteLine, JoinsThePiecesIntoOneLine) {
 TEST(WriteLine, ReachesTheReaderOfAPipe) {
   Pipe output;
   {
-    const Redirected redirected(output.writer);
+    const Redirected redirected(std::move(output.writer));
     writeLine({"one"});
     writeLine({"two"});
   }
   EXPECT_EQ("one\ntwo\n", Drain(output.reader));
-  close(output.reader);
 }
 
-TEST(WriteLine, LineLongerThanAPipeArrivesWhole) {
+TEST(WriteLine, LineLongerThanAPipeArrivesCompletely) {
   Pipe output;
   const std::string text(1 << 20, 'x');
   std::string received;
-  std::thread reader([&] {
-    std::array<char, 65536> bytes{};
-    for (ssize_t count = 0; (count = read(output.reader, bytes.data(), bytes.size())) > 0;) {
-      received.append(bytes.data(), static_cast<std::size_t>(count));
-    }
-  });
+  std::thread reader([&] { received = ReadAll(output.reader); });
   {
-    const Redirected redirected(output.writer);
+    const Redirected redirected(std::move(output.writer));
     writeLine({text});
   }
   reader.join();
   EXPECT_EQ(text.size() + 1, received.size());
   EXPECT_EQ(text + "\n", received);
-  close(output.reader);
 }
 
-TEST(WriteLine, PipeThatNobodyHoldsCostsOnlyTheLine) {
+TEST(WriteLine, PipeWithoutAReaderLosesOnlyTheLine) {
   std::signal(SIGPIPE, SIG_IGN); // as the daemon does when it starts
   Pipe output;
-  close(output.reader);
+  output.reader.Reset();
   {
-    const Redirected redirected(output.writer);
+    const Redirected redirected(std::move(output.writer));
     writeLine({"lost"});
   }
   EXPECT_EQ("kept\n", OutputOf([] { writeLine({"kept"}); }));
 }
 
-TEST(WriteLine, ClosedOutputCostsOnlyTheLine) {
+TEST(WriteLine, ClosedOutputLosesOnlyTheLine) {
   {
-    const Redirected redirected(-1);
+    const Redirected redirected{FileDescriptor()};
     writeLine({"lost"});
   }
   EXPECT_EQ("kept\n", OutputOf([] { writeLine({"kept"}); }));
 }
 
-TEST(WriteLine, FullPipeCostsLinesUntilItIsReadAgain) {
+TEST(WriteLine, FullPipeLosesLinesUntilItIsRead) {
   Pipe output;
   std::size_t filling = 0;
-  fcntl(output.writer, F_SETFL, O_NONBLOCK);
+  fcntl(output.writer.Get(), F_SETFL, O_NONBLOCK);
   const std::string filler(PIPE_BUF, '.');
-  for (ssize_t count = 0; (count = write(output.writer, filler.data(), filler.size())) > 0;) {
+  for (ssize_t count = 0; (count = write(output.writer.Get(), filler.data(), filler.size())) > 0;) {
     filling += static_cast<std::size_t>(count);
   }
-  fcntl(output.writer, F_SETFL, 0);
+  fcntl(output.writer.Get(), F_SETFL, 0);
 
   std::string lost;
   std::string read;
   {
-    const Redirected redirected(output.writer);
+    const Redirected redirected(std::move(output.writer));
     for (int i = 0; i < 100; ++i) {
       writeLine({"lost"});
     }
@@ -223,7 +220,6 @@ TEST(WriteLine, FullPipeCostsLinesUntilItIsReadAgain) {
   }
   EXPECT_EQ(std::string(filling, '.'), lost);
   EXPECT_EQ("after\n", read);
-  close(output.reader);
 }
 
 } // namespace

@@ -19,7 +19,7 @@ LogLine NotACandidate(const std::string& mountPoint) {
   return Error(mountPoint + "  ---------  is not a candidate \n");
 }
 
-/// A registry of directories, each of which is there.
+/// A registry of existing directories.
 class VolumeInfoManagerTest : public DaemonLayerTest {
 protected:
   void Add(VolumeInfo volume) {
@@ -45,7 +45,7 @@ protected:
   VolumeInfoManager registry;
 };
 
-TEST_F(VolumeInfoManagerTest, InstanceIsMadeOnFirstUseAndStays) {
+TEST_F(VolumeInfoManagerTest, InstanceIsCreatedOnceOnFirstUse) {
   EXPECT_EQ(nullptr, VolumeInfoManager::instance);
   VolumeInfoManager* const made = &VolumeInfoManager::Instance();
   EXPECT_EQ(made, VolumeInfoManager::instance);
@@ -54,7 +54,7 @@ TEST_F(VolumeInfoManagerTest, InstanceIsMadeOnFirstUseAndStays) {
   EXPECT_EQ("DUMMY_MOUNT_POINT", made->getMasterVolume().mountPoint);
 }
 
-TEST_F(VolumeInfoManagerTest, MoreVolumesThanAnybodyHasAreRefused) {
+TEST_F(VolumeInfoManagerTest, TooManyVolumesAreRefused) {
   std::string mountPoint = "/shares/";
   for (int i = 0; i < 1000; ++i) {
     Add(Record(mountPoint, GIB, GIB));
@@ -65,7 +65,7 @@ TEST_F(VolumeInfoManagerTest, MoreVolumesThanAnybodyHasAreRefused) {
   EXPECT_EQ(1000U, registry.getVolumes().size());
   EXPECT_THAT(Logged(), ElementsAre(Error("There are too many volumes to register the mountpoint " +
                                           mountPoint)));
-  // One that is registered is no further one, and one that goes makes room.
+  // A registered volume does not count again, and a removed one makes room.
   Add(Record("/shares/", GIB, GIB));
   EXPECT_THAT(Logged(), IsEmpty());
   Remove("/shares/");
@@ -73,7 +73,7 @@ TEST_F(VolumeInfoManagerTest, MoreVolumesThanAnybodyHasAreRefused) {
   EXPECT_EQ(mountPoint, MountPoints().back());
 }
 
-TEST_F(VolumeInfoManagerTest, LongerMountPointsThanAnybodyHasAreRefused) {
+TEST_F(VolumeInfoManagerTest, TooLongMountPointsAreRefused) {
   const auto mountPoint = [](std::size_t size) { return "/shares" + std::string(size - 7, '/'); };
   std::size_t left = 1U << 20U;
   for (std::size_t size = PATH_MAX - 1; size <= left; --size) {
@@ -97,7 +97,7 @@ TEST_F(VolumeInfoManagerTest, VolumesAreKeptInTheOrderOfTheirAdding) {
   EXPECT_THAT(Logged(), IsEmpty());
 }
 
-TEST_F(VolumeInfoManagerTest, VolumeThatIsNotThereIsRefused) {
+TEST_F(VolumeInfoManagerTest, VolumeWithoutADirectoryIsRefused) {
   VolumeInfo volume = Record("/shares/gone/", GIB, GIB);
   registry.addVolumeInfo(volume);
   EXPECT_THAT(registry.getVolumes(), IsEmpty());
@@ -135,7 +135,7 @@ TEST_F(VolumeInfoManagerTest, RemovalOfAnUnknownVolumeChangesNothing) {
   EXPECT_EQ("/shares/a/", Master());
 }
 
-TEST_F(VolumeInfoManagerTest, ElectionAmongNoneIsSilent) {
+TEST_F(VolumeInfoManagerTest, ElectionWithoutVolumesIsSilent) {
   EXPECT_FALSE(registry.reelectMasterVolume());
   EXPECT_EQ("DUMMY_MOUNT_POINT", Master());
   EXPECT_THAT(Logged(), IsEmpty());
@@ -185,7 +185,7 @@ TEST_F(VolumeInfoManagerTest, UnmeasuredVolumeIsNeverElected) {
   EXPECT_THAT(Logged(), ElementsAre(NotACandidate("/shares/a/")));
 }
 
-TEST_F(VolumeInfoManagerTest, EachLargerVolumeThatIsPassedOverIsLogged) {
+TEST_F(VolumeInfoManagerTest, EachLargerVolumeThatIsNotElectedIsLogged) {
   Add(Record("/shares/chosen/", 2 * GIB, GIB));
   Add(Record("/shares/full/", 3 * GIB, 0));
   Add(Record("/shares/smaller/", GIB, 0));
@@ -205,7 +205,7 @@ TEST_F(VolumeInfoManagerTest, MasterStaysWhenALargerVolumeAppears) {
   EXPECT_THAT(MountPoints(), ElementsAre("/shares/first/", "/shares/larger/"));
 }
 
-TEST_F(VolumeInfoManagerTest, RemovedMasterLeavesTheNextElectionToTheOthers) {
+TEST_F(VolumeInfoManagerTest, RemovedMasterIsReplacedInTheNextElection) {
   Add(Record("/shares/large/", 4 * GIB, GIB));
   Add(Record("/shares/small/", 2 * GIB, GIB));
   ASSERT_TRUE(registry.reelectMasterVolume());

@@ -28,13 +28,13 @@ TEST(VolumeInfo, LargeByteCountsAreTextInExponentForm) {
             volume.ToString());
 }
 
-TEST(VolumeInfo, SixDigitsOfAByteCountStandAsTheyAre) {
+TEST(VolumeInfo, ByteCountsOfSixDigitsAreNotInExponentForm) {
   const VolumeInfo volume{.mountPoint = "", .capacity = 999999.0, .used = 0.5};
   EXPECT_EQ("\nMountPoint: \nCapacity: 999999M\nUsed: 0.5M\nPhotoDB size: 0\nReadOnly: 0\n",
             volume.ToString());
 }
 
-TEST(VolumeInfo, IsStampedWhenItIsMade) {
+TEST(VolumeInfo, HasTheTimeOfItsCreation) {
   const std::time_t before = std::time(nullptr);
   const VolumeInfo volume;
   EXPECT_GE(volume.timestamp, before);

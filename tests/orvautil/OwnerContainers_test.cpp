@@ -1,5 +1,6 @@
 #include "Element.h"
 
+#include "orvautil/OwnerList.h"
 #include "orvautil/OwnerVector.h"
 
 #include <gmock/gmock.h>
@@ -22,18 +23,27 @@ using test::Throwing;
 using testing::ElementsAre;
 using testing::IsEmpty;
 
-static_assert(!std::is_copy_constructible_v<OwnerVector<Element>>);
-static_assert(!std::is_copy_assignable_v<OwnerVector<Element>>);
+/// What both containers of owned pointers do.
+template <typename Container>
+class OwnerContainerTest : public testing::Test {
+  static_assert(!std::is_copy_constructible_v<Container>);
+  static_assert(!std::is_copy_assignable_v<Container>);
+};
 
-/// Takes the elements out of an owner that stays with the caller.
-OwnerVector<Element> TakeFrom(OwnerVector<Element>& source) {
-  return {std::move(source)};
-}
+struct ContainerName {
+  template <typename Container>
+  static std::string GetName(int /*index*/) {
+    return std::is_same_v<Container, OwnerList<Element>> ? "OwnerList" : "OwnerVector";
+  }
+};
 
-TEST(OwnerVector, DeletesItsElementsFirstToLastThroughTheirBase) {
+using Containers = testing::Types<OwnerList<Element>, OwnerVector<Element>>;
+TYPED_TEST_SUITE(OwnerContainerTest, Containers, ContainerName);
+
+TYPED_TEST(OwnerContainerTest, DeletesItsElementsFirstToLastThroughTheirBase) {
   std::vector<std::string> deleted;
   {
-    OwnerVector<Element> owner;
+    TypeParam owner;
     owner.push_back(std::make_unique<Named>(deleted, "first"));
     owner.push_back(std::make_unique<Named>(deleted, "second"));
     owner.push_back(std::make_unique<Named>(deleted, "third"));
@@ -43,10 +53,10 @@ TEST(OwnerVector, DeletesItsElementsFirstToLastThroughTheirBase) {
   EXPECT_THAT(deleted, ElementsAre("first", "second", "third"));
 }
 
-TEST(OwnerVector, NullElementsArePassedOver) {
+TYPED_TEST(OwnerContainerTest, NullElementsAreAllowed) {
   std::vector<std::string> deleted;
   {
-    OwnerVector<Element> owner;
+    TypeParam owner;
     owner.push_back(nullptr);
     owner.push_back(std::make_unique<Named>(deleted, "only"));
     owner.push_back(nullptr);
@@ -56,10 +66,10 @@ TEST(OwnerVector, NullElementsArePassedOver) {
   EXPECT_THAT(deleted, ElementsAre("only"));
 }
 
-TEST(OwnerVector, AThrowingElementDoesNotKeepTheOthersAndTheFirstExceptionContinues) {
+TYPED_TEST(OwnerContainerTest, AThrowingElementDoesNotKeepTheOthersAndTheFirstExceptionIsThrown) {
   std::vector<std::string> deleted;
   const auto useOwner = [&deleted] {
-    OwnerVector<Element> owner;
+    TypeParam owner;
     owner.push_back(std::make_unique<Named>(deleted, "a"));
     owner.push_back(std::make_unique<Throwing>(deleted, "b"));
     owner.push_back(std::make_unique<Throwing>(deleted, "c"));
@@ -74,13 +84,18 @@ TEST(OwnerVector, AThrowingElementDoesNotKeepTheOthersAndTheFirstExceptionContin
   EXPECT_THAT(deleted, ElementsAre("a", "b", "c", "d"));
 }
 
-TEST(OwnerVector, AnEmptyOneIsHarmless) {
-  const OwnerVector<Element> owner;
+TYPED_TEST(OwnerContainerTest, MayBeEmpty) {
+  const TypeParam owner;
   EXPECT_TRUE(owner.empty());
   EXPECT_EQ(owner.begin(), owner.end());
 }
 
-TEST(OwnerVector, MovingHandsTheElementsOver) {
+/// Takes the elements out of an owner that stays with the caller.
+OwnerVector<Element> TakeFrom(OwnerVector<Element>& source) {
+  return {std::move(source)};
+}
+
+TEST(OwnerVector, MovingTransfersTheElements) {
   std::vector<std::string> deleted;
   OwnerVector<Element> source;
   source.push_back(std::make_unique<Named>(deleted, "only"));
