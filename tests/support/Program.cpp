@@ -95,6 +95,8 @@ Program::Program(Arguments arguments, const Options& options) {
   if (!options.directory.empty()) {
     posix_spawn_file_actions_addchdir_np(&actions, options.directory.c_str());
   }
+  // Descriptors that the test has inherited from its own caller.
+  posix_spawn_file_actions_addclosefrom_np(&actions, STDERR_FILENO + 1);
   const int code = posix_spawnp(&pid_, arguments.front().c_str(), &actions, nullptr,
                                 Pointers(arguments).data(), Pointers(environment).data());
   posix_spawn_file_actions_destroy(&actions);
