@@ -23,7 +23,7 @@ inline const std::string COPY = "/tmp/copy/zophotos.db";
 /// The command line of zophotos, for Program.
 Arguments ZophotosCommand(Arguments arguments);
 
-/// Runs zophotos. `output` as in Program::Streams.
+/// Runs zophotos. `output` as in Program::Options.
 Outcome Zophotos(Arguments arguments, const std::string& output = "");
 
 /// The arguments to run a command on the copy.
