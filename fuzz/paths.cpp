@@ -42,7 +42,7 @@ std::string PercentEncode(const std::string& text) {
 void Decode(const std::string& text) {
   const std::string decoded = util::Decodestring(text);
   Require(decoded.size() <= text.size() && (text.size() - decoded.size()) % 2 == 0,
-          "decoding replaces three characters by one");
+          "decoding replaces three characters with one");
   Require(std::ranges::count(decoded, '\0') == std::ranges::count(text, '\0'),
           "decoding makes no NUL");
   Require(text.find('%') != std::string::npos || decoded == text,

@@ -12,7 +12,7 @@ struct Options {
   std::vector<long long> sizes{10'000, 100'000, 1'000'000}; ///< files of a catalog, ascending
   std::vector<std::string> shapes{"unique", "camera", "flat", "deep", "restamped", "folders"};
   int pairs = 5;
-  std::chrono::seconds limit{120};  ///< a merge that takes longer is given up
+  std::chrono::seconds limit{120};  ///< a merge is given up after this time
   std::chrono::seconds budget{120}; ///< after this time a measurement makes no further pairs
   std::string output = "build/bench";
 };

@@ -3,8 +3,8 @@
 #include <ctime>
 #include <string>
 
-// What the daemon is compared with: programs that do the same work and nothing else. All times are
-// in seconds, without the time to start the process, which is measured just before. Failures are
+// What the daemon is compared with: programs that do only the same work. All times are in
+// seconds, without the time to start the process, which is measured just before. Failures are
 // thrown as std::exception.
 namespace orva::bench {
 

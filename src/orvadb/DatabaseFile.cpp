@@ -32,8 +32,8 @@ struct FileSize {
   long long blocks = 0; ///< of 512 bytes, that are allocated
 };
 
-/// The size of the regular file at `path`. One that is `written` must have no second name, under
-/// which it may be somebody else's file.
+/// The size of the regular file at `path`. A file to be `written` must not have a hard link: the
+/// other name may belong to another owner.
 FileSize RegularFileSize(const std::string& path, bool written) {
   struct stat status {};
   if (lstat(path.c_str(), &status) != 0) {
@@ -65,7 +65,7 @@ void Synchronise(const std::string& path, int flags, bool mayBeUnsupported) {
   }
 }
 
-/// Removes the file at `path`, if it exists. Returns whether none is left.
+/// Removes the file at `path`, if it exists. Returns true if nothing remains.
 bool Remove(const std::string& path) {
   return unlink(path.c_str()) == 0 || errno == ENOENT;
 }

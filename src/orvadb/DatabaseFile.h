@@ -10,7 +10,7 @@ namespace orva::db {
 /// Makes sure that SQLite may open the database at `path`, which need not exist, to read or also to
 /// write it: none of its files is anything other than a regular one, which might block, and none
 /// that SQLite writes has a second name. Returns the bytes of the database and its write-ahead log;
-/// holes count for little.
+/// holes count little.
 long long CheckDatabaseFiles(const std::string& path, bool written);
 
 /// Makes sure that undoing an interrupted transaction of the database at `path` touches no other
@@ -18,7 +18,7 @@ long long CheckDatabaseFiles(const std::string& path, bool written);
 void CheckJournal(const std::string& path);
 
 /// Removes a database with all its files, as far as they exist. Links are not followed. Returns
-/// whether none is left.
+/// true if nothing remains.
 bool RemoveDatabase(const std::string& path);
 
 /// Gives the closed database at `from` the name `to`, in the same directory, where there is none.

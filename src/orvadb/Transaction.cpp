@@ -7,7 +7,7 @@ namespace orva::db {
 
 Transaction::Transaction(const DB& db, unsigned int busyTimeout, const char* file,
                          unsigned int line)
-    : connection_(db.OpenConnection("BEGIN", file, line)) {
+    : connection_(db.OpenConnection("BEGIN IMMEDIATE", file, line)) {
   connection_.BeginTransaction(busyTimeout, file, line);
 }
 

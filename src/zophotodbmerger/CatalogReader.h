@@ -13,7 +13,7 @@ class VolumeDB;
 
 namespace orva::dbmerger {
 
-/// Photos of a catalog that are there and visible.
+/// Photos of a catalog that are visible and not deleted.
 struct PhotoCounts {
   int transcoded = 0; ///< with a finished rendition
   int total = 0;

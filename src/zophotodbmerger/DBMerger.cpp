@@ -68,7 +68,7 @@ void ApplyFolders(const PhotoDB& photos, const std::string& volume,
   }
 }
 
-/// Returns the time of the newest file applied, or `since` when none is newer.
+/// Returns the time of the newest file applied, or `since` if no file is newer.
 std::time_t ApplyFiles(const PhotoDB& photos, const std::string& volume,
                        const util::OwnerVector<db::File>& files, std::time_t since,
                        const std::atomic<bool>& stopRequested) {

@@ -5,7 +5,7 @@
 namespace orva::dbmerger {
 
 /// A master volume has been elected, but no merged database has been opened on it yet: that waits
-/// for a scan or a batch of pictures.
+/// for a scan or a batch of photos.
 class MasterVolumePluggedState : public State {
 public:
   void handleVolumePlugged(VolumeInfo volume) override;

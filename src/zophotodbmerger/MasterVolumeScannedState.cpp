@@ -47,7 +47,7 @@ void MasterVolumeScannedState::handleVolumeUnplugged(VolumeInfo volume) {
   StateMachine::Instance().fallBackToDefaultState();
 }
 
-// A scan changes nothing: the volume is merged when its pictures are transcoded.
+// A scan changes nothing: the volume is merged when its photos are transcoded.
 void MasterVolumeScannedState::handleVolumeScanned(VolumeInfo /*volume*/) {}
 
 void MasterVolumeScannedState::handlePictureTranscoded(VolumeInfo volume) {

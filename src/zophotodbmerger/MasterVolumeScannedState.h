@@ -6,7 +6,7 @@
 namespace orva::dbmerger {
 
 /// The working state: there is a master volume with a merged database, which the locator file
-/// names, and events become merges into it.
+/// names, and catalogs are merged into it.
 class MasterVolumeScannedState : public State {
 public:
   /// Creates or opens the merged database on the master and points the locator file at it.

@@ -35,7 +35,7 @@ public:
 
 using Handler = void (State::*)(VolumeInfo);
 
-/// Fills in the size of a plugged volume. When the file system does not tell, the record keeps the
+/// Fills in the size of a plugged volume. If the size cannot be determined, the record keeps the
 /// default size, which no election accepts.
 void MeasureVolume(VolumeInfo& volume) {
   struct statvfs status {};

@@ -58,10 +58,10 @@ public:
   void CreateTables();
   void CreateIndices();
 
-  /// Replaces the database file by an empty one without a schema, and opens that.
+  /// Replaces the database file with an empty one without a schema, and opens that.
   void Clear();
 
-  /// Kept for the programs that expect it; does nothing.
+  /// Kept for compatibility of the interface; does nothing.
   void DumpTable(const std::string& table) const;
 
   // Folders and files.
@@ -72,7 +72,7 @@ public:
   std::unique_ptr<Folder> GetFolder(const std::string& name, const std::string& volume) const;
 
   /// Adds a catalog's folder below its parent, unless its path is there already, under any
-  /// volume. Without its parent it is silently left out: parents come first.
+  /// volume. If the parent is missing, the folder is silently skipped, so add parents first.
   void AddFolder(std::string volume, db::Folder& folder) const;
 
   /// Removes every folder but the root, every file and all statistics, and compacts the file.
@@ -85,14 +85,14 @@ public:
   /// The file with this id, or null.
   std::unique_ptr<File> GetFile(long long fileId) const;
 
-  /// Adds a catalog's file to its folder, unless it is there already. Without the folder, on the
-  /// same volume, it is silently left out.
+  /// Adds a catalog's file to its folder, unless it is there already. If its folder is missing on
+  /// this volume, the file is silently skipped.
   void AddFile(const std::string& volume, db::File& file) const;
 
   /// Removes one folder and its own files, but not its subfolders.
   void DeleteFolder(const std::string& volume, db::Folder& folder) const;
 
-  /// Removes one file. Its path decides; the volume does not take part.
+  /// Removes one file, found by its folder's path and its name; `volume` is ignored.
   void DeleteFile(const std::string& volume, db::File& file) const;
 
   /// Appends the files of a folder to `files`; the caller owns them.
@@ -168,7 +168,8 @@ private:
   std::string dbLocation; ///< the directory of the database file
 
 public:
-  /// The status row in memory. Set `mdate` before UpdateStatus when the content has changed.
+  /// The status row in memory; UpdateStatus writes it. DeleteVolumes does not set `mdate`: its
+  /// caller does.
   Status status;
 
 private:

@@ -17,7 +17,7 @@ public:
   virtual void handleVolumePlugged(VolumeInfo volume) = 0;
   virtual void handleVolumeUnplugged(VolumeInfo volume) = 0;
   virtual void handleVolumeScanned(VolumeInfo volume) = 0;
-  /// A batch of the volume's pictures was transcoded, or the transcoding has ended.
+  /// A batch of the volume's photos was transcoded, or the transcoding has ended.
   virtual void handlePictureTranscoded(VolumeInfo volume) = 0;
   virtual void handleVolumePurged(VolumeInfo volume) = 0;
 

@@ -10,7 +10,9 @@ namespace orva::dbmerger {
 struct Status {
   std::int64_t id = -1;
   std::string mc_version = "1.0"; ///< version of the schema
-  std::time_t mdate = 0;          ///< last change of the content, seconds since the epoch
+  /// 1000 in a new database, otherwise when the database at the shares root was last emptied;
+  /// seconds since the epoch.
+  std::time_t mdate = 0;
   int etype = 0;
   std::string desc;
 };

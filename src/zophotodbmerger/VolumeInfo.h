@@ -13,7 +13,7 @@ struct VolumeInfo {
   double used = 1.0;                            ///< used bytes
   std::int64_t photoDbSize = 0;                 ///< size of the volume's photo database
   std::time_t timestamp = std::time(nullptr);   ///< when the record was made
-  bool readOnly = false;                        ///< mounted read only
+  bool readOnly = false; ///< set by no notification: read-only volumes can be elected
 
   /// The record as text for the log, over several lines.
   std::string ToString() const;

@@ -17,16 +17,16 @@ public:
   static VolumeInfoManager& Instance();
 
   /// Registers a copy of `volume` when something exists at its mount point. An existing record
-  /// stays as it is, so that the first event that names a volume fixes its capacity. More than 1000
-  /// volumes, or than a mebibyte of mount points, are refused with a line in the log.
+  /// stays as it is, so that the first event that names a volume fixes its capacity. Beyond 1,000
+  /// volumes or 1 MiB of mount points, a volume is refused with a log line.
   void addVolumeInfo(VolumeInfo& volume);
 
   /// Removes `volume`, also as the master.
   void removeVolumeInfo(VolumeInfo& volume);
 
-  /// Keeps an existing master; otherwise elects the largest writable volume with more than 200 MiB
-  /// free and sorts the registry by capacity, larger ones first. Returns whether there is a master
-  /// now.
+  /// Keeps an existing master; otherwise elects the largest volume with more than 200 MiB free that
+  /// is not marked read-only (notifications never mark one). For that it sorts the registry by
+  /// capacity, larger ones first. Returns whether there is a master now.
   bool reelectMasterVolume();
 
   const std::vector<VolumeInfo>& getVolumes() const noexcept { return volumes; }

@@ -137,7 +137,7 @@ private:
 void FilterSystemCalls() {
   ExpectValue("NoNewPrivileges", "yes");
   ExpectValue("SystemCallArchitectures", "native");
-  // As systemd does: what looks at arguments returns an error, a call that is not allowed kills.
+  // As systemd does: a rule on arguments returns an error; a forbidden call kills the process.
   Filter restrictions(SCMP_ACT_ALLOW);
   ExpectValue("RestrictAddressFamilies", "AF_UNIX");
   restrictions.Add(SCMP_ACT_ERRNO(EAFNOSUPPORT), "socket", {{0, SCMP_CMP_NE, AF_UNIX, 0}});
@@ -151,7 +151,7 @@ void FilterSystemCalls() {
   for (const std::string& call : AllowedCalls()) {
     list.Add(SCMP_ACT_ALLOW, call);
   }
-  // The list last: it forbids to load another filter.
+  // Loaded last, because it forbids loading another filter.
   restrictions.Load();
   list.Load();
 }

@@ -224,7 +224,7 @@ void Disk::Rename(const std::string& folder) {
   }
 }
 
-/// A name that is new on this disk, in no order.
+/// A name that this disk does not use yet. The names are in no order.
 std::string Disk::NewName() {
   static const std::vector<std::string> STEMS{"a", "Summer ", "it's 50%", "\xc3\xa9t\xc3\xa9 ",
                                               "Z", "-",       "%s%n"};

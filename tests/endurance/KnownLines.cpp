@@ -56,7 +56,7 @@ KnownLines::KnownLines(const std::string& page) {
       if (!std::regex_match(line, cells, ROW)) {
         throw std::runtime_error("not a row of a format and its level: " + line);
       }
-      // The page: the first two lines have the default facility.
+      // As the page says: the first two lines have the default facility.
       const int facility = formats_.size() < 2 ? LOG_USER : LOG_LOCAL1;
       const int level = cells[2] == "error" ? LOG_ERR : LOG_INFO;
       formats_.push_back(

@@ -17,8 +17,8 @@ namespace orva::test {
 /// The disks of a run, by mount point.
 using Disks = std::map<std::string, std::unique_ptr<Disk>>;
 
-/// The merged databases by location: a disk's keeper, the shares root, or the daemon's working
-/// directory for a location that does not exist.
+/// The merged databases by location: a disk's own directory (`Disk::Keeper`), the shares root, or
+/// the daemon's working directory for a location that does not exist.
 using Contents = std::map<std::string, Content>;
 
 /// The result of a notification, as the log shows it.
@@ -59,7 +59,7 @@ public:
   /// The content of the locator file.
   const std::string& Locator() const { return locator_; }
 
-  /// Whether the shares root would become the master, and stay it, without this volume.
+  /// Whether the shares root would become the master, and remain the master, without this volume.
   bool KeepsTheSharesRootOut(const std::string& mountPoint) const;
 
 private:

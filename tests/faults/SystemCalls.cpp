@@ -1,4 +1,4 @@
-// The daemon's own requests to the file system, without SQLite. The linker replaces its calls by
+// The daemon's own requests to the file system, without SQLite. The linker replaces its calls with
 // these functions (--wrap); those of SQLite's library stay as they are.
 
 #include "FaultVfs.h"

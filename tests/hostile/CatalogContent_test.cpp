@@ -34,7 +34,7 @@ std::string Replaced(std::string text, const std::string& old, const std::string
   return text.replace(text.find(old), old.size(), by);
 }
 
-/// Replaces the Folders table by an empty one with other columns.
+/// Replaces the Folders table with an empty one with other columns.
 std::vector<std::string> FoldersOf(const std::string& columns, std::vector<std::string> more = {}) {
   std::vector<std::string> statements{"DROP TABLE Folders",
                                       "CREATE TABLE Folders(" + columns + ")"};

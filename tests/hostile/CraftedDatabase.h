@@ -46,7 +46,7 @@ public:
   /// The number of cells on a b-tree page.
   std::uint32_t Cells(std::uint32_t page) const;
 
-  /// Replaces the cells of a leaf by as many pointers to its cell `index` as fit.
+  /// Replaces the cells of a leaf with as many pointers to its cell `index` as fit.
   void RepeatCell(std::uint32_t page, std::uint32_t index);
 
   /// Puts `levels` levels of interior pages above the content of the root page. All cells of a

@@ -51,7 +51,8 @@ std::vector<std::string> TriggersOnAll(const std::string& action,
   return first;
 }
 
-/// Replaces the Files table by an empty one with `column` instead of its created_date, and `more`.
+/// Replaces the Files table with an empty one that has `column` instead of created_date, and
+/// `more`.
 std::vector<std::string> FilesWith(const std::string& column, const std::string& more = "") {
   return {"DROP TABLE Files",
           "CREATE TABLE Files(file_id INTEGER PRIMARY KEY AUTOINCREMENT, folder_id INTEGER NOT "

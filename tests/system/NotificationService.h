@@ -7,7 +7,7 @@
 namespace orva::test {
 
 /// The appliance's notification service: listens on the notification socket and serves one client
-/// at a time. Operations that need a client accept the next one when none is connected, and fail
+/// at a time. Operations that need a client accept the next one if no client is connected, and fail
 /// when it stops reading. Failures are thrown as std::runtime_error or std::system_error.
 class NotificationService {
 public:

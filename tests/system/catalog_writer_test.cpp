@@ -51,7 +51,7 @@ struct Generation {
   }
 };
 
-/// The indexer of B. Replaces a generation by the next one in one transaction.
+/// The indexer of B. Replaces a generation with the next one in one transaction.
 class Indexer {
 public:
   Indexer(const Volume& volume, const std::string& journal) : catalog_(volume) {

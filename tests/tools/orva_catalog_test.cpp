@@ -102,7 +102,8 @@ protected:
   Lines Query(const char* sql, int columns = 1) const { return Select(*Open(), sql, columns); }
   long long Number(const char* sql) const { return SelectNumber(*Open(), sql); }
 
-  /// What a merge reads that has read everything up to `since`: "path|isDeleted|stamp".
+  /// What the next merge reads after one that read everything up to `since`:
+  /// "path|isDeleted|stamp".
   Lines ChangedSince(std::time_t since) const {
     const auto database = Open();
     db::Statement statement(
@@ -541,8 +542,8 @@ TEST_F(OrvaCatalog, UnreadableFoldersAreNotMarkedDeleted) {
 
   const Outcome outcome = RunProgram("index " + volume_.native());
   EXPECT_EQ(outcome.status, 0);
-  EXPECT_TRUE(
-      outcome.output.starts_with("orva-catalog: left as it was: " + volume_.native() + "/ddd"))
+  EXPECT_TRUE(outcome.output.starts_with(
+      "orva-catalog: not updated, cannot be read: " + volume_.native() + "/ddd"))
       << outcome.output;
 }
 
@@ -682,7 +683,7 @@ TEST(OrvaCatalogOptions, AreDecimalAndTheLastOneCounts) {
 
 TEST(OrvaCatalogOptions, WrongUsageIsRefused) {
   const std::vector<std::pair<Lines, std::string>> wrong = {
-      {{}, "A subcommand is required"},
+      {{}, "a command is required"},
       {{"scan", "/v"}, "unexpected argument 'scan'"},
       {{"index"}, "MOUNT is required"},
       {{"index", ""}, "MOUNT: must not be empty"},
@@ -691,6 +692,8 @@ TEST(OrvaCatalogOptions, WrongUsageIsRefused) {
       {{"index", "/v", "/w"}, "unexpected argument '/w'"},
       {{"generate", "/v"}, "--files is required"},
       {{"generate", "/v", "--files"}, "--files: 1 required NUMBER missing"},
+      {{"generate", "/v", "--names"}, "--names: 1 required unique|camera missing"},
+      {{"generate", "/v", "--tree"}, "--tree: 1 required flat|deep missing"},
       {{"generate", "/v", "--files=", "1", "--restamp"}, "--files= has no value"},
       {{"generate", "/v", "--files", "1", "--per-folder", "1", "--names", "camera"},
        "--tree is required"},

@@ -243,7 +243,7 @@ TEST(CommandLine, TakesDecimalNumbersAndTheLastOneCounts) {
 
 TEST(CommandLine, SaysWhatIsWrong) {
   const std::vector<std::pair<Arguments, std::string>> wrong = {
-      {{}, "A subcommand is required"},
+      {{}, "a command is required"},
       {{"listen"}, "unexpected argument 'listen'"},
       {{"send"}, "send: takes an event and a mount point, or --raw FILE"},
       {{"send", "plugged"}, "send: takes an event and a mount point, or --raw FILE"},

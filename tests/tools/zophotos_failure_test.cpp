@@ -124,7 +124,7 @@ TEST_F(ZophotosLocator, IsNotReadToTheEndIfHuge) {
 
 TEST(ZophotosUsage, ErrorsHaveAStatusOfTheirOwn) {
   const std::vector<std::pair<Arguments, std::string>> wrong{
-      {{}, "A subcommand is required"},
+      {{}, "a command is required"},
       {{"destroy"}, "destroy"},
       {{"ls", "--nonsense"}, "--nonsense"},
       {{"ls", "A", "B"}, "B"},

@@ -56,7 +56,7 @@ inline bool Parse(CLI::App& app, std::vector<std::string> arguments) {
     std::ranges::reverse(arguments); // as CLI11 takes them
     app.parse(std::move(arguments));
     if (app.get_require_subcommand_max() == 1 && app.get_subcommands().empty()) {
-      throw CLI::RequiredError::Subcommand(1);
+      throw UsageError("a command is required");
     }
   } catch (const CLI::Success& request) {
     app.exit(request);

@@ -31,8 +31,8 @@ struct GeneratorPlan {
   Tree tree = Tree::Flat;
 };
 
-/// Replaces the content of `catalog` by what `plan` says. The same plan gives the same rows, with a
-/// later stamp. Returns the number of folders.
+/// Replaces the content of `catalog` with what `plan` says. The same plan gives the same rows, with
+/// a later stamp. Returns the number of folders.
 long long Generate(const db::DB& catalog, const GeneratorPlan& plan, std::time_t now);
 
 /// Gives every transcoding a new stamp, as if all had been rendered again. Returns their number.

@@ -48,8 +48,8 @@ private:
   }
 
   void AddGenerate() {
-    generate_ = app_.add_subcommand("generate",
-                                    "Replace the catalog's content by photos that need not exist");
+    generate_ =
+        app_.add_subcommand("generate", "Replace the catalog's content with made-up photos");
     AddMountPoint(*generate_);
     const std::vector<CLI::Option*> plan{
         generate_->add_option("--files", options_.plan.files, "Number of photos")
@@ -62,14 +62,14 @@ private:
             ->add_option("--names", names_,
                          "unique: every photo has its own name;\n"
                          "camera: every folder has the same names, IMG_0001.JPG and so on")
-            ->option_text("unique|camera")
-            ->check(CLI::IsMember({"unique", "camera"})),
+            ->type_name("unique|camera")
+            ->check(CLI::IsMember({"unique", "camera"}).description("")),
         generate_
             ->add_option("--tree", tree_,
                          "flat: all folders are directly in the volume;\n"
                          "deep: every folder contains eight more")
-            ->option_text("flat|deep")
-            ->check(CLI::IsMember({"flat", "deep"}))};
+            ->type_name("flat|deep")
+            ->check(CLI::IsMember({"flat", "deep"}).description(""))};
     generate_->add_flag("--restamp", restamp_,
                         "Keep the content; give every transcoding a new stamp");
     generate_->footer("Without --restamp, all other options are required.");

@@ -72,7 +72,7 @@ void Index(const std::string& volume) {
   }
   catalog::Checkpoint(*database);
   for (const std::string& message : summary.unreadable) {
-    std::cerr << "orva-catalog: left as it was: " << message << '\n';
+    std::cerr << "orva-catalog: not updated, cannot be read: " << message << '\n';
   }
   std::cout << volume << ": " << summary.folders << " folders, " << summary.files << " files, "
             << summary.photos << " photos; files: " << summary.added << " added, "

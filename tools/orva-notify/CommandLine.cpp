@@ -40,8 +40,8 @@ public:
 private:
   void AddServe() {
     CLI::App* const serve =
-        app_.add_subcommand("serve", "Listen on the notification socket and send every client what "
-                                     "the other commands\nhand over, until SIGINT or SIGTERM");
+        app_.add_subcommand("serve", "Listen on the notification socket and send every client the "
+                                     "messages of\n'send', until SIGINT or SIGTERM");
     serve->add_flag("--watch", command_.watch,
                     "Also announce mounts and unmounts directly below /shares;\n"
                     "a new client first receives the mounted volumes");
@@ -94,8 +94,8 @@ private:
         ->type_name("SECONDS")
         ->capture_default_str()
         ->transform(commandline::Decimal(0, MAXIMUM_NUMBER));
-    request.footer("Prints the number of clients reached: each has the message in its queue, or "
-                   "its connection\nis closed.");
+    request.footer("Returns when the message is queued for every client, or, for drop, when all "
+                   "connections are\nclosed, and prints the number of clients.");
   }
 
   CLI::App app_{"Stands in for the appliance's notification service on machines without the "

@@ -44,7 +44,7 @@ bool WaitFor(const util::Socket& socket, short events, Clock::time_point deadlin
 }
 
 /// Sends `bytes`. Returns false when the deadline has passed. An error is left to ReceiveLine,
-/// which finds that the service has hung up.
+/// which finds that the service has closed the connection.
 bool SendAll(const util::Socket& socket, std::string_view bytes, Clock::time_point deadline) {
   while (!bytes.empty()) {
     const ssize_t count = send(socket.Descriptor(), bytes.data(), bytes.size(), MSG_NOSIGNAL);
@@ -60,7 +60,7 @@ bool SendAll(const util::Socket& socket, std::string_view bytes, Clock::time_poi
 }
 
 /// The line of the answer, without its newline; nothing when the deadline has passed. The line is
-/// empty when the service has hung up.
+/// empty when the service has closed the connection.
 std::optional<std::string> ReceiveLine(util::Socket& socket, Clock::time_point deadline) {
   std::string line;
   char next = 0;
@@ -110,7 +110,7 @@ std::size_t Ask(const std::string& address, const Request& request, std::chrono:
     ThrowTooLate(request, wait);
   }
   if (answer->empty()) {
-    throw util::Exception("The notification service hung up without an answer");
+    throw util::Exception("The notification service closed the connection without an answer");
   }
   return std::stoul(*answer);
 }

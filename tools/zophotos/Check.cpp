@@ -62,7 +62,7 @@ constexpr Check DAMAGE[] = {
      "> 1"},
 };
 
-/// What the daemon leaves in the database by its rules. doc/operations.md says when it is removed.
+/// What the daemon leaves in the database by its rules. doc/database.md describes it.
 constexpr Check LEFTOVERS[] = {
     {"statistics_without_content", "statistics of volumes without merged content",
      "SELECT volume FROM Statistics s WHERE NOT EXISTS (SELECT 1 FROM Folders o WHERE o.volume = "

@@ -5,7 +5,6 @@
 #include <SQLiteCpp/Statement.h>
 
 #include <algorithm>
-#include <ranges>
 #include <string_view>
 #include <vector>
 
@@ -78,11 +77,11 @@ std::vector<Node> MakeTree(const std::vector<StoredFolder>& folders, const std::
   }
   // Read from the end, the first node of a depth below a parent is the parent's last child.
   std::vector<bool> hasLast;
-  for (Node& node : nodes | std::views::reverse) {
-    const bool known = node.depth < hasLast.size() && hasLast[node.depth];
-    node.isLast = !known;
-    hasLast.resize(node.depth + 1, false);
-    hasLast[node.depth] = true;
+  for (auto node = nodes.rbegin(); node != nodes.rend(); ++node) {
+    const bool known = node->depth < hasLast.size() && hasLast[node->depth];
+    node->isLast = !known;
+    hasLast.resize(node->depth + 1, false);
+    hasLast[node->depth] = true;
   }
   return nodes;
 }

@@ -94,7 +94,7 @@ private:
     find_
         ->add_option("PATTERN", search_.pattern,
                      "Shell pattern for the name, or for the whole path if it has a /; without "
-                     "wildcards, text to find anywhere in it")
+                     "wildcards: text that the name or path contains")
         ->required();
     find_->add_flag("-i,--ignore-case", search_.ignoreCase, "Ignore case");
     find_->add_flag("-0,--null", search_.nullTerminated,

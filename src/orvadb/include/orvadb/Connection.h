@@ -24,13 +24,14 @@ struct StatementFinalizer {
 /// transaction. Belongs to the DB; used on its thread. Failures are thrown as std::string with the
 /// caller's `file` and `line`.
 ///
-/// A statement in use is checked out, so that a second one with the same text is compiled again;
-/// used ones come back reset, without bindings and without a lock.
+/// A statement in use is not in the cache: a second one with the same text is compiled. When its
+/// use ends, it is reset, its bindings are cleared, it holds no lock, and it returns to the cache.
 class Connection {
 public:
   using Compiled = std::unique_ptr<sqlite3_stmt, StatementFinalizer>;
 
-  /// Ends a use: puts the statement back into its place, instead of another that came first.
+  /// Returns the statement to the cache. If another one with the same text was returned earlier, it
+  /// is replaced.
   struct CheckIn {
     Compiled* place = nullptr; ///< belongs to the connection and lives as long
     void operator()(sqlite3_stmt* statement) const noexcept;
@@ -49,7 +50,7 @@ public:
   /// The database turned out to have `bytes` bytes.
   void SetFileSize(long long bytes) noexcept;
 
-  /// Hands out the compiled form of `sql`; compiles it when none is kept or it is in use. Throws
+  /// Hands out the compiled form of `sql`; compiles it if the cache has none free. Throws
   /// also when SQLite has rolled back the running transaction.
   CheckedOut CheckOut(const char* sql, const char* file, unsigned int line);
 
@@ -61,7 +62,7 @@ public:
   /// `busyTimeout` milliseconds for other connections.
   void BeginTransaction(unsigned int busyTimeout, const char* file, unsigned int line);
 
-  /// Number of the running transaction; 0 while there is none. Never the same for two.
+  /// Number of the running transaction, different for every one; 0 while there is none.
   unsigned long long RunningTransaction() const noexcept { return transaction_; }
 
   /// Has the running transaction execute `sql`, a literal, before it commits.
@@ -70,7 +71,7 @@ public:
   /// Commits the running transaction, which otherwise keeps running.
   void CommitTransaction(const char* file, unsigned int line);
 
-  /// Ends the running transaction without its changes.
+  /// Rolls back the running transaction.
   void RollBackTransaction() noexcept;
 
 private:
@@ -89,7 +90,7 @@ private:
   sqlite3* handle_;
   int busyTimeout_;
   std::unique_ptr<WorkLimit> workLimit_;
-  /// By text. Callers write whole texts, so that there are few. Null while in use.
+  /// By SQL text; there are few, because values are never part of a text. Null while in use.
   std::unordered_map<std::string, Compiled, TextHash, std::equal_to<>> statements_;
 
   unsigned long long transaction_ = 0;  ///< number of the running transaction, 0 for none

@@ -46,15 +46,15 @@ public:
   /// throws std::string with the caller's `file` and `line` and the statement `sql`.
   Connection& OpenConnection(const char* sql, const char* file, unsigned int line) const;
 
-  /// Bytes of the open database with its log; holes count for little. The limit of the statements'
-  /// work follows this size from now on: the file may have grown while another writer was waited
-  /// for. Throws std::string.
+  /// Bytes of the open database with its log; holes count little. From now on the limit of the
+  /// statements' work follows this size, because the file may have grown while this connection
+  /// waited for another writer. Throws std::string.
   long long MeasureFile() const;
 
   /// Makes sure that the values in `table` are those that were stored there: refuses generated
   /// columns and, where the connection can write, computed defaults, indexes on expressions or on
   /// part of the rows, and too many indexes. In an untrusted database these may be so expensive
-  /// that inserting a row takes minutes. A table that does not exist has none. Throws std::string.
+  /// that inserting a row takes minutes. A missing table is accepted. Throws std::string.
   void RejectComputedColumns(const std::string& table) const;
 
 protected:
@@ -71,8 +71,8 @@ protected:
   /// ReadWrite creates.
   void Open(std::string path, Access access, int busyTimeout, bool immutable);
 
-  /// Number of the transaction that runs on the open connection; 0 while there is none. Never the
-  /// same for two, so that a cache can be kept for one transaction.
+  /// Number of the transaction that runs on the open connection; 0 while there is none. Every
+  /// transaction of the connection has a different number, so that a cache can be kept for one.
   unsigned long long RunningTransaction() const noexcept;
 
   /// Executes `create` now, which makes an index in the running transaction, and `drop` before the

@@ -15,7 +15,7 @@ public:
   enum ItemType : int { FOLDER = 1, FILE = 2 };
 
   long long id = -1;       ///< row identifier in the catalog; -1 when not yet a row
-  long long folderId = -1; ///< identifier of the containing folder; -1 when unknown
+  long long folderId = -1; ///< its folder's id; -1 when unknown or directly in the volume's root
   std::string path;        ///< full path
   std::string name;        ///< last component of the path
 

@@ -21,8 +21,8 @@ public:
   static constexpr int ROW = 100;  ///< a row is ready
   static constexpr int DONE = 101; ///< the statement has finished
 
-  /// Prepares `sql` on `db`, which outlives the statement. The text must stay valid as long
-  /// as the statement.
+  /// Prepares `sql` on `db`, which stays open, and is not opened again, until the statement is
+  /// destroyed. The text must stay valid as long as the statement.
   Statement(const DB& db, const char* sql, const char* file = __builtin_FILE(),
             unsigned int line = __builtin_LINE());
   Statement(const Statement&) = delete;

@@ -10,9 +10,10 @@ class DB;
 /// is one consistent view of the database, from the first read to the end.
 class Transaction {
 public:
-  /// Begins on `db`, which outlives the transaction, at once as a writer where the connection
-  /// can write. `busyTimeout` is how long, in milliseconds, the transaction's statements wait
-  /// for other connections. Throws std::string with the caller's `file` and `line`.
+  /// Begins on `db`, which stays open, and is not opened again, until the transaction is destroyed.
+  /// Begins at once as a writer where the connection can write. `busyTimeout` is how long, in
+  /// milliseconds, the transaction's statements wait for other connections. Throws std::string with
+  /// the caller's `file` and `line`.
   Transaction(const DB& db, unsigned int busyTimeout, const char* file = __builtin_FILE(),
               unsigned int line = __builtin_LINE());
   Transaction(const Transaction&) = delete;

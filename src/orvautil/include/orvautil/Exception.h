@@ -5,7 +5,7 @@
 
 namespace orva::util {
 
-/// A failure that ends the operation that met it; what() is the message for a person.
+/// An error that ends the current operation; what() is a message for people.
 class Exception : public std::runtime_error {
 public:
   /// `file` and `line` name the place that throws; `file` must outlive the exception, as a literal

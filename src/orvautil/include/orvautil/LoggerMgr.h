@@ -12,7 +12,7 @@ class LoggerMgr {
 public:
   using Logger = std::function<void(const std::string&)>;
 
-  /// Highest level that is logged; 0, nothing at all, until a logger is added.
+  /// Messages up to this level are logged; 0 (none) until a logger is added.
   unsigned Level() const noexcept { return level_; }
 
   /// Adds a logger, which is handed each finished message, and sets the level.

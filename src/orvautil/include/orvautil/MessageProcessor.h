@@ -21,15 +21,15 @@ class Stream;
 
 /// Cuts a stream of bytes into messages at a delimiter, parses them as XML and handles them. The
 /// stream is untrusted: the memory it takes is bounded, and a message that cannot be handled is
-/// skipped with a line in the log. One thread at a time, on which the XML platform is initialised;
-/// only the stop flag may be set from another thread.
+/// skipped with a line in the log. Used by one thread at a time, which has initialised the XML
+/// platform; only the stop flag may be set from another thread.
 class MessageProcessor {
 public:
   /// Why a message was skipped.
   enum Error : int {
     MESSAGE_TOO_LONG = 1, ///< more than MAXIMUM_MESSAGE_LENGTH bytes without a delimiter
-    MESSAGE_ILL_FORMED,   ///< not well-formed XML, or with a document type declaration
-    MESSAGE_NOT_HANDLED   ///< HandleMessage threw
+    MESSAGE_ILL_FORMED, ///< not well-formed, nested too deeply, or has a document type declaration
+    MESSAGE_NOT_HANDLED ///< HandleMessage threw
   };
 
   /// Bytes of the longest message that is handled, without its delimiter.
@@ -57,7 +57,7 @@ public:
   virtual void HandleError(int error, Stream& stream, const unsigned char* data,
                            unsigned long length) const;
 
-  /// The bytes that end each message, and their number; constant for the object's life.
+  /// The bytes that end each message, and their number; the same for the life of the object.
   virtual std::pair<const unsigned char*, unsigned long> GetDelimiter() const = 0;
 
   /// Reads `stream` until it ends and handles its messages in order. Bytes after the last delimiter

@@ -22,8 +22,8 @@ public:
   OwnerList(const OwnerList&) = delete;
   OwnerList& operator=(const OwnerList&) = delete;
 
-  /// Deletes every element. An element whose destructor throws does not keep the others or
-  /// the nodes from being released; the first such exception then continues.
+  /// Deletes every element. If destructors throw, all elements are still deleted and all memory is
+  /// released; then the first exception is rethrown.
   ~OwnerList() noexcept(false) { deleteAll(static_cast<std::list<T*>&>(*this)); }
 
   using Base::back;

@@ -26,8 +26,8 @@ public:
   OwnerVector& operator=(const OwnerVector&) = delete;
   OwnerVector& operator=(OwnerVector&&) = delete;
 
-  /// Deletes every element. An element whose destructor throws does not keep the others or
-  /// the storage from being released; the first such exception then continues.
+  /// Deletes every element. If destructors throw, all elements are still deleted and all memory is
+  /// released; then the first exception is rethrown.
   ~OwnerVector() noexcept(false) { deleteAll(Mutable()); }
 
   using Base::back;

@@ -31,9 +31,9 @@ private:
   const std::string& path_;
 };
 
-/// `directory` and `name` joined by exactly one separator, whether or not the one ends in some
-/// or the other begins with some. An empty directory gives the name alone, an empty name the
-/// directory followed by a separator.
+/// `directory` and `name` joined by exactly one separator, even if `directory` ends or `name`
+/// begins with separators. An empty directory gives the name alone, an empty name the directory
+/// followed by a separator.
 std::string MakePath(std::string_view directory, std::string_view name);
 
 } // namespace orva::util

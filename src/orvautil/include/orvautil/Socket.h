@@ -31,7 +31,7 @@ public:
   /// True exactly when the descriptor is not -1.
   bool IsOpen() const override { return static_cast<bool>(descriptor_); }
   void Close() override;
-  /// Does nothing: Write keeps nothing back.
+  /// Does nothing: Write does not buffer.
   void Flush() override {}
   bool IsDataAvailable(unsigned long long* count) override;
   unsigned Read(void* data, unsigned size) override;

@@ -15,7 +15,7 @@ public:
   /// Ends the stream; harmless when it has ended.
   virtual void Close() = 0;
 
-  /// Sends what Write keeps back.
+  /// Sends buffered data.
   virtual void Flush() = 0;
 
   /// True when a Read would not block; then `*count` (if not null) is the number of bytes that

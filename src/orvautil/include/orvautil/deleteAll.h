@@ -4,8 +4,8 @@
 
 namespace orva::util {
 
-/// Deletes every element of a container of owning pointers, in order, whatever their
-/// destructors throw; then lets the first exception continue.
+/// Deletes every element of a container of owning pointers, in order. If destructors throw, all
+/// elements are still deleted; then the first exception is rethrown.
 template <typename Container>
 void deleteAll(Container& pointers) {
   std::exception_ptr first;
