@@ -223,6 +223,8 @@ void PhotoDB::Clear() {
   Close();
   unlink(path.c_str());
   Open(path);
+  // The new connection counts its transactions from the beginning again.
+  cache_ = MergeCache();
 }
 
 void PhotoDB::DumpTable(const std::string& /*table*/) const {}

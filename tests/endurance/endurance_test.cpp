@@ -290,11 +290,11 @@ protected:
     master->second->Sweep();
   }
 
-  void ReadForAMoment() { Lock(false); }
-  void ReadForLong() { Lock(true); }
+  void ReadForAMoment() { LockMaster(false); }
+  void ReadForLong() { LockMaster(true); }
 
   /// A reader locks the merged database: until a merge waits for it, or for the whole merge.
-  void Lock(bool long_) {
+  void LockMaster(bool long_) {
     if (model_.CurrentState() != Model::State::Scanned ||
         !HasMergedDatabase(model_.MasterLocation())) {
       return NotifyOfWork();

@@ -37,7 +37,7 @@ TEST_F(Flood, ABillionBytesWithoutADelimiterAreOneMessage) {
 }
 
 TEST_F(Flood, MessagesThatAreTooLongAreSkippedOneByOne) {
-  const std::size_t count = TestScale(200, 4000);
+  const auto count = TestScale<std::size_t>(200, 4000);
   const std::string message = std::string(LONGEST + 1, 'x') + DELIMITER;
   for (std::size_t i = 0; i < count; ++i) {
     appliance.Service().SendBytes(message);
@@ -134,7 +134,7 @@ TEST_F(Flood, ZerosThatAreNoDelimiterSpoilOnlyTheNextMessage) {
 }
 
 TEST_F(Flood, EveryPrefixOfAGoodMessageIsRefused) {
-  const std::string comment = "<!-- " + std::string(TestScale(0, 4'000), 'c') + " -->";
+  const std::string comment = "<!-- " + std::string(TestScale<std::size_t>(0, 4'000), 'c') + " -->";
   const std::string message =
       Notification("TranscodedBatch", "/shares/A", comment + ProfileElement("0123"));
   const std::size_t named =

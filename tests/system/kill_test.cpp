@@ -268,7 +268,7 @@ protected:
       appliance.Handle(steps[i].message);
     }
     std::pair<Lines, Lines> seen{Observe(), {}};
-    for (const std::size_t i : {6, 7, 8, 2, 5}) {
+    for (const std::size_t i : {6U, 7U, 8U, 2U, 5U}) {
       appliance.Handle(steps[i].message);
     }
     seen.second = Observe();

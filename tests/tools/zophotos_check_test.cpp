@@ -182,7 +182,7 @@ TEST_F(ZophotosCheck, FindsATruncatedFile) {
 TEST_F(ZophotosCheck, ReportsUnreadablePagesOnlyAsErrorsInTheFile) {
   Copy();
   const std::string page(4096, '\x5a');
-  for (auto at = 4096; at < static_cast<int>(std::filesystem::file_size(COPY)); at += 4096) {
+  for (std::size_t at = 4096; at < std::filesystem::file_size(COPY); at += 4096) {
     Overwrite(at, page);
   }
   const Outcome outcome = OnCopy({"check"});
