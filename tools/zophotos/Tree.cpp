@@ -77,12 +77,12 @@ std::vector<Node> MakeTree(const std::vector<StoredFolder>& folders, const std::
   }
   // Read from the end, the first node of a depth below a parent is the parent's last child.
   std::vector<bool> hasLast;
-  for (auto node = nodes.rbegin(); node != nodes.rend(); ++node) {
-    const bool known = node->depth < hasLast.size() && hasLast[node->depth];
-    node->isLast = !known;
-    hasLast.resize(node->depth + 1, false);
-    hasLast[node->depth] = true;
-  }
+  std::for_each(nodes.rbegin(), nodes.rend(), [&](Node& node) {
+    const bool known = node.depth < hasLast.size() && hasLast[node.depth];
+    node.isLast = !known;
+    hasLast.resize(node.depth + 1, false);
+    hasLast[node.depth] = true;
+  });
   return nodes;
 }
 
