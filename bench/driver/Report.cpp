@@ -185,7 +185,7 @@ std::string Today() {
   return text.str();
 }
 
-std::string Quoted(const std::string& text) {
+std::string JsonText(const std::string& text) {
   std::string quoted = "\"";
   for (const char byte : text) {
     if (byte == '"' || byte == '\\') {
@@ -208,21 +208,21 @@ std::string List(const Times& values) {
 
 std::string Json(const Figure& figure) {
   std::ostringstream text;
-  text << "{\"what\": " << Quoted(figure.what) << ", \"shape\": " << Quoted(figure.shape)
+  text << "{\"what\": " << JsonText(figure.what) << ", \"shape\": " << JsonText(figure.shape)
        << ", \"files\": " << figure.files << ", \"pairs\": " << figure.pairs << ", \"value\": ";
   if (figure.value) {
     text << *figure.value;
   } else {
     text << "null";
   }
-  text << ", \"target\": " << Quoted(TargetText(figure))
-       << ", \"verdict\": " << Quoted(Verdict(figure)) << '}';
+  text << ", \"target\": " << JsonText(TargetText(figure))
+       << ", \"verdict\": " << JsonText(Verdict(figure)) << '}';
   return text.str();
 }
 
 std::string Json(const Measurement& measured) {
   std::ostringstream text;
-  text << "{\"what\": " << Quoted(measured.what) << ", \"shape\": " << Quoted(measured.shape)
+  text << "{\"what\": " << JsonText(measured.what) << ", \"shape\": " << JsonText(measured.shape)
        << ", \"files\": " << measured.files << ", \"daemon\": " << List(measured.daemon)
        << ", \"floor\": " << List(measured.floor) << ", \"horizon\": " << List(measured.horizon)
        << ", \"gaveUp\": " << (measured.gaveUp ? "true" : "false") << '}';
@@ -231,14 +231,14 @@ std::string Json(const Measurement& measured) {
 
 std::string Json(const MicroResult& micro) {
   std::ostringstream text;
-  text << "{\"what\": " << Quoted(micro.what) << ", \"ours\": " << micro.ours
+  text << "{\"what\": " << JsonText(micro.what) << ", \"ours\": " << micro.ours
        << ", \"theirs\": " << micro.theirs << '}';
   return text.str();
 }
 
 template <typename Item>
 void WriteList(std::ostream& out, const std::string& name, const std::vector<Item>& items) {
-  out << ",\n  " << Quoted(name) << ": [";
+  out << ",\n  " << JsonText(name) << ": [";
   for (std::size_t i = 0; i < items.size(); ++i) {
     out << (i == 0 ? "\n    " : ",\n    ") << Json(items[i]);
   }
@@ -305,7 +305,7 @@ void WriteTable(std::ostream& out, const std::vector<Figure>& figures, const Res
 }
 
 void WriteJson(std::ostream& out, const std::vector<Figure>& figures, const Results& results) {
-  out << "{\n  \"date\": " << Quoted(Today()) << ",\n  \"machine\": " << Quoted(Machine());
+  out << "{\n  \"date\": " << JsonText(Today()) << ",\n  \"machine\": " << JsonText(Machine());
   WriteList(out, "figures", figures);
   WriteList(out, "measurements", results.measurements);
   WriteList(out, "micro", results.micro);

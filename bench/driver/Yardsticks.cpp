@@ -59,7 +59,7 @@ std::string Parameter(const std::string& name, const std::string& value) {
   return ".parameter set " + name + " " + value;
 }
 
-std::string Quoted(const std::string& text) {
+std::string SqlText(const std::string& text) {
   return "\"'" + text + "'\"";
 }
 
@@ -80,8 +80,8 @@ double MergeByHorizon(const std::string& catalog, const std::string& merged,
                       const std::string& volume) {
   RemoveDatabase(merged);
   return Beyond(SHELL_START,
-                {SHELL, "-bail", "-cmd", Parameter(":catalog", Quoted(catalog)), "-cmd",
-                 Parameter(":volume", Quoted(volume)), merged, ".read " + HORIZON_SCRIPT},
+                {SHELL, "-bail", "-cmd", Parameter(":catalog", SqlText(catalog)), "-cmd",
+                 Parameter(":volume", SqlText(volume)), merged, ".read " + HORIZON_SCRIPT},
                 NOWHERE);
 }
 

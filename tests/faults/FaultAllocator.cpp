@@ -8,11 +8,11 @@ namespace orva::test {
 
 namespace {
 
-FaultAllocator* current = nullptr;
+FaultAllocator* currentAllocator = nullptr;
 sqlite3_mem_methods real;
 
 bool Fails() {
-  return current != nullptr && current->Fails();
+  return currentAllocator != nullptr && currentAllocator->Fails();
 }
 
 void* Allocate(int bytes) {
@@ -41,14 +41,14 @@ void FaultAllocator::Install() {
 }
 
 FaultAllocator::FaultAllocator(int nth, bool permanent) : nth_(nth), permanent_(permanent) {
-  if (current != nullptr) {
+  if (currentAllocator != nullptr) {
     throw std::logic_error("two fault allocators");
   }
-  current = this;
+  currentAllocator = this;
 }
 
 FaultAllocator::~FaultAllocator() {
-  current = nullptr;
+  currentAllocator = nullptr;
 }
 
 bool FaultAllocator::Fails() noexcept {

@@ -13,6 +13,8 @@ namespace orva::test {
 
 namespace {
 
+using Effect = FaultPlan::Effect;
+
 struct Kind {
   const char* name;
   Request request;
@@ -102,7 +104,6 @@ std::vector<Fault> FileErrors(const std::string& files, const std::string& place
 }
 
 std::vector<Fault> Crashes(const std::string& files) {
-  using Effect = FaultPlan::Effect;
   return {
       Crash("crashed process", {.files = files, .requests = CHANGES, .effect = Effect::Crash}),
       Crash("crashed process, between changes",

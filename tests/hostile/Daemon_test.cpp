@@ -19,9 +19,9 @@ namespace fs = std::filesystem;
 using ::testing::IsEmpty;
 using ::testing::StartsWith;
 
-const std::string VICTIM = "/tmp/victim";
+const std::string PRECIOUS = "/tmp/victim";
 
-Log ErrorsIn(const Log& log) {
+Log ErrorLines(const Log& log) {
   Log errors;
   for (const LogLine& line : log) {
     if (line.priority == Error("").priority) {
@@ -35,7 +35,7 @@ Log ErrorsIn(const Log& log) {
 class HostileSystem : public SystemTest {
 protected:
   HostileSystem() {
-    std::ofstream(VICTIM) << "precious content";
+    std::ofstream(PRECIOUS) << "precious content";
     photos.AddPhoto("a.jpg", 1000, 2000);
   }
 
@@ -44,7 +44,7 @@ protected:
     const std::string name = std::to_string(++photos_) + ".jpg";
     photos.AddPhoto(name, 1, 2000 + photos_);
     const Log log = appliance.Handle(TranscodedBatch(good.Path()));
-    EXPECT_THAT(ErrorsIn(log), IsEmpty());
+    EXPECT_THAT(ErrorLines(log), IsEmpty());
     EXPECT_THAT(MergedDatabase(master.Path()).Files(),
                 ::testing::Contains("/shares/Good/" + name + "|1|1|/shares/Good/"));
   }
@@ -65,7 +65,7 @@ TEST_F(HostileSystem, ContinuesAfterHostileCatalogs) {
   const std::string home = core::GetORVA_HOME(hostile.Path());
   const std::string catalog = core::GetCatalogPath(hostile.Path());
   const auto expectRefused = [&](const std::string& message) {
-    const Log errors = ErrorsIn(appliance.Handle(message));
+    const Log errors = ErrorLines(appliance.Handle(message));
     ASSERT_EQ(1U, errors.size()) << ::testing::PrintToString(errors);
     EXPECT_THAT(errors[0].text, StartsWith("Error that we will ignore "));
     ExpectGoodMergeInto(good);
@@ -74,7 +74,7 @@ TEST_F(HostileSystem, ContinuesAfterHostileCatalogs) {
   for (const SpecialKind kind : SPECIAL_KINDS) {
     SCOPED_TRACE(NameOf(kind));
     fs::create_directory(home);
-    const SpecialFile special(kind, catalog, VICTIM);
+    const SpecialFile special(kind, catalog, PRECIOUS);
     expectRefused(TranscodedBatch(hostile.Path()));
     expectRefused(Purged(hostile.Path()));
   }
@@ -100,14 +100,14 @@ protected:
     appliance.Start();
     appliance.Handle(Plugged(hostile.Path()));
     appliance.Handle(Plugged(good.Path()));
-    const Log errors = ErrorsIn(appliance.Handle(Scanned(hostile.Path())));
+    const Log errors = ErrorLines(appliance.Handle(Scanned(hostile.Path())));
     ASSERT_EQ(1U, errors.size()) << ::testing::PrintToString(errors);
     EXPECT_THAT(errors[0].text, StartsWith("MessageProcessor:: "));
 
     appliance.Handle(Unplugged(hostile.Path()));
     ExpectGoodMergeInto(good);
     EXPECT_EQ("zophotos_db_path=/shares/Good//.zophotos/zophotos.db\n", Appliance::Locator());
-    EXPECT_TRUE(fs::exists(VICTIM));
+    EXPECT_TRUE(fs::exists(PRECIOUS));
     EXPECT_FALSE(fs::exists("/tmp/zophotos.db"));
   }
 
@@ -122,7 +122,7 @@ TEST_F(HostileMaster, WithGarbageDoesNotHarmTheNextMaster) {
 
 TEST_F(HostileMaster, WithAJournalThatNamesAFileDoesNotHarmTheNextMaster) {
   std::ofstream(database).flush();
-  CraftedJournal(4096, 1, {}, VICTIM).Save(database + "-journal");
+  CraftedJournal(4096, 1, {}, PRECIOUS).Save(database + "-journal");
   ExpectTheNextMasterToWork();
 }
 

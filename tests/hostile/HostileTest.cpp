@@ -30,20 +30,6 @@ long long MemoryAllowance(long long content) {
   return (128LL << 20U) + 64 * content;
 }
 
-bool IsError(const LogLine& line) {
-  return line.priority == Error("").priority;
-}
-
-Lines ErrorsIn(const Log& log) {
-  Lines errors;
-  for (const LogLine& line : log) {
-    if (IsError(line)) {
-      errors.push_back(line.text);
-    }
-  }
-  return errors;
-}
-
 /// Whether a log ends with the lines of a successful merge of the good volume.
 bool EndsWithGoodMerge(const Log& log, int files) {
   const Log good = MergeLines(GOOD, GOOD_FOLDERS, files);
@@ -120,7 +106,7 @@ HostileTest::Outcome HostileTest::MergeHostileVolume() {
   EXPECT_THAT(UnexpectedRows(MASTER), ::testing::IsEmpty());
   EXPECT_THAT(MergedRows(MASTER, "PRAGMA integrity_check"), ::testing::ElementsAre("ok"));
 
-  const Lines errors = ErrorsIn(log);
+  const Lines errors = ErrorTexts(log);
   refusal_ = errors.empty() ? "" : errors.front();
   if (errors.empty()) {
     EXPECT_EQ(10U, log.size());
@@ -150,7 +136,7 @@ std::vector<std::string> HostileTest::UseHostileMaster() {
   EXPECT_EQ("", attempt.thrown.at(5));
   EXPECT_TRUE(EndsWithGoodMerge(log, 4)) << ::testing::PrintToString(log);
   EXPECT_THAT(MergedStatistics(SPARE), ::testing::ElementsAre("/shares/Good/|4|4|400"));
-  for (const std::string& error : ErrorsIn(log)) {
+  for (const std::string& error : ErrorTexts(log)) {
     EXPECT_TRUE(error.starts_with(ERROR_BEGINNING) || error.starts_with("Could not ")) << error;
   }
   fs::remove_all(SPARE + ".zophotos");
@@ -158,7 +144,7 @@ std::vector<std::string> HostileTest::UseHostileMaster() {
     fs::remove(LOCATOR_PATH);
   }
 
-  return ErrorsIn(log) + attempt.thrown;
+  return ErrorTexts(log) + attempt.thrown;
 }
 
 void HostileTest::RestoreMaster() const {

@@ -7,6 +7,16 @@
 
 namespace orva::test {
 
+Lines ErrorTexts(const Log& log) {
+  Lines errors;
+  for (const LogLine& line : log) {
+    if (line.priority == Error("").priority) {
+      errors.push_back(line.text);
+    }
+  }
+  return errors;
+}
+
 std::string MaskTimes(const std::string& text) {
   static const std::regex TIME(R"(\d+\.\d{3} W   \d+\.\d{3} U   \d+\.\d{3} S   \d+\.\d%)");
   return std::regex_replace(text, TIME, "TIME");

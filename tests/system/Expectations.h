@@ -33,6 +33,9 @@ std::vector<Item> operator+(std::vector<Item> first, const std::vector<Item>& se
   return first;
 }
 
+/// The texts of a log's error lines.
+Lines ErrorTexts(const Log& log);
+
 /// A line of the log with TIME in place of an elapsed time.
 std::string MaskTimes(const std::string& text);
 

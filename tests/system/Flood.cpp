@@ -16,6 +16,15 @@ constexpr long GROWTH_LIMIT = 8192; ///< KiB
 
 } // namespace
 
+std::string Repeated(const std::string& text, std::size_t count) {
+  std::string repeated;
+  repeated.reserve(text.size() * count);
+  for (std::size_t i = 0; i < count; ++i) {
+    repeated += text;
+  }
+  return repeated;
+}
+
 std::string Filled(const std::string& head, const std::string& piece, const std::string& tail) {
   std::string message = head;
   while (message.size() + piece.size() + tail.size() <= LONGEST) {

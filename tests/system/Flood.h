@@ -20,6 +20,9 @@ inline const std::string DELIMITER(4, '\0');
 inline const std::string GOOD = Notification("Unplugged", "/shares/A");
 inline const Log HANDLED = {Info("Default:: Volumeunplugged, ignoring! ")};
 
+/// `text`, `count` times.
+std::string Repeated(const std::string& text, std::size_t count);
+
 /// `head` and `tail` with as many of `piece` between them as the longest message can hold.
 std::string Filled(const std::string& head, const std::string& piece, const std::string& tail);
 

@@ -20,7 +20,7 @@ using ::testing::IsEmpty;
 using ::testing::StartsWith;
 using namespace std::chrono_literals;
 
-constexpr unsigned SEED = 20'081;
+constexpr unsigned WRITER_SEED = 20'081;
 
 /// The content of volume B's catalog at one time. Each generation has a new folder with another
 /// number of photos; the number of the generation is their stamp.
@@ -183,7 +183,7 @@ TEST_P(CatalogWriter, ThatCommitsWhileMergesRunIsSeenAtOneOfItsCommits) {
   std::atomic<int> begun = 0; // merges
   std::atomic<int> latest = 1;
   std::thread writer([&] {
-    std::mt19937 random(SEED);
+    std::mt19937 random(WRITER_SEED);
     for (int merge = 0; merge < merges; ++merge) {
       begun.wait(merge);
       for (auto commits = 1 + random() % 4; commits > 0; --commits) {
@@ -200,7 +200,8 @@ TEST_P(CatalogWriter, ThatCommitsWhileMergesRunIsSeenAtOneOfItsCommits) {
     begun.notify_all();
     EXPECT_THAT(HandleForErrors(TranscodedBatch(b.Path())), IsEmpty());
     const Generation merged = Merged();
-    SCOPED_TRACE("seed " + std::to_string(SEED) + ", generation " + std::to_string(merged.number));
+    SCOPED_TRACE("seed " + std::to_string(WRITER_SEED) + ", generation " +
+                 std::to_string(merged.number));
     EXPECT_GE(merged.number, least);
     ExpectMerged(merged);
     overtaken += merged.number > least ? 1 : 0;

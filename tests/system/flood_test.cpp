@@ -15,15 +15,6 @@ using ::testing::IsEmpty;
 const LogLine SKIPPED = Error("MessageProcessor:: message of more than 65536 bytes skipped");
 const LogLine ILL_FORMED = Error("MessageProcessor:: ");
 
-std::string Repeated(const std::string& text, std::size_t count) {
-  std::string repeated;
-  repeated.reserve(text.size() * count);
-  for (std::size_t i = 0; i < count; ++i) {
-    repeated += text;
-  }
-  return repeated;
-}
-
 TEST_F(Flood, ABillionBytesWithoutADelimiterAreOneMessage) {
   const std::string mebibyte(1U << 20U, 'x');
   const int mebibytes = TestScale(64, 1024);

@@ -29,14 +29,6 @@ using HostileMessage = Flood;
 const std::string START = R"(<ORVANotification Name="Unplugged" MountPoint="/shares/A")";
 const std::string FINISH = "</ORVANotification>";
 
-std::string Repeated(const std::string& text, std::size_t count) {
-  std::string repeated;
-  for (std::size_t i = 0; i < count; ++i) {
-    repeated += text;
-  }
-  return repeated;
-}
-
 /// `count` nested elements, with `content` in the innermost one.
 std::string Nested(std::size_t count, const std::string& content = "") {
   return Repeated("<a>", count) + content + Repeated("</a>", count);

@@ -25,16 +25,6 @@ using ::testing::StartsWith;
 /// The distance between two instants of a merge at which a volume is pulled.
 const int STRIDE = TestScale(6, 1);
 
-Lines Errors(const Log& log) {
-  Lines errors;
-  for (const LogLine& line : log) {
-    if (line.priority == Error("").priority) {
-      errors.push_back(line.text);
-    }
-  }
-  return errors;
-}
-
 /// A daemon whose volumes are pulled while it merges.
 class Pull : public ::testing::Test {
 protected:
@@ -93,7 +83,7 @@ TEST_F(Pull, OfTheMergedVolumeLosesAtMostItsMerge) {
     FillB(b);
     appliance.Handle(Plugged(b.Path()));
     pulled = MergeAndPull(appliance, instant, [&] { b.Unmount(); });
-    const Lines errors = Errors(appliance.TakeLog());
+    const Lines errors = ErrorTexts(appliance.TakeLog());
     ++(errors.empty() ? merged : failed);
     if (!errors.empty()) {
       EXPECT_THAT(errors.back(), EndsWith("there is no volume at '/shares/B/'\n"));
@@ -164,7 +154,7 @@ protected:
       Begin(appliance);
       appliance.Handle(TranscodedBatch(a.Path()));
       pulled = MergeAndPull(appliance, instant, [&] { a.Unmount(); });
-      ExpectAllOrNothing(Errors(appliance.TakeLog()), pulled);
+      ExpectAllOrNothing(ErrorTexts(appliance.TakeLog()), pulled);
       ExpectSharesRootTakesOver(appliance);
       EXPECT_EQ(Exited(0), appliance.Shutdown());
     }
@@ -195,7 +185,7 @@ private:
   static void ExpectSharesRootTakesOver(Appliance& appliance) {
     appliance.Handle(Unplugged("/shares/A"));
     EXPECT_EQ("zophotos_db_path=/shares/.zophotos/zophotos.db\n", Appliance::Locator());
-    EXPECT_THAT(Errors(appliance.Handle(TranscodedBatch("/shares/B"))), IsEmpty());
+    EXPECT_THAT(ErrorTexts(appliance.Handle(TranscodedBatch("/shares/B"))), IsEmpty());
     EXPECT_THAT(MergedDatabase("/shares").Files(), SizeIs(1000));
   }
 
@@ -203,7 +193,7 @@ private:
   static void ExpectReturn() {
     Appliance appliance;
     Begin(appliance);
-    EXPECT_THAT(Errors(appliance.Handle(TranscodedBatch("/shares/B"))), IsEmpty());
+    EXPECT_THAT(ErrorTexts(appliance.Handle(TranscodedBatch("/shares/B"))), IsEmpty());
     const MergedDatabase merged("/shares/A");
     EXPECT_THAT(merged.Faults(), IsEmpty());
     EXPECT_THAT(merged.Files(), SizeIs(1100));

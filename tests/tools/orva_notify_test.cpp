@@ -61,12 +61,12 @@ Arguments Notify(Arguments arguments) {
 }
 
 /// The result of a command.
-struct Outcome {
+struct Answer {
   int status = 0;
   std::string line; ///< the first line of its output
 };
 
-Outcome RunNotify(const Arguments& arguments, const std::string& input = "/dev/null") {
+Answer RunNotify(const Arguments& arguments, const std::string& input = "/dev/null") {
   Program program(Notify(arguments), {.input = input});
   const std::string line = program.ReadLine();
   return {program.WaitForEnd(), line};
@@ -318,7 +318,7 @@ TEST_F(OrvaNotify, SendsEveryMessageToEachClient) {
   Serve();
   Listener one;
   Listener two;
-  const Outcome scanned = RunNotify({"send", "scanned", "/shares/My Photos"});
+  const Answer scanned = RunNotify({"send", "scanned", "/shares/My Photos"});
   EXPECT_EQ(scanned.status, 0);
   EXPECT_EQ(scanned.line, "sent to 2 clients");
   EXPECT_EQ(RunNotify({"send", "purged", "/shares/B"}).line, "sent to 2 clients");
@@ -357,26 +357,26 @@ TEST_F(OrvaNotify, SendsRawBytesFromAFileAndFromStandardInput) {
 
 TEST_F(OrvaNotify, ARawFileThatCannotBeReadIsAnError) {
   Serve();
-  const Outcome outcome = RunNotify({"send", "--raw", folder_ + "/absent"});
+  const Answer outcome = RunNotify({"send", "--raw", folder_ + "/absent"});
   EXPECT_EQ(outcome.status, 1);
   EXPECT_EQ(outcome.line, "orva-notify: Cannot read '" + folder_ + "/absent'");
 }
 
 TEST_F(OrvaNotify, SendFailsWhenNoServiceListens) {
-  const Outcome outcome = RunNotify({"send", "plugged", "/shares/A"});
+  const Answer outcome = RunNotify({"send", "plugged", "/shares/A"});
   EXPECT_EQ(outcome.status, 1);
   EXPECT_EQ(outcome.line, "orva-notify: No orva-notify serves " + ORVA_NOTIFICATION_SOCKET +
                               ": No such file or directory");
 }
 
 TEST_F(OrvaNotify, TheExitStatusDistinguishesWrongUsageFromFailure) {
-  const Outcome wrong = RunNotify({"send", "exploded", "/shares/A"});
+  const Answer wrong = RunNotify({"send", "exploded", "/shares/A"});
   EXPECT_EQ(wrong.status, 2);
   EXPECT_EQ(wrong.line, "orva-notify: EVENT: unknown event 'exploded'");
-  const Outcome help = RunNotify({"--help"});
+  const Answer help = RunNotify({"--help"});
   EXPECT_EQ(help.status, 0);
   EXPECT_THAT(help.line, HasSubstr("notification service"));
-  const Outcome version = RunNotify({"--version"});
+  const Answer version = RunNotify({"--version"});
   EXPECT_EQ(version.status, 0);
   EXPECT_EQ(version.line, "orva-notify " PROGRAM_VERSION);
 }
@@ -384,7 +384,7 @@ TEST_F(OrvaNotify, TheExitStatusDistinguishesWrongUsageFromFailure) {
 TEST_F(OrvaNotify, WaitsForTheGivenNumberOfClients) {
   Serve();
   Listener one;
-  const Outcome tooFew =
+  const Answer tooFew =
       RunNotify({"send", "--clients", "2", "--wait", "0", "plugged", "/shares/TooEarly"});
   EXPECT_EQ(tooFew.status, 1);
   EXPECT_EQ(tooFew.line, "orva-notify: Fewer than 2 clients connected within 0 s");
@@ -403,7 +403,7 @@ TEST_F(OrvaNotify, DropClosesTheClientsAndTheServiceListensOn) {
   Serve();
   Listener one;
   Listener two;
-  const Outcome outcome = RunNotify({"drop"});
+  const Answer outcome = RunNotify({"drop"});
   EXPECT_EQ(outcome.status, 0);
   EXPECT_EQ(outcome.line, "dropped 2 clients");
   EXPECT_EQ(one.ReadMessage(), "(end)");
@@ -436,7 +436,7 @@ TEST_F(OrvaNotify, ReplacesTheSocketOfAServiceThatWasKilled) {
 
 TEST_F(OrvaNotify, FailsWhenAnotherServiceListens) {
   Serve();
-  const Outcome second = RunNotify({"serve"});
+  const Answer second = RunNotify({"serve"});
   EXPECT_EQ(second.status, 1);
   EXPECT_THAT(second.line, HasSubstr("something else is there, perhaps another service"));
   Listener client;
@@ -477,7 +477,7 @@ TEST_F(OrvaNotify, RefusesAMessageThatIsTooLong) {
   Serve();
   const std::string file = FileWith("");
   std::filesystem::resize_file(file, MAXIMUM_QUEUED_BYTES + 1);
-  const Outcome outcome = RunNotify({"send", "--raw", file});
+  const Answer outcome = RunNotify({"send", "--raw", file});
   EXPECT_EQ(outcome.status, 1);
   EXPECT_EQ(outcome.line,
             "orva-notify: A message of 67108865 bytes is too long, 67108864 are allowed");

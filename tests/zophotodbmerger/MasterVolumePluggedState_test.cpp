@@ -12,8 +12,6 @@ using dbmerger::State;
 using ::testing::ElementsAre;
 using ::testing::IsEmpty;
 
-const LogLine MOVING = Info("Moving to the scanned state since we can safely do so ");
-
 /// The state after a volume that is larger than the shares root was plugged.
 class MasterVolumePluggedStateTest : public StatesTest {
 protected:

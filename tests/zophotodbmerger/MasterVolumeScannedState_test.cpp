@@ -15,7 +15,6 @@ using ::testing::ElementsAre;
 using ::testing::IsEmpty;
 
 const LogLine UNPLUGGED = Info("MasterVolumeScannedState:: Volumeunplugged ");
-const LogLine MOVING = Info("Moving to the scanned state since we can safely do so ");
 
 /// The scanned state, with the volume "/shares/Vol/" as the master.
 class MasterVolumeScannedStateTest : public StatesTest {

@@ -9,6 +9,9 @@
 
 namespace orva::test {
 
+/// Announces a move to the scanned state.
+inline const LogLine MOVING = Info("Moving to the scanned state since we can safely do so ");
+
 /// A test of the states: the machine has just started, with the shares root registered.
 class StatesTest : public DaemonLayerTest {
 protected:

@@ -4,13 +4,10 @@
 #include <cerrno>
 
 namespace orva::notify {
-namespace {
 
 bool IsTemporary(int error) {
   return error == EAGAIN || error == EINTR;
 }
-
-} // namespace
 
 void Client::Queue(const Message& message) {
   if (!message->empty()) {

@@ -10,6 +10,9 @@
 
 namespace orva::notify {
 
+/// Whether a request on a socket that has failed with `error`, an errno, may succeed later.
+bool IsTemporary(int error);
+
 /// A queued message, shared by the clients that receive it.
 using Message = std::shared_ptr<const std::string>;
 

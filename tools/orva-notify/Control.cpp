@@ -21,10 +21,6 @@ using Clock = std::chrono::steady_clock;
 
 constexpr std::size_t MAXIMUM_HEADER = 64;
 
-bool IsTemporary(int error) {
-  return error == EAGAIN || error == EINTR;
-}
-
 std::string Encode(const Request& request) {
   return (request.kind == Request::Kind::Send ? "send " : "drop ") +
          std::to_string(request.clients) + ' ' + std::to_string(request.message.size()) + '\n' +

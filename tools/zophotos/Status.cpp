@@ -111,7 +111,8 @@ Table MakeTable(const Volumes& volumes, int barWidth) {
   return table;
 }
 
-void PrintText(const std::string& path, const std::optional<Row>& row, const Volumes& volumes) {
+void PrintStatusText(const std::string& path, const std::optional<Row>& row,
+                     const Volumes& volumes) {
   std::cout << "Database  " << Printable(path) << "\nVersion   "
             << (row ? Printable(row->version) : "-") << "\nStamped   "
             << (row ? LocalTime(row->stamp) : "-") << "\n\n";
@@ -126,7 +127,8 @@ void PrintText(const std::string& path, const std::optional<Row>& row, const Vol
   (fits ? table : MakeTable(volumes, 0)).Print(std::cout, width);
 }
 
-void PrintJson(const std::string& path, const std::optional<Row>& row, const Volumes& volumes) {
+void PrintStatusJson(const std::string& path, const std::optional<Row>& row,
+                     const Volumes& volumes) {
   Json list = Json::array();
   for (const auto& [name, volume] : volumes) {
     list.push_back({{"volume", ToUtf8(name)},
@@ -147,7 +149,8 @@ void PrintJson(const std::string& path, const std::optional<Row>& row, const Vol
 ExitStatus ShowStatus(const std::string& path, Form form) {
   // Counting reads every row, which takes long.
   SQLite::Database database = CopyDatabase(path);
-  (form == Form::Json ? PrintJson : PrintText)(path, ReadRow(database), ReadVolumes(database));
+  (form == Form::Json ? PrintStatusJson : PrintStatusText)(path, ReadRow(database),
+                                                           ReadVolumes(database));
   return ExitStatus::Success;
 }
 

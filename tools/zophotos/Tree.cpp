@@ -86,7 +86,7 @@ std::vector<Node> MakeTree(const std::vector<StoredFolder>& folders, const std::
   return nodes;
 }
 
-void PrintText(const std::vector<Node>& nodes) {
+void PrintTreeText(const std::vector<Node>& nodes) {
   std::vector<std::string> indents; // one for each level above the node
   for (const Node& node : nodes) {
     indents.resize(node.depth);
@@ -105,7 +105,7 @@ void PrintText(const std::vector<Node>& nodes) {
   }
 }
 
-void PrintJson(const std::vector<Node>& nodes) {
+void PrintTreeJson(const std::vector<Node>& nodes) {
   for (const Node& node : nodes) {
     PrintLine({{"path", ToUtf8(node.path)},
                {"depth", node.depth},
@@ -123,7 +123,7 @@ ExitStatus ShowTree(const std::string& path, const std::string& folder, Form for
   if (nodes.empty()) {
     throw Failure(ExitStatus::Negative, "there is no folder " + top);
   }
-  (form == Form::Json ? PrintJson : PrintText)(nodes);
+  (form == Form::Json ? PrintTreeJson : PrintTreeText)(nodes);
   return ExitStatus::Success;
 }
 
