@@ -1,5 +1,6 @@
 #include "orvadb/Connection.h"
 
+#include "DatabaseVfs.h"
 #include "WorkLimit.h"
 
 #include "orvadb/ErrorMessage.h"
@@ -21,9 +22,8 @@ void Connection::CheckIn::operator()(sqlite3_stmt* statement) const noexcept {
   place->reset(statement);
 }
 
-Connection::Connection(sqlite3* handle, int busyTimeout, long long bytes)
-    : handle_(handle), busyTimeout_(busyTimeout),
-      workLimit_(std::make_unique<WorkLimit>(handle, bytes)) {
+Connection::Connection(sqlite3* handle, int busyTimeout)
+    : handle_(handle), busyTimeout_(busyTimeout), workLimit_(std::make_unique<WorkLimit>(handle)) {
   sqlite3_busy_timeout(handle_, busyTimeout_);
 }
 
@@ -33,8 +33,8 @@ bool Connection::IsReadOnly() const noexcept {
   return sqlite3_db_readonly(handle_, "main") == 1;
 }
 
-void Connection::SetFileSize(long long bytes) noexcept {
-  workLimit_->SetFileSize(bytes);
+long long Connection::BytesRead() const noexcept {
+  return workLimit_->BytesRead();
 }
 
 Connection::CheckedOut Connection::CheckOut(const char* sql, const char* file, unsigned int line) {
@@ -46,6 +46,7 @@ Connection::CheckedOut Connection::CheckOut(const char* sql, const char* file, u
                        file, line);
   }
   workLimit_->Restart();
+  DatabaseVfs::TakeRefusal(); // of a statement that went on without the file
   const auto kept = statements_.find(std::string_view(sql));
   Compiled& place = kept != statements_.end() ? kept->second : statements_[sql];
   Compiled compiled = place ? std::move(place) : Compile(sql, file, line);
@@ -66,6 +67,9 @@ Connection::Compiled Connection::Compile(const char* sql, const char* file,
 }
 
 int Connection::Step(sqlite3_stmt* statement, const char* file, unsigned int line) {
+  if (HasFailedToRead()) {
+    return SQLITE_ABORT;
+  }
   const int code = sqlite3_step(statement);
   if (code != SQLITE_ROW && code != SQLITE_DONE && failedStep_.empty()) {
     failedStep_ = ErrorMessage(statement, file, line);
@@ -102,6 +106,9 @@ void Connection::CommitTransaction(const char* file, unsigned int line) {
     throw ErrorMessage(
         util::FormatString("not committed after a failed step: %s", failedStep_.c_str()), file,
         line);
+  }
+  if (checkBeforeCommit_) {
+    checkBeforeCommit_();
   }
   for (const char* const sql : beforeCommit_) {
     Execute(CheckOut(sql, file, line).get(), file, line);

@@ -1,6 +1,6 @@
 #include "orvadb/DB.h"
 
-#include "DatabaseFile.h"
+#include "DatabaseVfs.h"
 
 #include "orvadb/Connection.h"
 #include "orvadb/ErrorMessage.h"
@@ -102,23 +102,20 @@ void DB::Open(const std::string& path) {
 
 void DB::Open(std::string path, Access access, int busyTimeout, bool immutable) {
   Close();
-  const long long size = CheckDatabaseFiles(path, access == Access::ReadWrite);
-  if (access == Access::ReadWrite) {
-    CheckJournal(path);
-  }
   ConfigureOnce();
+  vfs_ = std::make_unique<DatabaseVfs>(path, access == Access::ReadWrite);
   const int mode = access == Access::ReadWrite ? SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE
                                                : SQLITE_OPEN_READONLY;
   const int flags = mode | SQLITE_OPEN_NOFOLLOW | SQLITE_OPEN_PRIVATECACHE | SQLITE_OPEN_NOMUTEX |
                     (immutable ? SQLITE_OPEN_URI : 0);
   const std::string& name = immutable ? ImmutableUri(path) : path;
-  const int code = sqlite3_open_v2(name.c_str(), &handle_, flags, nullptr);
+  const int code = sqlite3_open_v2(name.c_str(), &handle_, flags, vfs_->Name());
   path_ = std::move(path);
   try {
     if (code != SQLITE_OK) {
       throw ErrorMessage(handle_, ("open '" + path_ + "'").c_str());
     }
-    connection_ = std::make_unique<Connection>(handle_, busyTimeout, size);
+    connection_ = std::make_unique<Connection>(handle_, busyTimeout);
     DisableUntrustedFeatures(handle_);
     if (access == Access::ReadWrite) {
       // A merge keeps its changes in memory until it commits, so that readers wait only then.
@@ -131,19 +128,21 @@ void DB::Open(std::string path, Access access, int busyTimeout, bool immutable) 
 }
 
 void DB::Create(const std::string& path, const std::function<void()>& build) {
-  const std::string unfinished = path + ".new";
-  if (!RemoveDatabase(unfinished)) {
+  ConfigureOnce();
+  const DatabaseFiles target(DatabaseVfs::FullPath(path), true);
+  const DatabaseFiles unfinished(target.Path() + ".new", true);
+  if (!unfinished.DeleteAll()) {
     // What an earlier attempt left there must not become part of the new database.
-    throw ErrorMessage(util::FormatString("cannot remove '%s'", unfinished.c_str()));
+    throw ErrorMessage(util::FormatString("cannot remove '%s'", unfinished.Path().c_str()));
   }
   try {
-    Open(unfinished);
+    Open(path + ".new");
     build();
     Close();
-    PublishDatabase(unfinished, path);
+    unfinished.Publish(target);
   } catch (...) {
     Close();
-    RemoveDatabase(unfinished);
+    unfinished.DeleteAll();
     throw;
   }
 }
@@ -153,6 +152,7 @@ void DB::Close() {
   // The connection has no statements left, so that SQLite closes it at once.
   sqlite3_close_v2(handle_);
   handle_ = nullptr;
+  vfs_.reset();
   path_.clear();
 }
 
@@ -163,13 +163,22 @@ Connection& DB::OpenConnection(const char* sql, const char* file, unsigned int l
   return *connection_;
 }
 
-long long DB::MeasureFile() const {
-  const long long size = CheckDatabaseFiles(path_, !connection_->IsReadOnly());
-  connection_->SetFileSize(size);
-  return size;
+long long DB::BytesRead() const noexcept {
+  return connection_->BytesRead();
+}
+
+void DB::CheckBeforeCommit(std::function<void()> check) const {
+  connection_->CheckBeforeCommit(std::move(check));
+}
+
+const DatabaseFiles& DB::Files() const noexcept {
+  return vfs_->Files();
 }
 
 void DB::RejectComputedColumns(const std::string& table) const {
+  if (connection_->HasFailedToRead()) {
+    return; // nothing is read from the table any more
+  }
   const bool written = !connection_->IsReadOnly();
   const auto rejectIf = [&](bool computed, const char* what) {
     if (computed) {

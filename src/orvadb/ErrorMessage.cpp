@@ -1,5 +1,7 @@
 #include "orvadb/ErrorMessage.h"
 
+#include "DatabaseVfs.h"
+
 #include "orvautil/FormatString.h"
 
 #include <sqlite3.h>
@@ -12,13 +14,16 @@ std::string ErrorMessage(const std::string& reason, const char* file, unsigned i
 
 std::string ErrorMessage(sqlite3* handle, const char* sql, const char* file, unsigned int line) {
   const int code = sqlite3_extended_errcode(handle);
-  // Only WorkLimit interrupts statements.
-  const char* const reason = code == SQLITE_INTERRUPT
-                                 ? "more work than a database of this size can need"
-                                 : sqlite3_errmsg(handle);
+  std::string reason = DatabaseVfs::TakeRefusal();
+  if (reason.empty()) {
+    // Only WorkLimit interrupts statements.
+    reason = code == SQLITE_INTERRUPT ? "more work than a database of this size can need"
+                                      : sqlite3_errmsg(handle);
+  }
   // A name in an untrusted schema may be of any length, but a line of the system log may not.
   return ErrorMessage(
-      util::FormatString("%.500s (extended code %d) in \"%.500s\"", reason, code, sql), file, line);
+      util::FormatString("%.500s (extended code %d) in \"%.500s\"", reason.c_str(), code, sql),
+      file, line);
 }
 
 std::string ErrorMessage(sqlite3_stmt* statement, const char* file, unsigned int line) {

@@ -1,6 +1,6 @@
 #include "orvadb/VolumeDB.h"
 
-#include "DatabaseFile.h"
+#include "DatabaseFiles.h"
 
 #include "orvadb/ErrorMessage.h"
 
@@ -10,9 +10,16 @@
 
 #include <sqlite3.h>
 
+#include <sys/stat.h>
 #include <sys/statvfs.h>
+#include <sys/types.h>
 
+#include <algorithm>
 #include <array>
+#include <chrono>
+#include <cstddef>
+#include <ctime>
+#include <thread>
 
 namespace orva::db {
 
@@ -26,18 +33,83 @@ bool IsOnReadOnlyFileSystem(const std::string& path) {
   return statvfs(path.c_str(), &status) == 0 && (status.f_flag & ST_RDONLY) != 0;
 }
 
-/// Whether the header of the open file asks for a write-ahead log. Reads through SQLite's own
-/// descriptor: closing another one on the file would drop SQLite's locks.
-bool IsInWalMode(sqlite3* handle) {
+/// Reads a part of the header of the open file into `bytes`; false if that fails. Reads through
+/// SQLite's own descriptor: closing another one on the file would drop SQLite's locks.
+template <std::size_t Count>
+bool ReadHeader(sqlite3* handle, sqlite3_int64 offset, std::array<unsigned char, Count>& bytes) {
   sqlite3_file* file = nullptr;
   sqlite3_file_control(handle, "main", SQLITE_FCNTL_FILE_POINTER, &file);
+  return file != nullptr && file->pMethods != nullptr &&
+         file->pMethods->xRead(file, bytes.data(), Count, offset) == SQLITE_OK;
+}
+
+/// Whether the header of the open file asks for a write-ahead log.
+bool IsInWalMode(sqlite3* handle) {
   constexpr sqlite3_int64 readVersionOffset = 19;
   constexpr unsigned char walVersion = 2;
   std::array<unsigned char, 1> readVersion{};
-  return file != nullptr && file->pMethods != nullptr &&
-         file->pMethods->xRead(file, readVersion.data(), readVersion.size(), readVersionOffset) ==
-             SQLITE_OK &&
-         readVersion.front() == walVersion;
+  return ReadHeader(handle, readVersionOffset, readVersion) && readVersion.front() == walVersion;
+}
+
+/// What changes when somebody writes to a file.
+struct FileState {
+  dev_t device = 0;
+  ino_t inode = 0;
+  off_t size = 0;
+  long long modified = 0; ///< nanoseconds since the epoch
+  long long changed = 0;  ///< the same
+
+  bool operator==(const FileState&) const = default;
+};
+
+/// What changes when somebody writes to a catalog. There is no lock between its users if one of
+/// them sees it on a read-only file system.
+struct CatalogState {
+  FileState database;
+  FileState log;
+  std::array<unsigned char, 4> changeCounter{};
+
+  bool operator==(const CatalogState&) const = default;
+};
+
+long long Nanoseconds(const timespec& time) {
+  return time.tv_sec * 1'000'000'000LL + time.tv_nsec;
+}
+
+FileState StateOf(const struct stat& status) {
+  return {.device = status.st_dev,
+          .inode = status.st_ino,
+          .size = status.st_size,
+          .modified = Nanoseconds(status.st_mtim),
+          .changed = Nanoseconds(status.st_ctim)};
+}
+
+CatalogState StateOf(const DatabaseFiles& files, sqlite3* handle) {
+  CatalogState state{.database = StateOf(files.Status("")),
+                     .log = StateOf(files.Status(DatabaseFiles::WRITE_AHEAD_LOG))};
+  constexpr sqlite3_int64 changeCounterOffset = 24;
+  ReadHeader(handle, changeCounterOffset, state.changeCounter);
+  return state;
+}
+
+/// The state of a catalog that differs from the one after any later change: a file system gives
+/// changes within one tick of its clock the same time.
+CatalogState SettledStateOf(const DatabaseFiles& files, sqlite3* handle) {
+  constexpr std::chrono::milliseconds tick(20);
+  constexpr int mostTicks = 5;
+  CatalogState state = StateOf(files, handle);
+  for (int i = 0; i < mostTicks; ++i) {
+    timespec now{};
+    clock_gettime(CLOCK_REALTIME, &now);
+    const std::chrono::nanoseconds age(Nanoseconds(now) -
+                                       std::max(state.database.modified, state.database.changed));
+    if (age < std::chrono::nanoseconds::zero() || age > tick) {
+      break;
+    }
+    std::this_thread::sleep_for(tick);
+    state = StateOf(files, handle);
+  }
+  return state;
 }
 
 } // namespace
@@ -51,15 +123,25 @@ VolumeDB::VolumeDB(const std::string& path, bool writable) : prefix_(path) {
   const Access access = writable ? Access::ReadWrite : Access::ReadOnly;
   Open(catalog, access, CATALOG_BUSY_TIMEOUT, false);
   if (!writable && IsOnReadOnlyFileSystem(catalog) && IsInWalMode(Handle())) {
-    // SQLite cannot make the shared memory that a log needs here. Where there is no log to read,
-    // no other process can be writing either.
-    if (!IsAbsentOrEmpty(catalog + "-wal")) {
-      throw ErrorMessage(util::FormatString("'%s' has a write-ahead log, which cannot be read on a "
-                                            "read-only file system",
-                                            catalog.c_str()));
-    }
-    Open(catalog, access, CATALOG_BUSY_TIMEOUT, true);
+    OpenImmutable(catalog);
   }
+}
+
+void VolumeDB::OpenImmutable(const std::string& catalog) {
+  const CatalogState before = SettledStateOf(Files(), Handle());
+  if (before.log.size != 0) {
+    throw ErrorMessage(util::FormatString("'%s' has a write-ahead log, which cannot be read on a "
+                                          "read-only file system",
+                                          catalog.c_str()));
+  }
+  Open(catalog, Access::ReadOnly, CATALOG_BUSY_TIMEOUT, true);
+  // The volume may be writable elsewhere.
+  CheckBeforeCommit([this, before] {
+    if (StateOf(Files(), Handle()) != before) {
+      throw ErrorMessage(
+          util::FormatString("'%s' was changed while it was read", GetPath().c_str()));
+    }
+  });
 }
 
 } // namespace orva::db

@@ -13,6 +13,8 @@
 #include "orvautil/FormatString.h"
 #include "orvautil/Path.h"
 
+#include <unistd.h>
+
 #include <algorithm>
 
 namespace orva::dbmerger {
@@ -27,17 +29,26 @@ constexpr long long TRANSCODED = 3;
 /// Items that a list has room for at first: its length is not known before it is read.
 constexpr std::size_t EXPECTED_ITEMS = 4096;
 
+/// A quarter of the machine's memory.
+long long MostMemory() {
+  return sysconf(_SC_PHYS_PAGES) / 4 * sysconf(_SC_PAGESIZE);
+}
+
 /// The memory that a list may take: in a crafted catalog a few pages may produce any number of
-/// rows. Made after the first read of a transaction, which no longer sees the catalog grow.
+/// rows.
 class ListMemory {
 public:
-  explicit ListMemory(const db::VolumeDB& catalog)
-      : catalog_(catalog), left_(LEAST + PER_BYTE * catalog.MeasureFile()) {}
+  explicit ListMemory(const db::VolumeDB& catalog) : catalog_(catalog) {}
 
-  /// Takes what one more item needs. Throws std::string when there is not enough left.
+  /// Takes what one more item needs. Throws std::string when that is more than the content can need
+  /// that was read, or more than the machine can spare.
   void Take(const db::FolderItem& item, std::size_t more) {
-    left_ -= static_cast<long long>(item.path.size() + item.name.size() + more);
-    if (left_ < 0) {
+    taken_ += static_cast<long long>(item.path.size() + item.name.size() + more);
+    if (taken_ > limit_) {
+      static const long long most = MostMemory();
+      limit_ = std::min(LEAST + PER_BYTE * catalog_.BytesRead(), most);
+    }
+    if (taken_ > limit_) {
       throw db::ErrorMessage(util::FormatString(
           "'%s' has more rows than a file of its size can hold", catalog_.GetPath().c_str()));
     }
@@ -49,7 +60,8 @@ private:
   static constexpr long long LEAST = 1 << 20;
 
   const db::VolumeDB& catalog_;
-  long long left_;
+  long long taken_ = 0;
+  long long limit_ = LEAST; ///< raised when it is reached
 };
 
 /// The row for the volume itself, which is not in its catalog.

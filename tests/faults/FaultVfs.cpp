@@ -188,7 +188,9 @@ int Delete(sqlite3_vfs* vfs, const char* path, int syncDirectory) {
     return current->Code();
   }
   current->Touching(path);
+  current->SetDeleting(true);
   const int code = Real(vfs)->xDelete(Real(vfs), path, syncDirectory);
+  current->SetDeleting(false);
   current->Deleted(path);
   if (syncDirectory != 0) {
     current->Synced(DirectoryOf(path).c_str());

@@ -55,6 +55,10 @@ public:
 
   // For the file system's side.
 
+  /// Whether SQLite is deleting a file, which it does through the daemon's code.
+  bool IsDeleting() const noexcept { return deleting_; }
+  void SetDeleting(bool deleting) noexcept { deleting_ = deleting; }
+
   /// The existing object; null when there is none.
   static FaultVfs* Current() noexcept;
 
@@ -83,6 +87,7 @@ private:
   void DirectorySynced(const std::string& path);
 
   FaultPlan plan_;
+  bool deleting_ = false;
   int seen_ = 0;
   int failed_ = 0;
   Files files_;   ///< by the path that they have

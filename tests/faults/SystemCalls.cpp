@@ -1,5 +1,5 @@
-// The daemon's own requests to the file system, without SQLite. The linker replaces its calls with
-// these functions (--wrap); those of SQLite's library stay as they are.
+// The daemon's own requests to the file system, beside those of SQLite. The linker replaces its
+// calls with these functions (--wrap); those of SQLite's library stay as they are.
 
 #include "FaultVfs.h"
 
@@ -13,12 +13,14 @@
 namespace orva::test {
 
 // The names that the linker uses.
-int RealRename(const char* from, const char* to) __asm__("__real_rename");
+int RealRename(int fromFolder, const char* from, int toFolder,
+               const char* to) __asm__("__real_renameat");
 int RealFsync(int descriptor) __asm__("__real_fsync");
-int RealUnlink(const char* path) __asm__("__real_unlink");
-int WrapRename(const char* from, const char* to) __asm__("__wrap_rename");
+int RealUnlink(int folder, const char* name, int flags) __asm__("__real_unlinkat");
+int WrapRename(int fromFolder, const char* from, int toFolder,
+               const char* to) __asm__("__wrap_renameat");
 int WrapFsync(int descriptor) __asm__("__wrap_fsync");
-int WrapUnlink(const char* path) __asm__("__wrap_unlink");
+int WrapUnlink(int folder, const char* name, int flags) __asm__("__wrap_unlinkat");
 
 namespace {
 
@@ -33,9 +35,9 @@ bool Fails(Request request, const std::string& path) {
 }
 
 /// Announces a change of the file to the file system with the fault.
-void Touching(const char* path) {
+void Touching(const std::string& path) {
   if (FaultVfs::Current() != nullptr) {
-    FaultVfs::Current()->Touching(path);
+    FaultVfs::Current()->Touching(path.c_str());
   }
 }
 
@@ -44,17 +46,23 @@ std::string PathOf(int descriptor) {
   return std::filesystem::read_symlink("/proc/self/fd/" + std::to_string(descriptor), error);
 }
 
+std::string PathIn(int folder, const char* name) {
+  return PathOf(folder) + '/' + name;
+}
+
 } // namespace
 
-int WrapRename(const char* from, const char* to) {
-  if (Fails(Request::Rename, from)) {
+int WrapRename(int fromFolder, const char* from, int toFolder, const char* to) {
+  const std::string fromPath = PathIn(fromFolder, from);
+  const std::string toPath = PathIn(toFolder, to);
+  if (Fails(Request::Rename, fromPath)) {
     return -1;
   }
-  Touching(from);
-  Touching(to);
-  const int result = RealRename(from, to);
+  Touching(fromPath);
+  Touching(toPath);
+  const int result = RealRename(fromFolder, from, toFolder, to);
   if (result == 0 && FaultVfs::Current() != nullptr) {
-    FaultVfs::Current()->Renamed(from, to);
+    FaultVfs::Current()->Renamed(fromPath.c_str(), toPath.c_str());
   }
   return result;
 }
@@ -71,14 +79,18 @@ int WrapFsync(int descriptor) {
   return result;
 }
 
-int WrapUnlink(const char* path) {
+int WrapUnlink(int folder, const char* name, int flags) {
+  const std::string path = PathIn(folder, name);
+  if (FaultVfs::Current() != nullptr && FaultVfs::Current()->IsDeleting()) {
+    return RealUnlink(folder, name, flags); // SQLite's request, which was counted there
+  }
   if (Fails(Request::Delete, path)) {
     return -1;
   }
   Touching(path);
-  const int result = RealUnlink(path);
+  const int result = RealUnlink(folder, name, flags);
   if (result == 0 && FaultVfs::Current() != nullptr) {
-    FaultVfs::Current()->Deleted(path);
+    FaultVfs::Current()->Deleted(path.c_str());
   }
   return result;
 }

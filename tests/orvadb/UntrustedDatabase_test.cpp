@@ -4,16 +4,27 @@
 
 #include "orvadb/DB.h"
 #include "orvadb/Statement.h"
+#include "orvadb/Transaction.h"
+
+#include "orvautil/FileDescriptor.h"
 
 #include "support/Thrown.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <fcntl.h>
+#include <sys/mount.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <csignal>
+#include <cstdint>
 #include <filesystem>
 #include <fstream>
 #include <functional>
 #include <string>
+#include <vector>
 
 namespace orva::db {
 namespace {
@@ -48,8 +59,10 @@ protected:
 
   /// The failure of a statement on it; empty when there is none.
   std::string FailureOf(const std::string& sql) const {
-    const TestDB db(path);
-    return Failure([&] { Statement(db, sql.c_str()).Execute(); });
+    return Failure([&] {
+      const TestDB db(path);
+      Statement(db, sql.c_str()).Execute();
+    });
   }
 
   /// Why the table is refused; empty when it is accepted.
@@ -110,11 +123,48 @@ const std::string EXPENSIVE = "SELECT count(*) FROM t x, t y WHERE +x.a = +y.b";
 const std::string THREE_THOUSAND = "WITH RECURSIVE n(i) AS (SELECT 1 UNION ALL SELECT i + 1 FROM n "
                                    "WHERE i < 3000) INSERT INTO t SELECT i, -i FROM n";
 
-TEST_F(UntrustedDatabaseTest, LargeDatabaseMayTakeMoreWork) {
+/// Makes the file large, without making EXPENSIVE read more.
+const std::string TEN_MEGABYTES =
+    "CREATE TABLE large(a); INSERT INTO large VALUES(zeroblob(10000000))";
+
+TEST_F(UntrustedDatabaseTest, ContentThatWasReadAllowsMoreWork) {
   Make(THREE_THOUSAND);
-  EXPECT_THAT(FailureOf(EXPENSIVE), HasSubstr("more work than"));
-  Make("CREATE TABLE large(a); INSERT INTO large VALUES(zeroblob(10000000))");
-  EXPECT_EQ(FailureOf(EXPENSIVE), "");
+  Make(TEN_MEGABYTES);
+  const TestDB db(path);
+  const auto count = [&] { Statement(db, EXPENSIVE.c_str()).Execute(); };
+  EXPECT_THAT(Failure(count), HasSubstr("more work than"));
+  Statement(db, "SELECT a FROM large").Execute();
+  EXPECT_EQ(Failure(count), "");
+}
+
+TEST_F(UntrustedDatabaseTest, ContentThatWasReadTwiceCountsOnce) {
+  Make(THREE_THOUSAND);
+  Make("CREATE TABLE large(a); INSERT INTO large VALUES(zeroblob(3000000))");
+  const TestDB db(path);
+  db.Rows("PRAGMA cache_size = 10");
+  for (int i = 0; i < 10; ++i) {
+    Statement(db, "SELECT a FROM large").Execute();
+  }
+  EXPECT_EQ(db.BytesRead(), static_cast<long long>(fs::file_size(path)));
+}
+
+TEST_F(UntrustedDatabaseTest, HolesAreNotContentThatWasRead) {
+  Make(THREE_THOUSAND);
+  const auto size = static_cast<long long>(fs::file_size(path));
+  fs::resize_file(path, 1LL << 40);
+  const TestDB db(path);
+  EXPECT_THAT(Failure([&] { Statement(db, EXPENSIVE.c_str()).Execute(); }),
+              HasSubstr("more work than"));
+  EXPECT_LE(db.BytesRead(), size);
+}
+
+TEST_F(UntrustedDatabaseTest, ContentOfTheLogCountsAsRead) {
+  Database writer(path);
+  writer.exec("PRAGMA journal_mode = WAL");
+  writer.exec(THREE_THOUSAND);
+  const TestDB db(path);
+  Statement(db, "SELECT a FROM t").Execute();
+  EXPECT_GT(db.BytesRead(), 4 * 4096);
 }
 
 TEST_F(UntrustedDatabaseTest, RowsThatTheConnectionHasChangedMayTakeMoreWork) {
@@ -176,59 +226,173 @@ TEST_F(UntrustedDatabaseTest, TooManyIndexesAreRefused) {
   EXPECT_THAT(Refusal(), HasSubstr("too many indexes"));
 }
 
-TEST_F(UntrustedDatabaseTest, FileThatHasGrownMayTakeMoreWork) {
-  Make(THREE_THOUSAND);
-  const TestDB db(path);
-  Make("CREATE TABLE large(a); INSERT INTO large VALUES(zeroblob(10000000))");
-  const auto count = [&] { Statement(db, EXPENSIVE.c_str()).Execute(); };
-  EXPECT_THROW(count(), std::string);
-  db.MeasureFile();
-  EXPECT_NO_THROW(count());
+/// A number as journals have it.
+std::string BigEndian(std::uint32_t number) {
+  std::string bytes;
+  for (int shift = 24; shift >= 0; shift -= 8) {
+    bytes.push_back(static_cast<char>(number >> static_cast<unsigned>(shift)));
+  }
+  return bytes;
 }
 
-/// The end of a journal that names a super-journal, which SQLite deletes after a rollback.
-const std::string SUPER_JOURNAL_MARK = "\xd9\xd5\x05\xf9\x20\xa1\x63\xd7";
+/// A journal that names a super-journal, which SQLite reads before it rolls back and deletes after.
+std::string JournalNaming(const std::string& super) {
+  std::uint32_t checksum = 0;
+  for (const char byte : super) {
+    checksum += static_cast<std::uint32_t>(byte);
+  }
+  return std::string(512, 'x') + BigEndian(1) + super +
+         BigEndian(static_cast<std::uint32_t>(super.size())) + BigEndian(checksum) +
+         "\xd9\xd5\x05\xf9\x20\xa1\x63\xd7";
+}
 
 TEST_F(UntrustedDatabaseTest, JournalThatNamesAnotherFileIsNotRolledBack) {
-  std::ofstream(path + "-journal") << "/tmp/db/victim and more" << SUPER_JOURNAL_MARK;
-  TestDB db;
-  EXPECT_THAT(Thrown([&] { db.Open(path); }),
-              HasSubstr("'/tmp/db/test.db-journal' names another file"));
-  EXPECT_EQ(db.Handle(), nullptr);
-  EXPECT_EQ(db.GetPath(), "");
-}
-
-TEST_F(UntrustedDatabaseTest, JournalWithTheMarkElsewhereIsAccepted) {
-  for (const std::string& content : {SUPER_JOURNAL_MARK + "x", SUPER_JOURNAL_MARK.substr(1)}) {
-    std::ofstream(path + "-journal") << content;
-    EXPECT_NO_THROW(TestDB db(path)) << content.size();
+  const std::string journal = JournalNaming("/tmp/db/victim");
+  for (const bool exists : {true, false}) {
+    std::ofstream(path + "-journal") << journal;
+    if (exists) {
+      std::ofstream("/tmp/db/victim") << "/tmp/db/another-journal";
+    }
+    EXPECT_THAT(FailureOf("SELECT a FROM t"),
+                HasSubstr("'/tmp/db/test.db-journal' names another file"));
+    EXPECT_EQ(fs::exists("/tmp/db/victim"), exists);
+    EXPECT_EQ(fs::file_size(path + "-journal"), journal.size());
+    fs::remove("/tmp/db/victim");
   }
 }
 
-TEST_F(UntrustedDatabaseTest, FileWithAnotherNameIsReadButNotWritten) {
+/// The files that SQLite opens, the database's own first.
+const std::vector<std::string> NAMES{"", "-journal", "-wal", "-shm"};
+
+class SideFileTest : public UntrustedDatabaseTest, public testing::WithParamInterface<std::string> {
+protected:
+  SideFileTest() {
+    if (GetParam() == "-wal" || GetParam() == "-shm") {
+      Make("PRAGMA journal_mode = WAL");
+    }
+    fs::remove(Name());
+  }
+
+  std::string Name() const { return path + GetParam(); }
+
+  /// Expects that the file is not used, for `reason`, and is still there.
+  void ExpectRefused(const std::string& reason) const {
+    EXPECT_THAT(FailureOf("INSERT INTO t VALUES(1, 2)"), HasSubstr("'" + Name() + "' " + reason));
+    EXPECT_TRUE(fs::exists(fs::symlink_status(Name())));
+  }
+};
+
+TEST_P(SideFileTest, LinkIsNotFollowed) {
+  std::ofstream("/tmp/db/victim") << "precious";
+  for (const std::string target : {"/tmp/db/victim", "/tmp/db/absent"}) {
+    fs::create_symlink(target, Name());
+    EXPECT_NE(FailureOf("INSERT INTO t VALUES(1, 2)"), "");
+    EXPECT_EQ(fs::file_size("/tmp/db/victim"), 8U);
+    EXPECT_FALSE(fs::exists("/tmp/db/absent"));
+    fs::remove(Name());
+  }
+}
+
+TEST_P(SideFileTest, FifoIsNotWaitedFor) {
+  ASSERT_EQ(mkfifo(Name().c_str(), 0666), 0);
+  ExpectRefused("is not a regular file");
+}
+
+TEST_P(SideFileTest, DirectoryIsRefused) {
+  fs::create_directory(Name());
+  ExpectRefused("is not a regular file");
+}
+
+TEST_P(SideFileTest, FileWithAnotherNameIsNotUsed) {
+  std::ofstream("/tmp/db/victim") << "precious";
+  fs::create_hard_link("/tmp/db/victim", Name());
+  ExpectRefused("has another name");
+}
+
+TEST_P(SideFileTest, FileOfAnotherUserIsNotUsed) {
+  std::ofstream(Name()) << "theirs";
+  if (chown(Name().c_str(), 1, 1) != 0) {
+    GTEST_SKIP() << "this user cannot give files away";
+  }
+  ExpectRefused("belongs to another user");
+  EXPECT_EQ(fs::file_size(Name()), 6U);
+}
+
+TEST_P(SideFileTest, MountIsNotUsed) {
+  std::ofstream("/tmp/db/victim") << "precious";
+  std::ofstream(Name()) << "x";
+  ASSERT_EQ(mount("/tmp/db/victim", Name().c_str(), nullptr, MS_BIND, nullptr), 0);
+  ExpectRefused("is a mount of its own");
+  ASSERT_EQ(umount(Name().c_str()), 0);
+  EXPECT_EQ(fs::file_size("/tmp/db/victim"), 8U);
+}
+
+INSTANTIATE_TEST_SUITE_P(Names, SideFileTest, testing::ValuesIn(NAMES), [](const auto& test) {
+  return test.param.empty() ? "database" : test.param.substr(1);
+});
+
+TEST_F(UntrustedDatabaseTest, FileWithAnotherNameIsRead) {
   fs::create_hard_link(path, "/tmp/db/snapshot");
   TestDB db;
-  EXPECT_THAT(Thrown([&] { db.Open(path); }), HasSubstr("'/tmp/db/test.db' has another name"));
-  EXPECT_NO_THROW(db.Open(path, TestDB::Access::ReadOnly, 7, false));
-
-  std::ofstream("/tmp/db/other") << "other content";
-  fs::create_hard_link("/tmp/db/other", path + "-shm");
-  EXPECT_THAT(Thrown([&] { db.Open(path, TestDB::Access::ReadOnly, 7, false); }),
-              HasSubstr("'/tmp/db/test.db-shm' has another name"));
+  db.Open(path, TestDB::Access::ReadOnly, 7, false);
+  EXPECT_NO_THROW(Statement(db, "SELECT a FROM t").Execute());
 }
 
-TEST_F(UntrustedDatabaseTest, HolesDoNotRaiseTheSize) {
-  fs::resize_file(path, 1LL << 40);
-  const TestDB db(path);
-  EXPECT_LT(db.MeasureFile(), 5 << 20);
+TEST_F(UntrustedDatabaseTest, FileOfTheOwnerOfTheDirectoryIsWritten) {
+  if (chown("/tmp/db", 1, 1) != 0 || chown(path.c_str(), 1, 1) != 0) {
+    GTEST_SKIP() << "this user cannot give files away";
+  }
+  EXPECT_EQ(FailureOf("INSERT INTO t VALUES(1, 2)"), "");
 }
 
-TEST_F(UntrustedDatabaseTest, SizeIncludesTheLog) {
-  Database writer(path);
-  writer.exec("PRAGMA journal_mode = WAL; CREATE TABLE more(a)");
+TEST_F(UntrustedDatabaseTest, LinkInTheDirectorysPlaceIsNotFollowed) {
+  fs::rename("/tmp/db", "/tmp/elsewhere");
+  fs::create_directory_symlink("/tmp/elsewhere", "/tmp/db");
+  EXPECT_NE(Failure([&] { const TestDB db(path); }), "");
+  fs::remove("/tmp/db");
+  fs::remove_all("/tmp/elsewhere");
+}
+
+TEST_F(UntrustedDatabaseTest, DirectoryThatWasReplacedIsNotWritten) {
   const TestDB db(path);
-  EXPECT_EQ(db.MeasureFile(),
-            static_cast<long long>(fs::file_size(path) + fs::file_size(path + "-wal")));
+  Statement(db, "SELECT a FROM t").Execute();
+  fs::rename("/tmp/db", "/tmp/elsewhere");
+  fs::create_directory("/tmp/db");
+  EXPECT_NE(Failure([&] { Statement(db, "INSERT INTO t VALUES(1, 2)").Execute(); }), "");
+  EXPECT_TRUE(fs::is_empty("/tmp/db"));
+  fs::remove_all("/tmp/elsewhere");
+}
+
+TEST_F(UntrustedDatabaseTest, LeaseIsWaitedForWithinBounds) {
+  const std::string journal = path + "-journal";
+  const util::FileDescriptor holder(open(journal.c_str(), O_RDWR | O_CREAT, 0644));
+  std::signal(SIGIO, SIG_IGN);
+  if (fcntl(holder.Get(), F_SETLEASE, F_WRLCK) != 0) {
+    GTEST_SKIP() << "the file system has no leases";
+  }
+  write(holder.Get(), "x", 1);
+  EXPECT_NE(FailureOf("INSERT INTO t VALUES(1, 2)"), "");
+  EXPECT_EQ(fcntl(holder.Get(), F_SETLEASE, F_UNLCK), 0);
+}
+
+TEST_F(UntrustedDatabaseTest, OtherConnectionsOfTheProcessAreNotConcerned) {
+  const TestDB db(path);
+  fs::create_directory("/tmp/db/other");
+  Database other("/tmp/db/other/test.db", true);
+  other.exec("CREATE TABLE t(a); BEGIN; INSERT INTO t VALUES(1); COMMIT");
+  EXPECT_FALSE(fs::exists("/tmp/db/other/test.db-journal"));
+}
+
+TEST_F(UntrustedDatabaseTest, AfterAFailureATransactionReadsNothingMore) {
+  Make(THREE_THOUSAND);
+  TestDB db;
+  db.Open(path, TestDB::Access::ReadOnly, 7, false);
+  Transaction transaction(db, 1000);
+  const std::string endless =
+      "WITH RECURSIVE n(i) AS (SELECT 1 UNION ALL SELECT i + 1 FROM n) SELECT count(*) FROM n";
+  EXPECT_NE(Statement(db, endless.c_str()).Step(), Statement::ROW);
+  EXPECT_NE(Statement(db, "SELECT a FROM t").Step(), Statement::ROW);
+  EXPECT_THAT(Thrown([&] { transaction.Commit(); }), HasSubstr("more work than"));
 }
 
 /// Creation of a database.

@@ -38,25 +38,31 @@ public:
   };
   using CheckedOut = std::unique_ptr<sqlite3_stmt, CheckIn>;
 
-  /// Belongs to `handle`, which it does not own, on a database of `bytes` bytes. `busyTimeout` is
-  /// how long, in milliseconds, statements outside of transactions wait for other connections.
-  Connection(sqlite3* handle, int busyTimeout, long long bytes);
+  /// Belongs to `handle`, which it does not own. `busyTimeout` is how long, in milliseconds,
+  /// statements outside of transactions wait for other connections.
+  Connection(sqlite3* handle, int busyTimeout);
   Connection(const Connection&) = delete;
   Connection& operator=(const Connection&) = delete;
   ~Connection();
 
   bool IsReadOnly() const noexcept;
 
-  /// The database turned out to have `bytes` bytes.
-  void SetFileSize(long long bytes) noexcept;
+  /// Bytes that statements have read so far from the database's files, at most those that there
+  /// are.
+  long long BytesRead() const noexcept;
 
   /// Hands out the compiled form of `sql`; compiles it if the cache has none free. Throws
   /// also when SQLite has rolled back the running transaction.
   CheckedOut CheckOut(const char* sql, const char* file, unsigned int line);
 
   /// Runs a statement to the next row or its end and returns SQLite's result code. After a failure
-  /// the running transaction cannot be committed.
+  /// the running transaction cannot be committed; if it only reads, its statements fail without
+  /// reading any more.
   int Step(sqlite3_stmt* statement, const char* file, unsigned int line);
+
+  /// Has every transaction call `check` before it commits. What that throws keeps the transaction
+  /// from committing.
+  void CheckBeforeCommit(std::function<void()> check) { checkBeforeCommit_ = std::move(check); }
 
   /// Begins a transaction, as a writer where the connection can write. Its statements wait
   /// `busyTimeout` milliseconds for other connections.
@@ -64,6 +70,11 @@ public:
 
   /// Number of the running transaction, different for every one; 0 while there is none.
   unsigned long long RunningTransaction() const noexcept { return transaction_; }
+
+  /// Whether the running transaction only reads and a step of it has failed.
+  bool HasFailedToRead() const noexcept {
+    return !failedStep_.empty() && transaction_ != 0 && IsReadOnly();
+  }
 
   /// Has the running transaction execute `sql`, a literal, before it commits.
   void ExecuteBeforeCommit(const char* sql);
@@ -90,6 +101,7 @@ private:
   sqlite3* handle_;
   int busyTimeout_;
   std::unique_ptr<WorkLimit> workLimit_;
+  std::function<void()> checkBeforeCommit_; ///< may be empty
   /// By SQL text; there are few, because values are never part of a text. Null while in use.
   std::unordered_map<std::string, Compiled, TextHash, std::equal_to<>> statements_;
 

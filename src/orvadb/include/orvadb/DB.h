@@ -9,6 +9,8 @@ struct sqlite3;
 namespace orva::db {
 
 class Connection;
+class DatabaseFiles;
+class DatabaseVfs;
 
 /// A connection to one SQLite database file. Used by one thread at a time. Statements and
 /// transactions on it end before it is closed, opened again or destroyed.
@@ -46,10 +48,9 @@ public:
   /// throws std::string with the caller's `file` and `line` and the statement `sql`.
   Connection& OpenConnection(const char* sql, const char* file, unsigned int line) const;
 
-  /// Bytes of the open database with its log; holes count little. From now on the limit of the
-  /// statements' work follows this size, because the file may have grown while this connection
-  /// waited for another writer. Throws std::string.
-  long long MeasureFile() const;
+  /// Bytes of the open database and its log that statements have read so far from the file, at most
+  /// those that there are.
+  long long BytesRead() const noexcept;
 
   /// Makes sure that the values in `table` are those that were stored there: refuses generated
   /// columns and, where the connection can write, computed defaults, indexes on expressions or on
@@ -85,11 +86,19 @@ protected:
   /// Row id of the last row inserted.
   long long LastInsertId() const noexcept;
 
+  /// Has every transaction on the open connection call `check` before it commits. What that throws
+  /// keeps the transaction from committing.
+  void CheckBeforeCommit(std::function<void()> check) const;
+
+  /// The files of the open database.
+  const DatabaseFiles& Files() const noexcept;
+
   /// The open connection, null while closed; still owned by this object.
   sqlite3* Handle() const noexcept { return handle_; }
 
 private:
-  sqlite3* handle_ = nullptr; ///< owned; released by Close
+  std::unique_ptr<DatabaseVfs> vfs_; ///< null while closed
+  sqlite3* handle_ = nullptr;        ///< owned; released by Close
   std::string path_;
   std::unique_ptr<Connection> connection_; ///< what belongs to the open handle; null while closed
 };

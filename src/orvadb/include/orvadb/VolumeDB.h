@@ -18,6 +18,9 @@ public:
   std::string GetPrefix() const override { return prefix_; }
 
 private:
+  /// Opens a catalog in WAL mode where SQLite cannot make the shared memory for its log.
+  void OpenImmutable(const std::string& catalog);
+
   std::string prefix_;
 };
 
