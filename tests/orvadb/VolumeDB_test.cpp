@@ -3,6 +3,7 @@
 #include "system/Database.h"
 
 #include "orvadb/Statement.h"
+#include "orvadb/Transaction.h"
 #include "orvadb/VolumeDB.h"
 
 #include "support/Thrown.h"
@@ -16,6 +17,7 @@
 #include <cerrno>
 #include <filesystem>
 #include <fstream>
+#include <functional>
 #include <string>
 #include <system_error>
 #include <vector>
@@ -282,6 +284,74 @@ INSTANTIATE_TEST_SUITE_P(Volume, ReadOnlyVolumeTest,
                          testing::Values("Plain", "Que?mode=rwc", "Ha#sh", "Per%41cent", "A b&c=d",
                                          "Caf\xc3\xa9"),
                          TestName);
+
+/// A catalog in WAL mode that the daemon sees on a read-only mount, and its indexer on a writable
+/// one. Nothing is in the log before a test.
+class ReadOnlyViewTest : public testing::Test {
+protected:
+  ReadOnlyViewTest() {
+    indexer.exec("PRAGMA journal_mode = WAL; CREATE TABLE t(a); INSERT INTO t VALUES('kept')");
+    EmptyLog();
+    fs::create_directory("/shares/View");
+    if (mount("/shares/Vol", "/shares/View", nullptr, MS_BIND, nullptr) != 0 ||
+        mount(nullptr, "/shares/View", nullptr, MS_BIND | MS_REMOUNT | MS_RDONLY, nullptr) != 0) {
+      throw std::system_error(errno, std::generic_category(), "mount");
+    }
+  }
+  ~ReadOnlyViewTest() override { umount2("/shares/View", MNT_DETACH); }
+
+  void EmptyLog() { indexer.exec("PRAGMA wal_checkpoint(TRUNCATE)"); }
+
+  /// Reads the catalog in one transaction, in which `change` happens. Returns why it fails.
+  static std::string ReadDuring(const std::function<void()>& change) {
+    const Catalog db("/shares/View", false);
+    Transaction transaction(db, 1000);
+    EXPECT_THAT(db.Rows("SELECT a FROM t"), ElementsAre("kept"));
+    change();
+    try {
+      transaction.Commit();
+    } catch (const std::string& failure) {
+      return failure;
+    }
+    return {};
+  }
+
+  const Mount volume{"/shares/Vol"};
+  Database indexer{"/shares/Vol/.orva/orva.db", true};
+};
+
+TEST_F(ReadOnlyViewTest, AnUnchangedCatalogIsRead) {
+  EXPECT_EQ(ReadDuring([] {}), "");
+}
+
+TEST_F(ReadOnlyViewTest, ACatalogThatWasWrittenAndCheckpointedIsNotReadAsOneState) {
+  EXPECT_THAT(ReadDuring([&] {
+                indexer.exec("UPDATE t SET a = 'late'");
+                EmptyLog();
+              }),
+              HasSubstr("'/shares/View/.orva/orva.db' was changed while it was read"));
+}
+
+TEST_F(ReadOnlyViewTest, ACatalogWhoseLogWasWrittenIsNotReadAsOneState) {
+  EXPECT_THAT(ReadDuring([&] { indexer.exec("UPDATE t SET a = 'late'"); }),
+              HasSubstr("was changed while it was read"));
+}
+
+TEST_F(ReadOnlyViewTest, ACatalogThatWasReplacedIsNotReadAsOneState) {
+  EXPECT_THAT(ReadDuring([&] {
+                fs::copy_file("/shares/Vol/.orva/orva.db", "/shares/Vol/.orva/copy");
+                fs::rename("/shares/Vol/.orva/copy", "/shares/Vol/.orva/orva.db");
+              }),
+              HasSubstr("was changed while it was read"));
+}
+
+TEST_F(ReadOnlyViewTest, TheNextReadSeesTheChange) {
+  ReadDuring([&] {
+    indexer.exec("UPDATE t SET a = 'late'");
+    EmptyLog();
+  });
+  EXPECT_THAT(Catalog("/shares/View", false).Rows("SELECT a FROM t"), ElementsAre("late"));
+}
 
 } // namespace
 } // namespace orva::db
