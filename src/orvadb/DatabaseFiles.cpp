@@ -92,9 +92,9 @@ util::FileDescriptor DatabaseFiles::Open(std::string_view suffix, int flags, mod
     if (fstat(file.Get(), &status) == 0) {
       refusal = Refusal(suffix, status);
     }
-    if (refusal.empty() && (written_ || !suffix.empty()) && IsOnAnotherMount(file.Get())) {
-      refusal = util::FormatString("'%s%s' is a mount of its own", path_.c_str(),
-                                   std::string(suffix).c_str());
+    if (refusal.empty() && MayBeWritten(suffix) && IsOnAnotherMount(file.Get())) {
+      refusal =
+          util::FormatString("'%s' is a mount of its own", (path_ + std::string(suffix)).c_str());
     }
   }
   if (!refusal.empty()) {
@@ -167,18 +167,22 @@ std::string DatabaseFiles::Name(std::string_view suffix) const {
 
 /// Why a file must not be used; empty if it may be.
 std::string DatabaseFiles::Refusal(std::string_view suffix, const struct stat& status) const {
-  const char* reason = nullptr;
+  const std::string path = path_ + std::string(suffix);
   if (!S_ISREG(status.st_mode)) {
-    reason = "is not a regular file";
-  } else if ((written_ || !suffix.empty()) && status.st_nlink > 1) {
-    // Even to read a database SQLite may write into its logs or change their owner.
-    reason = "has another name";
-  } else if (written_ && status.st_uid != folderStatus_.st_uid && status.st_uid != geteuid()) {
-    reason = "belongs to another user";
+    return util::FormatString("'%s' is not a regular file", path.c_str());
   }
-  return reason == nullptr
-             ? ""
-             : util::FormatString("'%s%s' %s", path_.c_str(), std::string(suffix).c_str(), reason);
+  if (MayBeWritten(suffix) && status.st_nlink > 1) {
+    return util::FormatString("'%s' has another name", path.c_str());
+  }
+  if (written_ && status.st_uid != folderStatus_.st_uid && status.st_uid != geteuid()) {
+    return util::FormatString("'%s' belongs to another user", path.c_str());
+  }
+  return {};
+}
+
+/// Even to read a database SQLite may write into its logs or change their owner.
+bool DatabaseFiles::MayBeWritten(std::string_view suffix) const {
+  return written_ || !suffix.empty();
 }
 
 /// Whether the path still leads to the directory; otherwise errno says why not.

@@ -63,6 +63,7 @@ public:
 private:
   std::string Name(std::string_view suffix) const;
   std::string Refusal(std::string_view suffix, const struct stat& status) const;
+  bool MayBeWritten(std::string_view suffix) const;
   bool IsOnAnotherMount(int descriptor) const;
   bool IsInPlace() const;
   bool DeleteLogs() const;

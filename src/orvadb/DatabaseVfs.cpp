@@ -194,7 +194,8 @@ bool DatabaseVfs::Accepts(const char* path) const noexcept {
     return true;
   }
   try {
-    lastRefusal = util::FormatString("'%s-journal' names another file", files_.Path().c_str());
+    lastRefusal =
+        util::FormatString("'%s' names another file", (files_.Path() + "-journal").c_str());
   } catch (const std::exception&) {
     lastRefusal.clear(); // no memory: SQLite's own message has to do
   }
