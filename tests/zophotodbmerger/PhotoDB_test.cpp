@@ -9,6 +9,7 @@
 
 #include "orvadb/File.h"
 #include "orvadb/Folder.h"
+#include "orvadb/Statement.h"
 
 #include "orvautil/Exception.h"
 #include "orvautil/OwnerVector.h"
@@ -854,6 +855,17 @@ TEST_F(PhotoDBTest, StatisticsWithoutATableAreThrown) {
   EXPECT_THROW(again.GetStatistics(VOLUME), std::string);
   EXPECT_THROW(again.InsertStatistics(VOLUME), std::string);
   EXPECT_THROW(again.UpdateStatistics({VOLUME, 1, 2, 3}), std::string);
+  EXPECT_THAT(Logged(), IsEmpty());
+}
+
+TEST_F(PhotoDBTest, StatisticsWithoutATableAreThrownAlsoAfterEarlierUses) {
+  photos.InsertStatistics(VOLUME);
+  photos.UpdateStatistics({VOLUME, 1, 2, 3});
+  ASSERT_TRUE(photos.GetStatistics(VOLUME));
+  db::Statement(photos, "DROP TABLE Statistics").Execute();
+  EXPECT_THROW(photos.GetStatistics(VOLUME), std::string);
+  EXPECT_THROW(photos.InsertStatistics(VOLUME), std::string);
+  EXPECT_THROW(photos.UpdateStatistics({VOLUME, 1, 2, 3}), std::string);
   EXPECT_THAT(Logged(), IsEmpty());
 }
 
