@@ -9,7 +9,35 @@
 
 #include <sqlite3.h>
 
+#include <algorithm>
+#include <array>
+#include <utility>
+
 namespace orva::db {
+
+namespace {
+
+/// Whether `sql` may change the schema, or a setting that SQLite compiles statements with:
+/// everything but the statements on rows and most of those on transactions.
+bool MayChangeSchema(const char* sql) {
+  return std::ranges::none_of(
+      std::to_array<std::string_view>({"SELECT", "INSERT", "UPDATE", "DELETE", "BEGIN", "COMMIT"}),
+      [sql](std::string_view word) {
+        return sqlite3_strnicmp(sql, word.data(), static_cast<int>(word.size())) == 0;
+      });
+}
+
+/// Counts the requests for pages of the file so far.
+std::pair<int, int> PageRequests(sqlite3* handle) {
+  int hits = 0;
+  int misses = 0;
+  int highest = 0;
+  sqlite3_db_status(handle, SQLITE_DBSTATUS_CACHE_HIT, &hits, &highest, 0);
+  sqlite3_db_status(handle, SQLITE_DBSTATUS_CACHE_MISS, &misses, &highest, 0);
+  return {hits, misses};
+}
+
+} // namespace
 
 void StatementFinalizer::operator()(sqlite3_stmt* statement) const noexcept {
   sqlite3_finalize(statement);
@@ -19,7 +47,8 @@ void Connection::CheckIn::operator()(sqlite3_stmt* statement) const noexcept {
   // A failed step was reported when it was made; reset only repeats its code.
   sqlite3_reset(statement);
   sqlite3_clear_bindings(statement);
-  place->reset(statement);
+  place->statement.reset(statement);
+  place->schema = schema;
 }
 
 Connection::Connection(sqlite3* handle, int busyTimeout)
@@ -48,38 +77,52 @@ Connection::CheckedOut Connection::CheckOut(const char* sql, const char* file, u
   workLimit_->Restart();
   DatabaseVfs::TakeRefusal(); // of a statement that went on without the file
   const auto kept = statements_.find(std::string_view(sql));
-  Compiled& place = kept != statements_.end() ? kept->second : statements_[sql];
-  Compiled compiled = place ? std::move(place) : Compile(sql, file, line);
-  return {compiled.release(), CheckIn{&place}};
+  Kept& place = kept != statements_.end() ? kept->second : statements_[sql];
+  Compiled compiled = std::move(place.statement);
+  if (!compiled || place.schema != schema_) {
+    place.mayChangeSchema = MayChangeSchema(sql);
+    compiled = Compile(sql, file, line);
+  }
+  return {compiled.release(), CheckIn{.place = &place, .schema = schema_}};
 }
 
-Connection::Compiled Connection::Compile(const char* sql, const char* file,
-                                         unsigned int line) const {
+Connection::Compiled Connection::Compile(const char* sql, const char* file, unsigned int line) {
+  const auto requestsBefore = PageRequests(handle_);
   sqlite3_stmt* statement = nullptr;
   // A virtual table would run a module's code on untrusted data.
   const int code = sqlite3_prepare_v3(
       handle_, sql, -1, SQLITE_PREPARE_PERSISTENT | SQLITE_PREPARE_NO_VTAB, &statement, nullptr);
   Compiled compiled(statement);
+  // Compiling reads pages only to load the schema.
+  if (PageRequests(handle_) != requestsBefore) {
+    ++schema_;
+  }
   if (code != SQLITE_OK) {
     throw ErrorMessage(handle_, sql, file, line);
   }
   return compiled;
 }
 
-int Connection::Step(sqlite3_stmt* statement, const char* file, unsigned int line) {
+int Connection::Step(const CheckedOut& statement, const char* file, unsigned int line) {
   if (HasFailedToRead()) {
     return SQLITE_ABORT;
   }
-  const int code = sqlite3_step(statement);
-  if (code != SQLITE_ROW && code != SQLITE_DONE && failedStep_.empty()) {
-    failedStep_ = ErrorMessage(statement, file, line);
+  const int code = sqlite3_step(statement.get());
+  const bool failed = code != SQLITE_ROW && code != SQLITE_DONE;
+  if (failed && failedStep_.empty()) {
+    failedStep_ = ErrorMessage(statement.get(), file, line);
+  }
+  // The first step compiles the statement again if another program has changed the schema.
+  if (failed || statement.get_deleter().place->mayChangeSchema ||
+      sqlite3_stmt_status(statement.get(), SQLITE_STMTSTATUS_REPREPARE, 1) != 0) {
+    ++schema_;
   }
   return code;
 }
 
-void Connection::Execute(sqlite3_stmt* statement, const char* file, unsigned int line) {
+void Connection::Execute(const CheckedOut& statement, const char* file, unsigned int line) {
   if (Step(statement, file, line) != SQLITE_DONE) {
-    throw ErrorMessage(statement, file, line);
+    throw ErrorMessage(statement.get(), file, line);
   }
 }
 
@@ -89,7 +132,7 @@ void Connection::BeginTransaction(unsigned int busyTimeout, const char* file, un
   beforeCommit_.clear();
   sqlite3_busy_timeout(handle_, static_cast<int>(busyTimeout));
   try {
-    Execute(begin.get(), file, line);
+    Execute(begin, file, line);
     transaction_ = ++transactions_;
   } catch (...) {
     sqlite3_busy_timeout(handle_, busyTimeout_);
@@ -111,9 +154,9 @@ void Connection::CommitTransaction(const char* file, unsigned int line) {
     checkBeforeCommit_();
   }
   for (const char* const sql : beforeCommit_) {
-    Execute(CheckOut(sql, file, line).get(), file, line);
+    Execute(CheckOut(sql, file, line), file, line);
   }
-  Execute(CheckOut("COMMIT", file, line).get(), file, line);
+  Execute(CheckOut("COMMIT", file, line), file, line);
   EndTransaction();
 }
 
@@ -122,6 +165,7 @@ void Connection::RollBackTransaction() noexcept {
   if (sqlite3_get_autocommit(handle_) == 0) {
     sqlite3_exec(handle_, "ROLLBACK", nullptr, nullptr, nullptr);
   }
+  ++schema_; // changes of the schema were rolled back, too
   EndTransaction();
 }
 

@@ -16,7 +16,7 @@ Statement::Statement(const DB& db, const char* sql, const char* file, unsigned i
       statement_(connection_.CheckOut(sql, file, line)) {}
 
 int Statement::Step(const char* file, unsigned int line) {
-  return connection_.Step(statement_.get(), file, line);
+  return connection_.Step(statement_, file, line);
 }
 
 bool Statement::Fetch(const char* file, unsigned int line) {

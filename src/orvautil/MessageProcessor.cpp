@@ -18,6 +18,7 @@
 
 #include <algorithm>
 #include <array>
+#include <optional>
 
 namespace orva::util {
 
@@ -179,7 +180,10 @@ void MessageProcessor::ProcessMessage(Stream& stream, Bytes message) const {
 
 void MessageProcessor::ParseMessage(Stream& stream, const unsigned char* data,
                                     unsigned long length) const {
-  if (spent_) {
+  std::optional<ParserScope> ownParser;
+  if (!parser_) {
+    ownParser.emplace(parser_);
+  } else if (spent_) {
     parser_ = std::make_unique<MessageParser>();
   }
   spent_ = length > ORDINARY_LENGTH;

@@ -7,17 +7,15 @@
 namespace orva::util {
 
 Thread::~Thread() {
-  try {
-    Thread::Wait();
-  } catch (...) {
-    // Owners wait before. A thread that cannot be joined is left running.
-    thread_.detach();
-  }
+  thread_.detach();
 }
 
 void Thread::Create(int stackMebibytes, unsigned flags, bool detached) {
   if (stackMebibytes <= 0 || flags != 0 || detached) {
     throw Exception("a thread needs a stack size, no flags, and must be joinable");
+  }
+  if (thread_.joinable()) {
+    throw Exception("the thread was started before and not waited for");
   }
   boost::thread::attributes attributes;
   attributes.set_stack_size(static_cast<std::size_t>(stackMebibytes) << 20U);

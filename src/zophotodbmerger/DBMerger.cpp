@@ -139,20 +139,17 @@ Applied ApplyCatalog(const PhotoDB& photos, const db::VolumeDB& catalog, const s
 
 DBMerger::DBMerger() {
   Create(8, 0, false);
-  registryCopied_.wait();
+  runState_->registryCopied.wait(false);
 }
 
 void DBMerger::Run() {
-  std::vector<std::string> mountPoints;
-  {
-    struct Copied {
-      std::latch& latch;
-      ~Copied() { latch.count_down(); }
-    } const copied{registryCopied_};
-    mountPoints = RegisteredMountPoints();
-  }
+  const std::shared_ptr<RunState> state = runState_;
+  const std::vector<std::string> mountPoints = RegisteredMountPoints();
+  state->registryCopied = true;
+  state->registryCopied.notify_all();
+  // From here on the merger may be destroyed.
   for (const std::string& mountPoint : mountPoints) {
-    if (stopRequested) {
+    if (state->stopRequested) {
       break;
     }
     syslog(LOG_LOCAL1 | LOG_INFO, "Iterating over mount point %s\n", mountPoint.c_str());

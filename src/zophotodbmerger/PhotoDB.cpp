@@ -12,9 +12,11 @@
 #include "orvadb/Statement.h"
 
 #include "orvautil/Exception.h"
+#include "orvautil/FileDescriptor.h"
 #include "orvautil/FormatString.h"
 #include "orvautil/Path.h"
 
+#include <dirent.h>
 #include <fcntl.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -48,9 +50,54 @@ bool IsDirectory(const std::string& path) {
   return lstat(path.c_str(), &status) == 0 && S_ISDIR(status.st_mode);
 }
 
-/// chmod that does not follow a link in the directory's place.
-bool ChangeDirectoryMode(const std::string& path, mode_t mode) {
-  return fchmodat(AT_FDCWD, path.c_str(), mode, AT_SYMLINK_NOFOLLOW) == 0;
+struct CloseDirectory {
+  void operator()(DIR* directory) const noexcept { closedir(directory); }
+};
+
+/// Whether an open directory has no entries.
+bool IsEmpty(int directory) {
+  const std::unique_ptr<DIR, CloseDirectory> entries(
+      fdopendir(openat(directory, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC)));
+  if (!entries) {
+    return false;
+  }
+  const dirent* entry = readdir(entries.get());
+  while (entry != nullptr && std::string_view("..").starts_with(entry->d_name)) {
+    entry = readdir(entries.get());
+  }
+  return entry == nullptr;
+}
+
+/// Creates the directory at `path` for everybody to write. Returns whether it was created.
+bool CreateDirectoryForEverybody(const std::string& path) {
+  if (!util::Path(path).Create(DIRECTORY_PERMISSIONS)) {
+    return false;
+  }
+  // Every user may rename what is in the root of a volume. So the name can stand for another
+  // directory by now, the mode of which must not change.
+  const util::FileDescriptor directory(
+      open(path.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+  struct stat created {};
+  struct stat location {};
+  if (!directory || fstat(directory.Get(), &created) != 0 ||
+      fstatat(directory.Get(), "..", &location, 0) != 0) {
+    return false;
+  }
+  // Some file systems report one owner for everything.
+  const bool isOwn = created.st_uid == geteuid() || created.st_uid == location.st_uid;
+  if (!isOwn || !IsEmpty(directory.Get())) {
+    return false;
+  }
+  if (fchmod(directory.Get(), EVERYBODY) == 0) {
+    return true;
+  }
+  // Otherwise the next attempt would accept the directory with the wrong mode.
+  struct stat present {};
+  if (lstat(path.c_str(), &present) == 0 && present.st_dev == created.st_dev &&
+      present.st_ino == created.st_ino) {
+    rmdir(path.c_str());
+  }
+  return false;
 }
 
 /// The path of the folder that holds the folder at `path`, with its trailing separator.
@@ -114,12 +161,9 @@ void HandOver(std::unique_ptr<Record> record, std::vector<Record*>& records) {
 PhotoDB::PhotoDB(const std::string& location, CacheUse cacheUse)
     : dbLocation(util::MakePath(util::Path(location).Canonicalize(), ".zophotos")),
       cacheUse_(cacheUse) {
-  if (!IsPresent(dbLocation)) {
-    util::Path(dbLocation).Create(DIRECTORY_PERMISSIONS);
-    if (!ChangeDirectoryMode(dbLocation, EVERYBODY)) {
-      throw util::Exception(
-          util::FormatString("Change permissions failed on dbLocation: '%s'", dbLocation.c_str()));
-    }
+  if (!IsPresent(dbLocation) && !CreateDirectoryForEverybody(dbLocation)) {
+    throw util::Exception(
+        util::FormatString("Change permissions failed on dbLocation: '%s'", dbLocation.c_str()));
   }
   if (!IsDirectory(dbLocation)) {
     throw Error("Invalid DB location : '" + dbLocation + "'");

@@ -35,6 +35,7 @@ namespace {
 using test::LogLine;
 using test::PairEnd;
 using test::SocketPair;
+using testing::Contains;
 using testing::ElementsAre;
 using testing::IsEmpty;
 using testing::Pair;
@@ -110,6 +111,13 @@ protected:
       pair.far.Close();
     });
     processor.ReadMessages(pair.near);
+  }
+
+  /// Lets the processor parse one message.
+  void Parse(const std::string& message) {
+    PairEnd none(-1);
+    processor.ParseMessage(none, reinterpret_cast<const unsigned char*>(message.data()),
+                           message.size());
   }
 
   /// Everything that was logged so far.
@@ -465,6 +473,36 @@ TEST_F(MessageProcessorTest, ManyAttributesAreHandled) {
   }
   Read(message + "/>" + END + "<b/>" + END);
   EXPECT_THAT(processor.handled, ElementsAre("a", "b"));
+}
+
+// One message without a stream of them.
+
+TEST_F(MessageProcessorTest, AMessageCanBeParsedOutsideOfReadMessages) {
+  Parse("<a/>");
+  Parse(MessageOf("long", LIMIT));
+  Parse("<b/>");
+  EXPECT_THAT(processor.handled, ElementsAre("a", "long", "b"));
+  EXPECT_THAT(processor.bytes, Contains("<b/>"));
+  Read("<c/>" + END);
+  Parse("<d/>");
+  EXPECT_THAT(processor.handled, ElementsAre("a", "long", "b", "c", "d"));
+}
+
+TEST_F(MessageProcessorTest, AnIllFormedMessageOutsideOfReadMessagesIsThrown) {
+  EXPECT_THROW(Parse("<a>"), Exception);
+  EXPECT_THROW(Parse("<!DOCTYPE a><a/>"), Exception);
+  processor.thrower = [] { throw std::runtime_error("broken handler"); };
+  EXPECT_THROW(Parse("<throw/>"), std::runtime_error);
+  Parse("<b/>");
+  EXPECT_THAT(processor.handled, ElementsAre("throw", "b"));
+  EXPECT_THAT(Logged(), IsEmpty());
+}
+
+TEST_F(MessageProcessorTest, AHandlerMayParseAnotherMessage) {
+  processor.thrower = [this] { Parse("<inner>" + std::string(LIMIT / 2, 'x') + "</inner>"); };
+  Read("<throw/>" + END + "<b/>" + END);
+  Parse("<throw/>");
+  EXPECT_THAT(processor.handled, ElementsAre("throw", "inner", "b", "throw", "inner"));
 }
 
 // Exceptions from the handler.

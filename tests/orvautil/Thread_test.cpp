@@ -73,6 +73,15 @@ TEST(Thread, WaitReturnsAtOnceWhenThereIsNothingToWaitFor) {
   EXPECT_EQ(worker.runs, 1);
 }
 
+TEST(Thread, AThreadThatWasNotWaitedForIsNotStartedAgain) {
+  Worker worker;
+  worker.Create(8, 0, false);
+  EXPECT_THROW(worker.Create(8, 0, false), Exception);
+  worker.gate.count_down();
+  worker.Wait();
+  EXPECT_EQ(worker.runs, 1);
+}
+
 TEST(Thread, InvalidArgumentsAreRefusedAndStartNothing) {
   Worker worker;
   worker.gate.count_down();

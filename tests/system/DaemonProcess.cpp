@@ -2,6 +2,8 @@
 
 #include "support/Programs.h"
 
+#include <gtest/gtest.h>
+
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
@@ -34,6 +36,12 @@ DaemonProcess::DaemonProcess(std::string directory, std::string output,
                            .directory = directory_,
                            .environment = environment,
                            .held = held}) {}
+
+DaemonProcess::~DaemonProcess() {
+  if (IsRunning()) {
+    ADD_FAILURE() << "the daemon still runs";
+  }
+}
 
 std::vector<std::string> DaemonProcess::StandardOutput() const {
   std::ifstream file(output_);

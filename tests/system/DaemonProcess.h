@@ -8,7 +8,7 @@
 namespace orva::test {
 
 /// The daemon as a process of its own, with a new working directory and its standard output in a
-/// file. Killed when the object ends while it still runs.
+/// file.
 class DaemonProcess {
 public:
   /// Starts the daemon in `directory`, which is created; `environment` ("NAME=value") is added to
@@ -17,6 +17,13 @@ public:
   /// ORVA_TEST_LAUNCHER, that program starts the daemon. Throws std::system_error.
   DaemonProcess(std::string directory, std::string output,
                 const std::vector<std::string>& environment = {}, bool held = false);
+
+  DaemonProcess(const DaemonProcess&) = delete;
+  DaemonProcess& operator=(const DaemonProcess&) = delete;
+
+  /// Kills a daemon that still runs, and fails the test: its exit status was not checked, which
+  /// would tell whether a sanitizer has found a leak.
+  ~DaemonProcess();
 
   /// Waits for the daemon's end, and returns its status as Program does. Throws std::runtime_error
   /// after the deadline.

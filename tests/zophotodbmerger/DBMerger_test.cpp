@@ -6,8 +6,18 @@
 #include "PhotoDB.h"
 #include "VolumeInfoManager.h"
 
+#include "orvautil/FileDescriptor.h"
+#include "orvautil/Socket.h"
+
+#include <sys/socket.h>
+#include <sys/time.h>
+
+#include <algorithm>
+#include <cerrno>
 #include <fstream>
+#include <future>
 #include <stdexcept>
+#include <system_error>
 #include <thread>
 
 namespace orva::test {
@@ -18,6 +28,7 @@ using dbmerger::PhotoDB;
 using dbmerger::VolumeInfo;
 using dbmerger::VolumeInfoManager;
 using ::testing::ElementsAre;
+using ::testing::HasSubstr;
 using ::testing::IsEmpty;
 
 const std::string MASTER = "/shares/Master/";
@@ -111,6 +122,56 @@ TEST_F(DaemonLayerTest, MergerCopiesTheRegistryWhenItIsCreated) {
   VolumeInfoManager::Instance().removeVolumeInfo(volume);
   merger.Wait();
   EXPECT_THAT(LoggedByAllThreads(), ElementsAre(Info("Iterating over mount point /shares/a/\n")));
+}
+
+TEST_F(DaemonLayerTest, MergersBodyCanBeRunAgain) {
+  VolumeInfo volume{.mountPoint = MakeDirectory("/shares/a/")};
+  VolumeInfoManager::Instance().addVolumeInfo(volume);
+  DBMerger merger;
+  merger.Wait();
+  merger.Run();
+  merger.Create(8, 0, false);
+  merger.Wait();
+  const LogLine line = Info("Iterating over mount point /shares/a/\n");
+  EXPECT_THAT(LoggedByAllThreads(), ElementsAre(line, line, line));
+}
+
+/// A system log that is full, because it is not read, before the thread of a merger has logged all
+/// volumes.
+class FullLog : public ::testing::Test {
+protected:
+  static constexpr int VOLUMES = 900;
+
+  FullLog() {
+    for (int i = 0; i < VOLUMES; ++i) {
+      VolumeInfo volume{.mountPoint = MakeDirectory("/shares/" + std::to_string(i) + "/")};
+      VolumeInfoManager::Instance().addVolumeInfo(volume);
+    }
+    const util::Socket::Address address("/dev/log");
+    const timeval deadline{.tv_sec = DEADLINE.count(), .tv_usec = 0};
+    if (bind(socket_.Get(), address.Get(), address.Length()) != 0 ||
+        setsockopt(socket_.Get(), SOL_SOCKET, SO_RCVTIMEO, &deadline, sizeof deadline) != 0) {
+      throw std::system_error(errno, std::generic_category(), "/dev/log");
+    }
+  }
+
+  /// The next line.
+  std::string Read() const {
+    std::string line(1000, '\0');
+    line.resize(std::max<ssize_t>(recv(socket_.Get(), line.data(), line.size(), 0), 0));
+    return line;
+  }
+
+private:
+  util::FileDescriptor socket_{socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0)};
+};
+
+TEST_F(FullLog, DestroyingAMergerNeitherStopsNorJoinsItsThread) {
+  auto destroyed = std::async(std::launch::async, [] { std::make_unique<DBMerger>().reset(); });
+  EXPECT_EQ(std::future_status::ready, destroyed.wait_for(DEADLINE));
+  for (int i = 0; i < VOLUMES; ++i) {
+    ASSERT_THAT(Read(), HasSubstr("Iterating over mount point /shares/" + std::to_string(i) + "/"));
+  }
 }
 
 // Merges.

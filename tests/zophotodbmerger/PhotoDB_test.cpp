@@ -5,19 +5,26 @@
 #include "Folder.h"
 #include "PhotoDB.h"
 #include "Statistics.h"
+#include "Tracer.h"
 
 #include "orvadb/File.h"
 #include "orvadb/Folder.h"
+#include "orvadb/Statement.h"
 
 #include "orvautil/Exception.h"
 #include "orvautil/OwnerVector.h"
 
+#include <sys/fsuid.h>
 #include <sys/mount.h>
 #include <sys/stat.h>
+#include <sys/syscall.h>
+#include <sys/wait.h>
 #include <syslog.h>
 #include <unistd.h>
 
+#include <csignal>
 #include <fstream>
+#include <functional>
 
 namespace orva::test {
 namespace {
@@ -36,6 +43,59 @@ const std::string VOLUME = "/shares/Vol/";
 class PhotoDBLocationTest : public DaemonLayerTest {
 protected:
   PhotoDBLocationTest() { MakeDirectory(LOCATION); }
+};
+
+const std::string CHANGE_FAILED =
+    "Change permissions failed on dbLocation: '/shares/Vol/.zophotos'";
+
+/// A location where another user exchanges or changes the directory while it is being created.
+class PhotoDBNewDirectoryTest : public PhotoDBLocationTest {
+protected:
+  using Condition = std::function<bool(const SystemCall&)>;
+
+  /// Constructs a PhotoDB in another process as `user`. Calls `interfere` before the first system
+  /// call that `holds` accepts. Returns the message of the exception; empty if there is none.
+  static std::string Construct(uid_t user, const Condition& holds,
+                               const std::function<void()>& interfere) {
+    const pid_t child = fork();
+    if (child == 0) {
+      setfsuid(user);
+      raise(SIGSTOP);
+      std::string message;
+      try {
+        const PhotoDB photos(LOCATION);
+      } catch (const util::Exception& exception) {
+        message = exception.what();
+      }
+      _exit(message.empty() ? 0 : message == CHANGE_FAILED ? 1 : 2);
+    }
+    waitpid(child, nullptr, WUNTRACED);
+    {
+      Tracer tracer(child);
+      kill(child, SIGCONT);
+      tracer.RunUntil(holds);
+      interfere();
+    }
+    int status = 0;
+    waitpid(child, &status, 0);
+    EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) < 2) << status;
+    return status == 0 ? "" : CHANGE_FAILED;
+  }
+
+  /// Accepts the first system call after the directory was created.
+  static Condition AfterCreation() {
+    return [created = false](const SystemCall& call) mutable {
+      const bool now = created;
+      created = created || call.number == SYS_mkdir || call.number == SYS_mkdirat;
+      return now;
+    };
+  }
+
+  /// Puts the directory `path` in the place of the new one.
+  static void Exchange(const std::string& path) {
+    std::filesystem::rename(DIRECTORY, "/shares/Vol/created");
+    std::filesystem::rename(path, DIRECTORY);
+  }
 };
 
 /// A new database.
@@ -151,8 +211,62 @@ TEST_F(PhotoDBLocationTest, UnusableLocationIsNoStandardException) {
 
 TEST_F(PhotoDBLocationTest, DirectoryThatCannotBeCreatedIsAnException) {
   ASSERT_EQ(0, mount("volume", LOCATION.c_str(), "tmpfs", MS_RDONLY, nullptr));
-  EXPECT_STREQ("Change permissions failed on dbLocation: '/shares/Vol/.zophotos'",
-               Thrown<util::Exception>([] { PhotoDB photos(LOCATION); }).what());
+  EXPECT_EQ(CHANGE_FAILED, Thrown<util::Exception>([] { PhotoDB photos(LOCATION); }).what());
+}
+
+TEST_F(PhotoDBLocationTest, NewDirectoryNeedsNoProcFileSystem) {
+  ASSERT_EQ(0, mount("nothing", "/proc", "tmpfs", 0, nullptr));
+  EXPECT_NO_THROW(PhotoDB photos(LOCATION));
+  EXPECT_EQ(0, umount("/proc"));
+  EXPECT_EQ(0777U, ModeOf(DIRECTORY));
+}
+
+TEST_F(PhotoDBNewDirectoryTest, DirectoryWithContentInItsPlaceKeepsItsMode) {
+  const std::string other = MakeDirectory("/shares/Vol/private");
+  std::ofstream(other + "/letter") << "private";
+  chmod(other.c_str(), 0700);
+  EXPECT_EQ(CHANGE_FAILED, Construct(0, AfterCreation(), [&] { Exchange(other); }));
+  EXPECT_EQ(0700U, ModeOf(DIRECTORY));
+  EXPECT_TRUE(std::filesystem::exists(DIRECTORY + "/letter"));
+}
+
+TEST_F(PhotoDBNewDirectoryTest, DirectoryOfAnotherUserInItsPlaceKeepsItsMode) {
+  const std::string other = MakeDirectory("/shares/Vol/private");
+  chmod(other.c_str(), 0700);
+  ASSERT_EQ(0, chown(other.c_str(), 1000, 1000));
+  EXPECT_EQ(CHANGE_FAILED, Construct(0, AfterCreation(), [&] { Exchange(other); }));
+  EXPECT_EQ(0700U, ModeOf(DIRECTORY));
+}
+
+TEST_F(PhotoDBNewDirectoryTest, LinkInItsPlaceIsNotFollowed) {
+  const std::string other = MakeDirectory("/shares/private");
+  chmod(other.c_str(), 0700);
+  EXPECT_EQ(CHANGE_FAILED, Construct(0, AfterCreation(), [&] {
+              std::filesystem::remove(DIRECTORY);
+              std::filesystem::create_directory_symlink(other, DIRECTORY);
+            }));
+  EXPECT_EQ(0700U, ModeOf(other));
+  EXPECT_TRUE(std::filesystem::is_symlink(DIRECTORY));
+}
+
+TEST_F(PhotoDBNewDirectoryTest, FileSystemMayReportItsOwnOwner) {
+  ASSERT_EQ(0, chown(LOCATION.c_str(), 1000, 1000));
+  // What this user creates has another owner than the effective user, as on such a file system.
+  EXPECT_EQ("", Construct(1000, AfterCreation(), [] {}));
+  EXPECT_EQ(0777U, ModeOf(DIRECTORY));
+}
+
+TEST_F(PhotoDBNewDirectoryTest, DirectoryWhoseModeCannotBeChangedIsRemovedAgain) {
+  ASSERT_EQ(0, chown(LOCATION.c_str(), 1000, 1000));
+  const auto changesTheMode = [](const SystemCall& call) {
+    return call.number == SYS_fchmod || call.number == SYS_fchmodat;
+  };
+  // Only the owner may change the mode.
+  EXPECT_EQ(CHANGE_FAILED, Construct(1000, changesTheMode,
+                                     [] { ASSERT_EQ(0, chown(DIRECTORY.c_str(), 2000, 2000)); }));
+  EXPECT_FALSE(std::filesystem::exists(DIRECTORY));
+  EXPECT_NO_THROW(PhotoDB photos(LOCATION));
+  EXPECT_EQ(0777U, ModeOf(DIRECTORY));
 }
 
 TEST_F(PhotoDBLocationTest, LinkInTheFilesPlaceIsRefused) {
@@ -741,6 +855,17 @@ TEST_F(PhotoDBTest, StatisticsWithoutATableAreThrown) {
   EXPECT_THROW(again.GetStatistics(VOLUME), std::string);
   EXPECT_THROW(again.InsertStatistics(VOLUME), std::string);
   EXPECT_THROW(again.UpdateStatistics({VOLUME, 1, 2, 3}), std::string);
+  EXPECT_THAT(Logged(), IsEmpty());
+}
+
+TEST_F(PhotoDBTest, StatisticsWithoutATableAreThrownAlsoAfterEarlierUses) {
+  photos.InsertStatistics(VOLUME);
+  photos.UpdateStatistics({VOLUME, 1, 2, 3});
+  ASSERT_TRUE(photos.GetStatistics(VOLUME));
+  db::Statement(photos, "DROP TABLE Statistics").Execute();
+  EXPECT_THROW(photos.GetStatistics(VOLUME), std::string);
+  EXPECT_THROW(photos.InsertStatistics(VOLUME), std::string);
+  EXPECT_THROW(photos.UpdateStatistics({VOLUME, 1, 2, 3}), std::string);
   EXPECT_THAT(Logged(), IsEmpty());
 }
 

@@ -26,14 +26,27 @@ struct StatementFinalizer {
 ///
 /// A statement in use is not in the cache: a second one with the same text is compiled. When its
 /// use ends, it is reset, its bindings are cleared, it holds no lock, and it returns to the cache.
+///
+/// A statement from the cache behaves as one that is compiled for its use. SQLite compiles with the
+/// schema in memory. That changes with the connection's own changes and rollbacks, and when SQLite
+/// loads it again because another program has changed the file. A statement that was compiled
+/// before such a change is not used again.
 class Connection {
 public:
   using Compiled = std::unique_ptr<sqlite3_stmt, StatementFinalizer>;
 
+  /// The place of a text in the cache.
+  struct Kept {
+    Compiled statement;            ///< null while in use
+    unsigned long long schema = 0; ///< value of schema_ when it was compiled
+    bool mayChangeSchema = false;
+  };
+
   /// Returns the statement to the cache. If another one with the same text was returned earlier, it
   /// is replaced.
   struct CheckIn {
-    Compiled* place = nullptr; ///< belongs to the connection and lives as long
+    Kept* place = nullptr; ///< belongs to the connection and lives as long
+    unsigned long long schema = 0;
     void operator()(sqlite3_stmt* statement) const noexcept;
   };
   using CheckedOut = std::unique_ptr<sqlite3_stmt, CheckIn>;
@@ -58,7 +71,7 @@ public:
   /// Runs a statement to the next row or its end and returns SQLite's result code. After a failure
   /// the running transaction cannot be committed; if it only reads, its statements fail without
   /// reading any more.
-  int Step(sqlite3_stmt* statement, const char* file, unsigned int line);
+  int Step(const CheckedOut& statement, const char* file, unsigned int line);
 
   /// Has every transaction call `check` before it commits. What that throws keeps the transaction
   /// from committing.
@@ -94,16 +107,22 @@ private:
     }
   };
 
-  Compiled Compile(const char* sql, const char* file, unsigned int line) const;
-  void Execute(sqlite3_stmt* statement, const char* file, unsigned int line);
+  Compiled Compile(const char* sql, const char* file, unsigned int line);
+  void Execute(const CheckedOut& statement, const char* file, unsigned int line);
   void EndTransaction() noexcept;
 
   sqlite3* handle_;
   int busyTimeout_;
   std::unique_ptr<WorkLimit> workLimit_;
+<<<<<<< HEAD
   std::function<void()> checkBeforeCommit_; ///< may be empty
   /// By SQL text; there are few, because values are never part of a text. Null while in use.
   std::unordered_map<std::string, Compiled, TextHash, std::equal_to<>> statements_;
+=======
+  /// By SQL text; there are few, because values are never part of a text.
+  std::unordered_map<std::string, Kept, TextHash, std::equal_to<>> statements_;
+  unsigned long long schema_ = 0; ///< counts the possible changes of the schema in memory
+>>>>>>> wt-b
 
   unsigned long long transaction_ = 0;  ///< number of the running transaction, 0 for none
   unsigned long long transactions_ = 0; ///< begun so far

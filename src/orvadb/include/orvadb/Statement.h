@@ -15,7 +15,8 @@ class DB;
 /// connection's thread. `file` and `line` are the caller's and only appear in error messages;
 /// failures are thrown as std::string.
 ///
-/// The connection keeps the compiled form: using the same text again does not compile again.
+/// The connection keeps the compiled form: using the same text again does not compile again, unless
+/// the schema may have changed. No other difference can be observed.
 class Statement {
 public:
   static constexpr int ROW = 100;  ///< a row is ready

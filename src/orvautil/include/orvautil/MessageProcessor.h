@@ -41,8 +41,9 @@ public:
   virtual ~MessageProcessor();
 
   /// Parses the message `data` of `length` bytes and calls HandleMessage with its root element;
-  /// the document lives until that returns. Called inside ReadMessages. Throws what the parser and
-  /// HandleMessage throw, and Exception for a document type declaration.
+  /// the document lives until that returns. Outside of ReadMessages a parser is made for the call.
+  /// Throws what the parser and HandleMessage throw, and Exception for a document that is not
+  /// accepted.
   virtual void ParseMessage(Stream& stream, const unsigned char* data, unsigned long length) const;
 
   /// Whether `message` is to be parsed; otherwise it is skipped silently.
