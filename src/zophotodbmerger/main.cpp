@@ -28,10 +28,16 @@ const std::string ORVA_LOG_FILE = util::MakePath(
 /// Deleted at the end of the process, when its thread has ended.
 std::unique_ptr<dbmerger::NotificationListener> notificationListener;
 
-/// A closed pipe as standard output must not end the daemon, and no socket or database file may get
-/// the number of a standard descriptor that was closed when the daemon started.
-void SecureStandardDescriptors() {
+/// A closed pipe as standard output or a limit on the size of files must not end the daemon: only
+/// the write fails.
+void IgnoreSignalsOfWrites() {
   std::signal(SIGPIPE, SIG_IGN);
+  std::signal(SIGXFSZ, SIG_IGN);
+}
+
+/// No socket or database file may get the number of a standard descriptor that was closed when the
+/// daemon started.
+void OpenStandardDescriptors() {
   int descriptor = 0;
   do {
     descriptor = open("/dev/null", O_RDWR);
@@ -51,7 +57,8 @@ void ListenUntilTheServiceEnds() {
 } // namespace
 
 int main() {
-  SecureStandardDescriptors();
+  IgnoreSignalsOfWrites();
+  OpenStandardDescriptors();
   xercesc::XMLPlatformUtils::Initialize();
   try {
     ListenUntilTheServiceEnds();
