@@ -1,5 +1,6 @@
 #include "stdafx.h"
 
+#include "InstanceLock.h"
 #include "NotificationListener.h"
 #include "StateMachine.h"
 
@@ -16,6 +17,7 @@
 #include <csignal>
 #include <cstdlib>
 #include <exception>
+#include <iostream>
 
 namespace {
 
@@ -59,6 +61,14 @@ void ListenUntilTheServiceEnds() {
 int main() {
   IgnoreSignalsOfWrites();
   OpenStandardDescriptors();
+  const dbmerger::InstanceLock lock;
+  if (lock.IsHeldByAnother()) {
+    const char* const path = dbmerger::InstanceLock::PATH;
+    syslog(LOG_LOCAL1 | LOG_ERR, "Another daemon is running: it has locked %s", path);
+    std::cerr << "zophotodbmerger: another daemon is running: it has locked " << path << '\n';
+    return EXIT_FAILURE;
+  }
+
   xercesc::XMLPlatformUtils::Initialize();
   try {
     ListenUntilTheServiceEnds();
