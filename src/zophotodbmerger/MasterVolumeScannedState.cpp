@@ -27,12 +27,16 @@ void MasterVolumeScannedState::handleVolumePlugged(VolumeInfo /*volume*/) {
 
 void MasterVolumeScannedState::handleVolumeUnplugged(VolumeInfo volume) {
   syslog(LOG_LOCAL1 | LOG_INFO, "MasterVolumeScannedState:: Volumeunplugged ");
-  VolumeInfoManager& registry = VolumeInfoManager::Instance();
   // When the master itself was unplugged, the registry has the empty record: the rows are then
   // removed from a database that is on no volume.
-  owned.merger.RemoveVolume(registry.getMasterVolume().mountPoint, volume.mountPoint);
-  owned.merger.stopRequested = true;
+  owned.merger.RemoveVolume(VolumeInfoManager::Instance().getMasterVolume().mountPoint,
+                            volume.mountPoint);
+  MasterVolumeScannedState::recover();
+}
 
+void MasterVolumeScannedState::recover() {
+  owned.merger.stopRequested = true;
+  VolumeInfoManager& registry = VolumeInfoManager::Instance();
   if (registry.reelectMasterVolume()) {
     syslog(LOG_LOCAL1 | LOG_INFO, "Moving to the scanned state since we can safely do so ");
     // The blank at the end distinguishes this line from those of the other states.
@@ -70,6 +74,14 @@ void MasterVolumeScannedState::handleVolumePurged(VolumeInfo volume) {
 
 int MasterVolumeScannedState::getStateType() {
   return MASTER_VOLUME_SCANNED;
+}
+
+State::Unfinished MasterVolumeScannedState::getUnfinished() {
+  if (owned.merger.stopRequested) {
+    return Unfinished::Transition;
+  }
+  const bool hasMaster = VolumeInfoManager::Instance().getMasterVolume() != EmptyVolumeInfo;
+  return hasMaster ? Unfinished::Nothing : Unfinished::Election;
 }
 
 } // namespace orva::dbmerger

@@ -20,6 +20,11 @@ public:
   void handleVolumePurged(VolumeInfo volume) override;
   int getStateType() override;
 
+  Unfinished getUnfinished() override;
+  /// The second half of an unplugging: stops the merger, elects a master and makes the state that
+  /// follows current.
+  void recover() override;
+
 private:
   /// Stops and joins its merger when it is destroyed, also after the state's constructor has
   /// thrown.

@@ -101,9 +101,16 @@ Handler SelectHandler(const std::string& name, const xercesc::DOMNode& root, Vol
   return nullptr;
 }
 
-/// Turns a notification into a volume record, updates the registry and calls the current state.
-/// Throws std::out_of_range when the notification names no mount point, and what the handler
-/// throws.
+/// What an earlier event that failed has left undone.
+State::Unfinished UnfinishedWork() {
+  const StateMachine* const machine = StateMachine::instance;
+  return machine == nullptr ? State::Unfinished::Nothing
+                            : machine->getCurrentState()->getUnfinished();
+}
+
+/// Turns a notification into a volume record, updates the registry, completes what an earlier event
+/// has left undone, and calls the current state. Throws std::out_of_range when the notification
+/// names no mount point, and what the state throws.
 void Parsenotification(const xercesc::DOMNode& root) {
   const xercesc::DOMNamedNodeMap* const attributes = root.getAttributes();
   VolumeInfo volume{.mountPoint =
@@ -118,13 +125,18 @@ void Parsenotification(const xercesc::DOMNode& root) {
   if (handler == nullptr) {
     return;
   }
+  const bool isUnfinished = UnfinishedWork() != State::Unfinished::Nothing;
   VolumeInfoManager& registry = VolumeInfoManager::Instance();
   if (handler == &State::handleVolumeUnplugged) {
     registry.removeVolumeInfo(volume);
   } else {
     registry.addVolumeInfo(volume);
   }
-  if (State* const state = StateMachine::Instance().getCurrentState()) {
+  StateMachine& machine = StateMachine::Instance();
+  if (isUnfinished) {
+    machine.getCurrentState()->recover();
+  }
+  if (State* const state = machine.getCurrentState()) {
     (state->*handler)(volume);
   }
 }
@@ -163,7 +175,26 @@ void NotificationListener::HandleMessage(util::Stream& /*stream*/, const unsigne
     syslog(LOG_LOCAL1 | LOG_ERR, "ERROR ! Node name = %s", name.c_str());
     return;
   }
-  Parsenotification(root);
+  try {
+    Parsenotification(root);
+  } catch (...) {
+    ElectAfterFailure();
+    throw;
+  }
+}
+
+void NotificationListener::ElectAfterFailure() const {
+  // A transition that failed is repeated only before the next event: what it waited for is probably
+  // still locked.
+  if (UnfinishedWork() != State::Unfinished::Election) {
+    return;
+  }
+  try {
+    StateMachine::Instance().getCurrentState()->recover();
+  } catch (...) {
+    syslog(LOG_LOCAL1 | LOG_ERR, "MessageProcessor:: %s",
+           DescribeException(std::current_exception()).c_str());
+  }
 }
 
 std::pair<const unsigned char*, unsigned long> NotificationListener::GetDelimiter() const {

@@ -18,7 +18,9 @@ public:
   /// Whether the message contains the name of a notification's element.
   bool IsValidMessage(const std::string& message) const override;
 
-  /// Turns a notification into an event for the current state; any other document is logged.
+  /// Turns a notification into an event for the current state; any other document is logged. Throws
+  /// what the state throws. What an event has left undone is completed at once when only the
+  /// election is missing, otherwise before the next event.
   void HandleMessage(util::Stream& stream, const unsigned char* data, unsigned long length,
                      const xercesc::DOMNode& root) const override;
 
@@ -27,6 +29,11 @@ public:
 
 protected:
   std::string DescribeException(const std::exception_ptr& exception) const override;
+
+private:
+  /// Elects a master if an event has failed before its election, so that the locator file does not
+  /// name a master that is gone. A failure is logged.
+  void ElectAfterFailure() const;
 };
 
 } // namespace orva::dbmerger

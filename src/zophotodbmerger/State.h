@@ -27,6 +27,19 @@ public:
 
   /// May throw, since a state may have to wait for a thread.
   virtual ~State() noexcept(false) = default;
+
+  /// What an event that failed has left undone. Without it, merges would not apply.
+  enum class Unfinished {
+    Nothing,
+    Election,  ///< the master is gone, and the event failed before the election
+    Transition ///< the event failed in the election or after it
+  };
+  /// Correct between two events only: before the registry changes for the next one.
+  virtual Unfinished getUnfinished() { return Unfinished::Nothing; }
+
+  /// Completes what is unfinished: elects a master and makes another state current. Throws what the
+  /// handlers throw; then the transition is unfinished.
+  virtual void recover() {}
 };
 
 } // namespace orva::dbmerger

@@ -28,6 +28,12 @@ bool HasRoomFor(const VolumeInfo& added, const std::vector<VolumeInfo>& volumes)
   return volumes.size() < MOST_VOLUMES && bytes <= MOST_BYTES;
 }
 
+bool CanBeMaster(const VolumeInfo& volume) {
+  // The locator file has one line.
+  const bool isOneLine = volume.mountPoint.find('\n') == std::string::npos;
+  return volume.capacity - volume.used > MINIMUM_FREE_SPACE && !volume.readOnly && isOneLine;
+}
+
 } // namespace
 
 VolumeInfoManager* VolumeInfoManager::instance = nullptr;
@@ -69,7 +75,7 @@ bool VolumeInfoManager::reelectMasterVolume() {
   }
   std::ranges::sort(volumes, VolumeInfoComp<VolumeInfo>());
   for (const VolumeInfo& volume : volumes) {
-    if (volume.capacity - volume.used > MINIMUM_FREE_SPACE && !volume.readOnly) {
+    if (CanBeMaster(volume)) {
       masterVolume = volume;
       return true;
     }

@@ -25,8 +25,9 @@ public:
   void removeVolumeInfo(VolumeInfo& volume);
 
   /// Keeps an existing master; otherwise elects the largest volume with more than 200 MiB free that
-  /// is not marked read-only (notifications never mark one). For that it sorts the registry by
-  /// capacity, larger ones first. Returns whether there is a master now.
+  /// is not marked read-only (notifications never mark one) and has no line feed in its mount
+  /// point. For that it sorts the registry by capacity, larger ones first. Returns whether there is
+  /// a master now.
   bool reelectMasterVolume();
 
   const std::vector<VolumeInfo>& getVolumes() const noexcept { return volumes; }

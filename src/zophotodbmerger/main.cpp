@@ -1,5 +1,6 @@
 #include "stdafx.h"
 
+#include "InstanceLock.h"
 #include "NotificationListener.h"
 #include "StateMachine.h"
 
@@ -16,6 +17,7 @@
 #include <csignal>
 #include <cstdlib>
 #include <exception>
+#include <iostream>
 
 namespace {
 
@@ -28,10 +30,16 @@ const std::string ORVA_LOG_FILE = util::MakePath(
 /// Deleted at the end of the process, when its thread has ended.
 std::unique_ptr<dbmerger::NotificationListener> notificationListener;
 
-/// A closed pipe as standard output must not end the daemon, and no socket or database file may get
-/// the number of a standard descriptor that was closed when the daemon started.
-void SecureStandardDescriptors() {
+/// A closed pipe as standard output or a limit on the size of files must not end the daemon: only
+/// the write fails.
+void IgnoreSignalsOfWrites() {
   std::signal(SIGPIPE, SIG_IGN);
+  std::signal(SIGXFSZ, SIG_IGN);
+}
+
+/// No socket or database file may get the number of a standard descriptor that was closed when the
+/// daemon started.
+void OpenStandardDescriptors() {
   int descriptor = 0;
   do {
     descriptor = open("/dev/null", O_RDWR);
@@ -51,7 +59,16 @@ void ListenUntilTheServiceEnds() {
 } // namespace
 
 int main() {
-  SecureStandardDescriptors();
+  IgnoreSignalsOfWrites();
+  OpenStandardDescriptors();
+  const dbmerger::InstanceLock lock;
+  if (lock.IsHeldByAnother()) {
+    const char* const path = dbmerger::InstanceLock::PATH;
+    syslog(LOG_LOCAL1 | LOG_ERR, "Another daemon is running: it has locked %s", path);
+    std::cerr << "zophotodbmerger: another daemon is running: it has locked " << path << '\n';
+    return EXIT_FAILURE;
+  }
+
   xercesc::XMLPlatformUtils::Initialize();
   try {
     ListenUntilTheServiceEnds();

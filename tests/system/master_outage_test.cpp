@@ -5,10 +5,12 @@
 
 #include "support/TestScale.h"
 
+#include <sys/resource.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <chrono>
+#include <filesystem>
 #include <functional>
 #include <regex>
 
@@ -271,6 +273,20 @@ TEST_F(MasterOutage, AReadOnlyMasterFailsWhatWouldChangeIt) {
                                   EndsWith(" WHERE volume = ?\""))));
   }
   a.MakeWritable();
+  ExpectRepairedByTheNextMerge();
+}
+
+/// The kernel sends a signal to a program that writes beyond this limit.
+TEST_F(MasterOutage, ALimitOnTheSizeOfFilesFailsTheMerge) {
+  const rlimit limit{std::filesystem::file_size(a.Path() + "/.zophotos/zophotos.db"),
+                     RLIM_INFINITY};
+  rlimit unlimited{};
+  const pid_t daemon = appliance.Daemon().Pid();
+  ASSERT_EQ(0, prlimit(daemon, RLIMIT_FSIZE, &limit, &unlimited));
+  EXPECT_THAT(Errors(appliance.Handle(TranscodedBatch(b.Path()))),
+              ElementsAre(StartsWith(IGNORED + "PLACE: disk I/O error")));
+  EXPECT_EQ(before, Content());
+  ASSERT_EQ(0, prlimit(daemon, RLIMIT_FSIZE, &unlimited, nullptr));
   ExpectRepairedByTheNextMerge();
 }
 

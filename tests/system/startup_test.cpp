@@ -2,6 +2,7 @@
 #include "Expectations.h"
 #include "Messages.h"
 
+#include "support/Program.h"
 #include "support/Programs.h"
 
 #include "orvautil/Core.h"
@@ -197,6 +198,58 @@ TEST_F(StartUp, TheLocatorOfAnEarlierRunIsReplacedCompletely) {
   MakeFile("/tmp/zophotodbmerger.conf", std::string(4096, 'x'));
   appliance.Start();
   EXPECT_EQ(SHARES_LOCATOR, Appliance::Locator());
+}
+
+/// Everything below /shares and the locator, with the time of the last change.
+Lines Published() {
+  Lines published{Appliance::Locator()};
+  for (const std::string& path : PathsBelow("/shares")) {
+    const auto changed = fs::last_write_time(path).time_since_epoch().count();
+    published.push_back(path + " " + std::to_string(changed));
+  }
+  return published;
+}
+
+TEST_F(StartUp, ASecondDaemonEndsBeforeItTouchesAnything) {
+  appliance.Start();
+  const Volume a("A", "150g");
+  appliance.Handle(Plugged(a.Path()));
+  appliance.Handle(Scanned(a.Path()));
+  const Lines published = Published();
+  ASSERT_EQ("zophotos_db_path=/shares/A//.zophotos/zophotos.db\n", published[0]);
+  appliance.TakeLog();
+
+  ASSERT_EQ(0, mkdir("/tmp/second", 0700));
+  Program second({ProgramPath("zophotodbmerger")},
+                 {.errors = Program::Errors::Apart, .directory = "/tmp/second"});
+  std::string output;
+  std::string error;
+  second.ReadToEnd(output, error);
+  EXPECT_EQ(Exited(1), second.WaitForEnd());
+
+  EXPECT_EQ("", output);
+  EXPECT_EQ("zophotodbmerger: another daemon is running: it has locked "
+            "/run/zophotodbmerger/lock\n",
+            error);
+  EXPECT_EQ(Log{Error("Another daemon is running: it has locked /run/zophotodbmerger/lock")},
+            appliance.TakeLog());
+  EXPECT_EQ(published, Published());
+  EXPECT_TRUE(fs::is_empty("/tmp/second"));
+  EXPECT_EQ(Log{Info(":: Scanned")}, appliance.Handle(Scanned(a.Path())));
+}
+
+TEST_F(StartUp, ADaemonThatWasKilledLeavesNoLock) {
+  appliance.Start();
+  ASSERT_EQ(0, kill(appliance.Daemon().Pid(), SIGKILL));
+  appliance.Daemon().AwaitEnd();
+  appliance.Service().CloseClient();
+  appliance.Start();
+}
+
+TEST_F(StartUp, WithoutAPlaceForTheLockTheDaemonStarts) {
+  MakeFile("/run/zophotodbmerger", "no directory");
+  appliance.Start();
+  EXPECT_EQ(CONNECTED, appliance.TakeLog());
 }
 
 } // namespace

@@ -449,5 +449,20 @@ TEST_F(Transitions, AnElectionPrefersTheLargestVolume) {
             appliance.Handle(Unplugged(a.Path())));
 }
 
+TEST_F(Transitions, AVolumeWithALineFeedInItsMountPointIsMergedButNotElected) {
+  StartUp();
+  const Volume broken("A\nzophotos_db_path=", "200g");
+  Catalog(broken).AddPhoto("a.jpg", 100, 200);
+  EXPECT_EQ((Log{PluggedLine(broken), Info("Default:: VolumePlugged "),
+                 Error(broken.MountPoint() + "  ---------  is not a candidate \n"),
+                 Master(SHARES_MASTER_TEXT)}),
+            appliance.Handle(Plugged(broken.Path())));
+  After(Scanned(broken.Path()));
+  EXPECT_EQ(LocatorOn("/shares"), Appliance::Locator());
+  After(TranscodedBatch(broken.Path()));
+  EXPECT_THAT(MergedDatabase("/shares").Files(),
+              ElementsAre(broken.MountPoint() + "a.jpg|100|100|" + broken.MountPoint()));
+}
+
 } // namespace
 } // namespace orva::test

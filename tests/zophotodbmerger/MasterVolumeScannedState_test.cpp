@@ -1,6 +1,7 @@
 #include "StatesTest.h"
 
 #include "Catalog.h"
+#include "DefaultState.h"
 #include "MasterVolumeScannedState.h"
 #include "PhotoDB.h"
 
@@ -11,6 +12,7 @@ namespace {
 
 using dbmerger::PhotoDB;
 using dbmerger::State;
+using Unfinished = State::Unfinished;
 using ::testing::ElementsAre;
 using ::testing::IsEmpty;
 
@@ -31,6 +33,10 @@ protected:
                 mountPoint + " using master volume at /shares/Vol/");
   }
 };
+
+LogLine MasterAgain(const std::string& text) {
+  return Info("We now have a master volume " + text + " ");
+}
 
 /// A catalog with one photo.
 Catalog MakeCatalog(const std::string& mountPoint) {
@@ -211,6 +217,165 @@ TEST_F(MasterVolumeScannedStateTest, FailureAfterTheRemovalLeavesTheMergerStoppe
   Transcoded("/shares/Vol/");
   EXPECT_THAT(MergedFiles("/shares/Next"), IsEmpty());
   EXPECT_THAT(MergedStatistics("/shares/Next"), ElementsAre("/shares/Vol/|1|1|0"));
+}
+
+// What events that failed have left undone.
+
+/// The same with a volume "/shares/Next/", which can be the next master, and a catalog on
+/// "/shares/C/".
+class UnfinishedTest : public MasterVolumeScannedStateTest {
+protected:
+  UnfinishedTest() {
+    Register("/shares/Next/", MIDDLE);
+    MakeCatalog("/shares/C/");
+  }
+
+  /// Makes a location unusable.
+  static void Obstruct(const std::string& location) {
+    std::filesystem::remove_all(location + "/.zophotos");
+    std::ofstream(location + "/.zophotos") << "in the way";
+  }
+  static void Clear(const std::string& location) {
+    std::filesystem::remove(location + "/.zophotos");
+  }
+
+  /// Unplugs the master. The removal of its rows fails.
+  void FailTheRemoval() {
+    Obstruct("/tmp/scratch");
+    Forget("/shares/Vol/");
+    EXPECT_THROW(Unplugged("/shares/Vol/"), PhotoDB::Error);
+    Logged();
+  }
+
+  /// Unplugs the master. The database on the next one cannot be opened.
+  void FailTheTransition() {
+    Obstruct("/shares/Next");
+    Forget("/shares/Vol/");
+    EXPECT_THROW(Unplugged("/shares/Vol/"), PhotoDB::Error);
+    Logged();
+  }
+
+  std::string Recover() const {
+    return OutputOf([&] { Current().recover(); });
+  }
+
+  /// The state is complete and merges into the database at `master`, which the locator names.
+  void ExpectMergesInto(const std::string& master) {
+    EXPECT_EQ(Unfinished::Nothing, Current().getUnfinished());
+    EXPECT_EQ("zophotos_db_path=" + master + "/.zophotos/zophotos.db\n", Appliance::Locator());
+    Transcoded("/shares/C/");
+    EXPECT_THAT(MergedFiles(master), ElementsAre("/shares/C/a.jpg"));
+    EXPECT_THAT(MergedStatistics(master), ElementsAre("/shares/C/|1|1|100"));
+  }
+};
+
+TEST_F(UnfinishedTest, StatesWithoutAFailureHaveNothingUnfinished) {
+  EXPECT_EQ(Unfinished::Nothing, Current().getUnfinished());
+  Forget("/shares/Vol/");
+  Unplugged("/shares/Vol/");
+  EXPECT_EQ(Unfinished::Nothing, Current().getUnfinished());
+  ForgetSharesRoot();
+  Forget("/shares/Next/");
+  Unplugged("/shares/Next/");
+  ASSERT_EQ(State::DEFAULT, CurrentType());
+  EXPECT_EQ(Unfinished::Nothing, Current().getUnfinished());
+  OutputOf([&] { Current().recover(); });
+  EXPECT_EQ(State::DEFAULT, CurrentType());
+}
+
+TEST_F(UnfinishedTest, FailedRemovalFromAMasterThatStaysLeavesNothing) {
+  MergedRows("/shares/Vol", "ALTER TABLE Statistics RENAME TO Stored");
+  EXPECT_THROW(Unplugged("/shares/C/"), std::string);
+  EXPECT_EQ(Unfinished::Nothing, Current().getUnfinished());
+}
+
+TEST_F(UnfinishedTest, FailedRemovalOfTheMasterLeavesTheElection) {
+  FailTheRemoval();
+  EXPECT_EQ(Unfinished::Election, Current().getUnfinished());
+  State* const before = &Current();
+
+  EXPECT_THAT(Recover(), ::testing::HasSubstr("Setting the current to scanned state"));
+
+  EXPECT_NE(before, &Current());
+  EXPECT_THAT(Logged(), ElementsAre(MOVING, MasterAgain(MasterText("/shares/Next/", MIDDLE))));
+  ExpectMergesInto("/shares/Next/");
+}
+
+TEST_F(UnfinishedTest, FailureAfterTheRemovalLeavesTheTransition) {
+  FailTheTransition();
+  EXPECT_EQ(Unfinished::Transition, Current().getUnfinished());
+  Clear("/shares/Next");
+  Recover();
+  EXPECT_THAT(Logged(), ElementsAre(MOVING, MasterAgain(MasterText("/shares/Next/", MIDDLE))));
+  ExpectMergesInto("/shares/Next/");
+}
+
+TEST_F(UnfinishedTest, FailedElectionLeavesTheTransition) {
+  FailTheRemoval();
+  Obstruct("/shares/Next");
+  State* const before = &Current();
+  EXPECT_THROW(Recover(), PhotoDB::Error);
+  EXPECT_EQ(before, &Current());
+  EXPECT_EQ(Unfinished::Transition, Current().getUnfinished());
+  EXPECT_THROW(Recover(), PhotoDB::Error);
+  EXPECT_EQ(Unfinished::Transition, Current().getUnfinished());
+  Clear("/shares/Next");
+  Recover();
+  ExpectMergesInto("/shares/Next/");
+}
+
+TEST_F(UnfinishedTest, TransitionContinuesWithAnotherMasterWhenTheNextOneIsUnpluggedToo) {
+  FailTheTransition();
+  Forget("/shares/Next/");
+  EXPECT_EQ(Unfinished::Transition, Current().getUnfinished());
+  Recover();
+  EXPECT_EQ("/shares", Master());
+  ExpectMergesInto("/shares");
+}
+
+TEST_F(UnfinishedTest, TransitionFallsBackWhenNoVolumeIsLeft) {
+  FailTheTransition();
+  Forget("/shares/Next/");
+  ForgetSharesRoot();
+  ASSERT_THAT(Registry().getVolumes(), IsEmpty());
+  Recover();
+  EXPECT_THAT(Logged(),
+              ElementsAre(Info("We do NOT have a master volume, so going back to the Default "
+                               "State ")));
+  EXPECT_EQ(State::DEFAULT, CurrentType());
+  EXPECT_EQ(SHARES_LOCATOR, Appliance::Locator());
+}
+
+TEST_F(UnfinishedTest, FailedFallbackLeavesTheTransition) {
+  Forget("/shares/Next/");
+  ForgetSharesRoot();
+  Obstruct("/shares");
+  Forget("/shares/Vol/");
+  EXPECT_THROW(Unplugged("/shares/Vol/"), PhotoDB::Error);
+  EXPECT_EQ(Unfinished::Transition, Current().getUnfinished());
+  EXPECT_THROW(Recover(), PhotoDB::Error);
+  Register("/shares/Next/", SMALL);
+  Recover();
+  ExpectMergesInto("/shares/Next/");
+}
+
+TEST_F(UnfinishedTest, FailedDeletionOfAnEarlierStateLeavesTheTransition) {
+  /// A state whose destructor throws.
+  class Failing final : public dbmerger::DefaultState {
+  public:
+    ~Failing() noexcept(false) override { throw std::string("the end failed"); }
+  };
+  OutputOf([&] {
+    machine.setCurrentState(std::make_unique<Failing>().release());
+    machine.setCurrentState(std::make_unique<dbmerger::MasterVolumeScannedState>().release());
+  });
+  State* const before = &Current();
+  EXPECT_THROW(Unplugged("/shares/D/"), std::string);
+  EXPECT_EQ(before, &Current());
+  EXPECT_EQ(Unfinished::Transition, Current().getUnfinished());
+  Recover();
+  EXPECT_NE(before, &Current());
+  ExpectMergesInto("/shares/Vol/");
 }
 
 TEST_F(MasterVolumeScannedStateTest, UnusableMasterIsThrownFromAMerge) {

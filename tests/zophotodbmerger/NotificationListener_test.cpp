@@ -318,6 +318,160 @@ TEST_F(NotificationTest, EmptyMountPointIsOutOfRange) {
   EXPECT_THAT(Logged(), IsEmpty());
 }
 
+// Events that fail.
+
+/// A state whose handlers fail and leave something undone, as long as the test wants it.
+class FailingState final : public State {
+public:
+  explicit FailingState(const dbmerger::VolumeInfoManager& registry) : registry_(registry) {}
+
+  void handleVolumePlugged(VolumeInfo /*volume*/) override { Handle("plugged"); }
+  void handleVolumeUnplugged(VolumeInfo /*volume*/) override { Handle("unplugged"); }
+  void handleVolumeScanned(VolumeInfo /*volume*/) override { Handle("scanned"); }
+  void handlePictureTranscoded(VolumeInfo /*volume*/) override { Handle("transcoded"); }
+  void handleVolumePurged(VolumeInfo /*volume*/) override { Handle("purged"); }
+  int getStateType() override { return -1; }
+
+  Unfinished getUnfinished() override { return unfinished; }
+  void recover() override {
+    steps.push_back("recovery with " + std::to_string(registry_.getVolumes().size()) + " volumes");
+    if (recoveryFails) {
+      unfinished = Unfinished::Transition;
+      throw std::string("recovery failed");
+    }
+    unfinished = Unfinished::Nothing;
+  }
+
+  bool fails = false;
+  bool recoveryFails = false;
+  Unfinished left = Unfinished::Nothing; ///< by a handler that fails
+  Unfinished unfinished = Unfinished::Nothing;
+  Lines steps;
+
+private:
+  void Handle(const std::string& event) {
+    steps.push_back(event);
+    if (fails) {
+      unfinished = left;
+      throw dbmerger::PhotoDB::Error(event + " failed");
+    }
+  }
+
+  const dbmerger::VolumeInfoManager& registry_;
+};
+
+class FailedEventTest : public StatesTest {
+protected:
+  FailedEventTest() {
+    ForgetSharesRoot();
+    MakeDirectory("/shares/Vol");
+    auto failing = std::make_unique<FailingState>(Registry());
+    state = failing.get();
+    machine.setCurrentState(failing.release());
+    Logged();
+  }
+
+  void Notify(const std::string& message) const { test::Notify(listener, message); }
+
+  /// The failure of the message as its reader gets it.
+  std::string FailureOf(const std::string& message) const {
+    return Thrown<dbmerger::PhotoDB::Error>([&] { Notify(message); }).Message();
+  }
+
+  FailingState* state;
+  NotificationListener listener;
+};
+
+TEST_F(FailedEventTest, WithNothingUnfinishedHasNoRecovery) {
+  state->fails = true;
+  EXPECT_EQ("scanned failed", FailureOf(test::Scanned("/shares/Vol")));
+  EXPECT_EQ("purged failed", FailureOf(test::Purged("/shares/Vol")));
+  EXPECT_THAT(state->steps, ElementsAre("scanned", "purged"));
+}
+
+TEST_F(FailedEventTest, BeforeItsElectionIsCompletedAtOnce) {
+  state->fails = true;
+  state->left = State::Unfinished::Election;
+  EXPECT_EQ("unplugged failed", FailureOf(test::Unplugged("/shares/Vol")));
+  EXPECT_THAT(state->steps, ElementsAre("unplugged", "recovery with 0 volumes"));
+  EXPECT_THAT(Logged(), IsEmpty());
+  state->fails = false;
+  Notify(test::Scanned("/shares/Vol"));
+  EXPECT_EQ("scanned", state->steps.back());
+}
+
+TEST_F(FailedEventTest, WhoseElectionFailsTooIsLoggedTwiceAndCompletedBeforeTheNextEvent) {
+  state->fails = true;
+  state->left = State::Unfinished::Election;
+  state->recoveryFails = true;
+  EXPECT_EQ("unplugged failed", FailureOf(test::Unplugged("/shares/Vol")));
+  EXPECT_THAT(state->steps, ElementsAre("unplugged", "recovery with 0 volumes"));
+  EXPECT_THAT(Logged(), ElementsAre(Error("MessageProcessor:: recovery failed")));
+  state->fails = state->recoveryFails = false;
+  Notify(test::Scanned("/shares/Vol"));
+  EXPECT_THAT(state->steps, ElementsAre("unplugged", "recovery with 0 volumes",
+                                        "recovery with 1 volumes", "scanned"));
+}
+
+/// The registry is up to date when the state recovers.
+TEST_F(FailedEventTest, InItsTransitionIsCompletedBeforeTheNextEventOfAnyKind) {
+  const Lines messages{test::Plugged("/shares/Vol"), test::Scanned("/shares/Vol"),
+                       TranscodedBatch("/shares/Vol"), End("/shares/Vol"),
+                       test::Purged("/shares/Vol")};
+  for (const std::string& message : messages) {
+    state->fails = true;
+    state->left = State::Unfinished::Transition;
+    EXPECT_EQ("unplugged failed", FailureOf(test::Unplugged("/shares/Vol")));
+    EXPECT_THAT(state->steps, ElementsAre("unplugged"));
+    state->fails = false;
+    Notify(message);
+    ASSERT_EQ(3U, state->steps.size());
+    EXPECT_EQ("recovery with 1 volumes", state->steps[1]);
+    Notify(test::Unplugged("/shares/Vol"));
+    EXPECT_EQ("unplugged", state->steps[3]);
+    state->steps.clear();
+  }
+}
+
+TEST_F(FailedEventTest, InItsTransitionIsCompletedBeforeAnUnplugging) {
+  Register("/shares/Vol/", LARGE);
+  state->unfinished = State::Unfinished::Transition;
+  Notify(test::Unplugged("/shares/Vol"));
+  EXPECT_THAT(state->steps, ElementsAre("recovery with 0 volumes", "unplugged"));
+}
+
+TEST_F(FailedEventTest, WhoseRecoveryFailsFailsTheNextEventsUntilItSucceeds) {
+  state->unfinished = State::Unfinished::Transition;
+  state->recoveryFails = true;
+  for (int i = 0; i < 2; ++i) {
+    EXPECT_EQ("recovery failed", Thrown([&] { Notify(TranscodedBatch("/shares/Vol")); }));
+  }
+  state->recoveryFails = false;
+  Notify(TranscodedBatch("/shares/Vol"));
+  EXPECT_THAT(state->steps, ElementsAre("recovery with 1 volumes", "recovery with 1 volumes",
+                                        "recovery with 1 volumes", "transcoded"));
+}
+
+TEST_F(FailedEventTest, IsNotCompletedByAMessageThatIsNoEvent) {
+  state->unfinished = State::Unfinished::Transition;
+  Notify(Notification("plugged", "/shares/Vol"));
+  EXPECT_THROW(Notify(Notification("Plugged", "")), std::out_of_range);
+  EXPECT_THAT(state->steps, IsEmpty());
+}
+
+/// The master is missing in the registry when the handler of its unplugging begins.
+TEST_F(StatesTest, UnpluggingOfTheMasterIsNotTakenForAFailedEvent) {
+  std::filesystem::current_path(MakeDirectory("/tmp/scratch"));
+  Register("/shares/Vol/", LARGE);
+  Scanned("/shares/Vol/");
+  Logged();
+  OutputOf([&] { test::Notify(NotificationListener(), test::Unplugged("/shares/Vol")); });
+  EXPECT_THAT(Logged(),
+              ElementsAre(Info("MasterVolumeScannedState:: Volumeunplugged "),
+                          Info("Moving to the scanned state since we can safely do so "),
+                          Info("We now have a master volume " + SHARES_MASTER_TEXT + " ")));
+}
+
 // The machine.
 
 TEST_F(DaemonLayerTest, NotificationCreatesTheMachineWhenThereIsNone) {

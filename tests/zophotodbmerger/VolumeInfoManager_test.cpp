@@ -179,6 +179,17 @@ TEST_F(VolumeInfoManagerTest, ReadOnlyVolumeIsNeverElected) {
   EXPECT_THAT(Logged(), ElementsAre(NotACandidate("/shares/locked/")));
 }
 
+/// The locator file would have two lines.
+TEST_F(VolumeInfoManagerTest, VolumeWithALineFeedInItsMountPointIsNeverElected) {
+  Add(Record("/shares/a\nb/", 100 * GIB, 100 * GIB));
+  EXPECT_FALSE(registry.reelectMasterVolume());
+  Add(Record("/shares/a/", GIB, GIB));
+  EXPECT_TRUE(registry.reelectMasterVolume());
+  EXPECT_EQ("/shares/a/", Master());
+  EXPECT_THAT(Logged(),
+              ElementsAre(NotACandidate("/shares/a\nb/"), NotACandidate("/shares/a\nb/")));
+}
+
 TEST_F(VolumeInfoManagerTest, UnmeasuredVolumeIsNeverElected) {
   Add(VolumeInfo{.mountPoint = "/shares/a/"});
   EXPECT_FALSE(registry.reelectMasterVolume());
