@@ -93,8 +93,7 @@ util::FileDescriptor DatabaseFiles::Open(std::string_view suffix, int flags, mod
       refusal = Refusal(suffix, status);
     }
     if (refusal.empty() && MayBeWritten(suffix) && IsOnAnotherMount(file.Get())) {
-      refusal =
-          util::FormatString("'%s' is a mount of its own", (path_ + std::string(suffix)).c_str());
+      refusal = Refused("'%s' is a mount of its own", path_ + std::string(suffix));
     }
   }
   if (!refusal.empty()) {
@@ -161,6 +160,10 @@ struct stat DatabaseFiles::Status(std::string_view suffix) const {
   return status;
 }
 
+std::string DatabaseFiles::Refused(const char* format, const std::string& path) {
+  return util::FormatString(format, path.c_str());
+}
+
 std::string DatabaseFiles::Name(std::string_view suffix) const {
   return name_ + std::string(suffix);
 }
@@ -169,13 +172,13 @@ std::string DatabaseFiles::Name(std::string_view suffix) const {
 std::string DatabaseFiles::Refusal(std::string_view suffix, const struct stat& status) const {
   const std::string path = path_ + std::string(suffix);
   if (!S_ISREG(status.st_mode)) {
-    return util::FormatString("'%s' is not a regular file", path.c_str());
+    return Refused("'%s' is not a regular file", path);
   }
   if (MayBeWritten(suffix) && status.st_nlink > 1) {
-    return util::FormatString("'%s' has another name", path.c_str());
+    return Refused("'%s' has another name", path);
   }
   if (written_ && status.st_uid != folderStatus_.st_uid && status.st_uid != geteuid()) {
-    return util::FormatString("'%s' belongs to another user", path.c_str());
+    return Refused("'%s' belongs to another user", path);
   }
   return {};
 }

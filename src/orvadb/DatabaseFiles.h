@@ -60,6 +60,9 @@ public:
   /// State of one of the files; links are not followed. All zero when there is none.
   struct stat Status(std::string_view suffix) const;
 
+  /// Why the file at `path` is not used; `format` has one %s for it.
+  static std::string Refused(const char* format, const std::string& path);
+
 private:
   std::string Name(std::string_view suffix) const;
   std::string Refusal(std::string_view suffix, const struct stat& status) const;

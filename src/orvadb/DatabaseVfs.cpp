@@ -194,8 +194,7 @@ bool DatabaseVfs::Accepts(const char* path) const noexcept {
     return true;
   }
   try {
-    lastRefusal =
-        util::FormatString("'%s' names another file", (files_.Path() + "-journal").c_str());
+    lastRefusal = DatabaseFiles::Refused("'%s' names another file", files_.Path() + "-journal");
   } catch (const std::exception&) {
     lastRefusal.clear(); // no memory: SQLite's own message has to do
   }

@@ -114,15 +114,10 @@ private:
   sqlite3* handle_;
   int busyTimeout_;
   std::unique_ptr<WorkLimit> workLimit_;
-<<<<<<< HEAD
   std::function<void()> checkBeforeCommit_; ///< may be empty
-  /// By SQL text; there are few, because values are never part of a text. Null while in use.
-  std::unordered_map<std::string, Compiled, TextHash, std::equal_to<>> statements_;
-=======
   /// By SQL text; there are few, because values are never part of a text.
   std::unordered_map<std::string, Kept, TextHash, std::equal_to<>> statements_;
   unsigned long long schema_ = 0; ///< counts the possible changes of the schema in memory
->>>>>>> wt-b
 
   unsigned long long transaction_ = 0;  ///< number of the running transaction, 0 for none
   unsigned long long transactions_ = 0; ///< begun so far
