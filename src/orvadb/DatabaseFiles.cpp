@@ -99,6 +99,8 @@ util::FileDescriptor DatabaseFiles::Open(std::string_view suffix, int flags, mod
   if (!refusal.empty()) {
     file.Reset();
     errno = EPERM;
+  } else if (suffix.empty()) {
+    databaseOwner_ = status.st_uid;
   }
   return file;
 }
@@ -177,7 +179,9 @@ std::string DatabaseFiles::Refusal(std::string_view suffix, const struct stat& s
   if (MayBeWritten(suffix) && status.st_nlink > 1) {
     return Refused("'%s' has another name", path);
   }
-  if (written_ && status.st_uid != folderStatus_.st_uid && status.st_uid != geteuid()) {
+  // SQLite gives the logs to the owner of the database.
+  if (written_ && !suffix.empty() && status.st_uid != databaseOwner_ &&
+      status.st_uid != folderStatus_.st_uid && status.st_uid != geteuid()) {
     return Refused("'%s' belongs to another user", path);
   }
   return {};

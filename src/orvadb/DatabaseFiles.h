@@ -5,6 +5,7 @@
 #include <sys/stat.h>
 #include <sys/types.h>
 
+#include <atomic>
 #include <cstdint>
 #include <optional>
 #include <string>
@@ -18,8 +19,9 @@ namespace orva::db {
 /// in that directory has been checked:
 /// - It is a regular file. Links are not followed; FIFOs and devices are not waited for.
 /// - The directory is still at its path: a volume that was pulled is not used any more.
-/// - A file that may be written has no second name and was not mounted at its name by itself. If
-///   the database is written, it belongs to the owner of the directory or to this process.
+/// - A file that may be written has no second name and was not mounted at its name by itself.
+/// - If the database is written, its logs belong to its owner, that of the directory, or this
+///   process.
 /// Any thread. Const operations may run at the same time.
 class DatabaseFiles {
 public:
@@ -79,6 +81,7 @@ private:
   util::FileDescriptor folder_; ///< the directory; null if it could not be opened
   int folderError_ = 0;         ///< errno of that
   struct stat folderStatus_ {};
+  mutable std::atomic<uid_t> databaseOwner_ = 0; ///< of the database when it was last opened
   std::uint64_t folderMount_ = 0;
 };
 

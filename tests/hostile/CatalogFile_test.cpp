@@ -56,11 +56,15 @@ TEST_P(SpecialCatalogTest, CatalogFolderThatIsNotAFolderIsRefused) {
 TEST_P(SpecialCatalogTest, LogThatIsNotARegularFileIsRefused) {
   MakeCatalog();
   SetWalMode();
-  for (const char* const suffix : {"-journal", "-wal", "-shm"}) {
+  catalogHasWal = true;
+  for (const char* const suffix : {"-wal", "-shm"}) {
     SCOPED_TRACE(suffix);
     const SpecialFile special(GetParam(), CATALOG + suffix, VICTIM);
     EXPECT_EQ(Outcome::Refused, MergeHostileVolume());
   }
+  // There is no journal, in this mode or behind a link to nothing.
+  const SpecialFile special(GetParam(), CATALOG + "-journal", VICTIM);
+  EXPECT_NE(Outcome::Broken, MergeHostileVolume());
 }
 
 INSTANTIATE_TEST_SUITE_P(Kinds, SpecialCatalogTest, ::testing::ValuesIn(SPECIAL_KINDS),

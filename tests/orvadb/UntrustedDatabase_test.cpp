@@ -309,7 +309,10 @@ TEST_P(SideFileTest, FileWithAnotherNameIsNotUsed) {
   ExpectRefused("has another name");
 }
 
-TEST_P(SideFileTest, FileOfAnotherUserIsNotUsed) {
+TEST_P(SideFileTest, LogOfAnotherUserIsNotUsed) {
+  if (GetParam().empty()) {
+    GTEST_SKIP() << "the database may belong to anybody";
+  }
   std::ofstream(Name()) << "theirs";
   if (chown(Name().c_str(), 1, 1) != 0) {
     GTEST_SKIP() << "this user cannot give files away";
@@ -338,8 +341,20 @@ TEST_F(UntrustedDatabaseTest, FileWithAnotherNameIsRead) {
   EXPECT_NO_THROW(Statement(db, "SELECT a FROM t").Execute());
 }
 
-TEST_F(UntrustedDatabaseTest, FileOfTheOwnerOfTheDirectoryIsWritten) {
-  if (chown("/tmp/db", 1, 1) != 0 || chown(path.c_str(), 1, 1) != 0) {
+TEST_F(UntrustedDatabaseTest, DatabaseOfAnotherUserIsWrittenWithALogOfTheSameUser) {
+  if (chown(path.c_str(), 1, 1) != 0) {
+    GTEST_SKIP() << "this user cannot give files away";
+  }
+  EXPECT_EQ(FailureOf("INSERT INTO t VALUES(1, 2)"), "");
+  std::ofstream(path + "-journal") << "x";
+  EXPECT_EQ(chown((path + "-journal").c_str(), 1, 1), 0);
+  EXPECT_EQ(FailureOf("INSERT INTO t VALUES(1, 2)"), "");
+  EXPECT_FALSE(fs::exists(path + "-journal"));
+}
+
+TEST_F(UntrustedDatabaseTest, LogOfTheOwnerOfTheDirectoryIsUsed) {
+  std::ofstream(path + "-journal") << "x";
+  if (chown("/tmp/db", 1, 1) != 0 || chown((path + "-journal").c_str(), 1, 1) != 0) {
     GTEST_SKIP() << "this user cannot give files away";
   }
   EXPECT_EQ(FailureOf("INSERT INTO t VALUES(1, 2)"), "");
