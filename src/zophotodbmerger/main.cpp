@@ -18,6 +18,7 @@
 #include <cstdlib>
 #include <exception>
 #include <iostream>
+#include <string_view>
 
 namespace {
 
@@ -47,6 +48,22 @@ void OpenStandardDescriptors() {
   close(descriptor);
 }
 
+/// Prints the version or the usage. Returns the exit status.
+int AnswerArguments(const std::vector<std::string_view>& arguments) {
+  if (arguments == std::vector<std::string_view>{"--version"}) {
+    std::cout << "zophotodbmerger " PROGRAM_VERSION "\n";
+    return EXIT_SUCCESS;
+  }
+  const bool isAsked = arguments == std::vector<std::string_view>{"--help"};
+  (isAsked ? std::cout : std::cerr)
+      << "usage: zophotodbmerger [--help | --version]\n\n"
+         "Without an option, runs as the daemon that merges the photo catalogs of all volumes into\n"
+         "one database. See zophotodbmerger(8).\n"
+         "  --help     prints this text\n"
+         "  --version  prints the version\n";
+  return isAsked ? EXIT_SUCCESS : 2;
+}
+
 void ListenUntilTheServiceEnds() {
   dbmerger::StateMachine::Instance();
   auto listener = std::make_unique<dbmerger::NotificationListener>();
@@ -58,9 +75,12 @@ void ListenUntilTheServiceEnds() {
 
 } // namespace
 
-int main() {
+int main(int count, char* arguments[]) {
   IgnoreSignalsOfWrites();
   OpenStandardDescriptors();
+  if (count > 1) {
+    return AnswerArguments({arguments + 1, arguments + count});
+  }
   const dbmerger::InstanceLock lock;
   if (lock.IsHeldByAnother()) {
     const char* const path = dbmerger::InstanceLock::PATH;

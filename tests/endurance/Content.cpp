@@ -67,12 +67,10 @@ Content Content::At(const std::string& location) {
   return content;
 }
 
-void Content::Merge(const Disk& disk, bool stopped) {
+void Content::Merge(const Disk& disk) {
   Statistics& statistics = statistics_[disk.MountPoint()];
-  if (!stopped) {
-    ApplyFolders(disk);
-    statistics.updated = ApplyFiles(disk, statistics.updated);
-  }
+  ApplyFolders(disk);
+  statistics.updated = ApplyFiles(disk, statistics.updated);
   statistics.transcoded = Count(disk, "status = 3");
   statistics.total = Count(disk, "1");
 }

@@ -18,9 +18,8 @@ public:
   /// The content of the database at `location`; that of a new one when there is none.
   static Content At(const std::string& location);
 
-  /// Applies the changes of the disk's catalog since the last merge; only its counts when the
-  /// merger has been stopped.
-  void Merge(const Disk& disk, bool stopped);
+  /// Applies the changes of the disk's catalog since the last merge.
+  void Merge(const Disk& disk);
 
   /// Removes the volume's rows, but not its counts.
   void RemoveVolume(const std::string& mountPoint);

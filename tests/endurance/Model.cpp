@@ -34,17 +34,28 @@ Result Model::Handle(Event event, const std::string& mountPoint, Contents& datab
   databases_ = &databases;
   circumstances_ = circumstances;
   result_ = {};
+  const bool unfinished = IsUnfinished();
   if (event == Event::Unplugged) {
     Unregister(mountPoint);
   } else {
     Register(event, mountPoint);
   }
   try {
+    if (unfinished) {
+      Move();
+    }
     Dispatch(event, mountPoint);
   } catch (const Refused&) {
     result_.refused = true;
+    if (IsUnfinished() && !stopped_) {
+      MoveAfterFailure();
+    }
   }
   return result_;
+}
+
+bool Model::IsUnfinished() const {
+  return state_ == State::Scanned && (stopped_ || master_.empty());
 }
 
 void Model::Register(Event event, const std::string& mountPoint) {
@@ -120,12 +131,24 @@ void Model::Unplugged(const std::string& mountPoint) {
   }
   if (state_ == State::Scanned) {
     RemoveVolume(mountPoint);
-    stopped_ = true;
   }
+  Move();
+}
+
+void Model::Move() {
+  stopped_ = state_ == State::Scanned;
   if (Elect()) {
     EnterScanned();
   } else {
     FallBack();
+  }
+}
+
+void Model::MoveAfterFailure() {
+  try {
+    Move();
+  } catch (const Refused&) {
+    // The next event repeats it.
   }
 }
 
@@ -139,6 +162,7 @@ void Model::EnterScanned() {
 void Model::FallBack() {
   DatabaseOf(SHARES) = Content();
   locator_ = "zophotos_db_path=/shares//.zophotos/zophotos.db\n";
+  stopped_ = false;
   if (std::filesystem::exists(SHARES)) {
     volumes_.push_back(
         {.mountPoint = SHARES, .capacity = SHARES_CAPACITY, .free = SHARES_CAPACITY});
@@ -166,7 +190,7 @@ void Model::Merge(const std::string& mountPoint) {
         !IsWritable(Location(master_))) {
       throw GivenUp();
     }
-    DatabaseOf(master_).Merge(*disk->second, stopped_);
+    DatabaseOf(master_).Merge(*disk->second);
     result_.merges = 1;
   } catch (const GivenUp&) {
     result_.gaveUp = true;

@@ -74,6 +74,9 @@ private:
   bool Elect();
   void Dispatch(notify::Event event, const std::string& mountPoint);
   void Unplugged(const std::string& mountPoint);
+  bool IsUnfinished() const;
+  void Move();
+  void MoveAfterFailure();
   void EnterScanned();
   void FallBack();
   void Merge(const std::string& mountPoint);
@@ -88,7 +91,7 @@ private:
   std::vector<Record> volumes_;
   std::string master_;
   State state_ = State::Default;
-  bool stopped_ = false; ///< the merger has been stopped
+  bool stopped_ = false; ///< the merger has been stopped by a move that failed
   std::string locator_ = "zophotos_db_path=/shares//.zophotos/zophotos.db\n";
 
   // While a notification is handled.

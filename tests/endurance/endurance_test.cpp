@@ -502,8 +502,6 @@ protected:
       }
       Notify(Event::Plugged, disk.Path());
     }
-    // A stopped merger merges nothing: this starts another one.
-    Notify(Event::Unplugged, "/shares/None");
     Notify(Event::Scanned, "/shares/Archive");
     for (const std::string& mountPoint : Present()) {
       const int before = merges_;

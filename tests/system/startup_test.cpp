@@ -252,5 +252,43 @@ TEST_F(StartUp, WithoutAPlaceForTheLockTheDaemonStarts) {
   EXPECT_EQ(CONNECTED, appliance.TakeLog());
 }
 
+/// Runs the program with arguments. It must not become the daemon: it touches nothing.
+Outcome RunWith(const Lines& arguments) {
+  Lines command{ProgramPath("zophotodbmerger")};
+  command.insert(command.end(), arguments.begin(), arguments.end());
+  Outcome outcome = Run(command);
+  EXPECT_EQ("(absent)", Appliance::Locator());
+  EXPECT_THAT(PathsBelow("/shares"), IsEmpty());
+  EXPECT_FALSE(fs::exists("/run/zophotodbmerger"));
+  return outcome;
+}
+
+const char* const USAGE = "usage: zophotodbmerger [--help | --version]\n";
+
+TEST_F(StartUp, HelpAndVersionArePrinted) {
+  const Outcome help = RunWith({"--help"});
+  EXPECT_EQ(Exited(0), help.status);
+  EXPECT_THAT(help.output, ::testing::StartsWith(USAGE));
+  EXPECT_THAT(help.output, ::testing::HasSubstr("See zophotodbmerger(8)."));
+  EXPECT_EQ("", help.error);
+
+  const Outcome version = RunWith({"--version"});
+  EXPECT_EQ(Exited(0), version.status);
+  EXPECT_THAT(version.output, ::testing::MatchesRegex("zophotodbmerger [0-9]+\\.[0-9.]+\n"));
+  EXPECT_EQ("", version.error);
+  EXPECT_THAT(appliance.TakeLog(), IsEmpty());
+}
+
+TEST_F(StartUp, OtherArgumentsAreRefused) {
+  for (const Lines& arguments : {Lines{"-h"}, Lines{"start"}, Lines{""}, Lines{"--help", "--help"},
+                                 Lines{"--version", "x"}, Lines{"--"}}) {
+    const Outcome outcome = RunWith(arguments);
+    EXPECT_EQ(Exited(2), outcome.status) << arguments[0];
+    EXPECT_EQ("", outcome.output);
+    EXPECT_THAT(outcome.error, ::testing::StartsWith(USAGE));
+  }
+  EXPECT_THAT(appliance.TakeLog(), IsEmpty());
+}
+
 } // namespace
 } // namespace orva::test

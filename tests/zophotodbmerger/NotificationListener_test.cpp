@@ -320,7 +320,7 @@ TEST_F(NotificationTest, EmptyMountPointIsOutOfRange) {
 
 // Events that fail.
 
-/// A state whose handlers fail and leave something undone, as long as the test wants it.
+/// A state whose handlers and recovery fail when a test has set that.
 class FailingState final : public State {
 public:
   explicit FailingState(const dbmerger::VolumeInfoManager& registry) : registry_(registry) {}
