@@ -2,6 +2,7 @@
 
 #include "orvautil/Exception.h"
 
+#include <cerrno>
 #include <cstddef>
 
 namespace orva::util {
@@ -15,7 +16,7 @@ void Thread::Create(int stackMebibytes, unsigned flags, bool detached) {
     throw Exception("a thread needs a stack size, no flags, and must be joinable");
   }
   if (thread_.joinable()) {
-    throw Exception("the thread was started before and not waited for");
+    throw boost::thread_resource_error(EBUSY);
   }
   boost::thread::attributes attributes;
   attributes.set_stack_size(static_cast<std::size_t>(stackMebibytes) << 20U);

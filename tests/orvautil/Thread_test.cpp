@@ -76,7 +76,7 @@ TEST(Thread, WaitReturnsAtOnceWhenThereIsNothingToWaitFor) {
 TEST(Thread, AThreadThatWasNotWaitedForIsNotStartedAgain) {
   Worker worker;
   worker.Create(8, 0, false);
-  EXPECT_THROW(worker.Create(8, 0, false), Exception);
+  EXPECT_THROW(worker.Create(8, 0, false), boost::thread_resource_error);
   worker.gate.count_down();
   worker.Wait();
   EXPECT_EQ(worker.runs, 1);

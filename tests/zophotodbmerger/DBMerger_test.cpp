@@ -158,7 +158,8 @@ protected:
   /// The next line.
   std::string Read() const {
     std::string line(1000, '\0');
-    line.resize(std::max<ssize_t>(recv(socket_.Get(), line.data(), line.size(), 0), 0));
+    const ssize_t size = recv(socket_.Get(), line.data(), line.size(), 0);
+    line.resize(static_cast<std::size_t>(std::max<ssize_t>(size, 0)));
     return line;
   }
 

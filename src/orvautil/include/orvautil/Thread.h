@@ -19,8 +19,9 @@ public:
   virtual void Run() = 0;
 
   /// Starts the thread, joinable, with a stack of `stackMebibytes`. No `flags` are defined and
-  /// no thread is `detached`: pass 0 and false. Throws Exception for other values, and for a second
-  /// thread before Wait; boost::thread_resource_error when the system cannot start a thread.
+  /// no thread is `detached`: pass 0 and false. Throws Exception for other values, and
+  /// boost::thread_resource_error when the system cannot start a thread, or an earlier one was not
+  /// waited for.
   void Create(int stackMebibytes, unsigned flags, bool detached);
 
   /// Blocks until Run has returned; returns at once when it was never started or already
