@@ -2,11 +2,8 @@
 // stops the daemon right before each call that takes one of the names, and the test replaces the
 // name, its directory, or the journal next to it.
 
-#include "Catalog.h"
-#include "CraftedDatabase.h"
-#include "Expectations.h"
 #include "Messages.h"
-#include "Replacement.h"
+#include "NamesTest.h"
 #include "Tracer.h"
 
 #include "orvautil/FormatString.h"
@@ -14,34 +11,16 @@
 #include "support/TestScale.h"
 
 #include <sys/syscall.h>
-#include <syslog.h>
 
-#include <chrono>
-#include <condition_variable>
-#include <csignal>
 #include <filesystem>
 #include <fstream>
-#include <map>
-#include <mutex>
 #include <optional>
 #include <set>
-#include <stdexcept>
-#include <thread>
 
 namespace orva::test {
 namespace {
 
 namespace fs = std::filesystem;
-using ::testing::IsEmpty;
-
-/// The longest time for an event. A lease would stop an unprepared opening for 45 seconds.
-constexpr std::chrono::seconds LONGEST_EVENT{20};
-
-const std::string FOLDER = "/shares/Master/.zophotos";
-const std::string MERGED = FOLDER + "/zophotos.db";
-const std::string HOME = "/shares/Vol/.orva";
-const std::string CATALOG = HOME + "/orva.db";
-const std::string LOCATOR = "/tmp/zophotodbmerger.conf";
 
 /// What the daemon does while a name is replaced.
 enum class Work { Merge, ReMerge, FirstMerge, Removal };
@@ -146,26 +125,6 @@ std::set<std::string> PlacesFor(const Lines& names) {
   return places;
 }
 
-const LogLine KILLED = Error("killed: it has not answered in time");
-
-/// Kills a process that is not done in time, and logs it, so that the test fails and does not hang.
-class Watchdog {
-public:
-  explicit Watchdog(pid_t process)
-      : thread_([process](const std::stop_token& done) {
-          std::mutex mutex;
-          std::unique_lock lock(mutex);
-          std::condition_variable_any().wait_for(lock, done, LONGEST_EVENT, [] { return false; });
-          if (!done.stop_requested()) {
-            kill(process, SIGKILL);
-            syslog(LOG_LOCAL1 | LOG_ERR, "%s", KILLED.text.c_str());
-          }
-        }) {}
-
-private:
-  std::jthread thread_;
-};
-
 /// A call that takes names.
 struct Instant {
   std::size_t number; ///< among these calls
@@ -173,35 +132,9 @@ struct Instant {
   Lines names; ///< their paths
 };
 
-class ReplacedNames : public SystemTest,
+class ReplacedNames : public NamesTest,
                       public ::testing::WithParamInterface<std::tuple<Work, Replacement>> {
 protected:
-  void SetUp() override {
-    Catalog(master_).AddPhoto("m.jpg", 1, 1000);
-    Catalog catalog(vol_);
-    catalog.AddFolder("a/", 11);
-    catalog.AddPhoto("a/one.jpg", 1, 1000);
-    std::ofstream(LOCATOR).flush();
-    appliance.Start();
-    appliance.Handle(Plugged(master_.Path()));
-    appliance.Handle(Plugged(vol_.Path()));
-    appliance.Handle(Scanned(master_.Path()));
-    appliance.Handle(TranscodedBatch(master_.Path()));
-    appliance.Handle(TranscodedBatch(vol_.Path()));
-    merged_ = Bytes::Of(MERGED);
-    catalog.AddPhoto("a/two.jpg", 2, 2000);
-    catalog_ = Bytes::Of(CATALOG);
-    volumes_.try_emplace(fs::path(FOLDER).parent_path(), "/shares/Master/spare",
-                         std::vector{MERGED});
-    volumes_.try_emplace(fs::path(HOME).parent_path(), "/shares/Vol/spare", std::vector{CATALOG});
-    volumes_.try_emplace(fs::path(LOCATOR).parent_path(), "/tmp/spare", std::vector<std::string>());
-
-    RestoreFiles();
-    appliance.Handle(TranscodedBatch(vol_.Path()));
-    good_ = MergedDatabase(master_.Path()).Content();
-    descriptors_ = Descriptors();
-  }
-
   /// Replaces names before each call of the work that takes one.
   void ReplaceEverywhere() {
     const std::vector<Instant> instants = Instants();
@@ -223,7 +156,7 @@ protected:
         }
       }
     }
-    EXPECT_EQ(descriptors_, Descriptors());
+    ExpectNoMoreDescriptors();
   }
 
 private:
@@ -236,26 +169,12 @@ private:
   std::string Message() const {
     switch (work_) {
     case Work::ReMerge:
-      return Purged(vol_.Path());
+      return Purged(vol.Path());
     case Work::Removal:
-      return Unplugged(vol_.Path());
+      return Unplugged(vol.Path());
     default:
-      return TranscodedBatch(vol_.Path());
+      return TranscodedBatch(vol.Path());
     }
-  }
-
-  /// The files before the work.
-  void RestoreFiles() const {
-    for (const std::string& path : {FOLDER, HOME, LOCATOR}) {
-      fs::remove_all(path);
-    }
-    for (const std::string& folder : {FOLDER, HOME}) {
-      fs::create_directory(folder);
-      fs::permissions(folder, fs::perms(0777));
-    }
-    catalog_.Save(CATALOG);
-    merged_.Save(MERGED);
-    std::ofstream(LOCATOR).flush();
   }
 
   void PrepareWork() const {
@@ -323,7 +242,7 @@ private:
       return ended || (!NamesOf(call).empty() && calls++ == instant.number);
     });
     if (!ended) {
-      Replacer& replacer = replacer_.emplace(volumes_.at(VolumeOf(place)));
+      Replacer& replacer = replacer_.emplace(FilesFor(place));
       replacer.Replace(kind_, place);
       if (forOneCall) {
         tracer.RunUntil([&](const SystemCall& call) { return call.thread == thread; });
@@ -333,70 +252,15 @@ private:
     return last;
   }
 
-  void AwaitAnswer(const std::string& last) {
-    bool killed = false;
-    const bool ended = appliance.Log().Await(
-        [&, searched = std::size_t{0}](const std::vector<LogLine>& lines) mutable {
-          for (; searched < lines.size(); ++searched) {
-            killed = killed || lines[searched] == KILLED;
-            if (killed || lines[searched] == Error(last)) {
-              return true;
-            }
-          }
-          return false;
-        });
-    if (killed || !ended) {
-      throw std::runtime_error("the daemon has not answered");
-    }
-  }
-
-  static std::string VolumeOf(const std::string& place) {
-    for (const std::string& path : {FOLDER, HOME, LOCATOR}) {
-      if (place.starts_with(path)) {
-        return fs::path(path).parent_path();
-      }
-    }
-    return {};
-  }
-
-  /// Expects that nothing was harmed, puts the files back as an administrator would, and expects
-  /// that the daemon continues.
+  /// Expects that nothing was harmed and that the daemon continues.
   void Recover() {
-    for (auto& [volume, files] : volumes_) {
-      EXPECT_THAT(files.Changes(), IsEmpty());
-    }
+    ExpectPrivateFilesUnchanged();
     RestoreFiles();
-    appliance.TakeLog();
-    Log log;
-    if (work_ == Work::Removal) {
-      log = appliance.Handle(Unplugged(vol_.Path())) + appliance.Handle(Plugged(vol_.Path()));
-      EXPECT_EQ("zophotos_db_path=/shares/Master//.zophotos/zophotos.db\n", Appliance::Locator());
-    }
-    log = log + appliance.Handle(TranscodedBatch(vol_.Path()));
-    for (const LogLine& line : log) {
-      EXPECT_NE(Error("").priority, line.priority) << line.text;
-    }
-    EXPECT_EQ(good_, MergedDatabase(master_.Path()).Content());
-    for (auto& [volume, files] : volumes_) {
-      EXPECT_THAT(files.Changes(), IsEmpty());
-    }
-  }
-
-  std::size_t Descriptors() const {
-    const fs::path directory = "/proc/" + std::to_string(appliance.Daemon().Pid()) + "/fd";
-    return static_cast<std::size_t>(
-        std::distance(fs::directory_iterator(directory), fs::directory_iterator()));
+    ExpectGoodMerge(work_ == Work::Removal);
   }
 
   const Work work_ = std::get<0>(GetParam());
   const Replacement kind_ = std::get<1>(GetParam());
-  const Volume master_{"Master", "150g"};
-  const Volume vol_{"Vol", "1g"};
-  Bytes merged_;
-  Bytes catalog_;
-  Lines good_; ///< what the merged database holds after a good merge
-  std::size_t descriptors_ = 0;
-  std::map<std::string, PrivateFiles> volumes_; ///< by the directory that the names are below
   std::optional<Replacer> replacer_;
   std::set<std::tuple<std::uint64_t, std::string, std::string, bool>> chosen_;
 };
