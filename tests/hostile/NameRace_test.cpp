@@ -21,11 +21,6 @@ const std::chrono::seconds DURATION{TestScale(3, 60)};
 /// How many hard links to a private file there are for a name.
 constexpr int HARD_LINKS = 4;
 
-/// The names of a database and of the files that SQLite keeps next to it.
-Lines WithLogs(const std::string& database) {
-  return {database, database + "-journal", database + "-wal", database + "-shm"};
-}
-
 /// The names on one file system, and a pool directory there for their replacements.
 struct Group {
   std::string pool;

@@ -26,6 +26,10 @@ const LogLine KILLED = Error("killed: it has not answered in time");
 
 } // namespace
 
+Lines WithLogs(const std::string& database) {
+  return {database, database + "-journal", database + "-wal", database + "-shm"};
+}
+
 Watchdog::Watchdog(pid_t process)
     : thread_([process](const std::stop_token& done) {
         std::mutex mutex;

@@ -18,6 +18,9 @@ const std::string HOME = "/shares/Vol/.orva";
 const std::string CATALOG = HOME + "/orva.db";
 const std::string LOCATOR = "/tmp/zophotodbmerger.conf";
 
+/// The names of a database and of the files that SQLite keeps next to it.
+Lines WithLogs(const std::string& database);
+
 /// Kills a process that has not answered in time, so that the test fails and does not hang.
 class Watchdog {
 public:

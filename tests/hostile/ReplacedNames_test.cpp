@@ -27,6 +27,9 @@ enum class Work { Merge, ReMerge, FirstMerge, Removal };
 
 const std::vector<Work> WORKS = {Work::Merge, Work::ReMerge, Work::FirstMerge, Work::Removal};
 
+const Lines EVERY_NAME =
+    Lines{FOLDER, HOME, LOCATOR} + WithLogs(MERGED) + WithLogs(MERGED + ".new") + WithLogs(CATALOG);
+
 std::string NameOf(Work work) {
   return std::vector<std::string>{"Merge", "ReMerge", "FirstMerge", "Removal"}.at(
       static_cast<std::size_t>(work));
@@ -135,8 +138,22 @@ struct Instant {
 class ReplacedNames : public NamesTest,
                       public ::testing::WithParamInterface<std::tuple<Work, Replacement>> {
 protected:
+  /// Replaces each name before the work.
+  void ReplaceBefore() {
+    for (const std::string& place : EVERY_NAME) {
+      if (IsFor(kind_, fs::path(place).filename()) && !HasFailure()) {
+        SCOPED_TRACE(place + " replaced before the work");
+        Expect([&] {
+          replacer_.emplace(FilesFor(place)).Replace(kind_, place);
+          appliance.Service().Send(Message());
+          return appliance.SendBarrier();
+        });
+      }
+    }
+  }
+
   /// Replaces names before each call of the work that takes one.
-  void ReplaceEverywhere() {
+  void ReplaceDuring() {
     const std::vector<Instant> instants = Instants();
     ASSERT_FALSE(instants.empty());
     for (const Instant& instant : instants) {
@@ -149,14 +166,13 @@ protected:
               "%s replaced before name call %zu (system call %llu on %s)%s", place.c_str(),
               instant.number, static_cast<unsigned long long>(instant.call),
               instant.names.front().c_str(), forOneCall ? ", for this call only" : ""));
-          ReplaceAt(instant, place, forOneCall);
+          Expect([&] { return Replace(instant, place, forOneCall); });
           if (HasFailure()) {
             return;
           }
         }
       }
     }
-    ExpectNoMoreDescriptors();
   }
 
 private:
@@ -216,11 +232,14 @@ private:
     return instants;
   }
 
-  void ReplaceAt(const Instant& instant, const std::string& place, bool forOneCall) {
+  /// Prepares the work, calls `start`, which returns the line that is logged after it, and expects
+  /// that the daemon ends the work, that nothing was harmed and that the daemon continues.
+  template <typename Start>
+  void Expect(Start start) {
     PrepareWork();
     const Watchdog watchdog(appliance.Daemon().Pid());
     try {
-      AwaitAnswer(Replace(instant, place, forOneCall));
+      AwaitAnswer(start());
     } catch (const std::exception& error) {
       ADD_FAILURE() << error.what();
       return;
@@ -252,7 +271,6 @@ private:
     return last;
   }
 
-  /// Expects that nothing was harmed and that the daemon continues.
   void Recover() {
     ExpectPrivateFilesUnchanged();
     RestoreFiles();
@@ -266,7 +284,9 @@ private:
 };
 
 TEST_P(ReplacedNames, HarmNothing) {
-  ReplaceEverywhere();
+  ReplaceBefore();
+  ReplaceDuring();
+  ExpectNoMoreDescriptors();
 }
 
 INSTANTIATE_TEST_SUITE_P(At, ReplacedNames,
