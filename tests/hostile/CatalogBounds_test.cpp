@@ -92,7 +92,7 @@ protected:
     deadline = std::chrono::minutes(10); // the machine may be busy: processor time counts
     EXPECT_EQ(Outcome::Refused, MergeHostileVolume());
 
-    const double longest = AreProgramsSanitized() ? 8 : 2;
+    const double longest = AreProgramsSanitized() ? 4 : 1;
     const double seconds =
         LastAttempt().processorSeconds * (1 << 20) / static_cast<double>(fs::file_size(CATALOG));
     EXPECT_LT(seconds, longest) << "for each MiB of the catalog";

@@ -106,20 +106,20 @@ private:
   }
 
 protected:
-  const Lines merged = WithLogs(MERGED) + WithLogs(MERGED + ".new");
-  const Group locator{"/tmp/pool", {LOCATOR}};
+  const Lines merged = WithLogs(MERGED_FILE) + WithLogs(MERGED_FILE + ".new");
+  const Group locator{"/tmp/pool", {LOCATOR_FILE}};
 };
 
 TEST_F(NameRace, ForFilesHarmsNothingAndEndsWithIt) {
-  Race({{"/shares/Master/pool", merged}, {"/shares/Vol/pool", WithLogs(CATALOG)}, locator});
+  Race({{"/shares/Master/pool", merged}, {"/shares/Vol/pool", WithLogs(CATALOG_FILE)}, locator});
 }
 
 TEST_F(NameRace, ForDirectoriesHarmsNothingAndEndsWithIt) {
   for (const Volume* const volume : {&master, &vol}) {
     fs::permissions(volume->Path(), fs::perms(0777));
   }
-  Race({{"/shares/Master/pool", Lines{FOLDER} + merged},
-        {"/shares/Vol/pool", Lines{HOME} + WithLogs(CATALOG)},
+  Race({{"/shares/Master/pool", Lines{MERGED_FOLDER} + merged},
+        {"/shares/Vol/pool", Lines{CATALOG_FOLDER} + WithLogs(CATALOG_FILE)},
         locator});
 }
 

@@ -52,12 +52,12 @@ void NamesTest::SetUp() {
   appliance.Handle(Scanned(master.Path()));
   appliance.Handle(TranscodedBatch(master.Path()));
   appliance.Handle(TranscodedBatch(vol.Path()));
-  merged_ = Bytes::Of(MERGED);
+  merged_ = Bytes::Of(MERGED_FILE);
   catalog.AddPhoto("a/two.jpg", 2, 2000);
-  catalog_ = Bytes::Of(CATALOG);
-  files_.try_emplace(FOLDER, "/shares/Master/spare", std::vector{MERGED});
-  files_.try_emplace(HOME, "/shares/Vol/spare", std::vector{CATALOG});
-  files_.try_emplace(LOCATOR, "/tmp/spare", std::vector<std::string>());
+  catalog_ = Bytes::Of(CATALOG_FILE);
+  files_.try_emplace(MERGED_FOLDER, "/shares/Master/spare", std::vector{MERGED_FILE});
+  files_.try_emplace(CATALOG_FOLDER, "/shares/Vol/spare", std::vector{CATALOG_FILE});
+  files_.try_emplace(LOCATOR_FILE, "/tmp/spare", std::vector<std::string>());
 
   RestoreFiles();
   appliance.Handle(TranscodedBatch(vol.Path()));
@@ -67,10 +67,10 @@ void NamesTest::SetUp() {
 }
 
 void NamesTest::RestoreFiles() const {
-  for (const std::string& path : {FOLDER, HOME, LOCATOR}) {
+  for (const std::string& path : {MERGED_FOLDER, CATALOG_FOLDER, LOCATOR_FILE}) {
     fs::remove_all(path);
   }
-  MakeFiles(FOLDER, HOME, LOCATOR);
+  MakeFiles(MERGED_FOLDER, CATALOG_FOLDER, LOCATOR_FILE);
 }
 
 void NamesTest::ExchangeFiles() const {
@@ -78,8 +78,8 @@ void NamesTest::ExchangeFiles() const {
   const auto fresh = [this](const std::string& path) {
     return FilesFor(path).Directory() + "/fresh";
   };
-  MakeFiles(fresh(FOLDER), fresh(HOME), fresh(LOCATOR));
-  for (const std::string& path : {FOLDER, HOME, LOCATOR}) {
+  MakeFiles(fresh(MERGED_FOLDER), fresh(CATALOG_FOLDER), fresh(LOCATOR_FILE));
+  for (const std::string& path : {MERGED_FOLDER, CATALOG_FOLDER, LOCATOR_FILE}) {
     const std::string made = fresh(path);
     if (renameat2(AT_FDCWD, made.c_str(), AT_FDCWD, path.c_str(), RENAME_EXCHANGE) != 0) {
       renameat2(AT_FDCWD, made.c_str(), AT_FDCWD, path.c_str(), RENAME_NOREPLACE);
@@ -94,8 +94,8 @@ void NamesTest::MakeFiles(const std::string& folder, const std::string& home,
     fs::create_directory(directory);
     fs::permissions(directory, fs::perms(0777));
   }
-  catalog_.Save(home + "/" + fs::path(CATALOG).filename().string());
-  merged_.Save(folder + "/" + fs::path(MERGED).filename().string());
+  catalog_.Save(home + "/" + fs::path(CATALOG_FILE).filename().string());
+  merged_.Save(folder + "/" + fs::path(MERGED_FILE).filename().string());
   std::ofstream(locator).flush();
   static_cast<void>(chown(locator.c_str(), UNTRUSTED_USER, UNTRUSTED_USER) == 0);
 }

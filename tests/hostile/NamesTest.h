@@ -12,11 +12,11 @@
 namespace orva::test {
 
 // Names that an untrusted user can replace.
-const std::string FOLDER = "/shares/Master/.zophotos";
-const std::string MERGED = FOLDER + "/zophotos.db";
-const std::string HOME = "/shares/Vol/.orva";
-const std::string CATALOG = HOME + "/orva.db";
-const std::string LOCATOR = "/tmp/zophotodbmerger.conf";
+const std::string MERGED_FOLDER = "/shares/Master/.zophotos";
+const std::string MERGED_FILE = MERGED_FOLDER + "/zophotos.db";
+const std::string CATALOG_FOLDER = "/shares/Vol/.orva";
+const std::string CATALOG_FILE = CATALOG_FOLDER + "/orva.db";
+const std::string LOCATOR_FILE = "/tmp/zophotodbmerger.conf";
 
 /// The names of a database and of the files that SQLite keeps next to it.
 Lines WithLogs(const std::string& database);

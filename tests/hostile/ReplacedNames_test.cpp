@@ -25,10 +25,11 @@ namespace fs = std::filesystem;
 /// What the daemon does while a name is replaced.
 enum class Work { Merge, ReMerge, FirstMerge, Removal };
 
-const std::vector<Work> WORKS = {Work::Merge, Work::ReMerge, Work::FirstMerge, Work::Removal};
+const std::vector<Work> EVERY_WORK = {Work::Merge, Work::ReMerge, Work::FirstMerge, Work::Removal};
 
-const Lines EVERY_NAME =
-    Lines{FOLDER, HOME, LOCATOR} + WithLogs(MERGED) + WithLogs(MERGED + ".new") + WithLogs(CATALOG);
+const Lines EVERY_NAME = Lines{MERGED_FOLDER, CATALOG_FOLDER, LOCATOR_FILE} +
+                         WithLogs(MERGED_FILE) + WithLogs(MERGED_FILE + ".new") +
+                         WithLogs(CATALOG_FILE);
 
 std::string NameOf(Work work) {
   return std::vector<std::string>{"Merge", "ReMerge", "FirstMerge", "Removal"}.at(
@@ -94,12 +95,12 @@ std::string TextAt(pid_t process, std::uint64_t address) {
 /// The path that a name has on the volumes; empty for names that are not replaced.
 std::string PlaceOf(const std::string& name) {
   if (name.starts_with("zophotos.db")) {
-    return FOLDER + "/" + name;
+    return MERGED_FOLDER + "/" + name;
   }
   if (name.starts_with("orva.db")) {
-    return HOME + "/" + name;
+    return CATALOG_FOLDER + "/" + name;
   }
-  for (const std::string& place : {FOLDER, HOME, LOCATOR}) {
+  for (const std::string& place : {MERGED_FOLDER, CATALOG_FOLDER, LOCATOR_FILE}) {
     if (name == fs::path(place).filename()) {
       return place;
     }
@@ -121,7 +122,7 @@ std::string JournalFor(const std::string& place) {
 std::set<std::string> PlacesFor(const Lines& names) {
   std::set<std::string> places(names.begin(), names.end());
   for (const std::string& name : names) {
-    if (name != FOLDER && name != HOME && name != LOCATOR) {
+    if (name != MERGED_FOLDER && name != CATALOG_FOLDER && name != LOCATOR_FILE) {
       places.insert({fs::path(name).parent_path(), JournalFor(name)});
     }
   }
@@ -176,10 +177,12 @@ protected:
   }
 
 private:
-  /// Everything in the long form; otherwise the first call of each kind on each name.
+  /// Everything in the long form; otherwise the first call of each kind on each name, and for one
+  /// call only those that open something.
   bool IsChosen(const Instant& instant, const std::string& place, bool forOneCall) {
-    return chosen_.emplace(instant.call, instant.names.front(), place, forOneCall).second ||
-           IsExtended();
+    const bool isFirst =
+        chosen_.emplace(instant.call, instant.names.front(), place, forOneCall).second;
+    return IsExtended() || (isFirst && (!forOneCall || instant.call == SYS_openat));
   }
 
   std::string Message() const {
@@ -196,7 +199,7 @@ private:
   void PrepareWork() const {
     RestoreFiles();
     if (work_ == Work::FirstMerge) {
-      fs::remove_all(FOLDER);
+      fs::remove_all(MERGED_FOLDER);
     }
   }
 
@@ -290,7 +293,7 @@ TEST_P(ReplacedNames, HarmNothing) {
 }
 
 INSTANTIATE_TEST_SUITE_P(At, ReplacedNames,
-                         ::testing::Combine(::testing::ValuesIn(WORKS),
+                         ::testing::Combine(::testing::ValuesIn(EVERY_WORK),
                                             ::testing::ValuesIn(REPLACEMENTS)),
                          [](const auto& tested) {
                            return NameOf(std::get<0>(tested.param)) + "With" +

@@ -2,17 +2,15 @@
 
 #include "CraftedLog.h"
 #include "Database.h"
+#include "SpecialFile.h"
 
 #include <fcntl.h>
-#include <sys/socket.h>
 #include <sys/stat.h>
-#include <sys/un.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
 #include <csignal>
-#include <cstring>
 #include <filesystem>
 #include <fstream>
 #include <ostream>
@@ -35,7 +33,7 @@ const std::vector<std::string> LOGS = {
     "zophotos.db.new-shm", "orva.db-journal",         "orva.db-wal",
     "orva.db-shm"};
 
-void Check(bool success, const std::string& what) {
+void Require(bool success, const std::string& what) {
   if (!success) {
     throw std::system_error(errno, std::generic_category(), what);
   }
@@ -43,7 +41,7 @@ void Check(bool success, const std::string& what) {
 
 void WritePrivate(const std::string& path, const std::string& content) {
   std::ofstream(path, std::ios::binary) << content;
-  Check(chmod(path.c_str(), 0600) == 0, path);
+  Require(chmod(path.c_str(), 0600) == 0, path);
 }
 
 bool IsFolder(const std::string& name) {
@@ -70,18 +68,10 @@ void Copy(const std::string& from, const std::string& to) {
   fs::permissions(to, fs::perms(0666));
 }
 
-void MakeSocket(const std::string& path) {
-  sockaddr_un address{};
-  address.sun_family = AF_UNIX;
-  std::strncpy(address.sun_path, path.c_str(), sizeof address.sun_path - 1);
-  const util::FileDescriptor socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
-  Check(bind(socket.Get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) == 0, path);
-}
-
 util::FileDescriptor Lease(const std::string& path) {
   std::signal(SIGIO, SIG_IGN); // tells that another process opens the file
   util::FileDescriptor file(open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0666));
-  Check(file && fcntl(file.Get(), F_SETLEASE, F_WRLCK) == 0, path);
+  Require(file && fcntl(file.Get(), F_SETLEASE, F_WRLCK) == 0, path);
   return file;
 }
 
@@ -135,7 +125,7 @@ PrivateFiles::PrivateFiles(std::string directory, const std::vector<std::string>
   for (const std::string& database : databases) {
     const std::string name = fs::path(database).filename();
     fs::copy_file(database, files + "/databases/" + name);
-    Check(chmod((files + "/databases/" + name).c_str(), 0600) == 0, name);
+    Require(chmod((files + "/databases/" + name).c_str(), 0600) == 0, name);
 
     const std::string copy = templates + "/" + name;
     Copy(database, copy);
@@ -143,7 +133,7 @@ PrivateFiles::PrivateFiles(std::string directory, const std::vector<std::string>
     const CraftedDatabase pages(copy);
     CraftedJournal(pages.PageSize(), pages.Pages(), {}, files + "/super").Save(copy + "-journal");
   }
-  Check(chmod(files.c_str(), 0700) == 0, files);
+  Require(chmod(files.c_str(), 0700) == 0, files);
   before_ = Tree::Of({files}, [](const std::string&) { return false; });
   watch_ = std::make_unique<WriteWatch>(files, [](const std::string&) { return false; });
 }
@@ -181,7 +171,7 @@ util::FileDescriptor MakeReplacement(Replacement kind, const std::string& path,
     return held;
   case Replacement::Fifo:
   case Replacement::OpenFifo:
-    Check(mkfifo(path.c_str(), 0666) == 0, path);
+    Require(mkfifo(path.c_str(), 0666) == 0, path);
     if (kind == Replacement::OpenFifo) {
       held.Reset(open(path.c_str(), O_RDWR | O_NONBLOCK | O_CLOEXEC));
     }
@@ -224,15 +214,15 @@ void Replacer::Replace(Replacement kind, const std::string& path) {
     fs::remove_all(old);
   }
   held_ = MakeReplacement(kind, prepared, fs::path(path).filename(), directory_);
-  Check(rename(path.c_str(), original.c_str()) == 0 || errno == ENOENT, path);
-  Check(rename(prepared.c_str(), path.c_str()) == 0 || errno == ENOENT, path);
+  Require(rename(path.c_str(), original.c_str()) == 0 || errno == ENOENT, path);
+  Require(rename(prepared.c_str(), path.c_str()) == 0 || errno == ENOENT, path);
 }
 
 void Replacer::Return() {
   const std::string returned = directory_ + "/returned";
   fs::remove_all(returned);
-  Check(rename(path_.c_str(), returned.c_str()) == 0 || errno == ENOENT, path_);
-  Check(rename((directory_ + "/original").c_str(), path_.c_str()) == 0 || errno == ENOENT, path_);
+  Require(rename(path_.c_str(), returned.c_str()) == 0 || errno == ENOENT, path_);
+  Require(rename((directory_ + "/original").c_str(), path_.c_str()) == 0 || errno == ENOENT, path_);
 }
 
 } // namespace orva::test
