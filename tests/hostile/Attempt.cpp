@@ -1,12 +1,11 @@
 #include "Attempt.h"
 
-#include "Deadline.h"
-
 #include "support/Program.h"
 #include "support/Programs.h"
 
+#include <sys/resource.h>
+
 #include <algorithm>
-#include <chrono>
 #include <csignal>
 #include <fstream>
 #include <sstream>
@@ -43,11 +42,22 @@ long long PeakMemory(pid_t pid) {
   return 0;
 }
 
+/// Of the processes that have ended.
+double ProcessorSecondsOfChildren() {
+  rusage usage{};
+  getrusage(RUSAGE_CHILDREN, &usage);
+  double seconds = 0;
+  for (const timeval& time : {usage.ru_utime, usage.ru_stime}) {
+    seconds += static_cast<double>(time.tv_sec) + static_cast<double>(time.tv_usec) / 1e6;
+  }
+  return seconds;
+}
+
 /// Waits for the end of the process, and kills it when it takes too much. Returns why.
-std::string Watch(const Program& program, Clock::time_point start, long long& peakMemory) {
+std::string Watch(const Program& program, Clock::time_point end, long long& peakMemory) {
   while (!program.AwaitEnd(INTERVAL)) {
     peakMemory = std::max(peakMemory, PeakMemory(program.Pid()));
-    const bool late = Clock::now() - start > DEADLINE;
+    const bool late = Clock::now() > end;
     if (late || peakMemory > MEMORY_CEILING) {
       program.Signal(SIGKILL);
       return late ? "it has not ended" : "it uses too much memory";
@@ -58,13 +68,17 @@ std::string Watch(const Program& program, Clock::time_point start, long long& pe
 
 } // namespace
 
-Attempt Attempt::Run(const std::vector<Operation>& operations) {
+Attempt Attempt::Run(const std::vector<Operation>& operations,
+                     const std::vector<std::string>& environment, std::chrono::seconds deadline) {
   Attempt attempt;
   const Clock::time_point start = Clock::now();
-  Program program(Command(operations), {.errors = Program::Errors::Inherited});
-  attempt.trouble = Watch(program, start, attempt.peakMemory);
+  const double processorStart = ProcessorSecondsOfChildren();
+  Program program(Command(operations),
+                  {.errors = Program::Errors::Inherited, .environment = environment});
+  attempt.trouble = Watch(program, start + deadline, attempt.peakMemory);
   const int status = program.WaitForEnd();
   attempt.seconds = std::chrono::duration<double>(Clock::now() - start).count();
+  attempt.processorSeconds = ProcessorSecondsOfChildren() - processorStart;
   if (attempt.trouble.empty() && status != 0) {
     attempt.trouble = "exit status " + std::to_string(status);
   }

@@ -1,5 +1,8 @@
 #pragma once
 
+#include "Deadline.h"
+
+#include <chrono>
 #include <string>
 #include <vector>
 
@@ -21,10 +24,14 @@ struct Attempt {
   /// For each operation the type and the beginning of the exception that it threw; empty for none.
   std::vector<std::string> thrown;
   double seconds = 0;
-  long long peakMemory = 0; ///< bytes of resident memory
+  double processorSeconds = 0; ///< of this process and the system for it
+  long long peakMemory = 0;    ///< bytes of resident memory
 
-  /// Runs the operations. Throws std::system_error when the process cannot be started.
-  static Attempt Run(const std::vector<Operation>& operations);
+  /// Runs the operations, with `environment` ("NAME=value") added to the test's. Kills the process
+  /// after `deadline`. Throws std::system_error when the process cannot be started.
+  static Attempt Run(const std::vector<Operation>& operations,
+                     const std::vector<std::string>& environment = {},
+                     std::chrono::seconds deadline = DEADLINE);
 };
 
 } // namespace orva::test

@@ -94,7 +94,8 @@ HostileTest::~HostileTest() {
 
 HostileTest::Outcome HostileTest::MergeHostileVolume() {
   RestoreMaster();
-  const Attempt attempt = RunWatched({{"merge", MASTER, VOLUME}, {"merge", MASTER, GOOD}});
+  last_ = RunWatched({{"merge", MASTER, VOLUME}, {"merge", MASTER, GOOD}});
+  const Attempt& attempt = last_;
   const Log log = Logged();
   if (!attempt.trouble.empty()) {
     return Outcome::Broken;
@@ -169,7 +170,7 @@ Attempt HostileTest::RunWatched(const std::vector<Operation>& operations) {
   const auto except = [this](const std::string& path) { return MayChange(path); };
   const Tree before = Tree::Of({"/shares", "/tmp"}, except);
   WriteWatch watch("/shares", except);
-  Attempt attempt = Attempt::Run(operations);
+  Attempt attempt = Attempt::Run(operations, environment, deadline);
   EXPECT_EQ("", attempt.trouble);
   EXPECT_THAT(watch.Take(), ::testing::IsEmpty());
   EXPECT_THAT(Tree::Of({"/shares", "/tmp"}, except).ChangesSince(before), ::testing::IsEmpty());

@@ -54,6 +54,13 @@ protected:
   /// Restores the merged database that the good volume's merge left on the master.
   void RestoreMaster() const;
 
+  /// The attempt of the last merge.
+  const Attempt& LastAttempt() const { return last_; }
+
+  /// For the attempts, "NAME=value".
+  std::vector<std::string> environment;
+  std::chrono::seconds deadline = DEADLINE;
+
   /// SQLite may write the catalog's log: the catalog is in that mode.
   bool catalogHasWal = false;
 
@@ -66,6 +73,7 @@ private:
   Lines goodContent_; ///< what it holds after the good volume's next merge
   long long usualMemory_ = 0;
   std::string refusal_;
+  Attempt last_;
 
   bool locatorIsFree_ = false; ///< the daemon may create it
 

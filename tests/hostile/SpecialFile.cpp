@@ -28,6 +28,8 @@ void Check(int result, const std::string& what) {
   }
 }
 
+} // namespace
+
 void MakeSocket(const std::string& path) {
   sockaddr_un address{};
   address.sun_family = AF_UNIX;
@@ -35,8 +37,6 @@ void MakeSocket(const std::string& path) {
   const util::FileDescriptor socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
   Check(bind(socket.Get(), reinterpret_cast<const sockaddr*>(&address), sizeof address), path);
 }
-
-} // namespace
 
 std::string NameOf(SpecialKind kind) {
   return std::vector<std::string>{"Fifo", "Socket",       "Directory",   "Device",

@@ -19,6 +19,9 @@ std::string NameOf(SpecialKind kind);
 /// Prints the name.
 void PrintTo(SpecialKind kind, std::ostream* stream);
 
+/// Makes a socket at a path. Throws std::system_error.
+void MakeSocket(const std::string& path);
+
 /// A special file at a path, for as long as the object lives. A device is a bind mount of one of
 /// the private root, whose file system allows no devices.
 class SpecialFile {
