@@ -10,8 +10,10 @@
 #include <algorithm>
 #include <cerrno>
 #include <exception>
+#include <filesystem>
 #include <mutex>
 #include <new>
+#include <system_error>
 #include <utility>
 #include <vector>
 
@@ -176,13 +178,10 @@ DatabaseVfs::~DatabaseVfs() {
 }
 
 std::string DatabaseVfs::FullPath(const std::string& path) {
-  sqlite3_vfs* const vfs = Default();
-  std::string full(static_cast<std::size_t>(vfs->mxPathname) + 1, '\0');
-  const int code =
-      vfs->xFullPathname(vfs, path.c_str(), static_cast<int>(full.size()), full.data());
-  // SQLite itself refuses links in a path when it opens it.
-  full.resize(code == SQLITE_OK || code == SQLITE_OK_SYMLINK ? full.find('\0') : 0);
-  return full;
+  // Without resolving links, which SQLite does and then refuses the path.
+  std::error_code error;
+  const std::filesystem::path full = std::filesystem::absolute(path, error);
+  return error ? path : full.lexically_normal().string();
 }
 
 std::string DatabaseVfs::TakeRefusal() {

@@ -27,8 +27,7 @@ public:
 
   const DatabaseFiles& Files() const noexcept { return files_; }
 
-  /// `path` as SQLite spells it for a file system: absolute, without dots. Empty when it is too
-  /// long.
+  /// `path` as SQLite spells it for a file system: absolute, without dots.
   static std::string FullPath(const std::string& path);
 
   /// Why the last file on this thread was refused, and forgets it; empty when none was.
