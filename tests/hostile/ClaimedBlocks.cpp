@@ -27,6 +27,8 @@ int Claim(int result, Status* status) {
 
 } // namespace
 
+// The parameters have other names in the headers.
+// NOLINTBEGIN(readability-inconsistent-declaration-parameter-name)
 extern "C" {
 
 int stat(const char* path, struct stat* status) noexcept {
@@ -93,3 +95,4 @@ off64_t lseek64(int file, off64_t offset, int whence) noexcept {
   return lseek(file, offset, whence);
 }
 }
+// NOLINTEND(readability-inconsistent-declaration-parameter-name)

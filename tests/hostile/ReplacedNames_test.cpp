@@ -254,7 +254,7 @@ private:
   std::string Replace(const Instant& instant, const std::string& place, bool forOneCall) {
     Tracer tracer(appliance.Daemon().Pid());
     appliance.Service().Send(Message());
-    const std::string last = appliance.SendBarrier();
+    std::string last = appliance.SendBarrier();
     std::size_t calls = 0;
     pid_t thread = 0;
     bool ended = false;
