@@ -48,4 +48,8 @@ Log MergeLines(const std::string& mountPoint, int folders, int files) {
           Info("Merged " + std::to_string(files) + " files for " + place)};
 }
 
+std::string LocatorOn(const std::string& mountPoint) {
+  return "zophotos_db_path=" + mountPoint + "/.zophotos/zophotos.db\n";
+}
+
 } // namespace orva::test

@@ -60,6 +60,9 @@ inline Log BatchLines() {
 /// The lines of a merge that succeeds: `folders` with the root row, `files` as read.
 Log MergeLines(const std::string& mountPoint, int folders, int files);
 
+/// The locator file's content for the merged database on `mountPoint`.
+std::string LocatorOn(const std::string& mountPoint);
+
 const std::string SHARES_LOCATOR = "zophotos_db_path=/shares//.zophotos/zophotos.db\n";
 
 } // namespace orva::test

@@ -37,20 +37,6 @@ void PrintTo(const NextEvent& event, std::ostream* stream) {
   *stream << event.name;
 }
 
-std::string LocatorOn(const std::string& mountPoint) {
-  return "zophotos_db_path=" + mountPoint + "/.zophotos/zophotos.db\n";
-}
-
-Lines Errors(const Log& log) {
-  Lines errors;
-  for (const LogLine& line : log) {
-    if (line.priority == Error("").priority) {
-      errors.push_back(line.text);
-    }
-  }
-  return errors;
-}
-
 /// The master A has merged volume C. Then A is pulled, and something prevents the change to B, the
 /// next master.
 class Recovery : public SystemTest {
@@ -79,7 +65,7 @@ protected:
   /// Unplugs the master. Returns the error lines.
   Lines PullTheMaster() {
     a.Unmount();
-    return Errors(appliance.Handle(Unplugged(a.Path())));
+    return ErrorTexts(appliance.Handle(Unplugged(a.Path())));
   }
 
   /// A file in the place of its directory keeps the database on B from being created.
@@ -92,13 +78,13 @@ protected:
 
   /// After the next event, the locator names B, and merges into it apply.
   void ExpectRepairedBy(const NextEvent& event) {
-    EXPECT_THAT(Errors(appliance.Handle(event.compose(c.Path()))), IsEmpty());
+    EXPECT_THAT(ErrorTexts(appliance.Handle(event.compose(c.Path()))), IsEmpty());
     ExpectMergesIntoB();
   }
 
   void ExpectMergesIntoB() {
     EXPECT_EQ(LocatorOn("/shares/B/"), Appliance::Locator());
-    EXPECT_THAT(Errors(appliance.Handle(TranscodedBatch(c.Path()))), IsEmpty());
+    EXPECT_THAT(ErrorTexts(appliance.Handle(TranscodedBatch(c.Path()))), IsEmpty());
     {
       const MergedDatabase merged(b.Path());
       EXPECT_THAT(merged.Faults(), IsEmpty());
@@ -126,10 +112,10 @@ TEST_F(Recovery, FromALockOnTheNextMaster) {
     const MergedDatabase other(b.Path());
     other.Rows().Run("BEGIN EXCLUSIVE");
     EXPECT_THAT(PullTheMaster(), ElementsAre(locked));
-    EXPECT_THAT(Errors(appliance.Handle(Purged(c.Path()))), ElementsAre(locked));
+    EXPECT_THAT(ErrorTexts(appliance.Handle(Purged(c.Path()))), ElementsAre(locked));
     other.Rows().Run("COMMIT");
   }
-  EXPECT_THAT(Errors(appliance.Handle(Purged(c.Path()))), IsEmpty());
+  EXPECT_THAT(ErrorTexts(appliance.Handle(Purged(c.Path()))), IsEmpty());
   EXPECT_EQ(LocatorOn("/shares/B/"), Appliance::Locator());
   EXPECT_THAT(MergedDatabase(b.Path()).Files(),
               ElementsAre("/shares/A/a.jpg|1000|1000|/shares/A/", rowC));
@@ -148,14 +134,14 @@ TEST_F(SystemTest, RecoversFromAFailedFallback) {
   a.Unmount();
   const auto failed = ElementsAre("/shares/C/  ---------  is not a candidate \n",
                                   "MessageProcessor:: Invalid DB location : '/shares/.zophotos'");
-  EXPECT_THAT(Errors(appliance.Handle(Unplugged(a.Path()))), failed);
-  EXPECT_THAT(Errors(appliance.Handle(TranscodedBatch(c.Path()))), failed);
+  EXPECT_THAT(ErrorTexts(appliance.Handle(Unplugged(a.Path()))), failed);
+  EXPECT_THAT(ErrorTexts(appliance.Handle(TranscodedBatch(c.Path()))), failed);
 
   fs::remove("/shares/.zophotos");
   // The fallback makes the shares root a candidate, and the batch begins the merges.
   appliance.Handle(TranscodedBatch(c.Path()));
   EXPECT_EQ(LocatorOn("/shares"), Appliance::Locator());
-  EXPECT_THAT(Errors(appliance.Handle(TranscodedBatch(c.Path()))), IsEmpty());
+  EXPECT_THAT(ErrorTexts(appliance.Handle(TranscodedBatch(c.Path()))), IsEmpty());
   EXPECT_THAT(MergedDatabase("/shares").Files(),
               ElementsAre("/shares/C/c.jpg|1001|1001|/shares/C/"));
 }
@@ -174,7 +160,7 @@ TEST_P(RecoveryBy, AfterASecondFailure) {
   Start();
   ObstructB();
   EXPECT_THAT(PullTheMaster(), ElementsAre(NO_DATABASE));
-  EXPECT_THAT(Errors(appliance.Handle(GetParam().compose(c.Path()))), ElementsAre(NO_DATABASE));
+  EXPECT_THAT(ErrorTexts(appliance.Handle(GetParam().compose(c.Path()))), ElementsAre(NO_DATABASE));
   ClearB();
   ExpectRepairedBy(GetParam());
 }

@@ -31,10 +31,6 @@ LogLine NoLocation(const std::string& mountPoint) {
   return Error("There is no filesystem location for the mountpoint " + mountPoint);
 }
 
-std::string LocatorOn(const std::string& mountPoint) {
-  return "zophotos_db_path=" + mountPoint + "/.zophotos/zophotos.db\n";
-}
-
 class Transitions : public SystemTest {
 protected:
   void StartUp() {

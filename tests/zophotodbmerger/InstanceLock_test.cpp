@@ -14,8 +14,8 @@ namespace {
 namespace fs = std::filesystem;
 using dbmerger::InstanceLock;
 
-const std::string DIRECTORY = "/run/zophotodbmerger";
-const std::string FILE_PATH = DIRECTORY + "/lock";
+const std::string LOCK_DIRECTORY = "/run/zophotodbmerger";
+const std::string FILE_PATH = LOCK_DIRECTORY + "/lock";
 
 TEST(InstanceLock, IsHeldByOneAtATime) {
   {
@@ -30,7 +30,7 @@ TEST(InstanceLock, IsHeldByOneAtATime) {
 TEST(InstanceLock, FileIsForItsOwnerOnlyWhateverTheUmask) {
   umask(0);
   const InstanceLock lock;
-  EXPECT_EQ(0755U, ModeOf(DIRECTORY));
+  EXPECT_EQ(0755U, ModeOf(LOCK_DIRECTORY));
   EXPECT_EQ(0600U, ModeOf(FILE_PATH));
 }
 
@@ -48,7 +48,7 @@ TEST(InstanceLock, IsNotInheritedByOtherPrograms) {
 }
 
 TEST(InstanceLock, UsesAnExistingDirectoryAndFile) {
-  MakeDirectory(DIRECTORY);
+  MakeDirectory(LOCK_DIRECTORY);
   std::ofstream(FILE_PATH) << "content";
   ASSERT_EQ(0, chmod(FILE_PATH.c_str(), 0600));
   const InstanceLock first;
@@ -77,13 +77,13 @@ void GiveAway(const std::string& path) {
 const std::vector<Unsafe> UNSAFE{
     {"AParentThatOthersCanWrite", [] { ASSERT_EQ(0, chmod("/run", 01777)); }},
     {"ADirectoryThatItsGroupCanWrite",
-     [] { ASSERT_EQ(0, chmod(MakeDirectory(DIRECTORY).c_str(), 0775)); }},
+     [] { ASSERT_EQ(0, chmod(MakeDirectory(LOCK_DIRECTORY).c_str(), 0775)); }},
     {"ADirectoryThatOthersCanWrite",
-     [] { ASSERT_EQ(0, chmod(MakeDirectory(DIRECTORY).c_str(), 0757)); }},
-    {"ADirectoryOfAnotherUser", [] { GiveAway(MakeDirectory(DIRECTORY)); }},
+     [] { ASSERT_EQ(0, chmod(MakeDirectory(LOCK_DIRECTORY).c_str(), 0757)); }},
+    {"ADirectoryOfAnotherUser", [] { GiveAway(MakeDirectory(LOCK_DIRECTORY)); }},
     {"ALinkToADirectory",
-     [] { fs::create_directory_symlink(MakeDirectory("/tmp/elsewhere"), DIRECTORY); }},
-    {"AFileInPlaceOfTheDirectory", [] { MakeFile(DIRECTORY); }},
+     [] { fs::create_directory_symlink(MakeDirectory("/tmp/elsewhere"), LOCK_DIRECTORY); }},
+    {"AFileInPlaceOfTheDirectory", [] { MakeFile(LOCK_DIRECTORY); }},
     {"AFileThatOthersCanRead", [] { MakeFile(FILE_PATH, 0604); }},
     {"AFileThatItsGroupCanRead", [] { MakeFile(FILE_PATH, 0640); }},
     {"AFileOfAnotherUser",
@@ -94,22 +94,22 @@ const std::vector<Unsafe> UNSAFE{
     {"AFileWithASecondName",
      [] {
        MakeFile(FILE_PATH);
-       fs::create_hard_link(FILE_PATH, DIRECTORY + "/second");
+       fs::create_hard_link(FILE_PATH, LOCK_DIRECTORY + "/second");
      }},
     {"ALinkToAFile",
      [] {
        MakeFile("/tmp/elsewhere");
-       MakeDirectory(DIRECTORY);
+       MakeDirectory(LOCK_DIRECTORY);
        fs::create_symlink("/tmp/elsewhere", FILE_PATH);
      }},
     {"ADanglingLink",
      [] {
-       MakeDirectory(DIRECTORY);
+       MakeDirectory(LOCK_DIRECTORY);
        fs::create_symlink("/tmp/elsewhere", FILE_PATH);
      }},
     {"AFifo",
      [] {
-       MakeDirectory(DIRECTORY);
+       MakeDirectory(LOCK_DIRECTORY);
        ASSERT_EQ(0, mkfifo(FILE_PATH.c_str(), 0600));
      }},
     {"ADirectoryInPlaceOfTheFile", [] { MakeDirectory(FILE_PATH); }},
