@@ -51,8 +51,9 @@ void Connection::CheckIn::operator()(sqlite3_stmt* statement) const noexcept {
   place->schema = schema;
 }
 
-Connection::Connection(sqlite3* handle, int busyTimeout)
-    : handle_(handle), busyTimeout_(busyTimeout), workLimit_(std::make_unique<WorkLimit>(handle)) {
+Connection::Connection(sqlite3* handle, int busyTimeout, const DatabaseVfs& vfs)
+    : handle_(handle), busyTimeout_(busyTimeout),
+      workLimit_(std::make_unique<WorkLimit>(handle, vfs)) {
   sqlite3_busy_timeout(handle_, busyTimeout_);
 }
 
@@ -60,10 +61,6 @@ Connection::~Connection() = default;
 
 bool Connection::IsReadOnly() const noexcept {
   return sqlite3_db_readonly(handle_, "main") == 1;
-}
-
-long long Connection::BytesRead() const noexcept {
-  return workLimit_->BytesRead();
 }
 
 Connection::CheckedOut Connection::CheckOut(const char* sql, const char* file, unsigned int line) {
@@ -75,7 +72,7 @@ Connection::CheckedOut Connection::CheckOut(const char* sql, const char* file, u
                        file, line);
   }
   workLimit_->Restart();
-  DatabaseVfs::TakeRefusal(); // of a statement that went on without the file
+  DatabaseVfs::ForgetRefusal(); // of a statement that went on without the file
   const auto kept = statements_.find(std::string_view(sql));
   Kept& place = kept != statements_.end() ? kept->second : statements_[sql];
   Compiled compiled = std::move(place.statement);

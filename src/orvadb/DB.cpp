@@ -103,6 +103,7 @@ void DB::Open(const std::string& path) {
 void DB::Open(std::string path, Access access, int busyTimeout, bool immutable) {
   Close();
   ConfigureOnce();
+  DatabaseVfs::ForgetRefusal();
   vfs_ = std::make_unique<DatabaseVfs>(path, access == Access::ReadWrite);
   const int mode = access == Access::ReadWrite ? SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE
                                                : SQLITE_OPEN_READONLY;
@@ -115,7 +116,7 @@ void DB::Open(std::string path, Access access, int busyTimeout, bool immutable) 
     if (code != SQLITE_OK) {
       throw ErrorMessage(handle_, ("open '" + path_ + "'").c_str());
     }
-    connection_ = std::make_unique<Connection>(handle_, busyTimeout);
+    connection_ = std::make_unique<Connection>(handle_, busyTimeout, *vfs_);
     DisableUntrustedFeatures(handle_);
     if (access == Access::ReadWrite) {
       // A merge keeps its changes in memory until it commits, so that readers wait only then.
@@ -164,7 +165,7 @@ Connection& DB::OpenConnection(const char* sql, const char* file, unsigned int l
 }
 
 long long DB::BytesRead() const noexcept {
-  return connection_->BytesRead();
+  return vfs_ ? vfs_->BytesRead() : 0;
 }
 
 void DB::CheckBeforeCommit(std::function<void()> check) const {

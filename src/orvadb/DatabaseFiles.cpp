@@ -5,6 +5,7 @@
 #include "orvautil/FormatString.h"
 
 #include <fcntl.h>
+#include <sys/statvfs.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -89,9 +90,10 @@ util::FileDescriptor DatabaseFiles::Open(std::string_view suffix, int flags, mod
     if (!file) {
       return file;
     }
-    if (fstat(file.Get(), &status) == 0) {
-      refusal = Refusal(suffix, status);
+    if (fstat(file.Get(), &status) != 0) {
+      return {};
     }
+    refusal = Refusal(suffix, status);
     if (refusal.empty() && MayBeWritten(suffix) && IsOnAnotherMount(file.Get())) {
       refusal = Refused("'%s' is a mount of its own", path_ + std::string(suffix));
     }
@@ -154,12 +156,24 @@ void DatabaseFiles::Synchronise() const {
   }
 }
 
+bool DatabaseFiles::Stat(std::string_view suffix, struct stat& status) const {
+  return IsInPlace() &&
+         fstatat(folder_.Get(), Name(suffix).c_str(), &status, AT_SYMLINK_NOFOLLOW) == 0;
+}
+
 struct stat DatabaseFiles::Status(std::string_view suffix) const {
   struct stat status {};
-  if (fstatat(folder_.Get(), Name(suffix).c_str(), &status, AT_SYMLINK_NOFOLLOW) != 0) {
+  if (!Stat(suffix, status)) {
     status = {};
   }
   return status;
+}
+
+bool DatabaseFiles::IsReadOnlyFileSystem() const {
+  const util::FileDescriptor file(
+      openat(folder_.Get(), name_.c_str(), O_PATH | O_NOFOLLOW | O_CLOEXEC));
+  struct statvfs status {};
+  return file && fstatvfs(file.Get(), &status) == 0 && (status.f_flag & ST_RDONLY) != 0;
 }
 
 std::string DatabaseFiles::Refused(const char* format, const std::string& path) {
@@ -181,7 +195,7 @@ std::string DatabaseFiles::Refusal(std::string_view suffix, const struct stat& s
   }
   // SQLite gives the logs to the owner of the database.
   if (written_ && !suffix.empty() && status.st_uid != databaseOwner_ &&
-      status.st_uid != folderStatus_.st_uid && status.st_uid != geteuid()) {
+      status.st_uid != geteuid()) {
     return Refused("'%s' belongs to another user", path);
   }
   return {};
@@ -208,7 +222,10 @@ bool DatabaseFiles::IsInPlace() const {
 
 /// A directory of the appliance may be mounted, but not one of the files in it.
 bool DatabaseFiles::IsOnAnotherMount(int descriptor) const {
-  return MountOf(descriptor) != folderMount_;
+  struct stat status {};
+  return folderMount_ != 0
+             ? MountOf(descriptor) != folderMount_
+             : fstat(descriptor, &status) != 0 || status.st_dev != folderStatus_.st_dev;
 }
 
 } // namespace orva::db

@@ -20,8 +20,7 @@ namespace orva::db {
 /// - It is a regular file. Links are not followed; FIFOs and devices are not waited for.
 /// - The directory is still at its path: a volume that was pulled is not used any more.
 /// - A file that may be written has no second name and was not mounted at its name by itself.
-/// - If the database is written, its logs belong to its owner, that of the directory, or this
-///   process.
+/// - If the database is written, its logs belong to its owner or to this process.
 /// Any thread. Const operations may run at the same time.
 class DatabaseFiles {
 public:
@@ -59,8 +58,15 @@ public:
   /// std::string.
   void Publish(const DatabaseFiles& target) const;
 
-  /// State of one of the files; links are not followed. All zero when there is none.
+  /// Gets the state of one of the files as lstat(2) does. Returns whether that worked; else errno
+  /// says why.
+  bool Stat(std::string_view suffix, struct stat& status) const;
+
+  /// The same; all zero when there is no file.
   struct stat Status(std::string_view suffix) const;
+
+  /// Whether the database is on a read-only file system.
+  bool IsReadOnlyFileSystem() const;
 
   /// Why the file at `path` is not used; `format` has one %s for it.
   static std::string Refused(const char* format, const std::string& path);

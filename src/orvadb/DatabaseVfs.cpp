@@ -5,6 +5,7 @@
 #include "orvautil/FormatString.h"
 
 #include <fcntl.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -123,31 +124,74 @@ bool DeleteFile(const char* path) {
   return deleted;
 }
 
-// SQLite calls these two in the place of open(2) and unlink(2). It knows no exceptions.
+/// The state of a file as stat(2) gives it, but links are not followed. SQLite uses it to look for
+/// journals, to give them the owner of the database, and to notice that the database was replaced.
+int StatFile(const char* path, struct stat* status) {
+  int result = -1;
+  const auto statFile = [&](const DatabaseFiles& files) {
+    result = files.Stat(*files.Suffix(path), *status) ? 0 : -1;
+  };
+  const auto isFile = [&](const DatabaseFiles& files) { return Contains(files, path); };
+  if (!WithDatabase(isFile, statFile)) {
+    result = stat(path, status);
+  }
+  return result;
+}
 
-int OpenCall(const char* path, int flags, int mode) noexcept {
+/// Whether a file is as this process creates files. SQLite gives every journal to the owner of the
+/// database, also one that it finds.
+bool IsNew(int descriptor) {
+  struct stat status {};
+  return fstat(descriptor, &status) == 0 && status.st_size == 0 && status.st_uid == geteuid();
+}
+
+/// Calls `call`; its failures are errnos. SQLite, which calls, knows no exceptions.
+template <typename Call>
+int Guarded(const Call& call) noexcept {
   try {
-    return OpenFile(path, flags, mode);
-  } catch (const std::bad_alloc&) {
+    return call();
+  } catch (...) {
     errno = ENOMEM;
     return -1;
   }
+}
+
+// SQLite calls these in the place of the system calls.
+
+int OpenCall(const char* path, int flags, int mode) noexcept {
+  return Guarded([&] { return OpenFile(path, flags, mode); });
 }
 
 int UnlinkCall(const char* path) noexcept {
-  try {
-    return DeleteFile(path) ? 0 : -1;
-  } catch (const std::bad_alloc&) {
-    errno = ENOMEM;
-    return -1;
-  }
+  return Guarded([&] { return DeleteFile(path) ? 0 : -1; });
 }
 
-/// Has SQLite use the two functions above, in the whole process.
+int StatCall(const char* path, struct stat* status) noexcept {
+  return Guarded([&] { return StatFile(path, status); });
+}
+
+int ChownCall(int descriptor, uid_t user, gid_t group) noexcept {
+  return IsNew(descriptor) ? fchown(descriptor, user, group) : 0;
+}
+
+int ChmodCall(int descriptor, mode_t mode) noexcept {
+  return IsNew(descriptor) ? fchmod(descriptor, mode) : 0;
+}
+
+/// Has SQLite use the functions above, in the whole process.
 void ReplaceSystemCalls() {
   sqlite3_vfs* const unix = sqlite3_vfs_find("unix");
-  unix->xSetSystemCall(unix, "open", reinterpret_cast<sqlite3_syscall_ptr>(&OpenCall));
-  unix->xSetSystemCall(unix, "unlink", reinterpret_cast<sqlite3_syscall_ptr>(&UnlinkCall));
+  if (unix == nullptr) {
+    throw ErrorMessage("out of memory");
+  }
+  const auto replace = [unix](const char* name, auto* function) {
+    unix->xSetSystemCall(unix, name, reinterpret_cast<sqlite3_syscall_ptr>(function));
+  };
+  replace("open", &OpenCall);
+  replace("unlink", &UnlinkCall);
+  replace("stat", &StatCall);
+  replace("fchown", &ChownCall);
+  replace("fchmod", &ChmodCall);
 }
 
 sqlite3_vfs* Default() {
@@ -166,15 +210,16 @@ DatabaseVfs::DatabaseVfs(const std::string& path, bool written)
   xOpen = Open;
   xDelete = Delete;
   xAccess = Access;
+  Databases().Add(files_);
   if (sqlite3_vfs_register(this, 0) != SQLITE_OK) {
+    Databases().Remove(files_);
     throw ErrorMessage("out of memory");
   }
-  Databases().Add(files_);
 }
 
 DatabaseVfs::~DatabaseVfs() {
-  Databases().Remove(files_);
   sqlite3_vfs_unregister(this);
+  Databases().Remove(files_);
 }
 
 std::string DatabaseVfs::FullPath(const std::string& path) {
@@ -184,8 +229,12 @@ std::string DatabaseVfs::FullPath(const std::string& path) {
   return error ? path : full.lexically_normal().string();
 }
 
-std::string DatabaseVfs::TakeRefusal() {
-  return std::exchange(lastRefusal, {});
+const std::string& DatabaseVfs::LastRefusal() noexcept {
+  return lastRefusal;
+}
+
+void DatabaseVfs::ForgetRefusal() noexcept {
+  lastRefusal.clear();
 }
 
 bool DatabaseVfs::Accepts(const char* path) const noexcept {
@@ -200,16 +249,38 @@ bool DatabaseVfs::Accepts(const char* path) const noexcept {
   return false;
 }
 
+int DatabaseVfs::CountRead(sqlite3_file* file, void* bytes, int count, sqlite3_int64 offset) {
+  auto& counted = *reinterpret_cast<CountedFile*>(const_cast<sqlite3_io_methods*>(file->pMethods));
+  const int code = counted.read(file, bytes, count, offset);
+  if (code == SQLITE_OK) {
+    try {
+      counted.counter.Count(offset, count);
+    } catch (const std::bad_alloc&) {
+      return SQLITE_IOERR_NOMEM;
+    }
+  }
+  return code;
+}
+
 int DatabaseVfs::Open(sqlite3_vfs* self, const char* path, sqlite3_file* file, int flags,
                       int* outFlags) {
-  const DatabaseVfs& vfs = *static_cast<DatabaseVfs*>(self);
+  DatabaseVfs& vfs = *static_cast<DatabaseVfs*>(self);
   const bool temporary = (flags & SQLITE_OPEN_DELETEONCLOSE) != 0;
-  if (!temporary && !vfs.Accepts(path)) {
+  const bool named = (flags & SQLITE_OPEN_SUPER_JOURNAL) != 0; // by a journal
+  if (!temporary && (named || !vfs.Accepts(path))) {
     file->pMethods = nullptr;
     return SQLITE_CANTOPEN;
   }
   const CurrentScope scope(vfs.files_);
-  return vfs.original_->xOpen(vfs.original_, path, file, flags, outFlags);
+  const int code = vfs.original_->xOpen(vfs.original_, path, file, flags, outFlags);
+  if (file->pMethods != nullptr && (flags & (SQLITE_OPEN_MAIN_DB | SQLITE_OPEN_WAL)) != 0) {
+    CountedFile& counted = (flags & SQLITE_OPEN_WAL) != 0 ? vfs.log_ : vfs.database_;
+    counted.read = file->pMethods->xRead;
+    counted.methods = *file->pMethods;
+    counted.methods.xRead = CountRead;
+    file->pMethods = &counted.methods;
+  }
+  return code;
 }
 
 int DatabaseVfs::Delete(sqlite3_vfs* self, const char* path, int syncDirectory) {

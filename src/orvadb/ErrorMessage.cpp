@@ -14,7 +14,7 @@ std::string ErrorMessage(const std::string& reason, const char* file, unsigned i
 
 std::string ErrorMessage(sqlite3* handle, const char* sql, const char* file, unsigned int line) {
   const int code = sqlite3_extended_errcode(handle);
-  std::string reason = DatabaseVfs::TakeRefusal();
+  std::string reason = DatabaseVfs::LastRefusal();
   if (reason.empty()) {
     // Only WorkLimit interrupts statements.
     reason = code == SQLITE_INTERRUPT ? "more work than a database of this size can need"

@@ -11,7 +11,6 @@
 #include <sqlite3.h>
 
 #include <sys/stat.h>
-#include <sys/statvfs.h>
 #include <sys/types.h>
 
 #include <algorithm>
@@ -19,6 +18,7 @@
 #include <chrono>
 #include <cstddef>
 #include <ctime>
+#include <optional>
 #include <thread>
 
 namespace orva::db {
@@ -27,11 +27,6 @@ namespace {
 
 /// Milliseconds. The indexer writes a whole scan in one transaction, which the reads wait for.
 constexpr int CATALOG_BUSY_TIMEOUT = 5000;
-
-bool IsOnReadOnlyFileSystem(const std::string& path) {
-  struct statvfs status {};
-  return statvfs(path.c_str(), &status) == 0 && (status.f_flag & ST_RDONLY) != 0;
-}
 
 /// Reads a part of the header of the open file into `bytes`; false if that fails. Reads through
 /// SQLite's own descriptor: closing another one on the file would drop SQLite's locks.
@@ -76,6 +71,11 @@ long long Nanoseconds(const timespec& time) {
   return time.tv_sec * 1'000'000'000LL + time.tv_nsec;
 }
 
+/// The part of a time below a second.
+long long Fraction(long long nanoseconds) {
+  return nanoseconds % 1'000'000'000;
+}
+
 FileState StateOf(const struct stat& status) {
   return {.device = status.st_dev,
           .inode = status.st_ino,
@@ -92,24 +92,31 @@ CatalogState StateOf(const DatabaseFiles& files, sqlite3* handle) {
   return state;
 }
 
-/// The state of a catalog that differs from the one after any later change: a file system gives
-/// changes within one tick of its clock the same time.
-CatalogState SettledStateOf(const DatabaseFiles& files, sqlite3* handle) {
-  constexpr std::chrono::milliseconds tick(20);
-  constexpr int mostTicks = 5;
-  CatalogState state = StateOf(files, handle);
-  for (int i = 0; i < mostTicks; ++i) {
-    timespec now{};
-    clock_gettime(CLOCK_REALTIME, &now);
-    const std::chrono::nanoseconds age(Nanoseconds(now) -
-                                       std::max(state.database.modified, state.database.changed));
-    if (age < std::chrono::nanoseconds::zero() || age > tick) {
-      break;
+/// Whether every later change gives a file another time than this state has: a file system gives
+/// changes within one tick of its clock the same time. Its clock may also be ahead.
+bool IsSettled(const FileState& file) {
+  using std::chrono::nanoseconds;
+  constexpr nanoseconds tick = std::chrono::milliseconds(20);
+  constexpr nanoseconds coarseTick = std::chrono::seconds(2);
+  const bool coarse = Fraction(file.modified) == 0 && Fraction(file.changed) == 0;
+  timespec now{};
+  clock_gettime(CLOCK_REALTIME, &now);
+  return Nanoseconds(now) - std::max(file.modified, file.changed) >
+         (coarse ? coarseTick : tick).count();
+}
+
+/// The settled state of a catalog. Waits for it up to some seconds, then returns nothing.
+std::optional<CatalogState> SettledStateOf(const DatabaseFiles& files, sqlite3* handle) {
+  constexpr std::chrono::milliseconds pause(25);
+  constexpr int pauses = 100;
+  for (int i = 0; i < pauses; ++i) {
+    const CatalogState state = StateOf(files, handle);
+    if (IsSettled(state.database) && IsSettled(state.log)) {
+      return state;
     }
-    std::this_thread::sleep_for(tick);
-    state = StateOf(files, handle);
+    std::this_thread::sleep_for(pause);
   }
-  return state;
+  return std::nullopt;
 }
 
 } // namespace
@@ -122,25 +129,28 @@ VolumeDB::VolumeDB(const std::string& path, bool writable) : prefix_(path) {
   const std::string catalog = core::GetCatalogPath(volume);
   const Access access = writable ? Access::ReadWrite : Access::ReadOnly;
   Open(catalog, access, CATALOG_BUSY_TIMEOUT, false);
-  if (!writable && IsOnReadOnlyFileSystem(catalog) && IsInWalMode(Handle())) {
+  if (!writable && Files().IsReadOnlyFileSystem() && IsInWalMode(Handle())) {
     OpenImmutable(catalog);
   }
 }
 
 void VolumeDB::OpenImmutable(const std::string& catalog) {
-  const CatalogState before = SettledStateOf(Files(), Handle());
-  if (before.log.size != 0) {
+  const auto failIfChanged = [catalog](bool changed) {
+    if (changed) {
+      throw ErrorMessage(util::FormatString("'%s' was changed while it was read", catalog.c_str()));
+    }
+  };
+  const std::optional<CatalogState> before = SettledStateOf(Files(), Handle());
+  failIfChanged(!before);
+  if (before->log.size != 0) {
     throw ErrorMessage(util::FormatString("'%s' has a write-ahead log, which cannot be read on a "
                                           "read-only file system",
                                           catalog.c_str()));
   }
   Open(catalog, Access::ReadOnly, CATALOG_BUSY_TIMEOUT, true);
   // The volume may be writable elsewhere.
-  CheckBeforeCommit([this, before] {
-    if (StateOf(Files(), Handle()) != before) {
-      throw ErrorMessage(
-          util::FormatString("'%s' was changed while it was read", GetPath().c_str()));
-    }
+  CheckBeforeCommit([this, failIfChanged, state = *before] {
+    failIfChanged(StateOf(Files(), Handle()) != state);
   });
 }
 

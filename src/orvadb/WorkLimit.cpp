@@ -1,9 +1,9 @@
 #include "WorkLimit.h"
 
+#include "DatabaseVfs.h"
+
 #include <sqlite3.h>
 
-#include <algorithm>
-#include <array>
 #include <ctime>
 
 namespace orva::db {
@@ -20,39 +20,15 @@ constexpr long long LIMIT_PER_BYTE = 20;
 /// Changed rows may not be in the file yet.
 constexpr long long LIMIT_PER_CHANGED_ROW = 2'000;
 
-/// Seconds of processor time. A statement on a million files needs about one.
-constexpr long long LONGEST = 60;
+/// Processor time of a statement that only reads. On a million files it needs about one second.
+constexpr long long MOST_SECONDS = 60;
 
-int TakeCount(sqlite3* handle, int counter) noexcept {
+/// A count of SQLite's, from the beginning of the connection.
+unsigned CountOf(sqlite3* handle, int counter) noexcept {
   int current = 0;
   int highest = 0;
-  sqlite3_db_status(handle, counter, &current, &highest, 1);
-  return current;
-}
-
-/// A file that SQLite has open; null when there is none.
-sqlite3_file* FileOf(sqlite3* handle, int which) noexcept {
-  sqlite3_file* file = nullptr;
-  sqlite3_file_control(handle, "main", which, &file);
-  return file != nullptr && file->pMethods != nullptr ? file : nullptr;
-}
-
-long long SizeOf(sqlite3_file* file) noexcept {
-  sqlite3_int64 size = 0;
-  return file != nullptr && file->pMethods->xFileSize(file, &size) == SQLITE_OK ? size : 0;
-}
-
-/// The page size in a database's header, where 1 stands for the largest.
-long long PageSize(sqlite3_file* file) noexcept {
-  constexpr sqlite3_int64 offset = 16;
-  constexpr unsigned largest = 65'536;
-  std::array<unsigned char, 2> bytes{};
-  if (file == nullptr ||
-      file->pMethods->xRead(file, bytes.data(), bytes.size(), offset) != SQLITE_OK) {
-    return 0;
-  }
-  const unsigned size = bytes[0] * 256U + bytes[1];
-  return size == 1 ? largest : size;
+  sqlite3_db_status(handle, counter, &current, &highest, 0);
+  return static_cast<unsigned>(current); // counts beyond the range of int wrap around
 }
 
 long long ProcessorSeconds() noexcept {
@@ -63,7 +39,8 @@ long long ProcessorSeconds() noexcept {
 
 } // namespace
 
-WorkLimit::WorkLimit(sqlite3* handle) noexcept : handle_(handle) {
+WorkLimit::WorkLimit(sqlite3* handle, const DatabaseVfs& vfs) noexcept
+    : handle_(handle), vfs_(vfs) {
   sqlite3_progress_handler(handle_, STEPS_PER_CHECK, &IsExceeded, this);
 }
 
@@ -76,18 +53,12 @@ void WorkLimit::Restart() noexcept {
   begin_ = -1;
 }
 
-long long WorkLimit::BytesRead() noexcept {
-  CountPages();
-  // Pages that did not fit into the cache were read several times.
-  sqlite3_file* const database = FileOf(handle_, SQLITE_FCNTL_FILE_POINTER);
-  return std::min(pagesRead_ * PageSize(database),
-                  SizeOf(database) + SizeOf(FileOf(handle_, SQLITE_FCNTL_JOURNAL_POINTER)));
-}
-
 void WorkLimit::CountPages() noexcept {
-  const int read = TakeCount(handle_, SQLITE_DBSTATUS_CACHE_MISS);
-  pagesRead_ += read;
-  work_ += TakeCount(handle_, SQLITE_DBSTATUS_CACHE_HIT) * CACHED_PAGE_COST + read * FILE_PAGE_COST;
+  const unsigned cached = CountOf(handle_, SQLITE_DBSTATUS_CACHE_HIT);
+  const unsigned read = CountOf(handle_, SQLITE_DBSTATUS_CACHE_MISS);
+  work_ += (cached - cachedPages_) * CACHED_PAGE_COST + (read - readPages_) * FILE_PAGE_COST;
+  cachedPages_ = cached;
+  readPages_ = read;
 }
 
 bool WorkLimit::TakesTooLong() noexcept {
@@ -95,7 +66,8 @@ bool WorkLimit::TakesTooLong() noexcept {
   if (begin_ == -1) {
     begin_ = now;
   }
-  return now - begin_ > LONGEST;
+  // Statements that write change as many rows as there are.
+  return now - begin_ > MOST_SECONDS && sqlite3_db_readonly(handle_, "main") == 1;
 }
 
 int WorkLimit::IsExceeded(void* self) noexcept {
@@ -106,7 +78,7 @@ int WorkLimit::IsExceeded(void* self) noexcept {
     return 0;
   }
   const bool exceeded =
-      limit.work_ > LEAST_LIMIT + limit.BytesRead() * LIMIT_PER_BYTE +
+      limit.work_ > LEAST_LIMIT + limit.vfs_.BytesRead() * LIMIT_PER_BYTE +
                         sqlite3_total_changes64(limit.handle_) * LIMIT_PER_CHANGED_ROW;
   return exceeded || limit.TakesTooLong() ? 1 : 0;
 }

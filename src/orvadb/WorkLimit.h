@@ -4,23 +4,22 @@ struct sqlite3;
 
 namespace orva::db {
 
+class DatabaseVfs;
+
 /// Interrupts a statement that works more than the content can need that was read from the
 /// database's files: in a crafted file a few pages may make endless rows. What the file system says
-/// about the files can only lower the limit. Installs itself in a connection for as long as it
-/// lives. On the connection's thread.
+/// about the files does not matter. Installs itself in a connection for as long as it lives. On the
+/// connection's thread.
 class WorkLimit {
 public:
-  /// For the connection `handle`.
-  explicit WorkLimit(sqlite3* handle) noexcept;
+  /// For the connection `handle`, which was opened through `vfs`.
+  WorkLimit(sqlite3* handle, const DatabaseVfs& vfs) noexcept;
   WorkLimit(const WorkLimit&) = delete;
   WorkLimit& operator=(const WorkLimit&) = delete;
   ~WorkLimit();
 
   /// A statement begins: counts its work from zero.
   void Restart() noexcept;
-
-  /// Bytes that the connection has read from the files, at most those that there are.
-  long long BytesRead() noexcept;
 
 private:
   static int IsExceeded(void* self) noexcept;
@@ -29,10 +28,11 @@ private:
   bool TakesTooLong() noexcept;
 
   sqlite3* handle_;
-  long long work_ = 0;      ///< of the current statement so far
-  long long pagesRead_ = 0; ///< by all statements
-  /// Processor time of the thread when the statement had done the least work that is limited, in
-  /// seconds; negative before.
+  const DatabaseVfs& vfs_;
+  long long work_ = 0;       ///< of the current statement so far
+  unsigned cachedPages_ = 0; ///< requests for pages that the cache had, by all statements
+  unsigned readPages_ = 0;   ///< the same for pages that it had not
+  /// Processor time of the thread when the statement exceeded LEAST_LIMIT, in seconds; -1 before.
   long long begin_ = -1;
 };
 

@@ -13,6 +13,7 @@ struct sqlite3_stmt;
 
 namespace orva::db {
 
+class DatabaseVfs;
 class WorkLimit;
 
 /// Finalises a compiled statement.
@@ -51,18 +52,14 @@ public:
   };
   using CheckedOut = std::unique_ptr<sqlite3_stmt, CheckIn>;
 
-  /// Belongs to `handle`, which it does not own. `busyTimeout` is how long, in milliseconds,
-  /// statements outside of transactions wait for other connections.
-  Connection(sqlite3* handle, int busyTimeout);
+  /// Belongs to `handle`, which it does not own and which was opened through `vfs`. `busyTimeout`
+  /// is how long, in milliseconds, statements outside of transactions wait for other connections.
+  Connection(sqlite3* handle, int busyTimeout, const DatabaseVfs& vfs);
   Connection(const Connection&) = delete;
   Connection& operator=(const Connection&) = delete;
   ~Connection();
 
   bool IsReadOnly() const noexcept;
-
-  /// Bytes that statements have read so far from the database's files, at most those that there
-  /// are.
-  long long BytesRead() const noexcept;
 
   /// Hands out the compiled form of `sql`; compiles it if the cache has none free. Throws
   /// also when SQLite has rolled back the running transaction.

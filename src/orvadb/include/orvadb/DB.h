@@ -48,8 +48,8 @@ public:
   /// throws std::string with the caller's `file` and `line` and the statement `sql`.
   Connection& OpenConnection(const char* sql, const char* file, unsigned int line) const;
 
-  /// Bytes of the open database and its log that statements have read so far from the file, at most
-  /// those that there are.
+  /// Bytes that were read so far from the open database and its write-ahead log, each part counted
+  /// once.
   long long BytesRead() const noexcept;
 
   /// Makes sure that the values in `table` are those that were stored there: refuses generated
