@@ -39,7 +39,7 @@ util::FileDescriptor OpenAt(int folder, const char* name, int flags, mode_t mode
   }
 }
 
-/// The mount that an open file is on; 0 when the kernel does not tell.
+/// The mount that an open file is on; 0 if the kernel does not report it.
 std::uint64_t MountOf(int descriptor) {
   struct statx status {};
   return statx(descriptor, "", AT_EMPTY_PATH, STATX_MNT_ID, &status) == 0 &&

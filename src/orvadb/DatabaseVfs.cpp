@@ -62,7 +62,8 @@ OpenDatabases& Databases() {
 
 thread_local std::string lastRefusal;
 
-/// The database that SQLite opens or deletes a file for, while it does; null when it does not tell.
+/// The database that SQLite opens or deletes a file for; null while no function of DatabaseVfs
+/// runs.
 thread_local const DatabaseFiles* current = nullptr;
 
 /// Sets `current` for as long as it lives.
