@@ -56,11 +56,12 @@ struct CloseDirectory {
 
 /// Whether an open directory has no entries.
 bool IsEmpty(int directory) {
-  const std::unique_ptr<DIR, CloseDirectory> entries(
-      fdopendir(openat(directory, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC)));
+  util::FileDescriptor listed(openat(directory, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  const std::unique_ptr<DIR, CloseDirectory> entries(fdopendir(listed.Get()));
   if (!entries) {
     return false;
   }
+  static_cast<void>(listed.Release()); // closedir closes it
   const dirent* entry = readdir(entries.get());
   while (entry != nullptr && std::string_view("..").starts_with(entry->d_name)) {
     entry = readdir(entries.get());
@@ -68,27 +69,43 @@ bool IsEmpty(int directory) {
   return entry == nullptr;
 }
 
+/// The permissions that mkdir gives to the directory of the database.
+mode_t PermissionsOfNewDirectory() {
+  // The umask can only be read by setting it: to a strict one, because another thread may create a
+  // file in the meantime.
+  const mode_t mask = umask(S_IRWXG | S_IRWXO);
+  umask(mask);
+  return DIRECTORY_PERMISSIONS & ~mask;
+}
+
+/// Whether a directory in `location` can be the one that the daemon has just created. Some file
+/// systems report one owner or one mode for everything.
+bool CanBeNew(const struct stat& directory, const struct stat& location) {
+  const mode_t mode = directory.st_mode & EVERYBODY;
+  const mode_t permissions = PermissionsOfNewDirectory();
+  return S_ISDIR(directory.st_mode) &&
+         (directory.st_uid == geteuid() || directory.st_uid == location.st_uid) &&
+         ((mode & permissions) == permissions || mode == (location.st_mode & EVERYBODY));
+}
+
 /// Creates the directory at `path` for everybody to write. Returns whether it was created.
 bool CreateDirectoryForEverybody(const std::string& path) {
   if (!util::Path(path).Create(DIRECTORY_PERMISSIONS)) {
     return false;
   }
-  // Every user may rename what is in the root of a volume. So the name can stand for another
-  // directory by now, the mode of which must not change.
+  // Every user may rename what is in the root of a volume. Another directory may have this name
+  // now. Its mode must not change.
   const util::FileDescriptor directory(
       open(path.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+  const int base = directory ? directory.Get() : AT_FDCWD;
+  const std::string name = directory ? "." : path;
   struct stat created {};
   struct stat location {};
-  if (!directory || fstat(directory.Get(), &created) != 0 ||
-      fstatat(directory.Get(), "..", &location, 0) != 0) {
+  if (fstatat(base, name.c_str(), &created, AT_SYMLINK_NOFOLLOW) != 0 ||
+      fstatat(base, (name + "/..").c_str(), &location, 0) != 0 || !CanBeNew(created, location)) {
     return false;
   }
-  // Some file systems report one owner for everything.
-  const bool isOwn = created.st_uid == geteuid() || created.st_uid == location.st_uid;
-  if (!isOwn || !IsEmpty(directory.Get())) {
-    return false;
-  }
-  if (fchmod(directory.Get(), EVERYBODY) == 0) {
+  if (directory && IsEmpty(directory.Get()) && fchmod(directory.Get(), EVERYBODY) == 0) {
     return true;
   }
   // Otherwise the next attempt would accept the directory with the wrong mode.

@@ -16,6 +16,7 @@
 
 #include <sys/fsuid.h>
 #include <sys/mount.h>
+#include <sys/resource.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
 #include <sys/wait.h>
@@ -238,6 +239,26 @@ TEST_F(PhotoDBNewDirectoryTest, DirectoryOfAnotherUserInItsPlaceKeepsItsMode) {
   EXPECT_EQ(0700U, ModeOf(DIRECTORY));
 }
 
+TEST_F(PhotoDBNewDirectoryTest, EmptyPrivateDirectoryInItsPlaceKeepsItsMode) {
+  umask(0022);
+  chmod(LOCATION.c_str(), 0777);
+  for (const mode_t mode : {0700U, 0750U, 0711U}) {
+    const std::string other = MakeDirectory("/shares/Vol/private");
+    chmod(other.c_str(), mode);
+    EXPECT_EQ(CHANGE_FAILED, Construct(0, AfterCreation(), [&] { Exchange(other); }));
+    EXPECT_EQ(mode, ModeOf(DIRECTORY));
+    std::filesystem::remove(DIRECTORY);
+    std::filesystem::remove("/shares/Vol/created");
+  }
+}
+
+TEST_F(PhotoDBNewDirectoryTest, FileSystemMayReportItsOwnMode) {
+  umask(0022);
+  chmod(LOCATION.c_str(), 0700);
+  EXPECT_EQ("", Construct(0, AfterCreation(), [] { chmod(DIRECTORY.c_str(), 0700); }));
+  EXPECT_EQ(0777U, ModeOf(DIRECTORY));
+}
+
 TEST_F(PhotoDBNewDirectoryTest, LinkInItsPlaceIsNotFollowed) {
   const std::string other = MakeDirectory("/shares/private");
   chmod(other.c_str(), 0700);
@@ -267,6 +288,24 @@ TEST_F(PhotoDBNewDirectoryTest, DirectoryWhoseModeCannotBeChangedIsRemovedAgain)
   EXPECT_FALSE(std::filesystem::exists(DIRECTORY));
   EXPECT_NO_THROW(PhotoDB photos(LOCATION));
   EXPECT_EQ(0777U, ModeOf(DIRECTORY));
+}
+
+TEST_F(PhotoDBLocationTest, NewDirectoryIsRemovedAgainWhenItCannotBeOpenedOrListed) {
+  rlimit unlimited{};
+  ASSERT_EQ(0, getrlimit(RLIMIT_NOFILE, &unlimited));
+  const int next = dup(STDOUT_FILENO);
+  close(next);
+  for (const int available : {0, 1}) {
+    const rlimit limit{static_cast<rlim_t>(next + available), unlimited.rlim_max};
+    ASSERT_EQ(0, setrlimit(RLIMIT_NOFILE, &limit));
+    EXPECT_EQ(CHANGE_FAILED, Thrown<util::Exception>([] { PhotoDB photos(LOCATION); }).what());
+    EXPECT_FALSE(std::filesystem::exists(DIRECTORY)) << available << " descriptors";
+    ASSERT_EQ(0, setrlimit(RLIMIT_NOFILE, &unlimited));
+  }
+  const int same = dup(STDOUT_FILENO);
+  close(same);
+  EXPECT_EQ(next, same) << "a descriptor has leaked";
+  EXPECT_NO_THROW(PhotoDB photos(LOCATION));
 }
 
 TEST_F(PhotoDBLocationTest, LinkInTheFilesPlaceIsRefused) {
