@@ -34,7 +34,7 @@ MasterVolumeScannedState::JoinedMerger::~JoinedMerger() noexcept(false) {
 }
 
 MasterVolumeScannedState::MasterVolumeScannedState() {
-  const std::string master = MasterMountPoint();
+  const std::string& master = MasterMountPoint();
   PhotoDB photos(master);
   photos.Init();
   updateLocatorFile(master);

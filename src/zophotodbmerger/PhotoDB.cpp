@@ -19,6 +19,7 @@
 #include <dirent.h>
 #include <fcntl.h>
 #include <sys/stat.h>
+#include <sys/xattr.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -78,14 +79,26 @@ mode_t PermissionsOfNewDirectory() {
   return DIRECTORY_PERMISSIONS & ~mask;
 }
 
-/// Whether a directory in `location` can be the one that the daemon has just created. Some file
-/// systems report one owner or one mode for everything.
-bool CanBeNew(const struct stat& directory, const struct stat& location) {
-  const mode_t mode = directory.st_mode & EVERYBODY;
+/// Whether new directories in a directory get their permissions from an access control list.
+bool HasDefaultAcl(int base, const std::string& name) {
+  const util::FileDescriptor directory(
+      openat(base, name.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  return directory && fgetxattr(directory.Get(), "system.posix_acl_default", nullptr, 0) > 0;
+}
+
+/// Whether the directory `name` can be the one that the daemon has just created; `status` is its
+/// status. Some file systems report one owner or one mode for everything.
+bool CanBeNew(int base, const std::string& name, const struct stat& status) {
+  const std::string parent = name + "/..";
+  struct stat location {};
+  if (!S_ISDIR(status.st_mode) || fstatat(base, parent.c_str(), &location, 0) != 0 ||
+      (status.st_uid != geteuid() && status.st_uid != location.st_uid)) {
+    return false;
+  }
+  const mode_t mode = status.st_mode & EVERYBODY;
   const mode_t permissions = PermissionsOfNewDirectory();
-  return S_ISDIR(directory.st_mode) &&
-         (directory.st_uid == geteuid() || directory.st_uid == location.st_uid) &&
-         ((mode & permissions) == permissions || mode == (location.st_mode & EVERYBODY));
+  return (mode & permissions) == permissions || mode == (location.st_mode & EVERYBODY) ||
+         HasDefaultAcl(base, parent);
 }
 
 /// Creates the directory at `path` for everybody to write. Returns whether it was created.
@@ -100,9 +113,8 @@ bool CreateDirectoryForEverybody(const std::string& path) {
   const int base = directory ? directory.Get() : AT_FDCWD;
   const std::string name = directory ? "." : path;
   struct stat created {};
-  struct stat location {};
   if (fstatat(base, name.c_str(), &created, AT_SYMLINK_NOFOLLOW) != 0 ||
-      fstatat(base, (name + "/..").c_str(), &location, 0) != 0 || !CanBeNew(created, location)) {
+      !CanBeNew(base, name, created)) {
     return false;
   }
   if (directory && IsEmpty(directory.Get()) && fchmod(directory.Get(), EVERYBODY) == 0) {
