@@ -27,34 +27,47 @@ FileDescriptor OpenDirectory(int parent, const char* name) {
   return directory;
 }
 
-/// Opens a file that no other user can open, and creates it when there is none.
-FileDescriptor OpenFile(int directory, const char* name) {
-  FileDescriptor file(openat(
-      directory, name, O_RDWR | O_CREAT | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC, S_IRUSR | S_IWUSR));
-  struct stat status {};
-  if (fstat(file.Get(), &status) != 0 || !S_ISREG(status.st_mode) || !IsOwn(status) ||
-      (status.st_mode & (S_IRWXG | S_IRWXO)) != 0 || status.st_nlink != 1) {
-    file.Reset();
-  }
-  return file;
-}
-
-/// Opens the file of PATH.
-FileDescriptor OpenLockFile() {
+/// Opens the directory of PATH.
+FileDescriptor OpenLockDirectory() {
   const FileDescriptor run = OpenDirectory(AT_FDCWD, "/run");
   if (!run) {
     return {};
   }
   const char* const name = "zophotodbmerger";
   mkdirat(run.Get(), name, 0755); // exists already below systemd
-  const FileDescriptor directory = OpenDirectory(run.Get(), name);
-  return directory ? OpenFile(directory.Get(), "lock") : FileDescriptor();
+  return OpenDirectory(run.Get(), name);
+}
+
+bool IsLockFile(const struct stat& status) {
+  return S_ISREG(status.st_mode) && IsOwn(status) && status.st_nlink == 1;
+}
+
+/// Makes sure that other users cannot open a lock file. Returns whether they cannot.
+bool ProtectLockFile(int file) {
+  struct stat status {};
+  return fstat(file, &status) == 0 && IsLockFile(status) &&
+         ((status.st_mode & (S_IRWXG | S_IRWXO)) == 0 || fchmod(file, S_IRUSR | S_IWUSR) == 0);
 }
 
 } // namespace
 
-InstanceLock::InstanceLock() : file_(OpenLockFile()) {
-  if (file_ && flock(file_.Get(), LOCK_EX | LOCK_NB) != 0) {
+InstanceLock::InstanceLock() {
+  const FileDescriptor directory = OpenLockDirectory();
+  if (!directory) {
+    return;
+  }
+  const char* const name = "lock";
+  file_.Reset(openat(directory.Get(), name, O_RDWR | O_CREAT | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC,
+                     S_IRUSR | S_IWUSR));
+  if (!file_) {
+    // The file of root's daemon, for a daemon without privileges.
+    struct stat status {};
+    isHeldByAnother_ = errno == EACCES &&
+                       fstatat(directory.Get(), name, &status, AT_SYMLINK_NOFOLLOW) == 0 &&
+                       IsLockFile(status);
+  } else if (!ProtectLockFile(file_.Get())) {
+    file_.Reset();
+  } else if (flock(file_.Get(), LOCK_EX | LOCK_NB) != 0) {
     isHeldByAnother_ = errno == EWOULDBLOCK;
   }
 }

@@ -6,7 +6,7 @@ namespace orva::dbmerger {
 
 /// Keeps a second daemon from running on the appliance, for as long as the object lives. The lock
 /// is on a file that other users can neither lock nor replace. If there can be no such file, there
-/// is no lock, and every daemon runs.
+/// is no lock, and every daemon runs. A file of root that the daemon may not open counts as locked.
 class InstanceLock {
 public:
   static constexpr const char* PATH = "/run/zophotodbmerger/lock";

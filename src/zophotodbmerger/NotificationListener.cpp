@@ -184,8 +184,8 @@ void NotificationListener::HandleMessage(util::Stream& /*stream*/, const unsigne
 }
 
 void NotificationListener::ElectAfterFailure() const {
-  // A transition that failed is repeated only before the next event: what it waited for is probably
-  // still locked.
+  // A transition that failed is repeated only before the next event: the database is probably still
+  // locked.
   if (UnfinishedWork() != State::Unfinished::Election) {
     return;
   }

@@ -19,6 +19,7 @@
 #include <dirent.h>
 #include <fcntl.h>
 #include <sys/stat.h>
+#include <sys/xattr.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -56,11 +57,12 @@ struct CloseDirectory {
 
 /// Whether an open directory has no entries.
 bool IsEmpty(int directory) {
-  const std::unique_ptr<DIR, CloseDirectory> entries(
-      fdopendir(openat(directory, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC)));
+  util::FileDescriptor listed(openat(directory, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  const std::unique_ptr<DIR, CloseDirectory> entries(fdopendir(listed.Get()));
   if (!entries) {
     return false;
   }
+  static_cast<void>(listed.Release()); // closedir closes it
   const dirent* entry = readdir(entries.get());
   while (entry != nullptr && std::string_view("..").starts_with(entry->d_name)) {
     entry = readdir(entries.get());
@@ -68,27 +70,54 @@ bool IsEmpty(int directory) {
   return entry == nullptr;
 }
 
+/// The permissions that mkdir gives to the directory of the database.
+mode_t PermissionsOfNewDirectory() {
+  // The umask can only be read by setting it: to a strict one, because another thread may create a
+  // file in the meantime.
+  const mode_t mask = umask(S_IRWXG | S_IRWXO);
+  umask(mask);
+  return DIRECTORY_PERMISSIONS & ~mask;
+}
+
+/// Whether new directories in a directory get their permissions from an access control list.
+bool HasDefaultAcl(int base, const std::string& name) {
+  const util::FileDescriptor directory(
+      openat(base, name.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  return directory && fgetxattr(directory.Get(), "system.posix_acl_default", nullptr, 0) > 0;
+}
+
+/// Whether the directory `name` can be the one that the daemon has just created; `status` is its
+/// status. Some file systems report one owner or one mode for everything.
+bool CanBeNew(int base, const std::string& name, const struct stat& status) {
+  const std::string parent = name + "/..";
+  struct stat location {};
+  if (!S_ISDIR(status.st_mode) || fstatat(base, parent.c_str(), &location, 0) != 0 ||
+      (status.st_uid != geteuid() && status.st_uid != location.st_uid)) {
+    return false;
+  }
+  const mode_t mode = status.st_mode & EVERYBODY;
+  const mode_t permissions = PermissionsOfNewDirectory();
+  return (mode & permissions) == permissions || mode == (location.st_mode & EVERYBODY) ||
+         HasDefaultAcl(base, parent);
+}
+
 /// Creates the directory at `path` for everybody to write. Returns whether it was created.
 bool CreateDirectoryForEverybody(const std::string& path) {
   if (!util::Path(path).Create(DIRECTORY_PERMISSIONS)) {
     return false;
   }
-  // Every user may rename what is in the root of a volume. So the name can stand for another
-  // directory by now, the mode of which must not change.
+  // Every user may rename what is in the root of a volume. Another directory may have this name
+  // now. Its mode must not change.
   const util::FileDescriptor directory(
       open(path.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+  const int base = directory ? directory.Get() : AT_FDCWD;
+  const std::string name = directory ? "." : path;
   struct stat created {};
-  struct stat location {};
-  if (!directory || fstat(directory.Get(), &created) != 0 ||
-      fstatat(directory.Get(), "..", &location, 0) != 0) {
+  if (fstatat(base, name.c_str(), &created, AT_SYMLINK_NOFOLLOW) != 0 ||
+      !CanBeNew(base, name, created)) {
     return false;
   }
-  // Some file systems report one owner for everything.
-  const bool isOwn = created.st_uid == geteuid() || created.st_uid == location.st_uid;
-  if (!isOwn || !IsEmpty(directory.Get())) {
-    return false;
-  }
-  if (fchmod(directory.Get(), EVERYBODY) == 0) {
+  if (directory && IsEmpty(directory.Get()) && fchmod(directory.Get(), EVERYBODY) == 0) {
     return true;
   }
   // Otherwise the next attempt would accept the directory with the wrong mode.

@@ -28,7 +28,7 @@ public:
   /// May throw, since a state may have to wait for a thread.
   virtual ~State() noexcept(false) = default;
 
-  /// What an event that failed has left undone. Without it, merges would not apply.
+  /// What an event that failed has left undone. Until it is completed, merges do not apply.
   enum class Unfinished {
     Nothing,
     Election,  ///< the master is gone, and the event failed before the election
