@@ -19,7 +19,6 @@
 #include <dirent.h>
 #include <fcntl.h>
 #include <sys/stat.h>
-#include <sys/xattr.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -70,35 +69,13 @@ bool IsEmpty(int directory) {
   return entry == nullptr;
 }
 
-/// The permissions that mkdir gives to the directory of the database.
-mode_t PermissionsOfNewDirectory() {
-  // The umask can only be read by setting it: to a strict one, because another thread may create a
-  // file in the meantime.
-  const mode_t mask = umask(S_IRWXG | S_IRWXO);
-  umask(mask);
-  return DIRECTORY_PERMISSIONS & ~mask;
-}
-
-/// Whether new directories in a directory get their permissions from an access control list.
-bool HasDefaultAcl(int base, const std::string& name) {
-  const util::FileDescriptor directory(
-      openat(base, name.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-  return directory && fgetxattr(directory.Get(), "system.posix_acl_default", nullptr, 0) > 0;
-}
-
 /// Whether the directory `name` can be the one that the daemon has just created; `status` is its
-/// status. Some file systems report one owner or one mode for everything.
+/// status. Some file systems report one owner for everything.
 bool CanBeNew(int base, const std::string& name, const struct stat& status) {
-  const std::string parent = name + "/..";
   struct stat location {};
-  if (!S_ISDIR(status.st_mode) || fstatat(base, parent.c_str(), &location, 0) != 0 ||
-      (status.st_uid != geteuid() && status.st_uid != location.st_uid)) {
-    return false;
-  }
-  const mode_t mode = status.st_mode & EVERYBODY;
-  const mode_t permissions = PermissionsOfNewDirectory();
-  return (mode & permissions) == permissions || mode == (location.st_mode & EVERYBODY) ||
-         HasDefaultAcl(base, parent);
+  return S_ISDIR(status.st_mode) &&
+         (status.st_uid == geteuid() || (fstatat(base, (name + "/..").c_str(), &location, 0) == 0 &&
+                                         status.st_uid == location.st_uid));
 }
 
 /// Creates the directory at `path` for everybody to write. Returns whether it was created.

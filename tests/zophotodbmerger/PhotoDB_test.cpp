@@ -20,7 +20,6 @@
 #include <sys/stat.h>
 #include <sys/syscall.h>
 #include <sys/wait.h>
-#include <sys/xattr.h>
 #include <syslog.h>
 #include <unistd.h>
 
@@ -240,47 +239,6 @@ TEST_F(PhotoDBNewDirectoryTest, DirectoryOfAnotherUserInItsPlaceKeepsItsMode) {
   ASSERT_EQ(0, chown(other.c_str(), 1000, 1000));
   EXPECT_EQ(CHANGE_FAILED, Construct(0, AfterCreation(), [&] { Exchange(other); }));
   EXPECT_EQ(0700U, ModeOf(DIRECTORY));
-}
-
-TEST_F(PhotoDBNewDirectoryTest, EmptyPrivateDirectoryInItsPlaceKeepsItsMode) {
-  umask(0022);
-  chmod(LOCATION.c_str(), 0777);
-  for (const mode_t mode : {0700U, 0750U, 0711U}) {
-    const std::string other = MakeDirectory("/shares/Vol/private");
-    chmod(other.c_str(), mode);
-    EXPECT_EQ(CHANGE_FAILED, Construct(0, AfterCreation(), [&] { Exchange(other); }));
-    EXPECT_EQ(mode, ModeOf(DIRECTORY));
-    std::filesystem::remove(DIRECTORY);
-    std::filesystem::remove("/shares/Vol/created");
-  }
-}
-
-TEST_F(PhotoDBNewDirectoryTest, FileSystemMayReportItsOwnMode) {
-  umask(0022);
-  chmod(LOCATION.c_str(), 0700);
-  EXPECT_EQ("", Construct(0, AfterCreation(), [] { chmod(DIRECTORY.c_str(), 0700); }));
-  EXPECT_EQ(0777U, ModeOf(DIRECTORY));
-}
-
-TEST_F(PhotoDBLocationTest, NewDirectoryMayHaveThePermissionsOfAnAccessControlList) {
-  umask(0022);
-  struct Entry {
-    std::uint16_t tag;
-    std::uint16_t permissions;
-    std::uint32_t id = 0xffffffff;
-  };
-  // Version 2: all permissions for the owner and the group, none for others.
-  struct {
-    std::uint32_t version = 2;
-    std::array<Entry, 3> entries{{{.tag = 0x01, .permissions = 7},
-                                  {.tag = 0x04, .permissions = 7},
-                                  {.tag = 0x20, .permissions = 0}}};
-  } const list;
-  if (setxattr(LOCATION.c_str(), "system.posix_acl_default", &list, sizeof list, 0) != 0) {
-    GTEST_SKIP() << "the file system has no access control lists";
-  }
-  EXPECT_NO_THROW(PhotoDB photos(LOCATION));
-  EXPECT_EQ(0777U, ModeOf(DIRECTORY));
 }
 
 TEST_F(PhotoDBNewDirectoryTest, LinkInItsPlaceIsNotFollowed) {
