@@ -7,26 +7,7 @@
 #include "Util.h"
 #include "VolumeInfoManager.h"
 
-#include "orvautil/Exception.h"
-#include "orvautil/FormatString.h"
-#include "orvautil/Path.h"
-
 namespace orva::dbmerger {
-
-namespace {
-
-/// The master's mount point. Throws util::Exception when a master was elected and its volume is
-/// gone: PhotoDB would use the working directory instead.
-const std::string& MasterMountPoint() {
-  const VolumeInfo& master = VolumeInfoManager::Instance().getMasterVolume();
-  const std::string& path = master.mountPoint;
-  if (master != EmptyVolumeInfo && !path.empty() && util::Path(path).Canonicalize().empty()) {
-    throw util::Exception(util::FormatString("there is no volume at '%s'", path.c_str()));
-  }
-  return path;
-}
-
-} // namespace
 
 MasterVolumeScannedState::JoinedMerger::~JoinedMerger() noexcept(false) {
   merger.stopRequested = true;
@@ -34,7 +15,7 @@ MasterVolumeScannedState::JoinedMerger::~JoinedMerger() noexcept(false) {
 }
 
 MasterVolumeScannedState::MasterVolumeScannedState() {
-  const std::string& master = MasterMountPoint();
+  const std::string master = VolumeInfoManager::Instance().getMasterVolume().mountPoint;
   PhotoDB photos(master);
   photos.Init();
   updateLocatorFile(master);
@@ -79,7 +60,7 @@ void MasterVolumeScannedState::handlePictureTranscoded(VolumeInfo volume) {
          "MasterVolumeScannedState:: handlePictureTranscoded, doing merge for mountPoint %s using "
          "master volume at %s",
          volume.mountPoint.c_str(), master.c_str());
-  owned.merger.MergeDB(MasterMountPoint(), volume.mountPoint);
+  owned.merger.MergeDB(master, volume.mountPoint);
 }
 
 void MasterVolumeScannedState::handleVolumePurged(VolumeInfo volume) {
@@ -88,7 +69,7 @@ void MasterVolumeScannedState::handleVolumePurged(VolumeInfo volume) {
          "MasterVolumeScannedState:: handleVolumePurged, doing merge for mountPoint %s using "
          "master volume at %s",
          volume.mountPoint.c_str(), master.c_str());
-  owned.merger.ReMergeDB(MasterMountPoint(), volume.mountPoint);
+  owned.merger.ReMergeDB(master, volume.mountPoint);
 }
 
 int MasterVolumeScannedState::getStateType() {

@@ -10,13 +10,12 @@ namespace orva::dbmerger {
 class MasterVolumeScannedState : public State {
 public:
   /// Creates or opens the merged database on the master and points the locator file at it.
-  /// Throws what PhotoDB throws, and util::Exception when the volume of the master is gone.
+  /// Throws what PhotoDB throws.
   MasterVolumeScannedState();
 
   void handleVolumePlugged(VolumeInfo volume) override;
   void handleVolumeUnplugged(VolumeInfo volume) override;
   void handleVolumeScanned(VolumeInfo volume) override;
-  /// These two throw util::Exception, too, when the volume of the master is gone.
   void handlePictureTranscoded(VolumeInfo volume) override;
   void handleVolumePurged(VolumeInfo volume) override;
   int getStateType() override;

@@ -15,7 +15,6 @@
 namespace orva::test {
 namespace {
 
-using ::testing::AnyOf;
 using ::testing::Each;
 using ::testing::ElementsAre;
 using ::testing::EndsWith;
@@ -175,10 +174,8 @@ private:
     const MergedDatabase merged(Kept::PATH);
     EXPECT_THAT(merged.Faults(), IsEmpty());
     EXPECT_THAT(merged.Files(), SizeIs(pulled ? 100 : 1100));
-    EXPECT_EQ(pulled, !errors.empty());
     if (!errors.empty()) {
-      EXPECT_THAT(errors.back(), AnyOf(StartsWith("Error that we will ignore "),
-                                       "MessageProcessor:: there is no volume at '/shares/A/'"));
+      EXPECT_THAT(errors.back(), StartsWith("Error that we will ignore "));
       EXPECT_THAT(Lines(errors.begin(), errors.end() - 1),
                   Each("Could not insert stats for /shares/B/ "));
     }

@@ -102,7 +102,6 @@ protected:
   Volume b{"B", "120g"};
   Volume c{"C", "1g"};
   const std::string rowC = "/shares/C/c.jpg|1001|1001|/shares/C/";
-  const std::string textOfB = MasterText(b);
 };
 
 TEST_F(Recovery, FromALockOnTheNextMaster) {
@@ -145,42 +144,6 @@ TEST_F(SystemTest, RecoversFromAFailedFallback) {
   EXPECT_THAT(ErrorTexts(appliance.Handle(TranscodedBatch(c.Path()))), IsEmpty());
   EXPECT_THAT(MergedDatabase("/shares").Files(),
               ElementsAre("/shares/C/c.jpg|1001|1001|/shares/C/"));
-}
-
-/// The master and the next one are pulled together, and only the master is reported at first.
-TEST_F(Recovery, FromANextMasterThatIsGoneToo) {
-  Start();
-  const std::string gone = "MessageProcessor:: there is no volume at '/shares/B/'";
-  b.Unmount();
-  EXPECT_THAT(PullTheMaster(), ElementsAre(gone));
-  EXPECT_EQ(LocatorOn("/shares/A/"), Appliance::Locator());
-  // No event is handled until B is reported.
-  EXPECT_EQ((BatchLines() + Log{Info("Moving to the scanned state since we can safely do so "),
-                                Info("We now have a master volume " + textOfB + " "), Error(gone)}),
-            appliance.Handle(TranscodedBatch(c.Path())));
-  EXPECT_THAT(ErrorTexts(appliance.Handle(Purged(c.Path()))), ElementsAre(gone));
-
-  EXPECT_THAT(ErrorTexts(appliance.Handle(Unplugged(b.Path()))), IsEmpty());
-  EXPECT_EQ(LocatorOn("/shares"), Appliance::Locator());
-  EXPECT_THAT(ErrorTexts(appliance.Handle(TranscodedBatch(c.Path()))), IsEmpty());
-  EXPECT_THAT(MergedDatabase("/shares").Files(), ElementsAre(rowC));
-  EXPECT_THAT(MergedDatabase(DIRECTORY).Files(), IsEmpty());
-}
-
-/// The master is pulled and not reported.
-TEST_F(Recovery, FromAMasterThatIsGoneUnreported) {
-  Start();
-  const std::string gone = "MessageProcessor:: there is no volume at '/shares/A/'";
-  a.Unmount();
-  EXPECT_EQ((BatchLines() +
-             Log{Info("MasterVolumeScannedState:: handlePictureTranscoded, doing merge for "
-                      "mountPoint /shares/C/ using master volume at /shares/A/"),
-                 Error(gone)}),
-            appliance.Handle(TranscodedBatch(c.Path())));
-  EXPECT_THAT(ErrorTexts(appliance.Handle(Purged(c.Path()))), ElementsAre(gone));
-  EXPECT_FALSE(HasMergedDatabase(DIRECTORY));
-  EXPECT_THAT(ErrorTexts(appliance.Handle(Unplugged(a.Path()))), IsEmpty());
-  ExpectMergesIntoB();
 }
 
 class RecoveryBy : public Recovery, public ::testing::WithParamInterface<NextEvent> {};

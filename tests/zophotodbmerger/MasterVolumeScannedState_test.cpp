@@ -5,8 +5,6 @@
 #include "MasterVolumeScannedState.h"
 #include "PhotoDB.h"
 
-#include "orvautil/Exception.h"
-
 #include <fstream>
 
 namespace orva::test {
@@ -387,30 +385,6 @@ TEST_F(MasterVolumeScannedStateTest, UnusableMasterIsThrownFromAMerge) {
   EXPECT_THROW(Transcoded("/shares/Vol/"), PhotoDB::Error);
   EXPECT_THROW(Purged("/shares/Vol/"), PhotoDB::Error);
   EXPECT_EQ(State::MASTER_VOLUME_SCANNED, CurrentType());
-}
-
-TEST_F(MasterVolumeScannedStateTest, MasterThatIsGoneIsThrown) {
-  MakeCatalog("/shares/Other/");
-  std::filesystem::remove_all("/shares/Vol");
-  const std::string gone = "there is no volume at '/shares/Vol/'";
-  EXPECT_EQ(gone, Thrown<util::Exception>([&] { Transcoded("/shares/Other/"); }).what());
-  EXPECT_EQ(gone, Thrown<util::Exception>([&] { Purged("/shares/Other/"); }).what());
-  EXPECT_EQ(gone,
-            Thrown<util::Exception>([] { const dbmerger::MasterVolumeScannedState state; }).what());
-  EXPECT_FALSE(std::filesystem::exists("/tmp/scratch/.zophotos"));
-  EXPECT_EQ(Unfinished::Nothing, Current().getUnfinished());
-}
-
-TEST_F(UnfinishedTest, NextMasterThatIsGoneTooLeavesTheTransition) {
-  std::filesystem::remove_all("/shares/Next");
-  Forget("/shares/Vol/");
-  EXPECT_THROW(Unplugged("/shares/Vol/"), util::Exception);
-  EXPECT_EQ(Unfinished::Transition, Current().getUnfinished());
-  EXPECT_THROW(Recover(), util::Exception);
-  EXPECT_EQ("zophotos_db_path=/shares/Vol//.zophotos/zophotos.db\n", Appliance::Locator());
-  Forget("/shares/Next/");
-  Recover();
-  ExpectMergesInto("/shares");
 }
 
 } // namespace
