@@ -12,8 +12,7 @@ namespace orva::db {
 /// SQLite's file system for the connections to one database: its default one, but every file is
 /// opened and deleted through DatabaseFiles, and nothing else is opened, deleted or looked for,
 /// except temporary files. A journal may name a file that SQLite would otherwise open and delete.
-/// Counts what is read from the database and its write-ahead log.
-/// Any thread.
+/// Counts what is read from the database and its write-ahead log. Made and destroyed on any thread.
 class DatabaseVfs : sqlite3_vfs {
 public:
   /// Registers a file system for the database at `path`, to read or also to write it. Throws

@@ -27,46 +27,57 @@ int Claim(int result, Status* status) {
 
 } // namespace
 
-// The parameters have other names in the headers.
-// NOLINTBEGIN(readability-inconsistent-declaration-parameter-name)
-extern "C" {
+// The names that programs use.
+int ClaimStat(const char* path, struct stat* status) __asm__("stat");
+int ClaimStat64(const char* path, struct stat64* status) __asm__("stat64");
+int ClaimLstat(const char* path, struct stat* status) __asm__("lstat");
+int ClaimLstat64(const char* path, struct stat64* status) __asm__("lstat64");
+int ClaimFstat(int file, struct stat* status) __asm__("fstat");
+int ClaimFstat64(int file, struct stat64* status) __asm__("fstat64");
+int ClaimFstatat(int directory, const char* path, struct stat* status,
+                 int flags) __asm__("fstatat");
+int ClaimFstatat64(int directory, const char* path, struct stat64* status,
+                   int flags) __asm__("fstatat64");
+int ClaimStatx(int directory, const char* path, int flags, unsigned mask,
+               struct statx* status) __asm__("statx");
+off_t SeekWithoutHoles(int file, off_t offset, int whence) __asm__("lseek");
+off64_t SeekWithoutHoles64(int file, off64_t offset, int whence) __asm__("lseek64");
 
-int stat(const char* path, struct stat* status) noexcept {
+int ClaimStat(const char* path, struct stat* status) {
   return Claim(Next<int(const char*, struct stat*)>("stat")(path, status), status);
 }
 
-int stat64(const char* path, struct stat64* status) noexcept {
+int ClaimStat64(const char* path, struct stat64* status) {
   return Claim(Next<int(const char*, struct stat64*)>("stat64")(path, status), status);
 }
 
-int lstat(const char* path, struct stat* status) noexcept {
+int ClaimLstat(const char* path, struct stat* status) {
   return Claim(Next<int(const char*, struct stat*)>("lstat")(path, status), status);
 }
 
-int lstat64(const char* path, struct stat64* status) noexcept {
+int ClaimLstat64(const char* path, struct stat64* status) {
   return Claim(Next<int(const char*, struct stat64*)>("lstat64")(path, status), status);
 }
 
-int fstat(int file, struct stat* status) noexcept {
+int ClaimFstat(int file, struct stat* status) {
   return Claim(Next<int(int, struct stat*)>("fstat")(file, status), status);
 }
 
-int fstat64(int file, struct stat64* status) noexcept {
+int ClaimFstat64(int file, struct stat64* status) {
   return Claim(Next<int(int, struct stat64*)>("fstat64")(file, status), status);
 }
 
-int fstatat(int directory, const char* path, struct stat* status, int flags) noexcept {
+int ClaimFstatat(int directory, const char* path, struct stat* status, int flags) {
   using Function = int(int, const char*, struct stat*, int);
   return Claim(Next<Function>("fstatat")(directory, path, status, flags), status);
 }
 
-int fstatat64(int directory, const char* path, struct stat64* status, int flags) noexcept {
+int ClaimFstatat64(int directory, const char* path, struct stat64* status, int flags) {
   using Function = int(int, const char*, struct stat64*, int);
   return Claim(Next<Function>("fstatat64")(directory, path, status, flags), status);
 }
 
-int statx(int directory, const char* path, int flags, unsigned mask,
-          struct statx* status) noexcept {
+int ClaimStatx(int directory, const char* path, int flags, unsigned mask, struct statx* status) {
   using Function = int(int, const char*, int, unsigned, struct statx*);
   const int result = Next<Function>("statx")(directory, path, flags, mask, status);
   if (result == 0 && S_ISREG(status->stx_mode)) {
@@ -75,13 +86,13 @@ int statx(int directory, const char* path, int flags, unsigned mask,
   return result;
 }
 
-off_t lseek(int file, off_t offset, int whence) noexcept {
+off_t SeekWithoutHoles(int file, off_t offset, int whence) {
   const auto next = Next<off_t(int, off_t, int)>("lseek");
   if (whence != SEEK_DATA && whence != SEEK_HOLE) {
     return next(file, offset, whence);
   }
   struct stat status {};
-  if (fstat(file, &status) != 0) {
+  if (ClaimFstat(file, &status) != 0) {
     return -1;
   }
   if (offset < 0 || offset >= status.st_size) {
@@ -91,8 +102,6 @@ off_t lseek(int file, off_t offset, int whence) noexcept {
   return next(file, whence == SEEK_DATA ? offset : status.st_size, SEEK_SET);
 }
 
-off64_t lseek64(int file, off64_t offset, int whence) noexcept {
-  return lseek(file, offset, whence);
+off64_t SeekWithoutHoles64(int file, off64_t offset, int whence) {
+  return SeekWithoutHoles(file, offset, whence);
 }
-}
-// NOLINTEND(readability-inconsistent-declaration-parameter-name)

@@ -43,7 +43,7 @@ protected:
     const std::string answer = racer.ReadLine();
     if (answer != "ready") {
       ASSERT_EQ(77, racer.WaitForEnd()) << answer;
-      GTEST_SKIP() << answer;
+      GTEST_SKIP() << answer; // in an ordinary user's root there is no other user to race with
     }
     int events = 0;
     try {

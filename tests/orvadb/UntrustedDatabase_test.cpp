@@ -8,6 +8,7 @@
 
 #include "orvautil/FileDescriptor.h"
 
+#include "support/OtherUsers.h"
 #include "support/Thrown.h"
 
 #include <gmock/gmock.h>
@@ -320,9 +321,10 @@ class LogFileTest : public SideFileTest {};
 
 TEST_P(LogFileTest, FileOfAnotherUserIsNotUsed) {
   std::ofstream(Name()) << "theirs";
-  if (chown(Name().c_str(), 1, 1) != 0) {
-    GTEST_SKIP() << "this user cannot give files away";
+  if (!test::HasOtherUsers()) {
+    GTEST_SKIP() << test::NO_OTHER_USERS;
   }
+  ASSERT_EQ(chown(Name().c_str(), 1, 1), 0);
   ExpectRefused("belongs to another user");
   EXPECT_EQ(fs::file_size(Name()), 6U);
 }
@@ -362,9 +364,10 @@ TEST_F(UntrustedDatabaseTest, FileFoundAtTheNameOfALogKeepsItsOwnerAndMode) {
   std::ofstream(path + "-journal") << "private";
   fs::permissions(path + "-journal", fs::perms::owner_read);
   const util::FileDescriptor found(open((path + "-journal").c_str(), O_RDONLY));
-  if (chown(path.c_str(), 1, 1) != 0) {
-    GTEST_SKIP() << "this user cannot give files away";
+  if (!test::HasOtherUsers()) {
+    GTEST_SKIP() << test::NO_OTHER_USERS;
   }
+  ASSERT_EQ(chown(path.c_str(), 1, 1), 0);
   FailureOf("SELECT a FROM t");
   FailureOf("INSERT INTO t VALUES(1, 2)");
   struct stat status {};
@@ -381,9 +384,10 @@ TEST_F(UntrustedDatabaseTest, FileWithAnotherNameIsRead) {
 }
 
 TEST_F(UntrustedDatabaseTest, DatabaseOfAnotherUserIsWrittenWithALogOfTheSameUser) {
-  if (chown(path.c_str(), 1, 1) != 0) {
-    GTEST_SKIP() << "this user cannot give files away";
+  if (!test::HasOtherUsers()) {
+    GTEST_SKIP() << test::NO_OTHER_USERS;
   }
+  ASSERT_EQ(chown(path.c_str(), 1, 1), 0);
   EXPECT_EQ(FailureOf("INSERT INTO t VALUES(1, 2)"), "");
   std::ofstream(path + "-journal") << "x";
   EXPECT_EQ(chown((path + "-journal").c_str(), 1, 1), 0);
@@ -413,9 +417,7 @@ TEST_F(UntrustedDatabaseTest, LeaseIsWaitedForWithinBounds) {
   const std::string journal = path + "-journal";
   const util::FileDescriptor holder(open(journal.c_str(), O_RDWR | O_CREAT, 0644));
   std::signal(SIGIO, SIG_IGN);
-  if (fcntl(holder.Get(), F_SETLEASE, F_WRLCK) != 0) {
-    GTEST_SKIP() << "the file system has no leases";
-  }
+  ASSERT_EQ(fcntl(holder.Get(), F_SETLEASE, F_WRLCK), 0);
   write(holder.Get(), "x", 1);
   EXPECT_NE(FailureOf("INSERT INTO t VALUES(1, 2)"), "");
   EXPECT_EQ(fcntl(holder.Get(), F_SETLEASE, F_UNLCK), 0);

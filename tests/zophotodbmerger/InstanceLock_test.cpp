@@ -4,6 +4,8 @@
 
 #include "orvautil/FileDescriptor.h"
 
+#include "support/OtherUsers.h"
+
 #include <fcntl.h>
 #include <sys/fsuid.h>
 #include <sys/stat.h>
@@ -73,11 +75,11 @@ TEST(InstanceLock, RepairsTheModeOfItsFile) {
 }
 
 TEST(InstanceLock, IsHeldWhenTheFileOfRootCannotBeOpened) {
+  if (!HasOtherUsers()) {
+    GTEST_SKIP() << NO_OTHER_USERS;
+  }
   { const InstanceLock root; }
   setfsuid(1000); // without the privilege to open every file
-  if (FileDescriptor(open(FILE_PATH.c_str(), O_RDWR | O_CLOEXEC))) {
-    GTEST_SKIP() << "there is no other user in this root";
-  }
   EXPECT_TRUE(InstanceLock().IsHeldByAnother());
   setfsuid(0);
   EXPECT_FALSE(InstanceLock().IsHeldByAnother());
@@ -103,9 +105,10 @@ void MakeFile(const std::string& path, mode_t mode = 0600) {
 }
 
 void GiveAway(const std::string& path) {
-  if (chown(path.c_str(), 65534, 65534) != 0) {
-    GTEST_SKIP() << "there is no other user in this root";
+  if (!HasOtherUsers()) {
+    GTEST_SKIP() << NO_OTHER_USERS;
   }
+  ASSERT_EQ(0, chown(path.c_str(), 65534, 65534));
 }
 
 const std::vector<Unsafe> UNSAFE{
