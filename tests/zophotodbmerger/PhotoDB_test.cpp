@@ -275,9 +275,11 @@ TEST_F(PhotoDBNewDirectoryTest, DirectoryWhoseModeCannotBeChangedIsRemovedAgain)
 }
 
 TEST_F(PhotoDBLocationTest, NewDirectoryIsRemovedAgainWhenItCannotBeOpenedOrListed) {
-  // A sanitizer needs descriptors to check a type for the first time.
-  { const PhotoDB photos(LOCATION); }
-  std::filesystem::remove(DIRECTORY);
+  // The sanitizer opens a pipe to look at the memory of an object, and takes the failure for a
+  // corrupt object. The test takes away all descriptors.
+  if (AreProgramsSanitized()) {
+    GTEST_SKIP() << "the sanitizer itself needs descriptors";
+  }
   rlimit unlimited{};
   ASSERT_EQ(0, getrlimit(RLIMIT_NOFILE, &unlimited));
   const int next = dup(STDOUT_FILENO);
