@@ -1,6 +1,7 @@
 #include "orvadb/Connection.h"
 
 #include "DatabaseVfs.h"
+#include "MemoryTable.h"
 #include "WorkLimit.h"
 
 #include "orvadb/ErrorMessage.h"
@@ -64,9 +65,24 @@ bool Connection::IsReadOnly() const noexcept {
 }
 
 Connection::CheckedOut Connection::CheckOut(const char* sql, const char* file, unsigned int line) {
+  // A virtual table would run a module's code on untrusted data.
+  return CheckOut(sql, SQLITE_PREPARE_PERSISTENT | SQLITE_PREPARE_NO_VTAB, file, line);
+}
+
+Connection::CheckedOut Connection::CheckOut(const char* sql, Rows& rows, const char* file,
+                                            unsigned int line) {
+  if (!memoryTable_) {
+    memoryTable_ = std::make_unique<MemoryTable>(handle_, *workLimit_);
+  }
+  memoryTable_->Provide(rows);
+  return CheckOut(sql, SQLITE_PREPARE_PERSISTENT, file, line);
+}
+
+Connection::CheckedOut Connection::CheckOut(const char* sql, unsigned flags, const char* file,
+                                            unsigned int line) {
   // SQLite rolls back by itself after some failures. It would commit every later statement of the
   // transaction's owner at once.
-  if (transaction_ != 0 && sqlite3_get_autocommit(handle_) != 0) {
+  if (inTransaction_ && sqlite3_get_autocommit(handle_) != 0) {
     throw ErrorMessage(util::FormatString("\"%s\" in a transaction that was rolled back: %s", sql,
                                           failedStep_.c_str()),
                        file, line);
@@ -78,17 +94,16 @@ Connection::CheckedOut Connection::CheckOut(const char* sql, const char* file, u
   Compiled compiled = std::move(place.statement);
   if (!compiled || place.schema != schema_) {
     place.mayChangeSchema = MayChangeSchema(sql);
-    compiled = Compile(sql, file, line);
+    compiled = Compile(sql, flags, file, line);
   }
   return {compiled.release(), CheckIn{.place = &place, .schema = schema_}};
 }
 
-Connection::Compiled Connection::Compile(const char* sql, const char* file, unsigned int line) {
+Connection::Compiled Connection::Compile(const char* sql, unsigned flags, const char* file,
+                                         unsigned int line) {
   const auto requestsBefore = PageRequests(handle_);
   sqlite3_stmt* statement = nullptr;
-  // A virtual table would run a module's code on untrusted data.
-  const int code = sqlite3_prepare_v3(
-      handle_, sql, -1, SQLITE_PREPARE_PERSISTENT | SQLITE_PREPARE_NO_VTAB, &statement, nullptr);
+  const int code = sqlite3_prepare_v3(handle_, sql, -1, flags, &statement, nullptr);
   Compiled compiled(statement);
   // Compiling reads pages only to load the schema.
   if (PageRequests(handle_) != requestsBefore) {
@@ -126,19 +141,14 @@ void Connection::Execute(const CheckedOut& statement, const char* file, unsigned
 void Connection::BeginTransaction(unsigned int busyTimeout, const char* file, unsigned int line) {
   const CheckedOut begin = CheckOut(IsReadOnly() ? "BEGIN" : "BEGIN IMMEDIATE", file, line);
   failedStep_.clear();
-  beforeCommit_.clear();
   sqlite3_busy_timeout(handle_, static_cast<int>(busyTimeout));
   try {
     Execute(begin, file, line);
-    transaction_ = ++transactions_;
+    inTransaction_ = true;
   } catch (...) {
     sqlite3_busy_timeout(handle_, busyTimeout_);
     throw;
   }
-}
-
-void Connection::ExecuteBeforeCommit(const char* sql) {
-  beforeCommit_.push_back(sql);
 }
 
 void Connection::CommitTransaction(const char* file, unsigned int line) {
@@ -149,9 +159,6 @@ void Connection::CommitTransaction(const char* file, unsigned int line) {
   }
   if (checkBeforeCommit_) {
     checkBeforeCommit_();
-  }
-  for (const char* const sql : beforeCommit_) {
-    Execute(CheckOut(sql, file, line), file, line);
   }
   Execute(CheckOut("COMMIT", file, line), file, line);
   EndTransaction();
@@ -168,7 +175,7 @@ void Connection::RollBackTransaction() noexcept {
 
 void Connection::EndTransaction() noexcept {
   sqlite3_busy_timeout(handle_, busyTimeout_);
-  transaction_ = 0;
+  inTransaction_ = false;
 }
 
 } // namespace orva::db

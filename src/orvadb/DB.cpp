@@ -48,6 +48,7 @@ void DisableUntrustedFeatures(sqlite3* handle) {
         std::pair(SQLITE_DBCONFIG_TRUSTED_SCHEMA, 0), std::pair(SQLITE_DBCONFIG_DEFENSIVE, 1)}) {
     sqlite3_db_config(handle, option, value, nullptr);
   }
+  sqlite3_drop_modules(handle, nullptr);
   sqlite3_limit(handle, SQLITE_LIMIT_LENGTH, LONGEST_VALUE);
   Run(handle, "PRAGMA cell_size_check = ON");
   Run(handle, "PRAGMA ignore_check_constraints = ON");
@@ -121,6 +122,8 @@ void DB::Open(std::string path, Access access, int busyTimeout, bool immutable) 
     if (access == Access::ReadWrite) {
       // A merge keeps its changes in memory until it commits, so that readers wait only then.
       Run(handle_, "PRAGMA cache_size = -65536");
+      // The sets of row ids that SQLite makes for a statement are small.
+      Run(handle_, "PRAGMA temp_store = MEMORY");
     }
   } catch (...) {
     Close();
@@ -216,14 +219,8 @@ void DB::RejectComputedColumns(const std::string& table) const {
   }
 }
 
-unsigned long long DB::RunningTransaction() const noexcept {
-  return connection_ ? connection_->RunningTransaction() : 0;
-}
-
-void DB::CreateTransientIndex(const char* create, const char* drop, const char* file,
-                              unsigned int line) const {
-  Statement(*this, create, file, line).Execute(file, line);
-  connection_->ExecuteBeforeCommit(drop);
+bool DB::IsInTransaction() const noexcept {
+  return handle_ != nullptr && sqlite3_get_autocommit(handle_) == 0;
 }
 
 long long DB::LastInsertId() const noexcept {

@@ -15,6 +15,10 @@ Statement::Statement(const DB& db, const char* sql, const char* file, unsigned i
     : connection_(db.OpenConnection(sql, file, line)),
       statement_(connection_.CheckOut(sql, file, line)) {}
 
+Statement::Statement(const DB& db, const char* sql, Rows& rows, const char* file, unsigned int line)
+    : connection_(db.OpenConnection(sql, file, line)),
+      statement_(connection_.CheckOut(sql, rows, file, line)) {}
+
 int Statement::Step(const char* file, unsigned int line) {
   return connection_.Step(statement_, file, line);
 }
@@ -53,10 +57,6 @@ void Statement::BindTextView(int index, std::string_view value, const char* file
             file, line);
 }
 
-int Statement::TakeCost() const {
-  return sqlite3_stmt_status(statement_.get(), SQLITE_STMTSTATUS_VM_STEP, 1);
-}
-
 void Statement::BindTime(int index, long value, const char* file, unsigned int line) {
   BindInt64(index, value, file, line);
 }
@@ -71,6 +71,14 @@ long long Statement::GetInt64(int column) const {
 
 bool Statement::IsNull(int column) const {
   return sqlite3_column_type(statement_.get(), column) == SQLITE_NULL;
+}
+
+bool Statement::IsText(int column) const {
+  return sqlite3_column_type(statement_.get(), column) == SQLITE_TEXT;
+}
+
+bool Statement::IsInteger(int column) const {
+  return sqlite3_column_type(statement_.get(), column) == SQLITE_INTEGER;
 }
 
 std::string Statement::GetText(int column) const {

@@ -17,7 +17,8 @@ constexpr long long CACHED_PAGE_COST = 20;
 constexpr long long FILE_PAGE_COST = 200;
 constexpr long long LEAST_LIMIT = 10'000'000;
 constexpr long long LIMIT_PER_BYTE = 20;
-/// Changed rows may not be in the file yet.
+/// Changed rows may not be in the file yet. Those of a running statement are not counted as
+/// changed, but as given.
 constexpr long long LIMIT_PER_CHANGED_ROW = 2'000;
 
 /// Processor time of a statement that only reads. On a million files it needs about one second.
@@ -50,6 +51,7 @@ WorkLimit::~WorkLimit() {
 
 void WorkLimit::Restart() noexcept {
   work_ = 0;
+  givenRows_ = 0;
   begin_ = -1;
 }
 
@@ -78,8 +80,9 @@ int WorkLimit::IsExceeded(void* self) noexcept {
     return 0;
   }
   const bool exceeded =
-      limit.work_ > LEAST_LIMIT + limit.vfs_.BytesRead() * LIMIT_PER_BYTE +
-                        sqlite3_total_changes64(limit.handle_) * LIMIT_PER_CHANGED_ROW;
+      limit.work_ >
+      LEAST_LIMIT + limit.vfs_.BytesRead() * LIMIT_PER_BYTE +
+          (sqlite3_total_changes64(limit.handle_) + limit.givenRows_) * LIMIT_PER_CHANGED_ROW;
   return exceeded || limit.TakesTooLong() ? 1 : 0;
 }
 

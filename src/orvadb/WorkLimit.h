@@ -21,6 +21,9 @@ public:
   /// A statement begins: counts its work from zero.
   void Restart() noexcept;
 
+  /// The statement was given one more row of ours: allows it the work for that.
+  void AllowForRow() noexcept { ++givenRows_; }
+
 private:
   static int IsExceeded(void* self) noexcept;
 
@@ -30,6 +33,7 @@ private:
   sqlite3* handle_;
   const DatabaseVfs& vfs_;
   long long work_ = 0;       ///< of the current statement so far
+  long long givenRows_ = 0;  ///< to the current statement
   unsigned cachedPages_ = 0; ///< requests for pages that the cache had, by all statements
   unsigned readPages_ = 0;   ///< the same for pages that it had not
   /// Processor time of the thread when the statement exceeded LEAST_LIMIT, in seconds; -1 before.

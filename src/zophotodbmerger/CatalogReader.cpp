@@ -26,9 +26,6 @@ using db::Statement;
 constexpr int ROOT_FOLDER_CATEGORY = 4;
 constexpr long long TRANSCODED = 3;
 
-/// Items that a list has room for at first: its length is not known before it is read.
-constexpr std::size_t EXPECTED_ITEMS = 4096;
-
 /// A quarter of the machine's memory.
 long long MostMemory() {
   return sysconf(_SC_PHYS_PAGES) / 4 * sysconf(_SC_PAGESIZE);
@@ -40,10 +37,10 @@ class ListMemory {
 public:
   explicit ListMemory(const db::VolumeDB& catalog) : catalog_(catalog) {}
 
-  /// Takes what one more item needs. Throws std::string when that is more than the content can need
-  /// that was read, or more than the machine can spare.
-  void Take(const db::FolderItem& item, std::size_t more) {
-    taken_ += static_cast<long long>(item.path.size() + item.name.size() + more);
+  /// Takes the bytes of one more item. Throws std::string when that is more than the content can
+  /// need that was read, or more than the machine can spare.
+  void Take(std::size_t bytes) {
+    taken_ += static_cast<long long>(bytes);
     if (taken_ > limit_) {
       static const long long most = MostMemory();
       limit_ = std::min(LEAST + PER_BYTE * catalog_.BytesRead(), most);
@@ -63,6 +60,35 @@ private:
   long long taken_ = 0;
   long long limit_ = LEAST; ///< raised when it is reached
 };
+
+/// Calls `use` with each visible folder of the catalog.
+template <typename Use>
+void ForEachFolder(const db::VolumeDB& catalog, Use use) {
+  catalog.RejectComputedColumns("Folders");
+  // The unary plus here and below keeps SQLite from using an index on a flag.
+  Statement query(catalog,
+                  "SELECT * FROM Folders where +isSystem = 0 AND +isBackup = 0 AND +isHidden = 0");
+  while (query.Step() == Statement::ROW) {
+    use(query);
+  }
+}
+
+/// Calls `use` with each file whose rendition was finished or withdrawn after `since`.
+template <typename Use>
+void ForEachChangedFile(const db::VolumeDB& catalog, std::time_t since, Use use) {
+  catalog.RejectComputedColumns("Files");
+  catalog.RejectComputedColumns("Transcodings");
+  Statement query(catalog,
+                  "SELECT f.id,f.folderId,f.path,f.name,f.category,f.lastModifiedDate,f.isBackup,"
+                  "f.isHidden,f.isSystem,f.isDeleted,f.status,t.lastUpdatedDate,f.ext,f.size from "
+                  "Files f, Transcodings t WHERE f.id = t.sourceId AND t.lastUpdatedDate > ? AND "
+                  "t.profile = 'cb62bbdd389b48898f2e5244977cb2c5' AND ((f.isDeleted = 0 and "
+                  "t.status = 1) OR (f.isDeleted = 1 and t.status = 0))");
+  query.BindTime(1, since);
+  while (query.Step() == Statement::ROW) {
+    use(query);
+  }
+}
 
 /// The row for the volume itself, which is not in its catalog.
 std::unique_ptr<db::Folder> RootFolder(const std::string& volumeMountPoint) {
@@ -93,52 +119,90 @@ std::unique_ptr<Item> ReadItem(const Statement& row, const std::string& base) {
   return item;
 }
 
+/// Builds the full paths of a catalog's rows, as util::MakePath does.
+class MergeListReader {
+public:
+  MergeListReader(const std::string& volumeMountPoint, const db::VolumeDB& catalog)
+      : base_(util::MakePath(util::Path(volumeMountPoint).Basic(), "")), memory_(catalog) {}
+
+  /// Adds a row to the list, as an item with `name`. Its columns are those that folders and files
+  /// have in common.
+  void Add(const Statement& row, std::string_view name) {
+    std::string_view path = row.GetTextView(2);
+    if (!base_.empty()) {
+      path.remove_prefix(std::min(path.find_first_not_of(NATIVE_PATH_SEPARATOR), path.size()));
+    }
+    const MergeItem item{.path = path,
+                         .name = name,
+                         .modified = row.GetInt(5),
+                         .updated = row.GetInt(11),
+                         .status = row.GetInt(10),
+                         .isDeleted = row.GetBool(9),
+                         .isSystem = row.GetBool(8)};
+    memory_.Take(sizeof(MergeItem) + base_.size() + item.path.size() + item.name.size());
+    list_.Add(base_, item);
+  }
+
+  /// The list, sorted.
+  MergeList Take() {
+    list_.Sort();
+    return std::move(list_);
+  }
+
+  MergeList& List() noexcept { return list_; }
+
+private:
+  std::string base_;
+  ListMemory memory_;
+  MergeList list_;
+};
+
 } // namespace
 
 util::OwnerVector<db::Folder> ReadFolders(const std::string& volumeMountPoint,
                                           const db::VolumeDB& catalog) {
-  catalog.RejectComputedColumns("Folders");
   ListMemory memory(catalog);
   util::OwnerVector<db::Folder> folders;
-  folders.reserve(EXPECTED_ITEMS);
   folders.push_back(RootFolder(volumeMountPoint));
-
-  // The unary plus here and below keeps SQLite from using an index on a flag.
   const std::string base = util::Path(volumeMountPoint).Basic();
-  Statement query(catalog,
-                  "SELECT * FROM Folders where +isSystem = 0 AND +isBackup = 0 AND +isHidden = 0");
-  while (query.Step() == Statement::ROW) {
-    folders.push_back(ReadItem<db::Folder>(query, base));
-    memory.Take(*folders.back(), sizeof(db::Folder));
-  }
+  ForEachFolder(catalog, [&](const Statement& row) {
+    auto folder = ReadItem<db::Folder>(row, base);
+    memory.Take(sizeof(db::Folder) + folder->path.size() + folder->name.size());
+    folders.push_back(std::move(folder));
+  });
   std::ranges::sort(folders, FolderItemCmp<db::FolderItem>());
   return folders;
 }
 
 util::OwnerVector<db::File> ReadChangedFiles(const std::string& volumeMountPoint,
                                              const db::VolumeDB& catalog, std::time_t since) {
-  catalog.RejectComputedColumns("Files");
-  catalog.RejectComputedColumns("Transcodings");
   ListMemory memory(catalog);
   util::OwnerVector<db::File> files;
-  files.reserve(EXPECTED_ITEMS);
   const std::string base = util::Path(volumeMountPoint).Basic();
-  Statement query(catalog,
-                  "SELECT f.id,f.folderId,f.path,f.name,f.category,f.lastModifiedDate,f.isBackup,"
-                  "f.isHidden,f.isSystem,f.isDeleted,f.status,t.lastUpdatedDate,f.ext,f.size from "
-                  "Files f, Transcodings t WHERE f.id = t.sourceId AND t.lastUpdatedDate > ? AND "
-                  "t.profile = 'cb62bbdd389b48898f2e5244977cb2c5' AND ((f.isDeleted = 0 and "
-                  "t.status = 1) OR (f.isDeleted = 1 and t.status = 0))");
-  query.BindTime(1, since);
-  while (query.Step() == Statement::ROW) {
-    auto file = ReadItem<db::File>(query, base);
-    file->ext = query.GetTextView(12);
-    file->size = query.GetInt64(13);
-    memory.Take(*file, sizeof(db::File) + file->ext.size());
+  ForEachChangedFile(catalog, since, [&](const Statement& row) {
+    auto file = ReadItem<db::File>(row, base);
+    file->ext = row.GetTextView(12);
+    file->size = row.GetInt64(13);
+    memory.Take(sizeof(db::File) + file->path.size() + file->name.size() + file->ext.size());
     files.push_back(std::move(file));
-  }
+  });
   std::ranges::sort(files, FolderItemCmp<db::FolderItem>());
   return files;
+}
+
+MergeList ListFolders(const std::string& volumeMountPoint, const db::VolumeDB& catalog) {
+  MergeListReader reader(volumeMountPoint, catalog);
+  reader.List().Add({}, {.path = volumeMountPoint});
+  ForEachFolder(catalog, [&](const Statement& row) { reader.Add(row, {}); });
+  return reader.Take();
+}
+
+MergeList ListChangedFiles(const std::string& volumeMountPoint, const db::VolumeDB& catalog,
+                           std::time_t since) {
+  MergeListReader reader(volumeMountPoint, catalog);
+  ForEachChangedFile(catalog, since,
+                     [&](const Statement& row) { reader.Add(row, row.GetTextView(3)); });
+  return reader.Take();
 }
 
 PhotoCounts CountPhotos(const std::string& /*volumeMountPoint*/, const db::VolumeDB& catalog) {

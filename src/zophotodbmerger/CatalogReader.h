@@ -1,5 +1,7 @@
 #pragma once
 
+#include "MergeList.h"
+
 #include "orvautil/OwnerVector.h"
 
 #include <ctime>
@@ -33,6 +35,11 @@ util::OwnerVector<db::Folder> ReadFolders(const std::string& volumeMountPoint,
 /// strictly after `since`.
 util::OwnerVector<db::File> ReadChangedFiles(const std::string& volumeMountPoint,
                                              const db::VolumeDB& catalog, std::time_t since);
+
+/// The same lists as a merge keeps them.
+MergeList ListFolders(const std::string& volumeMountPoint, const db::VolumeDB& catalog);
+MergeList ListChangedFiles(const std::string& volumeMountPoint, const db::VolumeDB& catalog,
+                           std::time_t since);
 
 PhotoCounts CountPhotos(const std::string& volumeMountPoint, const db::VolumeDB& catalog);
 

@@ -4,12 +4,10 @@
 
 #include "CatalogReader.h"
 #include "PhotoDB.h"
+#include "SetMerge.h"
 #include "Statistics.h"
-#include "Util.h"
 #include "VolumeInfoManager.h"
 
-#include "orvadb/File.h"
-#include "orvadb/Folder.h"
 #include "orvadb/Transaction.h"
 #include "orvadb/VolumeDB.h"
 
@@ -53,47 +51,6 @@ std::unique_ptr<Statistics> ReadStatistics(PhotoDB& photos, const std::string& v
   return statistics;
 }
 
-void ApplyFolders(const PhotoDB& photos, const std::string& volume,
-                  const util::OwnerVector<db::Folder>& folders,
-                  const std::atomic<bool>& stopRequested) {
-  for (db::Folder* const folder : folders) {
-    if (stopRequested) {
-      return;
-    }
-    if (folder->isDeleted) {
-      photos.DeleteFolder(volume, *folder);
-    } else {
-      photos.AddFolder(volume, *folder);
-    }
-  }
-}
-
-/// Returns the time of the newest file applied, or `since` if no file is newer.
-std::time_t ApplyFiles(const PhotoDB& photos, const std::string& volume,
-                       const util::OwnerVector<db::File>& files, std::time_t since,
-                       const std::atomic<bool>& stopRequested) {
-  std::time_t newest = since;
-  for (db::File* const file : files) {
-    if (stopRequested) {
-      break;
-    }
-    writeLine({"Processing file ", file->path, " isdeleted=", file->isDeleted ? "1" : "0",
-               " status = ", std::to_string(file->status)});
-    if (file->isSystem) {
-      continue;
-    }
-    if (file->isDeleted) {
-      writeLine({"Removing file ", file->path, " for mount ", volume});
-      photos.DeleteFile(volume, *file);
-    } else {
-      writeLine({"Adding file ", file->path, " for mount ", volume});
-      photos.AddFile(volume, *file);
-    }
-    newest = std::max(newest, file->lastUpdatedDate);
-  }
-  return newest;
-}
-
 /// What a merge stores about a catalog that it has applied.
 struct Applied {
   std::time_t newest = 0; ///< time of the newest file applied
@@ -108,14 +65,14 @@ Applied ApplyCatalog(const PhotoDB& photos, const db::VolumeDB& catalog, const s
   db::Transaction snapshot(catalog, CATALOG_BUSY_TIMEOUT);
 
   thread_timer timer;
-  const auto folders = ReadFolders(volume, catalog);
+  const MergeList folders = ListFolders(volume, catalog);
   syslog(LOG_LOCAL1 | LOG_INFO, "Retrieved changed folders list for %s in %s\n", volume.c_str(),
          Elapsed(timer).c_str());
 
   timer.Start();
-  const auto files = ReadChangedFiles(volume, catalog, since);
+  const MergeList files = ListChangedFiles(volume, catalog, since);
   syslog(LOG_LOCAL1 | LOG_INFO, "Retrieved %d changed files list for %s in %s\n",
-         static_cast<int>(files.size()), volume.c_str(), Elapsed(timer).c_str());
+         static_cast<int>(files.Size()), volume.c_str(), Elapsed(timer).c_str());
 
   timer.Start();
   const PhotoCounts counts = CountPhotos(volume, catalog);
@@ -124,13 +81,14 @@ Applied ApplyCatalog(const PhotoDB& photos, const db::VolumeDB& catalog, const s
   snapshot.Commit();
 
   timer.Start();
-  ApplyFolders(photos, volume, folders, stopRequested);
+  const SetMerge merge(photos, volume, stopRequested);
+  merge.ApplyFolders(folders);
   syslog(LOG_LOCAL1 | LOG_INFO, "Merged %d folders for %s in %s\n",
-         static_cast<int>(folders.size()), volume.c_str(), Elapsed(timer).c_str());
+         static_cast<int>(folders.Size()), volume.c_str(), Elapsed(timer).c_str());
 
   timer.Start();
-  const std::time_t newest = ApplyFiles(photos, volume, files, since, stopRequested);
-  syslog(LOG_LOCAL1 | LOG_INFO, "Merged %d files for %s in %s\n", static_cast<int>(files.size()),
+  const std::time_t newest = merge.ApplyFiles(files, since);
+  syslog(LOG_LOCAL1 | LOG_INFO, "Merged %d files for %s in %s\n", static_cast<int>(files.Size()),
          volume.c_str(), Elapsed(timer).c_str());
   return {.newest = newest, .counts = counts};
 }

@@ -4,12 +4,13 @@
 
 #include "File.h"
 #include "Folder.h"
+#include "StandardOutput.h"
 #include "Statistics.h"
-#include "Util.h"
 
 #include "orvadb/File.h"
 #include "orvadb/Folder.h"
 #include "orvadb/Statement.h"
+#include "orvadb/Transaction.h"
 
 #include "orvautil/Exception.h"
 #include "orvautil/FileDescriptor.h"
@@ -22,6 +23,7 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <array>
 
 namespace orva::dbmerger {
 
@@ -37,7 +39,25 @@ constexpr mode_t EVERYBODY = 0777;
 /// Stored in a new database's status row: a fixed placeholder, not the clock.
 constexpr std::time_t NEW_DATABASE_TIME = 1000;
 
-constexpr long long NO_FOLDER = -1;
+/// Milliseconds that a removal waits for other users of the database.
+constexpr unsigned BUSY_TIMEOUT = 1000;
+
+// The statements of the tables and indexes that merges work on. SQLite keeps their texts, which
+// HasOwnSchema compares.
+const char* const CREATE_FOLDERS =
+    "CREATE TABLE IF NOT EXISTS Folders(folder_id INTEGER PRIMARY KEY AUTOINCREMENT, "
+    "parent_folder_id INTEGER NOT NULL, name TEXT NOT NULL, modified_date INTEGER NOT NULL, volume "
+    "TEXT NOT NULL)";
+const char* const CREATE_FILES =
+    "CREATE TABLE IF NOT EXISTS Files(file_id INTEGER PRIMARY KEY AUTOINCREMENT, folder_id INTEGER "
+    "NOT NULL, name TEXT NOT NULL, modified_date INTEGER NOT NULL, volume TEXT NOT NULL, "
+    "created_date INTEGER NOT NULL, FOREIGN KEY(folder_id) REFERENCES Folders(folder_id) ON DELETE "
+    "CASCADE)";
+constexpr std::array<const char*, 4> CREATE_INDEXES{
+    "CREATE INDEX IF NOT EXISTS Folders_folderId ON Folders(parent_folder_id)",
+    "CREATE INDEX IF NOT EXISTS Folders_path ON Folders(name)",
+    "CREATE INDEX IF NOT EXISTS Files_folderId ON Files(folder_id)",
+    "CREATE INDEX IF NOT EXISTS Files_name ON Files(name)"};
 
 /// Whether anything exists at `path`, links not followed.
 bool IsPresent(const std::string& path) {
@@ -106,16 +126,6 @@ bool CreateDirectoryForEverybody(const std::string& path) {
   return false;
 }
 
-/// The path of the folder that holds the folder at `path`, with its trailing separator.
-std::string_view ParentPath(std::string_view path) {
-  return path.substr(0, path.rfind(NATIVE_PATH_SEPARATOR, path.size() - 2) + 1);
-}
-
-/// The path of the folder that holds the file at `path`, with its trailing separator.
-std::string_view FolderPath(std::string_view path) {
-  return path.substr(0, path.rfind(NATIVE_PATH_SEPARATOR) + 1);
-}
-
 /// The text between the last two separators of a folder's path.
 std::string FolderName(const std::string& path) {
   const std::size_t end = path.rfind(NATIVE_PATH_SEPARATOR);
@@ -155,6 +165,37 @@ bool IsSuccess(int code) {
   return code == 0 || code == Statement::ROW || code == Statement::DONE;
 }
 
+/// Whether the schema has the table or index that `create` makes.
+bool HasObject(const PhotoDB& photos, std::string create) {
+  // The text that SQLite keeps.
+  const std::string_view condition = "IF NOT EXISTS ";
+  create.erase(create.find(condition), condition.size());
+  Statement query(photos, "SELECT 1 FROM main.sqlite_schema WHERE sql = ?");
+  query.BindText(1, create);
+  return query.Fetch();
+}
+
+/// The caller's transaction, or else one of its own.
+class JoinedTransaction {
+public:
+  explicit JoinedTransaction(const db::DB& db) {
+    if (!db.IsInTransaction()) {
+      own_.emplace(db, BUSY_TIMEOUT);
+    }
+  }
+
+  bool IsOwn() const noexcept { return own_.has_value(); }
+
+  void Commit() {
+    if (own_) {
+      own_->Commit();
+    }
+  }
+
+private:
+  std::optional<db::Transaction> own_;
+};
+
 /// Appends `record` to a list of the caller, which then owns it.
 template <typename Record>
 void HandOver(std::unique_ptr<Record> record, std::vector<Record*>& records) {
@@ -164,9 +205,16 @@ void HandOver(std::unique_ptr<Record> record, std::vector<Record*>& records) {
 
 } // namespace
 
-PhotoDB::PhotoDB(const std::string& location, CacheUse cacheUse)
-    : dbLocation(util::MakePath(util::Path(location).Canonicalize(), ".zophotos")),
-      cacheUse_(cacheUse) {
+std::string_view ParentPath(std::string_view path) {
+  return path.substr(0, path.rfind(NATIVE_PATH_SEPARATOR, path.size() - 2) + 1);
+}
+
+std::string_view FolderPath(std::string_view path) {
+  return path.substr(0, path.rfind(NATIVE_PATH_SEPARATOR) + 1);
+}
+
+PhotoDB::PhotoDB(const std::string& location)
+    : dbLocation(util::MakePath(util::Path(location).Canonicalize(), ".zophotos")) {
   if (!IsPresent(dbLocation) && !CreateDirectoryForEverybody(dbLocation)) {
     throw util::Exception(
         util::FormatString("Change permissions failed on dbLocation: '%s'", dbLocation.c_str()));
@@ -232,11 +280,7 @@ void PhotoDB::CreateTables() {
   insertStatus.BindInt(4, status.etype);
   insertStatus.Execute();
 
-  Statement(*this,
-            "CREATE TABLE IF NOT EXISTS Folders(folder_id INTEGER PRIMARY KEY AUTOINCREMENT, "
-            "parent_folder_id INTEGER NOT NULL, name TEXT NOT NULL, modified_date INTEGER NOT "
-            "NULL, volume TEXT NOT NULL)")
-      .Execute();
+  Statement(*this, CREATE_FOLDERS).Execute();
 
   // The root folder, the parent of every volume. It gets id 1 because the table is new;
   // DeleteVolumes relies on that.
@@ -249,22 +293,21 @@ void PhotoDB::CreateTables() {
   insertRoot.BindText(4, "<DUMMY>");
   insertRoot.Execute();
 
-  Statement(*this,
-            "CREATE TABLE IF NOT EXISTS Files(file_id INTEGER PRIMARY KEY AUTOINCREMENT, folder_id "
-            "INTEGER NOT NULL, name TEXT NOT NULL, modified_date INTEGER NOT NULL, volume TEXT NOT "
-            "NULL, created_date INTEGER NOT NULL, FOREIGN KEY(folder_id) REFERENCES "
-            "Folders(folder_id) ON DELETE CASCADE)")
-      .Execute();
+  Statement(*this, CREATE_FILES).Execute();
 }
 
 void PhotoDB::CreateIndices() {
-  for (const char* const sql :
-       {"CREATE INDEX IF NOT EXISTS Folders_folderId ON Folders(parent_folder_id)",
-        "CREATE INDEX IF NOT EXISTS Folders_path ON Folders(name)",
-        "CREATE INDEX IF NOT EXISTS Files_folderId ON Files(folder_id)",
-        "CREATE INDEX IF NOT EXISTS Files_name ON Files(name)"}) {
+  for (const char* const sql : CREATE_INDEXES) {
     Statement(*this, sql).Execute();
   }
+}
+
+bool PhotoDB::HasOwnSchema() const {
+  Statement encoding(*this, "PRAGMA encoding");
+  return encoding.Fetch() && encoding.GetTextView(0) == "UTF-8" &&
+         HasObject(*this, CREATE_FOLDERS) && HasObject(*this, CREATE_FILES) &&
+         std::ranges::all_of(CREATE_INDEXES,
+                             [this](const char* create) { return HasObject(*this, create); });
 }
 
 void PhotoDB::Clear() {
@@ -273,8 +316,6 @@ void PhotoDB::Clear() {
   Close();
   unlink(path.c_str());
   Open(path);
-  // The new connection counts its transactions from the beginning again.
-  cache_ = MergeCache();
 }
 
 void PhotoDB::DumpTable(const std::string& /*table*/) const {}
@@ -294,41 +335,17 @@ std::unique_ptr<Folder> PhotoDB::GetFolder(const std::string& name,
   return query.Fetch() ? ReadFolder(query) : nullptr;
 }
 
-void PhotoDB::MergeCache::Invalidate() {
-  firstOwnFolder = NONE;
-  folderId = NONE;
-  names.reset();
-}
-
-void PhotoDB::MergeCache::EnterFolder(long long id, std::string_view path,
-                                      const std::string& volume) {
-  folderId = id;
-  folderPath = path;
-  folderVolume = volume;
-  folderCost = 0;
-  costAtLastLoad = 0;
-  names.reset();
-}
-
-PhotoDB::MergeCache& PhotoDB::Cache() const {
-  if (cache_.transaction != RunningTransaction()) {
-    cache_ = MergeCache();
-    cache_.transaction = RunningTransaction();
-  }
-  return cache_;
-}
-
-long long PhotoDB::FindFolder(std::string_view path) const {
+std::optional<long long> PhotoDB::FindFolder(std::string_view path) const {
   Statement query(*this, "select * FROM Folders where name = ?");
   query.BindTextView(1, path);
-  return query.Fetch() ? query.GetInt64(0) : NO_FOLDER;
+  return query.Fetch() ? std::optional(query.GetInt64(0)) : std::nullopt;
 }
 
-long long PhotoDB::FindFolder(std::string_view path, const std::string& volume) const {
+std::optional<long long> PhotoDB::FindFolder(std::string_view path, std::string_view volume) const {
   Statement query(*this, "select * FROM Folders where name = ? and volume = ?");
   query.BindTextView(1, path);
   query.BindTextView(2, volume);
-  return query.Fetch() ? query.GetInt64(0) : NO_FOLDER;
+  return query.Fetch() ? std::optional(query.GetInt64(0)) : std::nullopt;
 }
 
 void PhotoDB::AddFolder(std::string volume, db::Folder& folder) const {
@@ -339,7 +356,7 @@ void PhotoDB::AddFolder(std::string volume, db::Folder& folder) const {
       return;
     }
   }
-  const long long parentId = FindFolder(ParentPath(folder.path));
+  const long long parentId = FindFolder(ParentPath(folder.path)).value_or(NO_FOLDER);
   if (parentId == NO_FOLDER) {
     return;
   }
@@ -351,35 +368,30 @@ void PhotoDB::AddFolder(std::string volume, db::Folder& folder) const {
   insert.BindTime(3, folder.lastModifiedDate);
   insert.BindTextView(4, volume);
   insert.Execute();
-
-  MergeCache& cache = Cache();
-  if (cache.transaction != 0 && cache.firstOwnFolder == MergeCache::NONE) {
-    // Ids only grow, so every folder from this id on is inserted by this object.
-    cache.firstOwnFolder = LastInsertId();
-    cache.greatestPath.clear();
-  }
 }
 
 void PhotoDB::DeleteVolumes() const {
-  Cache().Invalidate();
+  JoinedTransaction transaction(*this);
   for (const char* const sql : {"DELETE FROM Folders WHERE folder_id != 1", "DELETE FROM Files ",
-                                "DELETE FROM Statistics", "VACUUM"}) {
+                                "DELETE FROM Statistics"}) {
     Statement(*this, sql).Execute();
+  }
+  transaction.Commit();
+  if (transaction.IsOwn()) {
+    Statement(*this, "VACUUM").Execute();
   }
 }
 
 void PhotoDB::DeleteVolume(const std::string& volume) const {
-  Cache().Invalidate();
-  // There is no transaction, so the order matters. After a crash between two of them no file has
-  // lost its folder, without which it would never be found again, and the volume's next merge
-  // starts from the beginning and restores what was removed.
+  JoinedTransaction transaction(*this);
   for (const char* const sql :
-       {"UPDATE Statistics SET last_updated_time = 0 WHERE volume = ?",
-        "DELETE FROM Files WHERE volume = ?", "DELETE FROM Folders WHERE volume = ?"}) {
+       {"DELETE FROM Folders WHERE volume = ?", "DELETE FROM Files WHERE volume = ?",
+        "UPDATE Statistics SET last_updated_time = 0 WHERE volume = ?"}) {
     Statement change(*this, sql);
     change.BindText(1, volume);
     change.Execute();
   }
+  transaction.Commit();
 }
 
 std::unique_ptr<File> PhotoDB::GetFile(long long fileId) const {
@@ -388,14 +400,8 @@ std::unique_ptr<File> PhotoDB::GetFile(long long fileId) const {
   return query.Fetch() ? ReadFile(query) : nullptr;
 }
 
-bool PhotoDB::IsFilePresent(const std::string& volume, const db::File& file,
-                            std::string_view folderPath) const {
-  MergeCache& cache = Cache();
-  if (cache.names) {
-    return cache.names->contains(file.name);
-  }
-  bool present = false;
-  int cost = 0;
+void PhotoDB::AddFile(const std::string& volume, db::File& file) const {
+  const std::string_view folderPath = FolderPath(file.path);
   {
     Statement query(*this,
                     "SELECT * FROM Files f, Folders o where f.folder_id = o.folder_id and f.name = "
@@ -403,71 +409,14 @@ bool PhotoDB::IsFilePresent(const std::string& volume, const db::File& file,
     query.BindTextView(1, file.name);
     query.BindTextView(2, folderPath);
     query.BindTextView(3, volume);
-    present = query.Fetch();
-    cost = query.TakeCost();
-  }
-  LoadNames(volume, cost);
-  return present;
-}
-
-// SQLite looks for a file by its name alone, through all folders that have one of that name. Where
-// that is expensive, loading all names of a folder is cheaper, unless the folder is large.
-void PhotoDB::LoadNames(const std::string& volume, int cost) const {
-  constexpr int expensiveSearch = 40;
-  constexpr long long leastFolderCost = 4'000;
-  constexpr int costPerName = 8;
-  constexpr std::size_t leastNames = 2'000;
-  constexpr std::size_t mostNames = 200'000;
-  constexpr std::size_t mostBytes = 64 << 20;
-
-  MergeCache& cache = Cache();
-  cache.folderCost += cost;
-  if (cacheUse_ == CacheUse::Bypass || cache.transaction == 0 || cost < expensiveSearch ||
-      cache.folderCost < std::max(leastFolderCost, cache.costAtLastLoad * 2)) {
-    return;
-  }
-  cache.costAtLastLoad = cache.folderCost;
-  const auto limit =
-      std::clamp(static_cast<std::size_t>(cache.folderCost / costPerName), leastNames, mostNames);
-  MergeCache::Names names;
-  std::size_t bytes = 0;
-  Statement query(*this, "SELECT * FROM Files WHERE folder_id = ? ");
-  query.BindInt64(1, cache.folderId);
-  while (query.Fetch()) {
-    bytes += query.GetTextView(2).size();
-    if (names.size() == limit || bytes > mostBytes) {
+    if (query.Fetch()) {
       return;
     }
-    if (query.GetTextView(4) == volume) {
-      names.emplace(query.GetTextView(2));
-    }
   }
-  cache.names = std::move(names);
-}
-
-void PhotoDB::AddFile(const std::string& volume, db::File& file) const {
-  const std::string_view folderPath = FolderPath(file.path);
-  MergeCache& cache = Cache();
-  const bool bypassed = cacheUse_ == CacheUse::Bypass || cache.transaction == 0;
-  if (bypassed || cache.folderId == MergeCache::NONE || cache.folderPath != folderPath ||
-      cache.folderVolume != volume) {
-    const long long found = FindFolder(folderPath, volume);
-    if (found == NO_FOLDER) {
-      return;
-    }
-    cache.EnterFolder(found, folderPath, volume);
-  }
-  const long long folderId = cache.folderId;
-
-  // A folder that this object inserted holds only files that it has added. When all of them are
-  // named as their paths say, a file whose path sorts after every path so far is new.
-  const bool isNamedByPath = std::string_view(file.path).substr(folderPath.size()) == file.name;
-  const bool isNew =
-      folderId >= cache.firstOwnFolder && isNamedByPath && file.path > cache.greatestPath;
-  if ((bypassed || !isNew) && IsFilePresent(volume, file, folderPath)) {
+  const long long folderId = FindFolder(folderPath, volume).value_or(NO_FOLDER);
+  if (folderId == NO_FOLDER) {
     return;
   }
-
   Statement insert(*this, "INSERT INTO Files(folder_id, name, modified_date, volume, created_date) "
                           "VALUES(?, ?, ?, ?, ?)");
   insert.BindInt64(1, folderId);
@@ -477,71 +426,36 @@ void PhotoDB::AddFile(const std::string& volume, db::File& file) const {
   // For readers a photo was created when it was last modified.
   insert.BindTime(5, file.lastModifiedDate);
   insert.Execute();
-
-  if (cache.names) {
-    cache.names->insert(file.name);
-  }
-  if (!isNamedByPath) {
-    cache.Invalidate();
-  } else if (file.path > cache.greatestPath) {
-    cache.greatestPath = file.path;
-  }
 }
 
 void PhotoDB::DeleteFolder(const std::string& volume, db::Folder& folder) const {
-  writeLine({"Deleting ", folder.path});
-  Cache().Invalidate();
-  const long long folderId = FindFolder(folder.path, volume);
-  if (folderId != NO_FOLDER) {
-    writeLine({"Found folder ", std::to_string(folderId), " for ", folder.path});
+  StandardOutput& output = StandardOutput::Current();
+  output.WriteLine({"Deleting ", folder.path});
+  const std::optional<long long> folderId = FindFolder(folder.path, volume);
+  if (folderId) {
+    output.WriteLine({"Found folder ", std::to_string(*folderId), " for ", folder.path});
   }
+  output.Flush();
   for (const char* const sql :
        {"DELETE FROM Files WHERE folder_id = ?", "DELETE FROM Folders WHERE folder_id = ?"}) {
     Statement change(*this, sql);
-    change.BindInt64(1, folderId);
+    change.BindInt64(1, folderId.value_or(NO_FOLDER));
     change.Execute();
   }
 }
 
 void PhotoDB::DeleteFile(const std::string& /*volume*/, db::File& file) const {
-  writeLine({"Deleting ", file.path});
-  Cache().Invalidate();
-  const long long folderId = FindFolder(FolderPath(file.path));
-  if (folderId != NO_FOLDER) {
-    writeLine({"Found parent folder ", std::to_string(folderId), " for ", file.path});
+  StandardOutput& output = StandardOutput::Current();
+  output.WriteLine({"Deleting ", file.path});
+  const std::optional<long long> folderId = FindFolder(FolderPath(file.path));
+  if (folderId) {
+    output.WriteLine({"Found parent folder ", std::to_string(*folderId), " for ", file.path});
   }
-  int cost = 0;
-  {
-    Statement change(*this, "DELETE FROM Files WHERE name = ? and folder_id = ?");
-    change.BindTextView(1, file.name);
-    change.BindInt64(2, folderId);
-    change.Execute();
-    cost = change.TakeCost();
-  }
-  IndexForRemovals(cost);
-}
-
-// SQLite removes a file by searching its whole folder. Once such searches have cost as much as an
-// index by folder and name, the index is made.
-void PhotoDB::IndexForRemovals(int cost) const {
-  constexpr long long negligibleCost = 100'000;
-  constexpr long long indexCostPerFile = 10;
-
-  MergeCache& cache = Cache();
-  cache.removalCost += cost;
-  if (cacheUse_ == CacheUse::Bypass || cache.transaction == 0 || cache.indexed ||
-      cache.removalCost < negligibleCost) {
-    return;
-  }
-  if (cache.indexCost == 0) {
-    Statement query(*this, "SELECT max(file_id) FROM Files");
-    cache.indexCost = query.Fetch() ? query.GetInt64(0) * indexCostPerFile : 0;
-  }
-  if (cache.removalCost >= cache.indexCost) {
-    CreateTransientIndex("CREATE INDEX Files_merge ON Files(folder_id, name)",
-                         "DROP INDEX Files_merge");
-    cache.indexed = true;
-  }
+  output.Flush();
+  Statement change(*this, "DELETE FROM Files WHERE name = ? and folder_id = ?");
+  change.BindTextView(1, file.name);
+  change.BindInt64(2, folderId.value_or(NO_FOLDER));
+  change.Execute();
 }
 
 void PhotoDB::GetFolderFiles(long long folderId, std::vector<File*>& files) const {

@@ -4,12 +4,10 @@
 
 #include "orvadb/DB.h"
 
-#include <limits>
 #include <memory>
 #include <optional>
 #include <string>
 #include <string_view>
-#include <unordered_set>
 #include <vector>
 
 namespace orva::db {
@@ -24,12 +22,21 @@ struct File;
 struct Folder;
 struct Statistics;
 
+/// The id that stands for a missing folder.
+constexpr long long NO_FOLDER = -1;
+
+/// The path of the folder that holds the folder at `path`, with its trailing separator.
+std::string_view ParentPath(std::string_view path);
+
+/// The path of the folder that holds the file at `path`, with its trailing separator.
+std::string_view FolderPath(std::string_view path);
+
 /// The merged photo database: one SQLite file with the folders and photo files of all volumes.
 /// Made on the stack for one piece of work: construct, Init, operate, destroy. One thread.
 ///
-/// Failures of the database layer pass through as std::string. Operations that change several
-/// rows are not atomic, except in a transaction of the caller. The volume of an operation is the
-/// mount point of the volume that the row came from.
+/// Failures of the database layer pass through as std::string. The operations on single rows open
+/// no transaction. The volume of an operation is the mount point of the volume that the row came
+/// from.
 class PhotoDB : public db::DB {
 public:
   /// A location that cannot hold the database.
@@ -42,13 +49,10 @@ public:
     std::string message_;
   };
 
-  /// Bypass is for tests, which compare the results with and without the cache.
-  enum class CacheUse { Normal, Bypass };
-
   /// Makes sure that the directory for the database exists at `location`; opens nothing. Throws
   /// Error when something else is in its place, and util::Exception when a new one cannot be made
   /// accessible to everybody.
-  explicit PhotoDB(const std::string& location, CacheUse cacheUse = CacheUse::Normal);
+  explicit PhotoDB(const std::string& location);
 
   /// Opens the database; creates it when there is none, else loads `status` from it.
   void Init();
@@ -64,6 +68,10 @@ public:
   /// Kept for compatibility of the interface; does nothing.
   void DumpTable(const std::string& table) const;
 
+  /// Whether the tables of folders and files are those that CreateTables makes, with their indexes.
+  /// A database that was found on a volume may have others.
+  bool HasOwnSchema() const;
+
   // Folders and files.
 
   /// The folder with this id, or null.
@@ -71,15 +79,21 @@ public:
   /// The folder with this full path on this volume, or null.
   std::unique_ptr<Folder> GetFolder(const std::string& name, const std::string& volume) const;
 
+  /// The id of the first folder with this full path, under any volume.
+  std::optional<long long> FindFolder(std::string_view path) const;
+  /// The id of the first folder with this full path on this volume.
+  std::optional<long long> FindFolder(std::string_view path, std::string_view volume) const;
+
   /// Adds a catalog's folder below its parent, unless its path is there already, under any
   /// volume. If the parent is missing, the folder is silently skipped, so add parents first.
   void AddFolder(std::string volume, db::Folder& folder) const;
 
-  /// Removes every folder but the root, every file and all statistics, and compacts the file.
+  /// Removes every folder but the root, every file and all statistics, in one transaction, and then
+  /// compacts the file. In a transaction of the caller it takes part in that and does not compact.
   void DeleteVolumes() const;
 
   /// Removes the folders and files of `volume`; its statistics stay, but its next merge starts
-  /// from the beginning.
+  /// from the beginning. In one transaction, or in that of the caller.
   void DeleteVolume(const std::string& volume) const;
 
   /// The file with this id, or null.
@@ -118,63 +132,14 @@ public:
   void UpdateStatus() const;
 
 private:
-  /// What is known about the content in the running transaction, during which no other connection
-  /// writes. Every removal invalidates it.
-  struct MergeCache {
-    static constexpr long long NONE = std::numeric_limits<long long>::max();
-
-    unsigned long long transaction = 0; ///< the one that the cache is valid for
-
-    /// Folders with this id and above were inserted by this object since the cache was last
-    /// invalidated, and hold only files that it has added since.
-    long long firstOwnFolder = NONE;
-    /// The greatest path of those files.
-    std::string greatestPath;
-
-    /// The folder of the last file added.
-    std::string folderPath;
-    std::string folderVolume;
-    long long folderId = NONE;
-
-    /// Cost of the searches for files in that folder, in all and up to the last attempt to load
-    /// its names.
-    long long folderCost = 0;
-    long long costAtLastLoad = 0;
-    /// The names of all its files, once they are loaded.
-    using Names = std::unordered_set<std::string>;
-    std::optional<Names> names;
-
-    /// Cost of the removals of files, and of making an index for them; 0 when not known yet.
-    long long removalCost = 0;
-    long long indexCost = 0;
-    bool indexed = false;
-
-    /// Drops what is known about folders and files; the costs stay.
-    void Invalidate();
-    /// Makes this the folder of the last file added.
-    void EnterFolder(long long id, std::string_view path, const std::string& volume);
-  };
-
   std::string FilePath() const;
   void LoadStatus();
-  long long FindFolder(std::string_view path) const;
-  long long FindFolder(std::string_view path, const std::string& volume) const;
-  bool IsFilePresent(const std::string& volume, const db::File& file,
-                     std::string_view folderPath) const;
-  void LoadNames(const std::string& volume, int cost) const;
-  void IndexForRemovals(int cost) const;
-  MergeCache& Cache() const;
-
   std::string dbLocation; ///< the directory of the database file
 
 public:
   /// The status row in memory; UpdateStatus writes it. DeleteVolumes does not set `mdate`: its
   /// caller does.
   Status status;
-
-private:
-  CacheUse cacheUse_;
-  mutable MergeCache cache_; ///< changes no result, only the statements executed for it
 };
 
 } // namespace orva::dbmerger

@@ -5,6 +5,7 @@
 #include "DefaultState.h"
 #include "MasterVolumeScannedState.h"
 #include "PhotoDB.h"
+#include "StandardOutput.h"
 #include "Util.h"
 #include "VolumeInfoManager.h"
 
@@ -42,7 +43,9 @@ void WriteStateLine(const std::vector<const char*>& texts, State& state) {
   if (type < texts.size()) {
     std::ostringstream address;
     address << static_cast<const void*>(&state);
-    writeLine({texts[type], address.str()});
+    StandardOutput& output = StandardOutput::Current();
+    output.WriteLine({texts[type], address.str()});
+    output.Flush();
   }
 }
 

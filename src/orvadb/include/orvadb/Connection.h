@@ -6,7 +6,6 @@
 #include <string>
 #include <string_view>
 #include <unordered_map>
-#include <vector>
 
 struct sqlite3;
 struct sqlite3_stmt;
@@ -14,6 +13,8 @@ struct sqlite3_stmt;
 namespace orva::db {
 
 class DatabaseVfs;
+class MemoryTable;
+class Rows;
 class WorkLimit;
 
 /// Finalises a compiled statement.
@@ -65,6 +66,10 @@ public:
   /// also when SQLite has rolled back the running transaction.
   CheckedOut CheckOut(const char* sql, const char* file, unsigned int line);
 
+  /// The same for a statement that reads `rows` as the table temp.input. Until it is returned, no
+  /// other one is handed out.
+  CheckedOut CheckOut(const char* sql, Rows& rows, const char* file, unsigned int line);
+
   /// Runs a statement to the next row or its end and returns SQLite's result code. After a failure
   /// the running transaction cannot be committed; if it only reads, its statements fail without
   /// reading any more.
@@ -78,16 +83,10 @@ public:
   /// `busyTimeout` milliseconds for other connections.
   void BeginTransaction(unsigned int busyTimeout, const char* file, unsigned int line);
 
-  /// Number of the running transaction, different for every one; 0 while there is none.
-  unsigned long long RunningTransaction() const noexcept { return transaction_; }
-
   /// Whether the running transaction only reads and a step of it has failed.
   bool HasFailedToRead() const noexcept {
-    return !failedStep_.empty() && transaction_ != 0 && IsReadOnly();
+    return !failedStep_.empty() && inTransaction_ && IsReadOnly();
   }
-
-  /// Has the running transaction execute `sql`, a literal, before it commits.
-  void ExecuteBeforeCommit(const char* sql);
 
   /// Commits the running transaction, which otherwise keeps running.
   void CommitTransaction(const char* file, unsigned int line);
@@ -104,22 +103,22 @@ private:
     }
   };
 
-  Compiled Compile(const char* sql, const char* file, unsigned int line);
+  CheckedOut CheckOut(const char* sql, unsigned flags, const char* file, unsigned int line);
+  Compiled Compile(const char* sql, unsigned flags, const char* file, unsigned int line);
   void Execute(const CheckedOut& statement, const char* file, unsigned int line);
   void EndTransaction() noexcept;
 
   sqlite3* handle_;
   int busyTimeout_;
   std::unique_ptr<WorkLimit> workLimit_;
-  std::function<void()> checkBeforeCommit_; ///< may be empty
+  std::unique_ptr<MemoryTable> memoryTable_; ///< null until it is first used
+  std::function<void()> checkBeforeCommit_;  ///< may be empty
   /// By SQL text; there are few, because values are never part of a text.
   std::unordered_map<std::string, Kept, TextHash, std::equal_to<>> statements_;
   unsigned long long schema_ = 0; ///< counts the possible changes of the schema in memory
 
-  unsigned long long transaction_ = 0;  ///< number of the running transaction, 0 for none
-  unsigned long long transactions_ = 0; ///< begun so far
+  bool inTransaction_ = false;
   std::string failedStep_; ///< message of the transaction's first failure; may be empty
-  std::vector<const char*> beforeCommit_;
 };
 
 } // namespace orva::db

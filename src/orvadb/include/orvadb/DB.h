@@ -52,6 +52,12 @@ public:
   /// once.
   long long BytesRead() const noexcept;
 
+  /// Row id of the last row inserted.
+  long long LastInsertId() const noexcept;
+
+  /// Whether a transaction is open on the connection.
+  bool IsInTransaction() const noexcept;
+
   /// Makes sure that the values in `table` are those that were stored there: refuses generated
   /// columns and, where the connection can write, computed defaults, indexes on expressions or on
   /// part of the rows, and too many indexes. In an untrusted database these may be so expensive
@@ -71,20 +77,6 @@ protected:
   /// the file does not change: SQLite then neither locks it nor checks it for changes. Only
   /// ReadWrite creates.
   void Open(std::string path, Access access, int busyTimeout, bool immutable);
-
-  /// Number of the transaction that runs on the open connection; 0 while there is none. Every
-  /// transaction of the connection has a different number, so that a cache can be kept for one.
-  unsigned long long RunningTransaction() const noexcept;
-
-  /// Executes `create` now, which makes an index in the running transaction, and `drop` before the
-  /// commit, so that no other connection ever sees the index. Both texts are literals. Throws
-  /// std::string with the caller's `file` and `line`.
-  void CreateTransientIndex(const char* create, const char* drop,
-                            const char* file = __builtin_FILE(),
-                            unsigned int line = __builtin_LINE()) const;
-
-  /// Row id of the last row inserted.
-  long long LastInsertId() const noexcept;
 
   /// Has every transaction on the open connection call `check` before it commits. What that throws
   /// keeps the transaction from committing.

@@ -9,6 +9,7 @@
 namespace orva::db {
 
 class DB;
+class Rows;
 
 /// One use of a prepared statement: construct, bind, then Execute or a loop of Step with the
 /// getters after each row, then destroy. Parameters count from 1, columns from 0. On the
@@ -25,6 +26,11 @@ public:
   /// Prepares `sql` on `db`, which stays open, and is not opened again, until the statement is
   /// destroyed. The text must stay valid as long as the statement.
   Statement(const DB& db, const char* sql, const char* file = __builtin_FILE(),
+            unsigned int line = __builtin_LINE());
+  /// The same for a statement that reads `rows` as the table temp.input. It may change ordinary
+  /// tables only, which its user has made sure of. Until it is destroyed, there is no other such
+  /// statement on `db`.
+  Statement(const DB& db, const char* sql, Rows& rows, const char* file = __builtin_FILE(),
             unsigned int line = __builtin_LINE());
   Statement(const Statement&) = delete;
   Statement& operator=(const Statement&) = delete;
@@ -55,13 +61,13 @@ public:
   void BindTextView(int index, std::string_view value, const char* file = __builtin_FILE(),
                     unsigned int line = __builtin_LINE());
 
-  /// Steps of SQLite's virtual machine that the statement has taken since the last call.
-  int TakeCost() const;
-
   /// The low 32 bits of an integer column, with their sign.
   int GetInt(int column) const;
   long long GetInt64(int column) const;
   bool IsNull(int column) const;
+  /// Whether the value is a text, and not a BLOB or a number that a getter converts.
+  bool IsText(int column) const;
+  bool IsInteger(int column) const;
   /// The text with its NUL bytes; NULL gives the empty string.
   std::string GetText(int column) const;
   /// The same without a copy: valid until the next step or getter of the column.

@@ -1,0 +1,207 @@
+#include "stdafx.h"
+
+#include "FolderSet.h"
+
+#include "IdRows.h"
+#include "PhotoDB.h"
+#include "StandardOutput.h"
+
+#include "orvadb/Rows.h"
+#include "orvadb/Statement.h"
+
+#include <algorithm>
+#include <array>
+
+namespace orva::dbmerger {
+
+using db::Statement;
+
+/// The additions of a set as rows. Takes the id of each row after it was inserted: the rows after
+/// it may be its subfolders.
+class FolderSet::AdditionRows final : public db::Rows {
+public:
+  AdditionRows(const PhotoDB& photos, std::string_view volume, std::vector<Addition>& additions)
+      : photos_(photos), volume_(volume), additions_(additions) {}
+
+  bool Next() noexcept override {
+    if (next_ != 0) {
+      additions_[next_ - 1].id = photos_.LastInsertId();
+    }
+    return next_++ != additions_.size();
+  }
+
+  Value Get(Column column) const noexcept override {
+    const Addition& addition = additions_[next_ - 1];
+    switch (column) {
+    case ID:
+      return addition.parent == NONE ? addition.parentId : additions_[addition.parent].id;
+    case NAME:
+      return addition.folder->path;
+    case TIME:
+      return static_cast<long long>(addition.folder->modified);
+    case VOLUME:
+      break;
+    }
+    return volume_;
+  }
+
+private:
+  const PhotoDB& photos_;
+  std::string_view volume_;
+  std::vector<Addition>& additions_;
+  std::size_t next_ = 0;
+};
+
+std::optional<long long>
+FolderSet::Candidates::First(const std::unordered_set<long long>& removed) {
+  while (next_ < ids_.size() && removed.contains(ids_[next_])) {
+    ++next_;
+  }
+  return next_ < ids_.size() ? std::optional(ids_[next_]) : std::nullopt;
+}
+
+FolderSet::FolderSet(const PhotoDB& photos, const std::string& volume,
+                     const std::atomic<bool>& stopRequested)
+    : photos_(photos), volume_(volume), stopRequested_(stopRequested),
+      output_(StandardOutput::Current()), finder_(photos) {}
+
+void FolderSet::Apply(std::span<const MergeItem> folders) {
+  while (!folders.empty() && !stopRequested_) {
+    const auto end = std::ranges::find_if(
+        folders, [&](const MergeItem& folder) { return folder.path != folders.front().path; });
+    const auto count = static_cast<std::size_t>(end - folders.begin());
+    ApplyPath(folders.first(count));
+    folders = folders.subspan(count);
+  }
+  Flush();
+}
+
+void FolderSet::ApplyPath(std::span<const MergeItem> folders) {
+  const std::string_view path = folders.front().path;
+  while (!ancestors_.empty() && !path.starts_with(ancestors_.back().path)) {
+    ancestors_.pop_back();
+  }
+  removed_.clear();
+  if (isStrayRemoved_) {
+    removed_.insert(NO_FOLDER);
+  }
+  any_.Reset(finder_.Find(path));
+  if (std::ranges::any_of(folders, &MergeItem::isDeleted)) {
+    FindOwn(path);
+  }
+  addition_ = NONE;
+  for (const MergeItem& folder : folders) {
+    if (stopRequested_) {
+      return;
+    }
+    if (folder.isDeleted) {
+      Remove(folder);
+    } else {
+      Add(folder);
+    }
+  }
+  ancestors_.push_back({.path = path, .id = any_.First(removed_), .addition = addition_});
+}
+
+void FolderSet::FindOwn(std::string_view path) {
+  std::vector<long long> ids;
+  Statement query(photos_, "select * FROM Folders where name = ? and volume = ?");
+  query.BindTextView(1, path);
+  query.BindTextView(2, volume_);
+  while (query.Fetch()) {
+    ids.push_back(query.GetInt64(0));
+  }
+  own_.Reset(ids);
+}
+
+void FolderSet::Add(const MergeItem& folder) {
+  if (addition_ != NONE || any_.First(removed_)) {
+    return;
+  }
+  const Addition addition = MakeAddition(folder);
+  if (addition.parent == NONE && addition.parentId == NO_FOLDER) {
+    return;
+  }
+  if (!removals_.empty()) {
+    Flush();
+  }
+  addition_ = additions_.size();
+  additions_.push_back(addition);
+}
+
+FolderSet::Addition FolderSet::MakeAddition(const MergeItem& folder) {
+  const std::string_view path = ParentPath(folder.path);
+  const auto parent = std::ranges::lower_bound(
+      ancestors_, path.size(), {}, [](const Ancestor& ancestor) { return ancestor.path.size(); });
+  if (parent == ancestors_.end() || parent->path.size() != path.size()) {
+    return {.folder = &folder, .parentId = FirstAt(path).value_or(NO_FOLDER)};
+  }
+  if (parent->id == NO_FOLDER && isStrayRemoved_) {
+    parent->id = FirstAt(path); // the next one at its path
+  }
+  return {
+      .folder = &folder, .parentId = parent->id.value_or(NO_FOLDER), .parent = parent->addition};
+}
+
+std::optional<long long> FolderSet::FirstAt(std::string_view path) {
+  if (!removals_.empty()) {
+    Flush();
+  }
+  return photos_.FindFolder(path);
+}
+
+void FolderSet::Remove(const MergeItem& folder) {
+  if (!additions_.empty()) {
+    Flush();
+  }
+  output_.WriteLine({"Deleting ", folder.path});
+  const std::optional<long long> id = own_.First(removed_);
+  if (id) {
+    output_.WriteLine({"Found folder ", std::to_string(*id), " for ", folder.path});
+  }
+  // A missing folder is removed as one with an id that stands for it.
+  isStrayRemoved_ = isStrayRemoved_ || id.value_or(NO_FOLDER) == NO_FOLDER;
+  removed_.insert(id.value_or(NO_FOLDER));
+  removals_.push_back(id.value_or(NO_FOLDER));
+}
+
+void FolderSet::Flush() {
+  finder_.Stop();
+  output_.Flush();
+  if (!additions_.empty()) {
+    ExecuteAdditions();
+  }
+  if (!removals_.empty()) {
+    for (const char* const sql :
+         {"DELETE FROM Files WHERE folder_id IN (SELECT id FROM temp.input)",
+          "DELETE FROM Folders WHERE folder_id IN (SELECT id FROM temp.input)"}) {
+      IdRows rows(removals_);
+      Statement(photos_, sql, rows).Execute();
+    }
+    removals_.clear();
+  }
+}
+
+void FolderSet::ExecuteAdditions() {
+  AdditionRows rows(photos_, volume_, additions_);
+  Statement(photos_,
+            "INSERT INTO Folders(parent_folder_id, name, modified_date, volume) SELECT id, name, "
+            "time, volume FROM temp.input",
+            rows)
+      .Execute();
+  for (Ancestor& ancestor : ancestors_) {
+    if (ancestor.addition != NONE) {
+      ancestor.id = additions_[ancestor.addition].id;
+      ancestor.addition = NONE;
+    }
+  }
+  if (addition_ != NONE) {
+    const std::array<long long, 1> added{additions_[addition_].id};
+    any_.Reset(added);
+    own_.Reset(added);
+    addition_ = NONE;
+  }
+  additions_.clear();
+}
+
+} // namespace orva::dbmerger

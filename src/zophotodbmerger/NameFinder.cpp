@@ -1,0 +1,141 @@
+#include "stdafx.h"
+
+#include "NameFinder.h"
+
+#include "PhotoDB.h"
+
+#include "orvadb/Statement.h"
+
+#include <algorithm>
+#include <optional>
+
+namespace orva::dbmerger {
+
+namespace {
+
+using db::Statement;
+
+bool IsText(const Statement& row, int column, std::string_view text) {
+  return row.IsText(column) && row.GetTextView(column) == text;
+}
+
+/// Reads all files of the folders.
+class FolderSearch {
+public:
+  FolderSearch(const PhotoDB& photos, const std::string& volume,
+               std::span<const std::string_view> names, std::span<const long long> folderIds)
+      : photos_(photos), volume_(volume), names_(names), folderIds_(folderIds) {}
+
+  /// Reads one row. Returns whether there may be more.
+  bool Step() {
+    if (!query_) {
+      query_.emplace(photos_, "SELECT file_id, name, volume FROM Files INDEXED BY Files_folderId "
+                              "WHERE folder_id = ?");
+      query_->BindInt64(1, folderIds_.front());
+    }
+    if (!query_->Fetch()) {
+      query_.reset();
+      folderIds_ = folderIds_.subspan(1);
+      return !folderIds_.empty();
+    }
+    if (query_->IsText(1) && FindName(query_->GetTextView(1))) {
+      found_.push_back({.name = static_cast<std::uint32_t>(position_),
+                        .isOwn = IsText(*query_, 2, volume_),
+                        .id = query_->GetInt64(0),
+                        .folderId = folderIds_.front()});
+    }
+    return true;
+  }
+
+  std::vector<FoundFile> TakeFound() { return std::move(found_); }
+
+private:
+  /// Whether `name` is one of the names; its position then. Files are mostly in the order of their
+  /// names, so the next one is tried first.
+  bool FindName(std::string_view name) {
+    if (position_ + 1 < names_.size() && names_[position_ + 1] == name) {
+      ++position_;
+      return true;
+    }
+    const auto found = std::ranges::lower_bound(names_, name);
+    if (found == names_.end() || *found != name) {
+      return false;
+    }
+    position_ = static_cast<std::size_t>(found - names_.begin());
+    return true;
+  }
+
+  const PhotoDB& photos_;
+  const std::string& volume_;
+  std::span<const std::string_view> names_;
+  std::span<const long long> folderIds_; ///< whose files were not all read
+  std::optional<Statement> query_;
+  std::size_t position_ = 0; ///< of the last name found
+  std::vector<FoundFile> found_;
+};
+
+/// Reads all files that have one of the names.
+class NameSearch {
+public:
+  NameSearch(const PhotoDB& photos, const std::string& volume,
+             std::span<const std::string_view> names, std::span<const long long> folderIds)
+      : photos_(photos), volume_(volume), names_(names),
+        folderIds_(folderIds.begin(), folderIds.end()) {
+    std::ranges::sort(folderIds_);
+  }
+
+  /// Reads one row. Returns whether there may be more.
+  bool Step() {
+    if (!query_) {
+      query_.emplace(photos_, "SELECT file_id, folder_id, volume FROM Files INDEXED BY Files_name "
+                              "WHERE name = ?");
+      query_->BindTextView(1, names_[position_]);
+    }
+    if (!query_->Fetch()) {
+      query_.reset();
+      ++position_;
+      return position_ < names_.size();
+    }
+    const long long folderId = query_->GetInt64(1);
+    if (query_->IsInteger(1) && std::ranges::binary_search(folderIds_, folderId)) {
+      found_.push_back({.name = static_cast<std::uint32_t>(position_),
+                        .isOwn = IsText(*query_, 2, volume_),
+                        .id = query_->GetInt64(0),
+                        .folderId = folderId});
+    }
+    return true;
+  }
+
+  std::vector<FoundFile> TakeFound() { return std::move(found_); }
+
+private:
+  const PhotoDB& photos_;
+  const std::string& volume_;
+  std::span<const std::string_view> names_;
+  std::vector<long long> folderIds_; ///< sorted
+  std::optional<Statement> query_;
+  std::size_t position_ = 0; ///< of the name that is searched for
+  std::vector<FoundFile> found_;
+};
+
+} // namespace
+
+std::vector<FoundFile> FindNames(const PhotoDB& photos, const std::string& volume,
+                                 std::span<const std::string_view> names,
+                                 std::span<const long long> folderIds) {
+  if (names.empty() || folderIds.empty()) {
+    return {};
+  }
+  FolderSearch throughFolders(photos, volume, names, folderIds);
+  NameSearch throughNames(photos, volume, names, folderIds);
+  while (true) {
+    if (!throughFolders.Step()) {
+      return throughFolders.TakeFound();
+    }
+    if (!throughNames.Step()) {
+      return throughNames.TakeFound();
+    }
+  }
+}
+
+} // namespace orva::dbmerger
