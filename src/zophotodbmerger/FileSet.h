@@ -80,6 +80,7 @@ private:
   void TakeFound(Entry& name, long long folderId);
   void TakeFromStrayHome(std::string_view name);
   void Flush();
+  void DeleteFiles();
 
   const PhotoDB& photos_;
   const std::string& volume_;
@@ -87,21 +88,23 @@ private:
   StandardOutput& output_;
 
   std::span<const MergeItem> files_;
-  std::vector<Entry> entries_; ///< one for each file
+  std::pmr::vector<Entry> entries_{LargeBlocks()}; ///< one for each file
   std::vector<Group> groups_;
   std::vector<long long> folderIds_;
-  std::vector<Index> byGroup_; ///< the files, group by group, in each by name
-  std::vector<Found> found_;
+  std::pmr::vector<Index> byGroup_{LargeBlocks()}; ///< the files, group by group, in each by name
+  std::pmr::vector<Found> found_{LargeBlocks()};
 
   /// Removals without a folder: as from a folder with an id that stands for it.
   Index strays_ = NONE;
   /// The group whose path has a folder with that id, too.
   Index strayHome_ = NONE;
 
-  std::vector<Index> additions_;    ///< the current set, if it is one of additions
-  std::vector<long long> removals_; ///< the current set, if it is one of removals
-  std::vector<long long> addedIds_; ///< of each entry; empty if the list has no removals
-  std::vector<long long> taken_;    ///< ids of the files that an entry removes
+  std::pmr::vector<Index> additions_{LargeBlocks()}; ///< the current set, if it is one of additions
+  std::pmr::vector<long long> removals_{
+      LargeBlocks()}; ///< the current set, if it is one of removals
+  std::pmr::vector<long long> addedIds_{
+      LargeBlocks()};            ///< of each entry; empty if the list has no removals
+  std::vector<long long> taken_; ///< ids of the files that an entry removes
 };
 
 } // namespace orva::dbmerger

@@ -6,27 +6,26 @@
 
 namespace orva::dbmerger {
 
-void MergeList::Add(std::string_view base, MergeItem item) {
-  item.path = Store(base, item.path);
-  item.name = item.path.ends_with(item.name) ? item.path.substr(item.path.size() - item.name.size())
-                                             : Store(item.name, {});
-  isSorted_ = isSorted_ && (items_.empty() || items_.back().path <= item.path);
-  items_.push_back(item);
+MergeItem& MergeList::Add(std::string_view base, std::string_view path, std::string_view name) {
+  const bool isNameInPath = path.ends_with(name);
+  const std::size_t pathSize = base.size() + path.size();
+  char* const text =
+      static_cast<char*>(pool_->allocate(pathSize + (isNameInPath ? 0 : name.size()), 1));
+  char* end = std::ranges::copy(base, text).out;
+  end = std::ranges::copy(path, end).out;
+  if (!isNameInPath) {
+    std::ranges::copy(name, end);
+  }
+  const MergeItem item(text, pathSize, name.size(), isNameInPath);
+  isSorted_ = isSorted_ && (items_.empty() || items_.back().Path() <= item.Path());
+  return items_.emplace_back(item);
 }
 
 void MergeList::Sort() {
   if (!isSorted_) {
-    std::ranges::sort(items_, {}, &MergeItem::path);
+    std::ranges::sort(items_, {}, &MergeItem::Path);
     isSorted_ = true;
   }
-}
-
-std::string_view MergeList::Store(std::string_view first, std::string_view second) {
-  const std::size_t size = first.size() + second.size();
-  char* const text = static_cast<char*>(pool_->allocate(size, 1));
-  std::ranges::copy(first, text);
-  std::ranges::copy(second, text + first.size());
-  return {text, size};
 }
 
 } // namespace orva::dbmerger

@@ -96,8 +96,9 @@ public:
       ++position_;
       return position_ < names_.size();
     }
+    const bool isId = query_->IsInteger(1);
     const long long folderId = query_->GetInt64(1);
-    if (query_->IsInteger(1) && std::ranges::binary_search(folderIds_, folderId)) {
+    if (isId && std::ranges::binary_search(folderIds_, folderId)) {
       found_.push_back({.name = static_cast<std::uint32_t>(position_),
                         .isOwn = IsText(*query_, 2, volume_),
                         .id = query_->GetInt64(0),
@@ -128,11 +129,12 @@ std::vector<FoundFile> FindNames(const PhotoDB& photos, const std::string& volum
   }
   FolderSearch throughFolders(photos, volume, names, folderIds);
   NameSearch throughNames(photos, volume, names, folderIds);
-  while (true) {
+  // The search by names needs a step for each of them, so the other one may take as many first.
+  for (std::size_t step = 0; true; ++step) {
     if (!throughFolders.Step()) {
       return throughFolders.TakeFound();
     }
-    if (!throughNames.Step()) {
+    if (step >= names.size() && !throughNames.Step()) {
       return throughNames.TakeFound();
     }
   }

@@ -206,11 +206,11 @@ void HandOver(std::unique_ptr<Record> record, std::vector<Record*>& records) {
 } // namespace
 
 std::string_view ParentPath(std::string_view path) {
-  return path.substr(0, path.rfind(NATIVE_PATH_SEPARATOR, path.size() - 2) + 1);
+  return path.substr(0, path.rfind('/', path.size() - 2) + 1);
 }
 
 std::string_view FolderPath(std::string_view path) {
-  return path.substr(0, path.rfind(NATIVE_PATH_SEPARATOR) + 1);
+  return path.substr(0, path.rfind('/') + 1);
 }
 
 PhotoDB::PhotoDB(const std::string& location)
