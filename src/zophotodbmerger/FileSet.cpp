@@ -54,6 +54,10 @@ FileSet::FileSet(const PhotoDB& photos, const std::string& volume,
     : photos_(photos), volume_(volume), stopRequested_(stopRequested),
       output_(StandardOutput::Current()) {}
 
+FileSet::~FileSet() {
+  output_.Flush();
+}
+
 std::time_t FileSet::Apply(std::span<const MergeItem> files, std::time_t since) {
   if (files.empty() || stopRequested_) {
     return since;

@@ -27,6 +27,11 @@ class FileSet {
 public:
   FileSet(const PhotoDB& photos, const std::string& volume, const std::atomic<bool>& stopRequested);
 
+  FileSet(const FileSet&) = delete;
+  FileSet& operator=(const FileSet&) = delete;
+  /// Writes the lines that are left after a failure.
+  ~FileSet();
+
   /// Applies the files, in the order of their paths. Ends early when a stop is requested. Returns
   /// the time of the newest one applied, or `since` if none is newer.
   std::time_t Apply(std::span<const MergeItem> files, std::time_t since);

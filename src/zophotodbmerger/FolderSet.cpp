@@ -62,6 +62,10 @@ FolderSet::FolderSet(const PhotoDB& photos, const std::string& volume,
     : photos_(photos), volume_(volume), stopRequested_(stopRequested),
       output_(StandardOutput::Current()), finder_(photos) {}
 
+FolderSet::~FolderSet() {
+  output_.Flush();
+}
+
 void FolderSet::Apply(std::span<const MergeItem> folders) {
   while (!folders.empty() && !stopRequested_) {
     const auto end = std::ranges::find_if(
@@ -195,6 +199,7 @@ void FolderSet::ExecuteAdditions() {
   }
   if (addition_ != NONE) {
     const std::array<long long, 1> added{additions_[addition_].id};
+    removed_.erase(added.front()); // a database may lack its sequence, and use an id again
     any_.Reset(added);
     own_.Reset(added);
     addition_ = NONE;

@@ -175,6 +175,13 @@ bool HasObject(const PhotoDB& photos, std::string create) {
   return query.Fetch();
 }
 
+/// Whether new folders and files get positive ids.
+bool HasOwnSequences(const PhotoDB& photos) {
+  Statement query(photos, "SELECT 1 FROM main.sqlite_sequence WHERE name IN ('Folders', 'Files') "
+                          "AND (typeof(seq) != 'integer' OR seq < 0)");
+  return !query.Fetch();
+}
+
 /// The caller's transaction, or else one of its own.
 class JoinedTransaction {
 public:
@@ -304,7 +311,7 @@ void PhotoDB::CreateIndices() {
 
 bool PhotoDB::HasOwnSchema() const {
   Statement encoding(*this, "PRAGMA encoding");
-  return encoding.Fetch() && encoding.GetTextView(0) == "UTF-8" &&
+  return encoding.Fetch() && encoding.GetTextView(0) == "UTF-8" && HasOwnSequences(*this) &&
          HasObject(*this, CREATE_FOLDERS) && HasObject(*this, CREATE_FILES) &&
          std::ranges::all_of(CREATE_INDEXES,
                              [this](const char* create) { return HasObject(*this, create); });

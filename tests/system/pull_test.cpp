@@ -15,6 +15,7 @@
 namespace orva::test {
 namespace {
 
+using ::testing::AnyOf;
 using ::testing::Each;
 using ::testing::ElementsAre;
 using ::testing::EndsWith;
