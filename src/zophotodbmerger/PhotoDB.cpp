@@ -311,10 +311,11 @@ void PhotoDB::CreateIndices() {
 
 bool PhotoDB::HasOwnSchema() const {
   Statement encoding(*this, "PRAGMA encoding");
-  return encoding.Fetch() && encoding.GetTextView(0) == "UTF-8" && HasOwnSequences(*this) &&
+  return encoding.Fetch() && encoding.GetTextView(0) == "UTF-8" &&
          HasObject(*this, CREATE_FOLDERS) && HasObject(*this, CREATE_FILES) &&
          std::ranges::all_of(CREATE_INDEXES,
-                             [this](const char* create) { return HasObject(*this, create); });
+                             [this](const char* create) { return HasObject(*this, create); }) &&
+         HasOwnSequences(*this);
 }
 
 void PhotoDB::Clear() {
