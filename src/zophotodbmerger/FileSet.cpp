@@ -67,15 +67,19 @@ std::time_t FileSet::Apply(std::span<const MergeItem> files, std::time_t since) 
   }
   files_ = files;
   entries_.assign(files.size(), {});
+  additions_.reserve(files.size());
   if (std::ranges::any_of(files, &MergeItem::isDeleted)) {
     addedIds_.assign(files.size(), 0);
   }
   MakeGroups();
   FindFolders();
   SortByGroup();
-  for (const Group& group : groups_) {
-    NameFiles(group);
-    FindFiles(group);
+  {
+    NameFinder finder(photos_, volume_);
+    for (const Group& group : groups_) {
+      NameFiles(group);
+      FindFiles(group, finder);
+    }
   }
 
   std::time_t newest = since;
@@ -204,7 +208,7 @@ void FileSet::NameFiles(const Group& group) {
   }
 }
 
-void FileSet::FindFiles(const Group& group) {
+void FileSet::FindFiles(const Group& group, NameFinder& finder) {
   std::vector<std::string_view> names;
   std::vector<Index> files;
   for (Index i = group.begin; i < group.end; ++i) {
@@ -215,7 +219,7 @@ void FileSet::FindFiles(const Group& group) {
   }
   const std::span<const long long> folderIds(folderIds_.begin() + group.firstFolder,
                                              group.folderCount);
-  for (const FoundFile& found : FindNames(photos_, volume_, names, folderIds)) {
+  for (const FoundFile& found : finder.Find(names, folderIds)) {
     Entry& name = entries_[files[found.name]];
     found_.push_back(
         {.id = found.id, .folderId = found.folderId, .isOwn = found.isOwn, .next = name.found});

@@ -14,6 +14,7 @@
 namespace orva::dbmerger {
 
 class FolderFinder;
+class NameFinder;
 class PhotoDB;
 class StandardOutput;
 
@@ -77,7 +78,7 @@ private:
   Index StrayGroup();
   void SortByGroup();
   void NameFiles(const Group& group);
-  void FindFiles(const Group& group);
+  void FindFiles(const Group& group, NameFinder& finder);
 
   void WriteLines(Index file) const;
   void Add(Index file);

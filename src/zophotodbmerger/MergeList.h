@@ -52,7 +52,8 @@ public:
   /// until the next call.
   MergeItem& Add(std::string_view base, std::string_view path, std::string_view name);
 
-  /// Brings the items into their order. Equal paths have no particular order.
+  /// Brings the items into their order, those with equal paths in the order in which they were
+  /// added. Fast for rows that came folder by folder.
   void Sort();
 
   std::size_t Size() const noexcept { return items_.size(); }
@@ -62,7 +63,7 @@ private:
   std::unique_ptr<std::pmr::monotonic_buffer_resource> pool_ =
       std::make_unique<std::pmr::monotonic_buffer_resource>(LargeBlocks());
   std::pmr::vector<MergeItem> items_{LargeBlocks()};
-  bool isSorted_ = true;
+  std::vector<std::size_t> runs_; ///< where items begin that are in order, but for the first ones
 };
 
 } // namespace orva::dbmerger
