@@ -1,0 +1,303 @@
+// SetMerge gives the same rows with the same ids, and the same lines, as the operations of PhotoDB
+// on single rows.
+
+#include "SetMerge.h"
+
+#include "CapturedOutput.h"
+#include "PhotoDB.h"
+#include "SetMergeCase.h"
+
+#include "orvadb/Statement.h"
+#include "orvadb/Transaction.h"
+
+#include "support/TestScale.h"
+
+#include <gtest/gtest.h>
+#include <sqlite3.h>
+
+#include <atomic>
+#include <filesystem>
+#include <string>
+#include <vector>
+
+namespace orva::test {
+namespace {
+
+using dbmerger::MergeList;
+using dbmerger::PhotoDB;
+using dbmerger::SetMerge;
+
+TEST(SetMergeTest, RandomMergesGiveTheSameRowsAndLines) {
+  const unsigned count = TestScale(4'000U, 60'000U);
+  for (unsigned seed = 1; seed <= count; ++seed) {
+    const MergeCase merge = MakeMergeCase(seed);
+    if (!CompareMerges(merge).empty()) {
+      const MergeCase reduced = Reduce(merge);
+      FAIL() << "seed " << seed << ", reduced:\n" << Describe(reduced) << CompareMerges(reduced);
+    }
+  }
+}
+
+TEST(SetMergeTest, StoppedMergesHaveAppliedTheFirstRows) {
+  int stoppedInTheMiddle = 0;
+  const unsigned count = TestScale(60U, 2'000U);
+  for (unsigned seed = 1; seed <= count; ++seed) {
+    const MergeCase merge = MakeMergeCase(seed);
+    try {
+      const std::string difference = CompareStoppedMerges(merge, stoppedInTheMiddle);
+      ASSERT_EQ("", difference) << "seed " << seed << "\n" << Describe(merge);
+    } catch (const std::string& /*failure*/) {
+      // The database refuses a row.
+    }
+  }
+  EXPECT_LT(10, stoppedInTheMiddle);
+}
+
+/// What SQLite has done for a merge.
+struct Cost {
+  int statements = 0;
+  long long steps = 0; ///< of SQLite's virtual machine
+};
+
+/// A new database whose statements are counted.
+class CountedPhotoDB : public PhotoDB {
+public:
+  CountedPhotoDB() : PhotoDB(MakeLocation()) {
+    Init();
+    sqlite3_trace_v2(Handle(), SQLITE_TRACE_PROFILE, &Count, &cost_);
+  }
+
+  /// Merges in a transaction. Returns what that has cost.
+  Cost Merge(const CatalogMerge& merge) {
+    const std::atomic<bool> stopRequested{false};
+    const MergeList folders = MakeMergeList(merge.folders);
+    const MergeList files = MakeMergeList(merge.files);
+    const CapturedOutput output;
+    db::Transaction transaction(*this, 1'000);
+    cost_ = {};
+    {
+      const SetMerge sets(*this, merge.volume, stopRequested);
+      sets.ApplyFolders(folders);
+      sets.ApplyFiles(files, merge.since);
+    }
+    const Cost cost = cost_;
+    transaction.Commit();
+    return cost;
+  }
+
+  void Run(const std::string& sql) const { db::Statement(*this, sql.c_str()).Execute(); }
+
+  long long CountFiles() const {
+    db::Statement query(*this, "SELECT count(*) FROM Files");
+    query.Fetch();
+    return query.GetInt64(0);
+  }
+
+private:
+  static const char* MakeLocation() {
+    const char* const location = "/tmp/counted";
+    std::filesystem::remove_all(location);
+    std::filesystem::create_directories(location);
+    return location;
+  }
+
+  static int Count(unsigned /*event*/, void* cost, void* statement, void* /*nanoseconds*/) {
+    ++static_cast<Cost*>(cost)->statements;
+    static_cast<Cost*>(cost)->steps +=
+        sqlite3_stmt_status(static_cast<sqlite3_stmt*>(statement), SQLITE_STMTSTATUS_VM_STEP, 1);
+    return 0;
+  }
+
+  Cost cost_;
+};
+
+const std::string VOLUME = "/shares/A/";
+
+std::string Numbered(const std::string& text, int number) {
+  return text + std::to_string(10'000 + number);
+}
+
+CatalogRow File(const std::string& folder, const std::string& name, bool isDeleted = false) {
+  return {.path = folder + name, .name = name, .isDeleted = isDeleted};
+}
+
+/// Folders that all have files of the same names, as cameras give them.
+CatalogMerge Camera(int folders, int files, bool areDeleted = false) {
+  CatalogMerge merge{.volume = VOLUME, .folders = {{.path = VOLUME}}};
+  for (int folder = 0; folder < folders; ++folder) {
+    const std::string path = VOLUME + Numbered("", folder) + "/";
+    merge.folders.push_back({.path = path});
+    for (int file = 0; file < files; ++file) {
+      merge.files.push_back(File(path, Numbered("IMG_", file), areDeleted));
+    }
+  }
+  return merge;
+}
+
+CatalogMerge Flat(int begin, int end, int step = 1, bool areDeleted = false) {
+  CatalogMerge merge{.volume = VOLUME, .folders = {{.path = VOLUME}}};
+  for (int file = begin; file < end; file += step) {
+    merge.files.push_back(File(VOLUME, Numbered("p", file), areDeleted));
+  }
+  return merge;
+}
+
+constexpr int SMALL = 250;
+constexpr int LARGE = 4 * SMALL;
+
+/// Expects that four times the rows cost at most little more than four times as much.
+template <typename Measure>
+void ExpectProportionalCost(Measure measure) {
+  const Cost small = measure(SMALL);
+  const Cost large = measure(LARGE);
+  EXPECT_LT(0, small.steps);
+  EXPECT_LE(large.steps, small.steps * 5);
+  EXPECT_LE(large.statements, small.statements * 5);
+}
+
+TEST(SetMergeCostTest, FilesOfAFolderAreAddedByAFixedNumberOfStatements) {
+  const auto measure = [](int count) {
+    CountedPhotoDB photos;
+    photos.Merge(Flat(0, 5));
+    const Cost cost = photos.Merge(Flat(5, count));
+    EXPECT_EQ(count, photos.CountFiles());
+    return cost;
+  };
+  ExpectProportionalCost(measure);
+  EXPECT_EQ(measure(SMALL).statements, measure(LARGE).statements);
+}
+
+TEST(SetMergeCostTest, RemovedFilesOfAFolderCostInProportion) {
+  ExpectProportionalCost([](int count) {
+    CountedPhotoDB photos;
+    photos.Merge(Flat(0, 2 * count));
+    const Cost cost = photos.Merge(Flat(0, 2 * count, 2, true));
+    EXPECT_EQ(count, photos.CountFiles());
+    return cost;
+  });
+}
+
+TEST(SetMergeCostTest, FoldersAreAddedByAFixedNumberOfStatements) {
+  const auto measure = [](int count) {
+    CountedPhotoDB photos;
+    return photos.Merge(Camera(count, 0));
+  };
+  ExpectProportionalCost(measure);
+  EXPECT_EQ(measure(SMALL).statements, measure(LARGE).statements);
+}
+
+TEST(SetMergeCostTest, FewFilesOfALargeFolderDoNotCostMoreThanOfASmallOne) {
+  for (const bool areDeleted : {false, true}) {
+    const auto measure = [&](int count) {
+      CountedPhotoDB photos;
+      photos.Merge(Flat(0, count));
+      return photos.Merge(Flat(7, 10, 1, areDeleted)).steps;
+    };
+    EXPECT_LE(measure(LARGE), measure(SMALL) * 11 / 10);
+  }
+}
+
+TEST(SetMergeCostTest, FewFilesWithCommonNamesDoNotCostMoreWhereThereAreMoreFolders) {
+  for (const bool areDeleted : {false, true}) {
+    const auto measure = [&](int count) {
+      CountedPhotoDB photos;
+      photos.Merge(Camera(count, 3));
+      CatalogMerge merge{.volume = VOLUME};
+      for (int file = 0; file < 3; ++file) {
+        merge.files.push_back(
+            File(VOLUME + Numbered("", 5) + "/", Numbered("IMG_", file), areDeleted));
+      }
+      const Cost cost = photos.Merge(merge);
+      EXPECT_EQ(3 * count - (areDeleted ? 3 : 0), photos.CountFiles());
+      return cost.steps;
+    };
+    EXPECT_LE(measure(LARGE), measure(SMALL) * 11 / 10);
+  }
+}
+
+TEST(SetMergeCostTest, NameThatAllFoldersHaveCostsInProportion) {
+  for (const bool areDeleted : {false, true}) {
+    ExpectProportionalCost([&](int count) {
+      CountedPhotoDB photos;
+      photos.Merge(Camera(count, 1));
+      const Cost cost = photos.Merge(Camera(count, 1, areDeleted));
+      EXPECT_EQ(areDeleted ? 0 : count, photos.CountFiles());
+      return cost;
+    });
+  }
+}
+
+TEST(SetMergeCostTest, NamesThatAllFoldersShareCostInProportion) {
+  for (const bool areDeleted : {false, true}) {
+    ExpectProportionalCost([&](int count) {
+      CountedPhotoDB photos;
+      photos.Merge(Camera(count / 10, 40));
+      const Cost cost = photos.Merge(Camera(count / 10, 60, areDeleted));
+      EXPECT_EQ(areDeleted ? 0 : count / 10 * 60, photos.CountFiles());
+      return cost;
+    });
+  }
+}
+
+TEST(SetMergeCostTest, OtherVolumesWithTheSameNamesCostInProportion) {
+  ExpectProportionalCost([](int count) {
+    CountedPhotoDB photos;
+    photos.Merge(Camera(count, 1));
+    CatalogMerge merge{.volume = "/shares/B/", .folders = {{.path = "/shares/B/"}}};
+    for (int file = 0; file < count; ++file) {
+      merge.files.push_back(File("/shares/B/", Numbered("IMG_", file % 2 == 0 ? 0 : file)));
+    }
+    return photos.Merge(merge);
+  });
+}
+
+TEST(SetMergeCostTest, PathThatIsAddedAndRemovedInTurnsCostsInProportion) {
+  ExpectProportionalCost([](int count) {
+    CountedPhotoDB photos;
+    photos.Merge(Flat(0, count));
+    CatalogMerge merge{.volume = VOLUME};
+    for (int turn = 0; turn < count; ++turn) {
+      merge.files.push_back(File(VOLUME, "p", turn % 2 != 0));
+      merge.folders.push_back({.path = VOLUME + "f/", .isDeleted = turn % 2 != 0});
+    }
+    return photos.Merge(merge);
+  });
+}
+
+TEST(SetMergeCostTest, RemovalsOfOneFolderCostInProportion) {
+  ExpectProportionalCost([](int count) {
+    CountedPhotoDB photos;
+    photos.Merge(Flat(0, count));
+    CatalogMerge merge{.volume = VOLUME};
+    for (int turn = 0; turn < count; ++turn) {
+      merge.folders.push_back({.path = VOLUME, .isDeleted = true});
+    }
+    const Cost cost = photos.Merge(merge);
+    EXPECT_EQ(0, photos.CountFiles());
+    return cost;
+  });
+}
+
+TEST(SetMergeCostTest, ManyRowsOfOneFolderCostInProportion) {
+  for (const bool areDeleted : {false, true}) {
+    ExpectProportionalCost([&](int count) {
+      CountedPhotoDB photos;
+      photos.Merge(Flat(0, count));
+      photos.Run(
+          "WITH RECURSIVE n(i) AS (SELECT 1 UNION ALL SELECT i + 1 FROM n WHERE i < " +
+          std::to_string(count) +
+          ") INSERT INTO Folders(parent_folder_id, name, modified_date, volume) SELECT 1, '" +
+          VOLUME + "', 0, iif(i % 2, '" + VOLUME + "', '/shares/B/') FROM n");
+      photos.Run("INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT "
+                 "folder_id, 'p10001', 0, volume, 0 FROM Folders");
+      CatalogMerge merge = Flat(0, count, 1, areDeleted);
+      for (int turn = 0; turn < count; ++turn) {
+        merge.folders.push_back({.path = VOLUME, .isDeleted = areDeleted});
+      }
+      return photos.Merge(merge);
+    });
+  }
+}
+
+} // namespace
+} // namespace orva::test
