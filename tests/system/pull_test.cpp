@@ -169,8 +169,8 @@ protected:
   }
 
 private:
-  /// A merge into a volume that is gone mostly fails: the next program that opens the database rolls
-  /// it back. At the end it may still commit, because it has the files open.
+  /// A merge into a volume that is gone mostly fails: the next program that opens the database
+  /// rolls it back. At the end it may still commit, because it has the files open.
   void ExpectAllOrNothing(const Lines& errors, bool pulled) {
     const MergedDatabase merged(Kept::PATH);
     EXPECT_THAT(merged.Faults(), IsEmpty());
