@@ -69,10 +69,6 @@ long long Statement::GetInt64(int column) const {
   return sqlite3_column_int64(statement_.get(), column);
 }
 
-bool Statement::IsNull(int column) const {
-  return sqlite3_column_type(statement_.get(), column) == SQLITE_NULL;
-}
-
 bool Statement::IsText(int column) const {
   return sqlite3_column_type(statement_.get(), column) == SQLITE_TEXT;
 }

@@ -64,7 +64,6 @@ public:
   /// The low 32 bits of an integer column, with their sign.
   int GetInt(int column) const;
   long long GetInt64(int column) const;
-  bool IsNull(int column) const;
   /// Whether the value is a text, and not a BLOB or a number that a getter converts.
   bool IsText(int column) const;
   bool IsInteger(int column) const;
