@@ -7,8 +7,11 @@
 
 #include "orvadb/File.h"
 #include "orvadb/Folder.h"
+#include "orvadb/Statement.h"
 #include "orvadb/Transaction.h"
 #include "orvadb/VolumeDB.h"
+
+#include "orvautil/FormatString.h"
 
 namespace orva::bench {
 
@@ -17,13 +20,19 @@ namespace {
 constexpr int PHOTO = 3;
 constexpr int FOLDER = 4;
 
+std::time_t NewestStampOf(const db::DB& catalog) {
+  return catalog::SelectNumber(catalog, "SELECT max(lastUpdatedDate) FROM Transcodings");
+}
+
 /// Calls `change` with the catalog and the stamp of the change.
 template <typename Change>
 void ChangeCatalog(const std::string& mountPoint, Change change) {
   const auto catalog = catalog::OpenCatalog(mountPoint);
   {
     db::Transaction transaction(*catalog, catalog::BUSY_TIMEOUT);
-    change(*catalog, catalog::NextStamp(*catalog, std::time(nullptr)));
+    // The generator and the changes here give no file or folder a later stamp than its
+    // transcodings, whose stamps have an index.
+    change(*catalog, NewestStampOf(*catalog) + 1);
     transaction.Commit();
   }
   catalog::Checkpoint(*catalog);
@@ -43,36 +52,72 @@ db::Folder AddFolder(const db::DB& catalog, std::time_t stamp) {
   return folder;
 }
 
-void AddPhoto(const db::DB& catalog, const db::Folder& folder, long long id) {
+void AddPhoto(const db::DB& catalog, const db::Folder& folder, const std::string& name,
+              std::time_t stamp) {
   db::File file;
-  file.id = id;
+  file.id = catalog::SelectNumber(catalog, "SELECT max(id) + 1 FROM Files");
   file.folderId = folder.id;
-  file.name = "New_" + std::to_string(id) + ".jpg";
+  file.name = name;
   file.path = folder.path + file.name;
   file.category = PHOTO;
-  file.lastModifiedDate = folder.lastModifiedDate;
+  file.lastModifiedDate = stamp;
   file.status = catalog::RENDERED;
-  file.lastUpdatedDate = folder.lastUpdatedDate;
+  file.lastUpdatedDate = stamp;
   file.ext = "jpg";
-  file.size = id;
+  file.size = file.id;
   catalog::StoreFile(catalog, file);
-  catalog::StoreTranscoding(catalog, file.id, catalog::FINISHED, folder.lastUpdatedDate);
+  catalog::StoreTranscoding(catalog, file.id, catalog::FINISHED, stamp);
+}
+
+/// A name that no file of the catalog has.
+std::string NewName(const db::DB& catalog) {
+  return "New_" + std::to_string(catalog::SelectNumber(catalog, "SELECT max(id) + 1 FROM Files")) +
+         ".jpg";
 }
 
 } // namespace
 
 std::time_t NewestStamp(const std::string& mountPoint) {
-  const db::VolumeDB catalog(mountPoint, false);
-  return catalog::SelectNumber(catalog, "SELECT max(lastUpdatedDate) FROM Transcodings");
+  return NewestStampOf(db::VolumeDB(mountPoint, false));
 }
 
-void AppendBatch(const std::string& mountPoint, int files) {
-  ChangeCatalog(mountPoint, [files](const db::DB& catalog, std::time_t stamp) {
+void AppendBatch(const std::string& mountPoint, int files, catalog::Names names) {
+  ChangeCatalog(mountPoint, [&](const db::DB& catalog, std::time_t stamp) {
     const db::Folder folder = AddFolder(catalog, stamp);
-    const long long first = catalog::SelectNumber(catalog, "SELECT max(id) + 1 FROM Files");
-    for (int i = 0; i < files; ++i) {
-      AddPhoto(catalog, folder, first + i);
+    for (int i = 1; i <= files; ++i) {
+      AddPhoto(catalog, folder,
+               names == catalog::Names::Camera ? util::FormatString("IMG_%04d.JPG", i)
+                                               : NewName(catalog),
+               stamp);
     }
+  });
+}
+
+void AppendFile(const std::string& mountPoint) {
+  ChangeCatalog(mountPoint, [](const db::DB& catalog, std::time_t stamp) {
+    db::Statement query(catalog, "SELECT id, path FROM Folders ORDER BY id LIMIT 1");
+    if (!query.Fetch()) {
+      throw std::string("the catalog has no folder");
+    }
+    db::Folder folder;
+    folder.id = query.GetInt64(0);
+    folder.path = query.GetText(1);
+    AddPhoto(catalog, folder, NewName(catalog), stamp);
+  });
+}
+
+void AddCovers(const std::string& mountPoint) {
+  ChangeCatalog(mountPoint, [](const db::DB& catalog, std::time_t stamp) {
+    catalog::Execute(catalog,
+                     "INSERT INTO Files(folderId, path, name, category, lastModifiedDate, "
+                     "isBackup, isHidden, isSystem, isDeleted, status, lastUpdatedDate, ext, size) "
+                     "SELECT id, path || 'cover.jpg', 'cover.jpg', ?, lastModifiedDate, "
+                     "0, 0, 0, 0, ?, ?, 'jpg', 1000 FROM Folders",
+                     PHOTO, static_cast<int>(catalog::RENDERED), stamp);
+    catalog::Execute(catalog,
+                     "INSERT INTO Transcodings(sourceId, profile, status, lastUpdatedDate) "
+                     "SELECT id, ?, ?, lastUpdatedDate FROM Files WHERE name = 'cover.jpg'",
+                     std::string(catalog::PROFILE), static_cast<int>(catalog::FINISHED));
   });
 }
 
@@ -81,14 +126,6 @@ void DeleteEveryFile(const std::string& mountPoint) {
     catalog::Execute(catalog, "UPDATE Files SET isDeleted = 1, status = 1, lastUpdatedDate = ?",
                      stamp);
     catalog::Execute(catalog, "UPDATE Transcodings SET status = 0, lastUpdatedDate = ?", stamp);
-  });
-}
-
-void ReviveEveryFile(const std::string& mountPoint) {
-  ChangeCatalog(mountPoint, [](const db::DB& catalog, std::time_t stamp) {
-    catalog::Execute(catalog, "UPDATE Files SET isDeleted = 0, status = 3, lastUpdatedDate = ?",
-                     stamp);
-    catalog::Execute(catalog, "UPDATE Transcodings SET status = 1, lastUpdatedDate = ?", stamp);
   });
 }
 

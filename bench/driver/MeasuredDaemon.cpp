@@ -10,15 +10,31 @@ namespace orva::bench {
 
 namespace {
 
+const std::string NULL_DEVICE = "/dev/null";
+const std::string FILE_OUTPUT = "/tmp/daemon.out";
+const std::string PIPE_OUTPUT = "/tmp/daemon.pipe";
+
 std::string ProcessFile(pid_t pid, const std::string& name) {
   return "/proc/" + std::to_string(pid) + "/" + name;
 }
 
 } // namespace
 
-MeasuredDaemon::MeasuredDaemon(const test::Volume& master, const test::Volume& library)
+MeasuredDaemon::MeasuredDaemon(const test::Volume& master, const test::Volume& library,
+                               Output output)
     : batch_(test::TranscodedBatch(library.Path())) {
-  appliance_.Start();
+  switch (output) {
+  case Output::Null:
+    appliance_.StartWithOutput(NULL_DEVICE);
+    break;
+  case Output::File:
+    appliance_.StartWithOutput(FILE_OUTPUT);
+    break;
+  case Output::Pipe:
+    pipe_.emplace(PIPE_OUTPUT);
+    appliance_.StartWithOutput(PIPE_OUTPUT);
+    break;
+  }
   for (const test::Volume* volume : {&master, &library}) {
     appliance_.Handle(test::Plugged(volume->Path()));
   }

@@ -1,5 +1,7 @@
 #pragma once
 
+#include "PipeReader.h"
+
 #include "Appliance.h"
 
 #include <chrono>
@@ -12,8 +14,16 @@ namespace orva::bench {
 /// are thrown as std::exception.
 class MeasuredDaemon {
 public:
+  /// Where the daemon's lines go.
+  enum class Output {
+    Null, ///< /dev/null, as in the systemd unit
+    File, ///< a regular file in memory
+    Pipe, ///< a pipe that a thread of the driver reads
+  };
+
   /// `master` holds the merged database.
-  MeasuredDaemon(const test::Volume& master, const test::Volume& library);
+  MeasuredDaemon(const test::Volume& master, const test::Volume& library,
+                 Output output = Output::Null);
   ~MeasuredDaemon();
   MeasuredDaemon(const MeasuredDaemon&) = delete;
   MeasuredDaemon& operator=(const MeasuredDaemon&) = delete;
@@ -28,6 +38,7 @@ public:
 private:
   double PeakMemory() const;
 
+  std::optional<PipeReader> pipe_; ///< outlives the daemon
   test::Appliance appliance_;
   std::string batch_;
   int merges_ = 0;

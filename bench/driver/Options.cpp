@@ -55,11 +55,14 @@ std::optional<Options> ParseOptions(const std::vector<std::string>& arguments) {
   app.set_version_flag("--version", "bench " PROGRAM_VERSION);
   app.option_defaults()->multi_option_policy(CLI::MultiOptionPolicy::TakeLast);
   app.add_flag("--quick", quick, "Leave out the catalogs of 1,000,000 files");
-  app.add_option("--sizes", sizes, "Files of the catalogs (10000,100000,1000000)")
+  app.add_option("--sizes", sizes,
+                 "Files of the catalogs (10000,100000,1000000); the shapes folders, same-names and "
+                 "covers have fixed sizes")
       ->type_name("N,...")
       ->check(ListOf(commandline::Decimal(1, MAXIMUM)));
   app.add_option("--shapes", shapes,
-                 "Shapes of the catalogs (unique,camera,flat,deep,restamped,folders)")
+                 "Shapes of the catalogs "
+                 "(unique,camera,flat,deep,restamped,folders,same-names,covers)")
       ->type_name("NAME,...")
       ->check(ListOf(CLI::IsMember(options.shapes)));
   app.add_option("--pairs", options.pairs, "How often each measurement is made")

@@ -16,9 +16,9 @@ namespace {
 
 constexpr long long LARGE = 100'000;
 constexpr long long LARGEST = 1'000'000;
-constexpr double BYTES_A_FILE = 400;
+constexpr double BYTES_A_FILE = 200;
 constexpr double MEBIBYTE = 1024.0 * 1024.0;
-constexpr double FIXED_BYTES = 96 * MEBIBYTE;
+constexpr double FIXED_BYTES = 80 * MEBIBYTE;
 
 using Bound = Figure::Bound;
 
@@ -52,63 +52,108 @@ Figure Bounded(Figure figure, bool applies, Bound bound, double target) {
   return figure;
 }
 
+/// What the daemon is compared with, and the target of the ratio.
+struct Comparison {
+  std::string what; ///< of the measurement
+  std::string name; ///< of the ratio
+  Times Measurement::*over;
+  Times Measurement::*under;
+  Bound bound = Bound::None;
+  double target = 0;
+};
+
+const std::vector<Comparison> COMPARISONS{
+    {FIRST_MERGE, "horizon / daemon", &Measurement::horizon, &Measurement::daemon, Bound::AtLeast,
+     1.0},
+    {FIRST_MERGE, "floor / daemon", &Measurement::floor, &Measurement::daemon},
+    {FIRST_MERGE, "horizon / floor", &Measurement::horizon, &Measurement::floor},
+    {FIRST_MERGE_FILE, "horizon / daemon", &Measurement::horizon, &Measurement::daemon,
+     Bound::AtLeast, 0.75},
+    {FIRST_MERGE_PIPE, "horizon / daemon", &Measurement::horizon, &Measurement::daemon,
+     Bound::AtLeast, 0.75},
+    {MERGED_AGAIN, "horizon / daemon", &Measurement::horizon, &Measurement::daemon, Bound::AtLeast,
+     0.8},
+    {MERGED_AGAIN, "floor / daemon", &Measurement::floor, &Measurement::daemon},
+    {ONE_MORE_FILE, "horizon / daemon", &Measurement::horizon, &Measurement::daemon, Bound::AtLeast,
+     0.5},
+    {UNCHANGED_MERGE, "daemon / reader's statements", &Measurement::daemon, &Measurement::shell,
+     Bound::AtMost, 1.2},
+    {BATCH_OF_100, "daemon / reader's statements", &Measurement::daemon, &Measurement::shell,
+     Bound::AtMost, 1.2},
+    {BATCH_OF_KNOWN_NAMES, "daemon / reader's statements", &Measurement::daemon,
+     &Measurement::shell, Bound::AtMost, 1.5},
+    {SINGLE_ADDITIONS, "daemon / reader's statements", &Measurement::daemon, &Measurement::shell,
+     Bound::AtMost, 1.5},
+    {DELETE_ALL, "shell's DELETE / daemon", &Measurement::shell, &Measurement::daemon,
+     Bound::AtLeast, 0.7},
+};
+
+/// Whether the targets apply to a catalog. They apply to the largest catalog of a shape.
+bool IsLargest(const Measurement& measured) {
+  if (measured.shape == "folders" || measured.shape == "covers") {
+    return measured.files == LARGE;
+  }
+  return measured.shape == "same-names" || measured.files == LARGEST;
+}
+
 /// Adds the figures of a single measurement.
 void AddFigures(std::vector<Figure>& figures, const Measurement& measured) {
-  const auto figure = [&measured](std::string what, std::optional<double> value) {
-    return Figure{.what = std::move(what),
+  const auto figure = [&measured](const std::string& what, std::optional<double> value,
+                                  std::size_t pairs) {
+    return Figure{.what = measured.what + what,
                   .shape = measured.shape,
                   .files = measured.files,
                   .value = measured.gaveUp ? std::nullopt : value,
-                  .pairs = measured.daemon.size()};
+                  .pairs = pairs};
   };
-  if (measured.what == FIRST_MERGE) {
-    figures.push_back(
-        Bounded(figure("first merge: floor / daemon", Ratio(measured.floor, measured.daemon)),
-                measured.files >= LARGE, Bound::AtLeast, 0.9));
-    figures.push_back(
-        figure("first merge: horizon / daemon", Ratio(measured.horizon, measured.daemon)));
-    figures.push_back(
-        figure("first merge: horizon / floor", Ratio(measured.horizon, measured.floor)));
-  } else if (measured.what == UNCHANGED_MERGE) {
-    figures.push_back(Bounded(figure("unchanged merge: daemon / reader's statements",
-                                     Ratio(measured.daemon, measured.floor)),
-                              measured.shape == "folders", Bound::AtMost, 3));
-  } else if (measured.what == BATCH_OF_100) {
-    figures.push_back(Bounded(figure("batch of 100: daemon / reader's statements",
-                                     Ratio(measured.daemon, measured.floor)),
-                              measured.files >= LARGEST, Bound::AtMost, 1.5));
-  } else if (measured.what == PEAK_MEMORY) {
+  for (const Comparison& comparison : COMPARISONS) {
+    if (comparison.what == measured.what) {
+      const Times& over = measured.*comparison.over;
+      const Times& under = measured.*comparison.under;
+      figures.push_back(Bounded(
+          figure(": " + comparison.name, Ratio(over, under), std::min(over.size(), under.size())),
+          IsLargest(measured), comparison.bound, comparison.target));
+    }
+  }
+  if (measured.what == PEAK_MEMORY) {
     const auto files = static_cast<double>(measured.files);
     const auto peak = MedianOf(measured.daemon);
-    figures.push_back(Bounded(
-        figure("peak memory over idle, MiB", peak ? std::optional(*peak / MEBIBYTE) : std::nullopt),
-        true, Bound::AtMost, (BYTES_A_FILE * files + FIXED_BYTES) / MEBIBYTE));
-    figures.push_back(figure("peak memory over idle, bytes a file",
-                             peak ? std::optional(*peak / files) : std::nullopt));
+    figures.push_back(
+        Bounded(figure(" over idle, MiB", peak ? std::optional(*peak / MEBIBYTE) : std::nullopt,
+                       measured.daemon.size()),
+                true, Bound::AtMost, (BYTES_A_FILE * files + FIXED_BYTES) / MEBIBYTE));
+    figures.push_back(figure(" over idle, bytes a file",
+                             peak ? std::optional(*peak / files) : std::nullopt,
+                             measured.daemon.size()));
   }
 }
+
+/// The most that the time of a measurement may grow with ten times the files.
+struct Growth {
+  std::string what; ///< of the measurement
+  double target = 0;
+};
+
+const std::vector<Growth> GROWTHS{
+    {FIRST_MERGE, 14}, {MERGED_AGAIN, 14}, {ONE_MORE_FILE, 13}, {DELETE_ALL, 12}};
 
 /// Adds how many times longer the daemon takes for ten times the files.
 void AddGrowth(std::vector<Figure>& figures, const Results& results, const Measurement& large) {
   const Measurement* const small = Find(results, large.what, large.shape, large.files / 10);
-  if (small == nullptr || (large.what != FIRST_MERGE && large.what != DELETE_ALL)) {
+  const auto growth = std::ranges::find(GROWTHS, large.what, &Growth::what);
+  if (small == nullptr || growth == GROWTHS.end()) {
     return;
   }
   const auto over = MedianOf(large.daemon);
   const auto under = MedianOf(small->daemon);
-  Figure growth{.what = large.what + ": growth from a tenth",
+  Figure figure{.what = large.what + ": growth from a tenth",
                 .shape = large.shape,
                 .files = large.files,
                 .pairs = std::min(large.daemon.size(), small->daemon.size())};
   if (over && under && !large.gaveUp && !small->gaveUp) {
-    growth.value = *over / *under;
+    figure.value = *over / *under;
   }
-  if (large.what == FIRST_MERGE) {
-    figures.push_back(Bounded(growth, large.files == LARGEST, Bound::AtMost, 14));
-  } else {
-    figures.push_back(
-        Bounded(growth, large.shape == "flat" && large.files == LARGE, Bound::AtMost, 15));
-  }
+  figures.push_back(Bounded(figure, IsLargest(large), Bound::AtMost, growth->target));
 }
 
 void AddMicro(std::vector<Figure>& figures, const MicroResult& micro) {
@@ -224,7 +269,8 @@ std::string Json(const Measurement& measured) {
   std::ostringstream text;
   text << "{\"what\": " << JsonText(measured.what) << ", \"shape\": " << JsonText(measured.shape)
        << ", \"files\": " << measured.files << ", \"daemon\": " << List(measured.daemon)
-       << ", \"floor\": " << List(measured.floor) << ", \"horizon\": " << List(measured.horizon)
+       << ", \"horizon\": " << List(measured.horizon) << ", \"shell\": " << List(measured.shell)
+       << ", \"floor\": " << List(measured.floor)
        << ", \"gaveUp\": " << (measured.gaveUp ? "true" : "false") << '}';
   return text.str();
 }
@@ -280,8 +326,8 @@ std::vector<Figure> ComputeFigures(const Results& results) {
 }
 
 void WriteTable(std::ostream& out, const std::vector<Figure>& figures, const Results& results) {
-  constexpr int FIGURE_WIDTH = 49;
-  constexpr int TIME_WIDTH = 25;
+  constexpr int FIGURE_WIDTH = 52;
+  constexpr int TIME_WIDTH = 33;
   out << Today() << ", " << Machine() << "\n\n";
   WriteRow(out, FIGURE_WIDTH, "FIGURE", "SHAPE", "FILES", "MEASURED", "TARGET", "", "PAIRS");
   for (const Figure& figure : figures) {
@@ -289,16 +335,16 @@ void WriteTable(std::ostream& out, const std::vector<Figure>& figures, const Res
              figure.value ? Number(*figure.value) : "gave up", TargetText(figure), Verdict(figure),
              CountText(static_cast<long long>(figure.pairs)));
   }
-  out << "\nMedians in seconds. The time to start a process is subtracted from floor, horizon and\n"
-         "shell. For an unchanged merge and a batch, FLOOR is the shell with the reader's\n"
-         "statements. A measurement makes no further pairs after two minutes. The deletion of\n"
-         "more than 100000 files is measured once.\n\n";
-  WriteRow(out, TIME_WIDTH, "WHAT", "SHAPE", "FILES", "DAEMON", "FLOOR", "HORIZON", "PAIRS");
+  out << "\nMedians in seconds. The time to start a process is subtracted from horizon, shell and\n"
+         "floor. SHELL has the reader's statements, or the DELETE for a deletion. The floor runs\n"
+         "in the first two pairs. A measurement makes no further pairs after two minutes.\n\n";
+  WriteRow(out, TIME_WIDTH, "WHAT", "SHAPE", "FILES", "DAEMON", "HORIZON", "SHELL", "FLOOR",
+           "PAIRS");
   for (const Measurement& measured : results.measurements) {
     if (measured.what != PEAK_MEMORY) {
       WriteRow(out, TIME_WIDTH, measured.what, measured.shape, CountText(measured.files),
-               measured.gaveUp ? "gave up" : Seconds(measured.daemon), Seconds(measured.floor),
-               Seconds(measured.horizon),
+               measured.gaveUp ? "gave up" : Seconds(measured.daemon), Seconds(measured.horizon),
+               Seconds(measured.shell), Seconds(measured.floor),
                CountText(static_cast<long long>(measured.daemon.size())));
     }
   }
@@ -315,7 +361,7 @@ void WriteJson(std::ostream& out, const std::vector<Figure>& figures, const Resu
 void WritePlotData(std::ostream& out, const Results& results) {
   std::string shape;
   for (const Measurement& measured : results.measurements) {
-    if (measured.what != FIRST_MERGE || measured.floor.empty()) {
+    if ((measured.what != FIRST_MERGE && measured.what != MERGED_AGAIN) || measured.floor.empty()) {
       continue;
     }
     if (measured.shape != shape) {

@@ -33,8 +33,8 @@ void WriteTable(std::ostream& out, const std::vector<Figure>& figures, const Res
 /// Writes the same for programs.
 void WriteJson(std::ostream& out, const std::vector<Figure>& figures, const Results& results);
 
-/// Writes the data of the plot, time of a first merge against size. Each shape has a block "#
-/// shape" of lines with the number of files and the medians of daemon, horizon and floor in
+/// Writes the data of the plot, time of a merge of all files against size. Each shape has a block
+/// "# shape" of lines with the number of files and the medians of daemon, horizon and floor in
 /// seconds.
 void WritePlotData(std::ostream& out, const Results& results);
 

@@ -3,7 +3,7 @@
 -- the parameters :catalog (path) and :volume (mount point with a trailing separator).
 -- The catalogs of the benchmark have no rows that a merge leaves out, except those that these
 -- statements leave out.
-PRAGMA cache_size = -65536;
+PRAGMA main.cache_size = -65536;
 ATTACH :catalog AS catalog;
 BEGIN IMMEDIATE;
 .read bench/schema.sql

@@ -34,8 +34,7 @@ struct MemoryTable::Module {
       return SQLITE_ERROR;
     }
     const int code =
-        sqlite3_declare_vtab(handle, "CREATE TABLE input(id INTEGER, name TEXT, time INTEGER, "
-                                     "volume TEXT)");
+        sqlite3_declare_vtab(handle, "CREATE TABLE input(id INTEGER, name TEXT, time INTEGER)");
     if (code != SQLITE_OK) {
       return code;
     }

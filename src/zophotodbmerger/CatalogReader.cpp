@@ -130,17 +130,15 @@ public:
   void Add(const Statement& row, std::string_view name) {
     std::string_view path = row.GetTextView(2);
     if (!base_.empty()) {
-      path.remove_prefix(std::min(path.find_first_not_of(NATIVE_PATH_SEPARATOR), path.size()));
+      path.remove_prefix(std::min(path.find_first_not_of('/'), path.size()));
     }
-    const MergeItem item{.path = path,
-                         .name = name,
-                         .modified = row.GetInt(5),
-                         .updated = row.GetInt(11),
-                         .status = row.GetInt(10),
-                         .isDeleted = row.GetBool(9),
-                         .isSystem = row.GetBool(8)};
-    memory_.Take(sizeof(MergeItem) + base_.size() + item.path.size() + item.name.size());
-    list_.Add(base_, item);
+    memory_.Take(sizeof(MergeItem) + base_.size() + path.size() + name.size());
+    MergeItem& item = list_.Add(base_, path, name);
+    item.modified = row.GetInt(5);
+    item.isSystem = row.GetBool(8);
+    item.isDeleted = row.GetBool(9);
+    item.status = row.GetInt(10);
+    item.updated = row.GetInt(11);
   }
 
   /// The list, sorted.
@@ -192,7 +190,7 @@ util::OwnerVector<db::File> ReadChangedFiles(const std::string& volumeMountPoint
 
 MergeList ListFolders(const std::string& volumeMountPoint, const db::VolumeDB& catalog) {
   MergeListReader reader(volumeMountPoint, catalog);
-  reader.List().Add({}, {.path = volumeMountPoint});
+  reader.List().Add({}, volumeMountPoint, {});
   ForEachFolder(catalog, [&](const Statement& row) { reader.Add(row, {}); });
   return reader.Take();
 }

@@ -3,7 +3,6 @@
 #include "FileSet.h"
 
 #include "FolderFinder.h"
-#include "IdRows.h"
 #include "NameFinder.h"
 #include "PhotoDB.h"
 #include "StandardOutput.h"
@@ -38,13 +37,11 @@ public:
     case ID:
       return set_.groups_[set_.entries_[file].group].target;
     case NAME:
-      return set_.files_[file].name;
+      return set_.files_[file].Name();
     case TIME:
       return static_cast<long long>(set_.files_[file].modified);
-    case VOLUME:
-      break;
     }
-    return std::string_view(set_.volume_);
+    return 0LL;
   }
 
 private:
@@ -57,6 +54,10 @@ FileSet::FileSet(const PhotoDB& photos, const std::string& volume,
     : photos_(photos), volume_(volume), stopRequested_(stopRequested),
       output_(StandardOutput::Current()) {}
 
+FileSet::~FileSet() {
+  output_.Flush();
+}
+
 std::time_t FileSet::Apply(std::span<const MergeItem> files, std::time_t since) {
   if (files.empty() || stopRequested_) {
     return since;
@@ -66,15 +67,19 @@ std::time_t FileSet::Apply(std::span<const MergeItem> files, std::time_t since) 
   }
   files_ = files;
   entries_.assign(files.size(), {});
+  additions_.reserve(files.size());
   if (std::ranges::any_of(files, &MergeItem::isDeleted)) {
     addedIds_.assign(files.size(), 0);
   }
   MakeGroups();
   FindFolders();
   SortByGroup();
-  for (const Group& group : groups_) {
-    NameFiles(group);
-    FindFiles(group);
+  {
+    NameFinder finder(photos_, volume_);
+    for (const Group& group : groups_) {
+      NameFiles(group);
+      FindFiles(group, finder);
+    }
   }
 
   std::time_t newest = since;
@@ -103,7 +108,7 @@ void FileSet::MakeGroups() {
     if (files_[file].isSystem) {
       continue;
     }
-    const std::string_view path = FolderPath(files_[file].path);
+    const std::string_view path = FolderPath(files_[file].Path());
     while (!open.empty() && !path.starts_with(groups_[open.back()].path)) {
       open.pop_back();
     }
@@ -190,7 +195,7 @@ void FileSet::SortByGroup() {
 
 void FileSet::NameFiles(const Group& group) {
   const std::span<Index> files(byGroup_.begin() + group.begin, byGroup_.begin() + group.end);
-  const auto name = [this](Index file) { return files_[file].name; };
+  const auto name = [this](Index file) { return files_[file].Name(); };
   if (!std::ranges::is_sorted(files, {}, name)) {
     std::ranges::sort(files, {}, [&](Index file) { return std::tuple(name(file), file); });
   }
@@ -203,18 +208,18 @@ void FileSet::NameFiles(const Group& group) {
   }
 }
 
-void FileSet::FindFiles(const Group& group) {
+void FileSet::FindFiles(const Group& group, NameFinder& finder) {
   std::vector<std::string_view> names;
   std::vector<Index> files;
   for (Index i = group.begin; i < group.end; ++i) {
     if (entries_[byGroup_[i]].name == byGroup_[i]) {
-      names.push_back(files_[byGroup_[i]].name);
+      names.push_back(files_[byGroup_[i]].Name());
       files.push_back(byGroup_[i]);
     }
   }
   const std::span<const long long> folderIds(folderIds_.begin() + group.firstFolder,
                                              group.folderCount);
-  for (const FoundFile& found : FindNames(photos_, volume_, names, folderIds)) {
+  for (const FoundFile& found : finder.Find(names, folderIds)) {
     Entry& name = entries_[files[found.name]];
     found_.push_back(
         {.id = found.id, .folderId = found.folderId, .isOwn = found.isOwn, .next = name.found});
@@ -225,20 +230,20 @@ void FileSet::FindFiles(const Group& group) {
 
 void FileSet::WriteLines(Index file) const {
   const MergeItem& item = files_[file];
-  output_.WriteLine({"Processing file ", item.path, " isdeleted=", item.isDeleted ? "1" : "0",
+  output_.WriteLine({"Processing file ", item.Path(), " isdeleted=", item.isDeleted ? "1" : "0",
                      " status = ", std::to_string(item.status)});
   if (item.isSystem) {
     return;
   }
   if (!item.isDeleted) {
-    output_.WriteLine({"Adding file ", item.path, " for mount ", volume_});
+    output_.WriteLine({"Adding file ", item.Path(), " for mount ", volume_});
     return;
   }
-  output_.WriteLine({"Removing file ", item.path, " for mount ", volume_});
-  output_.WriteLine({"Deleting ", item.path});
+  output_.WriteLine({"Removing file ", item.Path(), " for mount ", volume_});
+  output_.WriteLine({"Deleting ", item.Path()});
   if (entries_[file].isSourceFound) {
     output_.WriteLine({"Found parent folder ", std::to_string(groups_[entries_[file].group].source),
-                       " for ", item.path});
+                       " for ", item.Path()});
   }
 }
 
@@ -279,7 +284,7 @@ void FileSet::Remove(Index file) {
   }
   removals_.insert(removals_.end(), taken_.begin(), taken_.end());
   if (name.group == strays_ && strayHome_ != NONE) {
-    TakeFromStrayHome(files_[file].name);
+    TakeFromStrayHome(files_[file].Name());
   }
 }
 
@@ -302,8 +307,8 @@ void FileSet::TakeFromStrayHome(std::string_view name) {
   const Group& home = groups_[strayHome_];
   const std::span<const Index> files(byGroup_.begin() + home.begin, byGroup_.begin() + home.end);
   const auto found =
-      std::ranges::lower_bound(files, name, {}, [this](Index file) { return files_[file].name; });
-  if (found != files.end() && files_[*found].name == name) {
+      std::ranges::lower_bound(files, name, {}, [this](Index file) { return files_[file].Name(); });
+  if (found != files.end() && files_[*found].Name() == name) {
     TakeFound(entries_[*found], NO_FOLDER);
   }
 }
@@ -312,18 +317,35 @@ void FileSet::Flush() {
   output_.Flush();
   if (!additions_.empty()) {
     AdditionRows rows(*this);
-    Statement(photos_,
-              "INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT id, "
-              "name, time, volume, time FROM temp.input",
-              rows)
-        .Execute();
+    // For readers a photo was created when it was last modified.
+    Statement insert(photos_,
+                     "INSERT INTO Files(folder_id, name, modified_date, volume, created_date) "
+                     "SELECT id, name, time, ?, time FROM temp.input",
+                     rows);
+    insert.BindTextView(1, volume_);
+    insert.Execute();
     additions_.clear();
   }
   if (!removals_.empty()) {
-    IdRows rows(removals_);
-    Statement(photos_, "DELETE FROM Files WHERE file_id IN (SELECT id FROM temp.input)", rows)
-        .Execute();
+    DeleteFiles();
     removals_.clear();
+  }
+}
+
+// Files that were added together have consecutive ids. SQLite deletes a range of them in half the
+// time of a set.
+void FileSet::DeleteFiles() {
+  std::ranges::sort(removals_);
+  auto begin = removals_.begin();
+  while (begin != removals_.end()) {
+    const auto last = std::adjacent_find(
+        begin, removals_.end(), [](long long id, long long next) { return next != id + 1; });
+    const auto end = last == removals_.end() ? last : std::next(last);
+    Statement change(photos_, "DELETE FROM Files WHERE file_id BETWEEN ? AND ?");
+    change.BindInt64(1, *begin);
+    change.BindInt64(2, *std::prev(end));
+    change.Execute();
+    begin = end;
   }
 }
 

@@ -14,6 +14,7 @@
 namespace orva::dbmerger {
 
 class FolderFinder;
+class NameFinder;
 class PhotoDB;
 class StandardOutput;
 
@@ -26,6 +27,11 @@ class StandardOutput;
 class FileSet {
 public:
   FileSet(const PhotoDB& photos, const std::string& volume, const std::atomic<bool>& stopRequested);
+
+  FileSet(const FileSet&) = delete;
+  FileSet& operator=(const FileSet&) = delete;
+  /// Writes the lines that are left after a failure.
+  ~FileSet();
 
   /// Applies the files, in the order of their paths. Ends early when a stop is requested. Returns
   /// the time of the newest one applied, or `since` if none is newer.
@@ -72,7 +78,7 @@ private:
   Index StrayGroup();
   void SortByGroup();
   void NameFiles(const Group& group);
-  void FindFiles(const Group& group);
+  void FindFiles(const Group& group, NameFinder& finder);
 
   void WriteLines(Index file) const;
   void Add(Index file);
@@ -80,6 +86,7 @@ private:
   void TakeFound(Entry& name, long long folderId);
   void TakeFromStrayHome(std::string_view name);
   void Flush();
+  void DeleteFiles();
 
   const PhotoDB& photos_;
   const std::string& volume_;
@@ -87,21 +94,23 @@ private:
   StandardOutput& output_;
 
   std::span<const MergeItem> files_;
-  std::vector<Entry> entries_; ///< one for each file
+  std::pmr::vector<Entry> entries_{LargeBlocks()}; ///< one for each file
   std::vector<Group> groups_;
   std::vector<long long> folderIds_;
-  std::vector<Index> byGroup_; ///< the files, group by group, in each by name
-  std::vector<Found> found_;
+  std::pmr::vector<Index> byGroup_{LargeBlocks()}; ///< the files, group by group, in each by name
+  std::pmr::vector<Found> found_{LargeBlocks()};
 
   /// Removals without a folder: as from a folder with an id that stands for it.
   Index strays_ = NONE;
   /// The group whose path has a folder with that id, too.
   Index strayHome_ = NONE;
 
-  std::vector<Index> additions_;    ///< the current set, if it is one of additions
-  std::vector<long long> removals_; ///< the current set, if it is one of removals
-  std::vector<long long> addedIds_; ///< of each entry; empty if the list has no removals
-  std::vector<long long> taken_;    ///< ids of the files that an entry removes
+  std::pmr::vector<Index> additions_{LargeBlocks()}; ///< the current set, if it is one of additions
+  std::pmr::vector<long long> removals_{
+      LargeBlocks()}; ///< the current set, if it is one of removals
+  std::pmr::vector<long long> addedIds_{
+      LargeBlocks()};            ///< of each entry; empty if the list has no removals
+  std::vector<long long> taken_; ///< ids of the files that an entry removes
 };
 
 } // namespace orva::dbmerger

@@ -19,7 +19,10 @@ std::span<const long long> FolderFinder::Find(std::string_view path) {
   ids_.clear();
   while (!isAtEnd_ && query_->GetTextView(0) == path) {
     if (ids_.empty()) {
-      volume_ = query_->GetTextView(2);
+      volume_.reset();
+      if (query_->IsText(2)) {
+        volume_ = query_->GetTextView(2);
+      }
     }
     ids_.push_back(query_->GetInt64(1));
     Advance();

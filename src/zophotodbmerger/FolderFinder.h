@@ -24,7 +24,7 @@ public:
   std::span<const long long> Find(std::string_view path);
 
   /// Whether the only folder that was found is on `volume`.
-  bool IsOn(const std::string& volume) const { return volume_ == volume; }
+  bool IsOn(std::string_view volume) const { return volume_ == volume; }
 
   /// Ends the reading. Must be called before folders are changed.
   void Stop() { query_.reset(); }
@@ -39,7 +39,7 @@ private:
   bool isAtEnd_ = false;
   std::string lastPath_;
   std::vector<long long> ids_;
-  std::string volume_;
+  std::optional<std::string> volume_; ///< of the first one found, if it is a text
 };
 
 } // namespace orva::dbmerger

@@ -20,8 +20,8 @@ using db::Statement;
 /// it may be its subfolders.
 class FolderSet::AdditionRows final : public db::Rows {
 public:
-  AdditionRows(const PhotoDB& photos, std::string_view volume, std::vector<Addition>& additions)
-      : photos_(photos), volume_(volume), additions_(additions) {}
+  AdditionRows(const PhotoDB& photos, std::vector<Addition>& additions)
+      : photos_(photos), additions_(additions) {}
 
   bool Next() noexcept override {
     if (next_ != 0) {
@@ -36,18 +36,15 @@ public:
     case ID:
       return addition.parent == NONE ? addition.parentId : additions_[addition.parent].id;
     case NAME:
-      return addition.folder->path;
+      return addition.folder->Path();
     case TIME:
       return static_cast<long long>(addition.folder->modified);
-    case VOLUME:
-      break;
     }
-    return volume_;
+    return 0LL;
   }
 
 private:
   const PhotoDB& photos_;
-  std::string_view volume_;
   std::vector<Addition>& additions_;
   std::size_t next_ = 0;
 };
@@ -65,10 +62,14 @@ FolderSet::FolderSet(const PhotoDB& photos, const std::string& volume,
     : photos_(photos), volume_(volume), stopRequested_(stopRequested),
       output_(StandardOutput::Current()), finder_(photos) {}
 
+FolderSet::~FolderSet() {
+  output_.Flush();
+}
+
 void FolderSet::Apply(std::span<const MergeItem> folders) {
   while (!folders.empty() && !stopRequested_) {
     const auto end = std::ranges::find_if(
-        folders, [&](const MergeItem& folder) { return folder.path != folders.front().path; });
+        folders, [&](const MergeItem& folder) { return folder.Path() != folders.front().Path(); });
     const auto count = static_cast<std::size_t>(end - folders.begin());
     ApplyPath(folders.first(count));
     folders = folders.subspan(count);
@@ -77,7 +78,7 @@ void FolderSet::Apply(std::span<const MergeItem> folders) {
 }
 
 void FolderSet::ApplyPath(std::span<const MergeItem> folders) {
-  const std::string_view path = folders.front().path;
+  const std::string_view path = folders.front().Path();
   while (!ancestors_.empty() && !path.starts_with(ancestors_.back().path)) {
     ancestors_.pop_back();
   }
@@ -130,7 +131,7 @@ void FolderSet::Add(const MergeItem& folder) {
 }
 
 FolderSet::Addition FolderSet::MakeAddition(const MergeItem& folder) {
-  const std::string_view path = ParentPath(folder.path);
+  const std::string_view path = ParentPath(folder.Path());
   const auto parent = std::ranges::lower_bound(
       ancestors_, path.size(), {}, [](const Ancestor& ancestor) { return ancestor.path.size(); });
   if (parent == ancestors_.end() || parent->path.size() != path.size()) {
@@ -154,10 +155,10 @@ void FolderSet::Remove(const MergeItem& folder) {
   if (!additions_.empty()) {
     Flush();
   }
-  output_.WriteLine({"Deleting ", folder.path});
+  output_.WriteLine({"Deleting ", folder.Path()});
   const std::optional<long long> id = own_.First(removed_);
   if (id) {
-    output_.WriteLine({"Found folder ", std::to_string(*id), " for ", folder.path});
+    output_.WriteLine({"Found folder ", std::to_string(*id), " for ", folder.Path()});
   }
   // A missing folder is removed as one with an id that stands for it.
   isStrayRemoved_ = isStrayRemoved_ || id.value_or(NO_FOLDER) == NO_FOLDER;
@@ -183,12 +184,13 @@ void FolderSet::Flush() {
 }
 
 void FolderSet::ExecuteAdditions() {
-  AdditionRows rows(photos_, volume_, additions_);
-  Statement(photos_,
-            "INSERT INTO Folders(parent_folder_id, name, modified_date, volume) SELECT id, name, "
-            "time, volume FROM temp.input",
-            rows)
-      .Execute();
+  AdditionRows rows(photos_, additions_);
+  Statement insert(photos_,
+                   "INSERT INTO Folders(parent_folder_id, name, modified_date, volume) SELECT id, "
+                   "name, time, ? FROM temp.input",
+                   rows);
+  insert.BindTextView(1, volume_);
+  insert.Execute();
   for (Ancestor& ancestor : ancestors_) {
     if (ancestor.addition != NONE) {
       ancestor.id = additions_[ancestor.addition].id;
@@ -197,6 +199,7 @@ void FolderSet::ExecuteAdditions() {
   }
   if (addition_ != NONE) {
     const std::array<long long, 1> added{additions_[addition_].id};
+    removed_.erase(added.front()); // a database may lack its sequence, and use an id again
     any_.Reset(added);
     own_.Reset(added);
     addition_ = NONE;

@@ -27,6 +27,11 @@ public:
   FolderSet(const PhotoDB& photos, const std::string& volume,
             const std::atomic<bool>& stopRequested);
 
+  FolderSet(const FolderSet&) = delete;
+  FolderSet& operator=(const FolderSet&) = delete;
+  /// Writes the lines that are left after a failure.
+  ~FolderSet();
+
   /// Applies the folders, in the order of their paths. Ends early when a stop is requested.
   void Apply(std::span<const MergeItem> folders);
 

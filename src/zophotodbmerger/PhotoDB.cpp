@@ -175,6 +175,13 @@ bool HasObject(const PhotoDB& photos, std::string create) {
   return query.Fetch();
 }
 
+/// Whether new folders and files get positive ids.
+bool HasOwnSequences(const PhotoDB& photos) {
+  Statement query(photos, "SELECT 1 FROM main.sqlite_sequence WHERE name IN ('Folders', 'Files') "
+                          "AND (typeof(seq) != 'integer' OR seq < 0)");
+  return !query.Fetch();
+}
+
 /// The caller's transaction, or else one of its own.
 class JoinedTransaction {
 public:
@@ -206,11 +213,11 @@ void HandOver(std::unique_ptr<Record> record, std::vector<Record*>& records) {
 } // namespace
 
 std::string_view ParentPath(std::string_view path) {
-  return path.substr(0, path.rfind(NATIVE_PATH_SEPARATOR, path.size() - 2) + 1);
+  return path.substr(0, path.rfind('/', path.size() - 2) + 1);
 }
 
 std::string_view FolderPath(std::string_view path) {
-  return path.substr(0, path.rfind(NATIVE_PATH_SEPARATOR) + 1);
+  return path.substr(0, path.rfind('/') + 1);
 }
 
 PhotoDB::PhotoDB(const std::string& location)
@@ -307,7 +314,8 @@ bool PhotoDB::HasOwnSchema() const {
   return encoding.Fetch() && encoding.GetTextView(0) == "UTF-8" &&
          HasObject(*this, CREATE_FOLDERS) && HasObject(*this, CREATE_FILES) &&
          std::ranges::all_of(CREATE_INDEXES,
-                             [this](const char* create) { return HasObject(*this, create); });
+                             [this](const char* create) { return HasObject(*this, create); }) &&
+         HasOwnSequences(*this);
 }
 
 void PhotoDB::Clear() {

@@ -68,8 +68,8 @@ public:
   /// Kept for compatibility of the interface; does nothing.
   void DumpTable(const std::string& table) const;
 
-  /// Whether the tables of folders and files are those that CreateTables makes, with their indexes.
-  /// A database that was found on a volume may have others.
+  /// Whether the tables of folders and files are those that CreateTables makes, with their indexes
+  /// and positive new ids. A database that was found on a volume may have others.
   bool HasOwnSchema() const;
 
   // Folders and files.

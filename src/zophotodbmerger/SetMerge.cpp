@@ -21,8 +21,8 @@ namespace {
 template <typename Item>
 Item MakeItem(const MergeItem& row) {
   Item item;
-  item.path = row.path;
-  item.name = row.name;
+  item.path = row.Path();
+  item.name = row.Name();
   item.lastModifiedDate = row.modified;
   return item;
 }
@@ -68,14 +68,14 @@ std::time_t SetMerge::ApplySingleFiles(const MergeList& files, std::time_t since
     if (stopRequested_) {
       break;
     }
-    output.WriteLine({"Processing file ", row.path, " isdeleted=", row.isDeleted ? "1" : "0",
+    output.WriteLine({"Processing file ", row.Path(), " isdeleted=", row.isDeleted ? "1" : "0",
                       " status = ", std::to_string(row.status)});
     if (row.isSystem) {
       continue;
     }
     auto file = MakeItem<db::File>(row);
     output.WriteLine(
-        {row.isDeleted ? "Removing file " : "Adding file ", row.path, " for mount ", volume_});
+        {row.isDeleted ? "Removing file " : "Adding file ", row.Path(), " for mount ", volume_});
     output.Flush();
     if (row.isDeleted) {
       photos_.DeleteFile(volume_, file);

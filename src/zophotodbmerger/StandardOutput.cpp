@@ -48,6 +48,7 @@ void StandardOutput::Inspect() {
   }
   device_ = status.st_dev;
   inode_ = status.st_ino;
+  pending_.clear(); // the rest of a line of the former output
   isInLine_ = false;
   isStalled_ = false;
   own_.Reset();

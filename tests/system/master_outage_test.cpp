@@ -79,6 +79,9 @@ int CountFailuresUntilThereIsSpace(Appliance& appliance, Volume& volume, const s
   return pages;
 }
 
+const std::string INSERT_FOLDERS = "INSERT INTO Folders(parent_folder_id, name, modified_date, "
+                                   "volume) SELECT id, name, time, ? FROM temp.input";
+
 /// The text of an SQLite error, as the database layer throws it.
 std::string SqliteError(const std::string& reason, const std::string& sql) {
   return "PLACE: " + reason + " in \"" + sql + "\"";
@@ -175,10 +178,9 @@ std::vector<Lines> FullDiskErrors() {
   const std::string update = "UPDATE Statistics SET photos_xcoded = ?, photos_total = ?, "
                              "last_updated_time = ? where volume = ?";
   return {
-      FailedIn(FULL, "INSERT INTO Folders(parent_folder_id, name, modified_date, volume) "
-                     "VALUES(?, ?, ?, ?)"),
+      FailedIn(FULL, INSERT_FOLDERS),
       FailedIn(FULL, "INSERT INTO Files(folder_id, name, modified_date, volume, created_date) "
-                     "VALUES(?, ?, ?, ?, ?)"),
+                     "SELECT id, name, time, ?, time FROM temp.input"),
       FailedIn(FULL, "UPDATE Status SET mc_version = ?, mdate = ?, desc = ?, etype = ? WHERE "
                      "id = 1"),
       {"Could not update stats for /shares/B/. Return code 13",
@@ -263,9 +265,7 @@ TEST_F(MasterOutage, AFullDiskFailsTheReMergeUntilThereIsSpace) {
 
 TEST_F(MasterOutage, AReadOnlyMasterFailsWhatWouldChangeIt) {
   a.MakeReadOnly();
-  EXPECT_EQ(Announcement() + BeginOfMerge(3) +
-                Log{Error(FailedIn(READ_ONLY, "INSERT INTO Folders(parent_folder_id, name, "
-                                              "modified_date, volume) VALUES(?, ?, ?, ?)")[0])},
+  EXPECT_EQ(Announcement() + BeginOfMerge(3) + Log{Error(FailedIn(READ_ONLY, INSERT_FOLDERS)[0])},
             HandleMasked(appliance, TranscodedBatch(b.Path())));
   for (const std::string& message : {Purged(b.Path()), Unplugged(b.Path())}) {
     EXPECT_THAT(Errors(appliance.Handle(message)),

@@ -15,6 +15,7 @@
 namespace orva::test {
 namespace {
 
+using ::testing::AnyOf;
 using ::testing::Each;
 using ::testing::ElementsAre;
 using ::testing::EndsWith;
@@ -168,13 +169,17 @@ protected:
   }
 
 private:
-  /// A merge into a volume that is gone fails: the next program that opens the database rolls it
-  /// back.
+  /// A merge into a volume that is gone mostly fails: the next program that opens the database
+  /// rolls it back. At the end it may still commit, because it has the files open.
   void ExpectAllOrNothing(const Lines& errors, bool pulled) {
     const MergedDatabase merged(Kept::PATH);
     EXPECT_THAT(merged.Faults(), IsEmpty());
-    EXPECT_THAT(merged.Files(), SizeIs(pulled ? 100 : 1100));
+    EXPECT_THAT(merged.Files(), AnyOf(SizeIs(100), SizeIs(1100)));
+    if (!pulled) {
+      EXPECT_THAT(merged.Files(), SizeIs(1100));
+    }
     if (!errors.empty()) {
+      EXPECT_THAT(merged.Files(), SizeIs(100));
       EXPECT_THAT(errors.back(), StartsWith("Error that we will ignore "));
       EXPECT_THAT(Lines(errors.begin(), errors.end() - 1),
                   Each("Could not insert stats for /shares/B/ "));

@@ -476,13 +476,12 @@ MergeCase MakeMergeCase(unsigned seed, std::size_t scale) {
 MergeList MakeMergeList(const std::vector<CatalogRow>& rows) {
   MergeList list;
   for (const CatalogRow& row : rows) {
-    list.Add({}, {.path = row.path,
-                  .name = row.name,
-                  .modified = row.modified,
-                  .updated = row.updated,
-                  .status = row.status,
-                  .isDeleted = row.isDeleted,
-                  .isSystem = row.isSystem});
+    MergeItem& item = list.Add({}, row.path, row.name);
+    item.modified = row.modified;
+    item.updated = row.updated;
+    item.status = row.status;
+    item.isDeleted = row.isDeleted;
+    item.isSystem = row.isSystem;
   }
   list.Sort();
   return list;
@@ -518,8 +517,8 @@ std::string MakeDatabase(const std::vector<std::string>& sql) {
 template <typename Item>
 Item MakeItem(const MergeItem& row) {
   Item item;
-  item.path = row.path;
-  item.name = row.name;
+  item.path = row.Path();
+  item.name = row.Name();
   item.lastModifiedDate = row.modified;
   return item;
 }
@@ -541,17 +540,17 @@ std::time_t ApplySingleFiles(const PhotoDB& photos, const std::string& volume,
   StandardOutput& output = StandardOutput::Current();
   std::time_t newest = since;
   for (const MergeItem& row : rows) {
-    output.WriteLine({"Processing file ", row.path, " isdeleted=", row.isDeleted ? "1" : "0",
+    output.WriteLine({"Processing file ", row.Path(), " isdeleted=", row.isDeleted ? "1" : "0",
                       " status = ", std::to_string(row.status)});
     if (row.isSystem) {
       continue;
     }
     auto file = MakeItem<db::File>(row);
     if (row.isDeleted) {
-      output.WriteLine({"Removing file ", row.path, " for mount ", volume});
+      output.WriteLine({"Removing file ", row.Path(), " for mount ", volume});
       photos.DeleteFile(volume, file);
     } else {
-      output.WriteLine({"Adding file ", row.path, " for mount ", volume});
+      output.WriteLine({"Adding file ", row.Path(), " for mount ", volume});
       output.Flush();
       photos.AddFile(volume, file);
     }

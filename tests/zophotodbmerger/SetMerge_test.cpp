@@ -49,7 +49,7 @@ TEST(SetMergeTest, LargerRandomMergesGiveTheSameRowsAndLines) {
 
 TEST(SetMergeTest, StoppedMergesHaveAppliedTheFirstRows) {
   MiddleStops stops;
-  const unsigned count = TestScale(60U, 2'000U);
+  const unsigned count = TestScale(150U, 2'000U);
   for (unsigned seed = 1; seed <= count; ++seed) {
     const MergeCase merge = MakeMergeCase(seed);
     try {
@@ -59,8 +59,8 @@ TEST(SetMergeTest, StoppedMergesHaveAppliedTheFirstRows) {
       continue;
     }
   }
-  EXPECT_LT(10, stops.folders);
-  EXPECT_LT(10, stops.files);
+  EXPECT_LT(5, stops.folders);
+  EXPECT_LT(5, stops.files);
 }
 
 // What the random cases seldom have.

@@ -5,11 +5,11 @@
 
 namespace orva::db {
 
-/// Rows in memory that a statement reads as the table temp.input(id, name, time, volume), once and
+/// Rows in memory that a statement reads as the table temp.input(id, name, time), once and
 /// in their order. On the connection's thread.
 class Rows {
 public:
-  enum Column : int { ID, NAME, TIME, VOLUME };
+  enum Column : int { ID, NAME, TIME };
   using Value = std::variant<long long, std::string_view>;
 
   Rows() = default;
