@@ -193,33 +193,42 @@ FaultTest::Scenario FaultTest::LaterMerge() {
                 {OTHER, VOLUME});
 }
 
-/// The contents after the first statements of the volume's deletion.
-std::vector<Lines> FaultTest::PartsOfADeletion() {
-  std::vector<Lines> parts;
+/// The same in a database whose rows are changed one by one, because an index is missing.
+FaultTest::Scenario FaultTest::LaterMergeRowByRow() {
+  MakeMergedVolumes();
+  Database(DATABASE).Run("DROP INDEX Files_name");
+  Scenario scenario = Finish(
+      {.name = "a later merge row by row", .operation = [this] { Merge(VOLUME); }, .throws = false},
+      {OTHER, VOLUME});
+  std::erase(scenario.merged, "index|Files_name|Files|CREATE INDEX Files_name ON Files(name)");
+  return scenario;
+}
+
+/// The content between the removal of a volume and its merge.
+Lines FaultTest::ContentAfterDeletion() {
   const Files files = TakeFiles();
   for (const char* const sql :
        {"UPDATE Statistics SET last_updated_time = 0 WHERE volume = ?",
         "DELETE FROM Files WHERE volume = ?", "DELETE FROM Folders WHERE volume = ?"}) {
     Database(DATABASE).Run(sql, {VOLUME});
-    parts.push_back(Content());
   }
+  const Lines content = Content();
   RestoreFiles(files);
-  return parts;
+  return content;
 }
 
 FaultTest::Scenario FaultTest::ReMerge() {
   MakeMergedVolumes();
   return Finish({.name = "a re-merge",
                  .operation = [this] { merger.ReMergeDB(MASTER, VOLUME); },
-                 .between = PartsOfADeletion()},
+                 .between = {ContentAfterDeletion()}},
                 {OTHER, VOLUME});
 }
 
 FaultTest::Scenario FaultTest::Removal() {
   MakeMergedVolumes();
   return Finish({.name = "a removal of a volume",
-                 .operation = [this] { merger.RemoveVolume(MASTER, VOLUME); },
-                 .between = PartsOfADeletion()},
+                 .operation = [this] { merger.RemoveVolume(MASTER, VOLUME); }},
                 {OTHER, VOLUME});
 }
 
@@ -244,21 +253,13 @@ FaultTest::Scenario FaultTest::Opening() {
 
 FaultTest::Scenario FaultTest::Clearing() {
   MakeMergedVolumes();
-  const Files files = TakeFiles();
-  std::vector<Lines> parts;
-  for (const char* const sql : {"DELETE FROM Folders WHERE folder_id != 1", "DELETE FROM Files"}) {
-    Database(DATABASE).Run(sql);
-    parts.push_back(Content());
-  }
-  RestoreFiles(files);
   return Finish({.name = "a removal of all volumes",
                  .operation =
                      [] {
                        PhotoDB photos(MASTER);
                        photos.Init();
                        photos.DeleteVolumes();
-                     },
-                 .between = parts},
+                     }},
                 {});
 }
 

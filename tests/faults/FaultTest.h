@@ -58,6 +58,7 @@ protected:
   Scenario FirstMerge();
   Scenario FirstMergeWithoutADatabase();
   Scenario LaterMerge();
+  Scenario LaterMergeRowByRow();
   Scenario ReMerge();
   Scenario Removal();
   Scenario Creation();
@@ -87,7 +88,7 @@ private:
 
   void Merge(const std::string& volume);
   void MakeMergedVolumes();
-  static std::vector<Lines> PartsOfADeletion();
+  static Lines ContentAfterDeletion();
   Scenario Finish(Scenario scenario, const Lines& volumes);
   Outcome Try(const Fault& fault, int nth, const Action& action);
   int RunWith(const Scenario& scenario, const Fault& fault);

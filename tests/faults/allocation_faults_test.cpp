@@ -39,6 +39,10 @@ TEST_F(AllocationFaultTest, LaterMergeIsAllOrNothing) {
   ExpectToSurvive(LaterMerge(), faults);
 }
 
+TEST_F(AllocationFaultTest, LaterMergeRowByRowIsAllOrNothing) {
+  ExpectToSurvive(LaterMergeRowByRow(), faults);
+}
+
 TEST_F(AllocationFaultTest, ReMergeCanBeRepeatedByTheNextMerge) {
   ExpectToSurvive(ReMerge(), faults);
 }

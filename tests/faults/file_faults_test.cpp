@@ -71,6 +71,10 @@ TEST_F(FileFaultTest, LaterMergeIsAllOrNothing) {
   ExpectToSurvive(LaterMerge(), FileErrors(MERGED, "merged database"));
 }
 
+TEST_F(FileFaultTest, LaterMergeRowByRowIsAllOrNothing) {
+  ExpectToSurvive(LaterMergeRowByRow(), FileErrors(MERGED, "merged database"));
+}
+
 TEST_F(FileFaultTest, ReMergeCanBeRepeatedByTheNextMerge) {
   ExpectToSurvive(ReMerge(), FileErrors(MERGED, "merged database"));
 }
@@ -123,6 +127,10 @@ TEST_F(CrashTest, FirstMergeWithoutADatabaseIsAllOrNothing) {
 
 TEST_F(CrashTest, LaterMergeIsAllOrNothing) {
   ExpectToSurvive(LaterMerge(), Crashes(MERGED));
+}
+
+TEST_F(CrashTest, LaterMergeRowByRowIsAllOrNothing) {
+  ExpectToSurvive(LaterMergeRowByRow(), Crashes(MERGED));
 }
 
 TEST_F(CrashTest, ReMergeIsFinishedByTheNextMerge) {

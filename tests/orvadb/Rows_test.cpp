@@ -33,7 +33,6 @@ struct Row {
   long long id = 0;
   std::string name{};
   long long time = 0;
-  std::string volume{};
 };
 
 class TestRows final : public Rows {
@@ -50,11 +49,9 @@ public:
     case NAME:
       return row.name;
     case TIME:
-      return row.time;
-    case VOLUME:
       break;
     }
-    return row.volume;
+    return row.time;
   }
 
 private:
@@ -97,13 +94,13 @@ protected:
   RowsTest() {
     fs::remove_all("/tmp/db");
     fs::create_directory("/tmp/db");
-    Database(path, true).exec("CREATE TABLE t(id INTEGER PRIMARY KEY, name TEXT, time, volume)");
+    Database(path, true).exec("CREATE TABLE t(id INTEGER PRIMARY KEY, name TEXT, time)");
   }
 
   void Make(const std::string& sql) const { Database(path).exec(sql); }
 
   static void Insert(const DB& db, Rows& rows) {
-    Statement(db, "INSERT INTO t SELECT id, name, time, volume FROM temp.input", rows).Execute();
+    Statement(db, "INSERT INTO t SELECT id, name, time FROM temp.input", rows).Execute();
   }
 
   const std::string path = "/tmp/db/test.db";
@@ -111,19 +108,17 @@ protected:
 
 TEST_F(RowsTest, AreReadInTheirOrderWithTheirTypes) {
   const TestDB db(path);
-  TestRows rows(
-      {{7, "b", -1, "v"}, {-3, "a", std::numeric_limits<long long>::min(), ""}, {7, "", 0, "w"}});
-  Statement query(
-      db,
-      "SELECT id || '|' || quote(name) || '|' || quote(time) || '|' || quote(volume) || "
-      "typeof(id) FROM temp.input",
-      rows);
+  TestRows rows({{7, "b", -1}, {-3, "a", std::numeric_limits<long long>::min()}, {7, "", 0}});
+  Statement query(db,
+                  "SELECT id || '|' || quote(name) || '|' || quote(time) || '|' || "
+                  "typeof(id) FROM temp.input",
+                  rows);
   std::vector<std::string> read;
   while (query.Fetch()) {
     read.push_back(query.GetText(0));
   }
-  EXPECT_THAT(read, ElementsAre("7|'b'|-1|'v'integer", "-3|'a'|-9223372036854775808|''integer",
-                                "7|''|0|'w'integer"));
+  EXPECT_THAT(read, ElementsAre("7|'b'|-1|integer", "-3|'a'|-9223372036854775808|integer",
+                                "7|''|0|integer"));
 }
 
 TEST_F(RowsTest, NoRowsAreAnEmptyTable) {
@@ -135,11 +130,11 @@ TEST_F(RowsTest, NoRowsAreAnEmptyTable) {
 
 TEST_F(RowsTest, TextsKeepNulAndInvalidBytesAndMayBeEmpty) {
   const TestDB db(path);
-  TestRows rows({{1, "a\0b"s, 0, "\0"s}, {2, "", 0, "\xff\xfe"s}});
+  TestRows rows({{1, "a\0b"s, 0}, {2, "", 0}, {3, "\xff\xfe"s, 0}});
   Insert(db, rows);
-  EXPECT_THAT(db.Rows("SELECT hex(name) || '|' || hex(volume) || typeof(name) FROM t"),
-              ElementsAre("610062|00text", "|FFFEtext"));
-  TestRows same({{0, "a\0b"s, 0, ""}, {0, "", 0, ""}});
+  EXPECT_THAT(db.Rows("SELECT hex(name) || '|' || typeof(name) FROM t"),
+              ElementsAre("610062|text", "|text", "FFFE|text"));
+  TestRows same({{0, "a\0b"s, 0}, {0, "", 0}});
   Statement found(db, "SELECT count(*) FROM t WHERE name IN (SELECT name FROM temp.input)", same);
   ASSERT_TRUE(found.Fetch());
   EXPECT_EQ(2, found.GetInt(0));
@@ -155,7 +150,7 @@ TEST_F(RowsTest, NextRowIsAskedForAfterTheOneBeforeWasInserted) {
 TEST_F(RowsTest, KeptStatementReadsTheRowsOfItsUse) {
   const TestDB db(path);
   for (int id = 1; id <= 3; ++id) {
-    TestRows rows({{id, "n", 0, "v"}});
+    TestRows rows({{id, "n", 0}});
     Insert(db, rows);
   }
   EXPECT_THAT(db.Rows("SELECT id FROM t"), ElementsAre("1", "2", "3"));
@@ -166,21 +161,21 @@ TEST_F(RowsTest, TableWorksAgainAfterARollback) {
   const TestDB db(path);
   for (int id = 1; id <= 3; ++id) {
     const Transaction rolledBack(db, 1'000);
-    TestRows rows({{id, "n", 0, "v"}});
+    TestRows rows({{id, "n", 0}});
     Insert(db, rows);
     EXPECT_THAT(db.Rows("SELECT id FROM t"), ElementsAre(std::to_string(id)));
   }
-  TestRows rows({{4, "n", 0, "v"}});
+  TestRows rows({{4, "n", 0}});
   Insert(db, rows);
   EXPECT_THAT(db.Rows("SELECT id FROM t"), ElementsAre("4"));
 }
 
 TEST_F(RowsTest, TableWorksAgainAfterTheSchemaHasChanged) {
   const TestDB db(path);
-  TestRows first({{1, "n", 0, "v"}});
+  TestRows first({{1, "n", 0}});
   Insert(db, first);
   Make("CREATE INDEX later ON t(name)");
-  TestRows second({{2, "n", 0, "v"}});
+  TestRows second({{2, "n", 0}});
   Insert(db, second);
   EXPECT_THAT(db.Rows("SELECT id FROM t"), ElementsAre("1", "2"));
 }
@@ -188,7 +183,7 @@ TEST_F(RowsTest, TableWorksAgainAfterTheSchemaHasChanged) {
 TEST_F(RowsTest, TableWorksInADatabaseThatIsOpenedAgain) {
   TestDB db(path);
   for (int id = 1; id <= 2; ++id) {
-    TestRows rows({{id, "n", 0, "v"}});
+    TestRows rows({{id, "n", 0}});
     Insert(db, rows);
     db.Open(path);
   }
@@ -197,7 +192,7 @@ TEST_F(RowsTest, TableWorksInADatabaseThatIsOpenedAgain) {
 
 TEST_F(RowsTest, RefusedRowLeavesNothingOfItsStatement) {
   const TestDB db(path);
-  TestRows rows({{1, "n", 0, "v"}, {2, "n", 0, "v"}, {1, "n", 0, "v"}});
+  TestRows rows({{1, "n", 0}, {2, "n", 0}, {1, "n", 0}});
   EXPECT_THAT(Thrown([&] { Insert(db, rows); }), HasSubstr("UNIQUE constraint failed"));
   EXPECT_THAT(db.Rows("SELECT id FROM t"), IsEmpty());
 }
@@ -205,7 +200,7 @@ TEST_F(RowsTest, RefusedRowLeavesNothingOfItsStatement) {
 TEST_F(RowsTest, LeaveNoTraceInTheFile) {
   {
     const TestDB db(path);
-    TestRows rows({{1, "n", 0, "v"}});
+    TestRows rows({{1, "n", 0}});
     Insert(db, rows);
   }
   EXPECT_THAT(Database(path).Run("SELECT name FROM sqlite_schema"), ElementsAre("t"));
@@ -214,18 +209,17 @@ TEST_F(RowsTest, LeaveNoTraceInTheFile) {
 // Untrusted databases.
 
 TEST_F(RowsTest, TableOfTheFileWithTheSameNameIsNotRead) {
-  Make(
-      "CREATE TABLE input(id, name, time, volume); INSERT INTO input VALUES(9, 'file', 9, 'file')");
+  Make("CREATE TABLE input(id, name, time); INSERT INTO input VALUES(9, 'file', 9)");
   const TestDB db(path);
-  TestRows rows({{1, "n", 0, "v"}});
+  TestRows rows({{1, "n", 0}});
   Insert(db, rows);
   EXPECT_THAT(db.Rows("SELECT id || name FROM t"), ElementsAre("1n"));
-  EXPECT_THAT(Database(path).Run("SELECT * FROM input"), ElementsAre("9|file|9|file"));
+  EXPECT_THAT(Database(path).Run("SELECT * FROM input"), ElementsAre("9|file|9"));
 }
 
 TEST_F(RowsTest, OrdinaryStatementsCannotReadTheTable) {
   const TestDB db(path);
-  TestRows rows({{1, "n", 0, "v"}});
+  TestRows rows({{1, "n", 0}});
   Insert(db, rows);
   EXPECT_THAT(Thrown([&] { const Statement reads(db, "SELECT * FROM temp.input"); }),
               HasSubstr("input"));
@@ -249,7 +243,7 @@ TEST_P(VirtualTableTest, IsRefusedBeforeAndAfterRowsWereUsed) {
   EXPECT_NE("", Thrown(read));
   EXPECT_NE("", Thrown(change));
   {
-    TestRows rows({{1, "n", 0, "v"}});
+    TestRows rows({{1, "n", 0}});
     Statement query(db, "SELECT id FROM temp.input", rows);
     EXPECT_TRUE(query.Fetch());
   }
@@ -261,17 +255,16 @@ TEST_P(VirtualTableTest, IsRefusedByStatementsWithRows) {
   const TestDB db(path);
   for (const char* const sql : {"SELECT * FROM t WHERE rowid IN (SELECT id FROM temp.input)",
                                 "DELETE FROM t WHERE rowid IN (SELECT id FROM temp.input)",
-                                "INSERT INTO t SELECT id, name, time, volume FROM temp.input"}) {
-    TestRows rows({{1, "n", 0, "v"}});
+                                "INSERT INTO t SELECT id, name, time FROM temp.input"}) {
+    TestRows rows({{1, "n", 0}});
     EXPECT_NE("", Thrown([&] { Statement(db, sql, rows).Execute(); })) << sql;
   }
 }
 
 INSTANTIATE_TEST_SUITE_P(Modules, VirtualTableTest,
-                         testing::Values("orva_input", "orva_input(id, name, time, volume)",
-                                         "fts5(id, name, time, volume)",
-                                         "rtree(id, name, time, volume, more)", "json_each",
-                                         "dbstat", "generate_series", "missing"));
+                         testing::Values("orva_input", "orva_input(id, name, time)",
+                                         "fts5(id, name, time)", "rtree(id, name, time)",
+                                         "json_each", "dbstat", "generate_series", "missing"));
 
 // The limit of work.
 
@@ -293,7 +286,7 @@ const char* const ENDLESS =
 
 TEST_F(RowsTest, EndlessStatementWithRowsIsInterrupted) {
   const TestDB db(path);
-  TestRows rows({{1, "n", 0, "v"}});
+  TestRows rows({{1, "n", 0}});
   EXPECT_THAT(Thrown([&] { Statement(db, ENDLESS, rows).Execute(); }),
               HasSubstr("more work than a database of this size can need"));
 }

@@ -10,10 +10,12 @@
 #include "orvadb/File.h"
 #include "orvadb/Folder.h"
 #include "orvadb/Statement.h"
+#include "orvadb/Transaction.h"
 
 #include "orvautil/Exception.h"
 #include "orvautil/OwnerVector.h"
 
+#include <sqlite3.h>
 #include <sys/fsuid.h>
 #include <sys/mount.h>
 #include <sys/resource.h>
@@ -748,26 +750,157 @@ TEST_F(PhotoDBTest, FailedDeletionsAreThrown) {
   EXPECT_THAT(Thrown([&] { photos.DeleteVolumes(); }), HasSubstr("no such table: Files"));
 }
 
-TEST_F(PhotoDBTest, FailedDeletionKeepsItsFirstSteps) {
-  AddFolder("/shares/Vol/");
-  AddFile("/shares/Vol/", "a.jpg");
-  photos.InsertStatistics(VOLUME);
-  photos.UpdateStatistics({VOLUME, 3, 4, 500});
-  Rows("ALTER TABLE Folders RENAME TO Away");
-  EXPECT_THAT(Thrown([&] { photos.DeleteVolume(VOLUME); }), HasSubstr("no such table: Folders"));
-  EXPECT_THAT(Rows("SELECT name FROM Files"), IsEmpty());
-  EXPECT_THAT(Rows("SELECT name FROM Away"), ElementsAre("/shares/", "/shares/Vol/"));
-  EXPECT_THAT(MergedStatistics(LOCATION), ElementsAre("/shares/Vol/|3|4|0"));
+/// A database with two volumes, whose statements can be watched.
+class PhotoDBDeletionTest : public PhotoDBLocationTest {
+protected:
+  /// Removes volumes.
+  using Deletion = std::function<void(const PhotoDB&)>;
+
+  PhotoDBDeletionTest() : photos(LOCATION) {
+    photos.Init();
+    for (const std::string& volume : {VOLUME, std::string("/shares/Other/")}) {
+      db::Folder folder;
+      folder.path = volume;
+      photos.AddFolder(volume, folder);
+      db::File file;
+      file.path = volume + "a.jpg";
+      file.name = "a.jpg";
+      photos.AddFile(volume, file);
+      photos.InsertStatistics(volume);
+      photos.UpdateStatistics({volume, 3, 4, 500});
+    }
+  }
+
+  class WatchedPhotoDB : public PhotoDB {
+  public:
+    using PhotoDB::PhotoDB;
+
+    /// Calls `watch` with each statement that begins. `watch` lives as long as the database is
+    /// open.
+    void Watch(std::function<void(const std::string&)>& watch) const {
+      const auto call = [](unsigned /*event*/, void* place, void* /*statement*/, void* sql) {
+        (*static_cast<std::function<void(const std::string&)>*>(place))(
+            static_cast<const char*>(sql));
+        return 0;
+      };
+      sqlite3_trace_v2(Handle(), SQLITE_TRACE_STMT, call, &watch);
+    }
+  };
+
+  Lines StatementsOf(const Deletion& deletion) {
+    Lines statements;
+    std::function<void(const std::string&)> watch = [&](const std::string& sql) {
+      statements.push_back(sql);
+    };
+    photos.Watch(watch);
+    deletion(photos);
+    photos.Watch(nothing);
+    return statements;
+  }
+
+  static void DeleteOne(const PhotoDB& photos) { photos.DeleteVolume(VOLUME); }
+  static void DeleteAll(const PhotoDB& photos) { photos.DeleteVolumes(); }
+
+  WatchedPhotoDB photos;
+  std::function<void(const std::string&)> nothing = [](const std::string& /*sql*/) {};
+};
+
+TEST_F(PhotoDBDeletionTest, DeletionOfAVolumeIsOneTransaction) {
+  EXPECT_THAT(StatementsOf(&DeleteOne),
+              ElementsAre("BEGIN IMMEDIATE", "DELETE FROM Folders WHERE volume = ?",
+                          "DELETE FROM Files WHERE volume = ?",
+                          "UPDATE Statistics SET last_updated_time = 0 WHERE volume = ?",
+                          "COMMIT"));
 }
 
-TEST_F(PhotoDBTest, TimeOfAVolumeIsZeroEvenIfItsDeletionFails) {
-  AddFolder("/shares/Vol/");
-  photos.InsertStatistics(VOLUME);
-  photos.UpdateStatistics({VOLUME, 3, 4, 500});
-  Rows("ALTER TABLE Files RENAME TO Away");
-  EXPECT_THROW(photos.DeleteVolume(VOLUME), std::string);
-  EXPECT_THAT(MergedFolders(LOCATION), ElementsAre("/shares/Vol/|/shares/Vol/"));
-  EXPECT_THAT(MergedStatistics(LOCATION), ElementsAre("/shares/Vol/|3|4|0"));
+TEST_F(PhotoDBDeletionTest, DeletionOfAllVolumesIsOneTransactionBeforeTheFileIsCompacted) {
+  EXPECT_THAT(StatementsOf(&DeleteAll),
+              ElementsAre("BEGIN IMMEDIATE", "DELETE FROM Folders WHERE folder_id != 1",
+                          "DELETE FROM Files ", "DELETE FROM Statistics", "COMMIT", "VACUUM"));
+}
+
+TEST_F(PhotoDBDeletionTest, OtherConnectionsNeverSeeAPartOfADeletion) {
+  for (const Deletion& deletion : {Deletion(&DeleteOne), Deletion(&DeleteAll)}) {
+    const Lines first = MergedContent(LOCATION);
+    std::vector<Lines> seen;
+    std::function<void(const std::string&)> watch = [&](const std::string& /*sql*/) {
+      seen.push_back(MergedContent(LOCATION));
+    };
+    photos.Watch(watch);
+    deletion(photos);
+    photos.Watch(nothing);
+    const Lines last = MergedContent(LOCATION);
+    EXPECT_NE(first, last);
+    EXPECT_LE(5U, seen.size());
+    for (const Lines& content : seen) {
+      EXPECT_THAT(content, ::testing::AnyOf(first, last));
+    }
+  }
+}
+
+TEST_F(PhotoDBDeletionTest, FailureInTheMiddleLeavesEverything) {
+  for (const Deletion& deletion : {Deletion(&DeleteOne), Deletion(&DeleteAll)}) {
+    for (const char* const table : {"Folders", "Files", "Statistics"}) {
+      const Lines before = MergedContent(LOCATION);
+      const std::string name = table;
+      MergedRows(LOCATION, "ALTER TABLE " + name + " RENAME TO Away");
+      EXPECT_THAT(Thrown([&] { deletion(photos); }), HasSubstr("no such table: " + name));
+      MergedRows(LOCATION, "ALTER TABLE Away RENAME TO " + name);
+      EXPECT_EQ(before, MergedContent(LOCATION));
+    }
+  }
+  DeleteAll(photos);
+  EXPECT_THAT(MergedFolders(LOCATION), IsEmpty());
+}
+
+TEST_F(PhotoDBDeletionTest, ReaderThatHoldsALockMakesItFailWithEverythingLeft) {
+  const Lines before = MergedContent(LOCATION);
+  for (const Deletion& deletion : {Deletion(&DeleteOne), Deletion(&DeleteAll)}) {
+    const Database reader(MergedDatabasePath(LOCATION));
+    reader.Run("BEGIN");
+    reader.Run("SELECT * FROM Files");
+    EXPECT_THAT(Thrown([&] { deletion(photos); }), HasSubstr("database is locked"));
+    reader.Run("COMMIT");
+    EXPECT_EQ(before, MergedContent(LOCATION));
+  }
+  DeleteOne(photos);
+  EXPECT_THAT(MergedFiles(LOCATION), ElementsAre("/shares/Other/a.jpg"));
+}
+
+TEST_F(PhotoDBDeletionTest, TakesPartInATransactionOfTheCaller) {
+  const Lines before = MergedContent(LOCATION);
+  for (const Deletion& deletion : {Deletion(&DeleteOne), Deletion(&DeleteAll)}) {
+    const db::Transaction rolledBack(photos, 1'000);
+    deletion(photos);
+    EXPECT_EQ(before, MergedContent(LOCATION)) << "committed before its caller";
+  }
+  EXPECT_EQ(before, MergedContent(LOCATION));
+  db::Transaction transaction(photos, 1'000);
+  DeleteOne(photos);
+  transaction.Commit();
+  EXPECT_THAT(MergedFiles(LOCATION), ElementsAre("/shares/Other/a.jpg"));
+  EXPECT_THAT(MergedStatistics(LOCATION),
+              ElementsAre("/shares/Other/|3|4|500", "/shares/Vol/|3|4|0"));
+}
+
+TEST_F(PhotoDBDeletionTest, DoesNotCompactTheFileInATransactionOfTheCaller) {
+  db::Transaction transaction(photos, 1'000);
+  EXPECT_THAT(StatementsOf(&DeleteAll),
+              ElementsAre("DELETE FROM Folders WHERE folder_id != 1", "DELETE FROM Files ",
+                          "DELETE FROM Statistics"));
+  transaction.Commit();
+  EXPECT_THAT(MergedFolders(LOCATION), IsEmpty());
+}
+
+TEST_F(PhotoDBDeletionTest, FailureIsRolledBackWithATransactionOfTheCaller) {
+  const Lines before = MergedContent(LOCATION);
+  for (const Deletion& deletion : {Deletion(&DeleteOne), Deletion(&DeleteAll)}) {
+    const db::Transaction transaction(photos, 1'000);
+    db::Statement(photos, "ALTER TABLE Statistics RENAME TO Away").Execute();
+    EXPECT_THAT(Thrown([&] { deletion(photos); }), HasSubstr("no such table: Statistics"));
+    EXPECT_TRUE(photos.IsInTransaction());
+  }
+  EXPECT_EQ(before, MergedContent(LOCATION));
 }
 
 TEST_F(PhotoDBTest, FailedAdditionsAreThrown) {

@@ -66,6 +66,8 @@ const std::vector<std::string> OTHERS = {
 /// More indexes. Some of them change the order in which rows are found, or let an insertion fail.
 const std::vector<std::string> MORE_INDEXES = {
     "CREATE INDEX more ON Folders(name, volume DESC)",
+    "CREATE INDEX more ON Folders(name, volume DESC, parent_folder_id, modified_date)",
+    "CREATE INDEX more ON Folders(name, parent_folder_id DESC, volume, modified_date)",
     "CREATE INDEX more ON Folders(volume, name, parent_folder_id DESC)",
     "CREATE INDEX more ON Folders(name, parent_folder_id DESC, volume)",
     "CREATE INDEX more ON Files(name, folder_id)",
@@ -184,6 +186,10 @@ std::string SetTypes() {
 
 } // namespace
 
+std::vector<std::string> OwnSchema() {
+  return MakeSchema(Schema::Own, 0);
+}
+
 std::string SqlText(const std::string& bytes) {
   constexpr std::string_view digits = "0123456789abcdef";
   if (std::ranges::all_of(bytes, [](char byte) { return byte >= ' ' && byte != '\''; })) {
@@ -204,7 +210,7 @@ namespace {
 
 class Generator {
 public:
-  explicit Generator(unsigned seed) : random_(seed) {
+  Generator(unsigned seed, std::size_t scale) : random_(seed), scale_(scale) {
     const auto sometimes = [this] { return OneIn(4); };
     oddPaths_ = sometimes();
     oddTexts_ = sometimes();
@@ -245,7 +251,8 @@ private:
     static const std::vector<std::string> plain{"a", "b", "ab", "a b", "A"};
     static const std::vector<std::string> odd{"a\0"s, "\0"s,   "\xff"s, "\xc3\x28"s, "a\xc3\xa4"s,
                                               "5"s,   "-1.5"s, ""s,     " a"s,       "a."s};
-    return oddTexts_ && OneIn(2) ? Any(odd) : Any(plain);
+    std::string text = oddTexts_ && OneIn(2) ? Any(odd) : Any(plain);
+    return scale_ == 1 ? text : text + std::to_string(Below(scale_));
   }
 
   void MakePaths() {
@@ -253,7 +260,7 @@ private:
     if (OneIn(3)) {
       paths_.push_back(Any(volumes_));
     }
-    for (std::size_t count = 2 + Below(5); count > 0; --count) {
+    for (std::size_t count = 2 + Below(5 * scale_); count > 0; --count) {
       std::string path = Any(paths_) + Component();
       if (!(oddPaths_ && OneIn(4))) {
         path += '/';
@@ -270,7 +277,7 @@ private:
         }
       }
     }
-    for (std::size_t count = 1 + Below(4); count > 0; --count) {
+    for (std::size_t count = 1 + Below(4 * scale_); count > 0; --count) {
       names_.push_back(Component());
     }
   }
@@ -285,8 +292,9 @@ private:
     }
     const long long id = Any(odd);
     // After the largest one a table without AUTOINCREMENT uses random ids.
-    return oddIds_ && OneIn(4) && !(isForeign_ && id > 7) ? id
-                                                          : static_cast<long long>(1 + Below(8));
+    return oddIds_ && OneIn(4) && !(isForeign_ && id > 7)
+               ? id
+               : static_cast<long long>(1 + Below(8 * scale_));
   }
 
   std::string Text(const std::string& text) {
@@ -295,9 +303,9 @@ private:
       case 0:
         return "CAST(" + SqlText(text) + " AS BLOB)";
       case 1:
-        return "5";
+        return "17"; // equals no name: statements find those by number or by text
       case 2:
-        return "-1.5";
+        return "-2.25";
       default:
         return "NULL";
       }
@@ -351,13 +359,16 @@ private:
     if (!oddIds_ || !OneIn(4)) {
       sql.emplace_back("INSERT INTO Folders VALUES(1, -1, '/shares/', 0, '<DUMMY>')");
     }
-    for (std::size_t count = Below(8); count > 0; --count) {
-      const std::string id = oddIds_ || OneIn(3) ? Number(Id()) : "NULL";
+    for (std::size_t count = Below(8 * scale_); count > 0; --count) {
+      std::string id = oddIds_ || OneIn(3) ? Number(Id()) : "NULL";
+      if (strays_ && OneIn(3)) {
+        id = "-1";
+      }
       sql.push_back("INSERT OR IGNORE INTO Folders VALUES(" +
                     (IsPlain(id) ? id : std::string("NULL")) + ", " + Number(Id()) + ", " +
                     Text(Any(paths_)) + ", 1, " + Text(Any(volumes_)) + ")");
     }
-    for (std::size_t count = Below(14); count > 0; --count) {
+    for (std::size_t count = Below(14 * scale_); count > 0; --count) {
       const std::string id = oddIds_ ? Number(Id()) : "NULL";
       const std::string time = std::to_string(Below(1'000));
       sql.push_back("INSERT OR IGNORE INTO Files VALUES(" +
@@ -418,11 +429,11 @@ private:
     if (!OneIn(4)) {
       merge.folders.push_back({.path = merge.volume});
     }
-    for (std::size_t count = Below(9); count > 0; --count) {
+    for (std::size_t count = Below(9 * scale_); count > 0; --count) {
       merge.folders.push_back(Row(Any(paths_), removals));
     }
     removals = OneIn(8) ? 1 : Any(shares);
-    for (std::size_t count = Below(16); count > 0; --count) {
+    for (std::size_t count = Below(16 * scale_); count > 0; --count) {
       const std::string name = Any(names_);
       CatalogRow row = Row(Any(paths_) + name, removals);
       row.name = OneIn(8) ? Any(names_) : name;
@@ -440,6 +451,7 @@ private:
   }
 
   std::mt19937 random_;
+  std::size_t scale_; ///< how many times as many rows
   bool oddPaths_ = false;
   bool oddTexts_ = false;
   bool oddIds_ = false;
@@ -455,8 +467,8 @@ private:
 
 } // namespace
 
-MergeCase MakeMergeCase(unsigned seed) {
-  return Generator(seed).Make();
+MergeCase MakeMergeCase(unsigned seed, std::size_t scale) {
+  return Generator(seed, scale).Make();
 }
 
 // The comparison.
@@ -464,13 +476,12 @@ MergeCase MakeMergeCase(unsigned seed) {
 MergeList MakeMergeList(const std::vector<CatalogRow>& rows) {
   MergeList list;
   for (const CatalogRow& row : rows) {
-    list.Add({}, {.path = row.path,
-                  .name = row.name,
-                  .modified = row.modified,
-                  .updated = row.updated,
-                  .status = row.status,
-                  .isDeleted = row.isDeleted,
-                  .isSystem = row.isSystem});
+    MergeItem& item = list.Add({}, row.path, row.name);
+    item.modified = row.modified;
+    item.updated = row.updated;
+    item.status = row.status;
+    item.isDeleted = row.isDeleted;
+    item.isSystem = row.isSystem;
   }
   list.Sort();
   return list;
@@ -506,8 +517,8 @@ std::string MakeDatabase(const std::vector<std::string>& sql) {
 template <typename Item>
 Item MakeItem(const MergeItem& row) {
   Item item;
-  item.path = row.path;
-  item.name = row.name;
+  item.path = row.Path();
+  item.name = row.Name();
   item.lastModifiedDate = row.modified;
   return item;
 }
@@ -529,17 +540,17 @@ std::time_t ApplySingleFiles(const PhotoDB& photos, const std::string& volume,
   StandardOutput& output = StandardOutput::Current();
   std::time_t newest = since;
   for (const MergeItem& row : rows) {
-    output.WriteLine({"Processing file ", row.path, " isdeleted=", row.isDeleted ? "1" : "0",
+    output.WriteLine({"Processing file ", row.Path(), " isdeleted=", row.isDeleted ? "1" : "0",
                       " status = ", std::to_string(row.status)});
     if (row.isSystem) {
       continue;
     }
     auto file = MakeItem<db::File>(row);
     if (row.isDeleted) {
-      output.WriteLine({"Removing file ", row.path, " for mount ", volume});
+      output.WriteLine({"Removing file ", row.Path(), " for mount ", volume});
       photos.DeleteFile(volume, file);
     } else {
-      output.WriteLine({"Adding file ", row.path, " for mount ", volume});
+      output.WriteLine({"Adding file ", row.Path(), " for mount ", volume});
       output.Flush();
       photos.AddFile(volume, file);
     }
@@ -626,15 +637,16 @@ std::string Describe(const Effects& effects) {
          effects.lines + "rows:\n" + effects.rows + "after the transaction:\n" + effects.after;
 }
 
-/// A PhotoDB whose statements call a function when they begin.
+/// A PhotoDB whose statements call a function with their text when they begin.
 class TracedPhotoDB : public PhotoDB {
 public:
   using PhotoDB::PhotoDB;
+  using Function = std::function<void(std::string_view sql)>;
 
-  /// Only until the database is closed. `function` lives as long.
-  void CallForStatements(std::function<void()>& function) {
-    const auto call = [](unsigned /*event*/, void* place, void* /*statement*/, void* /*sql*/) {
-      (*static_cast<std::function<void()>*>(place))();
+  /// `function` lives as long as the database is used.
+  void CallForStatements(Function& function) {
+    const auto call = [](unsigned /*event*/, void* place, void* /*statement*/, void* sql) {
+      (*static_cast<Function*>(place))(static_cast<const char*>(sql));
       return 0;
     };
     sqlite3_trace_v2(Handle(), SQLITE_TRACE_STMT, call, &function);
@@ -701,15 +713,20 @@ Effects RunPart(const std::string& database, const CatalogMerge& merge, std::siz
 }
 
 /// The same in sets with a stop request when the statement with that number begins. Returns none
-/// if there are not so many.
+/// if there are not so many. `wasInSet` tells whether that is the statement of a set.
 std::optional<Effects> RunWithStop(const std::string& database, const CatalogMerge& merge,
-                                   int statement) {
+                                   int statement, bool& wasInSet) {
   OpenCase open(SETS, database);
   const MergeList folders = MakeMergeList(merge.folders);
   const MergeList files = MakeMergeList(merge.files);
   Effects effects;
   std::atomic<bool> stopRequested{statement == 0};
-  std::function<void()> count = [&] { stopRequested = stopRequested || --statement == 0; };
+  TracedPhotoDB::Function count = [&](std::string_view sql) {
+    if (!stopRequested && --statement == 0) {
+      stopRequested = true;
+      wasInSet = sql.find("temp.input") != std::string_view::npos;
+    }
+  };
   CapturedOutput output;
   const SetMerge sets(open.Photos(), merge.volume, stopRequested);
   open.Photos().CallForStatements(count);
@@ -725,29 +742,31 @@ std::optional<Effects> RunWithStop(const std::string& database, const CatalogMer
 
 } // namespace
 
-std::string CompareStoppedMerges(const MergeCase& merge, int& stoppedInTheMiddle) {
+std::string CompareStoppedMerges(const MergeCase& merge, MiddleStops& stops) {
   const std::string database = MakeDatabase(merge.database);
-  const CatalogMerge& first = merge.transactions.front().merges.front();
+  const CatalogMerge& merged = merge.transactions.front().merges.front();
   std::vector<Effects> parts;
-  for (std::size_t count = 0; count <= first.folders.size(); ++count) {
-    parts.push_back(RunPart(database, first, count, 0));
+  for (std::size_t count = 0; count <= merged.folders.size(); ++count) {
+    parts.push_back(RunPart(database, merged, count, 0));
   }
-  for (std::size_t count = 1; count <= first.files.size(); ++count) {
-    parts.push_back(RunPart(database, first, first.folders.size(), count));
+  for (std::size_t count = 1; count <= merged.files.size(); ++count) {
+    parts.push_back(RunPart(database, merged, merged.folders.size(), count));
   }
   for (int statement = 0;; ++statement) {
-    const std::optional<Effects> effects = RunWithStop(database, first, statement);
+    bool wasInSet = false;
+    const std::optional<Effects> effects = RunWithStop(database, merged, statement, wasInSet);
     if (!effects) {
       return {};
     }
-    if (std::ranges::find(parts, *effects) == parts.end() ||
-        (statement == 0 && !(*effects == parts.front()))) {
-      return "stopped at statement " + std::to_string(statement) + "\n" + Describe(*effects) +
-             "but without a row\n" + Describe(parts.front());
+    const auto first = std::ranges::find(parts, *effects);
+    if (first == parts.end() || (statement == 0 && first != parts.begin())) {
+      return "stopped at statement " + std::to_string(statement) + "\n" + Describe(*effects);
     }
-    if (!(*effects == parts.front()) && !(*effects == parts.back())) {
-      ++stoppedInTheMiddle;
-    }
+    // Rows without effects make equal parts.
+    const auto last = std::find(parts.rbegin(), parts.rend(), *effects).base() - 1;
+    const auto noFile = parts.begin() + std::ssize(merged.folders);
+    stops.folders += wasInSet && first != parts.begin() && last < noFile ? 1 : 0;
+    stops.files += wasInSet && first > noFile && last != parts.end() - 1 ? 1 : 0;
   }
 }
 

@@ -2,6 +2,7 @@
 
 #include "MergeList.h"
 
+#include <cstddef>
 #include <cstdint>
 #include <ctime>
 #include <string>
@@ -44,19 +45,28 @@ struct MergeCase {
   std::vector<MergeTransaction> transactions{};
 };
 
+/// SQL that makes the tables and indexes of PhotoDB, without rows.
+std::vector<std::string> OwnSchema();
+
 /// `bytes` as an SQL expression for a text.
 std::string SqlText(const std::string& bytes);
 
-/// A random case, the same for the same seed.
-MergeCase MakeMergeCase(unsigned seed);
+/// A random case, the same for the same seed, of some ten rows times `scale`.
+MergeCase MakeMergeCase(unsigned seed, std::size_t scale = 1);
 
 /// How the operations on single rows and SetMerge differ in the case; empty if they do not.
 std::string CompareMerges(const MergeCase& merge);
 
-/// The same for the first merge of the case, with a stop request at each of its statements: its
-/// effects are those of some of the first rows. The merge must not fail. Adds the number of stops
-/// after some of the rows.
-std::string CompareStoppedMerges(const MergeCase& merge, int& stoppedInTheMiddle);
+/// Stops during the statement of a set, after some of the folders and after some of the files.
+struct MiddleStops {
+  int folders = 0;
+  int files = 0;
+};
+
+/// CompareMerges for the first merge of the case, with a stop request at each of its statements:
+/// its effects are those of some of the first rows. Adds to `stops`. Throws std::string if the
+/// database refuses a row.
+std::string CompareStoppedMerges(const MergeCase& merge, MiddleStops& stops);
 
 /// The case without the parts that do not matter for its difference.
 MergeCase Reduce(MergeCase merge);
