@@ -38,6 +38,7 @@ private:
   unsigned readPages_ = 0;   ///< the same for pages that it had not
   /// Processor time of the thread when the statement exceeded LEAST_LIMIT, in seconds; -1 before.
   long long begin_ = -1;
+  long long lastLook_ = -1; ///< second in which that was looked at last
 };
 
 } // namespace orva::db
