@@ -252,8 +252,8 @@ private:
           single.shell.push_back(StepReaderStatements(CatalogPath(), before));
         }
       }
-      merges.daemon.push_back(Sum(single.daemon));
-      merges.shell.push_back(Sum(single.shell) * ADDITIONS_PER_SHELL);
+      merges.daemon.push_back(Total(single.daemon));
+      merges.shell.push_back(Total(single.shell) * ADDITIONS_PER_SHELL);
       present_ += ADDITIONS;
       RequireFiles(present_);
       return true;

@@ -16,7 +16,7 @@ inline double Median(Times values) {
   return values.size() % 2 == 1 ? values[middle] : (values[middle - 1] + values[middle]) / 2;
 }
 
-inline double Sum(const Times& values) {
+inline double Total(const Times& values) {
   return std::accumulate(values.begin(), values.end(), 0.0);
 }
 

@@ -119,6 +119,9 @@ std::unique_ptr<Item> ReadItem(const Statement& row, const std::string& base) {
   return item;
 }
 
+/// Bytes that a merge takes for an item beyond the list, at most.
+constexpr std::size_t MERGE_BYTES = 128;
+
 /// Builds the full paths of a catalog's rows, as util::MakePath does.
 class MergeListReader {
 public:
@@ -132,7 +135,7 @@ public:
     if (!base_.empty()) {
       path.remove_prefix(std::min(path.find_first_not_of('/'), path.size()));
     }
-    memory_.Take(sizeof(MergeItem) + base_.size() + path.size() + name.size());
+    memory_.Take(sizeof(MergeItem) + MERGE_BYTES + base_.size() + path.size() + name.size());
     MergeItem& item = list_.Add(base_, path, name);
     item.modified = row.GetInt(5);
     item.isSystem = row.GetBool(8);

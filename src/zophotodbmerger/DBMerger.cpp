@@ -13,8 +13,6 @@
 
 #include "orvautil/thread_timer.h"
 
-#include <algorithm>
-
 namespace orva::dbmerger {
 
 namespace {

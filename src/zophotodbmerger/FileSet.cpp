@@ -12,7 +12,6 @@
 #include "orvadb/Statement.h"
 
 #include <algorithm>
-#include <array>
 #include <tuple>
 
 namespace orva::dbmerger {
@@ -54,10 +53,6 @@ FileSet::FileSet(const PhotoDB& photos, const std::string& volume,
     : photos_(photos), volume_(volume), stopRequested_(stopRequested),
       output_(StandardOutput::Current()) {}
 
-FileSet::~FileSet() {
-  output_.Flush();
-}
-
 std::time_t FileSet::Apply(std::span<const MergeItem> files, std::time_t since) {
   if (files.empty() || stopRequested_) {
     return since;
@@ -65,6 +60,7 @@ std::time_t FileSet::Apply(std::span<const MergeItem> files, std::time_t since) 
   if (files.size() >= NONE) {
     throw db::ErrorMessage("too many files");
   }
+  const FlushAtEnd flush(output_);
   files_ = files;
   entries_.assign(files.size(), {});
   additions_.reserve(files.size());
@@ -77,6 +73,9 @@ std::time_t FileSet::Apply(std::span<const MergeItem> files, std::time_t since) 
   {
     NameFinder finder(photos_, volume_);
     for (const Group& group : groups_) {
+      if (stopRequested_) {
+        return since;
+      }
       NameFiles(group);
       FindFiles(group, finder);
     }

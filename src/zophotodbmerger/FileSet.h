@@ -1,11 +1,13 @@
 #pragma once
 
+#include "LargeBlocks.h"
 #include "MergeList.h"
 
 #include <atomic>
 #include <cstdint>
 #include <ctime>
 #include <limits>
+#include <memory_resource>
 #include <span>
 #include <string>
 #include <string_view>
@@ -30,8 +32,7 @@ public:
 
   FileSet(const FileSet&) = delete;
   FileSet& operator=(const FileSet&) = delete;
-  /// Writes the lines that are left after a failure.
-  ~FileSet();
+  ~FileSet() = default;
 
   /// Applies the files, in the order of their paths. Ends early when a stop is requested. Returns
   /// the time of the newest one applied, or `since` if none is newer.

@@ -17,9 +17,9 @@ std::span<const long long> FolderFinder::Find(std::string_view path) {
   }
   lastPath_ = path;
   ids_.clear();
+  volume_.reset();
   while (!isAtEnd_ && query_->GetTextView(0) == path) {
     if (ids_.empty()) {
-      volume_.reset();
       if (query_->IsText(2)) {
         volume_ = query_->GetTextView(2);
       }

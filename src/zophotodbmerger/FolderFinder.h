@@ -23,7 +23,7 @@ public:
   /// the next call.
   std::span<const long long> Find(std::string_view path);
 
-  /// Whether the only folder that was found is on `volume`.
+  /// Whether there is a folder at the path, and the first one in the index is on `volume`.
   bool IsOn(std::string_view volume) const { return volume_ == volume; }
 
   /// Ends the reading. Must be called before folders are changed.

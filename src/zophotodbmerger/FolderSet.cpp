@@ -62,11 +62,8 @@ FolderSet::FolderSet(const PhotoDB& photos, const std::string& volume,
     : photos_(photos), volume_(volume), stopRequested_(stopRequested),
       output_(StandardOutput::Current()), finder_(photos) {}
 
-FolderSet::~FolderSet() {
-  output_.Flush();
-}
-
 void FolderSet::Apply(std::span<const MergeItem> folders) {
+  const FlushAtEnd flush(output_);
   while (!folders.empty() && !stopRequested_) {
     const auto end = std::ranges::find_if(
         folders, [&](const MergeItem& folder) { return folder.Path() != folders.front().Path(); });
@@ -82,13 +79,16 @@ void FolderSet::ApplyPath(std::span<const MergeItem> folders) {
   while (!ancestors_.empty() && !path.starts_with(ancestors_.back().path)) {
     ancestors_.pop_back();
   }
-  removed_.clear();
+  removed_ = std::unordered_set<long long>(); // clear() would keep its buckets
   if (isStrayRemoved_) {
     removed_.insert(NO_FOLDER);
   }
-  any_.Reset(finder_.Find(path));
-  if (std::ranges::any_of(folders, &MergeItem::isDeleted)) {
+  const std::span<const long long> ids = finder_.Find(path);
+  any_.Reset(ids);
+  if (ids.size() > 1 && std::ranges::any_of(folders, &MergeItem::isDeleted)) {
     FindOwn(path);
+  } else {
+    own_.Reset(finder_.IsOn(volume_) ? ids : std::span<const long long>());
   }
   addition_ = NONE;
   for (const MergeItem& folder : folders) {
@@ -148,7 +148,8 @@ std::optional<long long> FolderSet::FirstAt(std::string_view path) {
   if (!removals_.empty()) {
     Flush();
   }
-  return photos_.FindFolder(path);
+  const std::span<const long long> ids = finder_.Find(path);
+  return ids.empty() ? std::nullopt : std::optional(ids.front());
 }
 
 void FolderSet::Remove(const MergeItem& folder) {
@@ -173,9 +174,10 @@ void FolderSet::Flush() {
     ExecuteAdditions();
   }
   if (!removals_.empty()) {
-    for (const char* const sql :
-         {"DELETE FROM Files WHERE folder_id IN (SELECT id FROM temp.input)",
-          "DELETE FROM Folders WHERE folder_id IN (SELECT id FROM temp.input)"}) {
+    for (
+        const char* const sql :
+        {"DELETE FROM Files INDEXED BY Files_folderId WHERE folder_id IN (SELECT id FROM temp.input)",
+         "DELETE FROM Folders WHERE folder_id IN (SELECT id FROM temp.input)"}) {
       IdRows rows(removals_);
       Statement(photos_, sql, rows).Execute();
     }

@@ -5,11 +5,11 @@
 
 #include <atomic>
 #include <cstddef>
-#include <cstdint>
 #include <limits>
 #include <optional>
 #include <span>
 #include <string>
+#include <string_view>
 #include <unordered_set>
 #include <vector>
 
@@ -29,8 +29,7 @@ public:
 
   FolderSet(const FolderSet&) = delete;
   FolderSet& operator=(const FolderSet&) = delete;
-  /// Writes the lines that are left after a failure.
-  ~FolderSet();
+  ~FolderSet() = default;
 
   /// Applies the folders, in the order of their paths. Ends early when a stop is requested.
   void Apply(std::span<const MergeItem> folders);

@@ -26,7 +26,7 @@ private:
   }
 
   void do_deallocate(void* block, std::size_t bytes, std::size_t alignment) override {
-    ::operator delete(block, bytes, std::align_val_t(bytes < HUGE_PAGE ? alignment : HUGE_PAGE));
+    ::operator delete(block, std::align_val_t(bytes < HUGE_PAGE ? alignment : HUGE_PAGE));
   }
 
   bool do_is_equal(const std::pmr::memory_resource& other) const noexcept override {

@@ -3,6 +3,7 @@
 #include "MergeList.h"
 
 #include <algorithm>
+#include <functional>
 #include <tuple>
 
 namespace orva::dbmerger {

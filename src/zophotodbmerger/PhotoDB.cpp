@@ -7,6 +7,7 @@
 #include "StandardOutput.h"
 #include "Statistics.h"
 
+#include "orvadb/ErrorMessage.h"
 #include "orvadb/File.h"
 #include "orvadb/Folder.h"
 #include "orvadb/Statement.h"
@@ -175,8 +176,18 @@ bool HasObject(const PhotoDB& photos, std::string create) {
   return query.Fetch();
 }
 
-/// Whether new folders and files get positive ids.
+/// Whether new folders and files get positive ids. Throws std::string if SQLite would search long
+/// for the next one, each time.
 bool HasOwnSequences(const PhotoDB& photos) {
+  constexpr long long mostSequences = 1'000;
+  if (!HasObject(photos, "CREATE TABLE IF NOT EXISTS sqlite_sequence(name,seq)")) {
+    return false;
+  }
+  Statement count(photos, "SELECT count(*) FROM main.sqlite_sequence");
+  if (count.Fetch() && count.GetInt64(0) > mostSequences) {
+    throw db::ErrorMessage(
+        util::FormatString("too many sequences in '%s'", photos.GetPath().c_str()));
+  }
   Statement query(photos, "SELECT 1 FROM main.sqlite_sequence WHERE name IN ('Folders', 'Files') "
                           "AND (typeof(seq) != 'integer' OR seq < 0)");
   return !query.Fetch();
@@ -438,6 +449,7 @@ void PhotoDB::AddFile(const std::string& volume, db::File& file) const {
 
 void PhotoDB::DeleteFolder(const std::string& volume, db::Folder& folder) const {
   StandardOutput& output = StandardOutput::Current();
+  const FlushAtEnd flush(output);
   output.WriteLine({"Deleting ", folder.path});
   const std::optional<long long> folderId = FindFolder(folder.path, volume);
   if (folderId) {
@@ -454,6 +466,7 @@ void PhotoDB::DeleteFolder(const std::string& volume, db::Folder& folder) const 
 
 void PhotoDB::DeleteFile(const std::string& /*volume*/, db::File& file) const {
   StandardOutput& output = StandardOutput::Current();
+  const FlushAtEnd flush(output);
   output.WriteLine({"Deleting ", file.path});
   const std::optional<long long> folderId = FindFolder(FolderPath(file.path));
   if (folderId) {

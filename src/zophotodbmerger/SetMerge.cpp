@@ -63,6 +63,7 @@ void SetMerge::ApplySingleFolders(const MergeList& folders) const {
 
 std::time_t SetMerge::ApplySingleFiles(const MergeList& files, std::time_t since) const {
   StandardOutput& output = StandardOutput::Current();
+  const FlushAtEnd flush(output);
   std::time_t newest = since;
   for (const MergeItem& row : files.Items()) {
     if (stopRequested_) {
@@ -84,7 +85,6 @@ std::time_t SetMerge::ApplySingleFiles(const MergeList& files, std::time_t since
     }
     newest = std::max<std::time_t>(newest, row.updated);
   }
-  output.Flush();
   return newest;
 }
 

@@ -11,6 +11,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <cstddef>
 
 namespace orva::dbmerger {
 
@@ -28,6 +29,19 @@ bool IsNullDevice(const struct stat& status) {
   return S_ISCHR(status.st_mode) && status.st_rdev == makedev(memoryDevices, null);
 }
 
+bool IsStreamSocket() {
+  int type = 0;
+  socklen_t size = sizeof type;
+  return getsockopt(STDOUT_FILENO, SOL_SOCKET, SO_TYPE, &type, &size) == 0 && type == SOCK_STREAM;
+}
+
+/// A pipe or terminal is opened again: O_NONBLOCK belongs to the open file description, which
+/// standard output shares with other processes. Where that fails, writing may block.
+util::FileDescriptor OpenAgain() {
+  return util::FileDescriptor(
+      open("/proc/self/fd/1", O_WRONLY | O_APPEND | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
+}
+
 } // namespace
 
 StandardOutput& StandardOutput::Current() {
@@ -41,9 +55,13 @@ void StandardOutput::Inspect() {
   if (fstat(STDOUT_FILENO, &status) != 0 || IsNullDevice(status)) {
     kind_ = Kind::Null;
     pending_.clear();
+    own_.Reset();
     return;
   }
   if (kind_ != Kind::Null && status.st_dev == device_ && status.st_ino == inode_) {
+    if (kind_ == Kind::Stream && !own_) {
+      own_ = OpenAgain(); // a FIFO may have a reader now
+    }
     return;
   }
   device_ = status.st_dev;
@@ -55,12 +73,10 @@ void StandardOutput::Inspect() {
   if (S_ISREG(status.st_mode)) {
     kind_ = Kind::File;
   } else if (S_ISSOCK(status.st_mode)) {
-    kind_ = Kind::Socket;
+    kind_ = IsStreamSocket() ? Kind::Socket : Kind::Datagrams;
   } else {
     kind_ = Kind::Stream;
-    // A pipe or terminal is opened again: O_NONBLOCK belongs to the open file description, which
-    // standard output shares with other processes. Where that fails, writing may block.
-    own_.Reset(open("/proc/self/fd/1", O_WRONLY | O_APPEND | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
+    own_ = OpenAgain();
   }
 }
 
@@ -68,11 +84,16 @@ void StandardOutput::WriteLine(std::initializer_list<std::string_view> pieces) {
   if (IsNull()) {
     return;
   }
+  std::size_t size = 1;
+  for (const std::string_view piece : pieces) {
+    size += piece.size();
+  }
+  pending_.reserve(pending_.size() + size); // a failure must not leave half a line
   for (const std::string_view piece : pieces) {
     pending_ += piece;
   }
   pending_ += '\n';
-  if (pending_.size() >= MOST_PENDING) {
+  if (pending_.size() >= MOST_PENDING || kind_ == Kind::Datagrams) {
     Flush();
   }
 }
@@ -100,7 +121,7 @@ void StandardOutput::Flush() {
 }
 
 ssize_t StandardOutput::Send(std::string_view text) const {
-  if (kind_ == Kind::Socket) {
+  if (kind_ == Kind::Socket || kind_ == Kind::Datagrams) {
     return send(STDOUT_FILENO, text.data(), text.size(), MSG_DONTWAIT | MSG_NOSIGNAL);
   }
   return write(own_ ? own_.Get() : STDOUT_FILENO, text.data(), text.size());

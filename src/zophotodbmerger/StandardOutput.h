@@ -10,9 +10,9 @@
 
 namespace orva::dbmerger {
 
-/// The lines on standard output. They are collected and written in few calls: whoever changes what
-/// a line announces calls Flush first, and nothing is kept back when an operation returns. One
-/// thread at a time.
+/// The lines on standard output. They are collected and written in few calls. A caller flushes
+/// before it changes what its lines announce, and before it returns (FlushAtEnd). One thread at a
+/// time.
 ///
 /// A line that cannot be written is lost: a closed output is ignored, and a reader that has stopped
 /// reading is waited for once and then loses lines until it reads again. It never gets a part of a
@@ -37,7 +37,7 @@ public:
   void Flush();
 
 private:
-  enum class Kind { Null, File, Socket, Stream };
+  enum class Kind { Null, File, Socket, Datagrams, Stream };
 
   void Inspect();
   ssize_t Send(std::string_view text) const;
@@ -50,6 +50,18 @@ private:
   std::string pending_;
   bool isInLine_ = false;  ///< the last byte written was not the end of a line
   bool isStalled_ = false; ///< the reader has stopped reading
+};
+
+/// Flushes the output when a scope ends, also by an exception.
+class FlushAtEnd {
+public:
+  explicit FlushAtEnd(StandardOutput& output) : output_(output) {}
+  FlushAtEnd(const FlushAtEnd&) = delete;
+  FlushAtEnd& operator=(const FlushAtEnd&) = delete;
+  ~FlushAtEnd() { output_.Flush(); }
+
+private:
+  StandardOutput& output_;
 };
 
 } // namespace orva::dbmerger

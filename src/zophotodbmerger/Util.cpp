@@ -9,6 +9,7 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <string_view>
 
 namespace orva::dbmerger {
 

@@ -212,7 +212,7 @@ Lines FaultTest::ContentAfterDeletion() {
         "DELETE FROM Files WHERE volume = ?", "DELETE FROM Folders WHERE volume = ?"}) {
     Database(DATABASE).Run(sql, {VOLUME});
   }
-  const Lines content = Content();
+  Lines content = Content();
   RestoreFiles(files);
   return content;
 }

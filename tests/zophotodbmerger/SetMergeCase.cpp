@@ -315,9 +315,9 @@ private:
 
   std::string Number(long long number) {
     // The least integer is no literal.
-    const std::string text = number == std::numeric_limits<long long>::min()
-                                 ? "(-9223372036854775807 - 1)"
-                                 : std::to_string(number);
+    std::string text = number == std::numeric_limits<long long>::min()
+                           ? "(-9223372036854775807 - 1)"
+                           : std::to_string(number);
     if (oddValues_ && OneIn(4)) {
       switch (Below(3)) {
       case 0:
@@ -400,7 +400,7 @@ private:
         "UPDATE sqlite_sequence SET seq = 9223372036854775804",
         "INSERT INTO sqlite_sequence VALUES('Files', 2), ('Folders', 3)"};
     // A schema without AUTOINCREMENT may have no such table.
-    sql.push_back("CREATE TABLE sequenced(id INTEGER PRIMARY KEY AUTOINCREMENT)");
+    sql.emplace_back("CREATE TABLE sequenced(id INTEGER PRIMARY KEY AUTOINCREMENT)");
     sql.push_back(Any(changes));
     // Without its last row a table may use an id again.
     if (OneIn(2)) {

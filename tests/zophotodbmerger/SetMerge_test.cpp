@@ -65,7 +65,7 @@ TEST(SetMergeTest, StoppedMergesHaveAppliedTheFirstRows) {
 
 // What the random cases seldom have.
 
-const std::string VOLUME = "/shares/A/";
+const std::string VOLUME_A = "/shares/A/";
 
 CatalogRow File(const std::string& folder, const std::string& name, bool isDeleted = false) {
   return {.path = folder + name, .name = name, .isDeleted = isDeleted};
@@ -86,21 +86,21 @@ TEST(SetMergeTest, RemovalWithoutAFolderRemovesFromAFolderWithTheIdThatStandsFor
            "'/shares/A/b/', 0, '/shares/A/')",
            "INSERT INTO Files VALUES(1, -1, 'n', 0, '/shares/A/', 0), (2, -1, 'm', 0, "
            "'/shares/A/', 0)"},
-          {{.volume = VOLUME,
+          {{.volume = VOLUME_A,
             .files = {File("/shares/A/a/", "m", true), File("/shares/A/a/", "n", true),
                       File("/shares/A/b/", "m"), File("/shares/A/b/", "n")}}});
 }
 
 TEST(SetMergeTest, FolderStoredUnderAVolumeOfBytesIsNotOnTheVolume) {
   Compare({"INSERT INTO Folders VALUES(5, 1, '/shares/A/a/', 1, CAST('/shares/A/' AS BLOB))"},
-          {{.volume = VOLUME, .files = {File("/shares/A/a/", "n")}}});
+          {{.volume = VOLUME_A, .files = {File("/shares/A/a/", "n")}}});
 }
 
 TEST(SetMergeTest, NewFolderMayGetTheIdThatStandsForNone) {
-  Compare(
-      {"INSERT INTO Folders VALUES(-2, 1, '/shares/A/b/', 1, '/shares/A/')",
-       "UPDATE sqlite_sequence SET seq = -5"},
-      {{.volume = VOLUME, .folders = {{.path = "/shares/A/b/c/"}, {.path = "/shares/A/b/c/d/"}}}});
+  Compare({"INSERT INTO Folders VALUES(-2, 1, '/shares/A/b/', 1, '/shares/A/')",
+           "UPDATE sqlite_sequence SET seq = -5"},
+          {{.volume = VOLUME_A,
+            .folders = {{.path = "/shares/A/b/c/"}, {.path = "/shares/A/b/c/d/"}}}});
 }
 
 TEST(SetMergeTest, NewFolderMayGetTheIdOfARemovedOne) {
@@ -111,7 +111,7 @@ TEST(SetMergeTest, NewFolderMayGetTheIdOfARemovedOne) {
     Compare({"INSERT INTO Folders VALUES(1, -1, '/shares/A/', 1, '/shares/A/'), (2, 1, "
              "'/shares/A/b/', 1, '/shares/A/')",
              change},
-            {{.volume = VOLUME,
+            {{.volume = VOLUME_A,
               .folders = {removed, folder, folder, removed, folder, removed, removed, folder}}});
   }
 }
@@ -176,12 +176,13 @@ private:
 
 TEST(SetMergeTest, RowsThatOthersAddBetweenTransactionsAreSeen) {
   CountedPhotoDB photos;
-  photos.Merge({.volume = VOLUME, .folders = {{.path = VOLUME}}, .files = {File(VOLUME, "a")}});
+  photos.Merge(
+      {.volume = VOLUME_A, .folders = {{.path = VOLUME_A}}, .files = {File(VOLUME_A, "a")}});
   Database(photos.GetPath())
       .Run("INSERT INTO Files(folder_id, name, modified_date, volume, created_date) VALUES(2, 'b', "
            "0, '/shares/A/', 0)");
-  photos.Merge(
-      {.volume = VOLUME, .files = {File(VOLUME, "a"), File(VOLUME, "b"), File(VOLUME, "c")}});
+  photos.Merge({.volume = VOLUME_A,
+                .files = {File(VOLUME_A, "a"), File(VOLUME_A, "b"), File(VOLUME_A, "c")}});
   EXPECT_EQ(3, photos.CountFiles());
 }
 
@@ -191,9 +192,9 @@ std::string Numbered(const std::string& text, int number) {
 
 /// Folders that all have files of the same names, as cameras give them.
 CatalogMerge Camera(int folders, int files, bool areDeleted = false) {
-  CatalogMerge merge{.volume = VOLUME, .folders = {{.path = VOLUME}}};
+  CatalogMerge merge{.volume = VOLUME_A, .folders = {{.path = VOLUME_A}}};
   for (int folder = 0; folder < folders; ++folder) {
-    const std::string path = VOLUME + Numbered("", folder) + "/";
+    const std::string path = VOLUME_A + Numbered("", folder) + "/";
     merge.folders.push_back({.path = path});
     for (int file = 0; file < files; ++file) {
       merge.files.push_back(File(path, Numbered("IMG_", file), areDeleted));
@@ -203,9 +204,9 @@ CatalogMerge Camera(int folders, int files, bool areDeleted = false) {
 }
 
 CatalogMerge Flat(int begin, int end, int step = 1, bool areDeleted = false) {
-  CatalogMerge merge{.volume = VOLUME, .folders = {{.path = VOLUME}}};
+  CatalogMerge merge{.volume = VOLUME_A, .folders = {{.path = VOLUME_A}}};
   for (int file = begin; file < end; file += step) {
-    merge.files.push_back(File(VOLUME, Numbered("p", file), areDeleted));
+    merge.files.push_back(File(VOLUME_A, Numbered("p", file), areDeleted));
   }
   return merge;
 }
@@ -270,10 +271,10 @@ TEST(SetMergeCostTest, FewFilesWithCommonNamesDoNotCostMoreWhereThereAreMoreFold
     const auto measure = [&](int count) {
       CountedPhotoDB photos;
       photos.Merge(Camera(count, 3));
-      CatalogMerge merge{.volume = VOLUME};
+      CatalogMerge merge{.volume = VOLUME_A};
       for (int file = 0; file < 3; ++file) {
         merge.files.push_back(
-            File(VOLUME + Numbered("", 5) + "/", Numbered("IMG_", file), areDeleted));
+            File(VOLUME_A + Numbered("", 5) + "/", Numbered("IMG_", file), areDeleted));
       }
       const Cost cost = photos.Merge(merge);
       EXPECT_EQ(3 * count - (areDeleted ? 3 : 0), photos.CountFiles());
@@ -323,10 +324,10 @@ TEST(SetMergeCostTest, PathThatIsAddedAndRemovedInTurnsCostsInProportion) {
   ExpectProportionalCost([](int count) {
     CountedPhotoDB photos;
     photos.Merge(Flat(0, count));
-    CatalogMerge merge{.volume = VOLUME};
+    CatalogMerge merge{.volume = VOLUME_A};
     for (int turn = 0; turn < count; ++turn) {
-      merge.files.push_back(File(VOLUME, "p", turn % 2 != 0));
-      merge.folders.push_back({.path = VOLUME + "f/", .isDeleted = turn % 2 != 0});
+      merge.files.push_back(File(VOLUME_A, "p", turn % 2 != 0));
+      merge.folders.push_back({.path = VOLUME_A + "f/", .isDeleted = turn % 2 != 0});
     }
     return photos.Merge(merge);
   });
@@ -336,9 +337,9 @@ TEST(SetMergeCostTest, RemovalsOfOneFolderCostInProportion) {
   ExpectProportionalCost([](int count) {
     CountedPhotoDB photos;
     photos.Merge(Flat(0, count));
-    CatalogMerge merge{.volume = VOLUME};
+    CatalogMerge merge{.volume = VOLUME_A};
     for (int turn = 0; turn < count; ++turn) {
-      merge.folders.push_back({.path = VOLUME, .isDeleted = true});
+      merge.folders.push_back({.path = VOLUME_A, .isDeleted = true});
     }
     const Cost cost = photos.Merge(merge);
     EXPECT_EQ(0, photos.CountFiles());
@@ -355,12 +356,12 @@ TEST(SetMergeCostTest, ManyRowsOfOneFolderCostInProportion) {
           "WITH RECURSIVE n(i) AS (SELECT 1 UNION ALL SELECT i + 1 FROM n WHERE i < " +
           std::to_string(count) +
           ") INSERT INTO Folders(parent_folder_id, name, modified_date, volume) SELECT 1, '" +
-          VOLUME + "', 0, iif(i % 2, '" + VOLUME + "', '/shares/B/') FROM n");
+          VOLUME_A + "', 0, iif(i % 2, '" + VOLUME_A + "', '/shares/B/') FROM n");
       photos.Run("INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT "
                  "folder_id, 'p10001', 0, volume, 0 FROM Folders");
       CatalogMerge merge = Flat(0, count, 1, areDeleted);
       for (int turn = 0; turn < count; ++turn) {
-        merge.folders.push_back({.path = VOLUME, .isDeleted = areDeleted});
+        merge.folders.push_back({.path = VOLUME_A, .isDeleted = areDeleted});
       }
       return photos.Merge(merge);
     });

@@ -143,7 +143,8 @@ TEST(StandardOutputTest, MegabytesOfLinesArriveCompletely) {
       const Redirected redirected(std::move(output.writer));
       StandardOutput& lines = StandardOutput::Current();
       for (int number = 0; written.size() < (8U << 20); ++number) {
-        const std::string text = std::to_string(number) + std::string(number % 700, '.');
+        const std::string text =
+            std::to_string(number) + std::string(static_cast<std::size_t>(number % 700), '.');
         lines.WriteLine({"Adding file ", text});
         written += "Adding file " + text + "\n";
       }

@@ -25,7 +25,7 @@ protected:
   void TearDown() override { EXPECT_THAT(Logged(), IsEmpty()) << "the locator is never logged"; }
 };
 
-std::string Content(const std::string& path) {
+std::string LocatorContent(const std::string& path) {
   std::ifstream file(path, std::ios::binary);
   return {std::istreambuf_iterator<char>(file), {}};
 }
@@ -62,7 +62,7 @@ TEST_F(LocatorTest, LinkInItsPlaceIsNotFollowed) {
   std::ofstream("/tmp/precious") << "keep";
   std::filesystem::create_symlink("/tmp/precious", LOCATOR_PATH);
   updateLocatorFile("/shares/Vol/");
-  EXPECT_EQ("keep", Content("/tmp/precious"));
+  EXPECT_EQ("keep", LocatorContent("/tmp/precious"));
   EXPECT_TRUE(std::filesystem::is_symlink(LOCATOR_PATH));
 }
 
