@@ -347,6 +347,36 @@ TEST(SetMergeCostTest, RemovalsOfOneFolderCostInProportion) {
   });
 }
 
+TEST(SetMergeCostTest, RemovedFoldersCostInProportionWithAnIndexOfAnotherProgram) {
+  ExpectProportionalCost([](int count) {
+    CountedPhotoDB photos;
+    CatalogMerge merge = Camera(count, 1);
+    photos.Merge(merge);
+    photos.Run("CREATE INDEX volumes ON Folders(volume)");
+    for (CatalogRow& folder : merge.folders) {
+      folder.isDeleted = true;
+    }
+    const Cost cost = photos.Merge({.volume = VOLUME_A, .folders = merge.folders});
+    EXPECT_EQ(0, photos.CountFiles());
+    return cost;
+  });
+}
+
+TEST(SetMergeCostTest, StatisticsOfTheDatabaseDoNotMakeRemovalsExpensive) {
+  const auto measure = [](int count) {
+    CountedPhotoDB photos;
+    photos.Merge(Flat(0, count));
+    photos.Run("ANALYZE");
+    photos.Run("DELETE FROM sqlite_stat1");
+    photos.Run("INSERT INTO sqlite_stat1 VALUES('Files', 'Files_folderId', '1000000 1000000'), "
+               "('Folders', 'Folders_path', '1000000 1000000')");
+    photos.Run("ANALYZE sqlite_schema");
+    return photos.Merge(
+        {.volume = VOLUME_A, .folders = {{.path = VOLUME_A + "none/", .isDeleted = true}}});
+  };
+  EXPECT_LE(measure(LARGE).steps, measure(SMALL).steps * 11 / 10);
+}
+
 TEST(SetMergeCostTest, ManyRowsOfOneFolderCostInProportion) {
   for (const bool areDeleted : {false, true}) {
     ExpectProportionalCost([&](int count) {

@@ -398,6 +398,36 @@ TEST(StandardOutputTest, FullFileSystemLosesWholeLines) {
   umount2("/tmp/full", MNT_DETACH);
 }
 
+TEST(StandardOutputTest, FifoThatGetsItsReaderLaterIsNotWaitedForPermanently) {
+  const char* const path = "/tmp/fifo";
+  std::filesystem::remove(path);
+  std::signal(SIGPIPE, SIG_IGN); // as the daemon does when it starts
+  ASSERT_EQ(0, mkfifo(path, 0600));
+  FileDescriptor reader(open(path, O_RDONLY | O_NONBLOCK));
+  const Redirected redirected(FileDescriptor(open(path, O_WRONLY)));
+  reader.Reset();
+  WriteLine({"lost"});
+  reader.Reset(open(path, O_RDONLY | O_NONBLOCK));
+  const std::string text(1 << 20, 'x');
+  WriteLine({text}); // returns, although nobody reads
+  EXPECT_THAT(Drain(reader), ::testing::StartsWith("xxx"));
+}
+
+TEST(StandardOutputTest, DatagramSocketGetsOneLineAMessage) {
+  std::array<int, 2> ends{};
+  ASSERT_EQ(0, socketpair(AF_UNIX, SOCK_DGRAM, 0, ends.data()));
+  const FileDescriptor reader(ends[0]);
+  {
+    const Redirected redirected{FileDescriptor(ends[1])};
+    StandardOutput& output = StandardOutput::Current();
+    output.WriteLine({"one"});
+    output.WriteLine({"two"});
+  }
+  std::array<char, 64> message{};
+  EXPECT_EQ(4, recv(reader.Get(), message.data(), message.size(), MSG_DONTWAIT));
+  EXPECT_EQ(4, recv(reader.Get(), message.data(), message.size(), MSG_DONTWAIT));
+}
+
 TEST(StandardOutputTest, NextOutputGetsNoRestOfALine) {
   Channel output = MakePipe();
   std::string half;
