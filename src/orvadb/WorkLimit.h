@@ -18,7 +18,7 @@ public:
   WorkLimit& operator=(const WorkLimit&) = delete;
   ~WorkLimit();
 
-  /// A statement begins: counts its work from zero.
+  /// A statement begins: counts the work from zero, also for statements that are still in use.
   void Restart() noexcept;
 
   /// The statement was given one more row of ours: allows it the work for that.

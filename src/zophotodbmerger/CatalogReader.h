@@ -21,7 +21,7 @@ struct PhotoCounts {
   int total = 0;
 };
 
-// The three reads of a merge. Each takes the volume's mount point and its open catalog, and does
+// Reads of a catalog. Each takes the volume's mount point and its open catalog, and does
 // not change the catalog. Lists have full paths, made from the catalog's relative ones, and are
 // sorted by them (FolderItemCmp). A failed step ends a list early; committing the transaction of
 // the reads then fails. Throws std::string.
@@ -36,7 +36,8 @@ util::OwnerVector<db::Folder> ReadFolders(const std::string& volumeMountPoint,
 util::OwnerVector<db::File> ReadChangedFiles(const std::string& volumeMountPoint,
                                              const db::VolumeDB& catalog, std::time_t since);
 
-/// The same lists as a merge keeps them.
+// The same lists in the form that a merge uses.
+
 MergeList ListFolders(const std::string& volumeMountPoint, const db::VolumeDB& catalog);
 MergeList ListChangedFiles(const std::string& volumeMountPoint, const db::VolumeDB& catalog,
                            std::time_t since);

@@ -135,7 +135,7 @@ void FileSet::FindFolders() {
     if (files_[file].isDeleted) {
       entry.isSourceFound = group.folderCount != 0;
       if (group.source == NO_FOLDER) {
-        entry.group = StrayGroup();
+        entry.group = GroupWithoutFolder();
       }
     } else if (group.target == NO_FOLDER) {
       entry.group = NONE;
@@ -155,20 +155,20 @@ void FileSet::FindFoldersOf(Group& group, FolderFinder& finder) {
   group.folderCount = static_cast<Index>(ids.size());
   folderIds_.insert(folderIds_.end(), ids.begin(), ids.end());
   if (std::ranges::find(ids, NO_FOLDER) != ids.end()) {
-    strayHome_ = static_cast<Index>(&group - groups_.data());
+    groupOfNoFolder_ = static_cast<Index>(&group - groups_.data());
   }
 }
 
-FileSet::Index FileSet::StrayGroup() {
-  if (strays_ == NONE) {
-    strays_ = static_cast<Index>(groups_.size());
+FileSet::Index FileSet::GroupWithoutFolder() {
+  if (groupWithoutFolder_ == NONE) {
+    groupWithoutFolder_ = static_cast<Index>(groups_.size());
     groups_.push_back({.target = NO_FOLDER,
                        .source = NO_FOLDER,
                        .firstFolder = static_cast<Index>(folderIds_.size()),
                        .folderCount = 1});
     folderIds_.push_back(NO_FOLDER);
   }
-  return strays_;
+  return groupWithoutFolder_;
 }
 
 // A counting sort: the files of a group stay in the order of the list.
@@ -265,35 +265,35 @@ void FileSet::Remove(Index file) {
   const Index first = entries_[file].name;
   Entry& name = entries_[first];
   const Group& group = groups_[name.group];
-  taken_.clear();
+  idsToRemove_.clear();
   if (name.isAdded && group.source == group.target) {
     Flush(); // gives it its id
-    taken_.push_back(addedIds_[first]);
+    idsToRemove_.push_back(addedIds_[first]);
     name.isAdded = false;
   }
-  if (!name.isSwept) {
+  if (!name.isSourceTaken) {
     TakeFound(name, group.source);
-    name.isSwept = true;
+    name.isSourceTaken = true;
   }
-  if (taken_.empty()) {
+  if (idsToRemove_.empty()) {
     return;
   }
   if (!additions_.empty()) {
     Flush();
   }
-  removals_.insert(removals_.end(), taken_.begin(), taken_.end());
-  if (name.group == strays_ && strayHome_ != NONE) {
-    TakeFromStrayHome(files_[file].Name());
+  removals_.insert(removals_.end(), idsToRemove_.begin(), idsToRemove_.end());
+  if (name.group == groupWithoutFolder_ && groupOfNoFolder_ != NONE) {
+    TakeFromNoFolder(files_[file].Name());
   }
 }
 
-// Moves the files that were found in the folder from the entry to taken_.
+// Moves the files that were found in the folder from the entry to idsToRemove_.
 void FileSet::TakeFound(Entry& name, long long folderId) {
   Index* link = &name.found;
   while (*link != NONE) {
     const Found& found = found_[*link];
     if (found.folderId == folderId) {
-      taken_.push_back(found.id);
+      idsToRemove_.push_back(found.id);
       name.ownCount -= found.isOwn ? 1 : 0;
       *link = found.next;
     } else {
@@ -302,8 +302,8 @@ void FileSet::TakeFound(Entry& name, long long folderId) {
   }
 }
 
-void FileSet::TakeFromStrayHome(std::string_view name) {
-  const Group& home = groups_[strayHome_];
+void FileSet::TakeFromNoFolder(std::string_view name) {
+  const Group& home = groups_[groupOfNoFolder_];
   const std::span<const Index> files(byGroup_.begin() + home.begin, byGroup_.begin() + home.end);
   const auto found =
       std::ranges::lower_bound(files, name, {}, [this](Index file) { return files_[file].Name(); });

@@ -61,7 +61,7 @@ private:
     Index ownCount = 0; ///< how many of them are on the volume
     bool isSourceFound = false; ///< the path of a removal has a folder
     bool isAdded = false;       ///< by this list
-    bool isSwept = false;       ///< no file that was found is left in the source
+    bool isSourceTaken = false; ///< no file that was found is left in the source
   };
 
   /// A file of the merged database with the name of an entry.
@@ -76,7 +76,7 @@ private:
   void MakeGroups();
   void FindFolders();
   void FindFoldersOf(Group& group, FolderFinder& finder);
-  Index StrayGroup();
+  Index GroupWithoutFolder();
   void SortByGroup();
   void NameFiles(const Group& group);
   void FindFiles(const Group& group, NameFinder& finder);
@@ -85,7 +85,7 @@ private:
   void Add(Index file);
   void Remove(Index file);
   void TakeFound(Entry& name, long long folderId);
-  void TakeFromStrayHome(std::string_view name);
+  void TakeFromNoFolder(std::string_view name);
   void Flush();
   void DeleteFiles();
 
@@ -102,16 +102,16 @@ private:
   std::pmr::vector<Found> found_{LargeBlocks()};
 
   /// Removals without a folder: as from a folder with an id that stands for it.
-  Index strays_ = NONE;
+  Index groupWithoutFolder_ = NONE;
   /// The group whose path has a folder with that id, too.
-  Index strayHome_ = NONE;
+  Index groupOfNoFolder_ = NONE;
 
   std::pmr::vector<Index> additions_{LargeBlocks()}; ///< the current set, if it is one of additions
   std::pmr::vector<long long> removals_{
       LargeBlocks()}; ///< the current set, if it is one of removals
   std::pmr::vector<long long> addedIds_{
-      LargeBlocks()};            ///< of each entry; empty if the list has no removals
-  std::vector<long long> taken_; ///< ids of the files that an entry removes
+      LargeBlocks()};                  ///< of each entry; empty if the list has no removals
+  std::vector<long long> idsToRemove_; ///< ids of the files that an entry removes
 };
 
 } // namespace orva::dbmerger

@@ -50,7 +50,7 @@ private:
 };
 
 std::optional<long long>
-FolderSet::Candidates::First(const std::unordered_set<long long>& removed) {
+FolderSet::Candidates::FirstLeft(const std::unordered_set<long long>& removed) {
   while (next_ < ids_.size() && removed.contains(ids_[next_])) {
     ++next_;
   }
@@ -80,7 +80,7 @@ void FolderSet::ApplyPath(std::span<const MergeItem> folders) {
     ancestors_.pop_back();
   }
   removed_ = std::unordered_set<long long>(); // clear() would keep its buckets
-  if (isStrayRemoved_) {
+  if (isNoFolderRemoved_) {
     removed_.insert(NO_FOLDER);
   }
   const std::span<const long long> ids = finder_.Find(path);
@@ -101,7 +101,7 @@ void FolderSet::ApplyPath(std::span<const MergeItem> folders) {
       Add(folder);
     }
   }
-  ancestors_.push_back({.path = path, .id = any_.First(removed_), .addition = addition_});
+  ancestors_.push_back({.path = path, .id = any_.FirstLeft(removed_), .addition = addition_});
 }
 
 void FolderSet::FindOwn(std::string_view path) {
@@ -116,7 +116,7 @@ void FolderSet::FindOwn(std::string_view path) {
 }
 
 void FolderSet::Add(const MergeItem& folder) {
-  if (addition_ != NONE || any_.First(removed_)) {
+  if (addition_ != NONE || any_.FirstLeft(removed_)) {
     return;
   }
   const Addition addition = MakeAddition(folder);
@@ -137,7 +137,7 @@ FolderSet::Addition FolderSet::MakeAddition(const MergeItem& folder) {
   if (parent == ancestors_.end() || parent->path.size() != path.size()) {
     return {.folder = &folder, .parentId = FirstAt(path).value_or(NO_FOLDER)};
   }
-  if (parent->id == NO_FOLDER && isStrayRemoved_) {
+  if (parent->id == NO_FOLDER && isNoFolderRemoved_) {
     parent->id = FirstAt(path); // the next one at its path
   }
   return {
@@ -157,12 +157,12 @@ void FolderSet::Remove(const MergeItem& folder) {
     Flush();
   }
   output_.WriteLine({"Deleting ", folder.Path()});
-  const std::optional<long long> id = own_.First(removed_);
+  const std::optional<long long> id = own_.FirstLeft(removed_);
   if (id) {
     output_.WriteLine({"Found folder ", std::to_string(*id), " for ", folder.Path()});
   }
-  // A missing folder is removed as one with an id that stands for it.
-  isStrayRemoved_ = isStrayRemoved_ || id.value_or(NO_FOLDER) == NO_FOLDER;
+  // A folder that is not found is removed by the id NO_FOLDER, which a row may have.
+  isNoFolderRemoved_ = isNoFolderRemoved_ || id.value_or(NO_FOLDER) == NO_FOLDER;
   removed_.insert(id.value_or(NO_FOLDER));
   removals_.push_back(id.value_or(NO_FOLDER));
 }

@@ -60,7 +60,7 @@ private:
       ids_.assign(ids.begin(), ids.end());
       next_ = 0;
     }
-    std::optional<long long> First(const std::unordered_set<long long>& removed);
+    std::optional<long long> FirstLeft(const std::unordered_set<long long>& removed);
 
   private:
     std::vector<long long> ids_;
@@ -85,7 +85,8 @@ private:
   std::vector<Ancestor> ancestors_; ///< each path is the beginning of the next one
   std::vector<Addition> additions_; ///< the current set, if it is one of additions
   std::vector<long long> removals_; ///< the current set, if it is one of removals
-  bool isStrayRemoved_ = false;     ///< a missing folder was removed: nothing has its id any more
+  /// A folder that was not found was removed by the id NO_FOLDER, which a row may have had.
+  bool isNoFolderRemoved_ = false;
 
   // Of the current path.
   Candidates any_;

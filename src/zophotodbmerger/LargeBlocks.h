@@ -4,8 +4,8 @@
 
 namespace orva::dbmerger {
 
-/// Memory for lists of millions of rows: asks the system for huge pages, which saves most of the
-/// time that first uses of pages take. Any thread.
+/// Memory for lists of millions of rows. Asks the system for huge pages: the first use of each page
+/// takes time. Any thread.
 std::pmr::memory_resource* LargeBlocks() noexcept;
 
 } // namespace orva::dbmerger

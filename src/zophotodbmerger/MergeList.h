@@ -63,7 +63,7 @@ private:
   std::unique_ptr<std::pmr::monotonic_buffer_resource> pool_ =
       std::make_unique<std::pmr::monotonic_buffer_resource>(LargeBlocks());
   std::pmr::vector<MergeItem> items_{LargeBlocks()};
-  std::vector<std::size_t> runs_; ///< where items begin that are in order, but for the first ones
+  std::vector<std::size_t> runs_; ///< where the second and each later run of items in order begins
 };
 
 } // namespace orva::dbmerger

@@ -89,7 +89,8 @@ public:
   void AddFolder(std::string volume, db::Folder& folder) const;
 
   /// Removes every folder but the root, every file and all statistics, in one transaction, and then
-  /// compacts the file. In a transaction of the caller it takes part in that and does not compact.
+  /// compacts the file: when only that fails, the rows are removed. In a transaction of the caller
+  /// it takes part in that and does not compact.
   void DeleteVolumes() const;
 
   /// Removes the folders and files of `volume`; its statistics stay, but its next merge starts

@@ -9,7 +9,7 @@ namespace orva::dbmerger {
 class MergeList;
 class PhotoDB;
 
-/// Applies the lists of one merge to the merged database, folders before files, with one statement
+/// Applies the lists of one merge to the merged database, folders before files, with few statements
 /// for each run of additions or removals. Rows, ids and lines are the same as with the operations
 /// of PhotoDB on single rows, in the order of the lists. Lives in one transaction on the database.
 /// Throws std::string.

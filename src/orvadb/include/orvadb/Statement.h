@@ -27,8 +27,8 @@ public:
   /// destroyed. The text must stay valid as long as the statement.
   Statement(const DB& db, const char* sql, const char* file = __builtin_FILE(),
             unsigned int line = __builtin_LINE());
-  /// The same for a statement that reads `rows` as the table temp.input. It may change ordinary
-  /// tables only, which its user has made sure of. Until it is destroyed, there is no other such
+  /// The same for a statement that reads `rows` as the table temp.input. The caller
+  /// makes sure that it changes ordinary tables only. Until it is destroyed, there is no other such
   /// statement on `db`.
   Statement(const DB& db, const char* sql, Rows& rows, const char* file = __builtin_FILE(),
             unsigned int line = __builtin_LINE());
