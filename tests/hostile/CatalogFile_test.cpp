@@ -4,6 +4,8 @@
 #include "HostileTest.h"
 #include "SpecialFile.h"
 
+#include "support/OtherUsers.h"
+
 #include <unistd.h>
 
 #include <filesystem>
@@ -80,6 +82,9 @@ TEST_F(CatalogFileTest, HardLinkAsTheSharedMemoryChangesNoOtherFile) {
 }
 
 TEST_F(CatalogFileTest, HardLinkAsTheJournalChangesNoOtherFile) {
+  if (!HasOtherUsers()) {
+    GTEST_SKIP() << NO_OTHER_USERS;
+  }
   MakeCatalog();
   fs::create_hard_link(VICTIM, CATALOG + "-journal");
   EXPECT_EQ(0, chown(CATALOG.c_str(), 1, 1));
