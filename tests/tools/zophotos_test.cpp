@@ -44,6 +44,13 @@ TEST_F(ZophotosStatus, PrintsOneObjectInJson) {
       "\n");
 }
 
+TEST_F(ZophotosStatus, IsShownWithoutACommand) {
+  ExpectOutput(Zophotos({}), Zophotos({"status"}).output);
+  ExpectOutput(Zophotos({"--json"}), Zophotos({"status", "--json"}).output);
+  Copy();
+  ExpectOutput(OnCopy({}), OnCopy({"status"}).output);
+}
+
 TEST_F(ZophotosStatus, SaysWhenNoVolumeHasBeenMerged) {
   const Database copy = Copy();
   copy.Run("DELETE FROM Statistics");
@@ -365,6 +372,10 @@ TEST_F(ZophotosExport, WritesCsvWithAHeading) {
       "\n"
       R"("/shares/B/Old/1.jpg","/shares/B/",1970-01-02T00:00:00Z,1970-01-02T00:00:00Z)"
       "\n");
+}
+
+TEST_F(ZophotosExport, WritesCsvByDefault) {
+  ExpectOutput(Zophotos({"export"}), Zophotos({"export", "--csv"}).output);
 }
 
 TEST_F(ZophotosExport, WritesOneJsonObjectPerLine) {

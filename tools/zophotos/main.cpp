@@ -1,6 +1,7 @@
 #include "Commands.h"
 #include "Locator.h"
 #include "MergedDatabase.h"
+#include "Suggestion.h"
 #include "Text.h"
 
 #include "commandline/Parse.h"
@@ -16,6 +17,7 @@
 namespace {
 
 using namespace orva::zophotos;
+using orva::commandline::UsageError;
 
 /// The command line.
 class Options {
@@ -30,6 +32,7 @@ public:
         ->check(orva::commandline::NotEmpty());
     app_.add_flag("--json", json_, "Print JSON: one object, or one object per line");
     app_.footer(
+        "Without a command, zophotos shows the status.\n"
         "Exit status: 0 success; 1 damaged, or nothing found; 2 wrong command line; 3 no database "
         "now;\n4 locked, try again; 5 any other error. See zophotos(1).");
     AddCommands();
@@ -38,7 +41,24 @@ public:
   /// Returns false when the arguments ask for help or the version, which are then on standard
   /// output. Throws UsageError.
   bool Parse(std::vector<std::string> arguments) {
-    return orva::commandline::Parse(app_, std::move(arguments));
+    try {
+      if (!orva::commandline::Parse(app_, std::move(arguments), false)) {
+        return false;
+      }
+    } catch (const UsageError& error) {
+      throw UsageError(Explain(error));
+    }
+    if (help_->parsed()) {
+      std::cout << Help();
+      return false;
+    }
+    return true;
+  }
+
+  /// The command whose help is likely to tell what is wrong with the command line.
+  std::string CommandToTry() const {
+    const CLI::App* const command = Command();
+    return command == nullptr || command == help_ ? "zophotos" : "zophotos " + command->get_name();
   }
 
   /// Runs the command. Throws Failure.
@@ -60,9 +80,77 @@ private:
 
   Form OutputForm() const { return json_ ? Form::Json : Form::Text; }
 
+  /// The command on the command line; null if there is none.
+  const CLI::App* Command() const {
+    const auto commands = app_.get_subcommands();
+    return commands.empty() ? nullptr : commands.front();
+  }
+
+  std::vector<std::string> CommandNames() const {
+    std::vector<std::string> names;
+    for (const CLI::App* const command : app_.get_subcommands({})) {
+      names.push_back(command->get_name());
+    }
+    return names;
+  }
+
+  /// The names of the options that the command line may have.
+  std::vector<std::string> OptionNames() const {
+    std::vector<std::string> names;
+    for (const CLI::App* const app : {Command(), static_cast<const CLI::App*>(&app_)}) {
+      if (app != nullptr) {
+        for (const CLI::Option* const option : app->get_options()) {
+          for (const std::string& name : option->get_lnames()) {
+            names.push_back("--" + name);
+          }
+        }
+      }
+    }
+    return names;
+  }
+
+  /// The message for an unknown command or option, otherwise that of `error`.
+  std::string Explain(const UsageError& error) const {
+    const std::vector<std::string> rest = app_.remaining(true);
+    if (rest.empty()) {
+      return error.what();
+    }
+    const std::string& word = rest.front();
+    if (word.starts_with('-')) {
+      std::string text = "unknown option '" + word + "'" + DidYouMean(word, OptionNames());
+      if (find_->parsed()) {
+        text += "; to search for a name that begins with a dash: zophotos find -- '" + word + "'";
+      }
+      return text;
+    }
+    return Command() == nullptr ? UnknownCommand(word) : error.what();
+  }
+
+  std::string UnknownCommand(const std::string& word) const {
+    return "unknown command '" + word + "'" + DidYouMean(word, CommandNames());
+  }
+
+  static std::string DidYouMean(const std::string& word, const std::vector<std::string>& names) {
+    const auto suggestion = Suggest(word, names);
+    return suggestion ? "; did you mean '" + *suggestion + "'?" : "";
+  }
+
+  /// The help that the command `help` prints.
+  std::string Help() const {
+    if (topic_.empty()) {
+      return app_.get_formatter()->make_help(&app_, app_.get_name(), CLI::AppFormatMode::Normal);
+    }
+    const auto commands = app_.get_subcommands(
+        [this](const CLI::App* command) { return command->get_name() == topic_; });
+    if (commands.empty()) {
+      throw UsageError(UnknownCommand(topic_));
+    }
+    return commands.front()->help(app_.get_name());
+  }
+
   ExitStatus RunOn(const std::string& path) const {
     const Form form = OutputForm();
-    if (status_->parsed()) {
+    if (Command() == nullptr || status_->parsed()) {
       return ShowStatus(path, form);
     }
     if (ls_->parsed()) {
@@ -77,7 +165,7 @@ private:
     if (check_->parsed()) {
       return CheckDatabase(path, form);
     }
-    return ExportFiles(path, csv_ ? ExportFormat::Csv : ExportFormat::JsonLines);
+    return ExportFiles(path, jsonLines_ || json_ ? ExportFormat::JsonLines : ExportFormat::Csv);
   }
 
   void AddCommands() {
@@ -107,6 +195,8 @@ private:
     check_ = app_.add_subcommand("check", "Check the database for damage");
     watch_ = app_.add_subcommand("watch", "Print a line for each change until interrupted");
     AddExport();
+    help_ = app_.add_subcommand("help", "Print help, or the help of a command");
+    help_->add_option("COMMAND", topic_, "The command");
     for (CLI::App* const command : app_.get_subcommands({})) {
       command->footer("Options of all commands: zophotos --help");
     }
@@ -114,11 +204,14 @@ private:
 
   void AddExport() {
     export_ = app_.add_subcommand("export", "Print every file with its full path");
-    export_->add_flag("--csv", csv_, "Print comma-separated values with a line of headings");
+    export_->add_flag("--csv", csv_,
+                      "Print comma-separated values with a line of headings (the default)");
     export_->add_flag("--jsonl", jsonLines_, "Print one JSON object per line, like --json");
     export_->callback([this] {
-      if (csv_ == (jsonLines_ || json_)) {
-        throw CLI::ValidationError("export", "needs either --csv or --jsonl");
+      if (csv_ && (jsonLines_ || json_)) {
+        throw CLI::ValidationError("export", std::string("--csv and ") +
+                                                 (jsonLines_ ? "--jsonl" : "--json") +
+                                                 " cannot be combined");
       }
     });
   }
@@ -131,8 +224,10 @@ private:
   CLI::App* check_ = nullptr;
   CLI::App* watch_ = nullptr;
   CLI::App* export_ = nullptr;
+  CLI::App* help_ = nullptr;
   std::string database_;
   std::string folder_;
+  std::string topic_; ///< of help
   Search search_;
   bool json_ = false;
   bool long_ = false;
@@ -149,11 +244,12 @@ int Finish(ExitStatus status) {
 }
 
 ExitStatus Run(std::vector<std::string> arguments) {
+  Options options;
   try {
-    Options options;
     return options.Parse(std::move(arguments)) ? options.Run() : ExitStatus::Success;
-  } catch (const orva::commandline::UsageError& error) {
-    std::cerr << "zophotos: " << Printable(error.what()) << "\nTry 'zophotos --help'.\n";
+  } catch (const UsageError& error) {
+    std::cerr << "zophotos: " << Printable(error.what()) << "\nTry '" << options.CommandToTry()
+              << " --help'.\n";
     return ExitStatus::Usage;
   } catch (const Failure& failure) {
     std::cerr << "zophotos: " << Printable(failure.what()) << '\n';
