@@ -13,6 +13,10 @@ using ::testing::HasSubstr;
 using ::testing::Not;
 using ::testing::StartsWith;
 
+const std::string STATUS_LEGEND =
+    "PHOTOS: transcoded / all of a volume, without hidden ones, at its last merge.\n"
+    "FILES: in the merged database: all transcoded files in visible folders.\n";
+
 class ZophotosStatus : public ZophotosTest {};
 class ZophotosList : public ZophotosTest {};
 class ZophotosTree : public ZophotosTest {};
@@ -20,16 +24,21 @@ class ZophotosFind : public ZophotosTest {};
 class ZophotosExport : public ZophotosTest {};
 
 TEST_F(ZophotosStatus, ShowsTheProgressOfEachVolume) {
-  ExpectOutput(Zophotos({"status"}),
-               "Database  /shares/A//.zophotos/zophotos.db\n"
-               "Version   2.0\n"
-               "Stamped   1970-01-01 00:16:40\n"
-               "\n"
-               "VOLUME      TRANSCODED        PHOTOS  FOLDERS  FILES  MERGED UP TO\n"
-               "/shares/A/  ██████████ 100 %     3/3        3      3  1970-01-01 00:33:22\n"
-               "/shares/B/  ███░░░░░░░  33 %     1/3        2      1  1970-01-01 00:33:23\n"
-               "/shares/C/  -                    0/0        1      0  -\n"
-               "/shares/D/  ░░░░░░░░░░   0 %     0/1        1      0  -\n");
+  ExpectOutput(
+      Zophotos({"status"}),
+      "Database  /shares/A//.zophotos/zophotos.db\n"
+      "Master    /shares/A/\n"
+      "Version   2.0\n"
+      "Emptied   -\n"
+      "\n"
+      "VOLUME               TRANSCODED        PHOTOS  FOLDERS  FILES  MERGED UP TO\n"
+      "/shares/A/ (master)  ██████████ 100 %     3/3        3      3  1970-01-01 00:33:22\n"
+      "/shares/B/           ███░░░░░░░  33 %     1/3        2      1  1970-01-01 00:33:23\n"
+      "/shares/C/           -                    0/0        1      0  -\n"
+      "/shares/D/           ░░░░░░░░░░   0 %     0/1        1      0  -\n"
+      "TOTAL                █████░░░░░  57 %     4/7        7      4  -\n"
+      "\n" +
+          STATUS_LEGEND);
 }
 
 TEST_F(ZophotosStatus, PrintsOneObjectInJson) {
@@ -57,7 +66,7 @@ TEST_F(ZophotosStatus, SaysWhenNoVolumeHasBeenMerged) {
   copy.Run("DELETE FROM Files");
   copy.Run("DELETE FROM Folders WHERE folder_id != 1");
   ExpectOutput(OnCopy({"status"}), "Database  " + COPY +
-                                       "\nVersion   2.0\nStamped   1970-01-01 00:16:40\n\n"
+                                       "\nMaster    -\nVersion   2.0\nEmptied   -\n\n"
                                        "No volume has been merged yet.\n");
   EXPECT_THAT(OnCopy({"--json", "status"}).output, HasSubstr(R"("volumes":[])"));
 }
@@ -78,22 +87,40 @@ TEST_F(ZophotosStatus, RoundsPercentagesDown) {
   }
 }
 
-TEST_F(ZophotosStatus, KeepsTheStatisticsOfAnUnpluggedVolume) {
+TEST_F(ZophotosStatus, ShowsAnUnpluggedVolumeAsGone) {
   appliance.Handle(Unplugged(b.Path()));
-  EXPECT_THAT(Zophotos({"status"}).output,
-              HasSubstr("/shares/B/  ███░░░░░░░  33 %     1/3        0      0  -\n"));
+  EXPECT_THAT(
+      Zophotos({"status"}).output,
+      AllOf(HasSubstr("/shares/B/           gone                   -        0      0  -\n"),
+            HasSubstr("TOTAL                ███████░░░  75 %     3/4        5      3  -\n")));
+  EXPECT_THAT(
+      Zophotos({"status", "--json"}).output,
+      HasSubstr(
+          R"({"volume":"/shares/B/","transcoded":1,"total":3,"folders":0,"files":0,"merged_up_to":null},)"));
+}
+
+TEST_F(ZophotosStatus, SaysThatThereIsNoMasterYet) {
+  // The daemon keeps the database there until the first scan.
+  std::filesystem::create_directories("/shares/.zophotos");
+  std::filesystem::copy_file(MERGED, "/shares//.zophotos/zophotos.db",
+                             std::filesystem::copy_options::overwrite_existing);
+  EXPECT_THAT(Zophotos({"--database", "/shares//.zophotos/zophotos.db"}).output,
+              AllOf(HasSubstr("\nMaster    none yet\n"), Not(HasSubstr("(master)"))));
+  EXPECT_THAT(Zophotos({"--database", "/shares/.zophotos/zophotos.db"}).output,
+              HasSubstr("\nMaster    /shares\n"));
 }
 
 TEST_F(ZophotosStatus, PrintsLocalTimesInText) {
+  Copy().Run("UPDATE Status SET mdate = 1001");
   setenv("TZ", "UTC-9", 1);
-  EXPECT_THAT(Zophotos({"status"}).output, HasSubstr("Stamped   1970-01-01 09:16:40\n"));
-  EXPECT_THAT(Zophotos({"status", "--json"}).output,
-              HasSubstr(R"("stamped":"1970-01-01T00:16:40Z")"));
+  EXPECT_THAT(OnCopy({"status"}).output, HasSubstr("Emptied   1970-01-01 09:16:41\n"));
+  EXPECT_THAT(OnCopy({"status", "--json"}).output,
+              HasSubstr(R"("stamped":"1970-01-01T00:16:41Z")"));
 }
 
 TEST_F(ZophotosStatus, AcceptsAMissingStatusRow) {
   Copy().Run("DELETE FROM Status");
-  EXPECT_THAT(OnCopy({"status"}).output, HasSubstr("\nVersion   -\nStamped   -\n\nVOLUME"));
+  EXPECT_THAT(OnCopy({"status"}).output, HasSubstr("\nVersion   -\nEmptied   -\n\nVOLUME"));
   EXPECT_THAT(OnCopy({"status", "--json"}).output, HasSubstr(R"("version":null,"stamped":null,)"));
 }
 
@@ -104,7 +131,7 @@ TEST_F(ZophotosStatus, PrintsTimesOutsideTheCalendarAsNumbers) {
         std::pair("253402300799", "9999-12-31 23:59:59"), std::pair("253402300800", "253402300800"),
         std::pair("67767976233532800", "67767976233532800")}) {
     copy.Run("UPDATE Status SET mdate = ?", {seconds});
-    EXPECT_THAT(OnCopy({"status"}).output, HasSubstr("\nStamped   " + std::string(text) + "\n"));
+    EXPECT_THAT(OnCopy({"status"}).output, HasSubstr("\nEmptied   " + std::string(text) + "\n"));
   }
 }
 
@@ -116,7 +143,7 @@ TEST_F(ZophotosStatus, ReadsTheDatabaseGivenAsAnOption) {
        {Arguments{"--database", COPY, "status"}, Arguments{"status", "--database=" + COPY}}) {
     const Outcome outcome = Zophotos(arguments);
     EXPECT_EQ(0, outcome.status);
-    EXPECT_THAT(outcome.output, StartsWith("Database  " + COPY + "\nVersion   7.5\n"));
+    EXPECT_THAT(outcome.output, StartsWith("Database  " + COPY + "\nMaster    -\nVersion   7.5\n"));
   }
   std::ofstream(LOCATOR) << "zophotos_db_path=" << MERGED << '\n';
 }
