@@ -13,6 +13,10 @@ using ::testing::HasSubstr;
 using ::testing::Not;
 using ::testing::StartsWith;
 
+/// A file name with a control character and a byte that is not UTF-8, in SQL and as bytes.
+const std::string ODD_NAME_SQL = "CAST(x'780a1b5bff5c2e6a7067' AS TEXT)";
+const std::string ODD_NAME = "x\n\x1b[\xff\\.jpg";
+
 const std::string STATUS_LEGEND =
     "PHOTOS: transcoded / all of a volume, without hidden ones, at its last merge.\n"
     "FILES: in the merged database: all transcoded files in visible folders.\n";
@@ -163,13 +167,67 @@ TEST_F(ZophotosList, AcceptsAbsoluteAndRelativeFolders) {
   }
 }
 
+TEST_F(ZophotosList, NormalizesPaths) {
+  for (const char* const folder :
+       {"A//Pictures", "//shares//A/./Pictures//", "A/Pictures/Summer/..", "../shares/A/Pictures",
+        "B/../A/Pictures/."}) {
+    ExpectOutput(Zophotos({"ls", folder}), "Summer/\nb.jpg\n");
+    ExpectOutput(Zophotos({"tree", folder}), Zophotos({"tree", "A/Pictures"}).output);
+  }
+  ExpectOutput(Zophotos({"ls", ".."}), "shares/\n");
+}
+
+TEST_F(ZophotosList, PrefersThePathAsItIsWritten) {
+  AddRows(Copy(), "'/shares/A//Pictures/'", "'other.jpg'");
+  ExpectOutput(OnCopy({"ls", "A//Pictures"}), "other.jpg\n");
+}
+
+TEST_F(ZophotosList, ShowsAFile) {
+  for (const char* const file :
+       {"A/Pictures/b.jpg", "/shares/A/Pictures/b.jpg", "A//Pictures/./b.jpg"}) {
+    ExpectOutput(Zophotos({"ls", file}), "/shares/A/Pictures/b.jpg\n");
+  }
+  ExpectOutput(Zophotos({"ls", "-l", "A/Pictures/b.jpg"}),
+               "MODIFIED             FILES  VOLUME      NAME\n"
+               "1970-01-01 00:16:41         /shares/A/  /shares/A/Pictures/b.jpg\n");
+  ExpectOutput(
+      Zophotos({"ls", "--json", "A/Pictures/b.jpg"}),
+      R"({"type":"file","path":"/shares/A/Pictures/b.jpg","volume":"/shares/A/","modified":"1970-01-01T00:16:41Z"})"
+      "\n");
+  EXPECT_EQ(1, Zophotos({"ls", "A/Pictures/b.jpg/"}).status);
+  EXPECT_EQ(1, Zophotos({"ls", "A/b.jpg"}).status);
+}
+
+TEST_F(ZophotosList, AcceptsNamesAsTheyArePrinted) {
+  const Database copy = Copy();
+  AddRows(copy, "'/shares/A/' || CAST(x'0a' AS TEXT) || '\\/'", ODD_NAME_SQL);
+  AddRows(copy, R"('/shares/A/\x41\xzz/')", R"('\x')");
+  for (const char* const folder : {R"(A/\x0a\\)", "A/\n\\"}) {
+    ExpectOutput(OnCopy({"ls", folder}), R"(x\x0a\x1b[\xff\\.jpg)"
+                                         "\n");
+    EXPECT_EQ(0, OnCopy({"tree", folder}).status);
+  }
+  for (const std::string& file : {std::string(R"(x\x0a\x1b[\xff\\.jpg)"), ODD_NAME}) {
+    ExpectOutput(OnCopy({"ls", "A/\n\\/" + file}), R"(/shares/A/\x0a\\/x\x0a\x1b[\xff\\.jpg)"
+                                                   "\n");
+  }
+  for (const char* const folder : {R"(A/\x41\xzz)", R"(A/\\x41\\xzz)"}) {
+    ExpectOutput(OnCopy({"ls", folder}), "\\\\x\n");
+  }
+}
+
+TEST_F(ZophotosList, PrintsOneNamePerLineOnRequest) {
+  ExpectOutput(Zophotos({"ls", "-1", "A"}), Zophotos({"ls", "A"}).output);
+  ExpectOutput(Zophotos({"ls", "-l1", "A"}), Zophotos({"ls", "-l", "A"}).output);
+}
+
 TEST_F(ZophotosList, AddsTimesNumbersAndVolumesInLongForm) {
   ExpectOutput(Zophotos({"ls", "-l", "A/Pictures"}),
                "MODIFIED             FILES  VOLUME      NAME\n"
                "1970-01-01 00:10:00      1  /shares/A/  Summer/\n"
                "1970-01-01 00:16:41         /shares/A/  b.jpg\n");
   EXPECT_THAT(Zophotos({"ls", "--long"}).output,
-              HasSubstr("1970-01-01 00:00:00      0  /shares/B/  B/\n"));
+              HasSubstr("\n-             0  /shares/B/  B/\n"));
 }
 
 TEST_F(ZophotosList, PrintsOneObjectPerLineInJson) {
@@ -183,8 +241,10 @@ TEST_F(ZophotosList, PrintsOneObjectPerLineInJson) {
 }
 
 TEST_F(ZophotosList, ReportsAMissingFolder) {
-  ExpectError(Zophotos({"ls", "A/Pict"}), 1, "zophotos: there is no folder /shares/A/Pict/\n");
-  ExpectError(Zophotos({"ls", "/elsewhere"}), 1, "zophotos: there is no folder /elsewhere/\n");
+  ExpectError(Zophotos({"ls", "A/Pict"}), 1,
+              "zophotos: there is no folder or file /shares/A/Pict\n");
+  ExpectError(Zophotos({"ls", "/elsewhere"}), 1,
+              "zophotos: there is no folder or file /elsewhere\n");
 }
 
 TEST_F(ZophotosList, PrintsNothingForAnEmptyFolder) {
@@ -340,10 +400,6 @@ TEST_F(ZophotosFind, PrintsOneObjectPerLineInJson) {
       R"({"type":"file","path":"/shares/B/Old/1.jpg","volume":"/shares/B/","modified":"1970-01-02T00:00:00Z"})"
       "\n");
 }
-
-/// A file name with a control character and a byte that is not UTF-8, in SQL and as bytes.
-const std::string ODD_NAME_SQL = "CAST(x'780a1b5bff5c2e6a7067' AS TEXT)";
-const std::string ODD_NAME = "x\n\x1b[\xff\\.jpg";
 
 TEST_F(ZophotosFind, EscapesControlCharactersAndInvalidUtf8) {
   AddRows(Copy(), "'/shares/A/odd/'", ODD_NAME_SQL);

@@ -19,10 +19,10 @@ using FindPath = std::function<std::string()>;
 /// Shows where the database is and the progress of each volume.
 ExitStatus ShowStatus(const std::string& path, Form form);
 
-/// Lists a folder. `folder` is absolute or relative to the shares root.
-ExitStatus ListFolder(const std::string& path, const std::string& folder, bool isLong, Form form);
+/// Lists a folder, or shows a file. `item` is its path as the user gives it, see Spellings.
+ExitStatus List(const std::string& path, const std::string& item, bool isLong, Form form);
 
-/// Shows all folders below a folder, by their paths.
+/// Shows all folders below a folder, by their paths. `folder` is as for List.
 ExitStatus ShowTree(const std::string& path, const std::string& folder, Form form);
 
 /// What FindItems searches for, and how it prints the results.
@@ -46,11 +46,5 @@ ExitStatus ExportFiles(const std::string& path, ExportFormat format);
 /// Prints a line for each change until the output cannot be written. An exception from `findPath`
 /// is a change, too.
 ExitStatus WatchDatabase(const FindPath& findPath, Form form);
-
-/// The name of `folder` in the database: its absolute path with a separator at the end.
-std::string FolderPath(const std::string& folder);
-
-/// The smallest text that sorts after all paths in the folder at `path`.
-std::string EndOfFolder(const std::string& path);
 
 } // namespace orva::zophotos

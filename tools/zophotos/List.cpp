@@ -1,6 +1,7 @@
 #include "Commands.h"
 #include "Json.h"
 #include "MergedDatabase.h"
+#include "Paths.h"
 #include "Table.h"
 
 #include <SQLiteCpp/Statement.h>
@@ -69,10 +70,41 @@ void ReadFiles(SQLite::Database& database, const std::string& folder, std::vecto
   }
 }
 
-bool IsStored(SQLite::Database& database, const std::string& folder) {
-  SQLite::Statement query(database, "SELECT 1 FROM Folders WHERE name = ?");
-  query.bind(1, folder);
-  return query.executeStep();
+/// The files at `path`: one, unless the database is damaged. Their names are their paths.
+std::vector<Entry> ReadFile(SQLite::Database& database, const std::string& path) {
+  const std::size_t name = path.rfind('/') + 1;
+  SQLite::Statement query(database,
+                          "SELECT f.modified_date, f.volume FROM Folders o JOIN Files f ON "
+                          "f.folder_id = o.folder_id WHERE o.name = ? AND f.name = ?");
+  query.bind(1, path.substr(0, name));
+  query.bind(2, path.substr(name));
+  std::vector<Entry> entries;
+  while (query.executeStep()) {
+    entries.push_back({.isFolder = false,
+                       .isStored = true,
+                       .path = path,
+                       .name = path,
+                       .modified = query.getColumn(0).getInt64(),
+                       .volume = query.getColumn(1).getString()});
+  }
+  return entries;
+}
+
+/// What is in a folder, or a file. Throws Failure if there is neither.
+std::vector<Entry> Read(SQLite::Database& database, const std::string& item) {
+  const std::vector<std::string> spellings = Spellings(item);
+  if (const auto folder = FindFolder(database, spellings)) {
+    std::vector<Entry> entries = ReadFolders(database, *folder);
+    ReadFiles(database, *folder, entries);
+    return entries;
+  }
+  for (const std::string& spelling : spellings) {
+    std::vector<Entry> entries = ReadFile(database, spelling);
+    if (!entries.empty()) {
+      return entries;
+    }
+  }
+  throw Failure(ExitStatus::Negative, "there is no folder or file " + spellings.front());
 }
 
 void PrintJson(const Entry& entry) {
@@ -93,7 +125,8 @@ void PrintLong(const std::vector<Entry>& entries) {
                {.heading = "VOLUME", .elastic = true},
                {.heading = "NAME", .elastic = true}});
   for (const Entry& entry : entries) {
-    table.AddRow({entry.isStored ? LocalTime(entry.modified) : "-",
+    // A volume's top folder has no time.
+    table.AddRow({entry.isStored && entry.modified != 0 ? LocalTime(entry.modified) : "-",
                   entry.isFolder ? std::to_string(entry.files) : "", Printable(entry.volume),
                   Printable(entry.name)});
   }
@@ -108,17 +141,12 @@ void PrintNames(const std::vector<Entry>& entries) {
 
 } // namespace
 
-ExitStatus ListFolder(const std::string& path, const std::string& folder, bool isLong, Form form) {
-  const std::string folderPath = FolderPath(folder);
+ExitStatus List(const std::string& path, const std::string& item, bool isLong, Form form) {
   std::vector<Entry> entries;
   {
     // Sorting takes long for a folder that holds most of a library.
     SQLite::Database database = CopyDatabase(path);
-    entries = ReadFolders(database, folderPath);
-    ReadFiles(database, folderPath, entries);
-    if (entries.empty() && !IsStored(database, folderPath)) {
-      throw Failure(ExitStatus::Negative, "there is no folder " + folderPath);
-    }
+    entries = Read(database, item);
   }
   if (form == Form::Json) {
     for (const Entry& entry : entries) {

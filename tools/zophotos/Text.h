@@ -18,6 +18,9 @@ std::string ToUtf8(std::string_view bytes);
 /// UTF-8 are escaped, so that a name cannot control the terminal.
 std::string Printable(std::string_view bytes);
 
+/// The bytes that Printable made `text` of. Backslashes that begin no escape stay.
+std::string Unescape(std::string_view text);
+
 /// The number of terminal columns that a printable text takes.
 std::size_t Width(std::string_view printable);
 

@@ -1,6 +1,7 @@
 #include "Commands.h"
 #include "Json.h"
 #include "MergedDatabase.h"
+#include "Paths.h"
 
 #include <SQLiteCpp/Statement.h>
 
@@ -34,9 +35,7 @@ bool ComesBefore(const std::string& a, const std::string& b) {
   return std::ranges::lexicographical_compare(a, b, {}, rank, rank);
 }
 
-std::vector<StoredFolder> ReadFolders(const std::string& path, const std::string& top) {
-  // Counting reads every file of a large library, which takes long.
-  SQLite::Database database = CopyDatabase(path);
+std::vector<StoredFolder> ReadFolders(SQLite::Database& database, const std::string& top) {
   SQLite::Statement query(database,
                           "SELECT name, (SELECT count(*) FROM Files f WHERE f.folder_id = "
                           "o.folder_id) FROM Folders o WHERE name >= ? AND name < ?");
@@ -117,12 +116,15 @@ void PrintTreeJson(const std::vector<Node>& nodes) {
 } // namespace
 
 ExitStatus ShowTree(const std::string& path, const std::string& folder, Form form) {
-  const std::string top = FolderPath(folder);
-  const std::vector<StoredFolder> folders = ReadFolders(path, top);
-  const std::vector<Node> nodes = MakeTree(folders, top);
-  if (nodes.empty()) {
-    throw Failure(ExitStatus::Negative, "there is no folder " + top);
+  // Counting reads every file of a large library, which takes long.
+  SQLite::Database database = CopyDatabase(path);
+  const std::vector<std::string> spellings = Spellings(folder);
+  const auto top = FindFolder(database, spellings);
+  if (!top) {
+    throw Failure(ExitStatus::Negative, "there is no folder " + FolderPath(spellings.front()));
   }
+  const std::vector<StoredFolder> folders = ReadFolders(database, *top);
+  const std::vector<Node> nodes = MakeTree(folders, *top);
   (form == Form::Json ? PrintTreeJson : PrintTreeText)(nodes);
   return ExitStatus::Success;
 }

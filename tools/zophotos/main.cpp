@@ -154,10 +154,10 @@ private:
       return ShowStatus(path, form);
     }
     if (ls_->parsed()) {
-      return ListFolder(path, folder_, long_, form);
+      return List(path, path_, long_, form);
     }
     if (tree_->parsed()) {
-      return ShowTree(path, folder_, form);
+      return ShowTree(path, path_, form);
     }
     if (find_->parsed()) {
       return FindItems(path, search_, form);
@@ -170,14 +170,16 @@ private:
 
   void AddCommands() {
     status_ = app_.add_subcommand("status", "Show the database and the progress of each volume");
-    ls_ = app_.add_subcommand("ls", "List a folder");
+    ls_ = app_.add_subcommand("ls", "List a folder, or show a file");
     ls_->add_flag("-l,--long", long_, "Add times, numbers of files and volumes");
+    ls_->add_flag_callback(
+        "-1", [] {}, "Print one name per line, which is the default");
+    ls_->add_option("PATH", path_, "The folder or file, absolute or relative to /shares")
+        ->default_str("/shares");
     tree_ =
         app_.add_subcommand("tree", "Show all folders below a folder, with their numbers of files");
-    for (CLI::App* const command : {ls_, tree_}) {
-      command->add_option("FOLDER", folder_, "The folder, absolute or relative to /shares")
-          ->default_str("/shares");
-    }
+    tree_->add_option("FOLDER", path_, "The folder, absolute or relative to /shares")
+        ->default_str("/shares");
     find_ = app_.add_subcommand("find", "Find files and folders by name");
     find_
         ->add_option("PATTERN", search_.pattern,
@@ -226,7 +228,7 @@ private:
   CLI::App* export_ = nullptr;
   CLI::App* help_ = nullptr;
   std::string database_;
-  std::string folder_;
+  std::string path_;  ///< of ls and tree
   std::string topic_; ///< of help
   Search search_;
   bool json_ = false;
