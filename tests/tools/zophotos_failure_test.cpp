@@ -139,6 +139,7 @@ TEST(ZophotosUsage, ErrorsHaveAStatusOfTheirOwn) {
       {{"status", "A"}, "A"},
       {{"find"}, "PATTERN is required"},
       {{"find", "a", "b"}, "b"},
+      {{"find", "--type", "x", "a"}, "--type: x not in {f,d}"},
       {{"export", "--csv", "--jsonl"}, "--csv and --jsonl cannot be combined"},
       {{"--json", "export", "--csv"}, "--csv and --json cannot be combined"},
       {{"find", "-0", "--json", "x"}, "--null and --json cannot be combined"},

@@ -226,8 +226,7 @@ TEST_F(ZophotosList, AddsTimesNumbersAndVolumesInLongForm) {
                "MODIFIED             FILES  VOLUME      NAME\n"
                "1970-01-01 00:10:00      1  /shares/A/  Summer/\n"
                "1970-01-01 00:16:41         /shares/A/  b.jpg\n");
-  EXPECT_THAT(Zophotos({"ls", "--long"}).output,
-              HasSubstr("\n-             0  /shares/B/  B/\n"));
+  EXPECT_THAT(Zophotos({"ls", "--long"}).output, HasSubstr("\n-             0  /shares/B/  B/\n"));
 }
 
 TEST_F(ZophotosList, PrintsOneObjectPerLineInJson) {
@@ -360,6 +359,42 @@ TEST_F(ZophotosFind, MatchesAPatternWithASeparatorWithTheWholePath) {
   ExpectOutput(Zophotos({"find", "Pictures/S"}), "/shares/A/Pictures/Summer/\n"
                                                  "/shares/A/Pictures/Summer/a.jpg\n");
   EXPECT_EQ(1, Zophotos({"find", "Old/*"}).status);
+}
+
+TEST_F(ZophotosFind, MatchesAPatternWithASeparatorRelativeToTheSharesRoot) {
+  ExpectOutput(Zophotos({"find", "B/*"}), "/shares/B/Old/\n/shares/B/Old/1.jpg\n");
+  ExpectOutput(Zophotos({"find", "B//Old/[0-9].jpg"}), "/shares/B/Old/1.jpg\n");
+  ExpectOutput(Zophotos({"find", "*/Old"}), "/shares/B/Old/\n");
+  EXPECT_EQ(1, Zophotos({"find", "/B/*"}).status);
+}
+
+TEST_F(ZophotosFind, MatchesRepeatedSeparatorsAsTheyAreWritten) {
+  AddRows(Copy(), "'/shares/A//Pictures/'", "'b.jpg'");
+  ExpectOutput(OnCopy({"find", "A//P*/b.jpg"}), "/shares/A//Pictures/b.jpg\n"
+                                                "/shares/A/Pictures/b.jpg\n");
+}
+
+TEST_F(ZophotosFind, AcceptsNamesAsTheyArePrinted) {
+  const Database copy = Copy();
+  AddRows(copy, "'/shares/A/odd/'", ODD_NAME_SQL);
+  AddRows(copy, "'/shares/A/odd[1]/'");
+  const std::string odd = R"(x\x0a\x1b[\xff\\.jpg)";
+  for (const std::string& pattern : {odd, ODD_NAME, "/shares/A/odd/" + odd, "A/odd/" + ODD_NAME}) {
+    ExpectOutput(OnCopy({"find", "-0", pattern}), "/shares/A/odd/" + ODD_NAME + '\0');
+  }
+  for (const char* const pattern : {"odd[1]", "/shares/A/odd[1]/", "A//odd[1]/"}) {
+    ExpectOutput(OnCopy({"find", pattern}), "/shares/A/odd[1]/\n");
+  }
+  EXPECT_THAT(OnCopy({"find", "/shares/A/Pictures/"}).output,
+              StartsWith("/shares/A/Pictures/\n/shares/A/Pictures/b.jpg\n"));
+}
+
+TEST_F(ZophotosFind, FindsOnlyFilesOrFoldersOnRequest) {
+  ExpectOutput(Zophotos({"find", "--type", "f", "A/Pictures/"}),
+               "/shares/A/Pictures/b.jpg\n/shares/A/Pictures/Summer/a.jpg\n");
+  ExpectOutput(Zophotos({"find", "--type=d", "A/Pictures/"}),
+               "/shares/A/Pictures/\n/shares/A/Pictures/Summer/\n");
+  ExpectError(Zophotos({"find", "--type", "d", "top.jpg"}), 1, "");
 }
 
 TEST_F(ZophotosFind, IgnoresCaseOnlyOnRequest) {

@@ -30,6 +30,8 @@ struct Search {
   std::string pattern;
   bool ignoreCase = false;
   bool nullTerminated = false; ///< print the bytes of each path unchanged and a NUL after them
+  bool folders = true;         ///< find folders
+  bool files = true;           ///< find files
 };
 
 /// Finds files and folders by their names.

@@ -183,12 +183,22 @@ private:
     find_ = app_.add_subcommand("find", "Find files and folders by name");
     find_
         ->add_option("PATTERN", search_.pattern,
-                     "Shell pattern for the name, or for the whole path if it has a /; without "
-                     "wildcards: text that the name or path contains")
+                     "Shell pattern for the name, or for the whole path if it has a /, absolute or "
+                     "relative to /shares; without wildcards: text that the name or path contains")
         ->required();
     find_->add_flag("-i,--ignore-case", search_.ignoreCase, "Ignore case");
     find_->add_flag("-0,--null", search_.nullTerminated,
                     "Print paths unescaped, each followed by a NUL");
+    find_
+        ->add_option_function<std::string>(
+            "--type",
+            [this](const std::string& type) {
+              search_.folders = type != "f";
+              search_.files = type != "d";
+            },
+            "Find only files (f) or only folders (d)")
+        ->type_name("f|d")
+        ->check(CLI::IsMember({"f", "d"}));
     find_->callback([this] {
       if (search_.nullTerminated && json_) {
         throw CLI::ValidationError("find", "--null and --json cannot be combined");
