@@ -177,12 +177,12 @@ TEST_F(ZophotosTerminal, NamesWriteNoControlCharacters) {
   }
   for (const Arguments& arguments :
        {Arguments{"status"}, Arguments{"ls", "A"}, Arguments{"ls", "-l", "A"}, Arguments{"tree"},
-        Arguments{"find", "*"}, Arguments{"check"}, Arguments{"ls", "\x1b[2J\xff"},
+        Arguments{"find", "*"}, Arguments{"check"}, Arguments{}, Arguments{"ls", "\x1b[2J\xff"},
         Arguments{"tree", "\u009b2J"}}) {
     const Lines lines = OnTerminal(200, arguments);
     EXPECT_THAT(lines, Not(IsEmpty()));
     for (const std::string& line : lines) {
-      EXPECT_NE(-1, Columns(line)) << arguments[0] << ": " << ::testing::PrintToString(line);
+      EXPECT_NE(-1, Columns(line)) << ::testing::PrintToString(arguments) << line;
       const std::vector<std::string> unseen{
           {'\xe2', '\x80', '\xae'}, {'\xd8', '\x9c'}, {'\xef', '\xbb', '\xbf'}};
       for (const std::string& invisible : unseen) {

@@ -203,16 +203,17 @@ TEST_F(ZophotosList, AcceptsNamesAsTheyArePrinted) {
   AddRows(copy, "'/shares/A/' || CAST(x'0a' AS TEXT) || '\\/'", ODD_NAME_SQL);
   AddRows(copy, R"('/shares/A/\x41\xzz/')", R"('\x')");
   for (const char* const folder : {R"(A/\x0a\\)", "A/\n\\"}) {
-    ExpectOutput(OnCopy({"ls", folder}), R"(x\x0a\x1b[\xff\\.jpg)"
-                                         "\n");
+    ExpectOutput(OnCopy({"ls", "--escape", folder}), R"(x\x0a\x1b[\xff\\.jpg)"
+                                                     "\n");
     EXPECT_EQ(0, OnCopy({"tree", folder}).status);
   }
   for (const std::string& file : {std::string(R"(x\x0a\x1b[\xff\\.jpg)"), ODD_NAME}) {
-    ExpectOutput(OnCopy({"ls", "A/\n\\/" + file}), R"(/shares/A/\x0a\\/x\x0a\x1b[\xff\\.jpg)"
-                                                   "\n");
+    ExpectOutput(OnCopy({"ls", "--escape", "A/\n\\/" + file}),
+                 R"(/shares/A/\x0a\\/x\x0a\x1b[\xff\\.jpg)"
+                 "\n");
   }
   for (const char* const folder : {R"(A/\x41\xzz)", R"(A/\\x41\\xzz)"}) {
-    ExpectOutput(OnCopy({"ls", folder}), "\\\\x\n");
+    ExpectOutput(OnCopy({"ls", "--escape", folder}), "\\\\x\n");
   }
 }
 
@@ -438,8 +439,19 @@ TEST_F(ZophotosFind, PrintsOneObjectPerLineInJson) {
 
 TEST_F(ZophotosFind, EscapesControlCharactersAndInvalidUtf8) {
   AddRows(Copy(), "'/shares/A/odd/'", ODD_NAME_SQL);
-  ExpectOutput(OnCopy({"find", "x*"}), R"(/shares/A/odd/x\x0a\x1b[\xff\\.jpg)"
-                                       "\n");
+  ExpectOutput(OnCopy({"--escape", "find", "x*"}), R"(/shares/A/odd/x\x0a\x1b[\xff\\.jpg)"
+                                                   "\n");
+}
+
+TEST_F(ZophotosFind, PrintsUnescapedPathsIntoAPipe) {
+  AddRows(Copy(), "'/shares/A/odd/'", ODD_NAME_SQL);
+  ExpectOutput(OnCopy({"find", "x*"}), "/shares/A/odd/" + ODD_NAME + '\n');
+  ExpectOutput(OnCopy({"ls", "A/odd"}), ODD_NAME + '\n');
+  ExpectOutput(OnCopy({"ls", "A/odd/" + ODD_NAME}), "/shares/A/odd/" + ODD_NAME + '\n');
+  // Other text has more in a line than a name.
+  for (const Arguments& arguments : {Arguments{"ls", "-l", "A/odd"}, Arguments{"ls", "-l", "A"}}) {
+    EXPECT_THAT(OnCopy(arguments).output, Not(HasSubstr("\x1b")));
+  }
 }
 
 TEST_F(ZophotosFind, EscapesInvisibleCharacters) {
@@ -455,12 +467,12 @@ TEST_F(ZophotosFind, EscapesInvisibleCharacters) {
       {"\U000E0041", R"(\xf3\xa0\x81\x81)"}};
   for (const auto& [name, escaped] : names) {
     copy.Run("UPDATE Files SET name = ?1 WHERE name = 'top.jpg' OR name LIKE '%.x'", {name + ".x"});
-    ExpectOutput(OnCopy({"find", "*.x"}), "/shares/A/" + escaped + ".x\n");
+    ExpectOutput(OnCopy({"find", "--escape", "*.x"}), "/shares/A/" + escaped + ".x\n");
   }
   // A joiner in an emoji, and variation selectors of an emoji and of a Chinese character.
   for (const char* const name : {"👩‍👧.x", "❤️.x", "葛\U000E0100.x", "ü.x"}) {
     copy.Run("UPDATE Files SET name = ? WHERE name LIKE '%.x'", {name});
-    ExpectOutput(OnCopy({"find", "*.x"}), "/shares/A/" + std::string(name) + "\n");
+    ExpectOutput(OnCopy({"find", "--escape", "*.x"}), "/shares/A/" + std::string(name) + "\n");
   }
 }
 

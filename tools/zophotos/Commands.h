@@ -19,10 +19,17 @@ using FindPath = std::function<std::string()>;
 /// Shows where the database is and the progress of each volume.
 ExitStatus ShowStatus(const std::string& path, Form form);
 
-/// Lists a folder, or shows a file. `item` is its path as the user gives it, see Spellings.
-ExitStatus List(const std::string& path, const std::string& item, bool isLong, Form form);
+/// What List shows, and how.
+struct Listing {
+  std::string path; ///< of a folder or file, as the user gives it, see Spellings
+  bool isLong = false;
+  bool escapes = true; ///< print names for people
+};
 
-/// Shows all folders below a folder, by their paths. `folder` is as for List.
+/// Lists a folder, or shows a file.
+ExitStatus List(const std::string& path, const Listing& listing, Form form);
+
+/// Shows all folders below a folder, by their paths. `folder` is as in Listing.
 ExitStatus ShowTree(const std::string& path, const std::string& folder, Form form);
 
 /// What FindItems searches for, and how it prints the results.
@@ -30,6 +37,7 @@ struct Search {
   std::string pattern;
   bool ignoreCase = false;
   bool nullTerminated = false; ///< print the bytes of each path unchanged and a NUL after them
+  bool escapes = true;         ///< print paths for people
   bool folders = true;         ///< find folders
   bool files = true;           ///< find files
 };

@@ -75,7 +75,7 @@ void Print(const std::string& path, const Item& item, bool isFolder, const Searc
                {"volume", ToUtf8(item.volume)},
                {"modified", JsonTime(isFolder ? item.folderModified : item.modified)}});
   } else {
-    std::cout << Printable(path) << '\n';
+    std::cout << (search.escapes ? Printable(path) : path) << '\n';
   }
 }
 

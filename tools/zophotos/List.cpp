@@ -133,27 +133,29 @@ void PrintLong(const std::vector<Entry>& entries) {
   table.Print(std::cout, TerminalWidth());
 }
 
-void PrintNames(const std::vector<Entry>& entries) {
+void PrintNames(const std::vector<Entry>& entries, bool escapes) {
   for (const Entry& entry : entries) {
-    std::cout << Printable(entry.name) << '\n';
+    std::cout << (escapes ? Printable(entry.name) : entry.name) << '\n';
   }
 }
 
 } // namespace
 
-ExitStatus List(const std::string& path, const std::string& item, bool isLong, Form form) {
+ExitStatus List(const std::string& path, const Listing& listing, Form form) {
   std::vector<Entry> entries;
   {
     // Sorting takes long for a folder that holds most of a library.
     SQLite::Database database = CopyDatabase(path);
-    entries = Read(database, item);
+    entries = Read(database, listing.path);
   }
   if (form == Form::Json) {
     for (const Entry& entry : entries) {
       PrintJson(entry);
     }
+  } else if (listing.isLong) {
+    PrintLong(entries);
   } else {
-    (isLong ? PrintLong : PrintNames)(entries);
+    PrintNames(entries, listing.escapes);
   }
   return ExitStatus::Success;
 }

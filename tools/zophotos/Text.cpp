@@ -176,6 +176,10 @@ std::optional<std::size_t> TerminalWidth() {
   return size.ws_col;
 }
 
+bool IsTerminal() {
+  return isatty(STDOUT_FILENO) != 0;
+}
+
 std::string LocalTime(std::int64_t seconds) {
   const std::time_t time = seconds;
   std::tm fields{};

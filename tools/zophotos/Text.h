@@ -33,6 +33,9 @@ std::string Shorten(const std::string& printable, std::size_t width);
 /// The width of the terminal at standard output; nothing if that is not a terminal.
 std::optional<std::size_t> TerminalWidth();
 
+/// Whether standard output is a terminal.
+bool IsTerminal();
+
 /// "2026-11-21 09:15:00" in local time, for people; the number outside the years 1 to 9999.
 std::string LocalTime(std::int64_t seconds);
 

@@ -31,6 +31,8 @@ public:
         ->type_name("FILE")
         ->check(orva::commandline::NotEmpty());
     app_.add_flag("--json", json_, "Print JSON: one object, or one object per line");
+    app_.add_flag("--escape", escape_,
+                  "Escape the names that ls and find print also if the output is not a terminal");
     app_.footer(
         "Without a command, zophotos shows the status.\n"
         "Exit status: 0 success; 1 damaged, or nothing found; 2 wrong command line; 3 no database "
@@ -79,6 +81,9 @@ private:
   std::string FindPath() const { return database_.empty() ? FindDatabase() : database_; }
 
   Form OutputForm() const { return json_ ? Form::Json : Form::Text; }
+
+  /// Whether to escape names where each is a line of its own.
+  bool Escapes() const { return escape_ || IsTerminal(); }
 
   /// The command on the command line; null if there is none.
   const CLI::App* Command() const {
@@ -154,13 +159,15 @@ private:
       return ShowStatus(path, form);
     }
     if (ls_->parsed()) {
-      return List(path, path_, long_, form);
+      return List(path, {.path = path_, .isLong = long_, .escapes = Escapes()}, form);
     }
     if (tree_->parsed()) {
       return ShowTree(path, path_, form);
     }
     if (find_->parsed()) {
-      return FindItems(path, search_, form);
+      Search search = search_;
+      search.escapes = Escapes();
+      return FindItems(path, search, form);
     }
     if (check_->parsed()) {
       return CheckDatabase(path, form);
@@ -242,6 +249,7 @@ private:
   std::string topic_; ///< of help
   Search search_;
   bool json_ = false;
+  bool escape_ = false;
   bool long_ = false;
   bool csv_ = false;
   bool jsonLines_ = false;
