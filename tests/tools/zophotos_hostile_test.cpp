@@ -296,7 +296,8 @@ TEST_F(ZophotosHostile, DecreasingIdsAddNothing) {
   Program watch(ZophotosCommand(OnCopyArguments({"watch"})));
   EXPECT_THAT(watch.ReadLine(), HasSubstr("watching"));
   copy.Run("UPDATE sqlite_sequence SET seq = 0");
-  EXPECT_THAT(watch.ReadLine(), HasSubstr("  written, nothing added or removed"));
+  EXPECT_THAT(watch.ReadLine(),
+              HasSubstr("  the daemon wrote to the database, but added and removed nothing"));
 }
 
 TEST_F(ZophotosHostile, BlobsAsNamesDoNoHarm) {
