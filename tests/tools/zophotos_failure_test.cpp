@@ -137,6 +137,8 @@ TEST(ZophotosUsage, ErrorsHaveAStatusOfTheirOwn) {
        "'-rf'; to search for a name that begins with a dash: zophotos find -- '-rf'\n"},
       {{"ls", "A", "B"}, "B"},
       {{"status", "A"}, "A"},
+      {{"tree", "-L", "0"}, "--level: takes a number from 1 to 1000000, not '0'"},
+      {{"tree", "-L", "x"}, "not 'x'"},
       {{"find"}, "PATTERN is required"},
       {{"find", "a", "b"}, "b"},
       {{"find", "--type", "x", "a"}, "--type: x not in {f,d}"},

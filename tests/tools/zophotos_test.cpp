@@ -227,12 +227,20 @@ TEST_F(ZophotosList, AddsTimesNumbersAndVolumesInLongForm) {
                "MODIFIED             FILES  VOLUME      NAME\n"
                "1970-01-01 00:10:00      1  /shares/A/  Summer/\n"
                "1970-01-01 00:16:41         /shares/A/  b.jpg\n");
-  EXPECT_THAT(Zophotos({"ls", "--long"}).output, HasSubstr("\n-             0  /shares/B/  B/\n"));
+  EXPECT_THAT(Zophotos({"ls", "--long"}).output, HasSubstr("\n-             1  /shares/B/  B/\n"));
+}
+
+TEST_F(ZophotosList, CountsTheFilesBelowFolders) {
+  EXPECT_THAT(Zophotos({"ls", "-l"}).output,
+              AllOf(HasSubstr("\n-             3  /shares/A/  A/\n"),
+                    HasSubstr("\n-             1  /shares/B/  B/\n")));
+  EXPECT_THAT(Zophotos({"ls", "--json"}).output,
+              HasSubstr(R"("files":0,"stored":true,"files_below":1})"));
 }
 
 TEST_F(ZophotosList, PrintsOneObjectPerLineInJson) {
   const std::string lines =
-      R"({"type":"folder","path":"/shares/A/Pictures/Summer/","volume":"/shares/A/","modified":"1970-01-01T00:10:00Z","files":1,"stored":true})"
+      R"({"type":"folder","path":"/shares/A/Pictures/Summer/","volume":"/shares/A/","modified":"1970-01-01T00:10:00Z","files":1,"stored":true,"files_below":1})"
       "\n"
       R"({"type":"file","path":"/shares/A/Pictures/b.jpg","volume":"/shares/A/","modified":"1970-01-01T00:16:41Z"})"
       "\n";
@@ -266,12 +274,12 @@ protected:
 TEST_F(ZophotosRemovedFolder, IsListedAsNotStored) {
   ExpectOutput(
       Zophotos({"ls", "A", "--json"}),
-      R"({"type":"folder","path":"/shares/A/Pictures/","volume":null,"modified":null,"files":0,"stored":false})"
+      R"({"type":"folder","path":"/shares/A/Pictures/","volume":null,"modified":null,"files":0,"stored":false,"files_below":1})"
       "\n"
       R"({"type":"file","path":"/shares/A/top.jpg","volume":"/shares/A/","modified":"1970-01-01T00:16:40Z"})"
       "\n");
   EXPECT_THAT(Zophotos({"ls", "-l", "A"}).output,
-              HasSubstr("-                        0              Pictures/\n"));
+              HasSubstr("-                        1              Pictures/\n"));
 }
 
 TEST_F(ZophotosRemovedFolder, CanBeListed) {
@@ -279,10 +287,10 @@ TEST_F(ZophotosRemovedFolder, CanBeListed) {
 }
 
 TEST_F(ZophotosRemovedFolder, IsShownInTheTree) {
-  ExpectOutput(Zophotos({"tree", "A"}), "/shares/A/  1 file\n"
-                                        "└── Pictures/  (not stored)\n"
+  ExpectOutput(Zophotos({"tree", "A"}), "/shares/A/  2 files\n"
+                                        "└── Pictures/  1 file (not stored)\n"
                                         "    └── Summer/  1 file\n");
-  ExpectOutput(Zophotos({"tree", "A/Pictures"}), "/shares/A/Pictures/  (not stored)\n"
+  ExpectOutput(Zophotos({"tree", "A/Pictures"}), "/shares/A/Pictures/  1 file (not stored)\n"
                                                  "└── Summer/  1 file\n");
 }
 
@@ -293,25 +301,40 @@ TEST_F(ZophotosRemovedFolder, IsNotDamage) {
                                              "    /shares/A/Pictures/Summer/\n");
 }
 
-TEST_F(ZophotosTree, ShowsAllFoldersWithTheirNumbersOfFiles) {
-  ExpectOutput(Zophotos({"tree"}), "/shares/  0 files\n"
-                                   "├── A/  1 file\n"
-                                   "│   └── Pictures/  1 file\n"
+TEST_F(ZophotosTree, ShowsAllFoldersWithTheNumbersOfFilesBelowThem) {
+  ExpectOutput(Zophotos({"tree"}), "/shares/  4 files\n"
+                                   "├── A/  3 files\n"
+                                   "│   └── Pictures/  2 files\n"
                                    "│       └── Summer/  1 file\n"
-                                   "├── B/  0 files\n"
+                                   "├── B/  1 file\n"
                                    "│   └── Old/  1 file\n"
                                    "├── C/  0 files\n"
                                    "└── D/  0 files\n");
 }
 
+TEST_F(ZophotosTree, ShowsSomeLevelsOnRequest) {
+  ExpectOutput(Zophotos({"tree", "-L", "1"}), "/shares/  4 files\n"
+                                              "├── A/  3 files\n"
+                                              "├── B/  1 file\n"
+                                              "├── C/  0 files\n"
+                                              "└── D/  0 files\n");
+  ExpectOutput(Zophotos({"tree", "--level=1", "A"}), "/shares/A/  3 files\n"
+                                                     "└── Pictures/  2 files\n");
+  ExpectOutput(Zophotos({"tree", "-L2", "A"}), Zophotos({"tree", "A"}).output);
+}
+
 TEST_F(ZophotosTree, PrintsOneObjectPerLineInJson) {
-  ExpectOutput(Zophotos({"--json", "tree", "/shares/A"}),
-               R"({"path":"/shares/A/","depth":0,"files":1,"stored":true})"
-               "\n"
-               R"({"path":"/shares/A/Pictures/","depth":1,"files":1,"stored":true})"
-               "\n"
-               R"({"path":"/shares/A/Pictures/Summer/","depth":2,"files":1,"stored":true})"
-               "\n");
+  const std::string lines =
+      R"({"path":"/shares/A/","depth":0,"files":1,"stored":true,"files_below":3})"
+      "\n"
+      R"({"path":"/shares/A/Pictures/","depth":1,"files":1,"stored":true,"files_below":2})"
+      "\n";
+  ExpectOutput(
+      Zophotos({"--json", "tree", "/shares/A"}),
+      lines +
+          R"({"path":"/shares/A/Pictures/Summer/","depth":2,"files":1,"stored":true,"files_below":1})"
+          "\n");
+  ExpectOutput(Zophotos({"--json", "tree", "/shares/A", "-L", "1"}), lines);
 }
 
 TEST_F(ZophotosTree, PrintsSubfoldersDirectlyBelowTheirFolder) {
@@ -321,8 +344,8 @@ TEST_F(ZophotosTree, PrintsSubfoldersDirectlyBelowTheirFolder) {
   onA.AddFolder("a/x/", 1);
   onA.AddFolder("a!/", 1);
   Merge(a);
-  ExpectOutput(Zophotos({"tree", "A"}), "/shares/A/  1 file\n"
-                                        "├── Pictures/  1 file\n"
+  ExpectOutput(Zophotos({"tree", "A"}), "/shares/A/  3 files\n"
+                                        "├── Pictures/  2 files\n"
                                         "│   └── Summer/  1 file\n"
                                         "├── a/  0 files\n"
                                         "│   └── x/  0 files\n"

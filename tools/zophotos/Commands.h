@@ -2,6 +2,7 @@
 
 #include "Failure.h"
 
+#include <cstddef>
 #include <functional>
 #include <string>
 
@@ -29,8 +30,10 @@ struct Listing {
 /// Lists a folder, or shows a file.
 ExitStatus List(const std::string& path, const Listing& listing, Form form);
 
-/// Shows all folders below a folder, by their paths. `folder` is as in Listing.
-ExitStatus ShowTree(const std::string& path, const std::string& folder, Form form);
+/// Shows the folders below a folder, by their paths, down to `levels` below it. `folder` is as in
+/// Listing.
+ExitStatus ShowTree(const std::string& path, const std::string& folder, std::size_t levels,
+                    Form form);
 
 /// What FindItems searches for, and how it prints the results.
 struct Search {

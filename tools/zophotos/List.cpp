@@ -18,6 +18,7 @@ struct Entry {
   std::string path{};
   std::string name{}; ///< last component; for a folder with its separator
   std::int64_t files = 0;
+  std::int64_t filesBelow = 0; ///< at any depth, with its own
   std::int64_t modified = 0;
   std::string volume{};
 };
@@ -70,6 +71,23 @@ void ReadFiles(SQLite::Database& database, const std::string& folder, std::vecto
   }
 }
 
+/// Sets the numbers of files below the folders.
+void CountFilesBelow(SQLite::Database& database, std::vector<Entry>& entries) {
+  SQLite::Statement query(database, "SELECT count(*) FROM Folders o JOIN Files f ON f.folder_id = "
+                                    "o.folder_id WHERE o.name >= ? AND o.name < ?");
+  for (Entry& entry : entries) {
+    entry.filesBelow = entry.files;
+    // Only an untrusted database has folders without a separator at the end.
+    if (entry.isFolder && entry.path.ends_with('/')) {
+      query.bind(1, entry.path);
+      query.bind(2, EndOfFolder(entry.path));
+      query.executeStep();
+      entry.filesBelow = query.getColumn(0).getInt64();
+      query.reset();
+    }
+  }
+}
+
 /// The files at `path`: one, unless the database is damaged. Their names are their paths.
 std::vector<Entry> ReadFile(SQLite::Database& database, const std::string& path) {
   const std::size_t name = path.rfind('/') + 1;
@@ -115,6 +133,7 @@ void PrintJson(const Entry& entry) {
   if (entry.isFolder) {
     line["files"] = entry.files;
     line["stored"] = entry.isStored;
+    line["files_below"] = entry.filesBelow;
   }
   PrintLine(line);
 }
@@ -127,7 +146,7 @@ void PrintLong(const std::vector<Entry>& entries) {
   for (const Entry& entry : entries) {
     // A volume's top folder has no time.
     table.AddRow({entry.isStored && entry.modified != 0 ? LocalTime(entry.modified) : "-",
-                  entry.isFolder ? std::to_string(entry.files) : "", Printable(entry.volume),
+                  entry.isFolder ? std::to_string(entry.filesBelow) : "", Printable(entry.volume),
                   Printable(entry.name)});
   }
   table.Print(std::cout, TerminalWidth());
@@ -147,6 +166,9 @@ ExitStatus List(const std::string& path, const Listing& listing, Form form) {
     // Sorting takes long for a folder that holds most of a library.
     SQLite::Database database = CopyDatabase(path);
     entries = Read(database, listing.path);
+    if (listing.isLong || form == Form::Json) {
+      CountFilesBelow(database, entries);
+    }
   }
   if (form == Form::Json) {
     for (const Entry& entry : entries) {

@@ -7,6 +7,7 @@
 
 #include <algorithm>
 #include <string_view>
+#include <utility>
 #include <vector>
 
 namespace orva::zophotos {
@@ -24,6 +25,7 @@ struct Node {
   std::string_view path; ///< a folder's path, or the beginning of one
   std::size_t depth;
   std::int64_t files = 0;
+  std::int64_t filesBelow = 0; ///< at any depth, with its own
   bool isStored = false;
   bool isLast = false; ///< the last one of its siblings
 };
@@ -76,11 +78,15 @@ std::vector<Node> MakeTree(const std::vector<StoredFolder>& folders, const std::
   }
   // Read from the end, the first node of a depth below a parent is the parent's last child.
   std::vector<bool> hasLast;
+  std::vector<std::int64_t> below; // the files of the nodes read whose parents are still to come
   std::for_each(nodes.rbegin(), nodes.rend(), [&](Node& node) {
     const bool known = node.depth < hasLast.size() && hasLast[node.depth];
     node.isLast = !known;
     hasLast.resize(node.depth + 1, false);
     hasLast[node.depth] = true;
+    below.resize(std::max(below.size(), node.depth + 2), 0);
+    node.filesBelow = node.files + std::exchange(below[node.depth + 1], 0);
+    below[node.depth] += node.filesBelow;
   });
   return nodes;
 }
@@ -100,7 +106,8 @@ void PrintTreeText(const std::vector<Node>& nodes) {
       std::cout << (node.isLast ? "└── " : "├── ") << Printable(node.path.substr(parentLength));
       indents.emplace_back(node.isLast ? "    " : "│   ");
     }
-    std::cout << (node.isStored ? "  " + Count(node.files, "file") : "  (not stored)") << '\n';
+    std::cout << "  " << Count(node.filesBelow, "file") << (node.isStored ? "" : " (not stored)")
+              << '\n';
   }
 }
 
@@ -109,13 +116,15 @@ void PrintTreeJson(const std::vector<Node>& nodes) {
     PrintLine({{"path", ToUtf8(node.path)},
                {"depth", node.depth},
                {"files", node.files},
-               {"stored", node.isStored}});
+               {"stored", node.isStored},
+               {"files_below", node.filesBelow}});
   }
 }
 
 } // namespace
 
-ExitStatus ShowTree(const std::string& path, const std::string& folder, Form form) {
+ExitStatus ShowTree(const std::string& path, const std::string& folder, std::size_t levels,
+                    Form form) {
   // Counting reads every file of a large library, which takes long.
   SQLite::Database database = CopyDatabase(path);
   const std::vector<std::string> spellings = Spellings(folder);
@@ -124,7 +133,8 @@ ExitStatus ShowTree(const std::string& path, const std::string& folder, Form for
     throw Failure(ExitStatus::Negative, "there is no folder " + FolderPath(spellings.front()));
   }
   const std::vector<StoredFolder> folders = ReadFolders(database, *top);
-  const std::vector<Node> nodes = MakeTree(folders, *top);
+  std::vector<Node> nodes = MakeTree(folders, *top);
+  std::erase_if(nodes, [levels](const Node& node) { return node.depth > levels; });
   (form == Form::Json ? PrintTreeJson : PrintTreeText)(nodes);
   return ExitStatus::Success;
 }

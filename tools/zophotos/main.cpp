@@ -10,6 +10,7 @@
 
 #include <exception>
 #include <iostream>
+#include <limits>
 #include <string>
 #include <utility>
 #include <vector>
@@ -162,7 +163,7 @@ private:
       return List(path, {.path = path_, .isLong = long_, .escapes = Escapes()}, form);
     }
     if (tree_->parsed()) {
-      return ShowTree(path, path_, form);
+      return ShowTree(path, path_, levels_, form);
     }
     if (find_->parsed()) {
       Search search = search_;
@@ -185,6 +186,9 @@ private:
         ->default_str("/shares");
     tree_ =
         app_.add_subcommand("tree", "Show all folders below a folder, with their numbers of files");
+    tree_->add_option("-L,--level", levels_, "Show only so many levels of folders")
+        ->type_name("NUMBER")
+        ->transform(orva::commandline::Decimal(1, 1'000'000));
     tree_->add_option("FOLDER", path_, "The folder, absolute or relative to /shares")
         ->default_str("/shares");
     find_ = app_.add_subcommand("find", "Find files and folders by name");
@@ -247,6 +251,7 @@ private:
   std::string database_;
   std::string path_;  ///< of ls and tree
   std::string topic_; ///< of help
+  std::size_t levels_ = std::numeric_limits<std::size_t>::max();
   Search search_;
   bool json_ = false;
   bool escape_ = false;
