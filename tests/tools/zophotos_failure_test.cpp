@@ -148,6 +148,7 @@ TEST(ZophotosUsage, ErrorsHaveAStatusOfTheirOwn) {
       {{"--json", "find", "--null", "x"}, "--null and --json cannot be combined"},
       {{"--database"}, "--database"},
       {{"--database", "", "status"}, "must not be empty"},
+      {{"--color", "red"}, "--color: red not in {auto,always,never}"},
       {{"status", "check"}, "check"}};
   for (const auto& [arguments, message] : wrong) {
     SCOPED_TRACE(Text(arguments));

@@ -81,6 +81,8 @@ protected:
   void SetUp() override {
     ZophotosTest::SetUp();
     ASSERT_NE(nullptr, std::setlocale(LC_CTYPE, "C.UTF-8"));
+    setenv("TERM", "xterm", 1);
+    unsetenv("NO_COLOR");
     const Database copy = Copy();
     const auto add = [&copy](const std::string& name) {
       copy.Run("INSERT INTO Folders(parent_folder_id, name, modified_date, volume) VALUES(2, "
@@ -102,10 +104,22 @@ protected:
     }
   }
 
-  /// Runs zophotos on the copy, on a terminal.
+  /// Runs zophotos on the copy, on a terminal, and removes the sequences that set and reset the
+  /// colour of folders.
   static Lines OnTerminal(int columns, const Arguments& arguments) {
-    return Terminal(columns).Run(OnCopyArguments(arguments));
+    Lines lines = Terminal(columns).Run(OnCopyArguments(arguments));
+    for (std::string& line : lines) {
+      for (const std::string sequence : {COLOR, RESET}) {
+        if (const std::size_t begin = line.find(sequence); begin != std::string::npos) {
+          line.erase(begin, sequence.size());
+        }
+      }
+    }
+    return lines;
   }
+
+  static constexpr const char* COLOR = "\x1b[1;34m";
+  static constexpr const char* RESET = "\x1b[0m";
 
   /// The widths of the lines.
   static std::vector<int> Widths(const Lines& lines) {
@@ -190,6 +204,42 @@ TEST_F(ZophotosTerminal, NamesWriteNoControlCharacters) {
       }
     }
   }
+}
+
+TEST_F(ZophotosTerminal, FoldersHaveAColor) {
+  Copy();
+  const std::string pictures = std::string(COLOR) + "Pictures/" + RESET;
+  const auto run = [](const Arguments& arguments) {
+    return Terminal(80).Run(OnCopyArguments(arguments));
+  };
+  EXPECT_EQ((Lines{pictures, "top.jpg"}), run({"ls", "A"}));
+  EXPECT_THAT(run({"ls", "-l", "A"}).at(1), testing::EndsWith("  " + pictures));
+  EXPECT_THAT(run({"ls", "-l", "A"}).at(2), testing::EndsWith("  top.jpg"));
+  EXPECT_EQ("└── " + pictures + "  2 files", run({"tree", "-L", "1", "A"}).at(1));
+  EXPECT_EQ((Lines{std::string(COLOR) + "/shares/A/Pictures/" + RESET}), run({"find", "Pict*"}));
+  EXPECT_EQ(pictures + "\ntop.jpg\n", OnCopy({"--color", "always", "ls", "A"}).output);
+}
+
+TEST_F(ZophotosTerminal, ColorsAreOnlyForTerminalsThatShowThem) {
+  Copy();
+  const Lines plain{"Pictures/", "top.jpg"};
+  const auto run = [](const Arguments& arguments) {
+    return Terminal(80).Run(OnCopyArguments(arguments));
+  };
+  EXPECT_EQ(plain, run({"ls", "A", "--color", "never"}));
+  EXPECT_EQ("Pictures/\ntop.jpg\n", OnCopy({"ls", "A"}).output);
+  setenv("NO_COLOR", "1", 1);
+  EXPECT_EQ(plain, run({"ls", "A"}));
+  unsetenv("NO_COLOR");
+  setenv("TERM", "dumb", 1);
+  EXPECT_EQ(plain, run({"ls", "A"}));
+  unsetenv("TERM");
+  EXPECT_EQ(plain, run({"ls", "A"}));
+}
+
+TEST_F(ZophotosTerminal, ColorsEscapeNamesAlsoInAPipe) {
+  AddRows(Copy(), "'/shares/A/' || CAST(x'1b' AS TEXT) || '/'");
+  EXPECT_THAT(OnCopy({"find", "--color", "always", "*"}).output, HasSubstr("/shares/A/\\x1b/"));
 }
 
 class ZophotosHostile : public ZophotosTest {

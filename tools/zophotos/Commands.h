@@ -25,15 +25,16 @@ struct Listing {
   std::string path; ///< of a folder or file, as the user gives it, see Spellings
   bool isLong = false;
   bool escapes = true; ///< print names for people
+  bool colors = false; ///< print folders in a colour; needs `escapes`
 };
 
 /// Lists a folder, or shows a file.
 ExitStatus List(const std::string& path, const Listing& listing, Form form);
 
-/// Shows the folders below a folder, by their paths, down to `levels` below it. `folder` is as in
-/// Listing.
+/// Shows the folders below a folder, by their paths, down to `levels` below it. `folder` and
+/// `colors` are as in Listing.
 ExitStatus ShowTree(const std::string& path, const std::string& folder, std::size_t levels,
-                    Form form);
+                    bool colors, Form form);
 
 /// What FindItems searches for, and how it prints the results.
 struct Search {
@@ -41,6 +42,7 @@ struct Search {
   bool ignoreCase = false;
   bool nullTerminated = false; ///< print the bytes of each path unchanged and a NUL after them
   bool escapes = true;         ///< print paths for people
+  bool colors = false;         ///< print folders in a colour; needs `escapes`
   bool folders = true;         ///< find folders
   bool files = true;           ///< find files
 };

@@ -75,7 +75,8 @@ void Print(const std::string& path, const Item& item, bool isFolder, const Searc
                {"volume", ToUtf8(item.volume)},
                {"modified", JsonTime(isFolder ? item.folderModified : item.modified)}});
   } else {
-    std::cout << (search.escapes ? Printable(path) : path) << '\n';
+    std::cout << FolderColor(search.escapes ? Printable(path) : path, search.colors && isFolder)
+              << '\n';
   }
 }
 

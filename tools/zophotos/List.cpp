@@ -138,7 +138,7 @@ void PrintJson(const Entry& entry) {
   PrintLine(line);
 }
 
-void PrintLong(const std::vector<Entry>& entries) {
+void PrintLong(const std::vector<Entry>& entries, bool colors) {
   Table table({{.heading = "MODIFIED"},
                {.heading = "FILES", .right = true},
                {.heading = "VOLUME", .elastic = true},
@@ -147,14 +147,17 @@ void PrintLong(const std::vector<Entry>& entries) {
     // A volume's top folder has no time.
     table.AddRow({entry.isStored && entry.modified != 0 ? LocalTime(entry.modified) : "-",
                   entry.isFolder ? std::to_string(entry.filesBelow) : "", Printable(entry.volume),
-                  Printable(entry.name)});
+                  Printable(entry.name)},
+                 colors && entry.isFolder);
   }
   table.Print(std::cout, TerminalWidth());
 }
 
-void PrintNames(const std::vector<Entry>& entries, bool escapes) {
+void PrintNames(const std::vector<Entry>& entries, const Listing& listing) {
   for (const Entry& entry : entries) {
-    std::cout << (escapes ? Printable(entry.name) : entry.name) << '\n';
+    std::cout << FolderColor(listing.escapes ? Printable(entry.name) : entry.name,
+                             listing.colors && entry.isFolder)
+              << '\n';
   }
 }
 
@@ -175,9 +178,9 @@ ExitStatus List(const std::string& path, const Listing& listing, Form form) {
       PrintJson(entry);
     }
   } else if (listing.isLong) {
-    PrintLong(entries);
+    PrintLong(entries, listing.colors);
   } else {
-    PrintNames(entries, listing.escapes);
+    PrintNames(entries, listing);
   }
   return ExitStatus::Success;
 }

@@ -135,6 +135,10 @@ std::string Unescape(std::string_view text) {
   return bytes;
 }
 
+std::string FolderColor(const std::string& printable, bool colors) {
+  return colors ? "\x1b[1;34m" + printable + "\x1b[0m" : printable;
+}
+
 std::size_t Width(std::string_view printable) {
   std::size_t columns = 0;
   while (!printable.empty()) {

@@ -21,6 +21,9 @@ std::string Printable(std::string_view bytes);
 /// The bytes that Printable made `text` of. Backslashes that begin no escape stay.
 std::string Unescape(std::string_view text);
 
+/// A printable text, in the colour of folders if `colors` is set.
+std::string FolderColor(const std::string& printable, bool colors);
+
 /// The number of terminal columns that a printable text takes.
 std::size_t Width(std::string_view printable);
 

@@ -91,19 +91,20 @@ std::vector<Node> MakeTree(const std::vector<StoredFolder>& folders, const std::
   return nodes;
 }
 
-void PrintTreeText(const std::vector<Node>& nodes) {
+void PrintTreeText(const std::vector<Node>& nodes, bool colors) {
   std::vector<std::string> indents; // one for each level above the node
   for (const Node& node : nodes) {
     indents.resize(node.depth);
     if (node.depth == 0) {
-      std::cout << Printable(node.path);
+      std::cout << FolderColor(Printable(node.path), colors);
       indents.emplace_back();
     } else {
       const std::size_t parentLength = node.path.rfind('/', node.path.size() - 2) + 1;
       for (const std::string& indent : indents) {
         std::cout << indent;
       }
-      std::cout << (node.isLast ? "└── " : "├── ") << Printable(node.path.substr(parentLength));
+      std::cout << (node.isLast ? "└── " : "├── ")
+                << FolderColor(Printable(node.path.substr(parentLength)), colors);
       indents.emplace_back(node.isLast ? "    " : "│   ");
     }
     std::cout << "  " << Count(node.filesBelow, "file") << (node.isStored ? "" : " (not stored)")
@@ -124,7 +125,7 @@ void PrintTreeJson(const std::vector<Node>& nodes) {
 } // namespace
 
 ExitStatus ShowTree(const std::string& path, const std::string& folder, std::size_t levels,
-                    Form form) {
+                    bool colors, Form form) {
   // Counting reads every file of a large library, which takes long.
   SQLite::Database database = CopyDatabase(path);
   const std::vector<std::string> spellings = Spellings(folder);
@@ -135,7 +136,11 @@ ExitStatus ShowTree(const std::string& path, const std::string& folder, std::siz
   const std::vector<StoredFolder> folders = ReadFolders(database, *top);
   std::vector<Node> nodes = MakeTree(folders, *top);
   std::erase_if(nodes, [levels](const Node& node) { return node.depth > levels; });
-  (form == Form::Json ? PrintTreeJson : PrintTreeText)(nodes);
+  if (form == Form::Json) {
+    PrintTreeJson(nodes);
+  } else {
+    PrintTreeText(nodes, colors);
+  }
   return ExitStatus::Success;
 }
 

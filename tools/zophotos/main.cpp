@@ -8,6 +8,7 @@
 
 #include <SQLiteCpp/Exception.h>
 
+#include <cstdlib>
 #include <exception>
 #include <iostream>
 #include <limits>
@@ -34,6 +35,9 @@ public:
     app_.add_flag("--json", json_, "Print JSON: one object, or one object per line");
     app_.add_flag("--escape", escape_,
                   "Escape the names that ls and find print also if the output is not a terminal");
+    app_.add_option("--color", color_, "Print folders in a colour; auto: on a terminal")
+        ->type_name("auto|always|never")
+        ->check(CLI::IsMember({"auto", "always", "never"}));
     app_.footer(
         "Without a command, zophotos shows the status.\n"
         "Exit status: 0 success; 1 damaged, or nothing found; 2 wrong command line; 3 no database "
@@ -84,7 +88,19 @@ private:
   Form OutputForm() const { return json_ ? Form::Json : Form::Text; }
 
   /// Whether to escape names where each is a line of its own.
-  bool Escapes() const { return escape_ || IsTerminal(); }
+  bool Escapes() const { return escape_ || Colors() || IsTerminal(); }
+
+  /// Whether to print folders in a colour.
+  bool Colors() const {
+    const auto variable = [](const char* name) {
+      const char* const value = std::getenv(name);
+      return std::string(value == nullptr ? "" : value);
+    };
+    const std::string terminal = variable("TERM");
+    return color_ == "always" ||
+           (color_ == "auto" && IsTerminal() && variable("NO_COLOR").empty() && !terminal.empty() &&
+            terminal != "dumb");
+  }
 
   /// The command on the command line; null if there is none.
   const CLI::App* Command() const {
@@ -160,14 +176,16 @@ private:
       return ShowStatus(path, form);
     }
     if (ls_->parsed()) {
-      return List(path, {.path = path_, .isLong = long_, .escapes = Escapes()}, form);
+      return List(path, {.path = path_, .isLong = long_, .escapes = Escapes(), .colors = Colors()},
+                  form);
     }
     if (tree_->parsed()) {
-      return ShowTree(path, path_, levels_, form);
+      return ShowTree(path, path_, levels_, Colors(), form);
     }
     if (find_->parsed()) {
       Search search = search_;
       search.escapes = Escapes();
+      search.colors = Colors();
       return FindItems(path, search, form);
     }
     if (check_->parsed()) {
@@ -249,6 +267,7 @@ private:
   CLI::App* export_ = nullptr;
   CLI::App* help_ = nullptr;
   std::string database_;
+  std::string color_ = "auto";
   std::string path_;  ///< of ls and tree
   std::string topic_; ///< of help
   std::size_t levels_ = std::numeric_limits<std::size_t>::max();

@@ -3,11 +3,11 @@
 _zophotos() {
   local current=${COMP_WORDS[COMP_CWORD]} previous=${COMP_WORDS[COMP_CWORD - 1]}
   local commands='status ls tree find check watch export help'
-  local words='--database --json --escape --version --help -h'
+  local words='--database --json --escape --color --version --help -h'
   local command='' i
   for ((i = 1; i < COMP_CWORD; i++)); do
     case ${COMP_WORDS[i]} in
-      --database) ((++i)) ;;
+      --database | --color) ((++i)) ;;
       -*) ;;
       *)
         command=${COMP_WORDS[i]}
@@ -24,6 +24,10 @@ _zophotos() {
       ;;
     --type)
       mapfile -t COMPREPLY < <(compgen -W 'f d' -- "$current")
+      return
+      ;;
+    --color)
+      mapfile -t COMPREPLY < <(compgen -W 'auto always never' -- "$current")
       return
       ;;
     -L | --level) return ;;

@@ -6,6 +6,7 @@ set -l first "not __fish_seen_subcommand_from $commands"
 complete -c zophotos -f
 complete -c zophotos -l database -r -F -d 'Read this database'
 complete -c zophotos -l json -d 'Print JSON'
+complete -c zophotos -l color -x -a 'auto always never' -d 'Print folders in a colour'
 complete -c zophotos -l escape -d 'Escape names also if the output is not a terminal'
 complete -c zophotos -l version -d 'Print the version'
 complete -c zophotos -s h -l help -d 'Print help'
