@@ -18,8 +18,9 @@ constexpr std::string_view SHARES = "/shares/";
 
 /// `path` with single separators.
 std::string WithoutRepeatedSeparators(std::string path) {
-  const auto rest = std::ranges::unique(path, [](char a, char b) { return a == '/' && b == '/'; });
-  path.erase(rest.begin(), rest.end());
+  const auto rest =
+      std::unique(path.begin(), path.end(), [](char a, char b) { return a == '/' && b == '/'; });
+  path.erase(rest, path.end());
   return path;
 }
 

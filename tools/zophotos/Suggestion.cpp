@@ -15,10 +15,10 @@ constexpr std::size_t LONGEST = 40;
 std::size_t Distance(const std::string& a, const std::string& b) {
   std::vector<std::size_t> row(b.size() + 1);
   std::iota(row.begin(), row.end(), 0U);
-  for (std::size_t i = 0; i < a.size(); ++i) {
+  for (const char character : a) {
     std::size_t diagonal = row[0]++;
     for (std::size_t j = 0; j < b.size(); ++j) {
-      const std::size_t replaced = diagonal + (a[i] == b[j] ? 0 : 1);
+      const std::size_t replaced = diagonal + (character == b[j] ? 0 : 1);
       diagonal = row[j + 1];
       row[j + 1] = std::min({replaced, row[j] + 1, diagonal + 1});
     }
