@@ -118,12 +118,13 @@ TEST_F(ZophotosWatch, ReportsAMergeInText) {
   onB.AddPhoto("Old/4.jpg", 7, 3002);
   Merge(b);
   EXPECT_THAT(watch->ReadLine(),
-              MatchesRegex("20[0-9-]+ [0-9:]+  \\+1 folder \\+1 file; /shares/B/ 2 of 4 photos "
-                           "transcoded"));
+              MatchesRegex("20[0-9-]+ [0-9:]+  added 1 folder and 1 file; /shares/B/: 2 of 4 "
+                           "photos transcoded"));
   onB.DeletePhoto("Old/4.jpg", 3003);
   onB.DeletePhoto("Old/1.jpg", 3004);
   Merge(b);
-  EXPECT_THAT(watch->ReadLine(), MatchesRegex(".*  -2 files; /shares/B/ 0 of 2 photos transcoded"));
+  EXPECT_THAT(watch->ReadLine(),
+              MatchesRegex(".*  removed 2 files; /shares/B/: 0 of 2 photos transcoded"));
 }
 
 TEST_F(ZophotosWatch, ReportsAdditionsAndRemovalsInOneLine) {
@@ -137,7 +138,8 @@ TEST_F(ZophotosWatch, ReportsAdditionsAndRemovalsInOneLine) {
 TEST_F(ZophotosWatch, ReportsAWriteWithoutAdditionsOrRemovals) {
   Start({});
   Database(MERGED).Run("UPDATE Status SET mdate = 1001");
-  EXPECT_THAT(watch->ReadLine(), EndsWith("  written, nothing added or removed"));
+  EXPECT_THAT(watch->ReadLine(),
+              EndsWith("  the daemon wrote to the database, but added and removed nothing"));
 }
 
 TEST_F(ZophotosWatch, ReportsAnUnpluggedVolume) {
@@ -150,7 +152,16 @@ TEST_F(ZophotosWatch, ReportsThatAVolumeWillBeMergedFromTheBeginning) {
   const Database copy = Copy();
   Start({"--database", COPY});
   copy.Run("UPDATE Statistics SET last_updated_time = 0 WHERE volume = '/shares/B/'");
-  EXPECT_THAT(watch->ReadLine(), EndsWith("  /shares/B/ will be merged from the beginning"));
+  EXPECT_THAT(watch->ReadLine(),
+              EndsWith("  /shares/B/: unplugged or purged, will be merged from the beginning"));
+}
+
+TEST_F(ZophotosWatch, ReportsANewVolumeWithoutRenditions) {
+  const Database copy = Copy();
+  Start({"--database", COPY});
+  copy.Run("INSERT INTO Statistics(volume, photos_xcoded, photos_total, last_updated_time) "
+           "VALUES('/shares/E/', 0, 7, 0)");
+  EXPECT_THAT(watch->ReadLine(), EndsWith("  /shares/E/: 0 of 7 photos transcoded"));
 }
 
 TEST_F(ZophotosWatch, PrintsNothingWhileNothingChanges) {

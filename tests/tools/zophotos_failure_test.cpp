@@ -20,13 +20,15 @@ namespace {
 
 namespace fs = std::filesystem;
 using ::testing::AllOf;
+using ::testing::EndsWith;
 using ::testing::HasSubstr;
 using ::testing::Lt;
 using ::testing::Not;
 using ::testing::SizeIs;
 
 /// All commands except watch, which does not end by itself.
-const std::vector<Arguments> COMMANDS{{"status"},
+const std::vector<Arguments> COMMANDS{{},
+                                      {"status"},
                                       {"ls"},
                                       {"ls", "-l", "A"},
                                       {"tree"},
@@ -124,20 +126,29 @@ TEST_F(ZophotosLocator, IsNotReadToTheEndIfHuge) {
 
 TEST(ZophotosUsage, ErrorsHaveAStatusOfTheirOwn) {
   const std::vector<std::pair<Arguments, std::string>> wrong{
-      {{}, "a command is required"},
-      {{"destroy"}, "destroy"},
-      {{"ls", "--nonsense"}, "--nonsense"},
+      {{"destroy"}, "unknown command 'destroy'\n"},
+      {{"stats", "-l"}, "unknown command 'stats'; did you mean 'status'?\n"},
+      {{"help", "stat"}, "unknown command 'stat'; did you mean 'status'?\n"},
+      {{"help", "ls", "A"}, "unexpected argument 'A'"},
+      {{"ls", "--nonsense"}, "unknown option '--nonsense'\n"},
+      {{"ls", "--lang"}, "unknown option '--lang'; did you mean '--long'?\n"},
+      {{"--jsn", "ls"}, "unknown option '--jsn'; did you mean '--json'?\n"},
+      {{"find", "-rf"},
+       "'-rf'; to search for a name that begins with a dash: zophotos find -- '-rf'\n"},
       {{"ls", "A", "B"}, "B"},
       {{"status", "A"}, "A"},
+      {{"tree", "-L", "0"}, "--level: takes a number from 1 to 1000000, not '0'"},
+      {{"tree", "-L", "x"}, "not 'x'"},
       {{"find"}, "PATTERN is required"},
       {{"find", "a", "b"}, "b"},
-      {{"export"}, "needs either --csv or --jsonl"},
-      {{"export", "--csv", "--jsonl"}, "needs either --csv or --jsonl"},
-      {{"export", "--csv", "--json"}, "needs either --csv or --jsonl"},
+      {{"find", "--type", "x", "a"}, "--type: x not in {f,d}"},
+      {{"export", "--csv", "--jsonl"}, "--csv and --jsonl cannot be combined"},
+      {{"--json", "export", "--csv"}, "--csv and --json cannot be combined"},
       {{"find", "-0", "--json", "x"}, "--null and --json cannot be combined"},
       {{"--json", "find", "--null", "x"}, "--null and --json cannot be combined"},
       {{"--database"}, "--database"},
       {{"--database", "", "status"}, "must not be empty"},
+      {{"--color", "red"}, "--color: red not in {auto,always,never}"},
       {{"status", "check"}, "check"}};
   for (const auto& [arguments, message] : wrong) {
     SCOPED_TRACE(Text(arguments));
@@ -148,8 +159,20 @@ TEST(ZophotosUsage, ErrorsHaveAStatusOfTheirOwn) {
   }
 }
 
+TEST(ZophotosUsage, ErrorsNameTheHelpOfTheCommand) {
+  for (const auto& [arguments, hint] : std::vector<std::pair<Arguments, std::string>>{
+           {{"destroy"}, "zophotos"},
+           {{"--nonsense", "ls"}, "zophotos ls"},
+           {{"find"}, "zophotos find"},
+           {{"export", "--csv", "--jsonl"}, "zophotos export"},
+           {{"help", "destroy"}, "zophotos"}}) {
+    EXPECT_THAT(Zophotos(arguments).error, EndsWith("\nTry '" + hint + " --help'.\n"))
+        << Text(arguments);
+  }
+}
+
 TEST(ZophotosUsage, HelpNamesAllCommands) {
-  for (const Arguments& arguments : {Arguments{"--help"}, Arguments{"-h"}}) {
+  for (const Arguments& arguments : {Arguments{"--help"}, Arguments{"-h"}, Arguments{"help"}}) {
     const Outcome help = Zophotos(arguments);
     EXPECT_EQ(0, help.status);
     for (const char* const command : {"status", "ls", "tree", "find", "check", "watch", "export"}) {
@@ -157,6 +180,7 @@ TEST(ZophotosUsage, HelpNamesAllCommands) {
       const Outcome more = Zophotos({command, "--help"});
       EXPECT_EQ(0, more.status);
       EXPECT_THAT(more.output, AllOf(HasSubstr(command), HasSubstr("zophotos --help")));
+      EXPECT_EQ(more.output, Zophotos({"help", command}).output);
     }
   }
 }
@@ -173,7 +197,7 @@ protected:
   static void ExpectAllFail(int status, const std::string& message,
                             const std::string& except = "") {
     for (const Arguments& command : COMMANDS) {
-      if (command[0] != except) {
+      if (command.empty() || command[0] != except) {
         SCOPED_TRACE(Text(command));
         ExpectFailure(OnCopy(command), status, COPY + message);
       }

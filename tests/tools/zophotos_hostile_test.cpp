@@ -81,6 +81,8 @@ protected:
   void SetUp() override {
     ZophotosTest::SetUp();
     ASSERT_NE(nullptr, std::setlocale(LC_CTYPE, "C.UTF-8"));
+    setenv("TERM", "xterm", 1);
+    unsetenv("NO_COLOR");
     const Database copy = Copy();
     const auto add = [&copy](const std::string& name) {
       copy.Run("INSERT INTO Folders(parent_folder_id, name, modified_date, volume) VALUES(2, "
@@ -102,10 +104,22 @@ protected:
     }
   }
 
-  /// Runs zophotos on the copy, on a terminal.
+  /// Runs zophotos on the copy, on a terminal, and removes the sequences that set and reset the
+  /// colour of folders.
   static Lines OnTerminal(int columns, const Arguments& arguments) {
-    return Terminal(columns).Run(OnCopyArguments(arguments));
+    Lines lines = Terminal(columns).Run(OnCopyArguments(arguments));
+    for (std::string& line : lines) {
+      for (const std::string sequence : {COLOR, RESET}) {
+        if (const std::size_t begin = line.find(sequence); begin != std::string::npos) {
+          line.erase(begin, sequence.size());
+        }
+      }
+    }
+    return lines;
   }
+
+  static constexpr const char* COLOR = "\x1b[1;34m";
+  static constexpr const char* RESET = "\x1b[0m";
 
   /// The widths of the lines.
   static std::vector<int> Widths(const Lines& lines) {
@@ -122,24 +136,26 @@ TEST_F(ZophotosTerminal, TablesFitTheTerminal) {
     EXPECT_EQ(8U, list.size());
     EXPECT_THAT(Widths(list), Each(AllOf(Le(columns), testing::Gt(0))));
     Lines status = OnTerminal(columns, {"status"});
-    EXPECT_EQ(14U, status.size());
-    status.erase(status.begin(), status.begin() + 4);
+    EXPECT_EQ(columns < 80 ? 16U : 19U, status.size());
+    EXPECT_EQ(columns >= 80, status.back().starts_with("FILES: "));
+    status.erase(status.begin(), status.begin() + 5);
+    std::erase(status, ""); // above the legend
     EXPECT_THAT(Widths(status), Each(AllOf(Le(columns), testing::Gt(0))));
   }
 }
 
 TEST_F(ZophotosTerminal, NamesAreShortenedBeforeNumbersAreCut) {
   const Lines status = OnTerminal(80, {"status"});
-  ASSERT_EQ(14U, status.size());
-  EXPECT_THAT(status[4], AllOf(HasSubstr("VOLUME"), HasSubstr("MERGED UP TO")));
-  EXPECT_THAT(status[13],
+  ASSERT_EQ(19U, status.size());
+  EXPECT_THAT(status[5], AllOf(HasSubstr("VOLUME"), HasSubstr("MERGED UP TO")));
+  EXPECT_THAT(status[14],
               AllOf(HasSubstr("…"), HasSubstr("12345/99999"), HasSubstr("2023-11-14 22:13:20")));
-  EXPECT_THAT(status[5], HasSubstr("/shares/A/ "));
+  EXPECT_THAT(status[6], HasSubstr("/shares/A/ "));
 }
 
 TEST_F(ZophotosTerminal, BarsAreShownOnlyIfTheyFit) {
-  EXPECT_THAT(OnTerminal(120, {"status"}).at(5), HasSubstr("██████████ 100 %"));
-  EXPECT_THAT(OnTerminal(70, {"status"}).at(5), AllOf(Not(HasSubstr("█")), HasSubstr("100 %")));
+  EXPECT_THAT(OnTerminal(120, {"status"}).at(6), HasSubstr("██████████ 100 %"));
+  EXPECT_THAT(OnTerminal(70, {"status"}).at(6), AllOf(Not(HasSubstr("█")), HasSubstr("100 %")));
 }
 
 TEST_F(ZophotosTerminal, TablesAreNotShortenedWithoutATerminal) {
@@ -175,12 +191,12 @@ TEST_F(ZophotosTerminal, NamesWriteNoControlCharacters) {
   }
   for (const Arguments& arguments :
        {Arguments{"status"}, Arguments{"ls", "A"}, Arguments{"ls", "-l", "A"}, Arguments{"tree"},
-        Arguments{"find", "*"}, Arguments{"check"}, Arguments{"ls", "\x1b[2J\xff"},
+        Arguments{"find", "*"}, Arguments{"check"}, Arguments{}, Arguments{"ls", "\x1b[2J\xff"},
         Arguments{"tree", "\u009b2J"}}) {
     const Lines lines = OnTerminal(200, arguments);
     EXPECT_THAT(lines, Not(IsEmpty()));
     for (const std::string& line : lines) {
-      EXPECT_NE(-1, Columns(line)) << arguments[0] << ": " << ::testing::PrintToString(line);
+      EXPECT_NE(-1, Columns(line)) << ::testing::PrintToString(arguments) << line;
       const std::vector<std::string> unseen{
           {'\xe2', '\x80', '\xae'}, {'\xd8', '\x9c'}, {'\xef', '\xbb', '\xbf'}};
       for (const std::string& invisible : unseen) {
@@ -188,6 +204,42 @@ TEST_F(ZophotosTerminal, NamesWriteNoControlCharacters) {
       }
     }
   }
+}
+
+TEST_F(ZophotosTerminal, FoldersHaveAColor) {
+  Copy();
+  const std::string pictures = std::string(COLOR) + "Pictures/" + RESET;
+  const auto run = [](const Arguments& arguments) {
+    return Terminal(80).Run(OnCopyArguments(arguments));
+  };
+  EXPECT_EQ((Lines{pictures, "top.jpg"}), run({"ls", "A"}));
+  EXPECT_THAT(run({"ls", "-l", "A"}).at(1), testing::EndsWith("  " + pictures));
+  EXPECT_THAT(run({"ls", "-l", "A"}).at(2), testing::EndsWith("  top.jpg"));
+  EXPECT_EQ("└── " + pictures + "  2 files", run({"tree", "-L", "1", "A"}).at(1));
+  EXPECT_EQ((Lines{std::string(COLOR) + "/shares/A/Pictures/" + RESET}), run({"find", "Pict*"}));
+  EXPECT_EQ(pictures + "\ntop.jpg\n", OnCopy({"--color", "always", "ls", "A"}).output);
+}
+
+TEST_F(ZophotosTerminal, ColorsAreOnlyForTerminalsThatShowThem) {
+  Copy();
+  const Lines plain{"Pictures/", "top.jpg"};
+  const auto run = [](const Arguments& arguments) {
+    return Terminal(80).Run(OnCopyArguments(arguments));
+  };
+  EXPECT_EQ(plain, run({"ls", "A", "--color", "never"}));
+  EXPECT_EQ("Pictures/\ntop.jpg\n", OnCopy({"ls", "A"}).output);
+  setenv("NO_COLOR", "1", 1);
+  EXPECT_EQ(plain, run({"ls", "A"}));
+  unsetenv("NO_COLOR");
+  setenv("TERM", "dumb", 1);
+  EXPECT_EQ(plain, run({"ls", "A"}));
+  unsetenv("TERM");
+  EXPECT_EQ(plain, run({"ls", "A"}));
+}
+
+TEST_F(ZophotosTerminal, ColorsEscapeNamesAlsoInAPipe) {
+  AddRows(Copy(), "'/shares/A/' || CAST(x'1b' AS TEXT) || '/'");
+  EXPECT_THAT(OnCopy({"find", "--color", "always", "*"}).output, HasSubstr("/shares/A/\\x1b/"));
 }
 
 class ZophotosHostile : public ZophotosTest {
@@ -294,7 +346,8 @@ TEST_F(ZophotosHostile, DecreasingIdsAddNothing) {
   Program watch(ZophotosCommand(OnCopyArguments({"watch"})));
   EXPECT_THAT(watch.ReadLine(), HasSubstr("watching"));
   copy.Run("UPDATE sqlite_sequence SET seq = 0");
-  EXPECT_THAT(watch.ReadLine(), HasSubstr("  written, nothing added or removed"));
+  EXPECT_THAT(watch.ReadLine(),
+              HasSubstr("  the daemon wrote to the database, but added and removed nothing"));
 }
 
 TEST_F(ZophotosHostile, BlobsAsNamesDoNoHarm) {

@@ -13,6 +13,14 @@ using ::testing::HasSubstr;
 using ::testing::Not;
 using ::testing::StartsWith;
 
+/// A file name with a control character and a byte that is not UTF-8, in SQL and as bytes.
+const std::string ODD_NAME_SQL = "CAST(x'780a1b5bff5c2e6a7067' AS TEXT)";
+const std::string ODD_NAME = "x\n\x1b[\xff\\.jpg";
+
+const std::string STATUS_LEGEND =
+    "PHOTOS: transcoded / all of a volume, without hidden ones, at its last merge.\n"
+    "FILES: in the merged database: all transcoded files in visible folders.\n";
+
 class ZophotosStatus : public ZophotosTest {};
 class ZophotosList : public ZophotosTest {};
 class ZophotosTree : public ZophotosTest {};
@@ -20,16 +28,21 @@ class ZophotosFind : public ZophotosTest {};
 class ZophotosExport : public ZophotosTest {};
 
 TEST_F(ZophotosStatus, ShowsTheProgressOfEachVolume) {
-  ExpectOutput(Zophotos({"status"}),
-               "Database  /shares/A//.zophotos/zophotos.db\n"
-               "Version   2.0\n"
-               "Stamped   1970-01-01 00:16:40\n"
-               "\n"
-               "VOLUME      TRANSCODED        PHOTOS  FOLDERS  FILES  MERGED UP TO\n"
-               "/shares/A/  ██████████ 100 %     3/3        3      3  1970-01-01 00:33:22\n"
-               "/shares/B/  ███░░░░░░░  33 %     1/3        2      1  1970-01-01 00:33:23\n"
-               "/shares/C/  -                    0/0        1      0  -\n"
-               "/shares/D/  ░░░░░░░░░░   0 %     0/1        1      0  -\n");
+  ExpectOutput(
+      Zophotos({"status"}),
+      "Database  /shares/A//.zophotos/zophotos.db\n"
+      "Master    /shares/A/\n"
+      "Version   2.0\n"
+      "Emptied   -\n"
+      "\n"
+      "VOLUME               TRANSCODED        PHOTOS  FOLDERS  FILES  MERGED UP TO\n"
+      "/shares/A/ (master)  ██████████ 100 %     3/3        3      3  1970-01-01 00:33:22\n"
+      "/shares/B/           ███░░░░░░░  33 %     1/3        2      1  1970-01-01 00:33:23\n"
+      "/shares/C/           -                    0/0        1      0  -\n"
+      "/shares/D/           ░░░░░░░░░░   0 %     0/1        1      0  -\n"
+      "TOTAL                █████░░░░░  57 %     4/7        7      4  -\n"
+      "\n" +
+          STATUS_LEGEND);
 }
 
 TEST_F(ZophotosStatus, PrintsOneObjectInJson) {
@@ -44,13 +57,20 @@ TEST_F(ZophotosStatus, PrintsOneObjectInJson) {
       "\n");
 }
 
+TEST_F(ZophotosStatus, IsShownWithoutACommand) {
+  ExpectOutput(Zophotos({}), Zophotos({"status"}).output);
+  ExpectOutput(Zophotos({"--json"}), Zophotos({"status", "--json"}).output);
+  Copy();
+  ExpectOutput(OnCopy({}), OnCopy({"status"}).output);
+}
+
 TEST_F(ZophotosStatus, SaysWhenNoVolumeHasBeenMerged) {
   const Database copy = Copy();
   copy.Run("DELETE FROM Statistics");
   copy.Run("DELETE FROM Files");
   copy.Run("DELETE FROM Folders WHERE folder_id != 1");
   ExpectOutput(OnCopy({"status"}), "Database  " + COPY +
-                                       "\nVersion   2.0\nStamped   1970-01-01 00:16:40\n\n"
+                                       "\nMaster    -\nVersion   2.0\nEmptied   -\n\n"
                                        "No volume has been merged yet.\n");
   EXPECT_THAT(OnCopy({"--json", "status"}).output, HasSubstr(R"("volumes":[])"));
 }
@@ -71,22 +91,40 @@ TEST_F(ZophotosStatus, RoundsPercentagesDown) {
   }
 }
 
-TEST_F(ZophotosStatus, KeepsTheStatisticsOfAnUnpluggedVolume) {
+TEST_F(ZophotosStatus, ShowsAnUnpluggedVolumeAsGone) {
   appliance.Handle(Unplugged(b.Path()));
-  EXPECT_THAT(Zophotos({"status"}).output,
-              HasSubstr("/shares/B/  ███░░░░░░░  33 %     1/3        0      0  -\n"));
+  EXPECT_THAT(
+      Zophotos({"status"}).output,
+      AllOf(HasSubstr("/shares/B/           gone                   -        0      0  -\n"),
+            HasSubstr("TOTAL                ███████░░░  75 %     3/4        5      3  -\n")));
+  EXPECT_THAT(
+      Zophotos({"status", "--json"}).output,
+      HasSubstr(
+          R"({"volume":"/shares/B/","transcoded":1,"total":3,"folders":0,"files":0,"merged_up_to":null},)"));
+}
+
+TEST_F(ZophotosStatus, SaysThatThereIsNoMasterYet) {
+  // The daemon keeps the database there until the first scan.
+  std::filesystem::create_directories("/shares/.zophotos");
+  std::filesystem::copy_file(MERGED, "/shares//.zophotos/zophotos.db",
+                             std::filesystem::copy_options::overwrite_existing);
+  EXPECT_THAT(Zophotos({"--database", "/shares//.zophotos/zophotos.db"}).output,
+              AllOf(HasSubstr("\nMaster    none yet\n"), Not(HasSubstr("(master)"))));
+  EXPECT_THAT(Zophotos({"--database", "/shares/.zophotos/zophotos.db"}).output,
+              HasSubstr("\nMaster    /shares\n"));
 }
 
 TEST_F(ZophotosStatus, PrintsLocalTimesInText) {
+  Copy().Run("UPDATE Status SET mdate = 1001");
   setenv("TZ", "UTC-9", 1);
-  EXPECT_THAT(Zophotos({"status"}).output, HasSubstr("Stamped   1970-01-01 09:16:40\n"));
-  EXPECT_THAT(Zophotos({"status", "--json"}).output,
-              HasSubstr(R"("stamped":"1970-01-01T00:16:40Z")"));
+  EXPECT_THAT(OnCopy({"status"}).output, HasSubstr("Emptied   1970-01-01 09:16:41\n"));
+  EXPECT_THAT(OnCopy({"status", "--json"}).output,
+              HasSubstr(R"("stamped":"1970-01-01T00:16:41Z")"));
 }
 
 TEST_F(ZophotosStatus, AcceptsAMissingStatusRow) {
   Copy().Run("DELETE FROM Status");
-  EXPECT_THAT(OnCopy({"status"}).output, HasSubstr("\nVersion   -\nStamped   -\n\nVOLUME"));
+  EXPECT_THAT(OnCopy({"status"}).output, HasSubstr("\nVersion   -\nEmptied   -\n\nVOLUME"));
   EXPECT_THAT(OnCopy({"status", "--json"}).output, HasSubstr(R"("version":null,"stamped":null,)"));
 }
 
@@ -97,7 +135,7 @@ TEST_F(ZophotosStatus, PrintsTimesOutsideTheCalendarAsNumbers) {
         std::pair("253402300799", "9999-12-31 23:59:59"), std::pair("253402300800", "253402300800"),
         std::pair("67767976233532800", "67767976233532800")}) {
     copy.Run("UPDATE Status SET mdate = ?", {seconds});
-    EXPECT_THAT(OnCopy({"status"}).output, HasSubstr("\nStamped   " + std::string(text) + "\n"));
+    EXPECT_THAT(OnCopy({"status"}).output, HasSubstr("\nEmptied   " + std::string(text) + "\n"));
   }
 }
 
@@ -109,7 +147,7 @@ TEST_F(ZophotosStatus, ReadsTheDatabaseGivenAsAnOption) {
        {Arguments{"--database", COPY, "status"}, Arguments{"status", "--database=" + COPY}}) {
     const Outcome outcome = Zophotos(arguments);
     EXPECT_EQ(0, outcome.status);
-    EXPECT_THAT(outcome.output, StartsWith("Database  " + COPY + "\nVersion   7.5\n"));
+    EXPECT_THAT(outcome.output, StartsWith("Database  " + COPY + "\nMaster    -\nVersion   7.5\n"));
   }
   std::ofstream(LOCATOR) << "zophotos_db_path=" << MERGED << '\n';
 }
@@ -129,18 +167,80 @@ TEST_F(ZophotosList, AcceptsAbsoluteAndRelativeFolders) {
   }
 }
 
+TEST_F(ZophotosList, NormalizesPaths) {
+  for (const char* const folder :
+       {"A//Pictures", "//shares//A/./Pictures//", "A/Pictures/Summer/..", "../shares/A/Pictures",
+        "B/../A/Pictures/."}) {
+    ExpectOutput(Zophotos({"ls", folder}), "Summer/\nb.jpg\n");
+    ExpectOutput(Zophotos({"tree", folder}), Zophotos({"tree", "A/Pictures"}).output);
+  }
+  ExpectOutput(Zophotos({"ls", ".."}), "shares/\n");
+}
+
+TEST_F(ZophotosList, PrefersThePathAsItIsWritten) {
+  AddRows(Copy(), "'/shares/A//Pictures/'", "'other.jpg'");
+  ExpectOutput(OnCopy({"ls", "A//Pictures"}), "other.jpg\n");
+}
+
+TEST_F(ZophotosList, ShowsAFile) {
+  for (const char* const file :
+       {"A/Pictures/b.jpg", "/shares/A/Pictures/b.jpg", "A//Pictures/./b.jpg"}) {
+    ExpectOutput(Zophotos({"ls", file}), "/shares/A/Pictures/b.jpg\n");
+  }
+  ExpectOutput(Zophotos({"ls", "-l", "A/Pictures/b.jpg"}),
+               "MODIFIED             FILES  VOLUME      NAME\n"
+               "1970-01-01 00:16:41         /shares/A/  /shares/A/Pictures/b.jpg\n");
+  ExpectOutput(
+      Zophotos({"ls", "--json", "A/Pictures/b.jpg"}),
+      R"({"type":"file","path":"/shares/A/Pictures/b.jpg","volume":"/shares/A/","modified":"1970-01-01T00:16:41Z"})"
+      "\n");
+  EXPECT_EQ(1, Zophotos({"ls", "A/Pictures/b.jpg/"}).status);
+  EXPECT_EQ(1, Zophotos({"ls", "A/b.jpg"}).status);
+}
+
+TEST_F(ZophotosList, AcceptsNamesAsTheyArePrinted) {
+  const Database copy = Copy();
+  AddRows(copy, "'/shares/A/' || CAST(x'0a' AS TEXT) || '\\/'", ODD_NAME_SQL);
+  AddRows(copy, R"('/shares/A/\x41\xzz/')", R"('\x')");
+  for (const char* const folder : {R"(A/\x0a\\)", "A/\n\\"}) {
+    ExpectOutput(OnCopy({"ls", "--escape", folder}), R"(x\x0a\x1b[\xff\\.jpg)"
+                                                     "\n");
+    EXPECT_EQ(0, OnCopy({"tree", folder}).status);
+  }
+  for (const std::string& file : {std::string(R"(x\x0a\x1b[\xff\\.jpg)"), ODD_NAME}) {
+    ExpectOutput(OnCopy({"ls", "--escape", "A/\n\\/" + file}),
+                 R"(/shares/A/\x0a\\/x\x0a\x1b[\xff\\.jpg)"
+                 "\n");
+  }
+  for (const char* const folder : {R"(A/\x41\xzz)", R"(A/\\x41\\xzz)"}) {
+    ExpectOutput(OnCopy({"ls", "--escape", folder}), "\\\\x\n");
+  }
+}
+
+TEST_F(ZophotosList, PrintsOneNamePerLineOnRequest) {
+  ExpectOutput(Zophotos({"ls", "-1", "A"}), Zophotos({"ls", "A"}).output);
+  ExpectOutput(Zophotos({"ls", "-l1", "A"}), Zophotos({"ls", "-l", "A"}).output);
+}
+
 TEST_F(ZophotosList, AddsTimesNumbersAndVolumesInLongForm) {
   ExpectOutput(Zophotos({"ls", "-l", "A/Pictures"}),
                "MODIFIED             FILES  VOLUME      NAME\n"
                "1970-01-01 00:10:00      1  /shares/A/  Summer/\n"
                "1970-01-01 00:16:41         /shares/A/  b.jpg\n");
-  EXPECT_THAT(Zophotos({"ls", "--long"}).output,
-              HasSubstr("1970-01-01 00:00:00      0  /shares/B/  B/\n"));
+  EXPECT_THAT(Zophotos({"ls", "--long"}).output, HasSubstr("\n-             1  /shares/B/  B/\n"));
+}
+
+TEST_F(ZophotosList, CountsTheFilesBelowFolders) {
+  EXPECT_THAT(Zophotos({"ls", "-l"}).output,
+              AllOf(HasSubstr("\n-             3  /shares/A/  A/\n"),
+                    HasSubstr("\n-             1  /shares/B/  B/\n")));
+  EXPECT_THAT(Zophotos({"ls", "--json"}).output,
+              HasSubstr(R"("files":0,"stored":true,"files_below":1})"));
 }
 
 TEST_F(ZophotosList, PrintsOneObjectPerLineInJson) {
   const std::string lines =
-      R"({"type":"folder","path":"/shares/A/Pictures/Summer/","volume":"/shares/A/","modified":"1970-01-01T00:10:00Z","files":1,"stored":true})"
+      R"({"type":"folder","path":"/shares/A/Pictures/Summer/","volume":"/shares/A/","modified":"1970-01-01T00:10:00Z","files":1,"stored":true,"files_below":1})"
       "\n"
       R"({"type":"file","path":"/shares/A/Pictures/b.jpg","volume":"/shares/A/","modified":"1970-01-01T00:16:41Z"})"
       "\n";
@@ -149,8 +249,10 @@ TEST_F(ZophotosList, PrintsOneObjectPerLineInJson) {
 }
 
 TEST_F(ZophotosList, ReportsAMissingFolder) {
-  ExpectError(Zophotos({"ls", "A/Pict"}), 1, "zophotos: there is no folder /shares/A/Pict/\n");
-  ExpectError(Zophotos({"ls", "/elsewhere"}), 1, "zophotos: there is no folder /elsewhere/\n");
+  ExpectError(Zophotos({"ls", "A/Pict"}), 1,
+              "zophotos: there is no folder or file /shares/A/Pict\n");
+  ExpectError(Zophotos({"ls", "/elsewhere"}), 1,
+              "zophotos: there is no folder or file /elsewhere\n");
 }
 
 TEST_F(ZophotosList, PrintsNothingForAnEmptyFolder) {
@@ -172,12 +274,12 @@ protected:
 TEST_F(ZophotosRemovedFolder, IsListedAsNotStored) {
   ExpectOutput(
       Zophotos({"ls", "A", "--json"}),
-      R"({"type":"folder","path":"/shares/A/Pictures/","volume":null,"modified":null,"files":0,"stored":false})"
+      R"({"type":"folder","path":"/shares/A/Pictures/","volume":null,"modified":null,"files":0,"stored":false,"files_below":1})"
       "\n"
       R"({"type":"file","path":"/shares/A/top.jpg","volume":"/shares/A/","modified":"1970-01-01T00:16:40Z"})"
       "\n");
   EXPECT_THAT(Zophotos({"ls", "-l", "A"}).output,
-              HasSubstr("-                        0              Pictures/\n"));
+              HasSubstr("-                        1              Pictures/\n"));
 }
 
 TEST_F(ZophotosRemovedFolder, CanBeListed) {
@@ -185,10 +287,10 @@ TEST_F(ZophotosRemovedFolder, CanBeListed) {
 }
 
 TEST_F(ZophotosRemovedFolder, IsShownInTheTree) {
-  ExpectOutput(Zophotos({"tree", "A"}), "/shares/A/  1 file\n"
-                                        "└── Pictures/  (not stored)\n"
+  ExpectOutput(Zophotos({"tree", "A"}), "/shares/A/  2 files\n"
+                                        "└── Pictures/  1 file (not stored)\n"
                                         "    └── Summer/  1 file\n");
-  ExpectOutput(Zophotos({"tree", "A/Pictures"}), "/shares/A/Pictures/  (not stored)\n"
+  ExpectOutput(Zophotos({"tree", "A/Pictures"}), "/shares/A/Pictures/  1 file (not stored)\n"
                                                  "└── Summer/  1 file\n");
 }
 
@@ -199,25 +301,40 @@ TEST_F(ZophotosRemovedFolder, IsNotDamage) {
                                              "    /shares/A/Pictures/Summer/\n");
 }
 
-TEST_F(ZophotosTree, ShowsAllFoldersWithTheirNumbersOfFiles) {
-  ExpectOutput(Zophotos({"tree"}), "/shares/  0 files\n"
-                                   "├── A/  1 file\n"
-                                   "│   └── Pictures/  1 file\n"
+TEST_F(ZophotosTree, ShowsAllFoldersWithTheNumbersOfFilesBelowThem) {
+  ExpectOutput(Zophotos({"tree"}), "/shares/  4 files\n"
+                                   "├── A/  3 files\n"
+                                   "│   └── Pictures/  2 files\n"
                                    "│       └── Summer/  1 file\n"
-                                   "├── B/  0 files\n"
+                                   "├── B/  1 file\n"
                                    "│   └── Old/  1 file\n"
                                    "├── C/  0 files\n"
                                    "└── D/  0 files\n");
 }
 
+TEST_F(ZophotosTree, ShowsSomeLevelsOnRequest) {
+  ExpectOutput(Zophotos({"tree", "-L", "1"}), "/shares/  4 files\n"
+                                              "├── A/  3 files\n"
+                                              "├── B/  1 file\n"
+                                              "├── C/  0 files\n"
+                                              "└── D/  0 files\n");
+  ExpectOutput(Zophotos({"tree", "--level=1", "A"}), "/shares/A/  3 files\n"
+                                                     "└── Pictures/  2 files\n");
+  ExpectOutput(Zophotos({"tree", "-L2", "A"}), Zophotos({"tree", "A"}).output);
+}
+
 TEST_F(ZophotosTree, PrintsOneObjectPerLineInJson) {
-  ExpectOutput(Zophotos({"--json", "tree", "/shares/A"}),
-               R"({"path":"/shares/A/","depth":0,"files":1,"stored":true})"
-               "\n"
-               R"({"path":"/shares/A/Pictures/","depth":1,"files":1,"stored":true})"
-               "\n"
-               R"({"path":"/shares/A/Pictures/Summer/","depth":2,"files":1,"stored":true})"
-               "\n");
+  const std::string lines =
+      R"({"path":"/shares/A/","depth":0,"files":1,"stored":true,"files_below":3})"
+      "\n"
+      R"({"path":"/shares/A/Pictures/","depth":1,"files":1,"stored":true,"files_below":2})"
+      "\n";
+  ExpectOutput(
+      Zophotos({"--json", "tree", "/shares/A"}),
+      lines +
+          R"({"path":"/shares/A/Pictures/Summer/","depth":2,"files":1,"stored":true,"files_below":1})"
+          "\n");
+  ExpectOutput(Zophotos({"--json", "tree", "/shares/A", "-L", "1"}), lines);
 }
 
 TEST_F(ZophotosTree, PrintsSubfoldersDirectlyBelowTheirFolder) {
@@ -227,8 +344,8 @@ TEST_F(ZophotosTree, PrintsSubfoldersDirectlyBelowTheirFolder) {
   onA.AddFolder("a/x/", 1);
   onA.AddFolder("a!/", 1);
   Merge(a);
-  ExpectOutput(Zophotos({"tree", "A"}), "/shares/A/  1 file\n"
-                                        "├── Pictures/  1 file\n"
+  ExpectOutput(Zophotos({"tree", "A"}), "/shares/A/  3 files\n"
+                                        "├── Pictures/  2 files\n"
                                         "│   └── Summer/  1 file\n"
                                         "├── a/  0 files\n"
                                         "│   └── x/  0 files\n"
@@ -266,6 +383,42 @@ TEST_F(ZophotosFind, MatchesAPatternWithASeparatorWithTheWholePath) {
   ExpectOutput(Zophotos({"find", "Pictures/S"}), "/shares/A/Pictures/Summer/\n"
                                                  "/shares/A/Pictures/Summer/a.jpg\n");
   EXPECT_EQ(1, Zophotos({"find", "Old/*"}).status);
+}
+
+TEST_F(ZophotosFind, MatchesAPatternWithASeparatorRelativeToTheSharesRoot) {
+  ExpectOutput(Zophotos({"find", "B/*"}), "/shares/B/Old/\n/shares/B/Old/1.jpg\n");
+  ExpectOutput(Zophotos({"find", "B//Old/[0-9].jpg"}), "/shares/B/Old/1.jpg\n");
+  ExpectOutput(Zophotos({"find", "*/Old"}), "/shares/B/Old/\n");
+  EXPECT_EQ(1, Zophotos({"find", "/B/*"}).status);
+}
+
+TEST_F(ZophotosFind, MatchesRepeatedSeparatorsAsTheyAreWritten) {
+  AddRows(Copy(), "'/shares/A//Pictures/'", "'b.jpg'");
+  ExpectOutput(OnCopy({"find", "A//P*/b.jpg"}), "/shares/A//Pictures/b.jpg\n"
+                                                "/shares/A/Pictures/b.jpg\n");
+}
+
+TEST_F(ZophotosFind, AcceptsNamesAsTheyArePrinted) {
+  const Database copy = Copy();
+  AddRows(copy, "'/shares/A/odd/'", ODD_NAME_SQL);
+  AddRows(copy, "'/shares/A/odd[1]/'");
+  const std::string odd = R"(x\x0a\x1b[\xff\\.jpg)";
+  for (const std::string& pattern : {odd, ODD_NAME, "/shares/A/odd/" + odd, "A/odd/" + ODD_NAME}) {
+    ExpectOutput(OnCopy({"find", "-0", pattern}), "/shares/A/odd/" + ODD_NAME + '\0');
+  }
+  for (const char* const pattern : {"odd[1]", "/shares/A/odd[1]/", "A//odd[1]/"}) {
+    ExpectOutput(OnCopy({"find", pattern}), "/shares/A/odd[1]/\n");
+  }
+  EXPECT_THAT(OnCopy({"find", "/shares/A/Pictures/"}).output,
+              StartsWith("/shares/A/Pictures/\n/shares/A/Pictures/b.jpg\n"));
+}
+
+TEST_F(ZophotosFind, FindsOnlyFilesOrFoldersOnRequest) {
+  ExpectOutput(Zophotos({"find", "--type", "f", "A/Pictures/"}),
+               "/shares/A/Pictures/b.jpg\n/shares/A/Pictures/Summer/a.jpg\n");
+  ExpectOutput(Zophotos({"find", "--type=d", "A/Pictures/"}),
+               "/shares/A/Pictures/\n/shares/A/Pictures/Summer/\n");
+  ExpectError(Zophotos({"find", "--type", "d", "top.jpg"}), 1, "");
 }
 
 TEST_F(ZophotosFind, IgnoresCaseOnlyOnRequest) {
@@ -307,14 +460,21 @@ TEST_F(ZophotosFind, PrintsOneObjectPerLineInJson) {
       "\n");
 }
 
-/// A file name with a control character and a byte that is not UTF-8, in SQL and as bytes.
-const std::string ODD_NAME_SQL = "CAST(x'780a1b5bff5c2e6a7067' AS TEXT)";
-const std::string ODD_NAME = "x\n\x1b[\xff\\.jpg";
-
 TEST_F(ZophotosFind, EscapesControlCharactersAndInvalidUtf8) {
   AddRows(Copy(), "'/shares/A/odd/'", ODD_NAME_SQL);
-  ExpectOutput(OnCopy({"find", "x*"}), R"(/shares/A/odd/x\x0a\x1b[\xff\\.jpg)"
-                                       "\n");
+  ExpectOutput(OnCopy({"--escape", "find", "x*"}), R"(/shares/A/odd/x\x0a\x1b[\xff\\.jpg)"
+                                                   "\n");
+}
+
+TEST_F(ZophotosFind, PrintsUnescapedPathsIntoAPipe) {
+  AddRows(Copy(), "'/shares/A/odd/'", ODD_NAME_SQL);
+  ExpectOutput(OnCopy({"find", "x*"}), "/shares/A/odd/" + ODD_NAME + '\n');
+  ExpectOutput(OnCopy({"ls", "A/odd"}), ODD_NAME + '\n');
+  ExpectOutput(OnCopy({"ls", "A/odd/" + ODD_NAME}), "/shares/A/odd/" + ODD_NAME + '\n');
+  // Other text has more in a line than a name.
+  for (const Arguments& arguments : {Arguments{"ls", "-l", "A/odd"}, Arguments{"ls", "-l", "A"}}) {
+    EXPECT_THAT(OnCopy(arguments).output, Not(HasSubstr("\x1b")));
+  }
 }
 
 TEST_F(ZophotosFind, EscapesInvisibleCharacters) {
@@ -330,12 +490,12 @@ TEST_F(ZophotosFind, EscapesInvisibleCharacters) {
       {"\U000E0041", R"(\xf3\xa0\x81\x81)"}};
   for (const auto& [name, escaped] : names) {
     copy.Run("UPDATE Files SET name = ?1 WHERE name = 'top.jpg' OR name LIKE '%.x'", {name + ".x"});
-    ExpectOutput(OnCopy({"find", "*.x"}), "/shares/A/" + escaped + ".x\n");
+    ExpectOutput(OnCopy({"find", "--escape", "*.x"}), "/shares/A/" + escaped + ".x\n");
   }
   // A joiner in an emoji, and variation selectors of an emoji and of a Chinese character.
   for (const char* const name : {"👩‍👧.x", "❤️.x", "葛\U000E0100.x", "ü.x"}) {
     copy.Run("UPDATE Files SET name = ? WHERE name LIKE '%.x'", {name});
-    ExpectOutput(OnCopy({"find", "*.x"}), "/shares/A/" + std::string(name) + "\n");
+    ExpectOutput(OnCopy({"find", "--escape", "*.x"}), "/shares/A/" + std::string(name) + "\n");
   }
 }
 
@@ -365,6 +525,10 @@ TEST_F(ZophotosExport, WritesCsvWithAHeading) {
       "\n"
       R"("/shares/B/Old/1.jpg","/shares/B/",1970-01-02T00:00:00Z,1970-01-02T00:00:00Z)"
       "\n");
+}
+
+TEST_F(ZophotosExport, WritesCsvByDefault) {
+  ExpectOutput(Zophotos({"export"}), Zophotos({"export", "--csv"}).output);
 }
 
 TEST_F(ZophotosExport, WritesOneJsonObjectPerLine) {

@@ -41,9 +41,9 @@ inline CLI::Validator NotEmpty() {
 
 /// Has `app` read the arguments that follow the program's name. Returns false when they ask for
 /// help or the version, which are then on standard output. An app with subcommands has
-/// require_subcommand(0, 1) and still needs one: CLI11 would not name an unknown one otherwise.
-/// Throws UsageError.
-inline bool Parse(CLI::App& app, std::vector<std::string> arguments) {
+/// require_subcommand(0, 1), since CLI11 would not name an unknown one otherwise. It still needs
+/// one, unless `needsCommand` is false. Throws UsageError.
+inline bool Parse(CLI::App& app, std::vector<std::string> arguments, bool needsCommand = true) {
   // For "--name=" CLI11 would take the next argument as the value.
   const auto end = std::ranges::find(arguments, "--");
   const auto empty = std::find_if(arguments.begin(), end, [](const std::string& argument) {
@@ -55,7 +55,7 @@ inline bool Parse(CLI::App& app, std::vector<std::string> arguments) {
   try {
     std::ranges::reverse(arguments); // as CLI11 takes them
     app.parse(std::move(arguments));
-    if (app.get_require_subcommand_max() == 1 && app.get_subcommands().empty()) {
+    if (needsCommand && app.get_require_subcommand_max() == 1 && app.get_subcommands().empty()) {
       throw UsageError("a command is required");
     }
   } catch (const CLI::Success& request) {

@@ -2,6 +2,7 @@
 
 #include "Failure.h"
 
+#include <cstddef>
 #include <functional>
 #include <string>
 
@@ -19,17 +20,31 @@ using FindPath = std::function<std::string()>;
 /// Shows where the database is and the progress of each volume.
 ExitStatus ShowStatus(const std::string& path, Form form);
 
-/// Lists a folder. `folder` is absolute or relative to the shares root.
-ExitStatus ListFolder(const std::string& path, const std::string& folder, bool isLong, Form form);
+/// What List shows, and how.
+struct Listing {
+  std::string path; ///< of a folder or file, as the user gives it, see Spellings
+  bool isLong = false;
+  bool escapes = true; ///< print names for people
+  bool colors = false; ///< print folders in a colour; needs `escapes`
+};
 
-/// Shows all folders below a folder, by their paths.
-ExitStatus ShowTree(const std::string& path, const std::string& folder, Form form);
+/// Lists a folder, or shows a file.
+ExitStatus List(const std::string& path, const Listing& listing, Form form);
+
+/// Shows the folders below a folder, by their paths, down to `levels` below it. `folder` and
+/// `colors` are as in Listing.
+ExitStatus ShowTree(const std::string& path, const std::string& folder, std::size_t levels,
+                    bool colors, Form form);
 
 /// What FindItems searches for, and how it prints the results.
 struct Search {
   std::string pattern;
   bool ignoreCase = false;
   bool nullTerminated = false; ///< print the bytes of each path unchanged and a NUL after them
+  bool escapes = true;         ///< print paths for people
+  bool colors = false;         ///< print folders in a colour; needs `escapes`
+  bool folders = true;         ///< find folders
+  bool files = true;           ///< find files
 };
 
 /// Finds files and folders by their names.
@@ -46,11 +61,5 @@ ExitStatus ExportFiles(const std::string& path, ExportFormat format);
 /// Prints a line for each change until the output cannot be written. An exception from `findPath`
 /// is a change, too.
 ExitStatus WatchDatabase(const FindPath& findPath, Form form);
-
-/// The name of `folder` in the database: its absolute path with a separator at the end.
-std::string FolderPath(const std::string& folder);
-
-/// The smallest text that sorts after all paths in the folder at `path`.
-std::string EndOfFolder(const std::string& path);
 
 } // namespace orva::zophotos

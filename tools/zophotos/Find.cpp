@@ -4,31 +4,64 @@
 
 #include <fnmatch.h>
 
+#include <algorithm>
 #include <optional>
+#include <set>
+#include <string_view>
+#include <utility>
 
 namespace orva::zophotos {
 
 namespace {
 
-/// Matches a pattern against the last component of a path, or against the whole path if the pattern
-/// has a separator. A pattern without wildcards matches anywhere in the text.
+constexpr std::string_view SHARES = "/shares/";
+
+/// `path` with single separators.
+std::string WithoutRepeatedSeparators(std::string path) {
+  const auto rest =
+      std::unique(path.begin(), path.end(), [](char a, char b) { return a == '/' && b == '/'; });
+  path.erase(rest, path.end());
+  return path;
+}
+
+/// Matches a pattern against the last component of a path. A pattern with a separator is compared
+/// with the whole path, and with the path relative to the shares root. A pattern without wildcards
+/// matches anywhere in the text. A name or path matches itself, also as Printable writes it.
 class Matcher {
 public:
   Matcher(const std::string& pattern, bool ignoreCase)
-      : pattern_(pattern.find_first_of("*?[\\") == std::string::npos ? "*" + pattern + "*"
-                                                                     : pattern),
-        wholePath_(pattern.find('/') != std::string::npos), flags_(ignoreCase ? FNM_CASEFOLD : 0) {
+      : wholePath_(pattern.find('/') != std::string::npos), flags_(ignoreCase ? FNM_CASEFOLD : 0) {
     UseUtf8(); // for fnmatch
+    const bool isText = pattern.find_first_of("*?[\\") == std::string::npos;
+    for (const std::string& spelling : {pattern, WithoutRepeatedSeparators(pattern)}) {
+      patterns_.insert(isText ? "*" + spelling + "*" : spelling);
+      for (std::string name : {spelling, Unescape(spelling)}) {
+        if (name.ends_with('/')) {
+          name.pop_back(); // of a folder as it is printed
+        }
+        names_.insert(std::move(name));
+      }
+    }
   }
 
   /// `path` is the path of a file, or of a folder without the separator at its end.
   bool Matches(const std::string& path) const {
-    const std::size_t name = wholePath_ ? 0 : path.rfind('/') + 1;
-    return fnmatch(pattern_.c_str(), path.c_str() + name, flags_) == 0;
+    if (!wholePath_) {
+      return MatchesText(path.substr(path.rfind('/') + 1));
+    }
+    return MatchesText(path) ||
+           (path.starts_with(SHARES) && MatchesText(path.substr(SHARES.size())));
   }
 
 private:
-  std::string pattern_;
+  bool MatchesText(const std::string& text) const {
+    return names_.contains(text) || std::ranges::any_of(patterns_, [&](const std::string& pattern) {
+             return fnmatch(pattern.c_str(), text.c_str(), flags_) == 0;
+           });
+  }
+
+  std::set<std::string> patterns_;
+  std::set<std::string> names_;
   bool wholePath_;
   int flags_;
 };
@@ -43,7 +76,8 @@ void Print(const std::string& path, const Item& item, bool isFolder, const Searc
                {"volume", ToUtf8(item.volume)},
                {"modified", JsonTime(isFolder ? item.folderModified : item.modified)}});
   } else {
-    std::cout << Printable(path) << '\n';
+    std::cout << FolderColor(search.escapes ? Printable(path) : path, search.colors && isFolder)
+              << '\n';
   }
 }
 
@@ -57,12 +91,12 @@ ExitStatus FindItems(const std::string& path, const Search& search, Form form) {
   Walk(database, [&](const Item& item) {
     if (folderId != item.folderId) {
       folderId = item.folderId;
-      if (matcher.Matches(item.folder.substr(0, item.folder.size() - 1))) {
+      if (search.folders && matcher.Matches(item.folder.substr(0, item.folder.size() - 1))) {
         found = true;
         Print(item.folder, item, true, search, form);
       }
     }
-    if (item.file && matcher.Matches(item.folder + *item.file)) {
+    if (search.files && item.file && matcher.Matches(item.folder + *item.file)) {
       found = true;
       Print(item.folder + *item.file, item, false, search, form);
     }

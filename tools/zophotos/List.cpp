@@ -1,6 +1,7 @@
 #include "Commands.h"
 #include "Json.h"
 #include "MergedDatabase.h"
+#include "Paths.h"
 #include "Table.h"
 
 #include <SQLiteCpp/Statement.h>
@@ -17,6 +18,7 @@ struct Entry {
   std::string path{};
   std::string name{}; ///< last component; for a folder with its separator
   std::int64_t files = 0;
+  std::int64_t filesBelow = 0; ///< at any depth, with its own
   std::int64_t modified = 0;
   std::string volume{};
 };
@@ -69,10 +71,58 @@ void ReadFiles(SQLite::Database& database, const std::string& folder, std::vecto
   }
 }
 
-bool IsStored(SQLite::Database& database, const std::string& folder) {
-  SQLite::Statement query(database, "SELECT 1 FROM Folders WHERE name = ?");
-  query.bind(1, folder);
-  return query.executeStep();
+/// Sets the numbers of files below the folders.
+void CountFilesBelow(SQLite::Database& database, std::vector<Entry>& entries) {
+  SQLite::Statement query(database, "SELECT count(*) FROM Folders o JOIN Files f ON f.folder_id = "
+                                    "o.folder_id WHERE o.name >= ? AND o.name < ?");
+  for (Entry& entry : entries) {
+    entry.filesBelow = entry.files;
+    // Only an untrusted database has folders without a separator at the end.
+    if (entry.isFolder && entry.path.ends_with('/')) {
+      query.bind(1, entry.path);
+      query.bind(2, EndOfFolder(entry.path));
+      query.executeStep();
+      entry.filesBelow = query.getColumn(0).getInt64();
+      query.reset();
+    }
+  }
+}
+
+/// The files at `path`: one, unless the database is damaged. Their names are their paths.
+std::vector<Entry> ReadFile(SQLite::Database& database, const std::string& path) {
+  const std::size_t name = path.rfind('/') + 1;
+  SQLite::Statement query(database,
+                          "SELECT f.modified_date, f.volume FROM Folders o JOIN Files f ON "
+                          "f.folder_id = o.folder_id WHERE o.name = ? AND f.name = ?");
+  query.bind(1, path.substr(0, name));
+  query.bind(2, path.substr(name));
+  std::vector<Entry> entries;
+  while (query.executeStep()) {
+    entries.push_back({.isFolder = false,
+                       .isStored = true,
+                       .path = path,
+                       .name = path,
+                       .modified = query.getColumn(0).getInt64(),
+                       .volume = query.getColumn(1).getString()});
+  }
+  return entries;
+}
+
+/// What is in a folder, or a file. Throws Failure if there is neither.
+std::vector<Entry> Read(SQLite::Database& database, const std::string& item) {
+  const std::vector<std::string> spellings = Spellings(item);
+  if (const auto folder = FindFolder(database, spellings)) {
+    std::vector<Entry> entries = ReadFolders(database, *folder);
+    ReadFiles(database, *folder, entries);
+    return entries;
+  }
+  for (const std::string& spelling : spellings) {
+    std::vector<Entry> entries = ReadFile(database, spelling);
+    if (!entries.empty()) {
+      return entries;
+    }
+  }
+  throw Failure(ExitStatus::Negative, "there is no folder or file " + spellings.front());
 }
 
 void PrintJson(const Entry& entry) {
@@ -83,49 +133,54 @@ void PrintJson(const Entry& entry) {
   if (entry.isFolder) {
     line["files"] = entry.files;
     line["stored"] = entry.isStored;
+    line["files_below"] = entry.filesBelow;
   }
   PrintLine(line);
 }
 
-void PrintLong(const std::vector<Entry>& entries) {
+void PrintLong(const std::vector<Entry>& entries, bool colors) {
   Table table({{.heading = "MODIFIED"},
                {.heading = "FILES", .right = true},
                {.heading = "VOLUME", .elastic = true},
                {.heading = "NAME", .elastic = true}});
   for (const Entry& entry : entries) {
-    table.AddRow({entry.isStored ? LocalTime(entry.modified) : "-",
-                  entry.isFolder ? std::to_string(entry.files) : "", Printable(entry.volume),
-                  Printable(entry.name)});
+    // A volume's top folder has no time.
+    table.AddRow({entry.isStored && entry.modified != 0 ? LocalTime(entry.modified) : "-",
+                  entry.isFolder ? std::to_string(entry.filesBelow) : "", Printable(entry.volume),
+                  Printable(entry.name)},
+                 colors && entry.isFolder);
   }
   table.Print(std::cout, TerminalWidth());
 }
 
-void PrintNames(const std::vector<Entry>& entries) {
+void PrintNames(const std::vector<Entry>& entries, const Listing& listing) {
   for (const Entry& entry : entries) {
-    std::cout << Printable(entry.name) << '\n';
+    std::cout << FolderColor(listing.escapes ? Printable(entry.name) : entry.name,
+                             listing.colors && entry.isFolder)
+              << '\n';
   }
 }
 
 } // namespace
 
-ExitStatus ListFolder(const std::string& path, const std::string& folder, bool isLong, Form form) {
-  const std::string folderPath = FolderPath(folder);
+ExitStatus List(const std::string& path, const Listing& listing, Form form) {
   std::vector<Entry> entries;
   {
     // Sorting takes long for a folder that holds most of a library.
     SQLite::Database database = CopyDatabase(path);
-    entries = ReadFolders(database, folderPath);
-    ReadFiles(database, folderPath, entries);
-    if (entries.empty() && !IsStored(database, folderPath)) {
-      throw Failure(ExitStatus::Negative, "there is no folder " + folderPath);
+    entries = Read(database, listing.path);
+    if (listing.isLong || form == Form::Json) {
+      CountFilesBelow(database, entries);
     }
   }
   if (form == Form::Json) {
     for (const Entry& entry : entries) {
       PrintJson(entry);
     }
+  } else if (listing.isLong) {
+    PrintLong(entries, listing.colors);
   } else {
-    (isLong ? PrintLong : PrintNames)(entries);
+    PrintNames(entries, listing);
   }
   return ExitStatus::Success;
 }

@@ -29,8 +29,9 @@ Table::Table(std::vector<Column> columns) : columns_(std::move(columns)) {
   AddRow(std::move(headings));
 }
 
-void Table::AddRow(std::vector<std::string> cells) {
+void Table::AddRow(std::vector<std::string> cells, bool colors) {
   rows_.push_back(std::move(cells));
+  colors_.push_back(colors);
 }
 
 std::vector<std::size_t> Table::Widths(std::size_t limit) const {
@@ -59,17 +60,25 @@ std::size_t Table::NarrowestWidth() const {
 void Table::Print(std::ostream& stream, std::optional<std::size_t> width) const {
   const std::size_t limit = width.value_or(std::string::npos);
   const std::vector<std::size_t> widths = Widths(limit);
-  for (const auto& row : rows_) {
+  for (std::size_t number = 0; number < rows_.size(); ++number) {
+    const auto& row = rows_[number];
     std::string line;
+    std::size_t last = 0; // where the last cell begins
     for (std::size_t i = 0; i < widths.size(); ++i) {
       const std::string cell = Shorten(row[i], widths[i]);
       const std::string padding(widths[i] - Width(cell), ' ');
+      last = line.size();
       line += columns_[i].right ? padding + cell : cell + padding;
       line.append(GAP, ' ');
     }
     line.erase(line.find_last_not_of(' ') + 1);
-    // A number without its end would look like another number, so the cut is marked.
-    stream << (Width(line) <= limit ? line : std::string(Head(line, limit - 1)) + "…") << '\n';
+    if (Width(line) > limit) {
+      // A number without its end would look like another number, so the cut is marked.
+      line = std::string(Head(line, limit - 1)) + "…";
+    } else if (last < line.size()) {
+      line = line.substr(0, last) + FolderColor(line.substr(last), colors_[number]);
+    }
+    stream << line << '\n';
   }
 }
 

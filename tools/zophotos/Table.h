@@ -19,8 +19,9 @@ public:
 
   explicit Table(std::vector<Column> columns);
 
-  /// Adds a row with one text per column.
-  void AddRow(std::vector<std::string> cells);
+  /// Adds a row with one text per column. The last one is in the colour of folders if `colors` is
+  /// set.
+  void AddRow(std::vector<std::string> cells, bool colors = false);
 
   /// Writes the headings and all rows, in at most `width` terminal columns. Shortens elastic
   /// columns first, then cuts the ends of the lines.
@@ -35,6 +36,7 @@ private:
 
   std::vector<Column> columns_;
   std::vector<std::vector<std::string>> rows_; ///< the first row is the headings
+  std::vector<bool> colors_;                   ///< of each row
 };
 
 } // namespace orva::zophotos

@@ -7,6 +7,7 @@
 #include <unistd.h>
 
 #include <array>
+#include <charconv>
 #include <clocale>
 #include <cstdio>
 #include <ctime>
@@ -114,6 +115,30 @@ std::string Printable(std::string_view bytes) {
   return text;
 }
 
+std::string Unescape(std::string_view text) {
+  std::string bytes;
+  while (!text.empty()) {
+    unsigned char code = 0;
+    if (text.starts_with("\\\\")) {
+      text.remove_prefix(1);
+    } else if (text.starts_with("\\x") && text.size() >= 4) {
+      const char* const end = text.data() + 4;
+      if (std::from_chars(text.data() + 2, end, code, 16).ptr == end) {
+        bytes += static_cast<char>(code);
+        text.remove_prefix(4);
+        continue;
+      }
+    }
+    bytes += text.front();
+    text.remove_prefix(1);
+  }
+  return bytes;
+}
+
+std::string FolderColor(const std::string& printable, bool colors) {
+  return colors ? "\x1b[1;34m" + printable + "\x1b[0m" : printable;
+}
+
 std::size_t Width(std::string_view printable) {
   std::size_t columns = 0;
   while (!printable.empty()) {
@@ -153,6 +178,10 @@ std::optional<std::size_t> TerminalWidth() {
     return std::nullopt;
   }
   return size.ws_col;
+}
+
+bool IsTerminal() {
+  return isatty(STDOUT_FILENO) != 0;
 }
 
 std::string LocalTime(std::int64_t seconds) {

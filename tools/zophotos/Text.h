@@ -18,6 +18,12 @@ std::string ToUtf8(std::string_view bytes);
 /// UTF-8 are escaped, so that a name cannot control the terminal.
 std::string Printable(std::string_view bytes);
 
+/// The bytes that Printable made `text` of. Backslashes that begin no escape stay.
+std::string Unescape(std::string_view text);
+
+/// A printable text, in the colour of folders if `colors` is set.
+std::string FolderColor(const std::string& printable, bool colors);
+
 /// The number of terminal columns that a printable text takes.
 std::size_t Width(std::string_view printable);
 
@@ -29,6 +35,9 @@ std::string Shorten(const std::string& printable, std::size_t width);
 
 /// The width of the terminal at standard output; nothing if that is not a terminal.
 std::optional<std::size_t> TerminalWidth();
+
+/// Whether standard output is a terminal.
+bool IsTerminal();
 
 /// "2026-11-21 09:15:00" in local time, for people; the number outside the years 1 to 9999.
 std::string LocalTime(std::int64_t seconds);

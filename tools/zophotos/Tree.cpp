@@ -1,11 +1,13 @@
 #include "Commands.h"
 #include "Json.h"
 #include "MergedDatabase.h"
+#include "Paths.h"
 
 #include <SQLiteCpp/Statement.h>
 
 #include <algorithm>
 #include <string_view>
+#include <utility>
 #include <vector>
 
 namespace orva::zophotos {
@@ -23,6 +25,7 @@ struct Node {
   std::string_view path; ///< a folder's path, or the beginning of one
   std::size_t depth;
   std::int64_t files = 0;
+  std::int64_t filesBelow = 0; ///< at any depth, with its own
   bool isStored = false;
   bool isLast = false; ///< the last one of its siblings
 };
@@ -34,9 +37,7 @@ bool ComesBefore(const std::string& a, const std::string& b) {
   return std::ranges::lexicographical_compare(a, b, {}, rank, rank);
 }
 
-std::vector<StoredFolder> ReadFolders(const std::string& path, const std::string& top) {
-  // Counting reads every file of a large library, which takes long.
-  SQLite::Database database = CopyDatabase(path);
+std::vector<StoredFolder> ReadFolders(SQLite::Database& database, const std::string& top) {
   SQLite::Statement query(database,
                           "SELECT name, (SELECT count(*) FROM Files f WHERE f.folder_id = "
                           "o.folder_id) FROM Folders o WHERE name >= ? AND name < ?");
@@ -77,31 +78,37 @@ std::vector<Node> MakeTree(const std::vector<StoredFolder>& folders, const std::
   }
   // Read from the end, the first node of a depth below a parent is the parent's last child.
   std::vector<bool> hasLast;
+  std::vector<std::int64_t> below; // the files of the nodes read whose parents are still to come
   std::for_each(nodes.rbegin(), nodes.rend(), [&](Node& node) {
     const bool known = node.depth < hasLast.size() && hasLast[node.depth];
     node.isLast = !known;
     hasLast.resize(node.depth + 1, false);
     hasLast[node.depth] = true;
+    below.resize(std::max(below.size(), node.depth + 2), 0);
+    node.filesBelow = node.files + std::exchange(below[node.depth + 1], 0);
+    below[node.depth] += node.filesBelow;
   });
   return nodes;
 }
 
-void PrintTreeText(const std::vector<Node>& nodes) {
+void PrintTreeText(const std::vector<Node>& nodes, bool colors) {
   std::vector<std::string> indents; // one for each level above the node
   for (const Node& node : nodes) {
     indents.resize(node.depth);
     if (node.depth == 0) {
-      std::cout << Printable(node.path);
+      std::cout << FolderColor(Printable(node.path), colors);
       indents.emplace_back();
     } else {
       const std::size_t parentLength = node.path.rfind('/', node.path.size() - 2) + 1;
       for (const std::string& indent : indents) {
         std::cout << indent;
       }
-      std::cout << (node.isLast ? "└── " : "├── ") << Printable(node.path.substr(parentLength));
+      std::cout << (node.isLast ? "└── " : "├── ")
+                << FolderColor(Printable(node.path.substr(parentLength)), colors);
       indents.emplace_back(node.isLast ? "    " : "│   ");
     }
-    std::cout << (node.isStored ? "  " + Count(node.files, "file") : "  (not stored)") << '\n';
+    std::cout << "  " << Count(node.filesBelow, "file") << (node.isStored ? "" : " (not stored)")
+              << '\n';
   }
 }
 
@@ -110,20 +117,30 @@ void PrintTreeJson(const std::vector<Node>& nodes) {
     PrintLine({{"path", ToUtf8(node.path)},
                {"depth", node.depth},
                {"files", node.files},
-               {"stored", node.isStored}});
+               {"stored", node.isStored},
+               {"files_below", node.filesBelow}});
   }
 }
 
 } // namespace
 
-ExitStatus ShowTree(const std::string& path, const std::string& folder, Form form) {
-  const std::string top = FolderPath(folder);
-  const std::vector<StoredFolder> folders = ReadFolders(path, top);
-  const std::vector<Node> nodes = MakeTree(folders, top);
-  if (nodes.empty()) {
-    throw Failure(ExitStatus::Negative, "there is no folder " + top);
+ExitStatus ShowTree(const std::string& path, const std::string& folder, std::size_t levels,
+                    bool colors, Form form) {
+  // Counting reads every file of a large library, which takes long.
+  SQLite::Database database = CopyDatabase(path);
+  const std::vector<std::string> spellings = Spellings(folder);
+  const auto top = FindFolder(database, spellings);
+  if (!top) {
+    throw Failure(ExitStatus::Negative, "there is no folder " + FolderPath(spellings.front()));
   }
-  (form == Form::Json ? PrintTreeJson : PrintTreeText)(nodes);
+  const std::vector<StoredFolder> folders = ReadFolders(database, *top);
+  std::vector<Node> nodes = MakeTree(folders, *top);
+  std::erase_if(nodes, [levels](const Node& node) { return node.depth > levels; });
+  if (form == Form::Json) {
+    PrintTreeJson(nodes);
+  } else {
+    PrintTreeText(nodes, colors);
+  }
   return ExitStatus::Success;
 }
 

@@ -6,6 +6,8 @@
 #include <SQLiteCpp/Statement.h>
 #include <SQLiteCpp/Transaction.h>
 
+#include <boost/algorithm/string/join.hpp>
+
 #include <sys/stat.h>
 
 #include <algorithm>
@@ -17,6 +19,7 @@
 #include <thread>
 #include <tuple>
 #include <utility>
+#include <vector>
 
 namespace orva::zophotos {
 
@@ -99,15 +102,24 @@ void AddVolumes(SQLite::Database& database, const char* newRowsSql, const Rows& 
   }
 }
 
-std::string Describe(const Difference& difference, const std::string& noun) {
+/// "added 1 folder and 2 files", without what is 0; empty if both are.
+std::string Describe(const char* verb, std::int64_t folders, std::int64_t files) {
   std::string text;
-  if (difference.added != 0) {
-    text += " +" + Count(difference.added, noun);
+  if (folders != 0) {
+    text = Count(folders, "folder");
   }
-  if (difference.removed != 0) {
-    text += " -" + Count(difference.removed, noun);
+  if (files != 0) {
+    text += (text.empty() ? "" : " and ") + Count(files, "file");
   }
-  return text;
+  return text.empty() ? text : verb + (" " + text);
+}
+
+/// What has become of a volume. `before` is null for a new one.
+std::string Describe(const Progress* before, const Progress& now) {
+  if (now.mergedUpTo == 0 && before != nullptr && before->mergedUpTo != 0) {
+    return "unplugged or purged, will be merged from the beginning";
+  }
+  return std::to_string(now.transcoded) + " of " + Count(now.total, "photo") + " transcoded";
 }
 
 class Watch {
@@ -191,6 +203,7 @@ private:
     std::set<std::string> changed;
     Difference folders;
     Difference files;
+    State before;
     {
       const SQLite::Transaction oneState(*database_);
       State now = ReadState(*database_);
@@ -204,28 +217,30 @@ private:
                  "SELECT volume FROM Files WHERE file_id > ? ORDER BY file_id LIMIT 10000",
                  state_.files, changed);
       for (const auto& [volume, progress] : now.volumes) {
-        const auto before = state_.volumes.find(volume);
-        if (before == state_.volumes.end() || before->second != progress) {
+        const auto known = state_.volumes.find(volume);
+        if (known == state_.volumes.end() || known->second != progress) {
           changed.insert(volume);
         }
       }
-      state_ = std::move(now);
+      before = std::exchange(state_, std::move(now));
     }
-    std::string text = Describe(folders, "folder") + Describe(files, "file");
+    std::vector<std::string> parts{Describe("added", folders.added, files.added),
+                                   Describe("removed", folders.removed, files.removed)};
     Json volumes = Json::array();
     for (const std::string& volume : changed) {
       const Progress progress = state_.volumes[volume];
-      text += "; " + Printable(volume) + " ";
-      text += progress.mergedUpTo == 0 ? "will be merged from the beginning"
-                                       : std::to_string(progress.transcoded) + " of " +
-                                             Count(progress.total, "photo") + " transcoded";
+      const auto known = before.volumes.find(volume);
+      parts.push_back(Printable(volume) + ": " +
+                      Describe(known == before.volumes.end() ? nullptr : &known->second, progress));
       volumes.push_back({{"volume", ToUtf8(volume)},
                          {"transcoded", progress.transcoded},
                          {"total", progress.total},
                          {"merged_up_to", JsonStamp(progress.mergedUpTo)}});
     }
+    std::erase(parts, "");
     Print("changed",
-          text.empty() ? "written, nothing added or removed" : text.substr(text[0] == ' ' ? 1 : 2),
+          parts.empty() ? "the daemon wrote to the database, but added and removed nothing"
+                        : boost::algorithm::join(parts, "; "),
           {{"folders_added", folders.added},
            {"folders_removed", folders.removed},
            {"files_added", files.added},

@@ -1,14 +1,17 @@
 #include "Commands.h"
 #include "Locator.h"
 #include "MergedDatabase.h"
+#include "Suggestion.h"
 #include "Text.h"
 
 #include "commandline/Parse.h"
 
 #include <SQLiteCpp/Exception.h>
 
+#include <cstdlib>
 #include <exception>
 #include <iostream>
+#include <limits>
 #include <string>
 #include <utility>
 #include <vector>
@@ -16,6 +19,7 @@
 namespace {
 
 using namespace orva::zophotos;
+using orva::commandline::UsageError;
 
 /// The command line.
 class Options {
@@ -29,7 +33,13 @@ public:
         ->type_name("FILE")
         ->check(orva::commandline::NotEmpty());
     app_.add_flag("--json", json_, "Print JSON: one object, or one object per line");
+    app_.add_flag("--escape", escape_,
+                  "Escape the names that ls and find print also if the output is not a terminal");
+    app_.add_option("--color", color_, "Print folders in a colour; auto: on a terminal")
+        ->type_name("auto|always|never")
+        ->check(CLI::IsMember({"auto", "always", "never"}));
     app_.footer(
+        "Without a command, zophotos shows the status.\n"
         "Exit status: 0 success; 1 damaged, or nothing found; 2 wrong command line; 3 no database "
         "now;\n4 locked, try again; 5 any other error. See zophotos(1).");
     AddCommands();
@@ -38,7 +48,24 @@ public:
   /// Returns false when the arguments ask for help or the version, which are then on standard
   /// output. Throws UsageError.
   bool Parse(std::vector<std::string> arguments) {
-    return orva::commandline::Parse(app_, std::move(arguments));
+    try {
+      if (!orva::commandline::Parse(app_, std::move(arguments), false)) {
+        return false;
+      }
+    } catch (const UsageError& error) {
+      throw UsageError(Explain(error));
+    }
+    if (help_->parsed()) {
+      std::cout << Help();
+      return false;
+    }
+    return true;
+  }
+
+  /// The command whose help is likely to tell what is wrong with the command line.
+  std::string CommandToTry() const {
+    const CLI::App* const command = Command();
+    return command == nullptr || command == help_ ? "zophotos" : "zophotos " + command->get_name();
   }
 
   /// Runs the command. Throws Failure.
@@ -60,45 +87,147 @@ private:
 
   Form OutputForm() const { return json_ ? Form::Json : Form::Text; }
 
+  /// Whether to escape names where each is a line of its own.
+  bool Escapes() const { return escape_ || Colors() || IsTerminal(); }
+
+  /// Whether to print folders in a colour.
+  bool Colors() const {
+    const auto variable = [](const char* name) {
+      const char* const value = std::getenv(name);
+      return std::string(value == nullptr ? "" : value);
+    };
+    const std::string terminal = variable("TERM");
+    return color_ == "always" ||
+           (color_ == "auto" && IsTerminal() && variable("NO_COLOR").empty() && !terminal.empty() &&
+            terminal != "dumb");
+  }
+
+  /// The command on the command line; null if there is none.
+  const CLI::App* Command() const {
+    const auto commands = app_.get_subcommands();
+    return commands.empty() ? nullptr : commands.front();
+  }
+
+  std::vector<std::string> CommandNames() const {
+    std::vector<std::string> names;
+    for (const CLI::App* const command : app_.get_subcommands({})) {
+      names.push_back(command->get_name());
+    }
+    return names;
+  }
+
+  /// The names of the options that the command line may have.
+  std::vector<std::string> OptionNames() const {
+    std::vector<std::string> names;
+    for (const CLI::App* const app : {Command(), static_cast<const CLI::App*>(&app_)}) {
+      if (app != nullptr) {
+        for (const CLI::Option* const option : app->get_options()) {
+          for (const std::string& name : option->get_lnames()) {
+            names.push_back("--" + name);
+          }
+        }
+      }
+    }
+    return names;
+  }
+
+  /// The message for an unknown command or option, otherwise that of `error`.
+  std::string Explain(const UsageError& error) const {
+    const std::vector<std::string> rest = app_.remaining(true);
+    if (rest.empty()) {
+      return error.what();
+    }
+    const std::string& word = rest.front();
+    if (word.starts_with('-')) {
+      std::string text = "unknown option '" + word + "'" + DidYouMean(word, OptionNames());
+      if (find_->parsed()) {
+        text += "; to search for a name that begins with a dash: zophotos find -- '" + word + "'";
+      }
+      return text;
+    }
+    return Command() == nullptr ? UnknownCommand(word) : error.what();
+  }
+
+  std::string UnknownCommand(const std::string& word) const {
+    return "unknown command '" + word + "'" + DidYouMean(word, CommandNames());
+  }
+
+  static std::string DidYouMean(const std::string& word, const std::vector<std::string>& names) {
+    const auto suggestion = Suggest(word, names);
+    return suggestion ? "; did you mean '" + *suggestion + "'?" : "";
+  }
+
+  /// The help that the command `help` prints.
+  std::string Help() const {
+    if (topic_.empty()) {
+      return app_.get_formatter()->make_help(&app_, app_.get_name(), CLI::AppFormatMode::Normal);
+    }
+    const auto commands = app_.get_subcommands(
+        [this](const CLI::App* command) { return command->get_name() == topic_; });
+    if (commands.empty()) {
+      throw UsageError(UnknownCommand(topic_));
+    }
+    return commands.front()->help(app_.get_name());
+  }
+
   ExitStatus RunOn(const std::string& path) const {
     const Form form = OutputForm();
-    if (status_->parsed()) {
+    if (Command() == nullptr || status_->parsed()) {
       return ShowStatus(path, form);
     }
     if (ls_->parsed()) {
-      return ListFolder(path, folder_, long_, form);
+      return List(path, {.path = path_, .isLong = long_, .escapes = Escapes(), .colors = Colors()},
+                  form);
     }
     if (tree_->parsed()) {
-      return ShowTree(path, folder_, form);
+      return ShowTree(path, path_, levels_, Colors(), form);
     }
     if (find_->parsed()) {
-      return FindItems(path, search_, form);
+      Search search = search_;
+      search.escapes = Escapes();
+      search.colors = Colors();
+      return FindItems(path, search, form);
     }
     if (check_->parsed()) {
       return CheckDatabase(path, form);
     }
-    return ExportFiles(path, csv_ ? ExportFormat::Csv : ExportFormat::JsonLines);
+    return ExportFiles(path, jsonLines_ || json_ ? ExportFormat::JsonLines : ExportFormat::Csv);
   }
 
   void AddCommands() {
     status_ = app_.add_subcommand("status", "Show the database and the progress of each volume");
-    ls_ = app_.add_subcommand("ls", "List a folder");
+    ls_ = app_.add_subcommand("ls", "List a folder, or show a file");
     ls_->add_flag("-l,--long", long_, "Add times, numbers of files and volumes");
+    ls_->add_flag_callback(
+        "-1", [] {}, "Print one name per line, which is the default");
+    ls_->add_option("PATH", path_, "The folder or file, absolute or relative to /shares")
+        ->default_str("/shares");
     tree_ =
         app_.add_subcommand("tree", "Show all folders below a folder, with their numbers of files");
-    for (CLI::App* const command : {ls_, tree_}) {
-      command->add_option("FOLDER", folder_, "The folder, absolute or relative to /shares")
-          ->default_str("/shares");
-    }
+    tree_->add_option("-L,--level", levels_, "Show only so many levels of folders")
+        ->type_name("NUMBER")
+        ->transform(orva::commandline::Decimal(1, 1'000'000));
+    tree_->add_option("FOLDER", path_, "The folder, absolute or relative to /shares")
+        ->default_str("/shares");
     find_ = app_.add_subcommand("find", "Find files and folders by name");
     find_
         ->add_option("PATTERN", search_.pattern,
-                     "Shell pattern for the name, or for the whole path if it has a /; without "
-                     "wildcards: text that the name or path contains")
+                     "Shell pattern for the name, or for the whole path if it has a /, absolute or "
+                     "relative to /shares; without wildcards: text that the name or path contains")
         ->required();
     find_->add_flag("-i,--ignore-case", search_.ignoreCase, "Ignore case");
     find_->add_flag("-0,--null", search_.nullTerminated,
                     "Print paths unescaped, each followed by a NUL");
+    find_
+        ->add_option_function<std::string>(
+            "--type",
+            [this](const std::string& type) {
+              search_.folders = type != "f";
+              search_.files = type != "d";
+            },
+            "Find only files (f) or only folders (d)")
+        ->type_name("f|d")
+        ->check(CLI::IsMember({"f", "d"}));
     find_->callback([this] {
       if (search_.nullTerminated && json_) {
         throw CLI::ValidationError("find", "--null and --json cannot be combined");
@@ -107,6 +236,8 @@ private:
     check_ = app_.add_subcommand("check", "Check the database for damage");
     watch_ = app_.add_subcommand("watch", "Print a line for each change until interrupted");
     AddExport();
+    help_ = app_.add_subcommand("help", "Print help, or the help of a command");
+    help_->add_option("COMMAND", topic_, "The command");
     for (CLI::App* const command : app_.get_subcommands({})) {
       command->footer("Options of all commands: zophotos --help");
     }
@@ -114,11 +245,14 @@ private:
 
   void AddExport() {
     export_ = app_.add_subcommand("export", "Print every file with its full path");
-    export_->add_flag("--csv", csv_, "Print comma-separated values with a line of headings");
+    export_->add_flag("--csv", csv_,
+                      "Print comma-separated values with a line of headings (the default)");
     export_->add_flag("--jsonl", jsonLines_, "Print one JSON object per line, like --json");
     export_->callback([this] {
-      if (csv_ == (jsonLines_ || json_)) {
-        throw CLI::ValidationError("export", "needs either --csv or --jsonl");
+      if (csv_ && (jsonLines_ || json_)) {
+        throw CLI::ValidationError("export", std::string("--csv and ") +
+                                                 (jsonLines_ ? "--jsonl" : "--json") +
+                                                 " cannot be combined");
       }
     });
   }
@@ -131,10 +265,15 @@ private:
   CLI::App* check_ = nullptr;
   CLI::App* watch_ = nullptr;
   CLI::App* export_ = nullptr;
+  CLI::App* help_ = nullptr;
   std::string database_;
-  std::string folder_;
+  std::string color_ = "auto";
+  std::string path_;  ///< of ls and tree
+  std::string topic_; ///< of help
+  std::size_t levels_ = std::numeric_limits<std::size_t>::max();
   Search search_;
   bool json_ = false;
+  bool escape_ = false;
   bool long_ = false;
   bool csv_ = false;
   bool jsonLines_ = false;
@@ -149,11 +288,12 @@ int Finish(ExitStatus status) {
 }
 
 ExitStatus Run(std::vector<std::string> arguments) {
+  Options options;
   try {
-    Options options;
     return options.Parse(std::move(arguments)) ? options.Run() : ExitStatus::Success;
-  } catch (const orva::commandline::UsageError& error) {
-    std::cerr << "zophotos: " << Printable(error.what()) << "\nTry 'zophotos --help'.\n";
+  } catch (const UsageError& error) {
+    std::cerr << "zophotos: " << Printable(error.what()) << "\nTry '" << options.CommandToTry()
+              << " --help'.\n";
     return ExitStatus::Usage;
   } catch (const Failure& failure) {
     std::cerr << "zophotos: " << Printable(failure.what()) << '\n';

@@ -1,0 +1,51 @@
+#include "Paths.h"
+
+#include "Text.h"
+
+#include <SQLiteCpp/Statement.h>
+
+#include <algorithm>
+#include <filesystem>
+
+namespace orva::zophotos {
+
+std::vector<std::string> Spellings(const std::string& text) {
+  std::vector<std::string> spellings;
+  const auto add = [&spellings](const std::string& path) {
+    if (std::ranges::find(spellings, path) == spellings.end()) {
+      spellings.push_back(path);
+    }
+  };
+  for (const std::string& path : {text, Unescape(text)}) {
+    const std::string absolute = path.starts_with('/') ? path : "/shares/" + path;
+    add(absolute);
+    add(std::filesystem::path(absolute).lexically_normal().string());
+  }
+  return spellings;
+}
+
+std::string FolderPath(const std::string& path) {
+  return path.ends_with('/') ? path : path + '/';
+}
+
+std::string EndOfFolder(const std::string& path) {
+  // '0' is the character after '/'.
+  return path.substr(0, path.size() - 1) + "0";
+}
+
+std::optional<std::string> FindFolder(SQLite::Database& database,
+                                      const std::vector<std::string>& spellings) {
+  SQLite::Statement query(database, "SELECT 1 FROM Folders WHERE name >= ? AND name < ? LIMIT 1");
+  for (const std::string& spelling : spellings) {
+    const std::string folder = FolderPath(spelling);
+    query.bind(1, folder);
+    query.bind(2, EndOfFolder(folder));
+    if (query.executeStep()) {
+      return folder;
+    }
+    query.reset();
+  }
+  return std::nullopt;
+}
+
+} // namespace orva::zophotos

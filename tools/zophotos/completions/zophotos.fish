@@ -1,0 +1,31 @@
+# Completion of zophotos for fish.
+
+set -l commands status ls tree find check watch export help
+set -l first "not __fish_seen_subcommand_from $commands"
+
+complete -c zophotos -f
+complete -c zophotos -l database -r -F -d 'Read this database'
+complete -c zophotos -l json -d 'Print JSON'
+complete -c zophotos -l color -x -a 'auto always never' -d 'Print folders in a colour'
+complete -c zophotos -l escape -d 'Escape names also if the output is not a terminal'
+complete -c zophotos -l version -d 'Print the version'
+complete -c zophotos -s h -l help -d 'Print help'
+
+complete -c zophotos -n $first -a status -d 'Show the database and the progress of each volume'
+complete -c zophotos -n $first -a ls -d 'List a folder, or show a file'
+complete -c zophotos -n $first -a tree -d 'Show all folders below a folder'
+complete -c zophotos -n $first -a find -d 'Find files and folders by name'
+complete -c zophotos -n $first -a check -d 'Check the database for damage'
+complete -c zophotos -n $first -a watch -d 'Print a line for each change until interrupted'
+complete -c zophotos -n $first -a export -d 'Print every file with its full path'
+complete -c zophotos -n $first -a help -d 'Print help, or the help of a command'
+complete -c zophotos -n '__fish_seen_subcommand_from help' -a "$commands"
+
+complete -c zophotos -n '__fish_seen_subcommand_from ls' -s l -l long -d 'Add times, numbers of files and volumes'
+complete -c zophotos -n '__fish_seen_subcommand_from ls' -s 1 -d 'Print one name per line'
+complete -c zophotos -n '__fish_seen_subcommand_from tree' -s L -l level -x -d 'Show only so many levels'
+complete -c zophotos -n '__fish_seen_subcommand_from find' -s i -l ignore-case -d 'Ignore case'
+complete -c zophotos -n '__fish_seen_subcommand_from find' -s 0 -l null -d 'End each path with a NUL'
+complete -c zophotos -n '__fish_seen_subcommand_from find' -l type -x -a 'f d' -d 'Find only files or folders'
+complete -c zophotos -n '__fish_seen_subcommand_from export' -l csv -d 'Print comma-separated values'
+complete -c zophotos -n '__fish_seen_subcommand_from export' -l jsonl -d 'Print one JSON object per line'
