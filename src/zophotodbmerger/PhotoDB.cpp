@@ -183,8 +183,10 @@ bool HasOwnSequences(const PhotoDB& photos) {
   if (!HasObject(photos, "CREATE TABLE IF NOT EXISTS sqlite_sequence(name,seq)")) {
     return false;
   }
-  Statement count(photos, "SELECT count(*) FROM main.sqlite_sequence");
-  if (count.Fetch() && count.GetInt64(0) > mostSequences) {
+  // Not by count(*), which no limit ends.
+  Statement next(photos, "SELECT 1 FROM main.sqlite_sequence LIMIT 1 OFFSET ?");
+  next.BindInt64(1, mostSequences);
+  if (next.Fetch()) {
     throw db::ErrorMessage(
         util::FormatString("too many sequences in '%s'", photos.GetPath().c_str()));
   }
