@@ -326,7 +326,7 @@ std::vector<Figure> ComputeFigures(const Results& results) {
 }
 
 void WriteTable(std::ostream& out, const std::vector<Figure>& figures, const Results& results) {
-  constexpr int FIGURE_WIDTH = 52;
+  constexpr int FIGURE_WIDTH = 54;
   constexpr int TIME_WIDTH = 33;
   out << Today() << ", " << Machine() << "\n\n";
   WriteRow(out, FIGURE_WIDTH, "FIGURE", "SHAPE", "FILES", "MEASURED", "TARGET", "", "PAIRS");
