@@ -2,7 +2,6 @@
 
 #include "FolderSet.h"
 
-#include "IdRows.h"
 #include "PhotoDB.h"
 #include "StandardOutput.h"
 
@@ -14,7 +13,24 @@
 
 namespace orva::dbmerger {
 
+namespace {
+
 using db::Statement;
+
+/// Ids as rows.
+class IdRows final : public db::Rows {
+public:
+  explicit IdRows(std::span<const long long> ids) : ids_(ids) {}
+
+  bool Next() noexcept override { return next_++ != ids_.size(); }
+  Value Get(Column /*column*/) const noexcept override { return ids_[next_ - 1]; }
+
+private:
+  std::span<const long long> ids_;
+  std::size_t next_ = 0;
+};
+
+} // namespace
 
 /// The additions of a set as rows. Takes the id of each row after it was inserted: the rows after
 /// it may be its subfolders.

@@ -5,7 +5,7 @@
 
 namespace orva::test {
 
-/// Whether the private root has users besides root. For an ordinary user it is a user namespace,
+/// Whether the private root has users other than root. For an ordinary user it is a user namespace,
 /// where only one user is known: no file can belong to another one.
 inline bool HasOtherUsers() {
   std::ifstream map("/proc/self/uid_map");
