@@ -66,7 +66,7 @@ void StandardOutput::Inspect() {
   }
   device_ = status.st_dev;
   inode_ = status.st_ino;
-  pending_.clear(); // the rest of a line of the former output
+  pending_.clear();                   // the rest of a line of the former output
   pending_.reserve(2 * MOST_PENDING); // once, so that the daemon does not grow
   isInLine_ = false;
   isStalled_ = false;
