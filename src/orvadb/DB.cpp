@@ -122,7 +122,7 @@ void DB::Open(std::string path, Access access, int busyTimeout, bool immutable) 
     if (access == Access::ReadWrite) {
       // A merge keeps its changes in memory until it commits, so that readers wait only then.
       Run(handle_, "PRAGMA cache_size = -65536");
-      // The sets of row ids that SQLite makes for a statement are small.
+      // What SQLite keeps for a statement is small: ids of folders, or an emptied database.
       Run(handle_, "PRAGMA temp_store = MEMORY");
     }
   } catch (...) {

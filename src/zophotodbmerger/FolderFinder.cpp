@@ -19,10 +19,8 @@ std::span<const long long> FolderFinder::Find(std::string_view path) {
   ids_.clear();
   volume_.reset();
   while (!isAtEnd_ && query_->GetTextView(0) == path) {
-    if (ids_.empty()) {
-      if (query_->IsText(2)) {
-        volume_ = query_->GetTextView(2);
-      }
+    if (ids_.empty() && query_->IsText(2)) {
+      volume_ = query_->GetTextView(2);
     }
     ids_.push_back(query_->GetInt64(1));
     Advance();
