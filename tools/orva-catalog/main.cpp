@@ -120,8 +120,8 @@ int main(int argc, char** argv) {
     }
     return 0;
   } catch (const commandline::UsageError& error) {
-    std::cerr << "orva-catalog: " << error.what() << "\nTry 'orva-catalog --help'.\n";
-    return 2;
+    commandline::Report(error);
+    return commandline::EXIT_USAGE;
   } catch (const std::exception& error) {
     std::cerr << "orva-catalog: " << error.what() << '\n';
   } catch (const std::string& error) { // the database layer's

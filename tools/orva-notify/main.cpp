@@ -16,8 +16,6 @@ namespace {
 using namespace orva::notify;
 using orva::core::ORVA_NOTIFICATION_SOCKET;
 
-constexpr int EXIT_USAGE = 2;
-
 std::string ReadAll(std::istream& stream) {
   return {std::istreambuf_iterator<char>(stream), std::istreambuf_iterator<char>()};
 }
@@ -82,8 +80,8 @@ int main(int count, char* arguments[]) {
     }
     return EXIT_SUCCESS;
   } catch (const orva::commandline::UsageError& error) {
-    std::cerr << "orva-notify: " << error.what() << "\nTry 'orva-notify --help'.\n";
-    return EXIT_USAGE;
+    orva::commandline::Report(error);
+    return orva::commandline::EXIT_USAGE;
   } catch (const std::exception& error) {
     std::cerr << "orva-notify: " << error.what() << '\n';
     return EXIT_FAILURE;
