@@ -366,13 +366,16 @@ TEST_F(OrvaNotify, ARawFileThatCannotBeReadIsAnError) {
   Serve();
   const Answer outcome = RunNotify({"send", "--raw", folder_ + "/absent"});
   EXPECT_EQ(outcome.status, 1);
-  EXPECT_EQ(outcome.line, "orva-notify: Cannot read '" + folder_ + "/absent'");
+  EXPECT_EQ(outcome.line,
+            "orva-notify: cannot read " + folder_ + "/absent: No such file or directory");
+  EXPECT_EQ(RunNotify({"send", "--raw", folder_}).line,
+            "orva-notify: cannot read " + folder_ + ": Is a directory");
 }
 
 TEST_F(OrvaNotify, SendFailsWhenNoServiceListens) {
   const Answer outcome = RunNotify({"send", "plugged", "/shares/A"});
   EXPECT_EQ(outcome.status, 1);
-  EXPECT_EQ(outcome.line, "orva-notify: No orva-notify serves " + ORVA_NOTIFICATION_SOCKET +
+  EXPECT_EQ(outcome.line, "orva-notify: no orva-notify serves " + ORVA_NOTIFICATION_SOCKET +
                               ": No such file or directory");
 }
 
@@ -394,7 +397,7 @@ TEST_F(OrvaNotify, WaitsForTheGivenNumberOfClients) {
   const Answer tooFew =
       RunNotify({"send", "--clients", "2", "--wait", "0", "plugged", "/shares/TooEarly"});
   EXPECT_EQ(tooFew.status, 1);
-  EXPECT_EQ(tooFew.line, "orva-notify: Fewer than 2 clients connected within 0 s");
+  EXPECT_EQ(tooFew.line, "orva-notify: fewer than 2 clients connected within 0 s");
 
   Program waiting(Notify({"send", "--clients", "2", "plugged", "/shares/A"}));
   EXPECT_EQ(RunNotify({"send", "scanned", "/shares/B"}).line, "sent to 1 client");
@@ -445,7 +448,10 @@ TEST_F(OrvaNotify, FailsWhenAnotherServiceListens) {
   Serve();
   const Answer second = RunNotify({"serve"});
   EXPECT_EQ(second.status, 1);
-  EXPECT_THAT(second.line, HasSubstr("something else is there, perhaps another service"));
+  EXPECT_EQ(second.line, "orva-notify: cannot listen on " +
+                             ControlAddress(ORVA_NOTIFICATION_SOCKET) +
+                             ": another service listens there; end it first (the installed "
+                             "one: systemctl stop orva-notify)");
   Listener client;
   EXPECT_EQ(RunNotify({"send", "end", "/shares/A"}).line, "sent to 1 client");
 }
@@ -454,7 +460,10 @@ TEST_F(OrvaNotify, DoesNotReplaceAFileThatIsNotASocket) {
   std::filesystem::create_directories(
       std::filesystem::path(ORVA_NOTIFICATION_SOCKET).parent_path());
   std::ofstream(ORVA_NOTIFICATION_SOCKET) << "precious";
-  EXPECT_EQ(RunNotify({"serve"}).status, 1);
+  const Answer outcome = RunNotify({"serve"});
+  EXPECT_EQ(outcome.status, 1);
+  EXPECT_EQ(outcome.line, "orva-notify: cannot listen on " + ORVA_NOTIFICATION_SOCKET +
+                              ": there is a file that is not a socket; remove it");
   EXPECT_EQ(std::filesystem::file_size(ORVA_NOTIFICATION_SOCKET), 8U);
 }
 
@@ -487,7 +496,7 @@ TEST_F(OrvaNotify, RefusesAMessageThatIsTooLong) {
   const Answer outcome = RunNotify({"send", "--raw", file});
   EXPECT_EQ(outcome.status, 1);
   EXPECT_EQ(outcome.line,
-            "orva-notify: A message of 67108865 bytes is too long, 67108864 are allowed");
+            "orva-notify: a message of 67108865 bytes is too long, 67108864 are allowed");
 }
 
 TEST_F(OrvaNotify, SurvivesMalformedRequests) {

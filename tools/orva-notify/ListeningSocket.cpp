@@ -2,7 +2,6 @@
 
 #include "orvautil/ClientSocket.h"
 #include "orvautil/Exception.h"
-#include "orvautil/FormatString.h"
 
 #include <sys/stat.h>
 #include <unistd.h>
@@ -32,6 +31,18 @@ void RemoveStaleSocket(const std::string& path) {
   }
 }
 
+/// Why `address` cannot be bound, and what to do.
+std::string Explain(const std::string& address, int error) {
+  if (error != EADDRINUSE) {
+    return strerror(error);
+  }
+  if (IsPath(address) && !IsSocket(address)) {
+    return "there is a file that is not a socket; remove it";
+  }
+  return "another service listens there; end it first (the installed one: systemctl stop "
+         "orva-notify)";
+}
+
 } // namespace
 
 ListeningSocket::ListeningSocket(std::string address)
@@ -54,9 +65,8 @@ void ListeningSocket::Bind() {
   const Address address(address_);
   isBound_ = bind(Descriptor(), address.Get(), address.Length()) == 0;
   if (!isBound_ || listen(Descriptor(), SOMAXCONN) != 0) {
-    const char* const reason =
-        errno == EADDRINUSE ? "something else is there, perhaps another service" : strerror(errno);
-    throw util::Exception(util::FormatString("Cannot listen on %s: %s", address_.c_str(), reason));
+    const std::string reason = Explain(address_, errno);
+    throw util::Exception("cannot listen on " + address_ + ": " + reason);
   }
 }
 

@@ -42,7 +42,7 @@ std::string CountOfClients(std::size_t count) {
 
 util::FileDescriptor CheckedDescriptor(int descriptor, const char* what) {
   if (descriptor == -1) {
-    throw util::Exception(FormatString("Cannot open %s: %s", what, strerror(errno)));
+    throw util::Exception(FormatString("cannot open %s: %s", what, strerror(errno)));
   }
   return util::FileDescriptor(descriptor);
 }
@@ -110,7 +110,7 @@ void Service::Wait() {
     add(request->Descriptor(), POLLIN);
   }
   if (poll(descriptors.data(), descriptors.size(), -1) == -1 && errno != EINTR) {
-    throw util::Exception(FormatString("Cannot wait for clients: %s", strerror(errno)));
+    throw util::Exception(FormatString("cannot wait for clients: %s", strerror(errno)));
   }
 }
 

@@ -4,30 +4,47 @@
 #include "orva-notify/Service.h"
 #include "orvautil/Core.h"
 #include "orvautil/Exception.h"
+#include "orvautil/FileDescriptor.h"
 
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <cerrno>
 #include <csignal>
 #include <cstdlib>
-#include <fstream>
+#include <cstring>
 #include <iostream>
-#include <iterator>
+#include <string>
+#include <vector>
 
 namespace {
 
 using namespace orva::notify;
 using orva::core::ORVA_NOTIFICATION_SOCKET;
 
-std::string ReadAll(std::istream& stream) {
-  return {std::istreambuf_iterator<char>(stream), std::istreambuf_iterator<char>()};
-}
-
+/// The content of the file; "-" is standard input.
 std::string ReadFile(const std::string& name) {
-  if (name == "-") {
-    return ReadAll(std::cin);
-  }
-  std::ifstream file(name, std::ios::binary);
-  std::string content = ReadAll(file);
+  const bool isInput = name == "-";
+  const orva::util::FileDescriptor file(isInput ? dup(STDIN_FILENO)
+                                                : open(name.c_str(), O_RDONLY | O_CLOEXEC));
+  const auto fail = [&] {
+    throw orva::util::Exception("cannot read " + (isInput ? "standard input" : name) + ": " +
+                                std::strerror(errno));
+  };
   if (!file) {
-    throw orva::util::Exception("Cannot read '" + name + "'");
+    fail();
+  }
+  std::string content;
+  std::vector<char> chunk(std::size_t{64} * 1024);
+  ssize_t count = 0;
+  do {
+    count = read(file.Get(), chunk.data(), chunk.size());
+    if (count > 0) {
+      content.append(chunk.data(), static_cast<std::size_t>(count));
+    }
+  } while (count > 0 || (count == -1 && errno == EINTR));
+  if (count == -1) {
+    fail();
   }
   return content;
 }
