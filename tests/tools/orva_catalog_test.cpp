@@ -728,11 +728,11 @@ TEST_F(OrvaCatalog, TheProgramIndexesAndPrintsWhatItChanged) {
   Write("b.txt");
   const Outcome first = RunProgram("index " + volume_.native());
   EXPECT_EQ(first.status, 0);
-  EXPECT_EQ(first.output, volume_.native() + ": 1 folders, 2 files, 1 photos; files: 2 added, "
+  EXPECT_EQ(first.output, volume_.native() + ": 1 folder, 2 files, 1 photo; files: 2 added, "
                                              "0 changed, 0 deleted, 0 revived\n");
   Remove("b.txt");
   const Outcome second = RunProgram("index " + volume_.native() + "/");
-  EXPECT_EQ(second.output, volume_.native() + ": 1 folders, 1 files, 1 photos; files: 0 added, "
+  EXPECT_EQ(second.output, volume_.native() + ": 1 folder, 1 file, 1 photo; files: 0 added, "
                                               "0 changed, 1 deleted, 0 revived\n");
 }
 
@@ -742,7 +742,7 @@ TEST_F(OrvaCatalog, ProgressIsShownOnATerminalAndErased) {
       RunShell("script --quiet --return --command '" + test::ProgramPath("orva-catalog") +
                " index " + volume_.native() + "' /dev/null");
   EXPECT_EQ(outcome.status, 0);
-  const std::string progress = "\r\033[K1 folders, 1 files, 1 photos\r\033[K";
+  const std::string progress = "\r\033[K1 folder, 1 file, 1 photo\r\033[K";
   EXPECT_EQ(outcome.output.substr(0, progress.size() + volume_.native().size()),
             progress + volume_.native());
 }
@@ -755,6 +755,12 @@ TEST_F(OrvaCatalog, TheProgramGeneratesAndRestamps) {
   const Outcome stamped = RunProgram("generate " + volume_.native() + " --restamp");
   EXPECT_EQ(stamped.status, 0);
   EXPECT_EQ(stamped.output, volume_.native() + ": stamped 25 transcodings again\n");
+  EXPECT_EQ(RunProgram("generate " + volume_.native() +
+                       " --files 1 --per-folder 10 --names unique --tree flat")
+                .output,
+            volume_.native() + ": generated 1 photo in 1 folder\n");
+  EXPECT_EQ(RunProgram("generate " + volume_.native() + " --restamp").output,
+            volume_.native() + ": stamped 1 transcoding again\n");
 }
 
 TEST_F(OrvaCatalog, HelpAndVersionGoToStandardOutput) {

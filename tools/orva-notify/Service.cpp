@@ -1,5 +1,6 @@
 #include "orva-notify/Service.h"
 
+#include "commandline/Count.h"
 #include "orva-notify/Notification.h"
 #include "orvautil/Exception.h"
 #include "orvautil/FormatString.h"
@@ -37,7 +38,7 @@ std::string Printable(const std::string& text) {
 }
 
 std::string CountOfClients(std::size_t count) {
-  return std::to_string(count) + (count == 1 ? " client" : " clients");
+  return commandline::Count(static_cast<long long>(count), "client");
 }
 
 util::FileDescriptor CheckedDescriptor(int descriptor, const char* what) {

@@ -1,3 +1,4 @@
+#include "commandline/Count.h"
 #include "commandline/UsageError.h"
 #include "orva-notify/CommandLine.h"
 #include "orva-notify/Control.h"
@@ -57,19 +58,20 @@ void Serve(const CommandLine& command) {
   Service(ORVA_NOTIFICATION_SOCKET, command.watch).Run();
 }
 
-void PrintCount(const char* what, std::size_t count) {
-  std::cout << what << ' ' << count << (count == 1 ? " client\n" : " clients\n");
+void PrintClients(const char* what, std::size_t count) {
+  std::cout << what << ' ' << orva::commandline::Count(static_cast<long long>(count), "client")
+            << '\n';
 }
 
 void Send(const CommandLine& command) {
   const Request request{
       .kind = Request::Kind::Send, .clients = command.clients, .message = MessageOf(command)};
-  PrintCount("sent to", Ask(ORVA_NOTIFICATION_SOCKET, request, command.wait));
+  PrintClients("sent to", Ask(ORVA_NOTIFICATION_SOCKET, request, command.wait));
 }
 
 void Drop(const CommandLine& command) {
   const Request request{.kind = Request::Kind::Drop, .clients = command.clients};
-  PrintCount("dropped", Ask(ORVA_NOTIFICATION_SOCKET, request, command.wait));
+  PrintClients("dropped", Ask(ORVA_NOTIFICATION_SOCKET, request, command.wait));
 }
 
 void Execute(const CommandLine& command) {
