@@ -41,7 +41,7 @@ std::string Explain(const CLI::App& app, const CLI::ParseError& error) {
   if (!rest.empty() && CommandOf(app) == nullptr) {
     return UnknownCommand(app, rest.front());
   }
-  const std::string message = error.what();
+  std::string message = error.what();
   if (dynamic_cast<const CLI::ExtrasError*>(&error) != nullptr) {
     // CLI11 would name all that follows, too, in reverse.
     return "unexpected argument: '" + rest.front() + "'";

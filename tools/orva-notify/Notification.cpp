@@ -55,6 +55,7 @@ std::optional<Event> EventFromWord(const std::string& word) {
 
 std::vector<std::string> EventWords() {
   std::vector<std::string> words;
+  words.reserve(EVENT_TEXTS.size());
   for (const EventText& text : EVENT_TEXTS) {
     words.emplace_back(text.word);
   }
