@@ -467,6 +467,15 @@ TEST_F(OrvaNotify, DoesNotReplaceAFileThatIsNotASocket) {
   EXPECT_EQ(std::filesystem::file_size(ORVA_NOTIFICATION_SOCKET), 8U);
 }
 
+TEST_F(OrvaNotify, FailsWhenTheDirectoryCannotBeCreated) {
+  const auto directory = std::filesystem::path(ORVA_NOTIFICATION_SOCKET).parent_path();
+  std::filesystem::remove_all(directory);
+  std::ofstream(directory) << "a file";
+  const Answer outcome = RunNotify({"serve"});
+  EXPECT_EQ(outcome.status, 1);
+  EXPECT_EQ(outcome.line, "orva-notify: cannot create " + directory.native() + ": Not a directory");
+}
+
 TEST_F(OrvaNotify, KeepsAMessageForAClientThatReadsLate) {
   Serve();
   Listener client;

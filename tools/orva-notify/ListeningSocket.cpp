@@ -9,6 +9,7 @@
 #include <cerrno>
 #include <cstring>
 #include <filesystem>
+#include <system_error>
 #include <utility>
 
 namespace orva::notify {
@@ -21,6 +22,14 @@ bool IsPath(const std::string& address) {
 bool IsSocket(const std::string& path) {
   struct stat status {};
   return lstat(path.c_str(), &status) == 0 && S_ISSOCK(status.st_mode);
+}
+
+void MakeDirectory(const std::filesystem::path& directory) {
+  std::error_code error;
+  std::filesystem::create_directories(directory, error);
+  if (error) {
+    throw util::Exception("cannot create " + directory.native() + ": " + error.message());
+  }
 }
 
 // The socket of a service that was killed refuses connections.
@@ -49,7 +58,7 @@ ListeningSocket::ListeningSocket(std::string address)
     : Socket(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0)),
       address_(std::move(address)) {
   if (IsPath(address_)) {
-    std::filesystem::create_directories(std::filesystem::path(address_).parent_path());
+    MakeDirectory(std::filesystem::path(address_).parent_path());
     RemoveStaleSocket(address_);
   }
   Bind();
