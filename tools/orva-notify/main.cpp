@@ -39,7 +39,7 @@ std::string MessageOf(const CommandLine& command) {
 }
 
 void Serve(const CommandLine& command) {
-  Service(ORVA_NOTIFICATION_SOCKET, command.watch).Run();
+  Service(ORVA_NOTIFICATION_SOCKET, command.watch, command.directories).Run();
 }
 
 void PrintCount(const char* what, std::size_t count) {
@@ -47,9 +47,13 @@ void PrintCount(const char* what, std::size_t count) {
 }
 
 void Send(const CommandLine& command) {
-  const Request request{
-      .kind = Request::Kind::Send, .clients = command.clients, .message = MessageOf(command)};
-  PrintCount("sent to", Ask(ORVA_NOTIFICATION_SOCKET, request, command.wait));
+  const Request request{.kind = Request::Kind::Send,
+                        .clients = command.clients,
+                        .message = MessageOf(command),
+                        .handled = command.handled,
+                        .raw = !command.event};
+  PrintCount(command.handled ? "handled by" : "sent to",
+             Ask(ORVA_NOTIFICATION_SOCKET, request, command.wait));
 }
 
 void Drop(const CommandLine& command) {
