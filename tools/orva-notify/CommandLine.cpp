@@ -2,6 +2,9 @@
 
 #include "commandline/Parse.h"
 #include "commandline/Suggestion.h"
+#include "orva-notify/MountInfo.h"
+
+#include <filesystem>
 
 namespace orva::notify {
 namespace {
@@ -10,6 +13,20 @@ using Action = CommandLine::Action;
 using commandline::UsageError;
 
 constexpr long long MAXIMUM_NUMBER = 100'000;
+
+/// Why `directory` cannot be a volume; empty if it can.
+std::string WhyNoVolume(const std::string& directory) {
+  const std::filesystem::path path(directory);
+  if (!path.is_absolute()) {
+    return "'" + directory + "' is not absolute";
+  }
+  if (path.lexically_normal().native() != directory ||
+      (directory.size() > 1 && directory.ends_with('/'))) {
+    return "'" + directory + "' is not canonical: it contains '.', '..', '//' or a '/' at the end";
+  }
+  return IsDirectlyBelowShares(directory) ? ""
+                                          : "'" + directory + "' is not directly below /shares";
+}
 
 class Parser {
 public:
@@ -42,9 +59,17 @@ private:
         app_.add_subcommand("serve", "Listen on the notification socket and send every client the "
                                      "messages of\n'send', until SIGINT or SIGTERM");
     serve->add_flag("--watch", command_.watch,
-                    "Also announce mounts and unmounts directly below /shares;\n"
-                    "a new client first receives the mounted volumes");
-    serve->footer("Prints a line for each event.");
+                    "Also announce mounts and unmounts directly below /shares");
+    serve
+        ->add_option("--volume", command_.directories,
+                     "Announce DIR, a plain directory directly below /shares,\n"
+                     "as a volume while it exists; may be repeated")
+        ->type_name("DIR")
+        ->allow_extra_args(false)
+        ->multi_option_policy(CLI::MultiOptionPolicy::TakeAll)
+        ->check(WhyNoVolume);
+    serve->footer("A new client first receives what was announced of the volumes.\n"
+                  "Prints a line for each event.");
   }
 
   void AddSend() {
@@ -83,6 +108,8 @@ private:
         throw UsageError("MOUNT is required");
       }
     });
+    send_->add_flag("--handled", command_.handled,
+                    "Return only when every client has handled the message");
     AddRequestOptions(*send_);
   }
 
@@ -105,7 +132,8 @@ private:
         ->capture_default_str()
         ->transform(commandline::Decimal(0, MAXIMUM_NUMBER));
     request.footer("Returns when the message is queued for every client, or, for drop, when all "
-                   "connections are\nclosed, and prints the number of clients.");
+                   "connections are\nclosed, and prints the number of clients. Observers are not "
+                   "counted.");
   }
 
   CLI::App app_{"Stands in for the appliance's notification service on machines without the "

@@ -55,7 +55,7 @@ std::string MessageOf(const CommandLine& command) {
 }
 
 void Serve(const CommandLine& command) {
-  Service(ORVA_NOTIFICATION_SOCKET, command.watch).Run();
+  Service(ORVA_NOTIFICATION_SOCKET, command.watch, command.directories).Run();
 }
 
 void PrintClients(const char* what, std::size_t count) {
@@ -64,9 +64,13 @@ void PrintClients(const char* what, std::size_t count) {
 }
 
 void Send(const CommandLine& command) {
-  const Request request{
-      .kind = Request::Kind::Send, .clients = command.clients, .message = MessageOf(command)};
-  PrintClients("sent to", Ask(ORVA_NOTIFICATION_SOCKET, request, command.wait));
+  const Request request{.kind = Request::Kind::Send,
+                        .clients = command.clients,
+                        .message = MessageOf(command),
+                        .handled = command.handled,
+                        .raw = !command.event};
+  PrintClients(command.handled ? "handled by" : "sent to",
+             Ask(ORVA_NOTIFICATION_SOCKET, request, command.wait));
 }
 
 void Drop(const CommandLine& command) {
