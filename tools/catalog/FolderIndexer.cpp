@@ -3,6 +3,7 @@
 #include "CatalogSchema.h"
 #include "CatalogWriter.h"
 #include "Sql.h"
+#include "UntrustedCatalog.h"
 #include "VolumeRoot.h"
 
 #include "orvadb/Folder.h"
@@ -13,6 +14,8 @@
 
 #include <dirent.h>
 #include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
@@ -179,11 +182,11 @@ void FolderIndexer::Examine(const IndexedFolder& folder, int descriptor, const c
   } else if (S_ISDIR(found.st_mode)) {
     listing.folders.push_back({.name = name, .isFolder = true, .lastModifiedDate = found.st_mtime});
   } else if (S_ISREG(found.st_mode)) {
-    listing.files.push_back(
-        {.name = name,
-         .isKnown = !hooks_.isComplete || hooks_.isComplete(folder, name, found),
-         .lastModifiedDate = found.st_mtime,
-         .size = found.st_size});
+  } else if (S_ISREG(found.st_mode)) {
+    listing.files.push_back({.name = name,
+                             .lastModifiedDate = found.st_mtime,
+                             .size = found.st_size,
+                             .statusChanged = found.st_ctim});
   }
 }
 
@@ -273,11 +276,17 @@ FolderIndexer::FileChanges FolderIndexer::CompareFiles(const IndexedFolder& fold
                                                        const Listing& listing) {
   FileChanges changes;
   auto entry = listing.files.begin();
+  const auto write = [&](const Entry& file, std::optional<FileRow> row) {
+    if (file.isKnown &&
+        (!hooks_.isComplete ||
+         hooks_.isComplete(folder, file.name,
+                           {.size = file.size, .statusChanged = file.statusChanged}))) {
+      changes.written.push_back({.entry = &file, .row = std::move(row)});
+    }
+  };
   const auto addBefore = [&](const std::string_view* name) {
     for (; entry != listing.files.end() && (name == nullptr || entry->name < *name); ++entry) {
-      if (entry->isKnown) {
-        changes.written.push_back({.entry = &*entry, .row = std::nullopt});
-      }
+      write(*entry, std::nullopt);
     }
   };
 
@@ -312,8 +321,8 @@ FolderIndexer::FileChanges FolderIndexer::CompareFiles(const IndexedFolder& fold
       }
       continue;
     }
-    if (entry->isKnown && (known.isDeleted || folder.revived || !IsUpToDate(row, folder, *entry))) {
-      changes.written.push_back({.entry = &*entry, .row = std::move(known)});
+    if (known.isDeleted || folder.revived || !IsUpToDate(row, folder, *entry)) {
+      write(*entry, std::move(known));
     }
     ++entry;
   }
@@ -428,13 +437,18 @@ void FolderIndexer::DeleteTree(const std::string& path) {
           Stamp(), path, end);
 }
 
-void FolderIndexer::DeleteUnreachableRows(long long folders, long long files) {
+long long FolderIndexer::DeleteUnreachableRows(long long folders, long long files) {
+  constexpr char COUNT_FILES[] = "SELECT count(*) FROM Files WHERE isDeleted = 0";
   if (SelectNumber(catalog_, "SELECT count(*) FROM Folders WHERE isDeleted = 0") != folders) {
     DeleteUnreachableFolders();
   }
-  if (SelectNumber(catalog_, "SELECT count(*) FROM Files WHERE isDeleted = 0") != files) {
-    DeleteUnreachableFiles();
+  const long long rows = SelectNumber(catalog_, COUNT_FILES);
+  if (rows == files) {
+    return rows;
   }
+  DeleteUnreachableFiles();
+  CheckIndexes(catalog_);
+  return SelectNumber(catalog_, COUNT_FILES);
 }
 
 // A folder is reachable exactly if its path is that of its folder and its name, and this holds for

@@ -2,8 +2,6 @@
 
 #include "Classification.h"
 
-#include <sys/stat.h>
-
 #include <ctime>
 #include <functional>
 #include <optional>
@@ -58,12 +56,24 @@ struct IndexedFolder {
 /// Failures of the database are thrown as std::string, others as util::Exception.
 class FolderIndexer {
 public:
+  /// What tells whether a file is still changing.
+  struct FileState {
+    long long size = 0;
+    timespec statusChanged{}; ///< its ctime
+
+    bool operator==(const FileState& other) const noexcept {
+      return size == other.size && statusChanged.tv_sec == other.statusChanged.tv_sec &&
+             statusChanged.tv_nsec == other.statusChanged.tv_nsec;
+    }
+  };
+
   /// What the caller does meanwhile. Each may be empty.
   struct Hooks {
     /// Called with the descriptor of the folder before it is listed.
     std::function<void(const IndexedFolder&, int)> opened{};
-    /// Whether a file of the folder may be entered. Otherwise its row stays as it is.
-    std::function<bool(const IndexedFolder&, const std::string&, const struct stat&)> isComplete{};
+    /// Whether a new or changed file of the folder may be entered. Otherwise its row stays as it
+    /// is.
+    std::function<bool(const IndexedFolder&, const std::string&, const FileState&)> isComplete{};
     /// Called often. What it throws ends the update.
     std::function<void()> pulse{};
   };
@@ -82,8 +92,9 @@ public:
 
   /// Marks rows deleted that no folder leads to. Only a damaged or crafted catalog has such rows,
   /// so they are looked for only if there are more rows than the `folders` and `files` that a walk
-  /// of the whole volume has found.
-  void DeleteUnreachableRows(long long folders, long long files);
+  /// of the whole volume has found. Returns the number of files that are not marked deleted. Throws
+  /// CatalogError for a damaged catalog.
+  long long DeleteUnreachableRows(long long folders, long long files);
 
   const IndexSummary& Summary() const noexcept { return summary_; }
 
@@ -98,6 +109,7 @@ private:
     bool isKnown = true; ///< false: its row must stay as it is
     std::time_t lastModifiedDate = 0;
     long long size = 0;
+    timespec statusChanged{};
   };
   /// What the catalog says about one of them.
   struct FolderRow {
