@@ -182,7 +182,6 @@ void FolderIndexer::Examine(const IndexedFolder& folder, int descriptor, const c
   } else if (S_ISDIR(found.st_mode)) {
     listing.folders.push_back({.name = name, .isFolder = true, .lastModifiedDate = found.st_mtime});
   } else if (S_ISREG(found.st_mode)) {
-  } else if (S_ISREG(found.st_mode)) {
     listing.files.push_back({.name = name,
                              .lastModifiedDate = found.st_mtime,
                              .size = found.st_size,
