@@ -8,6 +8,8 @@
 
 namespace orva::zophotos {
 
+struct Activity;
+
 /// Text for people, or JSON for programs: one object, or one object per line from a list.
 enum class Form { Text, Json };
 
@@ -17,8 +19,8 @@ using FindPath = std::function<std::string()>;
 // The commands. Each is in its own source. `path` is the path of the merged database. They print to
 // standard output, and throw Failure or SQLite::Exception.
 
-/// Shows where the database is and the progress of each volume.
-ExitStatus ShowStatus(const std::string& path, Form form);
+/// Shows where the database is, the progress of each volume, and what the services are doing.
+ExitStatus ShowStatus(const std::string& path, const Activity& services, Form form);
 
 /// What List shows, and how.
 struct Listing {

@@ -1,3 +1,4 @@
+#include "Activity.h"
 #include "Commands.h"
 #include "Locator.h"
 #include "MergedDatabase.h"
@@ -84,6 +85,9 @@ public:
 
 private:
   std::string FindPath() const { return database_.empty() ? FindDatabase() : database_; }
+
+  /// What the services of this machine are doing; nothing for another machine's database.
+  Activity Services() const { return database_.empty() ? ReadActivity() : Activity(); }
 
   Form OutputForm() const { return json_ ? Form::Json : Form::Text; }
 
@@ -173,7 +177,7 @@ private:
   ExitStatus RunOn(const std::string& path) const {
     const Form form = OutputForm();
     if (Command() == nullptr || status_->parsed()) {
-      return ShowStatus(path, form);
+      return ShowStatus(path, Services(), form);
     }
     if (ls_->parsed()) {
       return List(path, {.path = path_, .isLong = long_, .escapes = Escapes(), .colors = Colors()},
