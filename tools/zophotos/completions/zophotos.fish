@@ -1,6 +1,6 @@
 # Completion of zophotos for fish.
 
-set -l commands status ls tree find check watch export help
+set -l commands status ls tree find failed check watch export help
 set -l first "not __fish_seen_subcommand_from $commands"
 
 complete -c zophotos -f
@@ -15,6 +15,7 @@ complete -c zophotos -n $first -a status -d 'Show the database and the progress 
 complete -c zophotos -n $first -a ls -d 'List a folder, or show a file'
 complete -c zophotos -n $first -a tree -d 'Show all folders below a folder'
 complete -c zophotos -n $first -a find -d 'Find files and folders by name'
+complete -c zophotos -n $first -a failed -d 'List the photos that could not be rendered'
 complete -c zophotos -n $first -a check -d 'Check the database for damage'
 complete -c zophotos -n $first -a watch -d 'Print a line for each change until interrupted'
 complete -c zophotos -n $first -a export -d 'Print every file with its full path'
