@@ -34,6 +34,7 @@ const std::vector<Arguments> COMMANDS{{},
                                       {"tree"},
                                       {"find", "*"},
                                       {"find", "-0", ""},
+                                      {"failed"},
                                       {"check"},
                                       {"export", "--csv"},
                                       {"export", "--jsonl"},
@@ -175,7 +176,8 @@ TEST(ZophotosUsage, HelpNamesAllCommands) {
   for (const Arguments& arguments : {Arguments{"--help"}, Arguments{"-h"}, Arguments{"help"}}) {
     const Outcome help = Zophotos(arguments);
     EXPECT_EQ(0, help.status);
-    for (const char* const command : {"status", "ls", "tree", "find", "check", "watch", "export"}) {
+    for (const char* const command :
+         {"status", "ls", "tree", "find", "failed", "check", "watch", "export"}) {
       EXPECT_THAT(help.output, HasSubstr("\n  " + std::string(command) + " "));
       const Outcome more = Zophotos({command, "--help"});
       EXPECT_EQ(0, more.status);

@@ -2,7 +2,7 @@
 
 _zophotos() {
   local current=${COMP_WORDS[COMP_CWORD]} previous=${COMP_WORDS[COMP_CWORD - 1]}
-  local commands='status ls tree find check watch export help'
+  local commands='status ls tree find failed check watch export help'
   local words='--database --json --escape --color --version --help -h'
   local command='' i
   for ((i = 1; i < COMP_CWORD; i++)); do
