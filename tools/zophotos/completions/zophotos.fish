@@ -22,6 +22,7 @@ complete -c zophotos -n $first -a export -d 'Print every file with its full path
 complete -c zophotos -n $first -a help -d 'Print help, or the help of a command'
 complete -c zophotos -n '__fish_seen_subcommand_from help' -a "$commands"
 
+complete -c zophotos -n '__fish_seen_subcommand_from status' -s f -l follow -d 'Show the progress again after each change'
 complete -c zophotos -n '__fish_seen_subcommand_from ls' -s l -l long -d 'Add times, numbers of files and volumes'
 complete -c zophotos -n '__fish_seen_subcommand_from ls' -s 1 -d 'Print one name per line'
 complete -c zophotos -n '__fish_seen_subcommand_from tree' -s L -l level -x -d 'Show only so many levels'
