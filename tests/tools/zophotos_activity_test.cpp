@@ -62,14 +62,14 @@ TEST_F(ZophotosActivity, IsShownForEachVolumeOfTheServices) {
                                       TranscoderVolume("/shares/H/", "3", "0", "true"));
   EXPECT_EQ("\n"
             "VOLUME      WAITING  FAILED  ACTIVITY\n"
-            "/shares/A/     1200       0  being indexed, 12 folders waiting; rendering photos\n"
+            "/shares/A/     1200       0  being indexed, 12 folders waiting; rendering\n"
             "/shares/B/        0       0  watched\n"
             "/shares/C/        -       -  indexed at intervals, 1 folder waiting\n"
             "/shares/D/        -       -  read-only, not indexed\n"
             "/shares/E/        -       -  being indexed\n"
             "/shares/F/        -       -  cannot be indexed\n"
             "/shares/G/        -       -  re\\x1bst\n"
-            "/shares/H/        3       0  rendering photos\n",
+            "/shares/H/        3       0  rendering\n",
             Added());
 }
 

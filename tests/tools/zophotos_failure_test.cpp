@@ -315,6 +315,7 @@ TEST_F(ZophotosFailure, WriteAheadLogIsReportedAndNotCreated) {
 TEST_F(ZophotosFailure, UnwritableOutputIsReported) {
   std::vector<Arguments> commands = COMMANDS;
   commands.push_back({"watch"});
+  commands.push_back({"status", "-f"});
   commands.push_back({"--help"});
   for (const Arguments& command : commands) {
     SCOPED_TRACE(Text(command));
@@ -368,6 +369,9 @@ TEST_F(ZophotosFailure, NoCommandChangesTheDatabase) {
   }
   Program watch(ZophotosCommand({"watch"}));
   EXPECT_THAT(watch.ReadLine(), HasSubstr("watching"));
+  EXPECT_EQ(before, Snapshot("/shares/A/.zophotos"));
+  Program follow(ZophotosCommand({"status", "-f"}));
+  EXPECT_THAT(follow.ReadLineWith("TOTAL"), HasSubstr("57 %"));
   EXPECT_EQ(before, Snapshot("/shares/A/.zophotos"));
 }
 

@@ -133,7 +133,7 @@ std::string Describe(const VolumeActivity& activity) {
     text = Describe(*activity.indexing);
   }
   if (activity.rendering != nullptr && activity.rendering->isActive) {
-    text += (text.empty() ? "" : "; ") + std::string("rendering photos");
+    text += (text.empty() ? "" : "; ") + std::string("rendering");
   }
   return text.empty() ? "-" : text;
 }

@@ -51,7 +51,7 @@ Activity ReadActivity();
 /// The volumes that the services know.
 std::map<std::string, VolumeActivity> VolumesOf(const Activity& activity);
 
-/// "being indexed, 12 folders waiting; rendering photos"; a dash for nothing.
+/// "being indexed, 12 folders waiting; rendering"; a dash for nothing.
 std::string Describe(const VolumeActivity& activity);
 
 /// Notices that the status files change.

@@ -22,6 +22,16 @@ using FindPath = std::function<std::string()>;
 /// Shows where the database is, the progress of each volume, and what the services are doing.
 ExitStatus ShowStatus(const std::string& path, const Activity& services, Form form);
 
+/// How FollowStatus follows.
+struct Following {
+  bool services = true; ///< with what the services are doing
+  bool redraws = false; ///< on a terminal: replace the last report
+};
+
+/// Prints the progress of each volume and what the services are doing, and again after each
+/// change, until the output cannot be written.
+ExitStatus FollowStatus(const FindPath& findPath, const Following& following, Form form);
+
 /// What List shows, and how.
 struct Listing {
   std::string path; ///< of a folder or file, as the user gives it, see Spellings

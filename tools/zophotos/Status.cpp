@@ -120,17 +120,19 @@ void PrintActivity(const Activity& services) {
   if (volumes.empty()) {
     return;
   }
-  Table table({{.heading = "VOLUME", .elastic = true},
+  const auto width = TerminalWidth();
+  Table table({{.heading = "VOLUME"},
                {.heading = "WAITING", .right = true},
                {.heading = "FAILED", .right = true},
                {.heading = "ACTIVITY", .elastic = true}});
   std::int64_t failed = 0;
   for (const auto& [name, volume] : volumes) {
-    table.AddRow({Printable(name), Waiting(volume), Failed(volume), Describe(volume)});
+    table.AddRow(
+        {ShortName(Printable(name), width), Waiting(volume), Failed(volume), Describe(volume)});
     Add(failed, volume.rendering == nullptr ? 0 : volume.rendering->failed);
   }
   std::cout << '\n';
-  table.Print(std::cout, TerminalWidth());
+  table.Print(std::cout, width);
   if (failed > 0) {
     std::cout << "\n'zophotos failed' lists the failed photos with the reasons.\n";
   }

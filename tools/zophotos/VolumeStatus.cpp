@@ -92,6 +92,10 @@ std::string NameOf(const std::string& volume, const std::string& path) {
   return Printable(volume) + (volume == MountPoint(path) ? " (master)" : "");
 }
 
+std::string ShortName(const std::string& name, std::optional<std::size_t> terminalWidth) {
+  return terminalWidth ? Shorten(name, 32) : name;
+}
+
 void AddActivity(Json& object, const Activity& services, const VolumeActivity& volume) {
   if (services.indexer) {
     const Indexing* const indexing = volume.indexing;

@@ -5,6 +5,7 @@
 
 #include <SQLiteCpp/Database.h>
 
+#include <cstddef>
 #include <cstdint>
 #include <map>
 #include <optional>
@@ -54,6 +55,10 @@ std::optional<std::string> MountPoint(const std::string& path);
 
 /// The volume's name for people, with a mark on the one that holds the database at `path`.
 std::string NameOf(const std::string& volume, const std::string& path);
+
+/// A printable name for a table in which the activity is shortened first: on a terminal it has at
+/// most 32 columns.
+std::string ShortName(const std::string& name, std::optional<std::size_t> terminalWidth);
 
 /// Adds to the JSON of a volume what the services that run do with it: null for what they do not
 /// know.

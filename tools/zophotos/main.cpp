@@ -66,6 +66,11 @@ public:
     if (watch_->parsed()) {
       return WatchDatabase([this] { return FindPath(); }, OutputForm());
     }
+    if (follow_) {
+      return FollowStatus([this] { return FindPath(); },
+                          {.services = database_.empty(), .redraws = IsCapableTerminal()},
+                          OutputForm());
+    }
     if (failed_->parsed()) {
       return ListFailedPhotos([this] { return FindPath(); }, Services(), path_, Escapes(),
                               OutputForm());
@@ -90,16 +95,21 @@ private:
   /// Whether to escape names where each is a line of its own.
   bool Escapes() const { return escape_ || Colors() || IsTerminal(); }
 
+  static std::string Variable(const char* name) {
+    const char* const value = std::getenv(name);
+    return value == nullptr ? "" : value;
+  }
+
+  /// Whether the output is a terminal with colours and a cursor that moves.
+  static bool IsCapableTerminal() {
+    const std::string terminal = Variable("TERM");
+    return IsTerminal() && !terminal.empty() && terminal != "dumb";
+  }
+
   /// Whether to print folders in a colour.
   bool Colors() const {
-    const auto variable = [](const char* name) {
-      const char* const value = std::getenv(name);
-      return std::string(value == nullptr ? "" : value);
-    };
-    const std::string terminal = variable("TERM");
     return color_ == "always" ||
-           (color_ == "auto" && IsTerminal() && variable("NO_COLOR").empty() && !terminal.empty() &&
-            terminal != "dumb");
+           (color_ == "auto" && IsCapableTerminal() && Variable("NO_COLOR").empty());
   }
 
   /// The command on the command line; null if there is none.
@@ -157,6 +167,8 @@ private:
 
   void AddCommands() {
     status_ = app_.add_subcommand("status", "Show the database and the progress of each volume");
+    status_->add_flag("-f,--follow", follow_,
+                      "Show the progress again after each change until interrupted");
     ls_ = app_.add_subcommand("ls", "List a folder, or show a file");
     ls_->add_flag("-l,--long", long_, "Add times, numbers of files and volumes");
     ls_->add_flag_callback(
@@ -238,6 +250,7 @@ private:
   std::string topic_; ///< of help
   std::size_t levels_ = std::numeric_limits<std::size_t>::max();
   Search search_;
+  bool follow_ = false;
   bool json_ = false;
   bool escape_ = false;
   bool long_ = false;

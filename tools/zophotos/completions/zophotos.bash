@@ -34,6 +34,7 @@ _zophotos() {
   esac
   case $command in
     '') words+=" $commands" ;;
+    status) words+=' --follow -f' ;;
     ls) words+=' --long -l -1' ;;
     tree) words+=' --level -L' ;;
     find) words+=' --ignore-case --null --type -i -0' ;;

@@ -43,6 +43,7 @@ complete -c zophotos -n $first -a export -d 'Print every file with its full path
 complete -c zophotos -n $first -a help -d 'Print help, or the help of a command'
 complete -c zophotos -n 'contains help (__zophotos_command)' -a "$commands"
 
+complete -c zophotos -n 'contains status (__zophotos_command)' -s f -l follow -d 'Show the progress again after each change'
 complete -c zophotos -n 'contains ls (__zophotos_command)' -s l -l long -d 'Add times, numbers of files and volumes'
 complete -c zophotos -n 'contains ls (__zophotos_command)' -s 1 -d 'Print one name per line'
 complete -c zophotos -n 'contains tree (__zophotos_command)' -s L -l level -x -d 'Show only so many levels'
