@@ -57,8 +57,9 @@ const std::vector<std::string>& LoaderOptions() {
 /// where a part of /proc is hidden, as in our unit.
 std::vector<std::string> SandboxOptions(const SandboxFolders& folders) {
   std::vector<std::string> options = {
-      "/usr/bin/bwrap", "--unshare-all", "--die-with-parent", "--new-session", "--cap-drop", "ALL",
-      "--clearenv", "--setenv", "PATH", "/usr/bin", "--setenv", "LC_ALL", "C",
+      "/usr/bin/bwrap", "--unshare-user", "--unshare-ipc", "--unshare-net", "--unshare-pid",
+      "--unshare-uts", "--die-with-parent", "--new-session", "--cap-drop", "ALL", "--clearenv",
+      "--setenv", "PATH", "/usr/bin", "--setenv", "LC_ALL", "C",
       // The loaders that libvips itself does not trust with untrusted files are off.
       "--setenv", "VIPS_BLOCK_UNTRUSTED", "1", "--setenv", "VIPS_CONCURRENCY", "1",
       // Images that have to be in memory as a whole stay there. The limit of memory applies.
