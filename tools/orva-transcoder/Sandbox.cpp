@@ -14,6 +14,7 @@
 #include <array>
 #include <cerrno>
 #include <csignal>
+#include <filesystem>
 #include <initializer_list>
 #include <system_error>
 #include <utility>
@@ -27,18 +28,47 @@ constexpr std::size_t KEPT_OUTPUT = std::size_t{64} * 1024;
 constexpr rlim_t MOST_PROCESSES = 1024; // and threads, of all sandboxes
 constexpr int CANNOT_START = 127;
 
+/// Hides libvips's loadable modules except the one for HEIF: the formats of the others are no
+/// photos, and to load them takes as long as to load the program.
+std::vector<std::string> FindLoaders() {
+  namespace fs = std::filesystem;
+  std::vector<std::string> options;
+  std::error_code ignored;
+  for (const auto& architecture : fs::directory_iterator("/usr/lib", ignored)) {
+    for (const auto& folder : fs::directory_iterator(architecture.path(), ignored)) {
+      if (folder.path().filename().native().starts_with("vips-modules-")) {
+        options.insert(options.end(), {"--tmpfs", folder.path().native()});
+        const std::string heif = folder.path() / "vips-heif.so";
+        if (fs::exists(heif, ignored)) {
+          options.insert(options.end(), {"--ro-bind", heif, heif});
+        }
+      }
+    }
+  }
+  return options;
+}
+
+const std::vector<std::string>& LoaderOptions() {
+  static const std::vector<std::string> options = FindLoaders();
+  return options;
+}
+
 /// bwrap(1) without the command. There is no /proc, because the kernel does not allow to mount one
 /// where a part of /proc is hidden, as in our unit.
 std::vector<std::string> SandboxOptions(const SandboxFolders& folders) {
   std::vector<std::string> options = {
-      "/usr/bin/bwrap", "--unshare-all", "--die-with-parent", "--new-session", "--cap-drop", "ALL",
-      "--clearenv", "--setenv", "PATH", "/usr/bin", "--setenv", "LC_ALL", "C",
+      "/usr/bin/bwrap", "--unshare-user", "--unshare-ipc", "--unshare-net", "--unshare-pid",
+      "--unshare-uts", "--die-with-parent", "--new-session", "--cap-drop", "ALL", "--clearenv",
+      "--setenv", "PATH", "/usr/bin", "--setenv", "LC_ALL", "C",
       // The loaders that libvips itself does not trust with untrusted files are off.
       "--setenv", "VIPS_BLOCK_UNTRUSTED", "1", "--setenv", "VIPS_CONCURRENCY", "1",
       // Images that have to be in memory as a whole stay there. The limit of memory applies.
       "--setenv", "VIPS_DISC_THRESHOLD", "4g", "--ro-bind", "/usr", "/usr", "--symlink", "usr/bin",
       "/bin", "--symlink", "usr/lib", "/lib", "--symlink", "usr/lib64", "/lib64", "--size",
       "268435456", "--tmpfs", "/tmp", "--chdir", "/"};
+  for (const std::string& option : LoaderOptions()) {
+    options.push_back(option);
+  }
   if (!folders.input.empty()) {
     options.insert(options.end(), {"--ro-bind", folders.input, "/in"});
   }

@@ -8,10 +8,13 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
+#include <cstring>
 #include <filesystem>
 #include <system_error>
 #include <utility>
+#include <vector>
 
 namespace orva::transcoder {
 namespace {
@@ -85,6 +88,23 @@ util::FileDescriptor StagingFolder::Add(std::size_t number) const {
 void StagingFolder::Remove(std::size_t number) const {
   unlink((FileIn(Output(), number) + ".jpg").c_str());
   unlink(FileIn(Input(), number).c_str());
+}
+
+bool StagingFolder::InputContains(std::size_t number, std::string_view text) const {
+  const util::FileDescriptor file(
+      open(FileIn(Input(), number).c_str(), O_RDONLY | O_NOFOLLOW | O_CLOEXEC));
+  std::vector<char> chunk(std::size_t{256} * 1024);
+  std::size_t kept = 0; // the end of the last chunk: the text may begin there
+  ssize_t count = 0;
+  while ((count = read(file.Get(), chunk.data() + kept, chunk.size() - kept)) > 0) {
+    const std::string_view content(chunk.data(), kept + static_cast<std::size_t>(count));
+    if (content.find(text) != std::string_view::npos) {
+      return true;
+    }
+    kept = std::min(content.size(), text.size() - 1);
+    std::memmove(chunk.data(), content.data() + content.size() - kept, kept);
+  }
+  return count != 0;
 }
 
 util::FileDescriptor StagingFolder::OpenOutput(std::size_t number) const {

@@ -4,6 +4,7 @@
 
 #include <cstddef>
 #include <string>
+#include <string_view>
 
 namespace orva::transcoder {
 
@@ -30,6 +31,9 @@ public:
 
   /// Removes the files of the photo `number`.
   void Remove(std::size_t number) const;
+
+  /// Whether the photo's file in `in` contains `text`; true if it cannot be read.
+  bool InputContains(std::size_t number, std::string_view text) const;
 
   /// Opens the photo's file in `out` for reading. Returns no descriptor if it is not a regular
   /// file.

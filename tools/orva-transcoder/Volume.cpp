@@ -256,10 +256,15 @@ bool Volume::StagePhoto(const Opened& volume, const WaitingPhoto& photo, Batch& 
   if (number == MOST_PHOTOS) {
     return false;
   }
-  const util::FileDescriptor file = volume.root.Open(photo.path, O_RDONLY);
+  // To open a device may have an effect: look before.
   struct stat status {};
-  if (!file || fstat(file.Get(), &status) != 0 || !IsPhoto(status, photo)) {
+  const util::FileDescriptor entry = volume.root.Open(photo.path, O_PATH);
+  if (!entry || fstat(entry.Get(), &status) != 0 || !S_ISREG(status.st_mode)) {
     return true; // the indexer will notice what has changed
+  }
+  const util::FileDescriptor file = volume.root.Open(photo.path, O_RDONLY);
+  if (!file || fstat(file.Get(), &status) != 0 || !IsPhoto(status, photo)) {
+    return true;
   }
   if (status.st_size > LARGEST_PHOTO) {
     batch.photos.push_back(
