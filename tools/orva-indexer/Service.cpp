@@ -13,9 +13,13 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <charconv>
 #include <csignal>
 #include <ctime>
 #include <filesystem>
+#include <fstream>
+#include <set>
+#include <sstream>
 #include <system_error>
 #include <utility>
 
@@ -52,9 +56,39 @@ util::FileDescriptor CatchStopSignals() {
   return Checked(signalfd(-1, &signals, SFD_NONBLOCK | SFD_CLOEXEC), "signals");
 }
 
+constexpr char MOUNT_INFO[] = "/proc/self/mountinfo";
+
 util::FileDescriptor OpenMountInfo() {
-  constexpr char PATH[] = "/proc/self/mountinfo";
-  return Checked(open(PATH, O_RDONLY | O_CLOEXEC), PATH);
+  return Checked(open(MOUNT_INFO, O_RDONLY | O_CLOEXEC), MOUNT_INFO);
+}
+
+/// The kernel writes some bytes as a backslash and three octal digits.
+std::string DecodeOctal(const std::string& text) {
+  std::string decoded;
+  for (std::size_t i = 0; i < text.size(); ++i) {
+    int byte = 0;
+    if (text[i] == '\\' && i + 3 < text.size() &&
+        std::from_chars(&text[i + 1], &text[i + 4], byte, 8).ptr == &text[i + 4]) {
+      decoded += static_cast<char>(byte);
+      i += 3;
+    } else {
+      decoded += text[i];
+    }
+  }
+  return decoded;
+}
+
+std::set<std::string> ReadMountPoints() {
+  std::set<std::string> mountPoints;
+  std::ifstream table(MOUNT_INFO);
+  for (std::string line; std::getline(table, line);) {
+    std::istringstream fields(line);
+    std::string field;
+    for (int number = 0; number < 5 && std::getline(fields, field, ' '); ++number) {
+    }
+    mountPoints.insert(DecodeOctal(field));
+  }
+  return mountPoints;
 }
 
 } // namespace
@@ -116,8 +150,9 @@ void Service::Wait() {
     throw util::Exception("cannot wait for events: " + std::generic_category().message(errno));
   }
   if ((descriptors.front().revents & POLLPRI) != 0) {
+    const std::set<std::string> mountPoints = ReadMountPoints();
     for (const auto& [mountPoint, known] : volumes_) {
-      known->volume.TryAgain();
+      known->volume.HandleMounts(mountPoints);
     }
   }
 }
@@ -206,7 +241,8 @@ void Service::Plug(const std::string& mountPoint, bool isDirectory) {
     Forget(mountPoint);
   }
   LogInfo("Volume " + Printable(mountPoint) + ": walking");
-  volumes_[mountPoint] = std::make_unique<Known>(mountPoint, kind);
+  const auto known = volumes_.emplace(mountPoint, std::make_unique<Known>(mountPoint, kind)).first;
+  known->second->volume.HandleMounts(ReadMountPoints());
   isStatusDue_ = true;
 }
 
@@ -259,7 +295,7 @@ void Service::AnnounceResult(Known& known, const Volume::Result& result) {
   }
   if (result.isFirstWalk) {
     known.hasChanged = false;
-    Announce(known, Event::Scanned);
+    AnnounceScanned(known);
   } else if (known.hasChanged && known.isScanned) {
     known.hasChanged = false;
     Announce(known, known.volume.IsIdle() ? Event::End : Event::TranscodedBatch);
@@ -276,9 +312,14 @@ void Service::AnnounceAgain() {
   for (const auto& [mountPoint, known] : volumes_) {
     known->echoes = 0;
     if (!known->volume.Identity().empty()) {
-      Announce(*known, Event::Scanned);
+      AnnounceScanned(*known);
     }
   }
+}
+
+/// The daemon may elect a master then. So the answer is waited for before the master is looked up.
+void Service::AnnounceScanned(Known& known) {
+  Announce(known, Event::Scanned, true);
 }
 
 void Service::Announce(Known& known, Event event, bool handled) {
@@ -302,7 +343,11 @@ void Service::Announced(const Announcer::Announcement& announcement,
   switch (announcement.event) {
   case Event::Scanned:
     known.isScanned = true;
-    PurgeOrEnd(known);
+    if (*clients > 0) {
+      PurgeOrEnd(known);
+    } else {
+      Announce(known, Event::End); // no daemon: it writes the locator file when it starts
+    }
     break;
   case Event::Purged:
     if (*clients > 0 && master == known.purgedFor) {

@@ -40,11 +40,10 @@ private:
         : volume(std::move(mountPoint), kind) {}
 
     Volume volume;
-    bool isScannedDue = false; ///< Scanned must be announced, when the first walk has ended
-    bool isScanned = false;    ///< it was
-    bool hasChanged = false;   ///< since the last announcement
-    std::string purgedFor{};   ///< master for which Purged is being announced
-    int echoes = 0;            ///< announcements of ours that come back
+    bool isScanned = false;  ///< it was
+    bool hasChanged = false; ///< since the last announcement
+    std::string purgedFor{}; ///< master for which Purged is being announced
+    int echoes = 0;          ///< announcements of ours that come back
   };
 
   void Wait();
@@ -57,6 +56,7 @@ private:
   void AnnounceAgain();
   void WorkOnNext();
   void AnnounceResult(Known& known, const Volume::Result& result);
+  void AnnounceScanned(Known& known);
   void Announce(Known& known, notify::Event event, bool handled = false);
   void Announced(const Announcer::Announcement& announcement, std::optional<std::size_t> clients);
   void PurgeOrEnd(Known& known);
@@ -68,7 +68,7 @@ private:
 
   const Settings settings_;
   util::FileDescriptor signals_;
-  util::FileDescriptor mountInfo_; ///< polled, not read
+  util::FileDescriptor mountInfo_; ///< polled for changes
   RememberedCatalogs remembered_;
   notifications::Observer observer_;
   Announcer announcer_;

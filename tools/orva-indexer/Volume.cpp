@@ -20,6 +20,7 @@
 #include <algorithm>
 #include <array>
 #include <cerrno>
+#include <iterator>
 #include <ranges>
 #include <system_error>
 #include <utility>
@@ -49,7 +50,7 @@ constexpr auto LONGEST_EMPTY = 8s;
 constexpr auto LONGEST_OPEN = 600s;
 
 constexpr auto RETRY = 60s;
-constexpr auto BUSY_RETRY = 1s;
+constexpr auto SHORT_RETRY = 1s;
 
 /// A walk on a timer takes at most a twentieth of the time.
 constexpr auto SHORTEST_PAUSE = 60s;
@@ -187,9 +188,24 @@ void Volume::CheckLater(const std::string& folder, Clock::time_point when) {
   }
 }
 
-void Volume::TryAgain() {
+void Volume::HandleMounts(const std::set<std::string>& mountPoints) {
   if (trouble_ != Trouble::None) {
     notBefore_ = {};
+  }
+  std::set<std::string> mounts;
+  for (auto mount = mountPoints.upper_bound(path_ + '/');
+       mount != mountPoints.end() && mount->starts_with(path_ + '/'); ++mount) {
+    mounts.insert(mount->substr(path_.size() + 1) + '/');
+  }
+  std::vector<std::string> changed;
+  std::ranges::set_symmetric_difference(mounts, mounts_, std::back_inserter(changed));
+  mounts_ = std::move(mounts);
+  for (const std::string& folder : changed) {
+    if (watches_) {
+      // A folder that is not watched is walked when the one above is listed.
+      watches_->Forget(folder);
+      MarkDirty(FolderOf(folder));
+    }
   }
 }
 
@@ -267,7 +283,7 @@ Volume::Result Volume::Work(const std::function<void()>& pulse, std::time_t late
   } catch (const catalog::CatalogError& error) {
     switch (error.Problem()) {
     case CatalogProblem::Busy:
-      notBefore_ = Clock::now() + BUSY_RETRY;
+      notBefore_ = Clock::now() + SHORT_RETRY;
       return {};
     case CatalogProblem::ReadOnly:
       Fail(Trouble::ReadOnly, "read-only; its catalog is not updated until this changes");
@@ -368,6 +384,7 @@ void Volume::SetAside(const VolumeRoot& root, const std::string& reason) {
   LogError(name_ + ": its catalog is not one of ours, or damaged; it was renamed to " + name +
            " and is made again: " + Printable(reason));
   wasJustSetAside_ = true;
+  notBefore_ = Clock::now() + SHORT_RETRY; // in case somebody damages it again and again
   isWalked_ = false;
   StartAgain();
 }

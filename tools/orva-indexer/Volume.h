@@ -15,6 +15,7 @@
 #include <map>
 #include <memory>
 #include <optional>
+#include <set>
 #include <string>
 #include <unordered_map>
 #include <vector>
@@ -72,8 +73,9 @@ public:
   /// of the latest stamp that its catalog may have.
   Result Work(const std::function<void()>& pulse, std::time_t latest);
 
-  /// Something was mounted or unmounted: a volume that could not be written is tried again.
-  void TryAgain();
+  /// Something was mounted or unmounted: a volume that could not be written is tried again, and
+  /// mount points below the volume are looked at. `mountPoints` are all that there are.
+  void HandleMounts(const std::set<std::string>& mountPoints);
 
   /// Another program has written to the catalog: reads its newest stamp.
   void ReadStamp() { isStampWanted_ = true; }
@@ -139,6 +141,7 @@ private:
   bool isLimitLogged_ = false;
   bool hasNoEvents_ = false; ///< the file system reports no changes of others
   bool isUnmounted_ = false;
+  std::set<std::string> mounts_; ///< below the volume, as paths of folders
   Clock::time_point eventsRead_{};
 
   std::vector<Task> ready_; ///< the last one is next
