@@ -254,10 +254,11 @@ TEST(CommandLine, KnowsEachEvent) {
 }
 
 TEST(CommandLine, TakesOptionsBeforeAndAfterTheOperands) {
-  const auto command = ParseCommandLine({"send", "--clients", "3", "scanned", "", "--wait", "7"});
+  const auto command =
+      ParseCommandLine({"send", "--clients", "3", "scanned", "/shares/A", "--wait", "7"});
   ASSERT_TRUE(command);
   EXPECT_EQ(command->event, Event::Scanned);
-  EXPECT_EQ(command->mountPoint, "");
+  EXPECT_EQ(command->mountPoint, "/shares/A");
   EXPECT_EQ(command->clients, 3U);
   EXPECT_EQ(command->wait, std::chrono::seconds(7));
 
@@ -290,40 +291,47 @@ TEST(CommandLine, TakesDecimalNumbersAndTheLastOneCounts) {
 TEST(CommandLine, SaysWhatIsWrong) {
   const std::vector<std::pair<Arguments, std::string>> wrong = {
       {{}, "a command is required"},
-      {{"listen"}, "unexpected argument 'listen'"},
-      {{"send"}, "send: takes an event and a mount point, or --raw FILE"},
-      {{"send", "plugged"}, "send: takes an event and a mount point, or --raw FILE"},
-      {{"send", "Plugged", "/shares/A"}, "EVENT: unknown event 'Plugged'"},
-      {{"send", "plugged", "/a", "/b"}, "unexpected argument '/b'"},
-      {{"send", "--raw"}, "--raw: 1 required FILE missing"},
-      {{"send", "--raw", ""}, "--raw: must not be empty"},
-      {{"send", "--raw=", "f"}, "--raw= has no value"},
-      {{"send", "--raw", "f", "plugged"}, "--raw excludes EVENT"},
-      {{"send", "--watch", "plugged", "/a"}, "unexpected argument '--watch'"},
-      {{"serve", "--clients", "1"}, "unexpected argument '--clients'"},
-      {{"serve", "all"}, "unexpected argument 'all'"},
-      {{"serve", "--volume"}, "--volume: 1 required DIR missing"},
-      {{"serve", "--volume", "/shares/A", "/shares/B"}, "unexpected argument '/shares/B'"},
-      {{"serve", "--volume", "Photos"}, "--volume: 'Photos' is not absolute"},
-      {{"serve", "--volume", ""}, "--volume: '' is not absolute"},
-      {{"serve", "--volume", "/"}, "--volume: '/' is not directly below /shares"},
-      {{"serve", "--volume", "/shares"}, "--volume: '/shares' is not directly below /shares"},
+      {{"listen"}, "unknown command: 'listen'"},
+      {{"sned"}, "unknown command: 'sned'; did you mean 'send'?"},
+      {{"send"}, "EVENT and MOUNT are required, or --raw FILE"},
+      {{"send", "plugged"}, "MOUNT is required"},
+      {{"send", "Plugged", "/shares/A"}, "unknown event: 'Plugged'; did you mean 'plugged'?"},
+      {{"send", "exploded"}, "unknown event: 'exploded'"},
+      {{"send", "plugged", ""}, "MOUNT must be an absolute path such as /shares/Photos, not ''"},
+      {{"send", "plugged", "A"}, "MOUNT must be an absolute path such as /shares/Photos, not 'A'"},
+      {{"send", "plugged", "/a", "/b"}, "unexpected argument: '/b'"},
+      {{"send", "--raw"}, "option --raw needs a value"},
+      {{"send", "--raw", ""}, "option --raw must not be empty"},
+      {{"send", "--raw=", "f"}, "option --raw needs a value"},
+      {{"send", "--raw", "f", "plugged"}, "EVENT and --raw cannot be combined"},
+      {{"send", "--watch", "plugged", "/a"}, "unknown option: --watch"},
+      {{"serve", "--clients", "1"}, "unknown option: --clients"},
+      {{"serve", "--watch=no"}, "option --watch takes no value"},
+      {{"serve", "all"}, "unexpected argument: 'all'"},
+      {{"serve", "--volume"}, "option --volume needs a value"},
+      {{"serve", "--volume", "/shares/A", "/shares/B"}, "unexpected argument: '/shares/B'"},
+      {{"serve", "--volume", "Photos"}, "option --volume must be an absolute path, not 'Photos'"},
+      {{"serve", "--volume", ""}, "option --volume must be an absolute path, not ''"},
+      {{"serve", "--volume", "/"}, "option --volume must be directly below /shares, not '/'"},
+      {{"serve", "--volume", "/shares"},
+       "option --volume must be directly below /shares, not '/shares'"},
       {{"serve", "--volume", "/srv/Photos"},
-       "--volume: '/srv/Photos' is not directly below /shares"},
+       "option --volume must be directly below /shares, not '/srv/Photos'"},
       {{"serve", "--volume", "/shares/A/B"},
-       "--volume: '/shares/A/B' is not directly below /shares"},
+       "option --volume must be directly below /shares, not '/shares/A/B'"},
       {{"serve", "--volume", "/shares/A/"},
-       "--volume: '/shares/A/' is not canonical: it contains '.', '..', '//' or a '/' at the end"},
+       "option --volume must not contain '.', '..', '//' or a '/' at the end: '/shares/A/'"},
       {{"serve", "--volume", "/shares/.."},
-       "--volume: '/shares/..' is not canonical: it contains '.', '..', '//' or a '/' at the end"},
+       "option --volume must not contain '.', '..', '//' or a '/' at the end: '/shares/..'"},
       {{"serve", "--volume", "/shares//A"},
-       "--volume: '/shares//A' is not canonical: it contains '.', '..', '//' or a '/' at the end"},
-      {{"drop", "--handled"}, "unexpected argument '--handled'"},
-      {{"drop", "--clients"}, "--clients: 1 required NUMBER missing"},
-      {{"drop", "--clients", "2x"}, "--clients: takes a number from 0 to 100000, not '2x'"},
-      {{"drop", "--clients", "0x2"}, "--clients: takes a number from 0 to 100000, not '0x2'"},
-      {{"drop", "--wait", "-1"}, "--wait: takes a number from 0 to 100000, not '-1'"},
-      {{"drop", "--wait", "100001"}, "--wait: takes a number from 0 to 100000, not '100001'"}};
+       "option --volume must not contain '.', '..', '//' or a '/' at the end: '/shares//A'"},
+      {{"drop", "--handled"}, "unknown option: --handled"},
+      {{"drop", "--clients"}, "option --clients needs a value"},
+      {{"drop", "--clients", "2x"}, "option --clients takes a number from 0 to 100000, not '2x'"},
+      {{"drop", "--clients", "0x2"}, "option --clients takes a number from 0 to 100000, not '0x2'"},
+      {{"drop", "--wait", "-1"}, "option --wait takes a number from 0 to 100000, not '-1'"},
+      {{"drop", "--wait", "100001"},
+       "option --wait takes a number from 0 to 100000, not '100001'"}};
   for (const auto& [arguments, message] : wrong) {
     try {
       ParseCommandLine(arguments);
@@ -422,20 +430,23 @@ TEST_F(OrvaNotify, ARawFileThatCannotBeReadIsAnError) {
   Serve();
   const Answer outcome = RunNotify({"send", "--raw", folder_ + "/absent"});
   EXPECT_EQ(outcome.status, 1);
-  EXPECT_EQ(outcome.line, "orva-notify: Cannot read '" + folder_ + "/absent'");
+  EXPECT_EQ(outcome.line,
+            "orva-notify: cannot read " + folder_ + "/absent: No such file or directory");
+  EXPECT_EQ(RunNotify({"send", "--raw", folder_}).line,
+            "orva-notify: cannot read " + folder_ + ": Is a directory");
 }
 
 TEST_F(OrvaNotify, SendFailsWhenNoServiceListens) {
   const Answer outcome = RunNotify({"send", "plugged", "/shares/A"});
   EXPECT_EQ(outcome.status, 1);
-  EXPECT_EQ(outcome.line, "orva-notify: No orva-notify serves " + ORVA_NOTIFICATION_SOCKET +
+  EXPECT_EQ(outcome.line, "orva-notify: no orva-notify serves " + ORVA_NOTIFICATION_SOCKET +
                               ": No such file or directory");
 }
 
 TEST_F(OrvaNotify, TheExitStatusDistinguishesWrongUsageFromFailure) {
   const Answer wrong = RunNotify({"send", "exploded", "/shares/A"});
   EXPECT_EQ(wrong.status, 2);
-  EXPECT_EQ(wrong.line, "orva-notify: EVENT: unknown event 'exploded'");
+  EXPECT_EQ(wrong.line, "orva-notify: unknown event: 'exploded'");
   const Answer help = RunNotify({"--help"});
   EXPECT_EQ(help.status, 0);
   EXPECT_THAT(help.line, HasSubstr("notification service"));
@@ -450,7 +461,7 @@ TEST_F(OrvaNotify, WaitsForTheGivenNumberOfClients) {
   const Answer tooFew =
       RunNotify({"send", "--clients", "2", "--wait", "0", "plugged", "/shares/TooEarly"});
   EXPECT_EQ(tooFew.status, 1);
-  EXPECT_EQ(tooFew.line, "orva-notify: Fewer than 2 clients connected within 0 s");
+  EXPECT_EQ(tooFew.line, "orva-notify: fewer than 2 clients connected within 0 s");
 
   Program waiting(NotifyCommand({"send", "--clients", "2", "plugged", "/shares/A"}));
   EXPECT_EQ(RunNotify({"send", "scanned", "/shares/B"}).line, "sent to 1 client");
@@ -502,7 +513,10 @@ TEST_F(OrvaNotify, FailsWhenAnotherServiceListens) {
   Serve();
   const Answer second = RunNotify({"serve"});
   EXPECT_EQ(second.status, 1);
-  EXPECT_THAT(second.line, HasSubstr("something else is there, perhaps another service"));
+  EXPECT_EQ(second.line, "orva-notify: cannot listen on " +
+                             ControlAddress(ORVA_NOTIFICATION_SOCKET) +
+                             ": another service listens there; end it first (the installed "
+                             "one: systemctl stop orva-notify)");
   NotifyClient client;
   EXPECT_EQ(RunNotify({"send", "end", "/shares/A"}).line, "sent to 1 client");
 }
@@ -511,8 +525,20 @@ TEST_F(OrvaNotify, DoesNotReplaceAFileThatIsNotASocket) {
   std::filesystem::create_directories(
       std::filesystem::path(ORVA_NOTIFICATION_SOCKET).parent_path());
   std::ofstream(ORVA_NOTIFICATION_SOCKET) << "precious";
-  EXPECT_EQ(RunNotify({"serve"}).status, 1);
+  const Answer outcome = RunNotify({"serve"});
+  EXPECT_EQ(outcome.status, 1);
+  EXPECT_EQ(outcome.line, "orva-notify: cannot listen on " + ORVA_NOTIFICATION_SOCKET +
+                              ": there is a file that is not a socket; remove it");
   EXPECT_EQ(std::filesystem::file_size(ORVA_NOTIFICATION_SOCKET), 8U);
+}
+
+TEST_F(OrvaNotify, FailsWhenTheDirectoryCannotBeCreated) {
+  const auto directory = std::filesystem::path(ORVA_NOTIFICATION_SOCKET).parent_path();
+  std::filesystem::remove_all(directory);
+  std::ofstream(directory) << "a file";
+  const Answer outcome = RunNotify({"serve"});
+  EXPECT_EQ(outcome.status, 1);
+  EXPECT_EQ(outcome.line, "orva-notify: cannot create " + directory.native() + ": Not a directory");
 }
 
 TEST_F(OrvaNotify, KeepsAMessageForAClientThatReadsLate) {
@@ -544,7 +570,7 @@ TEST_F(OrvaNotify, RefusesAMessageThatIsTooLong) {
   const Answer outcome = RunNotify({"send", "--raw", file});
   EXPECT_EQ(outcome.status, 1);
   EXPECT_EQ(outcome.line,
-            "orva-notify: A message of 67108865 bytes is too long, 67108864 are allowed");
+            "orva-notify: a message of 67108865 bytes is too long, 67108864 are allowed");
 }
 
 TEST_F(OrvaNotify, SurvivesMalformedRequests) {

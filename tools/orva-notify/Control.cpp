@@ -75,9 +75,9 @@ std::optional<std::string> ReceiveLine(util::Socket& socket, Clock::time_point d
 [[noreturn]] void ThrowTooLate(const Request& request, std::chrono::seconds wait) {
   throw util::Exception(
       request.clients == 0
-          ? util::FormatString("No answer from the notification service within %lld s",
+          ? util::FormatString("no answer from the notification service within %lld s",
                                static_cast<long long>(wait.count()))
-          : util::FormatString("Fewer than %zu clients connected within %lld s", request.clients,
+          : util::FormatString("fewer than %zu clients connected within %lld s", request.clients,
                                static_cast<long long>(wait.count())));
 }
 
@@ -85,7 +85,7 @@ std::optional<std::string> ReceiveLine(util::Socket& socket, Clock::time_point d
 std::optional<std::size_t> ReceiveCount(util::Socket& socket, Clock::time_point deadline) {
   const auto line = ReceiveLine(socket, deadline);
   if (line && line->empty()) {
-    throw util::Exception("The notification service closed the connection without an answer");
+    throw util::Exception("the notification service closed the connection without an answer");
   }
   return line ? std::optional(std::stoul(*line)) : std::nullopt;
 }
@@ -98,14 +98,14 @@ std::string ControlAddress(const std::string& address) {
 
 std::size_t Ask(const std::string& address, const Request& request, std::chrono::seconds wait) {
   if (request.message.size() > MAXIMUM_QUEUED_BYTES) {
-    throw util::Exception(util::FormatString("A message of %zu bytes is too long, %zu are allowed",
+    throw util::Exception(util::FormatString("a message of %zu bytes is too long, %zu are allowed",
                                              request.message.size(), MAXIMUM_QUEUED_BYTES));
   }
   const auto deadline = Clock::now() + wait;
   util::ClientSocket socket(util::Socket::Address(ControlAddress(address)), true);
   if (!socket.IsOpen()) {
     throw util::Exception(
-        util::FormatString("No orva-notify serves %s: %s", address.c_str(), strerror(errno)));
+        util::FormatString("no orva-notify serves %s: %s", address.c_str(), strerror(errno)));
   }
   if (!SendAll(socket, Encode(request), deadline)) {
     ThrowTooLate(request, wait);
@@ -120,7 +120,7 @@ std::size_t Ask(const std::string& address, const Request& request, std::chrono:
   const auto handled = ReceiveCount(socket, deadline);
   if (!handled) {
     throw util::Exception(
-        util::FormatString("Sent, but not yet handled by all clients within %lld s",
+        util::FormatString("sent, but not yet handled by all clients within %lld s",
                            static_cast<long long>(wait.count())));
   }
   return *handled;

@@ -64,6 +64,15 @@ std::optional<Event> EventFromWord(const std::string& word) {
   return text == EVENT_TEXTS.end() ? std::nullopt : std::optional(text->event);
 }
 
+std::vector<std::string> EventWords() {
+  std::vector<std::string> words;
+  words.reserve(EVENT_TEXTS.size());
+  for (const EventText& text : EVENT_TEXTS) {
+    words.emplace_back(text.word);
+  }
+  return words;
+}
+
 std::string Compose(Event event, const std::string& mountPoint) {
   return Compose({.event = event, .mountPoint = mountPoint});
 }

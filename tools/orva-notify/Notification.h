@@ -2,6 +2,7 @@
 
 #include <optional>
 #include <string>
+#include <vector>
 
 namespace orva::notify {
 
@@ -23,6 +24,9 @@ const std::string TRANSCODING_PROFILE = "cb62bbdd389b48898f2e5244977cb2c5";
 
 /// The event for `word` of the command line ("plugged", "transcoded"); nothing for an unknown word.
 std::optional<Event> EventFromWord(const std::string& word);
+
+/// The words of the command line for all events.
+std::vector<std::string> EventWords();
 
 /// The XML document that announces `event` of the volume at `mountPoint`, without the delimiter.
 /// The mount point may contain any bytes.

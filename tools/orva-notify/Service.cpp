@@ -1,5 +1,6 @@
 #include "orva-notify/Service.h"
 
+#include "commandline/Count.h"
 #include "orva-notify/Notification.h"
 #include "orvautil/Exception.h"
 #include "orvautil/FormatString.h"
@@ -35,12 +36,12 @@ std::string Printable(const std::string& text) {
 }
 
 std::string CountOfClients(std::size_t count) {
-  return std::to_string(count) + (count == 1 ? " client" : " clients");
+  return commandline::Count(static_cast<long long>(count), "client");
 }
 
 util::FileDescriptor CheckedDescriptor(int descriptor, const char* what) {
   if (descriptor == -1) {
-    throw util::Exception(FormatString("Cannot open %s: %s", what, strerror(errno)));
+    throw util::Exception(FormatString("cannot open %s: %s", what, strerror(errno)));
   }
   return util::FileDescriptor(descriptor);
 }
@@ -110,7 +111,7 @@ void Service::Wait() {
     add(request->Descriptor(), POLLIN);
   }
   if (poll(descriptors.data(), descriptors.size(), -1) == -1 && errno != EINTR) {
-    throw util::Exception(FormatString("Cannot wait for clients: %s", strerror(errno)));
+    throw util::Exception(FormatString("cannot wait for clients: %s", strerror(errno)));
   }
   // Each event is taken before ServeClients() looks at the clients, so that a later one is not
   // lost.

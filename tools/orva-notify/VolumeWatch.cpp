@@ -24,7 +24,7 @@ const char* const MOUNT_TABLE = "/proc/self/mountinfo";
 
 util::FileDescriptor Checked(int descriptor, const char* what) {
   if (descriptor == -1) {
-    throw util::Exception(util::FormatString("Cannot watch %s: %s", what, strerror(errno)));
+    throw util::Exception(util::FormatString("cannot watch %s: %s", what, strerror(errno)));
   }
   return util::FileDescriptor(descriptor);
 }

@@ -1,7 +1,6 @@
 #include "Commands.h"
 #include "Locator.h"
 #include "MergedDatabase.h"
-#include "Suggestion.h"
 #include "Text.h"
 
 #include "commandline/Parse.h"
@@ -25,9 +24,7 @@ using orva::commandline::UsageError;
 class Options {
 public:
   Options() {
-    app_.require_subcommand(0, 1);
-    app_.fallthrough();
-    app_.set_version_flag("--version", "zophotos " PROGRAM_VERSION);
+    orva::commandline::SetUp(app_);
     app_.add_option("--database", database_,
                     "Read this database instead of the one named by the daemon's locator file")
         ->type_name("FILE")
@@ -37,7 +34,7 @@ public:
                   "Escape the names that ls and find print also if the output is not a terminal");
     app_.add_option("--color", color_, "Print folders in a colour; auto: on a terminal")
         ->type_name("auto|always|never")
-        ->check(CLI::IsMember({"auto", "always", "never"}));
+        ->check(orva::commandline::OneOf({"auto", "always", "never"}));
     app_.footer(
         "Without a command, zophotos shows the status.\n"
         "Exit status: 0 success; 1 damaged, or nothing found; 2 wrong command line; 3 no database "
@@ -53,19 +50,13 @@ public:
         return false;
       }
     } catch (const UsageError& error) {
-      throw UsageError(Explain(error));
+      throw UsageError(error.what() + DashHint(), error.Command());
     }
     if (help_->parsed()) {
       std::cout << Help();
       return false;
     }
     return true;
-  }
-
-  /// The command whose help is likely to tell what is wrong with the command line.
-  std::string CommandToTry() const {
-    const CLI::App* const command = Command();
-    return command == nullptr || command == help_ ? "zophotos" : "zophotos " + command->get_name();
   }
 
   /// Runs the command. Throws Failure.
@@ -108,53 +99,14 @@ private:
     return commands.empty() ? nullptr : commands.front();
   }
 
-  std::vector<std::string> CommandNames() const {
-    std::vector<std::string> names;
-    for (const CLI::App* const command : app_.get_subcommands({})) {
-      names.push_back(command->get_name());
-    }
-    return names;
-  }
-
-  /// The names of the options that the command line may have.
-  std::vector<std::string> OptionNames() const {
-    std::vector<std::string> names;
-    for (const CLI::App* const app : {Command(), static_cast<const CLI::App*>(&app_)}) {
-      if (app != nullptr) {
-        for (const CLI::Option* const option : app->get_options()) {
-          for (const std::string& name : option->get_lnames()) {
-            names.push_back("--" + name);
-          }
-        }
-      }
-    }
-    return names;
-  }
-
-  /// The message for an unknown command or option, otherwise that of `error`.
-  std::string Explain(const UsageError& error) const {
+  /// How to search for a name that was taken for an unknown option; otherwise empty.
+  std::string DashHint() const {
     const std::vector<std::string> rest = app_.remaining(true);
-    if (rest.empty()) {
-      return error.what();
+    if (!find_->parsed() || rest.empty() || !rest.front().starts_with('-')) {
+      return "";
     }
-    const std::string& word = rest.front();
-    if (word.starts_with('-')) {
-      std::string text = "unknown option '" + word + "'" + DidYouMean(word, OptionNames());
-      if (find_->parsed()) {
-        text += "; to search for a name that begins with a dash: zophotos find -- '" + word + "'";
-      }
-      return text;
-    }
-    return Command() == nullptr ? UnknownCommand(word) : error.what();
-  }
-
-  std::string UnknownCommand(const std::string& word) const {
-    return "unknown command '" + word + "'" + DidYouMean(word, CommandNames());
-  }
-
-  static std::string DidYouMean(const std::string& word, const std::vector<std::string>& names) {
-    const auto suggestion = Suggest(word, names);
-    return suggestion ? "; did you mean '" + *suggestion + "'?" : "";
+    return "; to search for a name that begins with a dash: zophotos find -- '" + rest.front() +
+           "'";
   }
 
   /// The help that the command `help` prints.
@@ -165,7 +117,7 @@ private:
     const auto commands = app_.get_subcommands(
         [this](const CLI::App* command) { return command->get_name() == topic_; });
     if (commands.empty()) {
-      throw UsageError(UnknownCommand(topic_));
+      throw UsageError(orva::commandline::UnknownCommand(app_, topic_), app_.get_name());
     }
     return commands.front()->help(app_.get_name());
   }
@@ -227,10 +179,10 @@ private:
             },
             "Find only files (f) or only folders (d)")
         ->type_name("f|d")
-        ->check(CLI::IsMember({"f", "d"}));
+        ->check(orva::commandline::OneOf({"f", "d"}));
     find_->callback([this] {
       if (search_.nullTerminated && json_) {
-        throw CLI::ValidationError("find", "--null and --json cannot be combined");
+        throw UsageError("--null and --json cannot be combined");
       }
     });
     check_ = app_.add_subcommand("check", "Check the database for damage");
@@ -250,9 +202,8 @@ private:
     export_->add_flag("--jsonl", jsonLines_, "Print one JSON object per line, like --json");
     export_->callback([this] {
       if (csv_ && (jsonLines_ || json_)) {
-        throw CLI::ValidationError("export", std::string("--csv and ") +
-                                                 (jsonLines_ ? "--jsonl" : "--json") +
-                                                 " cannot be combined");
+        throw UsageError(std::string("--csv and ") + (jsonLines_ ? "--jsonl" : "--json") +
+                         " cannot be combined");
       }
     });
   }
@@ -288,12 +239,11 @@ int Finish(ExitStatus status) {
 }
 
 ExitStatus Run(std::vector<std::string> arguments) {
-  Options options;
   try {
+    Options options;
     return options.Parse(std::move(arguments)) ? options.Run() : ExitStatus::Success;
   } catch (const UsageError& error) {
-    std::cerr << "zophotos: " << Printable(error.what()) << "\nTry '" << options.CommandToTry()
-              << " --help'.\n";
+    orva::commandline::Report(error, Printable);
     return ExitStatus::Usage;
   } catch (const Failure& failure) {
     std::cerr << "zophotos: " << Printable(failure.what()) << '\n';

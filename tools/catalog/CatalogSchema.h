@@ -20,18 +20,33 @@ inline constexpr unsigned BUSY_TIMEOUT = 5000;
 /// if they are missing.
 std::unique_ptr<db::VolumeDB> OpenCatalog(const std::string& mountPoint);
 
-/// Creates the tables and indexes that are missing.
+/// Whether every table, index, trigger and view of the catalog is one that this program would have
+/// made, with the same definition. In others, writing a row may do anything.
+bool HasOwnSchema(const db::DB& catalog);
+
+/// Creates the tables, indexes and the identity that are missing.
 void CreateSchema(const db::DB& catalog);
 
 /// The two halves of CreateSchema: rows are inserted faster while there are no indexes.
 void CreateTables(const db::DB& catalog);
 void CreateIndexes(const db::DB& catalog);
 
-/// Drops the tables and their content.
+/// Drops the tables that describe the volume's content. The identity and the newest stamp stay.
 void DropTables(const db::DB& catalog);
 
-/// The stamp for changes made at `now`. It is later than every stamp in the catalog, also within
-/// one second and after the clock was set back: a reader looks for later stamps than it has seen.
+/// A random text that tells this catalog from all others, also when it is mounted elsewhere. The
+/// content of a catalog with another identity has nothing to do with this one's.
+std::string Identity(const db::DB& catalog);
+
+/// Gives the catalog another identity: its content is replaced by another.
+void RenewIdentity(const db::DB& catalog);
+
+/// The newest stamp that was given out, seconds since the epoch; 0 in a new catalog.
+std::time_t NewestStamp(const db::DB& catalog);
+
+/// Gives out the stamp for changes made at `now`, inside the caller's transaction. It is later than
+/// every stamp in the catalog, also within one second and after the clock was set back: a reader
+/// looks for later stamps than it has seen.
 std::time_t NextStamp(const db::DB& catalog, std::time_t now);
 
 /// Moves all commits from the write-ahead log into the catalog's file, unless a reader still needs

@@ -15,10 +15,10 @@ namespace orva::catalog {
 inline constexpr char PROFILE[] = "cb62bbdd389b48898f2e5244977cb2c5";
 
 /// Files.status and Folders.status.
-enum ItemStatus : int { INDEXED = 1, RENDERED = 3 };
+enum ItemStatus : int { INDEXED = 1, UNRENDERABLE = 2, RENDERED = 3 };
 
 /// Transcodings.status.
-enum TranscodingStatus : int { WITHDRAWN = 0, FINISHED = 1 };
+enum TranscodingStatus : int { WITHDRAWN = 0, FINISHED = 1, FAILED = 3 };
 
 /// Inserts or replaces the row `folder.id`. `folder.path` is relative to the volume and ends in
 /// "/".

@@ -94,6 +94,7 @@ long long Generate(const db::DB& catalog, const GeneratorPlan& plan, std::time_t
   const std::time_t stamp = NextStamp(catalog, now);
   DropTables(catalog);
   CreateTables(catalog);
+  RenewIdentity(catalog);
   const long long folders = Generation(catalog, plan, stamp).Run();
   CreateIndexes(catalog);
   transaction.Commit();
