@@ -139,7 +139,7 @@ TEST_F(OrvaNotifyObserver, ReceivesEverythingAndIsNotCounted) {
   EXPECT_THAT(observer.ReadMessages(2), ElementsAre(Plugged("/shares/A"), End("/shares/A")));
   const Answer tooFew =
       RunNotify({"send", "--clients", "1", "--wait", "0", "scanned", "/shares/A"});
-  EXPECT_EQ(tooFew.line, "orva-notify: Fewer than 1 clients connected within 0 s");
+  EXPECT_EQ(tooFew.line, "orva-notify: fewer than 1 clients connected within 0 s");
 
   NotifyClient client;
   EXPECT_EQ(RunNotify({"send", "--clients", "1", "scanned", "/shares/A"}).line, "sent to 1 client");
@@ -236,8 +236,8 @@ TEST_F(OrvaNotifyHandled, SaysWhenTheTimeIsOverAndTheMessageIsStillHandled) {
   const Answer late = RunNotify({"send", "--handled", "--wait", "0", "end", "/shares/A"});
   EXPECT_EQ(late.status, 1);
   EXPECT_THAT(late.line,
-              testing::AnyOf("orva-notify: Sent, but not yet handled by all clients within 0 s",
-                             "orva-notify: No answer from the notification service within 0 s"));
+              testing::AnyOf("orva-notify: sent, but not yet handled by all clients within 0 s",
+                             "orva-notify: no answer from the notification service within 0 s"));
   Send(End("/shares/B"));
   EXPECT_THAT(client.ReadMessages(3), ElementsAre(End("/shares/A"), "", End("/shares/B")));
 }
@@ -248,7 +248,7 @@ TEST_F(OrvaNotifyHandled, ADeadlineThatPassesWhileAClientHandlesIsNotCalledTooFe
   const Answer late =
       RunNotify({"send", "--handled", "--clients", "1", "--wait", "1", "end", "/shares/A"});
   EXPECT_EQ(late.status, 1);
-  EXPECT_EQ(late.line, "orva-notify: Sent, but not yet handled by all clients within 1 s");
+  EXPECT_EQ(late.line, "orva-notify: sent, but not yet handled by all clients within 1 s");
 }
 
 TEST_F(OrvaNotifyHandled, AClientThatDisconnectsIsNotCounted) {

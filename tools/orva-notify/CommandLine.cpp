@@ -18,14 +18,15 @@ constexpr long long MAXIMUM_NUMBER = 100'000;
 std::string WhyNoVolume(const std::string& directory) {
   const std::filesystem::path path(directory);
   if (!path.is_absolute()) {
-    return "'" + directory + "' is not absolute";
+    return "must be an absolute path, not '" + directory + "'";
   }
   if (path.lexically_normal().native() != directory ||
       (directory.size() > 1 && directory.ends_with('/'))) {
-    return "'" + directory + "' is not canonical: it contains '.', '..', '//' or a '/' at the end";
+    return "must not contain '.', '..', '//' or a '/' at the end: '" + directory + "'";
   }
-  return IsDirectlyBelowShares(directory) ? ""
-                                          : "'" + directory + "' is not directly below /shares";
+  return IsDirectlyBelowShares(directory)
+             ? ""
+             : "must be directly below /shares, not '" + directory + "'";
 }
 
 class Parser {

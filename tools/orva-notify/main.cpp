@@ -70,7 +70,7 @@ void Send(const CommandLine& command) {
                         .handled = command.handled,
                         .raw = !command.event};
   PrintClients(command.handled ? "handled by" : "sent to",
-             Ask(ORVA_NOTIFICATION_SOCKET, request, command.wait));
+               Ask(ORVA_NOTIFICATION_SOCKET, request, command.wait));
 }
 
 void Drop(const CommandLine& command) {
