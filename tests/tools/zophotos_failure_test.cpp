@@ -34,6 +34,7 @@ const std::vector<Arguments> COMMANDS{{},
                                       {"tree"},
                                       {"find", "*"},
                                       {"find", "-0", ""},
+                                      {"failed"},
                                       {"check"},
                                       {"export", "--csv"},
                                       {"export", "--jsonl"},
@@ -175,7 +176,8 @@ TEST(ZophotosUsage, HelpNamesAllCommands) {
   for (const Arguments& arguments : {Arguments{"--help"}, Arguments{"-h"}, Arguments{"help"}}) {
     const Outcome help = Zophotos(arguments);
     EXPECT_EQ(0, help.status);
-    for (const char* const command : {"status", "ls", "tree", "find", "check", "watch", "export"}) {
+    for (const char* const command :
+         {"status", "ls", "tree", "find", "failed", "check", "watch", "export"}) {
       EXPECT_THAT(help.output, HasSubstr("\n  " + std::string(command) + " "));
       const Outcome more = Zophotos({command, "--help"});
       EXPECT_EQ(0, more.status);
@@ -313,6 +315,7 @@ TEST_F(ZophotosFailure, WriteAheadLogIsReportedAndNotCreated) {
 TEST_F(ZophotosFailure, UnwritableOutputIsReported) {
   std::vector<Arguments> commands = COMMANDS;
   commands.push_back({"watch"});
+  commands.push_back({"status", "-f"});
   commands.push_back({"--help"});
   for (const Arguments& command : commands) {
     SCOPED_TRACE(Text(command));
@@ -366,6 +369,9 @@ TEST_F(ZophotosFailure, NoCommandChangesTheDatabase) {
   }
   Program watch(ZophotosCommand({"watch"}));
   EXPECT_THAT(watch.ReadLine(), HasSubstr("watching"));
+  EXPECT_EQ(before, Snapshot("/shares/A/.zophotos"));
+  Program follow(ZophotosCommand({"status", "-f"}));
+  EXPECT_THAT(follow.ReadLineWith("TOTAL"), HasSubstr("57 %"));
   EXPECT_EQ(before, Snapshot("/shares/A/.zophotos"));
 }
 

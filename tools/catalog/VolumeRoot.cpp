@@ -37,7 +37,9 @@ VolumeRoot::VolumeRoot(std::string path, Kind kind)
 
 util::FileDescriptor VolumeRoot::Open(const std::string& path, int flags, mode_t mode) const {
   open_how how{};
-  how.flags = static_cast<std::uint64_t>(flags | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC);
+  // openat2 refuses flags without a meaning.
+  const int waiting = (flags & O_PATH) != 0 ? 0 : O_NONBLOCK | O_NOCTTY;
+  how.flags = static_cast<std::uint64_t>(flags | waiting | O_NOFOLLOW | O_CLOEXEC);
   how.mode = mode;
   how.resolve = RESOLVE_BENEATH | RESOLVE_NO_SYMLINKS;
   return util::FileDescriptor(static_cast<int>(

@@ -1,3 +1,4 @@
+#include "Activity.h"
 #include "Commands.h"
 #include "Locator.h"
 #include "MergedDatabase.h"
@@ -31,14 +32,15 @@ public:
         ->check(orva::commandline::NotEmpty());
     app_.add_flag("--json", json_, "Print JSON: one object, or one object per line");
     app_.add_flag("--escape", escape_,
-                  "Escape the names that ls and find print also if the output is not a terminal");
+                  "Escape the names that ls, find and failed print also if the output is not a "
+                  "terminal");
     app_.add_option("--color", color_, "Print folders in a colour; auto: on a terminal")
         ->type_name("auto|always|never")
         ->check(orva::commandline::OneOf({"auto", "always", "never"}));
     app_.footer(
         "Without a command, zophotos shows the status.\n"
-        "Exit status: 0 success; 1 damaged, or nothing found; 2 wrong command line; 3 no database "
-        "now;\n4 locked, try again; 5 any other error. See zophotos(1).");
+        "Exit status: 0 success; 1 damaged, incomplete or not found; 2 wrong command line;\n3 no "
+        "database now; 4 locked, try again; 5 any other error. See zophotos(1).");
     AddCommands();
   }
 
@@ -64,6 +66,15 @@ public:
     if (watch_->parsed()) {
       return WatchDatabase([this] { return FindPath(); }, OutputForm());
     }
+    if (follow_) {
+      return FollowStatus([this] { return FindPath(); },
+                          {.services = database_.empty(), .redraws = IsCapableTerminal()},
+                          OutputForm());
+    }
+    if (failed_->parsed()) {
+      return ListFailedPhotos([this] { return FindPath(); }, Services(), path_, Escapes(),
+                              OutputForm());
+    }
     const std::string path = FindPath();
     try {
       return RunOn(path);
@@ -76,21 +87,29 @@ public:
 private:
   std::string FindPath() const { return database_.empty() ? FindDatabase() : database_; }
 
+  /// What the services of this machine are doing; nothing for another machine's database.
+  Activity Services() const { return database_.empty() ? ReadActivity() : Activity(); }
+
   Form OutputForm() const { return json_ ? Form::Json : Form::Text; }
 
   /// Whether to escape names where each is a line of its own.
   bool Escapes() const { return escape_ || Colors() || IsTerminal(); }
 
+  static std::string Variable(const char* name) {
+    const char* const value = std::getenv(name);
+    return value == nullptr ? "" : value;
+  }
+
+  /// Whether the output is a terminal with colours and a cursor that moves.
+  static bool IsCapableTerminal() {
+    const std::string terminal = Variable("TERM");
+    return IsTerminal() && !terminal.empty() && terminal != "dumb";
+  }
+
   /// Whether to print folders in a colour.
   bool Colors() const {
-    const auto variable = [](const char* name) {
-      const char* const value = std::getenv(name);
-      return std::string(value == nullptr ? "" : value);
-    };
-    const std::string terminal = variable("TERM");
     return color_ == "always" ||
-           (color_ == "auto" && IsTerminal() && variable("NO_COLOR").empty() && !terminal.empty() &&
-            terminal != "dumb");
+           (color_ == "auto" && IsCapableTerminal() && Variable("NO_COLOR").empty());
   }
 
   /// The command on the command line; null if there is none.
@@ -125,7 +144,7 @@ private:
   ExitStatus RunOn(const std::string& path) const {
     const Form form = OutputForm();
     if (Command() == nullptr || status_->parsed()) {
-      return ShowStatus(path, form);
+      return ShowStatus(path, Services(), form);
     }
     if (ls_->parsed()) {
       return List(path, {.path = path_, .isLong = long_, .escapes = Escapes(), .colors = Colors()},
@@ -148,6 +167,8 @@ private:
 
   void AddCommands() {
     status_ = app_.add_subcommand("status", "Show the database and the progress of each volume");
+    status_->add_flag("-f,--follow", follow_,
+                      "Show the progress again after each change until interrupted");
     ls_ = app_.add_subcommand("ls", "List a folder, or show a file");
     ls_->add_flag("-l,--long", long_, "Add times, numbers of files and volumes");
     ls_->add_flag_callback(
@@ -185,6 +206,11 @@ private:
         throw UsageError("--null and --json cannot be combined");
       }
     });
+    failed_ = app_.add_subcommand("failed",
+                                  "List the photos that could not be rendered, with the reasons");
+    failed_->add_option("PATH", path_,
+                        "Only photos of this volume or in this folder, absolute or relative to "
+                        "/shares");
     check_ = app_.add_subcommand("check", "Check the database for damage");
     watch_ = app_.add_subcommand("watch", "Print a line for each change until interrupted");
     AddExport();
@@ -213,16 +239,18 @@ private:
   CLI::App* ls_ = nullptr;
   CLI::App* tree_ = nullptr;
   CLI::App* find_ = nullptr;
+  CLI::App* failed_ = nullptr;
   CLI::App* check_ = nullptr;
   CLI::App* watch_ = nullptr;
   CLI::App* export_ = nullptr;
   CLI::App* help_ = nullptr;
   std::string database_;
   std::string color_ = "auto";
-  std::string path_;  ///< of ls and tree
+  std::string path_;  ///< of ls, tree and failed
   std::string topic_; ///< of help
   std::size_t levels_ = std::numeric_limits<std::size_t>::max();
   Search search_;
+  bool follow_ = false;
   bool json_ = false;
   bool escape_ = false;
   bool long_ = false;

@@ -21,7 +21,7 @@ function __zophotos_command
     return 1
 end
 
-set -l commands status ls tree find check watch export help
+set -l commands status ls tree find failed check watch export help
 set -l first 'not __zophotos_command >/dev/null'
 
 complete -c zophotos -f
@@ -36,12 +36,14 @@ complete -c zophotos -n $first -a status -d 'Show the database and the progress 
 complete -c zophotos -n $first -a ls -d 'List a folder, or show a file'
 complete -c zophotos -n $first -a tree -d 'Show all folders below a folder'
 complete -c zophotos -n $first -a find -d 'Find files and folders by name'
+complete -c zophotos -n $first -a failed -d 'List the photos that could not be rendered'
 complete -c zophotos -n $first -a check -d 'Check the database for damage'
 complete -c zophotos -n $first -a watch -d 'Print a line for each change until interrupted'
 complete -c zophotos -n $first -a export -d 'Print every file with its full path'
 complete -c zophotos -n $first -a help -d 'Print help, or the help of a command'
 complete -c zophotos -n 'contains help (__zophotos_command)' -a "$commands"
 
+complete -c zophotos -n 'contains status (__zophotos_command)' -s f -l follow -d 'Show the progress again after each change'
 complete -c zophotos -n 'contains ls (__zophotos_command)' -s l -l long -d 'Add times, numbers of files and volumes'
 complete -c zophotos -n 'contains ls (__zophotos_command)' -s 1 -d 'Print one name per line'
 complete -c zophotos -n 'contains tree (__zophotos_command)' -s L -l level -x -d 'Show only so many levels'
