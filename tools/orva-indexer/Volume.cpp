@@ -414,11 +414,11 @@ void Volume::WalkNext(FolderIndexer& indexer) {
     return;
   }
   folder->revived = task.revived;
-  const long long files = indexer.Summary().files;
+  const long long rows = indexer.Summary().rows;
   std::vector<Folder> inside = indexer.Update(*folder);
   if (isWalkingAll_) {
     walkedFolders_ += static_cast<long long>(inside.size());
-    walkedFiles_ += indexer.Summary().files - files;
+    walkedFiles_ += indexer.Summary().rows - rows;
   }
   // The first one is next.
   for (Folder& next : inside | std::views::reverse) {
