@@ -6,6 +6,14 @@
 #include "orvadb/Folder.h"
 
 namespace orva::catalog {
+namespace {
+
+constexpr char STORE_FILE[] =
+    "INSERT OR REPLACE INTO Files(id, folderId, path, name, category, lastModifiedDate, "
+    "isBackup, isHidden, isSystem, isDeleted, status, lastUpdatedDate, ext, size) "
+    "VALUES(?, ?, ?, ?, ?, ?, ?, ?, ?, ?, ?, ?, ?, ?)";
+
+} // namespace
 
 void StoreFolder(const db::DB& catalog, const db::Folder& folder) {
   Execute(catalog,
@@ -18,13 +26,32 @@ void StoreFolder(const db::DB& catalog, const db::Folder& folder) {
 }
 
 void StoreFile(const db::DB& catalog, const db::File& file) {
-  Execute(catalog,
-          "INSERT OR REPLACE INTO Files(id, folderId, path, name, category, lastModifiedDate, "
-          "isBackup, isHidden, isSystem, isDeleted, status, lastUpdatedDate, ext, size) "
-          "VALUES(?, ?, ?, ?, ?, ?, ?, ?, ?, ?, ?, ?, ?, ?)",
-          file.id, file.folderId, file.path, file.name, file.category, file.lastModifiedDate,
-          file.isBackup, file.isHidden, file.isSystem, file.isDeleted, file.status,
-          file.lastUpdatedDate, file.ext, file.size);
+  Execute(catalog, STORE_FILE, file.id, file.folderId, file.path, file.name, file.category,
+          file.lastModifiedDate, file.isBackup, file.isHidden, file.isSystem, file.isDeleted,
+          file.status, file.lastUpdatedDate, file.ext, file.size);
+}
+
+void StoreFile(const db::DB& catalog, const FileRow& file) {
+  std::string path;
+  path.reserve(file.folderPath.size() + file.name.size());
+  path.append(file.folderPath).append(file.name);
+  db::Statement statement(catalog, STORE_FILE);
+  int column = 0;
+  statement.BindInt64(++column, file.id);
+  statement.BindInt64(++column, file.folderId);
+  statement.BindTextView(++column, path);
+  statement.BindTextView(++column, file.name);
+  statement.BindInt(++column, file.category);
+  statement.BindTime(++column, file.lastModifiedDate);
+  statement.BindInt(++column, file.flags.isBackup ? 1 : 0);
+  statement.BindInt(++column, file.flags.isHidden ? 1 : 0);
+  statement.BindInt(++column, file.flags.isSystem ? 1 : 0);
+  statement.BindInt(++column, 0); // isDeleted
+  statement.BindInt(++column, file.status);
+  statement.BindTime(++column, file.lastUpdatedDate);
+  statement.BindTextView(++column, file.extension);
+  statement.BindInt64(++column, file.size);
+  statement.Execute();
 }
 
 void StoreTranscoding(const db::DB& catalog, long long fileId, TranscodingStatus status,

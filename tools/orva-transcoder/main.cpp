@@ -26,7 +26,7 @@ bool ParseArguments(const std::vector<std::string>& arguments) {
   app.set_version_flag("--version", "orva-transcoder " PROGRAM_VERSION);
   app.footer("A service without options. Runs until a signal ends it. Exit status: 1 failed, 2 "
              "wrong\ncommand line. See orva-transcoder(8).");
-  return commandline::Parse(app, arguments);
+  return commandline::Parse(app, arguments, false);
 }
 
 /// The working folder: the one that systemd has made, or the one that the user has.

@@ -1,0 +1,545 @@
+#include "IndexerTest.h"
+
+#include "support/Programs.h"
+#include "support/TestScale.h"
+#include "system/DaemonProcess.h"
+#include "system/Database.h"
+#include "system/Deadline.h"
+
+#include "CatalogSchema.h"
+#include "Renditions.h"
+#include "orvadb/Transaction.h"
+#include "orvadb/VolumeDB.h"
+#include "orvautil/FileDescriptor.h"
+
+#include <gmock/gmock.h>
+
+#include <fcntl.h>
+#include <sys/mount.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <array>
+#include <chrono>
+#include <csignal>
+#include <ctime>
+#include <fstream>
+#include <iterator>
+#include <random>
+#include <string>
+#include <vector>
+
+namespace orva::test {
+namespace {
+
+namespace fs = std::filesystem;
+using testing::Contains;
+using testing::ElementsAre;
+using testing::HasSubstr;
+using testing::IsEmpty;
+using testing::Not;
+
+/// The number of events called `name`.
+long Count(const Lines& events, const std::string& name) {
+  return std::ranges::count(events, name);
+}
+
+// --- Volumes -----------------------------------------------------------------------------------
+
+TEST_F(IndexerTest, APluggedVolumeIsWalkedAndAnnounced) {
+  const Volume volume("A", "64m");
+  Write(volume.Path() + "/Pictures/a.jpg");
+  Write(volume.Path() + "/b.txt");
+  StartService();
+  StartIndexer();
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  EXPECT_TRUE(Await([&] { return Events(volume.Path()).size() >= 3; }));
+  Lines events = Events(volume.Path());
+  events.resize(3);
+  EXPECT_THAT(events, ElementsAre("Plugged", "Scanned", "End"));
+  EXPECT_THAT(Query(volume.Path(), "SELECT path, status FROM Files ORDER BY path"),
+              ElementsAre("Pictures/a.jpg|1", "b.txt|1"));
+  EXPECT_THAT(Query(volume.Path(), "SELECT count(*) FROM Transcodings"), ElementsAre("0"));
+  EXPECT_TRUE(Await([&] { return State(volume.Path()) == "watching"; }));
+  EXPECT_THAT(ErrorLines(), IsEmpty());
+  StopIndexer();
+}
+
+TEST_F(IndexerTest, APlainDirectoryIsAVolumeIfItsMessageSaysSo) {
+  Write("/shares/Photos/a.jpg");
+  StartService();
+  StartIndexer();
+  PlugDirectory("/shares/Photos");
+  EXPECT_THAT(AwaitCatalog("/shares/Photos"), IsEmpty());
+  fs::rename("/shares/Photos", "/shares/Gone");
+  EXPECT_TRUE(AwaitLog("/shares/Photos/: gone"));
+  EXPECT_FALSE(fs::exists("/shares/Photos"));
+}
+
+TEST_F(IndexerTest, NothingIsWrittenWhereNothingIsMounted) {
+  Write("/shares/B/a.jpg");
+  StartService();
+  StartIndexer();
+  Send("plugged", "/shares/B");
+  EXPECT_TRUE(AwaitLog("/shares/B/: gone"));
+  EXPECT_FALSE(fs::exists("/shares/B/.orva"));
+  EXPECT_THAT(ErrorLines(), IsEmpty());
+}
+
+TEST_F(IndexerTest, AVolumeCanBeUnmountedWhileItIsWatched) {
+  const Volume volume("A", "64m");
+  Write(volume.Path() + "/Pictures/a.jpg");
+  StartService();
+  StartIndexer();
+  ASSERT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  ASSERT_TRUE(Await([&] { return State(volume.Path()) == "watching"; }));
+  EXPECT_TRUE(Await([&] { return umount2(volume.Path().c_str(), 0) == 0; }));
+  EXPECT_TRUE(AwaitLog("/shares/A/: gone"));
+  EXPECT_THAT(fs::directory_iterator(volume.Path()), fs::directory_iterator());
+  EXPECT_THAT(ErrorLines(), IsEmpty());
+}
+
+TEST_F(IndexerTest, AVolumeThatVanishesDuringItsWalkIsNoError) {
+  Volume volume("A", "512m");
+  for (int folder = 0; folder < 100; ++folder) {
+    const std::string path = volume.Path() + "/" + std::to_string(folder);
+    fs::create_directory(path);
+    for (int file = 0; file < 200; ++file) {
+      std::ofstream(path + "/" + std::to_string(file) + ".jpg");
+    }
+  }
+  StartService();
+  StartIndexer();
+  ASSERT_TRUE(AwaitLog("/shares/A/: walking"));
+  volume.Unmount();
+  EXPECT_TRUE(AwaitLog("/shares/A/: gone"));
+  EXPECT_THAT(ErrorLines(), IsEmpty());
+  StopIndexer();
+}
+
+TEST_F(IndexerTest, EverythingIsAnnouncedAgainWhenTheServiceComesBack) {
+  const Volume volume("A", "64m");
+  Write(volume.Path() + "/a.jpg");
+  StartService();
+  StartIndexer();
+  ASSERT_TRUE(Await([&] { return Count(Events(volume.Path()), "End") == 1; }));
+  Service().Signal(SIGTERM);
+  ASSERT_EQ(Service().WaitForEnd(), 0);
+  StartService();
+  EXPECT_TRUE(Await([&] {
+    return Count(Events(volume.Path()), "Scanned") == 2 && Count(Events(volume.Path()), "End") == 2;
+  }));
+  Write(volume.Path() + "/b.jpg");
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+}
+
+TEST_F(IndexerTest, StartsBeforeTheService) {
+  const Volume volume("A", "64m");
+  Write(volume.Path() + "/a.jpg");
+  StartIndexer();
+  StartService();
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+}
+
+// --- Changes -----------------------------------------------------------------------------------
+
+TEST_F(IndexerTest, AChangeIsAnnouncedOnce) {
+  const Volume volume("A", "64m");
+  Write(volume.Path() + "/Pictures/a.jpg");
+  StartService();
+  StartIndexer();
+  ASSERT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  ASSERT_TRUE(Await([&] { return State(volume.Path()) == "watching"; }));
+  const long ends = Count(Events(volume.Path()), "End");
+  Write(volume.Path() + "/Pictures/b.jpg");
+  EXPECT_TRUE(Await([&] { return Count(Events(volume.Path()), "End") == ends + 1; }));
+  EXPECT_THAT(Query(volume.Path(), "SELECT path FROM Files ORDER BY path"),
+              ElementsAre("Pictures/a.jpg", "Pictures/b.jpg"));
+  EXPECT_EQ(Count(Events(volume.Path()), "Scanned"), 1);
+}
+
+TEST_F(IndexerTest, AFileWaitsWhileItIsWrittenAndOthersDoNot) {
+  const Volume volume("A", "64m");
+  StartService();
+  StartIndexer();
+  ASSERT_TRUE(Await([&] { return Count(Events(volume.Path()), "End") == 1; }));
+  std::ofstream slow(volume.Path() + "/slow.jpg");
+  slow << "half" << std::flush;
+  Write(volume.Path() + "/other.jpg");
+  ASSERT_TRUE(
+      Await([&] { return Query(volume.Path(), "SELECT path FROM Files") == Lines{"other.jpg"}; }));
+  slow << " whole" << std::flush;
+  Write(volume.Path() + "/third.jpg");
+  ASSERT_TRUE(Await([&] {
+    return Query(volume.Path(), "SELECT path FROM Files ORDER BY path") ==
+           (Lines{"other.jpg", "third.jpg"});
+  }));
+  slow.close();
+  EXPECT_TRUE(Await([&] {
+    return Query(volume.Path(), "SELECT size FROM Files WHERE path = 'slow.jpg'") == Lines{"10"};
+  }));
+}
+
+TEST_F(IndexerTest, ALinkIsEnteredAlthoughItIsNeverClosed) {
+  const Volume volume("A", "64m");
+  Write("/tmp/elsewhere.jpg");
+  Write(volume.Path() + "/a.jpg");
+  StartService();
+  StartIndexer();
+  ASSERT_TRUE(Await([&] { return Count(Events(volume.Path()), "End") == 1; }));
+  fs::create_hard_link(volume.Path() + "/a.jpg", volume.Path() + "/b.jpg");
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+}
+
+TEST_F(IndexerTest, ATreeThatIsMovedInIsEntered) {
+  // The volume is a part of a file system, so that a tree can be moved into it.
+  fs::create_directories("/tmp/disk");
+  ASSERT_EQ(mount("disk", "/tmp/disk", "tmpfs", 0, "size=256m"), 0);
+  fs::create_directories("/tmp/disk/volume");
+  fs::create_directories("/shares/A");
+  ASSERT_EQ(mount("/tmp/disk/volume", "/shares/A", nullptr, MS_BIND, nullptr), 0);
+  for (int folder = 0; folder < TestScale(100, 1000); ++folder) {
+    Write("/tmp/disk/tree/" + std::to_string(folder % 10) + "/" + std::to_string(folder) +
+          "/a.jpg");
+  }
+  StartService();
+  StartIndexer();
+  ASSERT_TRUE(Await([&] { return Count(Events("/shares/A"), "End") == 1; }));
+  fs::rename("/tmp/disk/tree", "/tmp/disk/volume/tree");
+  EXPECT_THAT(AwaitCatalog("/shares/A"), IsEmpty());
+  Write("/shares/A/tree/3/3/b.jpg"); // it is watched
+  EXPECT_THAT(AwaitCatalog("/shares/A"), IsEmpty());
+  fs::rename("/tmp/disk/volume/tree", "/tmp/disk/tree");
+  EXPECT_THAT(AwaitCatalog("/shares/A"), IsEmpty());
+  fs::rename("/tmp/disk/tree", "/tmp/disk/volume/other");
+  fs::rename("/tmp/disk/volume/other/3", "/tmp/disk/volume/other/4/inside");
+  EXPECT_THAT(AwaitCatalog("/shares/A"), IsEmpty());
+  Write("/shares/A/other/4/inside/3/c.jpg");
+  EXPECT_THAT(AwaitCatalog("/shares/A"), IsEmpty());
+  StopIndexer();
+  EXPECT_EQ(umount2("/shares/A", 0), 0);
+}
+
+TEST_F(IndexerTest, AfterAnOverflowOfTheQueueEverythingIsWalked) {
+  const Volume volume("A", "256m");
+  Write(volume.Path() + "/Pictures/a.jpg");
+  StartService();
+  StartIndexer();
+  ASSERT_TRUE(Await([&] { return State(volume.Path()) == "watching"; }));
+  Indexer().Signal(SIGSTOP);
+  std::ifstream limit("/proc/sys/fs/inotify/max_queued_events");
+  int events = 0;
+  ASSERT_TRUE(limit >> events);
+  for (int file = 0; file <= events / 2; ++file) { // created and closed
+    std::ofstream(volume.Path() + "/Pictures/" + std::to_string(file) + ".jpg");
+  }
+  fs::create_directories(volume.Path() + "/Later/Inside");
+  Indexer().Signal(SIGCONT);
+  EXPECT_TRUE(AwaitLog("too many changes at once"));
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  Write(volume.Path() + "/Later/Inside/b.jpg");
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+}
+
+TEST_F(IndexerTest, AtTheWatchLimitTheVolumeIsWalkedOnATimer) {
+  const Volume volume("A", "64m");
+  for (int folder = 0; folder < 20; ++folder) {
+    Write(volume.Path() + "/" + std::to_string(folder) + "/a.jpg");
+  }
+  StartService();
+  // The limit of a user namespace counts in addition to that of the system.
+  const Program::Arguments limited = {
+      "unshare", "--user", "--map-root-user",
+      "/bin/sh", "-c",     "echo 10 >/proc/sys/user/max_inotify_watches && exec \"$0\""};
+  Program::Arguments probe = limited;
+  probe.emplace_back("true");
+  if (test::Run(probe).status != 0) {
+    GTEST_SKIP() << "limits of a user namespace cannot be set here";
+  }
+  StartIndexer(limited);
+  EXPECT_TRUE(AwaitLog("fs.inotify.max_user_watches"));
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  EXPECT_TRUE(Await([&] { return State(volume.Path()) == "timed"; }));
+  EXPECT_EQ(LogLines("fs.inotify.max_user_watches").size(), 1U);
+}
+
+TEST_F(IndexerTest, AMountBelowTheVolumeIsFollowed) {
+  const Volume volume("A", "64m");
+  Write(volume.Path() + "/Inside/a.jpg");
+  StartService();
+  StartIndexer();
+  ASSERT_TRUE(Await([&] { return Count(Events(volume.Path()), "End") == 1; }));
+  const std::string inside = volume.Path() + "/Inside";
+  ASSERT_EQ(mount("inside", inside.c_str(), "tmpfs", 0, "size=1m"), 0);
+  Write(inside + "/b.jpg");
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  ASSERT_EQ(umount2(inside.c_str(), 0), 0);
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+}
+
+/// Random operations on the files and folders of a volume.
+class Operations {
+public:
+  Operations(std::string root, unsigned seed) : root_(std::move(root)), random_(seed) {}
+
+  void Perform() {
+    switch (Number(9)) {
+    case 0:
+    case 1:
+    case 2:
+      CreateFile();
+      break;
+    case 3:
+      fs::create_directories(SomeFolder() + "/" + Name(), ignored_);
+      break;
+    case 4:
+      fs::rename(SomeFile(), SomeFolder() + "/" + Name(), ignored_);
+      break;
+    case 5:
+      fs::rename(SomeFolder(), SomeFolder() + "/" + Name(), ignored_);
+      break;
+    case 6:
+      fs::remove(SomeFile(), ignored_);
+      break;
+    case 7:
+      if (Number(4) == 0) {
+        RemoveFolder();
+      }
+      break;
+    default:
+      std::ofstream(SomeFile(), std::ios::app) << "more";
+    }
+    fs::create_directories(root_);
+  }
+
+private:
+  unsigned Number(unsigned end) { return static_cast<unsigned>(random_()) % end; }
+
+  std::string Name() {
+    static const std::array names = {"a.jpg",  "B.JPG",      "c",       "d~",
+                                     ".e.jpg", "lost+found", "f g.png", "\xe9.gif",
+                                     "h.txt",  "i\n.jpg",    "j.bak",   "k"};
+    return names[Number(names.size())];
+  }
+
+  void CreateFile() { std::ofstream(SomeFolder() + "/" + Name()) << std::string(Number(100), 'x'); }
+
+  void RemoveFolder() {
+    const std::string folder = SomeFolder();
+    if (folder != root_) {
+      fs::remove_all(folder, ignored_);
+    }
+  }
+
+  std::string Some(bool folders) {
+    std::vector<std::string> found = {root_};
+    for (const auto& entry : fs::recursive_directory_iterator(root_)) {
+      if (entry.path().native().find("/.orva") == std::string::npos &&
+          entry.is_directory() == folders) {
+        found.push_back(entry.path());
+      }
+    }
+    return found[Number(static_cast<unsigned>(found.size()))];
+  }
+  std::string SomeFolder() { return Some(true); }
+  std::string SomeFile() { return Some(false); }
+
+  const std::string root_;
+  std::mt19937 random_;
+  std::error_code ignored_;
+};
+
+TEST_F(IndexerTest, RandomOperationsConvergeToWhatANewCatalogSays) {
+  const Volume volume("A", "64m");
+  StartService();
+  StartIndexer();
+  ASSERT_TRUE(Await([&] { return Count(Events(volume.Path()), "End") == 1; }));
+  constexpr int SEED = 14;
+  Operations operations(volume.Path(), SEED);
+  for (int round = 0; round < TestScale(3, 100); ++round) {
+    for (int i = 0; i < 100; ++i) {
+      operations.Perform();
+    }
+    ASSERT_THAT(AwaitCatalog(volume.Path()), IsEmpty()) << "seed " << SEED << ", round " << round;
+  }
+  EXPECT_THAT(Query(volume.Path(), "PRAGMA integrity_check"), ElementsAre("ok"));
+  EXPECT_THAT(ErrorLines(), IsEmpty());
+}
+
+TEST_F(IndexerTest, AKilledIndexerConvergesAfterItsStart) {
+  const Volume volume("A", "64m");
+  StartService();
+  std::mt19937 random(14);
+  Operations operations(volume.Path(), 15);
+  for (int round = 0; round < TestScale(5, 50); ++round) {
+    StartIndexer();
+    const auto instant = std::chrono::milliseconds(random() % 3000);
+    const auto end = std::chrono::steady_clock::now() + instant;
+    while (std::chrono::steady_clock::now() < end) {
+      operations.Perform();
+    }
+    Indexer().Signal(SIGKILL);
+    Indexer().WaitForEnd();
+  }
+  StartIndexer();
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  EXPECT_THAT(Query(volume.Path(), "PRAGMA integrity_check"), ElementsAre("ok"));
+  EXPECT_THAT(ErrorLines(), IsEmpty());
+}
+
+// --- Volumes that cannot be written ------------------------------------------------------------
+
+TEST_F(IndexerTest, AReadOnlyVolumeIsIndexedWhenItBecomesWritable) {
+  Volume volume("A", "64m");
+  Write(volume.Path() + "/a.jpg");
+  volume.MakeReadOnly();
+  StartService();
+  StartIndexer();
+  ASSERT_TRUE(AwaitLog("/shares/A/: read-only"));
+  EXPECT_TRUE(Await([&] { return State(volume.Path()) == "read-only"; }));
+  volume.MakeWritable();
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  EXPECT_EQ(LogLines("read-only").size(), 1U);
+}
+
+TEST_F(IndexerTest, AFullVolumeIsIndexedWhenThereIsSpace) {
+  Volume volume("A", "1m");
+  Write(volume.Path() + "/a.jpg");
+  std::ofstream filler(volume.Path() + "/filler");
+  while (filler << std::string(4096, 'x') << std::flush) {
+  }
+  filler.close();
+  StartService();
+  StartIndexer();
+  ASSERT_TRUE(AwaitLog("/shares/A/: full"));
+  volume.Resize(64 << 20);
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  EXPECT_EQ(LogLines(": full").size(), 1U);
+}
+
+// --- The merged database -----------------------------------------------------------------------
+
+/// The indexer and the daemon, with a master volume that keeps its merged database. It is plugged
+/// before the volumes of the tests, in the order of their names.
+class IndexerAndDaemonTest : public IndexerTest {
+protected:
+  IndexerAndDaemonTest() : master_("Big", "150g") {}
+  ~IndexerAndDaemonTest() override { StopDaemon(); }
+
+  void Start() {
+    StartService();
+    daemon_ = std::make_unique<DaemonProcess>("/tmp/daemon", "/tmp/daemon.out");
+    StartIndexer();
+  }
+
+  /// Ends all programs, the service first.
+  void Stop() {
+    StopIndexer();
+    Service().Signal(SIGTERM);
+    Service().WaitForEnd();
+    StopDaemon();
+  }
+
+  /// Marks all photos of a catalog finished, as the transcoder does.
+  static void FinishPhotos(const std::string& volume) {
+    const auto database = catalog::OpenCatalog(volume);
+    db::Transaction transaction(*database, catalog::BUSY_TIMEOUT);
+    const std::time_t stamp = catalog::NextStamp(*database, std::time(nullptr));
+    for (const auto& photo : catalog::NewestWaiting(*database, 1000)) {
+      catalog::MarkFinished(*database, photo, stamp);
+    }
+    transaction.Commit();
+  }
+
+  /// "file's name|volume" of all merged photos.
+  static Lines Merged() {
+    try {
+      return Database("/shares/Big/.zophotos/zophotos.db")
+          .Run("SELECT name, volume FROM Files ORDER BY name");
+    } catch (const SQLite::Exception&) {
+      return {};
+    }
+  }
+
+  /// Finishes the photos of the volume and waits until they are listed. Returns the merged photos
+  /// otherwise.
+  Lines AwaitMerged(const std::string& volume, const Lines& names) {
+    Lines expected;
+    for (const std::string& name : names) {
+      expected.push_back(name + "|" + volume + "/");
+    }
+    const Lines differences = AwaitCatalog(volume);
+    if (!differences.empty()) {
+      return differences;
+    }
+    FinishPhotos(volume);
+    Send("transcoded", volume);
+    Await([&] { return Merged() == expected; });
+    Lines merged = Merged();
+    return merged == expected ? Lines() : merged;
+  }
+
+private:
+  void StopDaemon() {
+    if (daemon_ && daemon_->IsRunning()) {
+      kill(daemon_->Pid(), SIGKILL);
+      daemon_->AwaitEnd();
+    }
+  }
+
+  const Volume master_;
+  std::unique_ptr<DaemonProcess> daemon_;
+};
+
+TEST_F(IndexerAndDaemonTest, DisksThatWereSwappedWhileNothingRanAreMergedFromTheBeginning) {
+  {
+    const Volume first("Disk", "64m");
+    Write(first.Path() + "/first.jpg");
+    Start();
+    ASSERT_THAT(AwaitMerged(first.Path(), {"first.jpg"}), IsEmpty());
+    Stop();
+  }
+  // The other disk has an older catalog, with smaller ids and stamps.
+  const Volume second("Disk", "64m");
+  Write(second.Path() + "/second.jpg");
+  Start();
+  EXPECT_THAT(AwaitMerged(second.Path(), {"second.jpg"}), IsEmpty());
+  EXPECT_THAT(Events(second.Path()), Contains("Purged"));
+}
+
+TEST_F(IndexerAndDaemonTest, ACatalogFromABackupIsMergedFromTheBeginning) {
+  const Volume volume("Disk", "64m");
+  Write(volume.Path() + "/a.jpg");
+  Start();
+  ASSERT_THAT(AwaitMerged(volume.Path(), {"a.jpg"}), IsEmpty());
+  Stop();
+  fs::copy_file(CatalogOf(volume.Path()), "/tmp/backup.db");
+  Start();
+  Write(volume.Path() + "/b.jpg");
+  ASSERT_THAT(AwaitMerged(volume.Path(), {"a.jpg", "b.jpg"}), IsEmpty());
+  fs::remove(volume.Path() + "/a.jpg");
+  ASSERT_TRUE(Await([&] { return Merged() == Lines{"b.jpg|/shares/Disk/"}; }));
+  Stop();
+  fs::remove(volume.Path() + "/b.jpg");
+  fs::copy_file("/tmp/backup.db", CatalogOf(volume.Path()), fs::copy_options::overwrite_existing);
+  Write(volume.Path() + "/c.jpg");
+  Start();
+  // Nothing in the catalog says that the merged database has b.jpg.
+  EXPECT_THAT(AwaitMerged(volume.Path(), {"c.jpg"}), IsEmpty());
+}
+
+// --- Command line ------------------------------------------------------------------------------
+
+TEST_F(IndexerTest, HasNoOptionsButHelpAndVersion) {
+  const std::string program = ProgramPath("orva-indexer");
+  EXPECT_EQ(test::Run({program, "--version"}).output, "orva-indexer " PROGRAM_VERSION "\n");
+  const Outcome help = test::Run({program, "--help"});
+  EXPECT_EQ(help.status, 0);
+  EXPECT_THAT(help.output, HasSubstr("Exit status"));
+  const Outcome wrong = test::Run({program, "now"});
+  EXPECT_EQ(wrong.status, 2);
+  EXPECT_THAT(wrong.output + wrong.error, HasSubstr("unexpected argument 'now'"));
+}
+
+} // namespace
+} // namespace orva::test

@@ -1,0 +1,517 @@
+#include "FolderIndexer.h"
+
+#include "CatalogSchema.h"
+#include "CatalogWriter.h"
+#include "Sql.h"
+#include "UntrustedCatalog.h"
+#include "VolumeRoot.h"
+
+#include "orvadb/Folder.h"
+
+#include "orvautil/Core.h"
+#include "orvautil/Exception.h"
+#include "orvautil/Path.h"
+
+#include <dirent.h>
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <memory>
+#include <string_view>
+#include <system_error>
+
+namespace orva::catalog {
+namespace {
+
+/// How often the caller's pulse is called: once for so many names or rows.
+constexpr std::size_t NAMES_PER_PULSE = 256;
+
+struct CloseDirectory {
+  void operator()(DIR* directory) const noexcept { closedir(directory); }
+};
+using Directory = std::unique_ptr<DIR, CloseDirectory>;
+
+/// True for the product's own folders in the root of a volume, which are not indexed.
+bool IsProductData(const IndexedFolder& folder, std::string_view name) {
+  static const std::string home = core::GetORVA_HOME("");
+  return folder.path.empty() && (name == home || name == ".zophotos");
+}
+
+/// Whether a folder that cannot be opened is no longer there.
+bool IsGone(int error) {
+  return error == ENOENT || error == ENOTDIR || error == ELOOP;
+}
+
+bool IsJoined(std::string_view path, std::string_view folder, std::string_view name,
+              std::string_view end = {}) {
+  return path.size() == folder.size() + name.size() + end.size() && path.starts_with(folder) &&
+         path.substr(folder.size()).starts_with(name) && path.ends_with(end);
+}
+
+/// A second row for a path begins with a separator, see Renditions.
+bool IsTombstone(std::string_view path) {
+  return path.starts_with('/');
+}
+
+/// The first path after all that begin with `folder`, which ends in "/".
+std::string EndOfTree(std::string folder) {
+  folder.back() = '/' + 1;
+  return folder;
+}
+
+} // namespace
+
+FolderIndexer::FolderIndexer(const db::DB& catalog, const VolumeRoot& volume, NewPhotos newPhotos,
+                             std::time_t now, Hooks hooks)
+    : catalog_(catalog), volume_(volume), newPhotos_(newPhotos), now_(now),
+      hooks_(std::move(hooks)),
+      nextFolderId_(SelectNumber(catalog, "SELECT max(id) FROM Folders") + 1),
+      nextFileId_(SelectNumber(catalog, "SELECT max(id) FROM Files") + 1) {}
+
+std::time_t FolderIndexer::Stamp() {
+  if (stamp_ == 0) {
+    stamp_ = NextStamp(catalog_, now_);
+  }
+  return stamp_;
+}
+
+void FolderIndexer::Pulse(std::size_t count) const {
+  if (hooks_.pulse && count % NAMES_PER_PULSE == 0) {
+    hooks_.pulse();
+  }
+}
+
+std::vector<IndexedFolder> FolderIndexer::Update(const IndexedFolder& folder) {
+  Pulse(0);
+  util::FileDescriptor descriptor = volume_.Open(folder.path, O_RDONLY | O_DIRECTORY);
+  struct stat status = {};
+  if (!descriptor || fstat(descriptor.Get(), &status) != 0) {
+    // A folder may disappear meanwhile, with all that was in it; the volume must not.
+    if (IsGone(errno) && !folder.path.empty()) {
+      DeleteTree(folder.path);
+    } else {
+      LeaveAlone(folder.path, std::generic_category().message(errno));
+    }
+    return {};
+  }
+  if (hooks_.opened) {
+    hooks_.opened(folder, descriptor.Get());
+  }
+  if (!folder.path.empty() && status.st_mtime != folder.lastModifiedDate) {
+    Execute(catalog_, "UPDATE Folders SET lastModifiedDate = ?, lastUpdatedDate = ? WHERE id = ?",
+            status.st_mtime, Stamp(), folder.id);
+  }
+
+  const Listing listing = List(folder, descriptor.Release());
+  const FileChanges changes = CompareFiles(folder, listing);
+  std::size_t count = 0;
+  for (const FileChange& change : changes.written) {
+    UpdateFile(folder, change);
+    Pulse(++count);
+  }
+  for (const FileRow& file : changes.vanished) {
+    DeleteFile(file);
+    Pulse(++count);
+  }
+  return UpdateFolders(folder, listing);
+}
+
+std::optional<IndexedFolder> FolderIndexer::Find(const std::string& path) const {
+  if (path.empty()) {
+    return IndexedFolder();
+  }
+  db::Statement row(catalog_, "SELECT id, lastModifiedDate, isBackup, isHidden, isSystem "
+                              "FROM Folders WHERE path = ? AND isDeleted = 0");
+  row.BindTextView(1, path);
+  if (!row.Fetch()) {
+    return std::nullopt;
+  }
+  return IndexedFolder{
+      .id = row.GetInt64(0),
+      .path = path,
+      .flags = {.isBackup = row.GetBool(2), .isHidden = row.GetBool(3), .isSystem = row.GetBool(4)},
+      .lastModifiedDate = row.GetTime(1)};
+}
+
+// --- The folder --------------------------------------------------------------------------------
+
+/// Takes over `descriptor`.
+FolderIndexer::Listing FolderIndexer::List(const IndexedFolder& folder, int descriptor) {
+  Listing listing;
+  const Directory directory(fdopendir(descriptor));
+  if (!directory) {
+    const int error = errno;
+    close(descriptor);
+    throw util::Exception("cannot list a folder: " + std::generic_category().message(error));
+  }
+  std::size_t count = 0;
+  for (;;) {
+    errno = 0;
+    const dirent* const entry = readdir(directory.get());
+    if (entry == nullptr) {
+      break;
+    }
+    const std::string_view name = entry->d_name;
+    if (name != "." && name != ".." && !IsProductData(folder, name) &&
+        (entry->d_type == DT_REG || entry->d_type == DT_DIR || entry->d_type == DT_UNKNOWN)) {
+      Examine(folder, descriptor, entry->d_name, listing);
+    }
+    Pulse(++count);
+  }
+  if (errno != 0) {
+    listing.isWhole = false;
+    LeaveAlone(folder.path, std::generic_category().message(errno));
+  }
+  std::ranges::sort(listing.folders, {}, &Entry::name);
+  std::ranges::sort(listing.files, {}, &Entry::name);
+  return listing;
+}
+
+void FolderIndexer::Examine(const IndexedFolder& folder, int descriptor, const char* name,
+                            Listing& listing) {
+  struct stat found = {};
+  if (fstatat(descriptor, name, &found, AT_SYMLINK_NOFOLLOW) != 0) {
+    if (errno != ENOENT) {
+      LeaveAlone(folder.path + name, std::generic_category().message(errno));
+      listing.folders.push_back({.name = name, .isFolder = true, .isKnown = false});
+      listing.files.push_back({.name = name, .isKnown = false});
+    }
+  } else if (S_ISDIR(found.st_mode)) {
+    listing.folders.push_back({.name = name, .isFolder = true, .lastModifiedDate = found.st_mtime});
+  } else if (S_ISREG(found.st_mode)) {
+    listing.files.push_back({.name = name,
+                             .lastModifiedDate = found.st_mtime,
+                             .size = found.st_size,
+                             .statusChanged = found.st_ctim});
+  }
+}
+
+// --- Folders in it -----------------------------------------------------------------------------
+
+std::vector<FolderIndexer::FolderRow>
+FolderIndexer::ReadFolderRows(const IndexedFolder& folder) const {
+  std::vector<FolderRow> rows;
+  db::Statement row(catalog_, "SELECT id, path, name, lastModifiedDate, isBackup, isHidden, "
+                              "isSystem, isDeleted FROM Folders WHERE folderId = ?");
+  row.BindInt64(1, folder.id);
+  while (row.Fetch()) {
+    const std::string_view path = row.GetTextView(1);
+    const std::string_view name = row.GetTextView(2);
+    if (row.IsText(1) && row.IsText(2) && IsJoined(path, folder.path, name, "/")) {
+      rows.push_back({.name = std::string(name),
+                      .folder = {.id = row.GetInt64(0),
+                                 .path = std::string(path),
+                                 .flags = {.isBackup = row.GetBool(4),
+                                           .isHidden = row.GetBool(5),
+                                           .isSystem = row.GetBool(6)},
+                                 .lastModifiedDate = row.GetTime(3)},
+                      .isDeleted = row.GetBool(7)});
+    }
+    Pulse(rows.size());
+  }
+  std::ranges::sort(rows, {}, &FolderRow::name);
+  return rows;
+}
+
+std::vector<IndexedFolder> FolderIndexer::UpdateFolders(const IndexedFolder& folder,
+                                                        const Listing& listing) {
+  const std::vector<FolderRow> rows = ReadFolderRows(folder);
+  std::vector<IndexedFolder> folders;
+  folders.reserve(listing.folders.size());
+  auto row = rows.begin();
+  const auto deleteBefore = [&](const Entry* next) {
+    for (; row != rows.end() && (next == nullptr || row->name < next->name); ++row) {
+      if (!row->isDeleted && listing.isWhole) {
+        DeleteTree(row->folder.path);
+      }
+    }
+  };
+  for (const Entry& entry : listing.folders) {
+    deleteBefore(&entry);
+    const FolderRow* const known = row != rows.end() && row->name == entry.name ? &*row++ : nullptr;
+    if (entry.isKnown) {
+      folders.push_back(UpdateFolder(folder, entry, known));
+    }
+    Pulse(folders.size());
+  }
+  deleteBefore(nullptr);
+  return folders;
+}
+
+IndexedFolder FolderIndexer::UpdateFolder(const IndexedFolder& parent, const Entry& entry,
+                                          const FolderRow* known) {
+  ++summary_.folders;
+  const Flags flags = FlagsOf(entry.name, parent.flags);
+  if (known != nullptr && !known->isDeleted && known->folder.flags == flags &&
+      known->folder.lastModifiedDate == entry.lastModifiedDate) {
+    return known->folder;
+  }
+  db::Folder folder;
+  folder.id = known != nullptr ? known->folder.id : nextFolderId_++;
+  folder.folderId = parent.id;
+  folder.path = parent.path + entry.name + '/';
+  folder.name = entry.name;
+  folder.category = FOLDER;
+  folder.lastModifiedDate = entry.lastModifiedDate;
+  folder.isBackup = flags.isBackup;
+  folder.isHidden = flags.isHidden;
+  folder.isSystem = flags.isSystem;
+  folder.status = INDEXED;
+  folder.lastUpdatedDate = Stamp();
+  StoreFolder(catalog_, folder);
+  return {.id = folder.id,
+          .path = folder.path,
+          .flags = flags,
+          .lastModifiedDate = entry.lastModifiedDate,
+          .revived = known != nullptr && known->isDeleted};
+}
+
+// --- Files in it -------------------------------------------------------------------------------
+
+FolderIndexer::FileChanges FolderIndexer::CompareFiles(const IndexedFolder& folder,
+                                                       const Listing& listing) {
+  FileChanges changes;
+  auto entry = listing.files.begin();
+  const auto write = [&](const Entry& file, std::optional<FileRow> row) {
+    if (file.isKnown &&
+        (!hooks_.isComplete ||
+         hooks_.isComplete(folder, file.name,
+                           {.size = file.size, .statusChanged = file.statusChanged}))) {
+      changes.written.push_back({.entry = &file, .row = std::move(row)});
+    }
+  };
+  const auto addBefore = [&](const std::string_view* name) {
+    for (; entry != listing.files.end() && (name == nullptr || entry->name < *name); ++entry) {
+      write(*entry, std::nullopt);
+    }
+  };
+
+  db::Statement row(catalog_,
+                    "SELECT id, path, name, lastModifiedDate, size, isDeleted, status, category, "
+                    "isBackup, isHidden, isSystem FROM Files INDEXED BY Files_folder "
+                    "WHERE folderId = ? ORDER BY name");
+  row.BindInt64(1, folder.id);
+  std::vector<std::pair<std::string, long long>> tombstones; ///< of names in this folder
+  std::size_t count = 0;
+  while (row.Fetch()) {
+    Pulse(++count);
+    const std::string_view path = row.GetTextView(1);
+    const std::string_view name = row.GetTextView(2);
+    if (!row.IsText(1) || !row.IsText(2)) {
+      continue;
+    }
+    if (IsTombstone(path)) {
+      tombstones.emplace_back(name, row.GetInt64(0));
+      continue;
+    }
+    if (!IsJoined(path, folder.path, name)) {
+      continue;
+    }
+    addBefore(&name);
+    const bool isThere = entry != listing.files.end() && entry->name == name;
+    FileRow known{.id = row.GetInt64(0), .status = row.GetInt(6), .isDeleted = row.GetBool(5)};
+    if (!isThere) {
+      if (!known.isDeleted && listing.isWhole) {
+        known.name = name;
+        changes.vanished.push_back(std::move(known));
+      }
+      continue;
+    }
+    if (known.isDeleted || folder.revived || !IsUpToDate(row, folder, *entry)) {
+      write(*entry, std::move(known));
+    }
+    ++entry;
+  }
+  addBefore(nullptr);
+
+  for (const auto& [name, id] : tombstones) {
+    const auto change = std::ranges::lower_bound(
+        changes.written, name, {},
+        [](const FileChange& c) -> const auto& { return c.entry->name; });
+    if (change != changes.written.end() && change->entry->name == name && change->row) {
+      change->row->tombstone = id;
+    }
+  }
+  for (const Entry& file : listing.files) {
+    ++summary_.files;
+    if (CategoryOf(ExtensionOf(file.name)) == PHOTO) {
+      ++summary_.photos;
+    }
+  }
+  return changes;
+}
+
+bool FolderIndexer::IsUpToDate(const db::Statement& row, const IndexedFolder& folder,
+                               const Entry& entry) const {
+  const Flags flags = FlagsOf(entry.name, folder.flags);
+  return row.GetTime(3) == entry.lastModifiedDate && row.GetInt64(4) == entry.size &&
+         row.IsInteger(3) && row.IsInteger(4) &&
+         row.GetInt(7) == CategoryOf(ExtensionOf(entry.name)) && row.GetBool(8) == flags.isBackup &&
+         row.GetBool(9) == flags.isHidden && row.GetBool(10) == flags.isSystem;
+}
+
+void FolderIndexer::UpdateFile(const IndexedFolder& folder, const FileChange& change) {
+  const Entry& entry = *change.entry;
+  if (!change.row) {
+    ++summary_.added;
+  } else if (change.row->isDeleted) {
+    ++summary_.revived;
+  } else if (!folder.revived) {
+    // When a folder was deleted, its files left the photo database, too. When it comes back, they
+    // are written again although they have not changed.
+    ++summary_.changed;
+  }
+  const std::string extension = ExtensionOf(entry.name);
+  const Category category = CategoryOf(extension);
+  const Flags flags = FlagsOf(entry.name, folder.flags);
+  const bool isFinished = category == PHOTO && newPhotos_ == NewPhotos::Finished;
+  const long long id = change.row ? change.row->id : nextFileId_++;
+  StoreFile(catalog_, catalog::FileRow{.id = id,
+                                       .folderId = folder.id,
+                                       .folderPath = folder.path,
+                                       .name = entry.name,
+                                       .category = category,
+                                       .lastModifiedDate = entry.lastModifiedDate,
+                                       .flags = flags,
+                                       .status = isFinished ? RENDERED : INDEXED,
+                                       .lastUpdatedDate = Stamp(),
+                                       .extension = extension,
+                                       .size = entry.size});
+  if (change.row && change.row->status == UNRENDERABLE) {
+    Execute(catalog_, "DELETE FROM Failures WHERE fileId = ?", id);
+  }
+  if (isFinished) {
+    StoreTranscoding(catalog_, id, FINISHED, Stamp());
+    if (change.row && change.row->tombstone != 0) {
+      Execute(catalog_, "DELETE FROM Transcodings WHERE sourceId = ?", change.row->tombstone);
+      Execute(catalog_, "DELETE FROM Files WHERE id = ?", change.row->tombstone);
+    }
+  }
+}
+
+// --- What is gone ------------------------------------------------------------------------------
+
+void FolderIndexer::DeleteFile(const FileRow& file) {
+  Execute(catalog_, "UPDATE Files SET isDeleted = 1, status = ?, lastUpdatedDate = ? WHERE id = ?",
+          static_cast<int>(INDEXED), Stamp(), file.id);
+  Execute(catalog_, "UPDATE Transcodings SET status = ?, lastUpdatedDate = ? WHERE sourceId = ?",
+          static_cast<int>(WITHDRAWN), Stamp(), file.id);
+  if (CategoryOf(ExtensionOf(file.name)) == PHOTO) {
+    Execute(catalog_, "INSERT OR IGNORE INTO Removals(fileId) VALUES(?)", file.id);
+  }
+  if (file.status == UNRENDERABLE) {
+    Execute(catalog_, "DELETE FROM Failures WHERE fileId = ?", file.id);
+  }
+  ++summary_.deleted;
+}
+
+/// Marks a folder and all that is below it deleted.
+void FolderIndexer::DeleteTree(const std::string& path) {
+  const std::string end = EndOfTree(path);
+  summary_.deleted += SelectNumber(
+      catalog_, "SELECT count(*) FROM Files WHERE path >= ? AND path < ? AND isDeleted = 0", path,
+      end);
+  Execute(catalog_,
+          "UPDATE Transcodings SET status = ?, lastUpdatedDate = ? WHERE sourceId IN "
+          "(SELECT id FROM Files WHERE path >= ? AND path < ? AND isDeleted = 0)",
+          static_cast<int>(WITHDRAWN), Stamp(), path, end);
+  Execute(catalog_,
+          "INSERT OR IGNORE INTO Removals(fileId) SELECT id FROM Files "
+          "WHERE path >= ? AND path < ? AND isDeleted = 0 AND category = 3",
+          path, end);
+  Execute(catalog_,
+          "DELETE FROM Failures WHERE fileId IN "
+          "(SELECT id FROM Files WHERE path >= ? AND path < ? AND isDeleted = 0 AND status = 2)",
+          path, end);
+  Execute(catalog_,
+          "UPDATE Files SET isDeleted = 1, status = ?, lastUpdatedDate = ? "
+          "WHERE path >= ? AND path < ? AND isDeleted = 0",
+          static_cast<int>(INDEXED), Stamp(), path, end);
+  Execute(catalog_,
+          "UPDATE Folders SET isDeleted = 1, lastUpdatedDate = ? "
+          "WHERE path >= ? AND path < ? AND isDeleted = 0",
+          Stamp(), path, end);
+}
+
+long long FolderIndexer::DeleteUnreachableRows(long long folders, long long files) {
+  constexpr char COUNT_FILES[] = "SELECT count(*) FROM Files WHERE isDeleted = 0";
+  if (SelectNumber(catalog_, "SELECT count(*) FROM Folders WHERE isDeleted = 0") != folders) {
+    DeleteUnreachableFolders();
+  }
+  const long long rows = SelectNumber(catalog_, COUNT_FILES);
+  if (rows == files) {
+    return rows;
+  }
+  DeleteUnreachableFiles();
+  CheckIndexes(catalog_);
+  return SelectNumber(catalog_, COUNT_FILES);
+}
+
+// A folder is reachable exactly if its path is that of its folder and its name, and this holds for
+// the folder, too. A path is longer than that of its folder, so there is no cycle.
+void FolderIndexer::DeleteUnreachableFolders() {
+  // Below a folder that is marked deleted here, others may have become unreachable.
+  for (bool found = true; found;) {
+    found = false;
+    std::vector<std::pair<long long, std::string>> rows;
+    ForEachRow(catalog_,
+               "SELECT f.id, f.path FROM Folders f "
+               "LEFT JOIN Folders p ON p.id = f.folderId AND p.isDeleted = 0 "
+               "WHERE f.isDeleted = 0 AND (typeof(f.path) <> 'text' OR typeof(f.name) <> 'text' "
+               "OR CASE WHEN f.folderId = -1 THEN f.path <> f.name || '/' "
+               "ELSE p.id IS NULL OR f.path <> p.path || f.name || '/' END)",
+               [&](const db::Statement& row) {
+                 Pulse(0);
+                 if (!IsLeftAlone(row.GetText(1))) {
+                   rows.emplace_back(row.GetInt64(0), row.GetText(1));
+                 }
+               });
+    for (const auto& [id, path] : rows) {
+      Pulse(0);
+      Execute(catalog_, "UPDATE Folders SET isDeleted = 1, lastUpdatedDate = ? WHERE id = ?",
+              Stamp(), id);
+      found = true;
+    }
+  }
+}
+
+void FolderIndexer::DeleteUnreachableFiles() {
+  std::vector<FileRow> files;
+  ForEachRow(catalog_,
+             "SELECT f.id, f.path, f.name, f.status FROM Files f "
+             "LEFT JOIN Folders p ON p.id = f.folderId AND p.isDeleted = 0 "
+             "WHERE f.isDeleted = 0 AND (typeof(f.path) <> 'text' OR typeof(f.name) <> 'text' "
+             "OR CASE WHEN f.folderId = -1 THEN f.path <> f.name "
+             "ELSE p.id IS NULL OR f.path <> p.path || f.name END)",
+             [&](const db::Statement& row) {
+               Pulse(0);
+               if (!IsLeftAlone(row.GetText(1))) {
+                 files.push_back(
+                     {.id = row.GetInt64(0), .name = row.GetText(2), .status = row.GetInt(3)});
+               }
+             });
+  for (const FileRow& file : files) {
+    Pulse(0);
+    DeleteFile(file);
+  }
+}
+
+void FolderIndexer::LeaveAlone(const std::string& path, const std::string& reason) {
+  const std::string message = util::MakePath(volume_.Path(), path) + ": " + reason;
+  if (path.empty()) {
+    throw util::Exception(message);
+  }
+  summary_.unreadable.push_back(message);
+  leftAlone_.push_back(path.ends_with('/') ? path.substr(0, path.size() - 1) : path);
+}
+
+bool FolderIndexer::IsLeftAlone(const std::string& path) const {
+  return std::ranges::any_of(leftAlone_, [&path](const std::string& prefix) {
+    return path.starts_with(prefix) && (path.size() == prefix.size() || path[prefix.size()] == '/');
+  });
+}
+
+} // namespace orva::catalog

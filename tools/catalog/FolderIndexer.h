@@ -1,0 +1,173 @@
+#pragma once
+
+#include "Classification.h"
+
+#include <ctime>
+#include <functional>
+#include <optional>
+#include <string>
+#include <utility>
+#include <vector>
+
+namespace orva::db {
+class DB;
+class Statement;
+} // namespace orva::db
+
+namespace orva::catalog {
+
+class VolumeRoot;
+
+/// What was found and changed.
+struct IndexSummary {
+  long long folders = 0; ///< on the volume
+  long long files = 0;   ///< on the volume
+  long long photos = 0;  ///< of the files
+
+  // Numbers of files that were changed in the catalog.
+  long long added = 0;
+  long long changed = 0;
+  long long deleted = 0;
+  long long revived = 0;
+
+  /// A message for each folder or file that could not be read. Its rows and those of what is below
+  /// it are unchanged, because it may still exist.
+  std::vector<std::string> unreadable;
+};
+
+/// The state of new and changed photos.
+enum class NewPhotos {
+  Finished, ///< listed by merged databases at once
+  Waiting   ///< for the transcoder
+};
+
+/// A folder that has a row, or the root of the volume, which has none and an empty path.
+struct IndexedFolder {
+  long long id = -1;
+  std::string path{}; ///< relative to the volume, ending in "/"
+  Flags flags{};
+  std::time_t lastModifiedDate = 0;
+  bool revived = false; ///< its row was marked deleted until now
+};
+
+/// Brings the rows of single folders up to date with the volume. Lists a folder and reads its rows;
+/// memory grows with the largest folder only. An object belongs to one transaction of its caller,
+/// on the catalog's thread. Links are not followed; file systems mounted below the volume are.
+/// Failures of the database are thrown as std::string, others as util::Exception.
+class FolderIndexer {
+public:
+  /// What tells whether a file is still changing.
+  struct FileState {
+    long long size = 0;
+    timespec statusChanged{}; ///< its ctime
+
+    bool operator==(const FileState& other) const noexcept {
+      return size == other.size && statusChanged.tv_sec == other.statusChanged.tv_sec &&
+             statusChanged.tv_nsec == other.statusChanged.tv_nsec;
+    }
+  };
+
+  /// What the caller does meanwhile. Each may be empty.
+  struct Hooks {
+    /// Called with the descriptor of the folder before it is listed.
+    std::function<void(const IndexedFolder&, int)> opened{};
+    /// Whether a new or changed file of the folder may be entered. Otherwise its row stays as it
+    /// is.
+    std::function<bool(const IndexedFolder&, const std::string&, const FileState&)> isComplete{};
+    /// Called often. What it throws ends the update.
+    std::function<void()> pulse{};
+  };
+
+  /// `catalog` is open for writing, has its schema and describes `volume`; both outlive the object.
+  /// `now` is the time of the changes.
+  FolderIndexer(const db::DB& catalog, const VolumeRoot& volume, NewPhotos newPhotos,
+                std::time_t now, Hooks hooks);
+
+  /// Updates the rows of what is directly in `folder`, and marks all rows below a folder that is
+  /// gone. Returns the folders in it, each with its row.
+  std::vector<IndexedFolder> Update(const IndexedFolder& folder);
+
+  /// The folder with this path, if its row is not marked deleted.
+  std::optional<IndexedFolder> Find(const std::string& path) const;
+
+  /// Marks rows deleted that no folder leads to. Only a damaged or crafted catalog has such rows,
+  /// so they are looked for only if there are more rows than the `folders` and `files` that a walk
+  /// of the whole volume has found. Returns the number of files that are not marked deleted. Throws
+  /// CatalogError for a damaged catalog.
+  long long DeleteUnreachableRows(long long folders, long long files);
+
+  const IndexSummary& Summary() const noexcept { return summary_; }
+
+  /// Whether a row was changed.
+  bool HasChanged() const noexcept { return stamp_ != 0; }
+
+private:
+  /// A file or folder found in a folder.
+  struct Entry {
+    std::string name;
+    bool isFolder = false;
+    bool isKnown = true; ///< false: its row must stay as it is
+    std::time_t lastModifiedDate = 0;
+    long long size = 0;
+    timespec statusChanged{};
+  };
+  /// What the catalog says about one of them.
+  struct FolderRow {
+    std::string name;
+    IndexedFolder folder;
+    bool isDeleted = false;
+  };
+  struct FileRow {
+    long long id = 0;
+    std::string name{}; ///< only for a file that is not in the folder any more
+    int status = 0;
+    bool isDeleted = false;
+    long long tombstone = 0; ///< the id of a second row for the path; 0 if there is none
+  };
+  struct Listing {
+    std::vector<Entry> folders; ///< by name
+    std::vector<Entry> files;   ///< by name
+    bool isWhole = true;
+  };
+  /// A file whose row must be written.
+  struct FileChange {
+    const Entry* entry = nullptr;
+    std::optional<FileRow> row;
+  };
+  /// The differences between a folder and its rows.
+  struct FileChanges {
+    std::vector<FileChange> written;
+    std::vector<FileRow> vanished;
+  };
+
+  std::time_t Stamp();
+  void Pulse(std::size_t count) const;
+  Listing List(const IndexedFolder& folder, int descriptor);
+  void Examine(const IndexedFolder& folder, int descriptor, const char* name, Listing& listing);
+  std::vector<FolderRow> ReadFolderRows(const IndexedFolder& folder) const;
+  std::vector<IndexedFolder> UpdateFolders(const IndexedFolder& folder, const Listing& listing);
+  IndexedFolder UpdateFolder(const IndexedFolder& parent, const Entry& entry,
+                             const FolderRow* known);
+  FileChanges CompareFiles(const IndexedFolder& folder, const Listing& listing);
+  bool IsUpToDate(const db::Statement& row, const IndexedFolder& folder, const Entry& entry) const;
+  void UpdateFile(const IndexedFolder& folder, const FileChange& change);
+  void DeleteFile(const FileRow& file);
+  void DeleteTree(const std::string& path);
+  void DeleteUnreachableFolders();
+  void DeleteUnreachableFiles();
+  void LeaveAlone(const std::string& path, const std::string& reason);
+  bool IsLeftAlone(const std::string& path) const;
+
+  const db::DB& catalog_;
+  const VolumeRoot& volume_;
+  const NewPhotos newPhotos_;
+  const std::time_t now_;
+  const Hooks hooks_;
+  std::time_t stamp_ = 0; ///< 0 until the first change
+  long long nextFolderId_ = 1;
+  long long nextFileId_ = 1;
+  std::vector<std::string> leftAlone_; ///< paths, without a trailing separator
+  IndexSummary summary_;
+};
+
+} // namespace orva::catalog

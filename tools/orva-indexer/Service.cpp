@@ -1,0 +1,428 @@
+#include "Service.h"
+
+#include "Log.h"
+#include "StatusFile.h"
+
+#include "orvautil/Exception.h"
+#include "orvautil/Path.h"
+
+#include <fcntl.h>
+#include <poll.h>
+#include <sys/signalfd.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <charconv>
+#include <csignal>
+#include <ctime>
+#include <filesystem>
+#include <fstream>
+#include <set>
+#include <sstream>
+#include <system_error>
+#include <utility>
+
+namespace orva::indexer {
+namespace {
+
+using namespace std::chrono_literals;
+using catalog::VolumeRoot;
+using notify::Event;
+using Notice = notifications::Notification::Event;
+
+constexpr auto INPUT_INTERVAL = 100ms;
+constexpr auto STATUS_INTERVAL = 1s;
+constexpr auto ANNOUNCE_RETRY = 30s;
+
+/// A master at /shares itself is no volume.
+constexpr char SHARES[] = "/shares";
+constexpr char NO_VOLUME[] = "-";
+
+util::FileDescriptor Checked(int descriptor, const char* what) {
+  if (descriptor == -1) {
+    throw util::Exception(std::string("cannot open ") + what + ": " +
+                          std::generic_category().message(errno));
+  }
+  return util::FileDescriptor(descriptor);
+}
+
+util::FileDescriptor CatchStopSignals() {
+  sigset_t signals;
+  sigemptyset(&signals);
+  sigaddset(&signals, SIGINT);
+  sigaddset(&signals, SIGTERM);
+  sigprocmask(SIG_BLOCK, &signals, nullptr);
+  return Checked(signalfd(-1, &signals, SFD_NONBLOCK | SFD_CLOEXEC), "signals");
+}
+
+constexpr char MOUNT_INFO[] = "/proc/self/mountinfo";
+
+util::FileDescriptor OpenMountInfo() {
+  return Checked(open(MOUNT_INFO, O_RDONLY | O_CLOEXEC), MOUNT_INFO);
+}
+
+/// The kernel writes some bytes as a backslash and three octal digits.
+std::string DecodeOctal(const std::string& text) {
+  std::string decoded;
+  for (std::size_t i = 0; i < text.size(); ++i) {
+    int byte = 0;
+    if (text[i] == '\\' && i + 3 < text.size() &&
+        std::from_chars(&text[i + 1], &text[i + 4], byte, 8).ptr == &text[i + 4]) {
+      decoded += static_cast<char>(byte);
+      i += 3;
+    } else {
+      decoded += text[i];
+    }
+  }
+  return decoded;
+}
+
+std::set<std::string> ReadMountPoints() {
+  std::set<std::string> mountPoints;
+  std::ifstream table(MOUNT_INFO);
+  for (std::string line; std::getline(table, line);) {
+    std::istringstream fields(line);
+    std::string field;
+    for (int number = 0; number < 5 && std::getline(fields, field, ' '); ++number) {
+    }
+    mountPoints.insert(DecodeOctal(field));
+  }
+  return mountPoints;
+}
+
+} // namespace
+
+Service::Service(Settings settings)
+    : settings_(std::move(settings)), signals_(CatchStopSignals()), mountInfo_(OpenMountInfo()),
+      remembered_(settings_.stateDirectory), observer_(settings_.notificationSocket),
+      announcer_(settings_.notificationSocket,
+                 [this](const Announcer::Announcement& announcement,
+                        std::optional<std::size_t> clients) { Announced(announcement, clients); }) {
+  std::error_code ignored;
+  std::filesystem::create_directories(settings_.runtimeDirectory, ignored);
+}
+
+void Service::Run() {
+  while (!isStopped_) {
+    ReadInput();
+    HandleNotifications();
+    announcer_.Proceed();
+    WorkOnNext();
+    announcer_.Proceed();
+    PublishStatus();
+    if (!isStopped_) {
+      Wait();
+    }
+  }
+}
+
+// --- Input -------------------------------------------------------------------------------------
+
+void Service::Wait() {
+  const auto now = Clock::now();
+  std::vector<pollfd> descriptors;
+  const auto add = [&descriptors](int descriptor, short events) {
+    descriptors.push_back({.fd = descriptor, .events = events, .revents = 0});
+  };
+  add(mountInfo_.Get(), POLLPRI);
+  add(signals_.Get(), POLLIN);
+  add(observer_.Descriptor(), POLLIN);
+  add(announcer_.Descriptor(), announcer_.Events());
+  add(locator_.Descriptor(), POLLIN);
+  auto next = announceAgain_;
+  for (const auto& [mountPoint, known] : volumes_) {
+    next = std::min(next, known->volume.NextWork());
+    add(known->volume.Descriptor(now), POLLIN);
+    if (descriptors.back().fd == -1) {
+      next = std::min(next, known->volume.NextEvents());
+    }
+  }
+  if (isStatusDue_) {
+    next = std::min(next, statusWritten_ + STATUS_INTERVAL);
+  }
+  int timeout = -1;
+  if (next != Clock::time_point::max()) {
+    const auto left = std::chrono::ceil<std::chrono::milliseconds>(next - now);
+    timeout = next <= now ? 0 : static_cast<int>(std::min<long long>(left.count(), 1'000'000'000));
+  }
+  if (poll(descriptors.data(), descriptors.size(), timeout) == -1 && errno != EINTR) {
+    throw util::Exception("cannot wait for events: " + std::generic_category().message(errno));
+  }
+  if ((descriptors.front().revents & POLLPRI) != 0) {
+    const std::set<std::string> mountPoints = ReadMountPoints();
+    for (const auto& [mountPoint, known] : volumes_) {
+      known->volume.HandleMounts(mountPoints);
+    }
+  }
+}
+
+/// Reads what has arrived, without acting on it.
+void Service::ReadInput() {
+  const auto now = Clock::now();
+  inputRead_ = now;
+  signalfd_siginfo signal{};
+  isStopped_ = isStopped_ || read(signals_.Get(), &signal, sizeof signal) > 0;
+  for (notifications::Notification& notification : observer_.Receive()) {
+    received_.push_back(std::move(notification));
+  }
+  for (const auto& [mountPoint, known] : volumes_) {
+    if (known->volume.Descriptor(now) != -1) {
+      known->volume.ReadEvents();
+    }
+  }
+}
+
+/// Called often while a volume is worked on.
+void Service::Pulse() {
+  if (Clock::now() - inputRead_ < INPUT_INTERVAL) {
+    return;
+  }
+  ReadInput();
+  PublishStatus();
+  const bool isUnplugged = std::ranges::any_of(received_, [this](const auto& notification) {
+    return notification.event == Notice::Unplugged &&
+           notification.mountPoint == working_->volume.MountPoint();
+  });
+  if (isStopped_ || isUnplugged) {
+    throw Volume::Interrupted();
+  }
+}
+
+void Service::HandleNotifications() {
+  for (const notifications::Notification& notification : std::exchange(received_, {})) {
+    Handle(notification);
+  }
+  if (locator_.HasChanged()) {
+    for (const auto& [mountPoint, known] : volumes_) {
+      const auto master = Master();
+      if (known->isScanned && master && IsPurgeOwed(*known, *master)) {
+        PurgeOrEnd(*known);
+      }
+    }
+  }
+  if (Clock::now() >= announceAgain_) {
+    AnnounceAgain();
+  }
+}
+
+void Service::Handle(const notifications::Notification& notification) {
+  switch (notification.event) {
+  case Notice::Connected:
+    AnnounceAgain();
+    break;
+  case Notice::Plugged:
+    Plug(notification.mountPoint, notification.isDirectory);
+    break;
+  case Notice::Unplugged:
+    Forget(notification.mountPoint);
+    break;
+  default:
+    // Announced by us, or by the transcoder, which has then given out stamps.
+    const auto found = volumes_.find(notification.mountPoint);
+    if (found != volumes_.end()) {
+      Known& known = *found->second;
+      if (known.echoes > 0) {
+        --known.echoes;
+      } else if (!known.volume.Identity().empty()) {
+        known.volume.ReadStamp();
+      }
+    }
+  }
+}
+
+void Service::Plug(const std::string& mountPoint, bool isDirectory) {
+  const auto kind = isDirectory ? VolumeRoot::Kind::Directory : VolumeRoot::Kind::Mount;
+  const auto found = volumes_.find(mountPoint);
+  if (found != volumes_.end()) {
+    if (found->second->volume.Kind() == kind && found->second->volume.IsInPlace()) {
+      return;
+    }
+    Forget(mountPoint);
+  }
+  LogInfo("Volume " + Printable(mountPoint) + ": walking");
+  const auto known = volumes_.emplace(mountPoint, std::make_unique<Known>(mountPoint, kind)).first;
+  known->second->volume.HandleMounts(ReadMountPoints());
+  isStatusDue_ = true;
+}
+
+void Service::Forget(const std::string& mountPoint) {
+  if (volumes_.erase(mountPoint) > 0) {
+    LogInfo("Volume " + Printable(mountPoint) + ": gone");
+    announcer_.Forget(util::Path(mountPoint).Basic());
+    isStatusDue_ = true;
+  }
+}
+
+// --- Work --------------------------------------------------------------------------------------
+
+/// Does one piece of work, on each volume in turn.
+void Service::WorkOnNext() {
+  const auto now = Clock::now();
+  const auto isDue = [now](const auto& entry) { return entry.second->volume.NextWork() <= now; };
+  const auto after = volumes_.upper_bound(lastWorked_);
+  auto next = std::find_if(after, volumes_.end(), isDue);
+  if (next == volumes_.end()) {
+    next = std::find_if(volumes_.begin(), after, isDue);
+    if (next == after) {
+      return;
+    }
+  }
+  lastWorked_ = next->first;
+  Known& known = *next->second;
+  working_ = &known;
+  const Volume::Result result = known.volume.Work([this] { Pulse(); }, LatestStamp());
+  working_ = nullptr;
+  isStatusDue_ = true;
+  if (result.isGone) {
+    Forget(lastWorked_);
+  } else {
+    AnnounceResult(known, result);
+  }
+}
+
+std::time_t Service::LatestStamp() const {
+  // Without a battery the clock may be years late after a start.
+  return std::max(std::time(nullptr), remembered_.NewestStamp());
+}
+
+// --- Announcements -----------------------------------------------------------------------------
+
+void Service::AnnounceResult(Known& known, const Volume::Result& result) {
+  known.hasChanged = known.hasChanged || result.hasChanged;
+  if (known.volume.Identity().empty()) {
+    return; // Scanned comes first
+  }
+  if (result.isFirstWalk) {
+    known.hasChanged = false;
+    AnnounceScanned(known);
+  } else if (known.hasChanged && known.isScanned) {
+    known.hasChanged = false;
+    Announce(known, known.volume.IsIdle() ? Event::End : Event::TranscodedBatch);
+  } else if (const auto master = Master(); master && known.isScanned) {
+    if (!IsPurgeOwed(known, *master)) {
+      Remember(known, *master); // stamps of the transcoder
+    }
+  }
+}
+
+/// The notification service was started again, or was not there.
+void Service::AnnounceAgain() {
+  announceAgain_ = Clock::time_point::max();
+  for (const auto& [mountPoint, known] : volumes_) {
+    known->echoes = 0;
+    if (!known->volume.Identity().empty()) {
+      AnnounceScanned(*known);
+    }
+  }
+}
+
+/// The daemon may elect a master then. So the answer is waited for before the master is looked up.
+void Service::AnnounceScanned(Known& known) {
+  Announce(known, Event::Scanned, true);
+}
+
+void Service::Announce(Known& known, Event event, bool handled) {
+  announcer_.Announce({.event = event, .mountPoint = known.volume.Path(), .handled = handled});
+}
+
+/// One announcement is done; the next ones about the volume follow.
+void Service::Announced(const Announcer::Announcement& announcement,
+                        std::optional<std::size_t> clients) {
+  if (!clients) {
+    announceAgain_ = std::min(announceAgain_, Clock::now() + ANNOUNCE_RETRY);
+    return;
+  }
+  const auto found = volumes_.find(announcement.mountPoint + '/');
+  if (found == volumes_.end()) {
+    return;
+  }
+  Known& known = *found->second;
+  ++known.echoes;
+  const auto master = Master();
+  switch (announcement.event) {
+  case Event::Scanned:
+    known.isScanned = true;
+    if (*clients > 0) {
+      PurgeOrEnd(known);
+    } else {
+      Announce(known, Event::End); // no daemon: it writes the locator file when it starts
+    }
+    break;
+  case Event::Purged:
+    if (*clients > 0 && master == known.purgedFor) {
+      Remember(known, *master);
+      Announce(known, Event::End);
+    } else if (*clients > 0) {
+      PurgeOrEnd(known); // another volume has become the master
+    }
+    break;
+  default:
+    if (*clients > 0 && master && !IsPurgeOwed(known, *master)) {
+      Remember(known, *master);
+    }
+  }
+}
+
+void Service::PurgeOrEnd(Known& known) {
+  const auto master = Master();
+  if (master && IsPurgeOwed(known, *master)) {
+    known.purgedFor = *master;
+    Announce(known, Event::Purged, true);
+  } else {
+    Announce(known, Event::End);
+  }
+}
+
+/// Whether merged rows of the volume may come from another catalog.
+bool Service::IsPurgeOwed(const Known& known, const std::string& master) const {
+  const auto remembered = remembered_.Find(master, known.volume.MountPoint());
+  return !remembered || remembered->identity != known.volume.Identity() ||
+         remembered->newestStamp > known.volume.NewestStamp();
+}
+
+void Service::Remember(const Known& known, const std::string& master) {
+  const RememberedCatalogs::Catalog now{.identity = known.volume.Identity(),
+                                        .newestStamp = known.volume.NewestStamp()};
+  const auto before = remembered_.Find(master, known.volume.MountPoint());
+  if (!before || before->identity != now.identity || before->newestStamp != now.newestStamp) {
+    remembered_.Store(master, known.volume.MountPoint(), now);
+  }
+}
+
+/// The identity of the catalog on the master volume; nothing while that is not known.
+std::optional<std::string> Service::Master() const {
+  const auto path = Locator::Master();
+  if (!path) {
+    return std::nullopt;
+  }
+  if (*path == SHARES) {
+    return NO_VOLUME;
+  }
+  const auto found = volumes_.find(*path + '/');
+  return found == volumes_.end() || found->second->volume.Identity().empty()
+             ? std::nullopt
+             : std::optional(found->second->volume.Identity());
+}
+
+// --- Status ------------------------------------------------------------------------------------
+
+void Service::PublishStatus() {
+  const auto now = Clock::now();
+  const bool isIdle = working_ == nullptr && std::ranges::all_of(volumes_, [](const auto& entry) {
+                        return entry.second->volume.IsIdle();
+                      });
+  if (!(isStatusDue_ || working_ != nullptr) ||
+      (now - statusWritten_ < STATUS_INTERVAL && !isIdle)) {
+    return;
+  }
+  std::vector<VolumeStatus> status;
+  for (const auto& [mountPoint, known] : volumes_) {
+    status.push_back(known->volume.Status());
+  }
+  WriteStatus(settings_.runtimeDirectory, status);
+  statusWritten_ = now;
+  isStatusDue_ = false;
+}
+
+} // namespace orva::indexer

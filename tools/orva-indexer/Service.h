@@ -1,0 +1,88 @@
+#pragma once
+
+#include "Announcer.h"
+#include "Locator.h"
+#include "RememberedCatalogs.h"
+#include "Volume.h"
+
+#include "notifications/Observer.h"
+#include "orvautil/FileDescriptor.h"
+
+#include <chrono>
+#include <map>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+namespace orva::indexer {
+
+/// The indexer: hears of volumes from the notification service, keeps their catalogs up to date and
+/// announces what has changed. One thread, one loop.
+class Service {
+public:
+  struct Settings {
+    std::string notificationSocket; ///< address
+    std::string stateDirectory;     ///< what must outlive the process
+    std::string runtimeDirectory;   ///< for the status file
+  };
+
+  /// From now on, SIGINT and SIGTERM stop the service. Throws util::Exception and std::string.
+  explicit Service(Settings settings);
+
+  /// Works until SIGINT or SIGTERM.
+  void Run();
+
+private:
+  /// A volume with what is to be announced about it.
+  struct Known {
+    explicit Known(std::string mountPoint, catalog::VolumeRoot::Kind kind)
+        : volume(std::move(mountPoint), kind) {}
+
+    Volume volume;
+    bool isScanned = false;  ///< it was
+    bool hasChanged = false; ///< since the last announcement
+    std::string purgedFor{}; ///< master for which Purged is being announced
+    int echoes = 0;          ///< announcements of ours that come back
+  };
+
+  void Wait();
+  void ReadInput();
+  void Pulse();
+  void HandleNotifications();
+  void Handle(const notifications::Notification& notification);
+  void Plug(const std::string& mountPoint, bool isDirectory);
+  void Forget(const std::string& mountPoint);
+  void AnnounceAgain();
+  void WorkOnNext();
+  void AnnounceResult(Known& known, const Volume::Result& result);
+  void AnnounceScanned(Known& known);
+  void Announce(Known& known, notify::Event event, bool handled = false);
+  void Announced(const Announcer::Announcement& announcement, std::optional<std::size_t> clients);
+  void PurgeOrEnd(Known& known);
+  bool IsPurgeOwed(const Known& known, const std::string& master) const;
+  void Remember(const Known& known, const std::string& master);
+  std::optional<std::string> Master() const;
+  std::time_t LatestStamp() const;
+  void PublishStatus();
+
+  const Settings settings_;
+  util::FileDescriptor signals_;
+  util::FileDescriptor mountInfo_; ///< polled for changes
+  RememberedCatalogs remembered_;
+  notifications::Observer observer_;
+  Announcer announcer_;
+  Locator locator_;
+  std::map<std::string, std::unique_ptr<Known>> volumes_; ///< by mount point, ending in "/"
+  std::vector<notifications::Notification> received_;
+  std::string lastWorked_; ///< mount point
+  const Known* working_ = nullptr;
+  bool isStopped_ = false;
+  Clock::time_point inputRead_{};
+  Clock::time_point announceAgain_ = Clock::time_point::max();
+  Clock::time_point statusWritten_{};
+  std::string status_; ///< what was published last
+  bool isStatusDue_ = true;
+};
+
+} // namespace orva::indexer

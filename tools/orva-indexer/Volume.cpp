@@ -1,0 +1,538 @@
+#include "Volume.h"
+
+#include "Log.h"
+
+#include "CatalogSchema.h"
+#include "Sql.h"
+
+#include "orvadb/Transaction.h"
+#include "orvadb/VolumeDB.h"
+
+#include "orvautil/Core.h"
+#include "orvautil/Exception.h"
+#include "orvautil/FormatString.h"
+#include "orvautil/Path.h"
+
+#include <sys/inotify.h>
+#include <sys/stat.h>
+#include <sys/statfs.h>
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <iterator>
+#include <ranges>
+#include <system_error>
+#include <utility>
+
+namespace orva::indexer {
+namespace {
+
+using namespace std::chrono_literals;
+using catalog::CatalogProblem;
+using catalog::FolderIndexer;
+using catalog::VolumeRoot;
+using util::FormatString;
+
+/// A folder is walked when it was quiet for QUIET, or LATEST after its first event.
+constexpr auto QUIET = 1s;
+constexpr auto LATEST = 8s;
+
+/// Events are not read more often, so that a large copy does not wake the program for each write.
+constexpr auto EVENT_INTERVAL = 100ms;
+
+/// How long a piece of work may take before its commit.
+constexpr auto MOST_WORK = 2s;
+
+/// A file that was created but neither written nor closed may be a link, for which there is no
+/// other event. One that was written and not closed may have been truncated by its name.
+constexpr auto LONGEST_EMPTY = 8s;
+constexpr auto LONGEST_OPEN = 600s;
+
+constexpr auto RETRY = 60s;
+constexpr auto SHORT_RETRY = 1s;
+
+/// A walk on a timer takes at most a twentieth of the time.
+constexpr auto SHORTEST_PAUSE = 60s;
+constexpr int PAUSE_FACTOR = 20;
+
+/// Bounds the memory for files that are being written.
+constexpr std::size_t MOST_FILES = 10'000;
+
+// statfs(2), linux/magic.h and the kernel's sources. They do not report changes that are made
+// elsewhere.
+constexpr std::array<std::uint32_t, 13> REMOTE_FILE_SYSTEMS = {
+    0x6969,     // NFS
+    0xFF534D42, // CIFS
+    0xFE534D42, // SMB 2
+    0x517B,     // SMB
+    0x01021997, // 9P
+    0x65735546, // FUSE
+    0x65735543, // FUSE control
+    0x00C36400, // Ceph
+    0x5346414F, // AFS
+    0x6B414653, // kAFS
+    0x73757245, // Coda
+    0x01161970, // GFS2
+    0x786F4256, // folders shared with a virtual machine
+};
+
+bool HasNoEvents(const VolumeRoot& root) {
+  struct statfs status = {};
+  return fstatfs(root.Descriptor(), &status) == 0 &&
+         std::ranges::find(REMOTE_FILE_SYSTEMS, static_cast<std::uint32_t>(status.f_type)) !=
+             REMOTE_FILE_SYSTEMS.end();
+}
+
+/// The path of the folder that contains the folder at `path`, which is not the root.
+std::string FolderOf(const std::string& path) {
+  const std::size_t end = path.rfind('/', path.size() - 2);
+  return end == std::string::npos ? std::string() : path.substr(0, end + 1);
+}
+
+bool IsProductFolder(const FolderWatches::Event& event) {
+  static const std::string home = core::GetORVA_HOME("");
+  return event.folder.empty() && (event.name == home || event.name == ".zophotos");
+}
+
+} // namespace
+
+const std::string Volume::NO_IDENTITY;
+
+Volume::Volume(std::string mountPoint, VolumeRoot::Kind kind)
+    : mountPoint_(std::move(mountPoint)), path_(util::Path(mountPoint_).Basic()), kind_(kind),
+      name_("Volume " + Printable(mountPoint_)) {
+  StartAgain();
+}
+
+bool Volume::IsInPlace() const {
+  struct stat status = {};
+  return lstat(path_.c_str(), &status) == 0 &&
+         (inode_ == 0 || (status.st_dev == device_ && status.st_ino == inode_));
+}
+
+// --- Events ------------------------------------------------------------------------------------
+
+int Volume::Descriptor(Clock::time_point now) const {
+  return watches_ && now - eventsRead_ >= EVENT_INTERVAL ? watches_->Descriptor() : -1;
+}
+
+Clock::time_point Volume::NextEvents() const {
+  return watches_ ? eventsRead_ + EVENT_INTERVAL : Clock::time_point::max();
+}
+
+void Volume::ReadEvents() {
+  if (!watches_) {
+    return;
+  }
+  eventsRead_ = Clock::now();
+  for (const FolderWatches::Event& event : watches_->Read()) {
+    Handle(event);
+    if (!watches_) {
+      return;
+    }
+  }
+}
+
+void Volume::Handle(const FolderWatches::Event& event) {
+  if ((event.mask & IN_Q_OVERFLOW) != 0) {
+    LogInfo(name_ + ": too many changes at once; walking all of it");
+    StartAgain();
+  } else if ((event.mask & IN_UNMOUNT) != 0 && event.folder.empty()) {
+    isUnmounted_ = true;
+    notBefore_ = {};
+  } else if ((event.mask & IN_UNMOUNT) != 0) { // a file system mounted below the volume
+    watches_->Forget(event.folder);
+    MarkDirty(FolderOf(event.folder));
+  } else if ((event.mask & (IN_IGNORED | IN_DELETE_SELF | IN_MOVE_SELF)) != 0) {
+    if (event.folder.empty() && (event.mask & IN_IGNORED) == 0) {
+      MarkDirty(""); // the root: finds out whether the volume is still there
+    }
+  } else if (!IsProductFolder(event)) {
+    if ((event.mask & IN_ISDIR) != 0) {
+      if ((event.mask & (IN_MOVED_FROM | IN_MOVED_TO | IN_DELETE | IN_CREATE)) != 0) {
+        // Also for a new folder: another one may have had its name.
+        watches_->Forget(event.folder + event.name + '/');
+      }
+    } else {
+      NoteFile(event);
+    }
+    MarkDirty(event.folder);
+  }
+}
+
+void Volume::NoteFile(const FolderWatches::Event& event) {
+  const std::string path = event.folder + event.name;
+  if ((event.mask & (IN_CREATE | IN_MODIFY)) != 0) {
+    if (openFiles_.size() < MOST_FILES) {
+      OpenFile& file = openFiles_[path];
+      file.written = Clock::now();
+      file.hasContent = file.hasContent || (event.mask & IN_MODIFY) != 0;
+    }
+  } else if ((event.mask & (IN_CLOSE_WRITE | IN_MOVED_FROM | IN_MOVED_TO | IN_DELETE)) != 0) {
+    openFiles_.erase(path);
+  }
+}
+
+void Volume::MarkDirty(const std::string& folder) {
+  const auto now = Clock::now();
+  const auto [entry, isNew] = pending_.try_emplace(folder, Pending{now + QUIET, now + LATEST});
+  entry->second.latest = std::min(entry->second.latest, now + LATEST);
+  entry->second.due = std::min(now + QUIET, entry->second.latest);
+}
+
+void Volume::CheckLater(const std::string& folder, Clock::time_point when) {
+  const auto [entry, isNew] = pending_.try_emplace(folder, Pending{when, when});
+  if (!isNew && when < entry->second.due) {
+    entry->second.due = when;
+  }
+}
+
+void Volume::HandleMounts(const std::set<std::string>& mountPoints) {
+  if (trouble_ != Trouble::None) {
+    notBefore_ = {};
+  }
+  std::set<std::string> mounts;
+  for (auto mount = mountPoints.upper_bound(path_ + '/');
+       mount != mountPoints.end() && mount->starts_with(path_ + '/'); ++mount) {
+    mounts.insert(mount->substr(path_.size() + 1) + '/');
+  }
+  std::vector<std::string> changed;
+  std::ranges::set_symmetric_difference(mounts, mounts_, std::back_inserter(changed));
+  mounts_ = std::move(mounts);
+  for (const std::string& folder : changed) {
+    if (watches_) {
+      // A folder that is not watched is walked when the one above is listed.
+      watches_->Forget(folder);
+      MarkDirty(FolderOf(folder));
+    }
+  }
+}
+
+// --- What is to be done ------------------------------------------------------------------------
+
+/// Forgets what is known about folders, and walks all of them.
+void Volume::StartAgain() {
+  watches_ = hasNoEvents_ ? nullptr : std::make_unique<FolderWatches>();
+  if (watches_ && watches_->Descriptor() == -1) {
+    GiveUpWatches(errno);
+  }
+  openFiles_.clear();
+  looks_.clear();
+  WalkAll();
+}
+
+void Volume::WalkAll() {
+  pending_.clear();
+  ready_.clear();
+  ready_.push_back({.path = "", .recursive = true});
+  isWalkingAll_ = true;
+  walkTime_ = {};
+  walkedFolders_ = 0;
+  walkedFiles_ = 0;
+}
+
+Clock::time_point Volume::NextWork() const {
+  auto next = Clock::time_point::max();
+  if (!ready_.empty() || isUnmounted_ || isStampWanted_) {
+    next = Clock::time_point::min();
+  }
+  if (!watches_ && ready_.empty()) {
+    next = std::min(next, nextWalk_);
+  }
+  for (const auto& [folder, pending] : pending_) {
+    next = std::min(next, pending.due);
+  }
+  return std::max(next, notBefore_);
+}
+
+void Volume::TakeDue() {
+  const auto now = Clock::now();
+  if (!watches_ && ready_.empty() && now >= nextWalk_ && isWalked_) {
+    // The watch limit may have been raised.
+    StartAgain();
+    return;
+  }
+  for (auto entry = pending_.begin(); entry != pending_.end();) {
+    if (entry->second.due <= now) {
+      ready_.push_back({.path = entry->first});
+      entry = pending_.erase(entry);
+    } else {
+      ++entry;
+    }
+  }
+}
+
+// --- Work --------------------------------------------------------------------------------------
+
+Volume::Result Volume::Work(const std::function<void()>& pulse, std::time_t latest) {
+  std::optional<VolumeRoot> root;
+  try {
+    root.emplace(path_, kind_);
+  } catch (const util::Exception&) {
+    return {.isGone = true};
+  }
+  if (isUnmounted_) {
+    return {.isGone = true};
+  }
+  try {
+    return WorkOn(*root, pulse, latest);
+  } catch (const Interrupted&) {
+    StartAgain();
+    return {};
+  } catch (const catalog::CatalogError& error) {
+    switch (error.Problem()) {
+    case CatalogProblem::Busy:
+      notBefore_ = Clock::now() + SHORT_RETRY;
+      return {};
+    case CatalogProblem::ReadOnly:
+      Fail(Trouble::ReadOnly, "read-only; its catalog is not updated until this changes");
+      break;
+    case CatalogProblem::Full:
+      Fail(Trouble::ReadOnly, "full; its catalog is not updated until this changes");
+      break;
+    default:
+      if (!root->IsInPlace()) {
+        return {.isGone = true};
+      }
+      Fail(Trouble::Unusable, std::string("not indexed: ") + error.what());
+    }
+  } catch (const util::Exception& error) { // the root cannot be read
+    if (!root->IsInPlace()) {
+      return {.isGone = true};
+    }
+    Fail(Trouble::Unusable, std::string("not indexed: ") + error.what());
+  }
+  return {};
+}
+
+Volume::Result Volume::WorkOn(const VolumeRoot& root, const std::function<void()>& pulse,
+                              std::time_t latest) {
+  Result result;
+  struct stat status = {};
+  if (fstat(root.Descriptor(), &status) == 0 &&
+      (status.st_dev != device_ || status.st_ino != inode_)) {
+    device_ = status.st_dev;
+    inode_ = status.st_ino;
+    hasNoEvents_ = HasNoEvents(root);
+    StartAgain();
+  }
+  if (std::exchange(isRetry_, false)) {
+    StartAgain();
+  }
+  try {
+    const auto begin = Clock::now();
+    const auto database = OpenCatalog(root, latest);
+    CheckIdentity(*database);
+    TakeDue();
+    db::Transaction transaction(*database, catalog::BUSY_TIMEOUT);
+    isStampWanted_ = false;
+    FolderIndexer indexer(
+        *database, root, catalog::NewPhotos::Waiting, std::time(nullptr),
+        {.opened = [this](const Folder& folder, int descriptor) { Opened(folder, descriptor); },
+         .isComplete =
+             [this](const Folder& folder, const std::string& name,
+                    const FolderIndexer::FileState& state) {
+               return IsComplete(folder, name, state);
+             },
+         .pulse = pulse});
+    while (!ready_.empty() && Clock::now() - begin < MOST_WORK) {
+      WalkNext(indexer);
+    }
+    walkTime_ += Clock::now() - begin;
+    const bool isEnd = isWalkingAll_ && ready_.empty();
+    const long long files = isEnd ? indexer.DeleteUnreachableRows(walkedFolders_, walkedFiles_) : 0;
+    const std::time_t newestStamp = catalog::NewestStamp(*database);
+    transaction.Commit();
+    newestStamp_ = newestStamp;
+    result.hasChanged = indexer.HasChanged();
+    files_ += indexer.Summary().added + indexer.Summary().revived - indexer.Summary().deleted;
+    // An event may have begun another walk.
+    if (isEnd && ready_.empty()) {
+      FinishWalk(result, files);
+    }
+  } catch (const std::string& failure) {
+    const CatalogProblem problem = catalog::ProblemOf(failure);
+    if (problem == CatalogProblem::Foreign && root.IsInPlace()) {
+      SetAside(root, failure);
+      return {};
+    }
+    throw catalog::CatalogError(problem, failure);
+  } catch (const catalog::CatalogError& error) {
+    if (error.Problem() == CatalogProblem::Foreign && root.IsInPlace()) {
+      SetAside(root, error.what());
+      return {};
+    }
+    throw;
+  }
+  return result;
+}
+
+std::unique_ptr<db::VolumeDB> Volume::OpenCatalog(const VolumeRoot& root, std::time_t latest) {
+  auto database = catalog::OpenUntrustedCatalog(root, latest);
+  if (!root.IsInPlace()) {
+    throw catalog::CatalogError(CatalogProblem::Other, "the volume was replaced");
+  }
+  return database;
+}
+
+void Volume::SetAside(const VolumeRoot& root, const std::string& reason) {
+  if (wasJustSetAside_) {
+    throw catalog::CatalogError(CatalogProblem::Other, reason);
+  }
+  const std::string name = catalog::SetCatalogAside(root);
+  LogError(name_ + ": its catalog is not one of ours, or damaged; it was renamed to " + name +
+           " and is made again: " + Printable(reason));
+  wasJustSetAside_ = true;
+  notBefore_ = Clock::now() + SHORT_RETRY; // in case somebody damages it again and again
+  isWalked_ = false;
+  StartAgain();
+}
+
+/// A catalog with another identity describes another content.
+void Volume::CheckIdentity(const db::DB& catalog) {
+  const std::string identity = catalog::Identity(catalog);
+  if (identity != identity_) {
+    if (isWalked_) {
+      StartAgain();
+    }
+    identity_ = identity;
+    isWalked_ = false;
+  }
+}
+
+void Volume::WalkNext(FolderIndexer& indexer) {
+  const Task task = std::move(ready_.back());
+  ready_.pop_back();
+  std::optional<Folder> folder = indexer.Find(task.path);
+  if (!folder) {
+    // The folder above has not been listed since this one has appeared.
+    if (watches_) {
+      watches_->Forget(task.path);
+    }
+    ready_.push_back({.path = FolderOf(task.path)});
+    return;
+  }
+  folder->revived = task.revived;
+  const long long files = indexer.Summary().files;
+  std::vector<Folder> inside = indexer.Update(*folder);
+  if (isWalkingAll_) {
+    walkedFolders_ += static_cast<long long>(inside.size());
+    walkedFiles_ += indexer.Summary().files - files;
+  }
+  // The first one is next.
+  for (Folder& next : inside | std::views::reverse) {
+    const bool isUnknown = watches_ && !watches_->Has(next.path);
+    if (task.recursive || isUnknown) {
+      ready_.push_back({.path = std::move(next.path), .recursive = true, .revived = next.revived});
+    }
+  }
+}
+
+void Volume::FinishWalk(Result& result, long long files) {
+  isWalkingAll_ = false;
+  files_ = files;
+  nextWalk_ = Clock::now() + std::max<Clock::duration>(SHORTEST_PAUSE, walkTime_ * PAUSE_FACTOR);
+  result.isFirstWalk = !std::exchange(isWalked_, true);
+  if (result.isFirstWalk) {
+    LogInfo(name_ + FormatString(": walked %lld folders, %lld files in %.1f s%s", walkedFolders_,
+                                 files_, std::chrono::duration<double>(walkTime_).count(),
+                                 watches_ ? "" : "; its changes are looked for on a timer"));
+  }
+  Recover();
+}
+
+void Volume::Opened(const Folder& folder, int descriptor) {
+  if (watches_ && !watches_->Add(folder.path, descriptor)) {
+    GiveUpWatches(errno);
+  }
+}
+
+void Volume::GiveUpWatches(int error) {
+  watches_.reset();
+  openFiles_.clear();
+  if (!std::exchange(isLimitLogged_, true)) {
+    LogError(name_ + ": its folders cannot be watched (" + std::generic_category().message(error) +
+             "), so it is walked on a timer; see the sysctl fs.inotify." +
+             (error == ENOSPC ? "max_user_watches" : "max_user_instances"));
+  }
+}
+
+/// Whether nobody writes the file any more. Otherwise its folder is looked at again.
+bool Volume::IsComplete(const Folder& folder, const std::string& name,
+                        const FolderIndexer::FileState& state) {
+  const auto now = Clock::now();
+  const std::string path = folder.path + name;
+  const auto open = openFiles_.find(path);
+  if (open != openFiles_.end()) {
+    const auto end = open->second.written +
+                     (open->second.hasContent ? Clock::duration(LONGEST_OPEN) : LONGEST_EMPTY);
+    if (now < end) {
+      CheckLater(folder.path, end);
+      return false;
+    }
+    openFiles_.erase(open);
+  }
+
+  timespec clock = {};
+  clock_gettime(CLOCK_REALTIME, &clock);
+  const auto age = std::chrono::seconds(clock.tv_sec - state.statusChanged.tv_sec) +
+                   std::chrono::nanoseconds(clock.tv_nsec - state.statusChanged.tv_nsec);
+  if (age >= QUIET) {
+    looks_.erase(path);
+    return true;
+  }
+  if (age >= 0s) {
+    CheckLater(folder.path, now + (QUIET - age));
+    return false;
+  }
+  // The clock was set back since. The file is complete when it was the same a second ago.
+  if (!looks_.contains(path) && looks_.size() >= MOST_FILES) {
+    return true;
+  }
+  const auto [look, isNew] = looks_.try_emplace(path, Look{state, now});
+  if (!isNew && look->second.state == state && now - look->second.when >= QUIET) {
+    looks_.erase(look);
+    return true;
+  }
+  if (!isNew && look->second.state != state) {
+    look->second = {state, now};
+  }
+  CheckLater(folder.path, look->second.when + QUIET);
+  return false;
+}
+
+// --- Trouble -----------------------------------------------------------------------------------
+
+void Volume::Fail(Trouble trouble, const std::string& reason) {
+  if (std::exchange(trouble_, trouble) == Trouble::None) {
+    LogError(name_ + ": " + Printable(reason));
+  }
+  StartAgain();
+  watches_.reset();
+  isRetry_ = true;
+  notBefore_ = Clock::now() + RETRY;
+}
+
+/// A walk of all folders has ended.
+void Volume::Recover() {
+  if (std::exchange(trouble_, Trouble::None) != Trouble::None) {
+    LogInfo(name_ + ": indexed again");
+  }
+  wasJustSetAside_ = false;
+  isLimitLogged_ = isLimitLogged_ && !watches_;
+}
+
+VolumeStatus Volume::Status() const {
+  const char* const state = trouble_ == Trouble::ReadOnly   ? "read-only"
+                            : trouble_ == Trouble::Unusable ? "unusable"
+                            : !ready_.empty()               ? "walking"
+                            : watches_                      ? "watching"
+                                                            : "timed";
+  return {.mountPoint = mountPoint_,
+          .state = state,
+          .foldersWaiting = ready_.size() + pending_.size(),
+          .files = isWalkingAll_ ? walkedFiles_ : files_};
+}
+
+} // namespace orva::indexer
