@@ -526,7 +526,7 @@ void Volume::Recover() {
 VolumeStatus Volume::Status() const {
   const char* const state = trouble_ == Trouble::ReadOnly   ? "read-only"
                             : trouble_ == Trouble::Unusable ? "unusable"
-                            : !ready_.empty()               ? "walking"
+                            : !IsIdle()                     ? "walking"
                             : watches_                      ? "watching"
                                                             : "timed";
   return {.mountPoint = mountPoint_,
