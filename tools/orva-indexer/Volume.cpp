@@ -125,8 +125,8 @@ void Volume::ReadEvents() {
   if (!watches_) {
     return;
   }
-  eventsRead_ = Clock::now();
   for (const FolderWatches::Event& event : watches_->Read()) {
+    eventsRead_ = Clock::now();
     Handle(event);
     if (!watches_) {
       return;
