@@ -125,8 +125,8 @@ void Volume::ReadEvents() {
   if (!watches_) {
     return;
   }
-  eventsRead_ = Clock::now();
   for (const FolderWatches::Event& event : watches_->Read()) {
+    eventsRead_ = Clock::now();
     Handle(event);
     if (!watches_) {
       return;
@@ -526,7 +526,7 @@ void Volume::Recover() {
 VolumeStatus Volume::Status() const {
   const char* const state = trouble_ == Trouble::ReadOnly   ? "read-only"
                             : trouble_ == Trouble::Unusable ? "unusable"
-                            : !ready_.empty()               ? "walking"
+                            : !IsIdle()                     ? "walking"
                             : watches_                      ? "watching"
                                                             : "timed";
   return {.mountPoint = mountPoint_,
