@@ -296,13 +296,23 @@ void Service::AnnounceResult(Known& known, const Volume::Result& result) {
   if (result.isFirstWalk) {
     known.hasChanged = false;
     AnnounceScanned(known);
-  } else if (known.hasChanged && known.isScanned) {
+  } else if (known.isScanned) {
+    AnnounceChanges(known);
+  }
+}
+
+void Service::AnnounceChanges(Known& known) {
+  const bool isIdle = known.volume.IsIdle();
+  if (known.hasChanged && !isIdle) {
     known.hasChanged = false;
-    Announce(known, known.volume.IsIdle() ? Event::End : Event::TranscodedBatch);
-  } else if (const auto master = Master(); master && known.isScanned) {
-    if (!IsPurgeOwed(known, *master)) {
-      Remember(known, *master); // stamps of the transcoder
-    }
+    known.isEndDue = true;
+    Announce(known, Event::TranscodedBatch);
+  } else if (known.hasChanged || (known.isEndDue && isIdle)) {
+    known.hasChanged = false;
+    known.isEndDue = false;
+    Announce(known, Event::End);
+  } else if (const auto master = Master(); master && !IsPurgeOwed(known, *master)) {
+    Remember(known, *master); // stamps of the transcoder
   }
 }
 

@@ -42,6 +42,7 @@ private:
     Volume volume;
     bool isScanned = false;  ///< it was
     bool hasChanged = false; ///< since the last announcement
+    bool isEndDue = false;   ///< after a batch
     std::string purgedFor{}; ///< master for which Purged is being announced
     int echoes = 0;          ///< announcements of ours that come back
   };
@@ -56,6 +57,7 @@ private:
   void AnnounceAgain();
   void WorkOnNext();
   void AnnounceResult(Known& known, const Volume::Result& result);
+  void AnnounceChanges(Known& known);
   void AnnounceScanned(Known& known);
   void Announce(Known& known, notify::Event event, bool handled = false);
   void Announced(const Announcer::Announcement& announcement, std::optional<std::size_t> clients);

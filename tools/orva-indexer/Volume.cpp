@@ -125,8 +125,8 @@ void Volume::ReadEvents() {
   if (!watches_) {
     return;
   }
-  eventsRead_ = Clock::now();
   for (const FolderWatches::Event& event : watches_->Read()) {
+    eventsRead_ = Clock::now();
     Handle(event);
     if (!watches_) {
       return;
@@ -414,11 +414,11 @@ void Volume::WalkNext(FolderIndexer& indexer) {
     return;
   }
   folder->revived = task.revived;
-  const long long files = indexer.Summary().files;
+  const long long rows = indexer.Summary().rows;
   std::vector<Folder> inside = indexer.Update(*folder);
   if (isWalkingAll_) {
     walkedFolders_ += static_cast<long long>(inside.size());
-    walkedFiles_ += indexer.Summary().files - files;
+    walkedFiles_ += indexer.Summary().rows - rows;
   }
   // The first one is next.
   for (Folder& next : inside | std::views::reverse) {
@@ -526,7 +526,7 @@ void Volume::Recover() {
 VolumeStatus Volume::Status() const {
   const char* const state = trouble_ == Trouble::ReadOnly   ? "read-only"
                             : trouble_ == Trouble::Unusable ? "unusable"
-                            : !ready_.empty()               ? "walking"
+                            : !IsIdle()                     ? "walking"
                             : watches_                      ? "watching"
                                                             : "timed";
   return {.mountPoint = mountPoint_,

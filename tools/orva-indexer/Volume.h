@@ -67,7 +67,7 @@ public:
   Clock::time_point NextWork() const;
 
   /// Whether no folder is being walked or waits to be walked now.
-  bool IsIdle() const noexcept { return ready_.empty(); }
+  bool IsIdle() const noexcept { return ready_.empty() && !isWalkingAll_; }
 
   /// Walks folders for at most two seconds and commits. Calls `pulse` often. `latest` is the time
   /// of the latest stamp that its catalog may have.

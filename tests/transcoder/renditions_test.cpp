@@ -1,0 +1,276 @@
+#include "transcoder/Photos.h"
+#include "transcoder/TranscoderTest.h"
+
+#include "support/OtherUsers.h"
+
+#include <gmock/gmock.h>
+
+#include <sys/mount.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+
+namespace {
+
+using namespace orva::test;
+using testing::Contains;
+using testing::HasSubstr;
+namespace fs = std::filesystem;
+
+class Renditions : public TranscoderTest {
+protected:
+  void SetUp() override {
+    TranscoderTest::SetUp();
+    if (!IsSkipped()) {
+      MakePhoto("/tmp/photo.jpg", 600, 400);
+    }
+  }
+
+  void Copy(const std::string& name) const { fs::copy_file("/tmp/photo.jpg", At(name)); }
+  void CopyAll(const Lines& names) const {
+    for (const std::string& name : names) {
+      Copy(name);
+    }
+  }
+
+  struct stat StatusOf(const std::string& path) const {
+    struct stat status {};
+    EXPECT_EQ(lstat(path.c_str(), &status), 0) << path;
+    return status;
+  }
+};
+
+TEST_F(Renditions, AreInFoldersOfAThousandById) {
+  CopyAll({"a.jpg", "b.jpg"});
+  AddAllWaiting({"a.jpg", "b.jpg"});
+  Query("UPDATE Files SET id = 12345 WHERE path = 'b.jpg'");
+  RenderAll();
+  EXPECT_TRUE(fs::is_regular_file(At(".orva/renditions/0/1.jpg")));
+  EXPECT_TRUE(fs::is_regular_file(At(".orva/renditions/12/12345.jpg")));
+  EXPECT_EQ(StatusOf(At(".orva/renditions")).st_mode & 07777, 0755U);
+  EXPECT_EQ(
+      Query("SELECT sourceId, profile, status FROM Transcodings ORDER BY 1", 3),
+      (Lines{"1|cb62bbdd389b48898f2e5244977cb2c5|1", "12345|cb62bbdd389b48898f2e5244977cb2c5|1"}));
+}
+
+TEST_F(Renditions, GetTheOwnerOfThePhotoAndItsPermissionToRead) {
+  if (!HasOtherUsers()) {
+    GTEST_SKIP() << NO_OTHER_USERS;
+  }
+  CopyAll({"private.jpg", "group.jpg", "open.jpg"});
+  chmod(At("private.jpg").c_str(), 0600);
+  chmod(At("group.jpg").c_str(), 04770);
+  ASSERT_EQ(chown(At("private.jpg").c_str(), 1234, 2345), 0);
+  ASSERT_EQ(chown(At("group.jpg").c_str(), 1234, 2345), 0);
+  AddAllWaiting({"private.jpg", "group.jpg", "open.jpg"});
+  RenderAll();
+  const struct stat isPrivate = StatusOf(Rendition("private.jpg"));
+  EXPECT_EQ(isPrivate.st_uid, 1234U);
+  EXPECT_EQ(isPrivate.st_gid, 2345U);
+  EXPECT_EQ(isPrivate.st_mode & 07777, 0400U);
+  EXPECT_EQ(StatusOf(Rendition("group.jpg")).st_mode & 07777, 0440U);
+  EXPECT_EQ(StatusOf(Rendition("open.jpg")).st_mode & 07777, 0444U);
+}
+
+TEST_F(Renditions, AFailedPhotoIsNotTriedAgainUntilItChanges) {
+  WriteBytes(At("a.jpg"), "no image");
+  Copy("b.jpg");
+  AddWaiting("a.jpg");
+  RenderAll();
+  const long long stamp = Number("SELECT lastUpdatedDate FROM Transcodings");
+  AddWaiting("b.jpg");
+  RenderAll();
+  EXPECT_EQ(Number("SELECT lastUpdatedDate FROM Transcodings WHERE sourceId = 1"), stamp);
+  fs::remove(At("a.jpg"));
+  Copy("a.jpg");
+  AddWaiting("a.jpg");
+  RenderAll();
+  EXPECT_EQ(StateOf("a.jpg"), "finished");
+}
+
+TEST_F(Renditions, AFailedChangeRemovesTheOldRendition) {
+  Copy("a.jpg");
+  AddWaiting("a.jpg");
+  RenderAll();
+  ASSERT_TRUE(fs::exists(Rendition("a.jpg")));
+  WriteBytes(At("a.jpg"), "no image any more");
+  AddWaiting("a.jpg");
+  RenderAll();
+  EXPECT_THAT(StateOf("a.jpg"), HasSubstr("failed"));
+  EXPECT_TRUE(Await([this] { return !fs::exists(RenditionOf(1)); }));
+}
+
+TEST_F(Renditions, OfVanishedPhotosAreRemoved) {
+  CopyAll({"a.jpg", "b.jpg"});
+  AddAllWaiting({"a.jpg", "b.jpg"});
+  RenderAll();
+  fs::remove(At("a.jpg"));
+  AddRemoved("a.jpg");
+  // This one is back.
+  Query("INSERT INTO Removals(fileId) VALUES(2)");
+  Announce("end");
+  EXPECT_TRUE(Await([this] { return Number("SELECT count(*) FROM Removals") == 0; }));
+  EXPECT_FALSE(fs::exists(RenditionOf(1)));
+  EXPECT_TRUE(fs::exists(RenditionOf(2)));
+}
+
+TEST_F(Renditions, AreComparedWithTheCatalogWhenTheVolumeAppears) {
+  const Lines names = {"a.jpg", "b.jpg", "c.jpg", "d.jpg", "e.jpg"};
+  CopyAll(names);
+  AddAllWaiting(names);
+  Query("UPDATE Files SET id = 5001 WHERE path = 'e.jpg'");
+  RenderAll();
+  KillTranscoder();
+
+  fs::remove(Rendition("a.jpg"));
+  WriteBytes(Rendition("b.jpg"), "");
+  fs::remove(Rendition("c.jpg"));
+  ASSERT_EQ(mkfifo(Rendition("c.jpg").c_str(), 0600), 0);
+  fs::remove_all(At(".orva/renditions/5"));
+  const std::string all = At(".orva/renditions");
+  WriteBytes("/tmp/outside", "outside");
+  fs::create_symlink("/tmp/outside", all + "/0/77.jpg");
+  WriteBytes(all + "/0/4.jpg.new", "temporary");
+  WriteBytes(all + "/0/999.jpg", "of nothing");
+  WriteBytes(all + "/0/04.jpg", "not as we write it");
+  WriteBytes(all + "/0/folder/kept", "kept");
+  WriteBytes(all + "/3/3000.jpg", "of nothing");
+  WriteBytes(all + "/photos/kept", "kept");
+  WriteBytes(all + "/07/kept", "kept");
+  WriteBytes(all + "/file", "a file");
+  fs::create_directory("/tmp/elsewhere");
+  WriteBytes("/tmp/elsewhere/9000.jpg", "outside");
+  fs::create_directory_symlink("/tmp/elsewhere", all + "/9");
+  const auto kept = fs::last_write_time(Rendition("d.jpg"));
+
+  StartTranscoder();
+  ASSERT_TRUE(Await([&] { return !fs::exists(all + "/3"); })); // comes last
+  ASSERT_TRUE(Await([this] { return Waiting() == 0; }));
+  for (const std::string& name : names) {
+    EXPECT_EQ(StateOf(name), "finished") << name;
+    EXPECT_EQ(HeaderOf(Rendition(name)).width, 600) << name;
+  }
+  EXPECT_EQ(fs::last_write_time(Rendition("d.jpg")), kept);
+  for (const char* const gone :
+       {"/0/77.jpg", "/0/4.jpg.new", "/0/999.jpg", "/0/04.jpg", "/file", "/9"}) {
+    EXPECT_FALSE(fs::exists(fs::symlink_status(all + gone))) << gone;
+  }
+  for (const char* const stays : {"/0/folder/kept", "/photos/kept", "/07/kept"}) {
+    EXPECT_TRUE(fs::exists(all + stays)) << stays;
+  }
+  EXPECT_EQ(ReadBytes("/tmp/outside"), "outside");
+  EXPECT_EQ(ReadBytes("/tmp/elsewhere/9000.jpg"), "outside");
+}
+
+TEST_F(Renditions, APhotoThatDiffersFromTheCatalogWaitsForTheIndexer) {
+  CopyAll({"a.jpg", "b.jpg"});
+  AddAllWaiting({"a.jpg", "b.jpg"});
+  WriteBytes(At("a.jpg"), "changed, and the catalog does not know");
+  Announce("scanned");
+  ASSERT_TRUE(Await([this] { return StateOf("b.jpg") == "finished"; }));
+  EXPECT_TRUE(AwaitSent("\"End\""));
+  EXPECT_EQ(StateOf("a.jpg"), "waiting");
+  fs::remove(At("a.jpg"));
+  Copy("a.jpg");
+  AddWaiting("a.jpg");
+  RenderAll();
+  EXPECT_EQ(StateOf("a.jpg"), "finished");
+}
+
+TEST_F(Renditions, APhotoThatIsReplacedWhileItIsRenderedIsRenderedAgain) {
+  MakePhoto(At("a.png"), 12000, 12000);
+  AddWaiting("a.png");
+  Announce("scanned");
+  ASSERT_TRUE(Await([] { return Status().find("\"rendering\":true") != std::string::npos; }));
+  fs::remove(At("a.png"));
+  fs::copy_file("/tmp/photo.jpg", At("a.png"));
+  AddWaiting("a.png");
+  RenderAll();
+  EXPECT_EQ(HeaderOf(Rendition("a.png")).width, 600);
+}
+
+TEST_F(Renditions, APhotoThatVanishesWhileItIsRenderedLeavesNoRendition) {
+  MakePhoto(At("a.png"), 12000, 12000);
+  AddWaiting("a.png");
+  Announce("scanned");
+  ASSERT_TRUE(Await([] { return Status().find("\"rendering\":true") != std::string::npos; }));
+  fs::remove(At("a.png"));
+  AddRemoved("a.png");
+  Announce("end");
+  ASSERT_TRUE(Await([] { return Status().find("\"rendering\":true") == std::string::npos; }));
+  EXPECT_TRUE(Await([this] { return Number("SELECT count(*) FROM Removals") == 0; }));
+  EXPECT_FALSE(fs::exists(RenditionOf(1)));
+}
+
+TEST_F(Renditions, TheVolumeCanBeUnmountedBetweenTwoPiecesOfWork) {
+  MakePhoto(At("a.png"), 12000, 12000);
+  AddWaiting("a.png");
+  Announce("scanned");
+  ASSERT_TRUE(Await([] { return Status().find("\"rendering\":true") != std::string::npos; }));
+  // The photo is being rendered, and nothing of the volume is open.
+  EXPECT_TRUE(Await([this] { return umount2(Root().c_str(), 0) == 0; })) << errno;
+  ASSERT_TRUE(Await([] { return Status() == "{\"volumes\":[]}\n"; })) << Status();
+  EXPECT_TRUE(fs::is_empty(Root()));
+  EXPECT_TRUE(Await([] { return fs::is_empty(std::string(RUNTIME) + "/staging"); }));
+}
+
+TEST_F(Renditions, NothingIsWrittenWhereNothingIsMounted) {
+  fs::create_directories("/shares/Bare");
+  UseRoot("/shares/Bare");
+  Copy("a.jpg");
+  AddWaiting("a.jpg");
+  Announce("plugged");
+  Announce("scanned");
+  // Another volume is looked at later.
+  EXPECT_TRUE(Await([this] {
+    const Lines logged = Logged();
+    return std::ranges::find(logged, "/shares/Bare: nothing is mounted there") != logged.end();
+  }));
+  EXPECT_FALSE(fs::exists("/shares/Bare/.orva/renditions"));
+  Announce("unplugged");
+  AnnounceDirectory("/shares/Bare");
+  RenderAll();
+  EXPECT_TRUE(fs::exists(Rendition("a.jpg")));
+}
+
+TEST_F(Renditions, AFullVolumeIsReportedOnceAndTriedAgain) {
+  // Its rendition is larger than the free space, which is enough for the catalog.
+  RunChecked({"vips", "gaussnoise", "/tmp/noise.v", "1000", "1000", "--sigma", "90"});
+  RunChecked({"vips", "cast", "/tmp/noise.v", At("a.png"), "uchar"});
+  AddWaiting("a.png");
+  TheVolume().Resize(TheVolume().Used() + (256 << 10));
+  for (int i = 0; i < 3; ++i) {
+    Announce("scanned");
+  }
+  ASSERT_TRUE(Await([this] {
+    return testing::Matches(Contains(HasSubstr("No space left on device")))(Logged());
+  })) << testing::PrintToString(Logged());
+  TheVolume().Resize(1e9);
+  RenderAll();
+  EXPECT_EQ(StateOf("a.png"), "finished");
+  const Lines logged = Logged();
+  EXPECT_EQ(
+      std::ranges::count_if(
+          logged, [](const std::string& line) { return line.find("No space") < line.size(); }),
+      1);
+}
+
+TEST_F(Renditions, AReadOnlyVolumeIsReportedOnceAndTriedAgain) {
+  Copy("a.jpg");
+  AddWaiting("a.jpg");
+  TheVolume().MakeReadOnly();
+  Announce("scanned");
+  Announce("scanned");
+  ASSERT_TRUE(
+      Await([this] { return testing::Matches(Contains(HasSubstr("is read-only")))(Logged()); }));
+  TheVolume().MakeWritable();
+  RenderAll();
+  const Lines logged = Logged();
+  EXPECT_EQ(
+      std::ranges::count_if(
+          logged, [](const std::string& line) { return line.find("read-only") < line.size(); }),
+      1);
+}
+
+} // namespace

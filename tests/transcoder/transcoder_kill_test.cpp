@@ -1,0 +1,77 @@
+#include "transcoder/Photos.h"
+#include "transcoder/TranscoderTest.h"
+
+#include "support/TestScale.h"
+
+#include <gmock/gmock.h>
+
+#include <chrono>
+#include <random>
+#include <thread>
+
+namespace {
+
+namespace test = orva::test;
+using namespace orva::test;
+namespace fs = std::filesystem;
+
+using TranscoderKill = TranscoderTest;
+
+TEST_F(TranscoderKill, AtAnyInstantNothingIsListedWithoutARendition) {
+  const int kills = TestScale(15, 50);
+  MakePhoto("/tmp/photo.jpg", 1200, 800);
+  Lines names;
+  for (int i = 0; i < 300; ++i) {
+    names.push_back(std::to_string(i) + ".jpg");
+    fs::copy_file("/tmp/photo.jpg", At(names.back()));
+  }
+  AddAllWaiting(names);
+  std::mt19937 random(7);
+  for (int i = 0; i < kills; ++i) {
+    Announce("scanned");
+    // At a random point of the work: after so many photos, and so many files in memory.
+    const long long photos = Waiting() - static_cast<long long>(random() % 60);
+    const std::size_t files = random() % 100;
+    Await([&] {
+      std::error_code ignored;
+      std::size_t count = 0;
+      for (auto entry =
+               fs::recursive_directory_iterator(std::string(RUNTIME) + "/staging", ignored);
+           !ignored && entry != fs::recursive_directory_iterator(); entry.increment(ignored)) {
+        ++count;
+      }
+      return Waiting() <= std::max(photos, 0LL) || count > files;
+    });
+    KillTranscoder();
+    for (const std::string& id : Query("SELECT sourceId FROM Transcodings WHERE status = 1")) {
+      ASSERT_GT(fs::file_size(RenditionOf(std::stoll(id))), 100U) << id;
+    }
+    // Some wait again, so that there is always work.
+    if (Waiting() < 100) {
+      AddAllWaiting(names);
+    }
+    StartTranscoder();
+    EXPECT_TRUE(Await([] { return fs::is_empty(std::string(RUNTIME) + "/staging"); }));
+  }
+  RenderAll();
+  for (const std::string& name : names) {
+    ASSERT_EQ(StateOf(name), "finished");
+    ASSERT_EQ(HeaderOf(Rendition(name)).width, 1024);
+  }
+  EXPECT_TRUE(Await([this] {
+    return std::distance(fs::directory_iterator(At(".orva/renditions/0")),
+                         fs::directory_iterator()) == 300;
+  }));
+}
+
+TEST_F(TranscoderKill, ProgramsInTheSandboxEndWithTheService) {
+  MakePhoto(At("slow.png"), 15000, 15000);
+  AddWaiting("slow.png");
+  Announce("scanned");
+  const auto isRendering = [] { return test::Run({"pidof", "vipsthumbnail"}).status == 0; };
+  ASSERT_TRUE(Await(isRendering));
+  KillTranscoder();
+  EXPECT_TRUE(Await([&] { return !isRendering(); }));
+}
+
+} // namespace
