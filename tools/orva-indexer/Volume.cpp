@@ -97,8 +97,6 @@ bool IsProductFolder(const FolderWatches::Event& event) {
 
 } // namespace
 
-const std::string Volume::NO_IDENTITY;
-
 Volume::Volume(std::string mountPoint, VolumeRoot::Kind kind)
     : mountPoint_(std::move(mountPoint)), path_(util::Path(mountPoint_).Basic()), kind_(kind),
       name_("Volume " + Printable(mountPoint_)) {
@@ -107,7 +105,7 @@ Volume::Volume(std::string mountPoint, VolumeRoot::Kind kind)
 
 bool Volume::IsInPlace() const {
   struct stat status = {};
-  return lstat(path_.c_str(), &status) == 0 &&
+  return !isUnmounted_ && lstat(path_.c_str(), &status) == 0 &&
          (inode_ == 0 || (status.st_dev == device_ && status.st_ino == inode_));
 }
 
