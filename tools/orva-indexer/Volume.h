@@ -131,7 +131,7 @@ private:
   void GiveUpWatches(int error);
   bool IsComplete(const Folder& folder, const std::string& name,
                   const catalog::FolderIndexer::FileState& state);
-  void Fail(Trouble trouble, const std::string& reason);
+  void Fail(Trouble trouble, const std::string& reason, bool isMedium = false);
   void Recover();
 
   const std::string mountPoint_;
@@ -164,6 +164,8 @@ private:
   Clock::duration walkTime_{}; ///< of work, without pauses
   long long walkedFolders_ = 0;
   long long walkedFiles_ = 0;
+  long long unreadable_ = 0; ///< folders and files, in this walk
+  std::string unreadableExample_;
   long long files_ = 0; ///< on the volume, as far as known
   Trouble trouble_ = Trouble::None;
   bool isRetry_ = false; ///< of a volume with trouble, which is not watched yet
