@@ -1,14 +1,35 @@
 #include "ZophotosTest.h"
 
 #include "support/Programs.h"
+#include "system/Deadline.h"
 
+#include <chrono>
 #include <cstdlib>
 #include <filesystem>
+#include <fstream>
 #include <sstream>
+#include <stdexcept>
+#include <thread>
 
 namespace orva::test {
 
 namespace fs = std::filesystem;
+
+namespace {
+
+/// How many times a process has gone to sleep.
+long Waits(pid_t pid) {
+  std::ifstream file("/proc/" + std::to_string(pid) + "/status");
+  const std::string name = "voluntary_ctxt_switches:";
+  for (std::string line; std::getline(file, line);) {
+    if (line.starts_with(name)) {
+      return std::stol(line.substr(name.size()));
+    }
+  }
+  throw std::runtime_error("no " + name + " of " + std::to_string(pid));
+}
+
+} // namespace
 
 Arguments ZophotosCommand(Arguments arguments) {
   arguments.insert(arguments.begin(), ProgramPath("zophotos"));
@@ -65,6 +86,16 @@ void AddFiles(const Database& copy, int count, const std::string& folderId,
            std::to_string(count) +
            ") INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT " +
            folderId + ", " + name + ", 1, '/shares/A/', 1 FROM n");
+}
+
+void AwaitLooks(const Program& program) {
+  // It sleeps between two looks, and in a look that waits for a lock.
+  const long enough = Waits(program.Pid()) + 8;
+  const auto end = std::chrono::steady_clock::now() + DEADLINE;
+  while (Waits(program.Pid()) < enough) {
+    ASSERT_LT(std::chrono::steady_clock::now(), end) << "the program does not look";
+    std::this_thread::yield();
+  }
 }
 
 void ZophotosTest::SetUp() {

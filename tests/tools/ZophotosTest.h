@@ -49,6 +49,9 @@ void AddRows(const Database& copy, const std::string& folder, const std::string&
 void AddFiles(const Database& copy, int count, const std::string& folderId,
               const std::string& name);
 
+/// Waits until a running zophotos has looked for changes, or tried to, several times.
+void AwaitLooks(const Program& program);
+
 /// zophotos and the daemon, which has merged four volumes into A: A has all of its photos
 /// transcoded, B one of three, C has no photos, and D has one that is not transcoded.
 class ZophotosTest : public SystemTest {

@@ -883,33 +883,35 @@ TEST(OrvaCatalogOptions, AreDecimalAndTheLastOneCounts) {
 TEST(OrvaCatalogOptions, WrongUsageIsRefused) {
   const std::vector<std::pair<Lines, std::string>> wrong = {
       {{}, "a command is required"},
-      {{"scan", "/v"}, "unexpected argument 'scan'"},
+      {{"scan", "/v"}, "unknown command: 'scan'"},
       {{"index"}, "MOUNT is required"},
-      {{"index", ""}, "MOUNT: must not be empty"},
-      {{"index", "--files"}, "MOUNT is required"},
-      {{"index", "/v", "--files"}, "unexpected argument '--files'"},
-      {{"index", "/v", "/w"}, "unexpected argument '/w'"},
+      {{"index", ""}, "MOUNT must not be empty"},
+      {{"index", "--files"}, "unknown option: --files"},
+      {{"index", "/v", "--files"}, "unknown option: --files"},
+      {{"index", "/v", "/w"}, "unexpected argument: '/w'"},
       {{"generate", "/v"}, "--files is required"},
-      {{"generate", "/v", "--files"}, "--files: 1 required NUMBER missing"},
-      {{"generate", "/v", "--names"}, "--names: 1 required unique|camera missing"},
-      {{"generate", "/v", "--tree"}, "--tree: 1 required flat|deep missing"},
-      {{"generate", "/v", "--files=", "1", "--restamp"}, "--files= has no value"},
+      {{"generate", "/v", "--files"}, "option --files needs a value"},
+      {{"generate", "/v", "--names"}, "option --names needs a value"},
+      {{"generate", "/v", "--tree"}, "option --tree needs a value"},
+      {{"generate", "/v", "--files=", "1", "--restamp"}, "option --files needs a value"},
       {{"generate", "/v", "--files", "1", "--per-folder", "1", "--names", "camera"},
        "--tree is required"},
       {{"generate", "/v", "--files", "-1", "--restamp"},
-       "--files: takes a number from 0 to 1000000000, not '-1'"},
+       "option --files takes a number from 0 to 1000000000, not '-1'"},
       {{"generate", "/v", "--files", "1x", "--restamp"},
-       "--files: takes a number from 0 to 1000000000, not '1x'"},
+       "option --files takes a number from 0 to 1000000000, not '1x'"},
       {{"generate", "/v", "--files", "0x10", "--restamp"},
-       "--files: takes a number from 0 to 1000000000, not '0x10'"},
+       "option --files takes a number from 0 to 1000000000, not '0x10'"},
       {{"generate", "/v", "--files", "99999999999999999999", "--restamp"},
-       "--files: takes a number from 0 to 1000000000, not '99999999999999999999'"},
+       "option --files takes a number from 0 to 1000000000, not '99999999999999999999'"},
       {{"generate", "/v", "--per-folder", "0", "--restamp"},
-       "--per-folder: takes a number from 1 to 1000000000, not '0'"},
-      {{"generate", "/v", "--names", "none", "--restamp"}, "--names: none not in {unique,camera}"},
-      {{"generate", "/v", "--tree", "round", "--restamp"}, "--tree: round not in {flat,deep}"},
-      {{"generate", "/v", "--colour", "red", "--restamp"}, "unexpected argument '--colour'"},
-      {{"generate", "/v", "stray", "--restamp"}, "unexpected argument 'stray'"}};
+       "option --per-folder takes a number from 1 to 1000000000, not '0'"},
+      {{"generate", "/v", "--names", "none", "--restamp"},
+       "option --names takes unique or camera, not 'none'"},
+      {{"generate", "/v", "--tree", "round", "--restamp"},
+       "option --tree takes flat or deep, not 'round'"},
+      {{"generate", "/v", "--colour", "red", "--restamp"}, "unknown option: --colour"},
+      {{"generate", "/v", "stray", "--restamp"}, "unexpected argument: 'stray'"}};
   for (const auto& [arguments, message] : wrong) {
     try {
       catalog::ParseOptions(arguments);
@@ -925,11 +927,11 @@ TEST_F(OrvaCatalog, TheProgramIndexesAndPrintsWhatItChanged) {
   Write("b.txt");
   const Outcome first = RunProgram("index " + volume_.native());
   EXPECT_EQ(first.status, 0);
-  EXPECT_EQ(first.output, volume_.native() + ": 1 folders, 2 files, 1 photos; files: 2 added, "
+  EXPECT_EQ(first.output, volume_.native() + ": 1 folder, 2 files, 1 photo; files: 2 added, "
                                              "0 changed, 0 deleted, 0 revived\n");
   Remove("b.txt");
   const Outcome second = RunProgram("index " + volume_.native() + "/");
-  EXPECT_EQ(second.output, volume_.native() + ": 1 folders, 1 files, 1 photos; files: 0 added, "
+  EXPECT_EQ(second.output, volume_.native() + ": 1 folder, 1 file, 1 photo; files: 0 added, "
                                               "0 changed, 1 deleted, 0 revived\n");
 }
 
@@ -939,7 +941,7 @@ TEST_F(OrvaCatalog, ProgressIsShownOnATerminalAndErased) {
       RunShell("script --quiet --return --command '" + test::ProgramPath("orva-catalog") +
                " index " + volume_.native() + "' /dev/null");
   EXPECT_EQ(outcome.status, 0);
-  const std::string progress = "\r\033[K1 folders, 1 files, 1 photos\r\033[K";
+  const std::string progress = "\r\033[K1 folder, 1 file, 1 photo\r\033[K";
   EXPECT_EQ(outcome.output.substr(0, progress.size() + volume_.native().size()),
             progress + volume_.native());
 }
@@ -952,6 +954,12 @@ TEST_F(OrvaCatalog, TheProgramGeneratesAndRestamps) {
   const Outcome stamped = RunProgram("generate " + volume_.native() + " --restamp");
   EXPECT_EQ(stamped.status, 0);
   EXPECT_EQ(stamped.output, volume_.native() + ": stamped 25 transcodings again\n");
+  EXPECT_EQ(RunProgram("generate " + volume_.native() +
+                       " --files 1 --per-folder 10 --names unique --tree flat")
+                .output,
+            volume_.native() + ": generated 1 photo in 1 folder\n");
+  EXPECT_EQ(RunProgram("generate " + volume_.native() + " --restamp").output,
+            volume_.native() + ": stamped 1 transcoding again\n");
 }
 
 TEST_F(OrvaCatalog, HelpAndVersionGoToStandardOutput) {
@@ -979,7 +987,7 @@ TEST_F(OrvaCatalog, TheExitStatusDistinguishesWrongUsageFromFailure) {
   const Outcome usage = RunProgram("index");
   EXPECT_EQ(usage.status, 2);
   EXPECT_EQ(usage.output, "orva-catalog: MOUNT is required\n"
-                          "Try 'orva-catalog --help'.\n");
+                          "Try 'orva-catalog index --help'.\n");
   const Outcome absent = RunProgram("index /absent");
   EXPECT_EQ(absent.status, 1);
   EXPECT_EQ(absent.output, "orva-catalog: /absent is not a directory\n");

@@ -4,158 +4,42 @@
 #include "orva-notify/Control.h"
 #include "orva-notify/MountInfo.h"
 #include "orva-notify/Notification.h"
+#include "orva-notify/VolumeMemory.h"
+
+#include "NotifyTest.h"
 
 #include "orvautil/ClientSocket.h"
 #include "orvautil/Core.h"
 #include "orvautil/Decodestring.h"
 
-#include "support/Program.h"
 #include "support/Programs.h"
-#include "system/Deadline.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include <poll.h>
-#include <sys/mount.h>
+#include <sys/socket.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <array>
-#include <cerrno>
 #include <chrono>
 #include <csignal>
-#include <cstdio>
-#include <cstring>
 #include <filesystem>
 #include <fstream>
 #include <memory>
 #include <sstream>
 #include <string>
-#include <system_error>
 #include <vector>
 
 namespace {
 
 using namespace orva;
 using namespace orva::notify;
+using namespace orva::test;
 using core::ORVA_NOTIFICATION_SOCKET;
-using test::DEADLINE;
-using test::Program;
 using testing::ElementsAre;
 using testing::HasSubstr;
 using testing::Pair;
-using Arguments = std::vector<std::string>;
-using Clock = std::chrono::steady_clock;
-
-/// Waits until `descriptor` is readable. Returns false when the deadline has passed.
-bool IsReadable(int descriptor, Clock::time_point deadline) {
-  const auto left = std::chrono::ceil<std::chrono::milliseconds>(deadline - Clock::now());
-  pollfd ready{.fd = descriptor, .events = POLLIN, .revents = 0};
-  return poll(&ready, 1, static_cast<int>(std::max<long>(left.count(), 0))) == 1;
-}
-
-Arguments Notify(Arguments arguments) {
-  arguments.insert(arguments.begin(), test::ProgramPath("orva-notify"));
-  return arguments;
-}
-
-/// The result of a command.
-struct Answer {
-  int status = 0;
-  std::string line; ///< the first line of its output
-};
-
-Answer RunNotify(const Arguments& arguments, const std::string& input = "/dev/null") {
-  Program program(Notify(arguments), {.input = input});
-  const std::string line = program.ReadLine();
-  return {program.WaitForEnd(), line};
-}
-
-/// A client of the service, like the daemon.
-class Listener {
-public:
-  Listener() : socket_(util::Socket::Address(ORVA_NOTIFICATION_SOCKET), false) {}
-
-  bool IsConnected() const { return socket_.IsOpen(); }
-  void Close() { socket_.Close(); }
-
-  /// The next message without its delimiter; "(end)" or "(deadline)" when there is none.
-  std::string ReadMessage() {
-    const std::string delimiter(4, '\0');
-    const auto deadline = Clock::now() + DEADLINE;
-    std::vector<char> chunk(std::size_t{256} * 1024);
-    std::size_t searched = 0;
-    for (;;) {
-      const auto end = input_.find(delimiter, searched);
-      if (end != std::string::npos) {
-        std::string message = input_.substr(0, end);
-        input_.erase(0, end + delimiter.size());
-        return message;
-      }
-      searched = std::max<std::size_t>(input_.size(), 3) - 3;
-      if (!IsReadable(socket_.Descriptor(), deadline)) {
-        return "(deadline)";
-      }
-      const unsigned count = socket_.Read(chunk.data(), static_cast<unsigned>(chunk.size()));
-      if (count == 0) {
-        return input_.empty() ? "(end)" : "(end within a message)";
-      }
-      input_.append(chunk.data(), count);
-    }
-  }
-
-private:
-  util::ClientSocket socket_;
-  std::string input_;
-};
-
-class OrvaNotify : public testing::Test {
-protected:
-  void SetUp() override {
-    std::filesystem::create_directories(folder_);
-    std::filesystem::create_directories("/shares");
-  }
-
-  void TearDown() override {
-    service_.reset();
-    std::filesystem::remove_all(std::filesystem::path(ORVA_NOTIFICATION_SOCKET).parent_path());
-    std::filesystem::remove_all(folder_);
-  }
-
-  /// Starts the service and waits until it listens.
-  void Serve(Arguments options = {}) {
-    options.insert(options.begin(), "serve");
-    service_ = std::make_unique<Program>(Notify(options));
-    ASSERT_EQ(service_->ReadLine(), "listening on " + ORVA_NOTIFICATION_SOCKET);
-  }
-
-  std::string FileWith(const std::string& content) const {
-    std::string name = folder_ + "/message";
-    std::ofstream(name, std::ios::binary) << content;
-    return name;
-  }
-
-  const std::string folder_ = "/tmp/orva_notify_test";
-  std::unique_ptr<Program> service_;
-};
-
-/// A tmpfs below /shares while it lives.
-class Volume {
-public:
-  explicit Volume(std::string mountPoint) : mountPoint_(std::move(mountPoint)) {
-    std::filesystem::create_directories(mountPoint_);
-    if (mount("none", mountPoint_.c_str(), "tmpfs", 0, "size=64k") != 0) {
-      throw std::system_error(errno, std::generic_category(), "mount " + mountPoint_);
-    }
-  }
-  Volume(const Volume&) = delete;
-  Volume& operator=(const Volume&) = delete;
-  ~Volume() { umount2(mountPoint_.c_str(), MNT_DETACH); }
-
-private:
-  const std::string mountPoint_;
-};
 
 TEST(Notification, NamesTheEventAndTheMountPoint) {
   EXPECT_EQ(Compose(Event::Plugged, "/shares/Photos"),
@@ -198,6 +82,163 @@ TEST(Notification, IsFramedByFourZeroBytes) {
   EXPECT_EQ(Frame("<a/>"), std::string("<a/>\0\0\0\0", 8));
 }
 
+TEST(Notification, SaysThatAVolumeIsAPlainDirectory) {
+  EXPECT_EQ(
+      Compose(
+          {.event = Event::Plugged, .mountPoint = "/shares/Photos", .kind = VolumeKind::Directory}),
+      R"(<ORVANotification Name="Plugged" MountPoint="/shares/Photos" Kind="directory"/>)");
+  EXPECT_EQ(
+      Compose(
+          {.event = Event::Scanned, .mountPoint = "/shares/Photos", .kind = VolumeKind::Directory}),
+      Compose(Event::Scanned, "/shares/Photos"));
+}
+
+TEST(Notification, IsRecognizedIfItIsComposedHere) {
+  for (const Event event : {Event::Plugged, Event::Unplugged, Event::Scanned,
+                            Event::TranscodedBatch, Event::End, Event::Purged}) {
+    const auto announcement = Recognize(Compose(event, "/shares/a \"b\"&\xFF"));
+    ASSERT_TRUE(announcement);
+    EXPECT_EQ(announcement->event, event);
+    EXPECT_EQ(announcement->mountPoint, "/shares/a \"b\"&\xFF");
+    EXPECT_EQ(announcement->kind, VolumeKind::Mount);
+  }
+  const auto directory = Recognize(
+      Compose({.event = Event::Plugged, .mountPoint = "/a", .kind = VolumeKind::Directory}));
+  ASSERT_TRUE(directory);
+  EXPECT_EQ(directory->kind, VolumeKind::Directory);
+
+  const std::string message = Compose(Event::End, "/shares/A");
+  for (const std::string& other :
+       {std::string(), std::string("<a/>"), message + " ", message.substr(0, message.size() - 1),
+        message.substr(0, message.find("/shares")),
+        std::string("<ORVANotification Name=\"End\" MountPoint=\"/a b\"/>")}) {
+    EXPECT_EQ(Recognize(other), std::nullopt) << other;
+  }
+}
+
+TEST(Client, HasNotHandledWhatItLeavesUnreadWhenItHangsUp) {
+  for (const bool leavesMark : {false, true}) {
+    int ends[2];
+    ASSERT_EQ(socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0, ends), 0);
+    Client client{util::FileDescriptor(ends[0]), 1};
+    util::FileDescriptor reader(ends[1]);
+    client.Queue(std::make_shared<const std::string>("message"));
+    const auto handling = std::make_shared<Handling>();
+    client.QueueMark(handling);
+    std::array<char, 64> input{};
+    if (leavesMark) {
+      ASSERT_EQ(read(reader.Get(), input.data(), input.size()), 7);
+      client.SendQueued();
+    }
+    EXPECT_TRUE(client.AwaitsReader());
+    reader.Reset();
+    client.SendQueued();
+    EXPECT_EQ(handling->handled, 0U);
+    client.DiscardInput();
+    EXPECT_FALSE(client.IsOpen());
+  }
+}
+
+/// The names of the events with their mount points, in short.
+std::vector<std::string> Texts(const std::vector<Announcement>& announcements) {
+  std::vector<std::string> texts;
+  for (const auto& announcement : announcements) {
+    const std::string message = Compose(announcement);
+    const auto start = message.find("Name=") + 6;
+    texts.push_back(message.substr(start, message.find('"', start) - start) + ' ' +
+                    announcement.mountPoint +
+                    (announcement.kind == VolumeKind::Directory ? " directory" : ""));
+  }
+  return texts;
+}
+
+TEST(VolumeMemory, ReplaysPluggedThenScannedThenEnd) {
+  VolumeMemory memory;
+  EXPECT_THAT(Texts(memory.Replay()), ElementsAre());
+  memory.Remember({Event::Plugged, "/shares/B"});
+  memory.Remember({Event::Scanned, "/shares/B"});
+  memory.Remember({Event::End, "/shares/B"});
+  memory.Remember({Event::Plugged, "/shares/C"});
+  memory.Remember({Event::Plugged, "/shares/A"});
+  memory.Remember({Event::Scanned, "/shares/A"});
+  EXPECT_THAT(Texts(memory.Replay()),
+              ElementsAre("Plugged /shares/B", "Plugged /shares/C", "Plugged /shares/A",
+                          "Scanned /shares/B", "Scanned /shares/A", "End /shares/B"));
+  EXPECT_THAT(Texts(memory.Ends()), ElementsAre("End /shares/B"));
+}
+
+TEST(VolumeMemory, AVolumeThatIsMergedCountsAsScanned) {
+  for (const Event event : {Event::TranscodedBatch, Event::End, Event::Purged}) {
+    VolumeMemory memory;
+    memory.Remember({Event::Plugged, "/shares/A"});
+    memory.Remember({event, "/shares/A"});
+    EXPECT_THAT(Texts(memory.Replay()),
+                ElementsAre("Plugged /shares/A", "Scanned /shares/A", "End /shares/A"));
+  }
+}
+
+TEST(VolumeMemory, ForgetsAnUnpluggedVolume) {
+  VolumeMemory memory;
+  memory.Remember({Event::Plugged, "/shares/A"});
+  memory.Remember({Event::End, "/shares/A"});
+  EXPECT_TRUE(memory.Remember({Event::Unplugged, "/shares/A"}));
+  EXPECT_TRUE(memory.Remember({Event::Unplugged, "/shares/A"}));
+  EXPECT_THAT(Texts(memory.Replay()), ElementsAre());
+  memory.Remember({Event::Plugged, "/shares/A"});
+  EXPECT_THAT(Texts(memory.Replay()), ElementsAre("Plugged /shares/A"));
+}
+
+TEST(VolumeMemory, DoesNotPlugAVolumeThatWasNotPlugged) {
+  VolumeMemory memory;
+  memory.Remember({Event::Scanned, "/shares/A"});
+  EXPECT_THAT(Texts(memory.Replay()), ElementsAre("Scanned /shares/A"));
+}
+
+TEST(VolumeMemory, TheFirstPluggedSaysWhatTheVolumeIs) {
+  VolumeMemory memory;
+  memory.Remember({Event::Plugged, "/shares/A", VolumeKind::Directory});
+  memory.Remember({Event::Plugged, "/shares/A"});
+  EXPECT_THAT(Texts(memory.Replay()), ElementsAre("Plugged /shares/A directory"));
+}
+
+TEST(VolumeMemory, ASeparatorAtTheEndMakesNoDifferenceAndTwoDo) {
+  VolumeMemory memory;
+  memory.Remember({Event::Plugged, "/shares/A"});
+  memory.Remember({Event::Scanned, "/shares/A/"});
+  memory.Remember({Event::Plugged, "/shares/A//"});
+  EXPECT_THAT(Texts(memory.Replay()),
+              ElementsAre("Plugged /shares/A", "Plugged /shares/A//", "Scanned /shares/A"));
+  memory.Remember({Event::Unplugged, "/shares/A/"});
+  EXPECT_THAT(Texts(memory.Replay()), ElementsAre("Plugged /shares/A//"));
+}
+
+TEST(VolumeMemory, HoldsAsManyVolumesAsTheDaemon) {
+  VolumeMemory memory;
+  for (std::size_t i = 0; i < VolumeMemory::MAXIMUM_VOLUMES; ++i) {
+    ASSERT_TRUE(memory.Remember({Event::Plugged, "/shares/" + std::to_string(i)}));
+  }
+  EXPECT_FALSE(memory.Remember({Event::Plugged, "/shares/more"}));
+  EXPECT_TRUE(memory.Remember({Event::Scanned, "/shares/7"}));
+  EXPECT_EQ(memory.Replay().size(), VolumeMemory::MAXIMUM_VOLUMES + 1);
+  EXPECT_TRUE(memory.Remember({Event::Unplugged, "/shares/8"}));
+  EXPECT_TRUE(memory.Remember({Event::Plugged, "/shares/more"}));
+}
+
+TEST(VolumeMemory, HoldsAsManyBytesOfMountPointsAsTheDaemon) {
+  VolumeMemory memory;
+  const std::string half(VolumeMemory::MAXIMUM_BYTES / 2, 'x');
+  EXPECT_TRUE(memory.Remember({Event::Plugged, half}));
+  EXPECT_FALSE(memory.Remember({Event::Plugged, half + "y"}));
+  EXPECT_TRUE(memory.Remember({Event::Plugged, "y" + half.substr(1)}));
+  EXPECT_FALSE(memory.Remember({Event::Plugged, "z"}));
+}
+
+TEST(VolumeMemory, AnEmptyMountPointNamesNoVolume) {
+  VolumeMemory memory;
+  EXPECT_TRUE(memory.Remember({Event::Scanned, ""}));
+  EXPECT_THAT(Texts(memory.Replay()), ElementsAre());
+}
+
 TEST(CommandLine, KnowsEachEvent) {
   const std::vector<std::pair<std::string, Event>> words = {
       {"plugged", Event::Plugged}, {"unplugged", Event::Unplugged},
@@ -213,10 +254,11 @@ TEST(CommandLine, KnowsEachEvent) {
 }
 
 TEST(CommandLine, TakesOptionsBeforeAndAfterTheOperands) {
-  const auto command = ParseCommandLine({"send", "--clients", "3", "scanned", "", "--wait", "7"});
+  const auto command =
+      ParseCommandLine({"send", "--clients", "3", "scanned", "/shares/A", "--wait", "7"});
   ASSERT_TRUE(command);
   EXPECT_EQ(command->event, Event::Scanned);
-  EXPECT_EQ(command->mountPoint, "");
+  EXPECT_EQ(command->mountPoint, "/shares/A");
   EXPECT_EQ(command->clients, 3U);
   EXPECT_EQ(command->wait, std::chrono::seconds(7));
 
@@ -226,7 +268,12 @@ TEST(CommandLine, TakesOptionsBeforeAndAfterTheOperands) {
   EXPECT_EQ(raw->rawFile, "-");
   EXPECT_EQ(raw->wait, std::chrono::seconds(10));
 
+  EXPECT_TRUE(ParseCommandLine({"send", "end", "/shares/A", "--handled"})->handled);
+  EXPECT_FALSE(ParseCommandLine({"send", "end", "/shares/A"})->handled);
   EXPECT_TRUE(ParseCommandLine({"serve", "--watch"})->watch);
+  EXPECT_THAT(
+      ParseCommandLine({"serve", "--volume", "/shares/A", "--volume=/shares/b c"})->directories,
+      ElementsAre("/shares/A", "/shares/b c"));
   EXPECT_FALSE(ParseCommandLine({"serve"})->watch);
   EXPECT_EQ(ParseCommandLine({"serve"})->action, CommandLine::Action::Serve);
   EXPECT_EQ(ParseCommandLine({"drop"})->action, CommandLine::Action::Drop);
@@ -244,23 +291,47 @@ TEST(CommandLine, TakesDecimalNumbersAndTheLastOneCounts) {
 TEST(CommandLine, SaysWhatIsWrong) {
   const std::vector<std::pair<Arguments, std::string>> wrong = {
       {{}, "a command is required"},
-      {{"listen"}, "unexpected argument 'listen'"},
-      {{"send"}, "send: takes an event and a mount point, or --raw FILE"},
-      {{"send", "plugged"}, "send: takes an event and a mount point, or --raw FILE"},
-      {{"send", "Plugged", "/shares/A"}, "EVENT: unknown event 'Plugged'"},
-      {{"send", "plugged", "/a", "/b"}, "unexpected argument '/b'"},
-      {{"send", "--raw"}, "--raw: 1 required FILE missing"},
-      {{"send", "--raw", ""}, "--raw: must not be empty"},
-      {{"send", "--raw=", "f"}, "--raw= has no value"},
-      {{"send", "--raw", "f", "plugged"}, "--raw excludes EVENT"},
-      {{"send", "--watch", "plugged", "/a"}, "unexpected argument '--watch'"},
-      {{"serve", "--clients", "1"}, "unexpected argument '--clients'"},
-      {{"serve", "all"}, "unexpected argument 'all'"},
-      {{"drop", "--clients"}, "--clients: 1 required NUMBER missing"},
-      {{"drop", "--clients", "2x"}, "--clients: takes a number from 0 to 100000, not '2x'"},
-      {{"drop", "--clients", "0x2"}, "--clients: takes a number from 0 to 100000, not '0x2'"},
-      {{"drop", "--wait", "-1"}, "--wait: takes a number from 0 to 100000, not '-1'"},
-      {{"drop", "--wait", "100001"}, "--wait: takes a number from 0 to 100000, not '100001'"}};
+      {{"listen"}, "unknown command: 'listen'"},
+      {{"sned"}, "unknown command: 'sned'; did you mean 'send'?"},
+      {{"send"}, "EVENT and MOUNT are required, or --raw FILE"},
+      {{"send", "plugged"}, "MOUNT is required"},
+      {{"send", "Plugged", "/shares/A"}, "unknown event: 'Plugged'; did you mean 'plugged'?"},
+      {{"send", "exploded"}, "unknown event: 'exploded'"},
+      {{"send", "plugged", ""}, "MOUNT must be an absolute path such as /shares/Photos, not ''"},
+      {{"send", "plugged", "A"}, "MOUNT must be an absolute path such as /shares/Photos, not 'A'"},
+      {{"send", "plugged", "/a", "/b"}, "unexpected argument: '/b'"},
+      {{"send", "--raw"}, "option --raw needs a value"},
+      {{"send", "--raw", ""}, "option --raw must not be empty"},
+      {{"send", "--raw=", "f"}, "option --raw needs a value"},
+      {{"send", "--raw", "f", "plugged"}, "EVENT and --raw cannot be combined"},
+      {{"send", "--watch", "plugged", "/a"}, "unknown option: --watch"},
+      {{"serve", "--clients", "1"}, "unknown option: --clients"},
+      {{"serve", "--watch=no"}, "option --watch takes no value"},
+      {{"serve", "all"}, "unexpected argument: 'all'"},
+      {{"serve", "--volume"}, "option --volume needs a value"},
+      {{"serve", "--volume", "/shares/A", "/shares/B"}, "unexpected argument: '/shares/B'"},
+      {{"serve", "--volume", "Photos"}, "option --volume must be an absolute path, not 'Photos'"},
+      {{"serve", "--volume", ""}, "option --volume must be an absolute path, not ''"},
+      {{"serve", "--volume", "/"}, "option --volume must be directly below /shares, not '/'"},
+      {{"serve", "--volume", "/shares"},
+       "option --volume must be directly below /shares, not '/shares'"},
+      {{"serve", "--volume", "/srv/Photos"},
+       "option --volume must be directly below /shares, not '/srv/Photos'"},
+      {{"serve", "--volume", "/shares/A/B"},
+       "option --volume must be directly below /shares, not '/shares/A/B'"},
+      {{"serve", "--volume", "/shares/A/"},
+       "option --volume must not contain '.', '..', '//' or a '/' at the end: '/shares/A/'"},
+      {{"serve", "--volume", "/shares/.."},
+       "option --volume must not contain '.', '..', '//' or a '/' at the end: '/shares/..'"},
+      {{"serve", "--volume", "/shares//A"},
+       "option --volume must not contain '.', '..', '//' or a '/' at the end: '/shares//A'"},
+      {{"drop", "--handled"}, "unknown option: --handled"},
+      {{"drop", "--clients"}, "option --clients needs a value"},
+      {{"drop", "--clients", "2x"}, "option --clients takes a number from 0 to 100000, not '2x'"},
+      {{"drop", "--clients", "0x2"}, "option --clients takes a number from 0 to 100000, not '0x2'"},
+      {{"drop", "--wait", "-1"}, "option --wait takes a number from 0 to 100000, not '-1'"},
+      {{"drop", "--wait", "100001"},
+       "option --wait takes a number from 0 to 100000, not '100001'"}};
   for (const auto& [arguments, message] : wrong) {
     try {
       ParseCommandLine(arguments);
@@ -316,13 +387,13 @@ TEST(MountInfo, AnotherMountOnAMountPointIsUnpluggedAndPlugged) {
 
 TEST_F(OrvaNotify, SendsEveryMessageToEachClient) {
   Serve();
-  Listener one;
-  Listener two;
+  NotifyClient one;
+  NotifyClient two;
   const Answer scanned = RunNotify({"send", "scanned", "/shares/My Photos"});
   EXPECT_EQ(scanned.status, 0);
   EXPECT_EQ(scanned.line, "sent to 2 clients");
   EXPECT_EQ(RunNotify({"send", "purged", "/shares/B"}).line, "sent to 2 clients");
-  for (Listener* const client : {&one, &two}) {
+  for (NotifyClient* const client : {&one, &two}) {
     EXPECT_EQ(client->ReadMessage(), Compose(Event::Scanned, "/shares/My Photos"));
     EXPECT_EQ(client->ReadMessage(), Compose(Event::Purged, "/shares/B"));
   }
@@ -330,7 +401,7 @@ TEST_F(OrvaNotify, SendsEveryMessageToEachClient) {
 
 TEST_F(OrvaNotify, PrintsALineForEachEvent) {
   Serve();
-  Listener client;
+  NotifyClient client;
   EXPECT_EQ(service_->ReadLine(), "client 1 connected");
   RunNotify({"send", "end", "/shares/A"});
   EXPECT_EQ(service_->ReadLine(), "sent to 1 client: " + Compose(Event::End, "/shares/A"));
@@ -344,7 +415,7 @@ TEST_F(OrvaNotify, PrintsALineForEachEvent) {
 
 TEST_F(OrvaNotify, SendsRawBytesFromAFileAndFromStandardInput) {
   Serve();
-  Listener client;
+  NotifyClient client;
   const std::string bytes("\x01\0\0\0<a>\xFF\n", 9);
   const std::string file = FileWith(bytes);
   EXPECT_EQ(RunNotify({"send", "--raw", file}).status, 0);
@@ -359,20 +430,23 @@ TEST_F(OrvaNotify, ARawFileThatCannotBeReadIsAnError) {
   Serve();
   const Answer outcome = RunNotify({"send", "--raw", folder_ + "/absent"});
   EXPECT_EQ(outcome.status, 1);
-  EXPECT_EQ(outcome.line, "orva-notify: Cannot read '" + folder_ + "/absent'");
+  EXPECT_EQ(outcome.line,
+            "orva-notify: cannot read " + folder_ + "/absent: No such file or directory");
+  EXPECT_EQ(RunNotify({"send", "--raw", folder_}).line,
+            "orva-notify: cannot read " + folder_ + ": Is a directory");
 }
 
 TEST_F(OrvaNotify, SendFailsWhenNoServiceListens) {
   const Answer outcome = RunNotify({"send", "plugged", "/shares/A"});
   EXPECT_EQ(outcome.status, 1);
-  EXPECT_EQ(outcome.line, "orva-notify: No orva-notify serves " + ORVA_NOTIFICATION_SOCKET +
+  EXPECT_EQ(outcome.line, "orva-notify: no orva-notify serves " + ORVA_NOTIFICATION_SOCKET +
                               ": No such file or directory");
 }
 
 TEST_F(OrvaNotify, TheExitStatusDistinguishesWrongUsageFromFailure) {
   const Answer wrong = RunNotify({"send", "exploded", "/shares/A"});
   EXPECT_EQ(wrong.status, 2);
-  EXPECT_EQ(wrong.line, "orva-notify: EVENT: unknown event 'exploded'");
+  EXPECT_EQ(wrong.line, "orva-notify: unknown event: 'exploded'");
   const Answer help = RunNotify({"--help"});
   EXPECT_EQ(help.status, 0);
   EXPECT_THAT(help.line, HasSubstr("notification service"));
@@ -383,32 +457,33 @@ TEST_F(OrvaNotify, TheExitStatusDistinguishesWrongUsageFromFailure) {
 
 TEST_F(OrvaNotify, WaitsForTheGivenNumberOfClients) {
   Serve();
-  Listener one;
+  NotifyClient one;
   const Answer tooFew =
       RunNotify({"send", "--clients", "2", "--wait", "0", "plugged", "/shares/TooEarly"});
   EXPECT_EQ(tooFew.status, 1);
-  EXPECT_EQ(tooFew.line, "orva-notify: Fewer than 2 clients connected within 0 s");
+  EXPECT_EQ(tooFew.line, "orva-notify: fewer than 2 clients connected within 0 s");
 
-  Program waiting(Notify({"send", "--clients", "2", "plugged", "/shares/A"}));
+  Program waiting(NotifyCommand({"send", "--clients", "2", "plugged", "/shares/A"}));
   EXPECT_EQ(RunNotify({"send", "scanned", "/shares/B"}).line, "sent to 1 client");
-  Listener two;
+  NotifyClient two;
   EXPECT_EQ(waiting.ReadLine(), "sent to 2 clients");
   EXPECT_EQ(waiting.WaitForEnd(), 0);
   EXPECT_EQ(one.ReadMessage(), Compose(Event::Scanned, "/shares/B"));
   EXPECT_EQ(one.ReadMessage(), Compose(Event::Plugged, "/shares/A"));
+  EXPECT_EQ(two.ReadMessage(), Compose(Event::Scanned, "/shares/B")); // remembered for it
   EXPECT_EQ(two.ReadMessage(), Compose(Event::Plugged, "/shares/A"));
 }
 
 TEST_F(OrvaNotify, DropClosesTheClientsAndTheServiceListensOn) {
   Serve();
-  Listener one;
-  Listener two;
+  NotifyClient one;
+  NotifyClient two;
   const Answer outcome = RunNotify({"drop"});
   EXPECT_EQ(outcome.status, 0);
   EXPECT_EQ(outcome.line, "dropped 2 clients");
   EXPECT_EQ(one.ReadMessage(), "(end)");
   EXPECT_EQ(two.ReadMessage(), "(end)");
-  Listener three;
+  NotifyClient three;
   EXPECT_EQ(RunNotify({"send", "end", "/shares/A"}).line, "sent to 1 client");
   EXPECT_EQ(three.ReadMessage(), Compose(Event::End, "/shares/A"));
 }
@@ -416,7 +491,7 @@ TEST_F(OrvaNotify, DropClosesTheClientsAndTheServiceListensOn) {
 TEST_F(OrvaNotify, StopsCleanlyOnBothSignals) {
   for (const int signal : {SIGTERM, SIGINT}) {
     Serve();
-    Listener client;
+    NotifyClient client;
     service_->Signal(signal);
     EXPECT_EQ(service_->WaitForEnd(), 0);
     EXPECT_EQ(client.ReadMessage(), "(end)");
@@ -431,15 +506,18 @@ TEST_F(OrvaNotify, ReplacesTheSocketOfAServiceThatWasKilled) {
   EXPECT_EQ(service_->WaitForEnd(), 128 + SIGKILL);
   ASSERT_TRUE(std::filesystem::exists(ORVA_NOTIFICATION_SOCKET));
   Serve();
-  EXPECT_TRUE(Listener().IsConnected());
+  EXPECT_TRUE(NotifyClient().IsConnected());
 }
 
 TEST_F(OrvaNotify, FailsWhenAnotherServiceListens) {
   Serve();
   const Answer second = RunNotify({"serve"});
   EXPECT_EQ(second.status, 1);
-  EXPECT_THAT(second.line, HasSubstr("something else is there, perhaps another service"));
-  Listener client;
+  EXPECT_EQ(second.line, "orva-notify: cannot listen on " +
+                             ControlAddress(ORVA_NOTIFICATION_SOCKET) +
+                             ": another service listens there; end it first (the installed "
+                             "one: systemctl stop orva-notify)");
+  NotifyClient client;
   EXPECT_EQ(RunNotify({"send", "end", "/shares/A"}).line, "sent to 1 client");
 }
 
@@ -447,13 +525,25 @@ TEST_F(OrvaNotify, DoesNotReplaceAFileThatIsNotASocket) {
   std::filesystem::create_directories(
       std::filesystem::path(ORVA_NOTIFICATION_SOCKET).parent_path());
   std::ofstream(ORVA_NOTIFICATION_SOCKET) << "precious";
-  EXPECT_EQ(RunNotify({"serve"}).status, 1);
+  const Answer outcome = RunNotify({"serve"});
+  EXPECT_EQ(outcome.status, 1);
+  EXPECT_EQ(outcome.line, "orva-notify: cannot listen on " + ORVA_NOTIFICATION_SOCKET +
+                              ": there is a file that is not a socket; remove it");
   EXPECT_EQ(std::filesystem::file_size(ORVA_NOTIFICATION_SOCKET), 8U);
+}
+
+TEST_F(OrvaNotify, FailsWhenTheDirectoryCannotBeCreated) {
+  const auto directory = std::filesystem::path(ORVA_NOTIFICATION_SOCKET).parent_path();
+  std::filesystem::remove_all(directory);
+  std::ofstream(directory) << "a file";
+  const Answer outcome = RunNotify({"serve"});
+  EXPECT_EQ(outcome.status, 1);
+  EXPECT_EQ(outcome.line, "orva-notify: cannot create " + directory.native() + ": Not a directory");
 }
 
 TEST_F(OrvaNotify, KeepsAMessageForAClientThatReadsLate) {
   Serve();
-  Listener client;
+  NotifyClient client;
   const std::string large(MAXIMUM_QUEUED_BYTES / 2, 'x');
   EXPECT_EQ(RunNotify({"send", "--raw", FileWith(large)}).line, "sent to 1 client");
   EXPECT_EQ(RunNotify({"send", "end", "/shares/A"}).line, "sent to 1 client");
@@ -463,13 +553,13 @@ TEST_F(OrvaNotify, KeepsAMessageForAClientThatReadsLate) {
 
 TEST_F(OrvaNotify, DropsAClientThatDoesNotRead) {
   Serve();
-  Listener idle;
+  NotifyClient idle;
   const std::string file = FileWith(std::string(MAXIMUM_QUEUED_BYTES / 4 * 3, 'x'));
   EXPECT_EQ(RunNotify({"send", "--raw", file}).line, "sent to 1 client");
   EXPECT_EQ(RunNotify({"send", "--raw", file}).line, "sent to 0 clients");
   EXPECT_THAT(service_->ReadLineWith("does not read"), HasSubstr("client 1 does not read"));
   EXPECT_EQ(idle.ReadMessage(), "(end within a message)");
-  Listener next;
+  NotifyClient next;
   EXPECT_EQ(RunNotify({"send", "end", "/shares/A"}).line, "sent to 1 client");
 }
 
@@ -480,7 +570,7 @@ TEST_F(OrvaNotify, RefusesAMessageThatIsTooLong) {
   const Answer outcome = RunNotify({"send", "--raw", file});
   EXPECT_EQ(outcome.status, 1);
   EXPECT_EQ(outcome.line,
-            "orva-notify: A message of 67108865 bytes is too long, 67108864 are allowed");
+            "orva-notify: a message of 67108865 bytes is too long, 67108864 are allowed");
 }
 
 TEST_F(OrvaNotify, SurvivesMalformedRequests) {
@@ -501,7 +591,7 @@ TEST_F(OrvaNotify, SurvivesMalformedRequests) {
 TEST_F(OrvaNotify, ContinuesWhenItsOutputIsClosed) {
   Serve();
   service_->CloseOutput();
-  Listener client;
+  NotifyClient client;
   EXPECT_EQ(RunNotify({"send", "end", "/shares/A"}).line, "sent to 1 client");
   EXPECT_EQ(RunNotify({"send", "end", "/shares/B"}).line, "sent to 1 client");
 }
@@ -513,12 +603,12 @@ TEST_F(OrvaNotify, ContinuesWhenDescriptorsRunOut) {
   {
     // The sanitizer opens a pipe when it checks the first object of a class. That must happen now,
     // while there are free descriptors.
-    const Listener first;
+    const NotifyClient first;
     EXPECT_EQ(RunNotify({"send", "end", "/shares/A"}).line, "sent to 1 client");
   }
   EXPECT_EQ(service_->ReadLineWith("gone"), "client 1 gone");
   {
-    const std::array<Listener, 12> clients;
+    const std::array<NotifyClient, 12> clients;
     EXPECT_THAT(service_->ReadLineWith("cannot take"),
                 HasSubstr("cannot take another connection until one ends"));
   }
@@ -527,22 +617,22 @@ TEST_F(OrvaNotify, ContinuesWhenDescriptorsRunOut) {
 
 TEST_F(OrvaNotify, AnnouncesMountsAndUnmountsBelowShares) {
   Serve({"--watch"});
-  Listener client;
+  NotifyClient client;
   {
-    const Volume volume("/shares/My Photos");
+    const TmpfsMount volume("/shares/My Photos");
     EXPECT_EQ(client.ReadMessage(), Compose(Event::Plugged, "/shares/My Photos"));
     EXPECT_EQ(service_->ReadLineWith("seen"), "plugged seen: /shares/My Photos");
-    const Volume inner("/shares/My Photos/inner");
+    const TmpfsMount inner("/shares/My Photos/inner");
   }
   EXPECT_EQ(client.ReadMessage(), Compose(Event::Unplugged, "/shares/My Photos"));
   EXPECT_EQ(service_->ReadLineWith("seen"), "unplugged seen: /shares/My Photos");
 }
 
 TEST_F(OrvaNotify, AnnouncesMountedVolumesToANewClientFirst) {
-  const Volume b("/shares/B");
+  const TmpfsMount b("/shares/B");
   Serve({"--watch"});
-  const Volume a("/shares/A");
-  Listener client;
+  const TmpfsMount a("/shares/A");
+  NotifyClient client;
   EXPECT_EQ(RunNotify({"send", "scanned", "/shares/A"}).line, "sent to 1 client");
   std::vector<std::string> messages{client.ReadMessage(), client.ReadMessage()};
   std::ranges::sort(messages);
@@ -552,20 +642,20 @@ TEST_F(OrvaNotify, AnnouncesMountedVolumesToANewClientFirst) {
 }
 
 TEST_F(OrvaNotify, AnnouncesAMountOnTopOfAnother) {
-  const Volume lower("/shares/A");
+  const TmpfsMount lower("/shares/A");
   Serve({"--watch"});
-  Listener client;
+  NotifyClient client;
   EXPECT_EQ(client.ReadMessage(), Compose(Event::Plugged, "/shares/A"));
-  const Volume upper("/shares/A");
+  const TmpfsMount upper("/shares/A");
   EXPECT_EQ(client.ReadMessage(), Compose(Event::Unplugged, "/shares/A"));
   EXPECT_EQ(client.ReadMessage(), Compose(Event::Plugged, "/shares/A"));
 }
 
 TEST_F(OrvaNotify, AnnouncesNoMountsWithoutWatch) {
-  const Volume before("/shares/A");
+  const TmpfsMount before("/shares/A");
   Serve();
-  Listener client;
-  const Volume after("/shares/B");
+  NotifyClient client;
+  const TmpfsMount after("/shares/B");
   EXPECT_EQ(RunNotify({"send", "end", "/shares/C"}).line, "sent to 1 client");
   EXPECT_EQ(client.ReadMessage(), Compose(Event::End, "/shares/C"));
 }

@@ -3,19 +3,14 @@
 #include "PeakMemory.h"
 #include "ZophotosTest.h"
 
-#include "system/Deadline.h"
-
 #include <nlohmann/json.hpp>
 
 #include <algorithm>
-#include <chrono>
 #include <csignal>
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
 #include <memory>
-#include <stdexcept>
-#include <thread>
 
 namespace orva::test {
 namespace {
@@ -27,18 +22,6 @@ using ::testing::EndsWith;
 using ::testing::HasSubstr;
 using ::testing::MatchesRegex;
 
-/// How many times a process has gone to sleep.
-long Waits(pid_t pid) {
-  std::ifstream file("/proc/" + std::to_string(pid) + "/status");
-  const std::string name = "voluntary_ctxt_switches:";
-  for (std::string line; std::getline(file, line);) {
-    if (line.starts_with(name)) {
-      return std::stol(line.substr(name.size()));
-    }
-  }
-  throw std::runtime_error("no " + name + " of " + std::to_string(pid));
-}
-
 class ZophotosWatch : public ZophotosTest {
 protected:
   /// Starts a watch and waits for its first line.
@@ -47,17 +30,6 @@ protected:
     arguments.insert(arguments.end(), options.begin(), options.end());
     watch = std::make_unique<Program>(ZophotosCommand(arguments));
     first = watch->ReadLine();
-  }
-
-  /// Waits until the watch has looked, or tried to look, several times.
-  void AwaitLooks() const {
-    // It sleeps between two looks, and in a look that waits for a lock.
-    const long enough = Waits(watch->Pid()) + 8;
-    const auto end = std::chrono::steady_clock::now() + DEADLINE;
-    while (Waits(watch->Pid()) < enough) {
-      ASSERT_LT(std::chrono::steady_clock::now(), end) << "the watch does not look";
-      std::this_thread::yield();
-    }
   }
 
   /// The next line without its time.
@@ -171,11 +143,11 @@ TEST_F(ZophotosWatch, PrintsNothingWhileNothingChanges) {
   appliance.Barrier();
   const std::string locator = Appliance::Locator();
   std::ofstream(LOCATOR) << locator;
-  AwaitLooks();
+  AwaitLooks(*watch);
   onB.AddPhoto("Old/4.jpg", 7, 3002);
   Merge(b);
   EXPECT_THAT(Next(), HasSubstr(R"("event":"changed","folders_added":0)"));
-  AwaitLooks();
+  AwaitLooks(*watch);
   onB.AddPhoto("Old/5.jpg", 7, 3003);
   Merge(b);
   EXPECT_THAT(
@@ -202,7 +174,7 @@ TEST_F(ZophotosWatch, ReportsOnceThatTheDatabaseIsLost) {
   EXPECT_EQ(
       Next(),
       R"("event":"lost","reason":"no merged database: /tmp/zophotodbmerger.conf names no database at the moment"})");
-  AwaitLooks();
+  AwaitLooks(*watch);
   std::ofstream(LOCATOR) << locator;
   EXPECT_EQ(Next(), OPENED_A);
 }
@@ -234,7 +206,7 @@ TEST_F(ZophotosWatch, PrintsNothingForAShortLock) {
   Start({"--json", "--database", COPY});
   copy.Run("BEGIN EXCLUSIVE");
   copy.Run("DELETE FROM Files WHERE name = '1.jpg'");
-  AwaitLooks();
+  AwaitLooks(*watch);
   copy.Run("COMMIT");
   EXPECT_THAT(Next(), HasSubstr(R"("files_removed":1)"));
 }
@@ -245,7 +217,7 @@ TEST_F(ZophotosWatch, ReportsALongLockOnce) {
   copy.Run("BEGIN EXCLUSIVE");
   EXPECT_EQ(Next(), R"("event":"delayed","reason":")" + COPY +
                         R"( is locked, for example while a large merge commits; try again"})");
-  AwaitLooks();
+  AwaitLooks(*watch);
   copy.Run("DELETE FROM Files WHERE name = '1.jpg'");
   copy.Run("COMMIT");
   EXPECT_THAT(Next(), HasSubstr(R"("files_removed":1)"));

@@ -34,6 +34,7 @@ const std::vector<Arguments> COMMANDS{{},
                                       {"tree"},
                                       {"find", "*"},
                                       {"find", "-0", ""},
+                                      {"failed"},
                                       {"check"},
                                       {"export", "--csv"},
                                       {"export", "--jsonl"},
@@ -126,30 +127,30 @@ TEST_F(ZophotosLocator, IsNotReadToTheEndIfHuge) {
 
 TEST(ZophotosUsage, ErrorsHaveAStatusOfTheirOwn) {
   const std::vector<std::pair<Arguments, std::string>> wrong{
-      {{"destroy"}, "unknown command 'destroy'\n"},
-      {{"stats", "-l"}, "unknown command 'stats'; did you mean 'status'?\n"},
-      {{"help", "stat"}, "unknown command 'stat'; did you mean 'status'?\n"},
-      {{"help", "ls", "A"}, "unexpected argument 'A'"},
-      {{"ls", "--nonsense"}, "unknown option '--nonsense'\n"},
-      {{"ls", "--lang"}, "unknown option '--lang'; did you mean '--long'?\n"},
-      {{"--jsn", "ls"}, "unknown option '--jsn'; did you mean '--json'?\n"},
+      {{"destroy"}, "unknown command: 'destroy'\n"},
+      {{"stats", "-l"}, "unknown command: 'stats'; did you mean 'status'?\n"},
+      {{"help", "stat"}, "unknown command: 'stat'; did you mean 'status'?\n"},
+      {{"help", "ls", "A"}, "unexpected argument: 'A'"},
+      {{"ls", "--nonsense"}, "unknown option: --nonsense\n"},
+      {{"ls", "--lang"}, "unknown option: --lang; did you mean '--long'?\n"},
+      {{"--jsn", "ls"}, "unknown option: --jsn; did you mean '--json'?\n"},
       {{"find", "-rf"},
-       "'-rf'; to search for a name that begins with a dash: zophotos find -- '-rf'\n"},
-      {{"ls", "A", "B"}, "B"},
-      {{"status", "A"}, "A"},
-      {{"tree", "-L", "0"}, "--level: takes a number from 1 to 1000000, not '0'"},
+       "unknown option: -rf; to search for a name that begins with a dash: zophotos find -- '-rf'\n"},
+      {{"ls", "A", "B"}, "unexpected argument: 'B'"},
+      {{"status", "A"}, "unexpected argument: 'A'"},
+      {{"tree", "-L", "0"}, "option --level takes a number from 1 to 1000000, not '0'"},
       {{"tree", "-L", "x"}, "not 'x'"},
       {{"find"}, "PATTERN is required"},
-      {{"find", "a", "b"}, "b"},
-      {{"find", "--type", "x", "a"}, "--type: x not in {f,d}"},
+      {{"find", "a", "b"}, "unexpected argument: 'b'"},
+      {{"find", "--type", "x", "a"}, "option --type takes f or d, not 'x'"},
       {{"export", "--csv", "--jsonl"}, "--csv and --jsonl cannot be combined"},
       {{"--json", "export", "--csv"}, "--csv and --json cannot be combined"},
       {{"find", "-0", "--json", "x"}, "--null and --json cannot be combined"},
       {{"--json", "find", "--null", "x"}, "--null and --json cannot be combined"},
-      {{"--database"}, "--database"},
-      {{"--database", "", "status"}, "must not be empty"},
-      {{"--color", "red"}, "--color: red not in {auto,always,never}"},
-      {{"status", "check"}, "check"}};
+      {{"--database"}, "option --database needs a value"},
+      {{"--database", "", "status"}, "option --database must not be empty"},
+      {{"--color", "red"}, "option --color takes auto, always or never, not 'red'"},
+      {{"status", "check"}, "unexpected argument: 'check'"}};
   for (const auto& [arguments, message] : wrong) {
     SCOPED_TRACE(Text(arguments));
     const Outcome outcome = Zophotos(arguments);
@@ -175,7 +176,8 @@ TEST(ZophotosUsage, HelpNamesAllCommands) {
   for (const Arguments& arguments : {Arguments{"--help"}, Arguments{"-h"}, Arguments{"help"}}) {
     const Outcome help = Zophotos(arguments);
     EXPECT_EQ(0, help.status);
-    for (const char* const command : {"status", "ls", "tree", "find", "check", "watch", "export"}) {
+    for (const char* const command :
+         {"status", "ls", "tree", "find", "failed", "check", "watch", "export"}) {
       EXPECT_THAT(help.output, HasSubstr("\n  " + std::string(command) + " "));
       const Outcome more = Zophotos({command, "--help"});
       EXPECT_EQ(0, more.status);
@@ -313,6 +315,7 @@ TEST_F(ZophotosFailure, WriteAheadLogIsReportedAndNotCreated) {
 TEST_F(ZophotosFailure, UnwritableOutputIsReported) {
   std::vector<Arguments> commands = COMMANDS;
   commands.push_back({"watch"});
+  commands.push_back({"status", "-f"});
   commands.push_back({"--help"});
   for (const Arguments& command : commands) {
     SCOPED_TRACE(Text(command));
@@ -366,6 +369,9 @@ TEST_F(ZophotosFailure, NoCommandChangesTheDatabase) {
   }
   Program watch(ZophotosCommand({"watch"}));
   EXPECT_THAT(watch.ReadLine(), HasSubstr("watching"));
+  EXPECT_EQ(before, Snapshot("/shares/A/.zophotos"));
+  Program follow(ZophotosCommand({"status", "-f"}));
+  EXPECT_THAT(follow.ReadLineWith("TOTAL"), HasSubstr("57 %"));
   EXPECT_EQ(before, Snapshot("/shares/A/.zophotos"));
 }
 

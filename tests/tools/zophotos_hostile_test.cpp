@@ -1,25 +1,14 @@
 // Names and numbers of an untrusted database harm neither zophotos nor the terminal.
 
+#include "Terminal.h"
 #include "ZophotosTest.h"
-
-#include "orvautil/FileDescriptor.h"
-
-#include "system/Deadline.h"
 
 #include <nlohmann/json.hpp>
 
-#include <fcntl.h>
-#include <poll.h>
-#include <sys/ioctl.h>
-#include <unistd.h>
-
 #include <algorithm>
-#include <array>
-#include <chrono>
 #include <clocale>
 #include <cstdlib>
 #include <cwchar>
-#include <stdexcept>
 
 namespace orva::test {
 namespace {
@@ -31,43 +20,6 @@ using ::testing::HasSubstr;
 using ::testing::IsEmpty;
 using ::testing::Le;
 using ::testing::Not;
-
-/// A pseudo terminal of a given width.
-class Terminal {
-public:
-  explicit Terminal(int columns) : master_(posix_openpt(O_RDWR | O_NOCTTY | O_CLOEXEC)) {
-    const winsize size{.ws_row = 24,
-                       .ws_col = static_cast<unsigned short>(columns),
-                       .ws_xpixel = 0,
-                       .ws_ypixel = 0};
-    if (!master_ || grantpt(master_.Get()) != 0 || unlockpt(master_.Get()) != 0 ||
-        ioctl(master_.Get(), TIOCSWINSZ, &size) != 0) {
-      throw std::runtime_error("no pseudo terminal");
-    }
-  }
-
-  /// Runs zophotos with both outputs on the terminal, and returns the lines.
-  Lines Run(const Arguments& arguments) const {
-    Program program(ZophotosCommand(arguments), {.output = ptsname(master_.Get())});
-    std::string text;
-    std::array<char, 4096> chunk{};
-    pollfd ready{master_.Get(), POLLIN, 0};
-    const auto deadline = std::chrono::milliseconds(DEADLINE).count();
-    while (poll(&ready, 1, static_cast<int>(deadline)) == 1) {
-      const ssize_t size = read(master_.Get(), chunk.data(), chunk.size());
-      if (size <= 0) { // the program has closed it
-        break;
-      }
-      text.append(chunk.data(), static_cast<std::size_t>(size));
-    }
-    program.WaitForEnd();
-    std::erase(text, '\r');
-    return SplitLines(text);
-  }
-
-private:
-  util::FileDescriptor master_;
-};
 
 /// The number of columns of a text; -1 if it has a character that is not printable.
 int Columns(const std::string& text) {

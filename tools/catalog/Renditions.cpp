@@ -6,10 +6,10 @@
 
 #include "orvautil/FormatString.h"
 
+#include <limits>
+
 namespace orva::catalog {
 namespace {
-
-constexpr long long RENDITIONS_PER_FOLDER = 1000;
 
 /// Whether the catalog still describes `photo` as it was read.
 bool IsUnchanged(const db::DB& catalog, const WaitingPhoto& photo) {
@@ -49,11 +49,20 @@ void RemoveTombstone(const db::DB& catalog, const std::string& photo) {
 } // namespace
 
 std::vector<WaitingPhoto> NewestWaiting(const db::DB& catalog, std::size_t count) {
+  constexpr long long LAST = std::numeric_limits<long long>::max();
+  return NewestWaiting(catalog, count, {.id = LAST, .path = {}, .lastModifiedDate = LAST});
+}
+
+std::vector<WaitingPhoto> NewestWaiting(const db::DB& catalog, std::size_t count,
+                                        const WaitingPhoto& previous) {
   db::Statement statement(
       catalog, "SELECT id, path, lastModifiedDate, size FROM Files INDEXED BY Files_waiting "
                "WHERE category = 3 AND status = 1 AND isDeleted = 0 "
-               "ORDER BY lastModifiedDate DESC LIMIT ?");
-  statement.BindInt64(1, static_cast<long long>(count));
+               "AND (lastModifiedDate, id) < (?, ?) "
+               "ORDER BY lastModifiedDate DESC, id DESC LIMIT ?");
+  statement.BindTime(1, previous.lastModifiedDate);
+  statement.BindInt64(2, previous.id);
+  statement.BindInt64(3, static_cast<long long>(count));
   std::vector<WaitingPhoto> photos;
   while (statement.Fetch()) {
     photos.push_back({.id = statement.GetInt64(0),
@@ -117,6 +126,21 @@ std::vector<long long> RemovedFiles(const db::DB& catalog, std::size_t count) {
     files.push_back(statement.GetInt64(0));
   }
   return files;
+}
+
+std::vector<long long> ListedPhotos(const db::DB& catalog, long long first, std::size_t count) {
+  db::Statement statement(
+      catalog, "SELECT id FROM Files WHERE id >= ? AND category = 3 AND isDeleted = 0 "
+               "AND EXISTS (SELECT 1 FROM Transcodings WHERE sourceId = Files.id AND profile = ? "
+               "AND Transcodings.status = 1) ORDER BY id LIMIT ?");
+  statement.BindInt64(1, first);
+  statement.BindText(2, PROFILE);
+  statement.BindInt64(3, static_cast<long long>(count));
+  std::vector<long long> photos;
+  while (statement.Fetch()) {
+    photos.push_back(statement.GetInt64(0));
+  }
+  return photos;
 }
 
 bool IsOnVolume(const db::DB& catalog, long long fileId) {

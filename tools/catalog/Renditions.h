@@ -22,8 +22,11 @@ struct WaitingPhoto {
   long long size = 0; ///< bytes
 };
 
-/// At most `count` photos that wait, the newest first.
+/// At most `count` photos that wait, the newest first: all, or those that follow `previous` in this
+/// order.
 std::vector<WaitingPhoto> NewestWaiting(const db::DB& catalog, std::size_t count);
+std::vector<WaitingPhoto> NewestWaiting(const db::DB& catalog, std::size_t count,
+                                        const WaitingPhoto& previous);
 
 /// How many photos wait, and how many have failed.
 long long CountWaiting(const db::DB& catalog);
@@ -45,6 +48,10 @@ void MarkMissing(const db::DB& catalog, long long fileId);
 /// At most `count` files that are gone and may still have a rendition.
 std::vector<long long> RemovedFiles(const db::DB& catalog, std::size_t count);
 
+/// At most `count` ids from `first` on, in order, of the photos that merged databases list: their
+/// renditions must be in their places.
+std::vector<long long> ListedPhotos(const db::DB& catalog, long long first, std::size_t count);
+
 /// Whether the file is on the volume: its rendition must not be removed.
 bool IsOnVolume(const db::DB& catalog, long long fileId);
 
@@ -52,8 +59,9 @@ bool IsOnVolume(const db::DB& catalog, long long fileId);
 void ForgetRemovedFile(const db::DB& catalog, long long fileId);
 
 /// Folder of the renditions and path of a file's rendition, relative to the volume. A folder has at
-/// most 1,000 renditions: some file systems allow only 65,536 entries.
+/// most RENDITIONS_PER_FOLDER: some file systems allow only 65,536 entries.
 inline constexpr char RENDITIONS[] = ".orva/renditions";
+inline constexpr long long RENDITIONS_PER_FOLDER = 1000;
 std::string RenditionFolder(long long fileId);
 std::string RenditionPath(long long fileId);
 

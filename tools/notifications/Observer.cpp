@@ -34,12 +34,10 @@ constexpr std::string_view DELIMITER_TEXT("\0\0\0\0", DELIMITER.size());
 constexpr long RETRY_NANOSECONDS = 100'000'000;
 constexpr int MOST_ATTEMPTS = 50;
 
-constexpr std::array EVENTS = {std::pair{"Plugged", Event::Plugged},
-                               std::pair{"Unplugged", Event::Unplugged},
-                               std::pair{"Scanned", Event::Scanned},
-                               std::pair{"TranscodedBatch", Event::TranscodedBatch},
-                               std::pair{"End", Event::End},
-                               std::pair{"Purged", Event::Purged}};
+constexpr std::array EVENTS = {
+    std::pair{"Plugged", Event::Plugged}, std::pair{"Unplugged", Event::Unplugged},
+    std::pair{"Scanned", Event::Scanned}, std::pair{"TranscodedBatch", Event::TranscodedBatch},
+    std::pair{"End", Event::End},         std::pair{"Purged", Event::Purged}};
 
 /// Reads single messages.
 class MessageReader : public util::MessageProcessor {
@@ -66,8 +64,7 @@ public:
     }
     const auto* const attributes = root.getAttributes();
     const std::string name = util::GetAttributeValue("Name", attributes);
-    std::string mountPoint =
-        util::Decodestring(util::GetAttributeValue("MountPoint", attributes));
+    std::string mountPoint = util::Decodestring(util::GetAttributeValue("MountPoint", attributes));
     if (!mountPoint.starts_with('/')) {
       return;
     }
@@ -78,8 +75,7 @@ public:
       if (name == text) {
         notification_ = {.event = event,
                          .mountPoint = std::move(mountPoint),
-                         .isDirectory =
-                             util::GetAttributeValue("Kind", attributes) == "directory"};
+                         .isDirectory = util::GetAttributeValue("Kind", attributes) == "directory"};
         return;
       }
     }

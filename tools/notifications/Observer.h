@@ -22,7 +22,7 @@ struct Notification {
   };
 
   Event event = Event::Connected;
-  std::string mountPoint{};       ///< ends in "/"
+  std::string mountPoint{}; ///< ends in "/"
   bool isDirectory = false; ///< Plugged: the volume is a plain directory, not a mount point
 };
 

@@ -13,10 +13,7 @@ constexpr long long MAXIMUM_COUNT = 1'000'000'000;
 class Parser {
 public:
   Parser() {
-    app_.require_subcommand(0, 1);
-    app_.fallthrough();
-    app_.set_version_flag("--version", "orva-catalog " PROGRAM_VERSION);
-    app_.option_defaults()->multi_option_policy(CLI::MultiOptionPolicy::TakeLast);
+    commandline::SetUp(app_);
     app_.footer(
         "Exit status: 0 done; 1 failed, the catalog's content is unchanged; 2 wrong command "
         "line.\nSee orva-catalog(1).");
@@ -63,13 +60,13 @@ private:
                          "unique: every photo has its own name;\n"
                          "camera: every folder has the same names, IMG_0001.JPG and so on")
             ->type_name("unique|camera")
-            ->check(CLI::IsMember({"unique", "camera"}).description("")),
+            ->check(commandline::OneOf({"unique", "camera"})),
         generate_
             ->add_option("--tree", tree_,
                          "flat: all folders are directly in the volume;\n"
                          "deep: every folder contains eight more")
             ->type_name("flat|deep")
-            ->check(CLI::IsMember({"flat", "deep"}).description(""))};
+            ->check(commandline::OneOf({"flat", "deep"}))};
     generate_->add_flag("--restamp", restamp_,
                         "Keep the content; give every transcoding a new stamp");
     generate_->footer("Without --restamp, all other options are required.");

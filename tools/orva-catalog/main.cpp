@@ -3,6 +3,7 @@
 #include "Indexer.h"
 #include "Options.h"
 
+#include "commandline/Count.h"
 #include "commandline/UsageError.h"
 
 #include "orvadb/VolumeDB.h"
@@ -24,6 +25,7 @@
 namespace {
 
 using namespace orva;
+using commandline::Count;
 
 /// The volume's mount point with all links resolved. Throws when it is not a directory.
 std::string FindVolume(const std::string& mountPoint) {
@@ -32,6 +34,12 @@ std::string FindVolume(const std::string& mountPoint) {
     throw util::Exception(mountPoint + " is not a directory");
   }
   return volume;
+}
+
+/// "1 folder, 2 files, 1 photo"
+std::string Contents(const catalog::IndexSummary& summary) {
+  return Count(summary.folders, "folder") + ", " + Count(summary.files, "file") + ", " +
+         Count(summary.photos, "photo");
 }
 
 /// A line on the terminal that shows the progress of a run. It is erased at the end.
@@ -52,8 +60,7 @@ public:
       return;
     }
     shown_ = now;
-    std::cerr << "\r\033[K" << summary.folders << " folders, " << summary.files << " files, "
-              << summary.photos << " photos" << std::flush;
+    std::cerr << "\r\033[K" << Contents(summary) << std::flush;
   }
 
 private:
@@ -74,8 +81,7 @@ void Index(const std::string& volume) {
   for (const std::string& message : summary.unreadable) {
     std::cerr << "orva-catalog: not updated, cannot be read: " << message << '\n';
   }
-  std::cout << volume << ": " << summary.folders << " folders, " << summary.files << " files, "
-            << summary.photos << " photos; files: " << summary.added << " added, "
+  std::cout << volume << ": " << Contents(summary) << "; files: " << summary.added << " added, "
             << summary.changed << " changed, " << summary.deleted << " deleted, " << summary.revived
             << " revived\n";
 }
@@ -84,7 +90,8 @@ void Generate(const std::string& volume, const catalog::GeneratorPlan& plan) {
   const auto database = catalog::OpenCatalog(volume);
   const long long folders = catalog::Generate(*database, plan, std::time(nullptr));
   catalog::Checkpoint(*database);
-  std::cout << volume << ": generated " << plan.files << " photos in " << folders << " folders\n";
+  std::cout << volume << ": generated " << Count(plan.files, "photo") << " in "
+            << Count(folders, "folder") << '\n';
 }
 
 void Restamp(const std::string& volume) {
@@ -94,7 +101,7 @@ void Restamp(const std::string& volume) {
   const auto database = catalog::OpenCatalog(volume);
   const long long count = catalog::Restamp(*database, std::time(nullptr));
   catalog::Checkpoint(*database);
-  std::cout << volume << ": stamped " << count << " transcodings again\n";
+  std::cout << volume << ": stamped " << Count(count, "transcoding") << " again\n";
 }
 
 void Run(const catalog::Options& options) {
@@ -120,8 +127,8 @@ int main(int argc, char** argv) {
     }
     return 0;
   } catch (const commandline::UsageError& error) {
-    std::cerr << "orva-catalog: " << error.what() << "\nTry 'orva-catalog --help'.\n";
-    return 2;
+    commandline::Report(error);
+    return commandline::EXIT_USAGE;
   } catch (const std::exception& error) {
     std::cerr << "orva-catalog: " << error.what() << '\n';
   } catch (const std::string& error) { // the database layer's

@@ -1,21 +1,38 @@
 #include "orva-notify/CommandLine.h"
 
 #include "commandline/Parse.h"
+#include "commandline/Suggestion.h"
+#include "orva-notify/MountInfo.h"
+
+#include <filesystem>
 
 namespace orva::notify {
 namespace {
 
 using Action = CommandLine::Action;
+using commandline::UsageError;
 
 constexpr long long MAXIMUM_NUMBER = 100'000;
+
+/// Why `directory` cannot be a volume; empty if it can.
+std::string WhyNoVolume(const std::string& directory) {
+  const std::filesystem::path path(directory);
+  if (!path.is_absolute()) {
+    return "must be an absolute path, not '" + directory + "'";
+  }
+  if (path.lexically_normal().native() != directory ||
+      (directory.size() > 1 && directory.ends_with('/'))) {
+    return "must not contain '.', '..', '//' or a '/' at the end: '" + directory + "'";
+  }
+  return IsDirectlyBelowShares(directory)
+             ? ""
+             : "must be directly below /shares, not '" + directory + "'";
+}
 
 class Parser {
 public:
   Parser() {
-    app_.require_subcommand(0, 1);
-    app_.fallthrough();
-    app_.set_version_flag("--version", "orva-notify " PROGRAM_VERSION);
-    app_.option_defaults()->multi_option_policy(CLI::MultiOptionPolicy::TakeLast);
+    commandline::SetUp(app_);
     app_.footer("Exit status: 0 done; 1 failed (no service listens, too few clients); 2 wrong "
                 "command line.\nSee orva-notify(1).");
     AddServe();
@@ -43,36 +60,57 @@ private:
         app_.add_subcommand("serve", "Listen on the notification socket and send every client the "
                                      "messages of\n'send', until SIGINT or SIGTERM");
     serve->add_flag("--watch", command_.watch,
-                    "Also announce mounts and unmounts directly below /shares;\n"
-                    "a new client first receives the mounted volumes");
-    serve->footer("Prints a line for each event.");
+                    "Also announce mounts and unmounts directly below /shares");
+    serve
+        ->add_option("--volume", command_.directories,
+                     "Announce DIR, a plain directory directly below /shares,\n"
+                     "as a volume while it exists; may be repeated")
+        ->type_name("DIR")
+        ->allow_extra_args(false)
+        ->multi_option_policy(CLI::MultiOptionPolicy::TakeAll)
+        ->check(WhyNoVolume);
+    serve->footer("A new client first receives what was announced of the volumes.\n"
+                  "Prints a line for each event.");
   }
 
   void AddSend() {
     send_ = app_.add_subcommand("send", "Announce an event of a volume to every client");
     CLI::Option* const event =
         send_->add_option("EVENT", event_, "plugged, unplugged, scanned, transcoded, end or purged")
-            ->type_name("")
-            ->check([](const std::string& word) {
-              return EventFromWord(word) ? std::string() : "unknown event '" + word + "'";
-            });
+            ->type_name("");
     CLI::Option* const mountPoint =
-        send_->add_option("MOUNT", command_.mountPoint, "Mount point of the volume")->type_name("");
+        send_->add_option("MOUNT", command_.mountPoint, "Mount point of the volume, absolute")
+            ->type_name("")
+            ->check([](const std::string& path) {
+              return path.starts_with('/')
+                         ? std::string()
+                         : "must be an absolute path such as /shares/Photos, not '" + path + "'";
+            });
     CLI::Option* const rawFile =
         send_
             ->add_option("--raw", command_.rawFile,
                          "Send the bytes of FILE (-: standard input) as one message instead")
             ->type_name("FILE")
             ->check(commandline::NotEmpty());
-    send_->callback([event, mountPoint, rawFile] {
+    send_->callback([this, event, mountPoint, rawFile] {
       const bool isRaw = rawFile->count() > 0;
-      if (isRaw && event->count() > 0) {
-        throw CLI::ExcludesError(rawFile->get_name(), event->get_name());
+      const bool hasEvent = event->count() > 0;
+      if (isRaw && hasEvent) {
+        throw UsageError("EVENT and --raw cannot be combined");
       }
-      if (!isRaw && mountPoint->count() == 0) {
-        throw CLI::ValidationError("send", "takes an event and a mount point, or --raw FILE");
+      if (!isRaw && !hasEvent) {
+        throw UsageError("EVENT and MOUNT are required, or --raw FILE");
+      }
+      if (hasEvent && !EventFromWord(event_)) {
+        throw UsageError("unknown event: '" + event_ + "'" +
+                         commandline::DidYouMean(event_, EventWords()));
+      }
+      if (hasEvent && mountPoint->count() == 0) {
+        throw UsageError("MOUNT is required");
       }
     });
+    send_->add_flag("--handled", command_.handled,
+                    "Return only when every client has handled the message");
     AddRequestOptions(*send_);
   }
 
@@ -95,7 +133,8 @@ private:
         ->capture_default_str()
         ->transform(commandline::Decimal(0, MAXIMUM_NUMBER));
     request.footer("Returns when the message is queued for every client, or, for drop, when all "
-                   "connections are\nclosed, and prints the number of clients.");
+                   "connections are\nclosed, and prints the number of clients. Observers are not "
+                   "counted.");
   }
 
   CLI::App app_{"Stands in for the appliance's notification service on machines without the "

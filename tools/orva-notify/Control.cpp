@@ -1,6 +1,5 @@
 #include "orva-notify/Control.h"
 
-#include "orva-notify/Client.h"
 #include "orvautil/ClientSocket.h"
 #include "orvautil/Exception.h"
 #include "orvautil/FormatString.h"
@@ -12,6 +11,7 @@
 #include <cstring>
 #include <sstream>
 #include <string_view>
+#include <utility>
 #include <vector>
 
 namespace orva::notify {
@@ -23,8 +23,8 @@ constexpr std::size_t MAXIMUM_HEADER = 64;
 
 std::string Encode(const Request& request) {
   return (request.kind == Request::Kind::Send ? "send " : "drop ") +
-         std::to_string(request.clients) + ' ' + std::to_string(request.message.size()) + '\n' +
-         request.message;
+         std::to_string(request.clients) + ' ' + std::to_string(request.message.size()) +
+         (request.raw ? " raw" : "") + (request.handled ? " handled" : "") + '\n' + request.message;
 }
 
 /// Waits for `events`. Returns false when `deadline` has passed.
@@ -75,10 +75,19 @@ std::optional<std::string> ReceiveLine(util::Socket& socket, Clock::time_point d
 [[noreturn]] void ThrowTooLate(const Request& request, std::chrono::seconds wait) {
   throw util::Exception(
       request.clients == 0
-          ? util::FormatString("No answer from the notification service within %lld s",
+          ? util::FormatString("no answer from the notification service within %lld s",
                                static_cast<long long>(wait.count()))
-          : util::FormatString("Fewer than %zu clients connected within %lld s", request.clients,
+          : util::FormatString("fewer than %zu clients connected within %lld s", request.clients,
                                static_cast<long long>(wait.count())));
+}
+
+/// The number in the next line of the answer; nothing when the deadline has passed.
+std::optional<std::size_t> ReceiveCount(util::Socket& socket, Clock::time_point deadline) {
+  const auto line = ReceiveLine(socket, deadline);
+  if (line && line->empty()) {
+    throw util::Exception("the notification service closed the connection without an answer");
+  }
+  return line ? std::optional(std::stoul(*line)) : std::nullopt;
 }
 
 } // namespace
@@ -89,26 +98,32 @@ std::string ControlAddress(const std::string& address) {
 
 std::size_t Ask(const std::string& address, const Request& request, std::chrono::seconds wait) {
   if (request.message.size() > MAXIMUM_QUEUED_BYTES) {
-    throw util::Exception(util::FormatString("A message of %zu bytes is too long, %zu are allowed",
+    throw util::Exception(util::FormatString("a message of %zu bytes is too long, %zu are allowed",
                                              request.message.size(), MAXIMUM_QUEUED_BYTES));
   }
   const auto deadline = Clock::now() + wait;
   util::ClientSocket socket(util::Socket::Address(ControlAddress(address)), true);
   if (!socket.IsOpen()) {
     throw util::Exception(
-        util::FormatString("No orva-notify serves %s: %s", address.c_str(), strerror(errno)));
+        util::FormatString("no orva-notify serves %s: %s", address.c_str(), strerror(errno)));
   }
   if (!SendAll(socket, Encode(request), deadline)) {
     ThrowTooLate(request, wait);
   }
-  const auto answer = ReceiveLine(socket, deadline);
-  if (!answer) {
+  const auto reached = ReceiveCount(socket, deadline);
+  if (!reached) {
     ThrowTooLate(request, wait);
   }
-  if (answer->empty()) {
-    throw util::Exception("The notification service closed the connection without an answer");
+  if (!request.handled) {
+    return *reached;
   }
-  return std::stoul(*answer);
+  const auto handled = ReceiveCount(socket, deadline);
+  if (!handled) {
+    throw util::Exception(
+        util::FormatString("sent, but not yet handled by all clients within %lld s",
+                           static_cast<long long>(wait.count())));
+  }
+  return *handled;
 }
 
 void ControlConnection::ReadAvailable() {
@@ -117,7 +132,7 @@ void ControlConnection::ReadAvailable() {
   if (count == -1 && IsTemporary(errno)) {
     return;
   }
-  if (count <= 0 || complete_) {
+  if (count <= 0 || complete_ || handling_) {
     Close();
     return;
   }
@@ -147,15 +162,33 @@ bool ControlConnection::ReadHeader() {
     return false;
   }
   request.kind = kind == "send" ? Request::Kind::Send : Request::Kind::Drop;
+  for (std::string word; header >> word;) {
+    request.raw = request.raw || word == "raw";
+    request.handled = request.handled || word == "handled";
+  }
   arriving_ = request;
   input_.erase(0, end + 1);
   return true;
 }
 
 void ControlConnection::Answer(std::size_t count) {
-  const std::string answer = std::to_string(count) + '\n';
-  static_cast<void>(Write(answer.data(), static_cast<unsigned>(answer.size())));
+  WriteLine(count);
   Close();
+}
+
+void ControlConnection::AwaitHandling(std::size_t count, std::shared_ptr<const Handling> handling) {
+  WriteLine(count);
+  handling_ = std::move(handling);
+  complete_.reset();
+}
+
+std::optional<std::size_t> ControlConnection::Handled() const {
+  return handling_ && handling_.use_count() == 1 ? std::optional(handling_->handled) : std::nullopt;
+}
+
+void ControlConnection::WriteLine(std::size_t count) {
+  const std::string line = std::to_string(count) + '\n';
+  static_cast<void>(Write(line.data(), static_cast<unsigned>(line.size())));
 }
 
 } // namespace orva::notify

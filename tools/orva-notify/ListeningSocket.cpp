@@ -2,7 +2,6 @@
 
 #include "orvautil/ClientSocket.h"
 #include "orvautil/Exception.h"
-#include "orvautil/FormatString.h"
 
 #include <sys/stat.h>
 #include <unistd.h>
@@ -10,6 +9,7 @@
 #include <cerrno>
 #include <cstring>
 #include <filesystem>
+#include <system_error>
 #include <utility>
 
 namespace orva::notify {
@@ -24,6 +24,14 @@ bool IsSocket(const std::string& path) {
   return lstat(path.c_str(), &status) == 0 && S_ISSOCK(status.st_mode);
 }
 
+void MakeDirectory(const std::filesystem::path& directory) {
+  std::error_code error;
+  std::filesystem::create_directories(directory, error);
+  if (error) {
+    throw util::Exception("cannot create " + directory.native() + ": " + error.message());
+  }
+}
+
 // The socket of a service that was killed refuses connections.
 void RemoveStaleSocket(const std::string& path) {
   const util::ClientSocket probe(util::Socket::Address(path), true);
@@ -32,13 +40,25 @@ void RemoveStaleSocket(const std::string& path) {
   }
 }
 
+/// Why `address` cannot be bound, and what to do.
+std::string Explain(const std::string& address, int error) {
+  if (error != EADDRINUSE) {
+    return strerror(error);
+  }
+  if (IsPath(address) && !IsSocket(address)) {
+    return "there is a file that is not a socket; remove it";
+  }
+  return "another service listens there; end it first (the installed one: systemctl stop "
+         "orva-notify)";
+}
+
 } // namespace
 
 ListeningSocket::ListeningSocket(std::string address)
     : Socket(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0)),
       address_(std::move(address)) {
   if (IsPath(address_)) {
-    std::filesystem::create_directories(std::filesystem::path(address_).parent_path());
+    MakeDirectory(std::filesystem::path(address_).parent_path());
     RemoveStaleSocket(address_);
   }
   Bind();
@@ -54,9 +74,8 @@ void ListeningSocket::Bind() {
   const Address address(address_);
   isBound_ = bind(Descriptor(), address.Get(), address.Length()) == 0;
   if (!isBound_ || listen(Descriptor(), SOMAXCONN) != 0) {
-    const char* const reason =
-        errno == EADDRINUSE ? "something else is there, perhaps another service" : strerror(errno);
-    throw util::Exception(util::FormatString("Cannot listen on %s: %s", address_.c_str(), reason));
+    const std::string reason = Explain(address_, errno);
+    throw util::Exception("cannot listen on " + address_ + ": " + reason);
   }
 }
 

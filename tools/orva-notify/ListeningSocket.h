@@ -12,7 +12,7 @@ class ListeningSocket : public util::Socket {
 public:
   /// Listens on `address`, a text for Socket::Address. Creates the directory of a path, and
   /// replaces a socket that no process listens on any more. Throws util::Exception, also when
-  /// another process listens there, and std::filesystem::filesystem_error.
+  /// another process listens there.
   explicit ListeningSocket(std::string address);
 
   /// Removes the socket's file.

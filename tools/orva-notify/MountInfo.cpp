@@ -28,12 +28,6 @@ std::string DecodeOctal(const std::string& text) {
   return decoded;
 }
 
-bool IsDirectlyBelowShares(const std::string& mountPoint) {
-  const std::string start = SHARES + "/";
-  return mountPoint.size() > start.size() && mountPoint.starts_with(start) &&
-         mountPoint.find('/', start.size()) == std::string::npos;
-}
-
 /// The mount points of the mounts that are in `volumes` and not in `others`.
 std::vector<std::string> MountPointsOnlyIn(const Volumes& volumes, const Volumes& others) {
   std::vector<std::string> mountPoints;
@@ -47,6 +41,12 @@ std::vector<std::string> MountPointsOnlyIn(const Volumes& volumes, const Volumes
 }
 
 } // namespace
+
+bool IsDirectlyBelowShares(const std::string& path) {
+  const std::string start = SHARES + "/";
+  return path.size() > start.size() && path.starts_with(start) &&
+         path.find('/', start.size()) == std::string::npos;
+}
 
 Volumes ReadVolumes(std::istream& mountInfo) {
   Volumes volumes;

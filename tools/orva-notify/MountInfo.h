@@ -10,6 +10,9 @@ namespace orva::notify {
 /// The mounted volumes: mount points with the identifiers of their mounts.
 using Volumes = std::map<std::string, int>;
 
+/// Whether `path`, which is canonical, is directly below /shares.
+bool IsDirectlyBelowShares(const std::string& path);
+
 /// Reads a table in the format of /proc/self/mountinfo. Returns the visible mount points directly
 /// below /shares. Malformed lines are skipped.
 Volumes ReadVolumes(std::istream& mountInfo);

@@ -1,5 +1,7 @@
 #include "orva-notify/Notification.h"
 
+#include "orvautil/Decodestring.h"
+
 #include <algorithm>
 #include <array>
 #include <string_view>
@@ -22,8 +24,17 @@ constexpr std::array<EventText, 6> EVENT_TEXTS = {{
     {Event::Purged, "purged", "Purged"},
 }};
 
+constexpr std::string_view START = "<ORVANotification Name=\"";
+constexpr std::string_view MOUNT_POINT = "\" MountPoint=\"";
+constexpr std::string_view DIRECTORY = " Kind=\"directory\"";
+
 std::string_view NameOf(Event event) {
   return std::ranges::find(EVENT_TEXTS, event, &EventText::event)->name;
+}
+
+/// The text up to the mount point.
+std::string StartOf(std::string_view name) {
+  return std::string(START).append(name).append(MOUNT_POINT);
 }
 
 bool IsPlain(char c) {
@@ -53,13 +64,47 @@ std::optional<Event> EventFromWord(const std::string& word) {
   return text == EVENT_TEXTS.end() ? std::nullopt : std::optional(text->event);
 }
 
+std::vector<std::string> EventWords() {
+  std::vector<std::string> words;
+  words.reserve(EVENT_TEXTS.size());
+  for (const EventText& text : EVENT_TEXTS) {
+    words.emplace_back(text.word);
+  }
+  return words;
+}
+
 std::string Compose(Event event, const std::string& mountPoint) {
-  const std::string start = "<ORVANotification Name=\"" + std::string(NameOf(event)) +
-                            "\" MountPoint=\"" + PercentEncode(mountPoint) + "\"";
+  return Compose({.event = event, .mountPoint = mountPoint});
+}
+
+std::string Compose(const Announcement& announcement) {
+  const auto& [event, mountPoint, kind] = announcement;
+  const std::string start = StartOf(NameOf(event)) + PercentEncode(mountPoint) + '"';
   if (event == Event::TranscodedBatch) {
     return start + "><profile>" + TRANSCODING_PROFILE + "</profile></ORVANotification>";
   }
-  return start + "/>";
+  const bool isDirectory = event == Event::Plugged && kind == VolumeKind::Directory;
+  return start + std::string(isDirectory ? DIRECTORY : "") + "/>";
+}
+
+std::optional<Announcement> Recognize(const std::string& message) {
+  for (const auto& text : EVENT_TEXTS) {
+    const std::string start = StartOf(text.name);
+    if (!message.starts_with(start)) {
+      continue;
+    }
+    const auto end = message.find('"', start.size());
+    Announcement announcement{
+        .event = text.event,
+        .mountPoint = util::Decodestring(message.substr(start.size(), end - start.size()))};
+    for (const auto kind : {VolumeKind::Mount, VolumeKind::Directory}) {
+      announcement.kind = kind;
+      if (Compose(announcement) == message) {
+        return announcement;
+      }
+    }
+  }
+  return std::nullopt;
 }
 
 std::string Frame(const std::string& message) {

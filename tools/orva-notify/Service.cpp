@@ -1,18 +1,19 @@
 #include "orva-notify/Service.h"
 
+#include "commandline/Count.h"
 #include "orva-notify/Notification.h"
 #include "orvautil/Exception.h"
 #include "orvautil/FormatString.h"
 
-#include <fcntl.h>
 #include <poll.h>
+#include <sys/epoll.h>
 #include <sys/signalfd.h>
 
 #include <algorithm>
+#include <array>
 #include <cerrno>
 #include <csignal>
 #include <cstring>
-#include <fstream>
 #include <iostream>
 #include <utility>
 
@@ -20,8 +21,6 @@ namespace orva::notify {
 namespace {
 
 using util::FormatString;
-
-const char* const MOUNT_INFO = "/proc/self/mountinfo";
 
 void Print(const std::string& line) {
   std::cout << line << std::endl;
@@ -37,12 +36,12 @@ std::string Printable(const std::string& text) {
 }
 
 std::string CountOfClients(std::size_t count) {
-  return std::to_string(count) + (count == 1 ? " client" : " clients");
+  return commandline::Count(static_cast<long long>(count), "client");
 }
 
 util::FileDescriptor CheckedDescriptor(int descriptor, const char* what) {
   if (descriptor == -1) {
-    throw util::Exception(FormatString("Cannot open %s: %s", what, strerror(errno)));
+    throw util::Exception(FormatString("cannot open %s: %s", what, strerror(errno)));
   }
   return util::FileDescriptor(descriptor);
 }
@@ -56,11 +55,6 @@ util::FileDescriptor CatchStopSignals() {
   return CheckedDescriptor(signalfd(-1, &signals, SFD_NONBLOCK | SFD_CLOEXEC), "signals");
 }
 
-util::FileDescriptor OpenMountInfo(bool watch) {
-  return watch ? CheckedDescriptor(open(MOUNT_INFO, O_RDONLY | O_CLOEXEC), MOUNT_INFO)
-               : util::FileDescriptor();
-}
-
 template <typename Connection>
 std::size_t EraseClosed(std::vector<std::unique_ptr<Connection>>& connections) {
   return std::erase_if(connections, [](const auto& connection) { return !connection->IsOpen(); });
@@ -68,17 +62,19 @@ std::size_t EraseClosed(std::vector<std::unique_ptr<Connection>>& connections) {
 
 } // namespace
 
-Service::Service(const std::string& address, bool watch)
+Service::Service(const std::string& address, bool watch,
+                 const std::vector<std::string>& directories)
     : address_(address), signals_(CatchStopSignals()), control_(ControlAddress(address)),
-      notification_(address), mountInfo_(OpenMountInfo(watch)) {}
+      notification_(address), volumes_(watch, directories),
+      readers_(CheckedDescriptor(epoll_create1(EPOLL_CLOEXEC), "epoll")) {}
 
 // Each turn tries every descriptor. Requests are read first and performed last: a client that
-// connected or a volume that was mounted before a request is thus handled before it.
+// connected or a volume that was plugged before a request is thus handled before it.
 void Service::Run() {
   Print("listening on " + address_);
   while (!IsAskedToStop()) {
     ReadRequests();
-    FollowMounts();
+    FollowVolumes();
     AcceptClients();
     ServeClients();
     PerformRequests();
@@ -98,19 +94,29 @@ void Service::Wait() {
     descriptors.push_back({.fd = descriptor, .events = static_cast<short>(events), .revents = 0});
   };
   add(signals_.Get(), POLLIN);
-  add(mountInfo_.Get(), POLLPRI); // poll() ignores it when it is none
+  add(volumes_.MountTable(), POLLPRI); // poll() ignores -1
+  add(volumes_.DirectoryEvents(), POLLIN);
+  add(readers_.Get(), POLLIN);
   if (!isFull_) {
     add(control_.Descriptor(), POLLIN);
     add(notification_.Descriptor(), POLLIN);
   }
   for (const auto& client : clients_) {
-    add(client->Descriptor(), client->QueuedBytes() > 0 ? POLLIN | POLLOUT : POLLIN);
+    if (client->AwaitsReader()) {
+      client->ReportReading(readers_.Get());
+    }
+    add(client->Descriptor(), client->AwaitsSpace() ? POLLIN | POLLOUT : POLLIN);
   }
   for (const auto& request : requests_) {
     add(request->Descriptor(), POLLIN);
   }
   if (poll(descriptors.data(), descriptors.size(), -1) == -1 && errno != EINTR) {
-    throw util::Exception(FormatString("Cannot wait for clients: %s", strerror(errno)));
+    throw util::Exception(FormatString("cannot wait for clients: %s", strerror(errno)));
+  }
+  // Each event is taken before ServeClients() looks at the clients, so that a later one is not
+  // lost.
+  std::array<epoll_event, 16> events;
+  while (epoll_wait(readers_.Get(), events.data(), events.size(), 0) > 0) {
   }
 }
 
@@ -123,22 +129,20 @@ void Service::ReadRequests() {
   }
 }
 
-void Service::FollowMounts() {
-  if (!mountInfo_) {
-    return;
+void Service::FollowVolumes() {
+  const auto changes = volumes_.TakeChanges();
+  const auto plugged = std::ranges::find(changes, Event::Plugged, &Announcement::event);
+  for (auto change = changes.begin(); change != plugged; ++change) {
+    Print("unplugged seen: " + Printable(change->mountPoint));
+    Announce(*change);
   }
-  std::ifstream table(MOUNT_INFO);
-  const Volumes now = ReadVolumes(table);
-  const VolumeChanges changes = Compare(volumes_, now);
-  for (const auto& mountPoint : changes.unplugged) {
-    Print("unplugged seen: " + Printable(mountPoint));
-    SendToAll(Compose(Event::Unplugged, mountPoint));
+  if (plugged != changes.begin()) {
+    SendEnds();
   }
-  for (const auto& mountPoint : changes.plugged) {
-    Print("plugged seen: " + Printable(mountPoint));
-    SendToAll(Compose(Event::Plugged, mountPoint));
+  for (auto change = plugged; change != changes.end(); ++change) {
+    Print("plugged seen: " + Printable(change->mountPoint));
+    Announce(*change);
   }
-  volumes_ = now;
 }
 
 void Service::AcceptClients() {
@@ -146,8 +150,8 @@ void Service::AcceptClients() {
     clients_.push_back(std::make_unique<Client>(std::move(connection), ++lastNumber_));
     Client& client = *clients_.back();
     Print(FormatString("client %u connected", client.Number()));
-    for (const auto& [mountPoint, id] : volumes_) {
-      const std::string message = Compose(Event::Plugged, mountPoint);
+    for (const auto& announcement : memory_.Replay()) {
+      const std::string message = Compose(announcement);
       Queue(client, std::make_shared<const std::string>(Frame(message)));
       Print(FormatString("sent to client %u: %s", client.Number(), message.c_str()));
     }
@@ -156,8 +160,12 @@ void Service::AcceptClients() {
 
 void Service::ServeClients() {
   for (const auto& client : clients_) {
-    client->SendQueued();
+    const bool wasObserver = client->IsObserver();
     client->DiscardInput();
+    if (client->IsObserver() && !wasObserver) {
+      Print(FormatString("client %u is an observer", client->Number()));
+    }
+    client->SendQueued();
   }
   ForgetClosed();
 }
@@ -165,8 +173,12 @@ void Service::ServeClients() {
 void Service::PerformRequests() {
   for (const auto& request : requests_) {
     const auto& received = request->Received();
-    if (request->IsOpen() && received && clients_.size() >= received->clients) {
-      request->Answer(Perform(*received));
+    if (request->IsOpen() && received && CountClients() >= received->clients) {
+      Perform(*request);
+    }
+    if (const auto handled = request->Handled(); handled && request->IsOpen()) {
+      Print("handled by " + CountOfClients(*handled));
+      request->Answer(*handled);
     }
   }
   if (EraseClosed(requests_) > 0) {
@@ -174,8 +186,60 @@ void Service::PerformRequests() {
   }
 }
 
-std::size_t Service::Perform(const Request& request) {
-  return request.kind == Request::Kind::Send ? SendToAll(request.message) : DropAll();
+void Service::Perform(ControlConnection& request) {
+  const Request& received = *request.Received();
+  if (received.kind == Request::Kind::Drop) {
+    request.Answer(DropAll());
+    return;
+  }
+  const std::size_t count = SendToAll(received.message);
+  if (const auto announcement = received.raw ? std::nullopt : Recognize(received.message)) {
+    Remember(*announcement);
+    if (announcement->event == Event::Unplugged) {
+      SendEnds();
+    }
+  }
+  if (received.handled) {
+    request.AwaitHandling(count, QueueMarks());
+  } else {
+    request.Answer(count);
+  }
+}
+
+std::size_t Service::CountClients() const {
+  return static_cast<std::size_t>(
+      std::ranges::count_if(clients_, [](const auto& client) { return !client->IsObserver(); }));
+}
+
+void Service::Announce(const Announcement& announcement) {
+  SendToAll(Compose(announcement));
+  Remember(announcement);
+}
+
+void Service::Remember(const Announcement& announcement) {
+  if (!memory_.Remember(announcement)) {
+    Print(FormatString("not remembered, %zu volumes or %zu bytes of mount points are the limit: ",
+                       VolumeMemory::MAXIMUM_VOLUMES, VolumeMemory::MAXIMUM_BYTES) +
+          Printable(announcement.mountPoint));
+  }
+}
+
+// The unplugged volume may have been the master. The new one has only the rows of earlier times.
+void Service::SendEnds() {
+  for (const auto& announcement : memory_.Ends()) {
+    SendToAll(Compose(announcement));
+  }
+}
+
+std::shared_ptr<const Handling> Service::QueueMarks() {
+  auto handling = std::make_shared<Handling>();
+  for (const auto& client : clients_) {
+    if (!client->IsObserver()) {
+      client->QueueMark(handling);
+    }
+  }
+  ForgetClosed();
+  return handling;
 }
 
 std::size_t Service::SendToAll(const std::string& message) {
@@ -184,12 +248,13 @@ std::size_t Service::SendToAll(const std::string& message) {
     Queue(*client, framed);
   }
   ForgetClosed();
-  Print("sent to " + CountOfClients(clients_.size()) + ": " + Printable(message));
-  return clients_.size();
+  const std::size_t count = CountClients();
+  Print("sent to " + CountOfClients(count) + ": " + Printable(message));
+  return count;
 }
 
 std::size_t Service::DropAll() {
-  const std::size_t count = clients_.size();
+  const std::size_t count = CountClients();
   for (const auto& client : clients_) {
     client->Close();
   }

@@ -3,7 +3,8 @@
 #include "orva-notify/Client.h"
 #include "orva-notify/Control.h"
 #include "orva-notify/ListeningSocket.h"
-#include "orva-notify/MountInfo.h"
+#include "orva-notify/VolumeMemory.h"
+#include "orva-notify/VolumeWatch.h"
 #include "orvautil/FileDescriptor.h"
 
 #include <cstddef>
@@ -19,8 +20,9 @@ class Service {
 public:
   /// Listens on `address` for clients and on ControlAddress(address) for requests. From now on,
   /// SIGINT and SIGTERM stop the service. With `watch`, mounts and unmounts directly below /shares
-  /// are announced. Throws util::Exception and std::filesystem::filesystem_error.
-  Service(const std::string& address, bool watch);
+  /// are announced, and, in any case, the changes of `directories`; see VolumeWatch. Throws
+  /// util::Exception and std::filesystem::filesystem_error.
+  Service(const std::string& address, bool watch, const std::vector<std::string>& directories);
 
   /// Serves until SIGINT or SIGTERM.
   void Run();
@@ -29,12 +31,17 @@ private:
   bool IsAskedToStop();
   void Wait();
   void ReadRequests();
-  void FollowMounts();
+  void FollowVolumes();
   void AcceptClients();
   void ServeClients();
   void PerformRequests();
 
-  std::size_t Perform(const Request& request);
+  std::size_t CountClients() const;
+  void Perform(ControlConnection& request);
+  void Announce(const Announcement& announcement);
+  void Remember(const Announcement& announcement);
+  void SendEnds();
+  std::shared_ptr<const Handling> QueueMarks();
   std::size_t SendToAll(const std::string& message);
   std::size_t DropAll();
   void Queue(Client& client, const Message& framed);
@@ -46,8 +53,9 @@ private:
   ListeningSocket
       control_; // opened first: a second service fails before a client can connect to it
   ListeningSocket notification_;
-  util::FileDescriptor mountInfo_; ///< polled, not read; none when mounts are not watched
-  Volumes volumes_;                ///< as announced
+  VolumeWatch volumes_;
+  VolumeMemory memory_;
+  util::FileDescriptor readers_; ///< of epoll: the clients that are waited for have read something
   std::vector<std::unique_ptr<Client>> clients_;
   std::vector<std::unique_ptr<ControlConnection>> requests_;
   unsigned lastNumber_ = 0;

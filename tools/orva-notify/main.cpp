@@ -1,35 +1,51 @@
+#include "commandline/Count.h"
 #include "commandline/UsageError.h"
 #include "orva-notify/CommandLine.h"
 #include "orva-notify/Control.h"
 #include "orva-notify/Service.h"
 #include "orvautil/Core.h"
 #include "orvautil/Exception.h"
+#include "orvautil/FileDescriptor.h"
 
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <cerrno>
 #include <csignal>
 #include <cstdlib>
-#include <fstream>
+#include <cstring>
 #include <iostream>
-#include <iterator>
+#include <string>
+#include <vector>
 
 namespace {
 
 using namespace orva::notify;
 using orva::core::ORVA_NOTIFICATION_SOCKET;
 
-constexpr int EXIT_USAGE = 2;
-
-std::string ReadAll(std::istream& stream) {
-  return {std::istreambuf_iterator<char>(stream), std::istreambuf_iterator<char>()};
-}
-
+/// The content of the file; "-" is standard input.
 std::string ReadFile(const std::string& name) {
-  if (name == "-") {
-    return ReadAll(std::cin);
-  }
-  std::ifstream file(name, std::ios::binary);
-  std::string content = ReadAll(file);
+  const bool isInput = name == "-";
+  const orva::util::FileDescriptor file(isInput ? dup(STDIN_FILENO)
+                                                : open(name.c_str(), O_RDONLY | O_CLOEXEC));
+  const auto fail = [&] {
+    throw orva::util::Exception("cannot read " + (isInput ? "standard input" : name) + ": " +
+                                std::strerror(errno));
+  };
   if (!file) {
-    throw orva::util::Exception("Cannot read '" + name + "'");
+    fail();
+  }
+  std::string content;
+  std::vector<char> chunk(std::size_t{64} * 1024);
+  ssize_t count = 0;
+  do {
+    count = read(file.Get(), chunk.data(), chunk.size());
+    if (count > 0) {
+      content.append(chunk.data(), static_cast<std::size_t>(count));
+    }
+  } while (count > 0 || (count == -1 && errno == EINTR));
+  if (count == -1) {
+    fail();
   }
   return content;
 }
@@ -39,22 +55,27 @@ std::string MessageOf(const CommandLine& command) {
 }
 
 void Serve(const CommandLine& command) {
-  Service(ORVA_NOTIFICATION_SOCKET, command.watch).Run();
+  Service(ORVA_NOTIFICATION_SOCKET, command.watch, command.directories).Run();
 }
 
-void PrintCount(const char* what, std::size_t count) {
-  std::cout << what << ' ' << count << (count == 1 ? " client\n" : " clients\n");
+void PrintClients(const char* what, std::size_t count) {
+  std::cout << what << ' ' << orva::commandline::Count(static_cast<long long>(count), "client")
+            << '\n';
 }
 
 void Send(const CommandLine& command) {
-  const Request request{
-      .kind = Request::Kind::Send, .clients = command.clients, .message = MessageOf(command)};
-  PrintCount("sent to", Ask(ORVA_NOTIFICATION_SOCKET, request, command.wait));
+  const Request request{.kind = Request::Kind::Send,
+                        .clients = command.clients,
+                        .message = MessageOf(command),
+                        .handled = command.handled,
+                        .raw = !command.event};
+  PrintClients(command.handled ? "handled by" : "sent to",
+               Ask(ORVA_NOTIFICATION_SOCKET, request, command.wait));
 }
 
 void Drop(const CommandLine& command) {
   const Request request{.kind = Request::Kind::Drop, .clients = command.clients};
-  PrintCount("dropped", Ask(ORVA_NOTIFICATION_SOCKET, request, command.wait));
+  PrintClients("dropped", Ask(ORVA_NOTIFICATION_SOCKET, request, command.wait));
 }
 
 void Execute(const CommandLine& command) {
@@ -82,8 +103,8 @@ int main(int count, char* arguments[]) {
     }
     return EXIT_SUCCESS;
   } catch (const orva::commandline::UsageError& error) {
-    std::cerr << "orva-notify: " << error.what() << "\nTry 'orva-notify --help'.\n";
-    return EXIT_USAGE;
+    orva::commandline::Report(error);
+    return orva::commandline::EXIT_USAGE;
   } catch (const std::exception& error) {
     std::cerr << "orva-notify: " << error.what() << '\n';
     return EXIT_FAILURE;

@@ -8,6 +8,8 @@
 
 namespace orva::zophotos {
 
+struct Activity;
+
 /// Text for people, or JSON for programs: one object, or one object per line from a list.
 enum class Form { Text, Json };
 
@@ -17,8 +19,18 @@ using FindPath = std::function<std::string()>;
 // The commands. Each is in its own source. `path` is the path of the merged database. They print to
 // standard output, and throw Failure or SQLite::Exception.
 
-/// Shows where the database is and the progress of each volume.
-ExitStatus ShowStatus(const std::string& path, Form form);
+/// Shows where the database is, the progress of each volume, and what the services are doing.
+ExitStatus ShowStatus(const std::string& path, const Activity& services, Form form);
+
+/// How FollowStatus follows.
+struct Following {
+  bool services = true; ///< with what the services are doing
+  bool redraws = false; ///< on a terminal: replace the last report
+};
+
+/// Prints the progress of each volume and what the services are doing, and again after each
+/// change, until the output cannot be written.
+ExitStatus FollowStatus(const FindPath& findPath, const Following& following, Form form);
 
 /// What List shows, and how.
 struct Listing {
@@ -49,6 +61,12 @@ struct Search {
 
 /// Finds files and folders by their names.
 ExitStatus FindItems(const std::string& path, const Search& search, Form form);
+
+/// Lists the photos that could not be rendered, with the reasons, from the catalogs of the volumes
+/// that the merged database or a service names. `path` selects those of a volume, or in a folder,
+/// see Spellings; all if it is empty. `escapes` is as in Listing.
+ExitStatus ListFailedPhotos(const FindPath& findPath, const Activity& services,
+                            const std::string& path, bool escapes, Form form);
 
 /// Checks the database for damage.
 ExitStatus CheckDatabase(const std::string& path, Form form);

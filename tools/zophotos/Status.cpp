@@ -2,29 +2,17 @@
 #include "Json.h"
 #include "MergedDatabase.h"
 #include "Table.h"
+#include "VolumeStatus.h"
 
 #include <SQLiteCpp/Statement.h>
 
 #include <algorithm>
-#include <limits>
-#include <map>
 #include <optional>
-#include <string_view>
+#include <utility>
 
 namespace orva::zophotos {
 
 namespace {
-
-struct Volume {
-  bool isMerged = false; ///< has a row of statistics
-  std::int64_t transcoded = 0;
-  std::int64_t total = 0;
-  std::int64_t mergedUpTo = 0;
-  std::int64_t folders = 0;
-  std::int64_t files = 0;
-};
-
-using Volumes = std::map<std::string, Volume>;
 
 /// The status row.
 struct Row {
@@ -49,23 +37,8 @@ std::optional<Row> ReadRow(SQLite::Database& database) {
   return Row{.version = query.getColumn(0).getString(), .stamp = query.getColumn(1).getInt64()};
 }
 
-/// Reads only the first row of each volume, like the daemon.
-void ReadStatistics(SQLite::Database& database, Volumes& volumes) {
-  SQLite::Statement query(database, "SELECT volume, photos_xcoded, photos_total, last_updated_time "
-                                    "FROM Statistics ORDER BY id");
-  while (query.executeStep()) {
-    Volume& volume = volumes[query.getColumn(0).getString()];
-    if (!volume.isMerged) {
-      volume.isMerged = true;
-      volume.transcoded = query.getColumn(1).getInt64();
-      volume.total = query.getColumn(2).getInt64();
-      volume.mergedUpTo = query.getColumn(3).getInt64();
-    }
-  }
-}
-
-Volumes ReadVolumes(SQLite::Database& database) {
-  Volumes volumes;
+VolumeStatuses ReadVolumes(SQLite::Database& database) {
+  VolumeStatuses volumes;
   ReadStatistics(database, volumes);
   // Folder 1 is the shares root, which belongs to no volume.
   SQLite::Statement folders(
@@ -77,69 +50,15 @@ Volumes ReadVolumes(SQLite::Database& database) {
   while (files.executeStep()) {
     volumes[files.getColumn(0).getString()].files = files.getColumn(1).getInt64();
   }
+  for (auto& [name, volume] : volumes) {
+    volume.isGone =
+        volume.isMerged && volume.mergedUpTo == 0 && volume.folders == 0 && volume.files == 0;
+  }
   return volumes;
-}
-
-/// Whether only the statistics of the volume are left: it was unplugged, or purged and not merged
-/// since.
-bool IsGone(const Volume& volume) {
-  return volume.isMerged && volume.mergedUpTo == 0 && volume.folders == 0 && volume.files == 0;
-}
-
-/// Adds a number of an untrusted database, up to the largest number.
-void Add(std::int64_t& sum, std::int64_t number) {
-  if (__builtin_add_overflow(sum, std::max<std::int64_t>(number, 0), &sum)) {
-    sum = std::numeric_limits<std::int64_t>::max();
-  }
-}
-
-/// The sums of all volumes that are not gone.
-Volume Total(const Volumes& volumes) {
-  Volume total;
-  for (const auto& [name, volume] : volumes) {
-    if (!IsGone(volume)) {
-      Add(total.transcoded, volume.transcoded);
-      Add(total.total, volume.total);
-      Add(total.folders, volume.folders);
-      Add(total.files, volume.files);
-    }
-  }
-  return total;
-}
-
-/// "█████░░░░░  50 %" with a bar of `width` columns; a dash if there are no photos.
-std::string Progress(const Volume& volume, int width) {
-  if (volume.total <= 0) {
-    return "-";
-  }
-  const auto done =
-      static_cast<double>(std::clamp<std::int64_t>(volume.transcoded, 0, volume.total));
-  // Multiplied first, because the double 0.29 times 100 is less than 29.
-  const auto part = [&](int whole) {
-    return static_cast<int>(done * whole / static_cast<double>(volume.total));
-  };
-  const int filled = part(width);
-  std::string bar;
-  for (int i = 0; i < width; ++i) {
-    bar += i < filled ? "█" : "░";
-  }
-  // Rounded down, so that only all photos are 100 %.
-  const std::string percent = std::to_string(part(100));
-  return bar + std::string(4 - percent.size(), ' ') + percent + " %";
 }
 
 std::string LocalTimeOrDash(std::int64_t seconds, std::int64_t none) {
   return seconds == none ? "-" : LocalTime(seconds);
-}
-
-/// The mount point of the volume that holds the database at `path`, as the database names it.
-/// Nothing if the daemon does not keep databases at such a path.
-std::optional<std::string> MountPoint(const std::string& path) {
-  constexpr std::string_view place = "/.zophotos/zophotos.db";
-  if (!path.ends_with(place)) {
-    return std::nullopt;
-  }
-  return path.substr(0, path.size() - place.size());
 }
 
 /// The daemon's master volume.
@@ -151,25 +70,21 @@ std::string Master(const std::string& path) {
   return mountPoint ? Printable(*mountPoint) : "-";
 }
 
-void AddRow(Table& table, const std::string& name, const Volume& volume, int barWidth) {
-  const bool isGone = IsGone(volume);
-  table.AddRow(
-      {name, isGone ? "gone" : Progress(volume, barWidth),
-       isGone ? "-" : std::to_string(volume.transcoded) + "/" + std::to_string(volume.total),
-       std::to_string(volume.folders), std::to_string(volume.files),
-       LocalTimeOrDash(volume.mergedUpTo, 0)});
+void AddRow(Table& table, const std::string& name, const VolumeStatus& volume, int barWidth) {
+  table.AddRow({name, ProgressBar(volume, barWidth), PhotoCounts(volume),
+                std::to_string(volume.folders), std::to_string(volume.files),
+                LocalTimeOrDash(volume.mergedUpTo, 0)});
 }
 
-Table MakeTable(const std::string& path, const Volumes& volumes, int barWidth) {
+Table MakeTable(const std::string& path, const VolumeStatuses& volumes, int barWidth) {
   Table table({{.heading = "VOLUME", .elastic = true},
                {.heading = "TRANSCODED"},
                {.heading = "PHOTOS", .right = true},
                {.heading = "FOLDERS", .right = true},
                {.heading = "FILES", .right = true},
                {.heading = "MERGED UP TO"}});
-  const auto master = MountPoint(path);
   for (const auto& [name, volume] : volumes) {
-    AddRow(table, Printable(name) + (name == master ? " (master)" : ""), volume, barWidth);
+    AddRow(table, NameOf(name, path), volume, barWidth);
   }
   AddRow(table, "TOTAL", Total(volumes), barWidth);
   return table;
@@ -186,11 +101,7 @@ void PrintLegend(std::optional<std::size_t> width) {
   }
 }
 
-void PrintStatusText(const std::string& path, const std::optional<Row>& row,
-                     const Volumes& volumes) {
-  std::cout << "Database  " << Printable(path) << "\nMaster    " << Master(path) << "\nVersion   "
-            << (row ? Printable(row->version) : "-") << "\nEmptied   "
-            << (row ? LocalTimeOrDash(row->stamp, NEVER_EMPTIED) : "-") << "\n\n";
+void PrintVolumes(const std::string& path, const VolumeStatuses& volumes) {
   if (volumes.empty()) {
     std::cout << "No volume has been merged yet.\n";
     return;
@@ -203,16 +114,49 @@ void PrintStatusText(const std::string& path, const std::optional<Row>& row,
   PrintLegend(width);
 }
 
-void PrintStatusJson(const std::string& path, const std::optional<Row>& row,
-                     const Volumes& volumes) {
-  Json list = Json::array();
+/// Prints what the services are doing.
+void PrintActivity(const Activity& services) {
+  const auto volumes = VolumesOf(services);
+  if (volumes.empty()) {
+    return;
+  }
+  const auto width = TerminalWidth();
+  Table table({{.heading = "VOLUME"},
+               {.heading = "WAITING", .right = true},
+               {.heading = "FAILED", .right = true},
+               {.heading = "ACTIVITY", .elastic = true}});
+  std::int64_t failed = 0;
   for (const auto& [name, volume] : volumes) {
-    list.push_back({{"volume", ToUtf8(name)},
-                    {"transcoded", volume.transcoded},
-                    {"total", volume.total},
-                    {"folders", volume.folders},
-                    {"files", volume.files},
-                    {"merged_up_to", JsonStamp(volume.mergedUpTo)}});
+    table.AddRow(
+        {ShortName(Printable(name), width), Waiting(volume), Failed(volume), Describe(volume)});
+    Add(failed, volume.rendering == nullptr ? 0 : volume.rendering->failed);
+  }
+  std::cout << '\n';
+  table.Print(std::cout, width);
+  if (failed > 0) {
+    std::cout << "\n'zophotos failed' lists the failed photos with the reasons.\n";
+  }
+}
+
+void PrintStatusText(const std::string& path, const std::optional<Row>& row,
+                     const VolumeStatuses& volumes, const Activity& services) {
+  std::cout << "Database  " << Printable(path) << "\nMaster    " << Master(path) << "\nVersion   "
+            << (row ? Printable(row->version) : "-") << "\nEmptied   "
+            << (row ? LocalTimeOrDash(row->stamp, NEVER_EMPTIED) : "-") << "\n\n";
+  PrintVolumes(path, volumes);
+  PrintActivity(services);
+}
+
+void PrintStatusJson(const std::string& path, const std::optional<Row>& row,
+                     const VolumeStatuses& volumes, const Activity& services) {
+  Json list = Json::array();
+  for (const auto& [name, volume] : Combine(volumes, services)) {
+    const VolumeStatus status = volume.status.value_or(VolumeStatus());
+    Json object{{"volume", ToUtf8(name)}, {"transcoded", status.transcoded},
+                {"total", status.total},  {"folders", status.folders},
+                {"files", status.files},  {"merged_up_to", JsonStamp(status.mergedUpTo)}};
+    AddActivity(object, services, volume.activity);
+    list.push_back(std::move(object));
   }
   PrintLine({{"database", ToUtf8(path)},
              {"version", row ? Json(ToUtf8(row->version)) : Json()},
@@ -222,11 +166,11 @@ void PrintStatusJson(const std::string& path, const std::optional<Row>& row,
 
 } // namespace
 
-ExitStatus ShowStatus(const std::string& path, Form form) {
+ExitStatus ShowStatus(const std::string& path, const Activity& services, Form form) {
   // Counting reads every row, which takes long.
   SQLite::Database database = CopyDatabase(path);
   (form == Form::Json ? PrintStatusJson : PrintStatusText)(path, ReadRow(database),
-                                                           ReadVolumes(database));
+                                                           ReadVolumes(database), services);
   return ExitStatus::Success;
 }
 

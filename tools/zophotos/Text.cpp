@@ -180,6 +180,14 @@ std::optional<std::size_t> TerminalWidth() {
   return size.ws_col;
 }
 
+std::optional<std::size_t> TerminalHeight() {
+  winsize size{};
+  if (ioctl(STDOUT_FILENO, TIOCGWINSZ, &size) != 0 || size.ws_row == 0) {
+    return std::nullopt;
+  }
+  return size.ws_row;
+}
+
 bool IsTerminal() {
   return isatty(STDOUT_FILENO) != 0;
 }

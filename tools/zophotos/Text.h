@@ -36,6 +36,9 @@ std::string Shorten(const std::string& printable, std::size_t width);
 /// The width of the terminal at standard output; nothing if that is not a terminal.
 std::optional<std::size_t> TerminalWidth();
 
+/// The number of its lines.
+std::optional<std::size_t> TerminalHeight();
+
 /// Whether standard output is a terminal.
 bool IsTerminal();
 

@@ -1,32 +1,25 @@
 #include "Commands.h"
 #include "Json.h"
+#include "LiveDatabase.h"
 #include "MergedDatabase.h"
 
 #include <SQLiteCpp/Exception.h>
 #include <SQLiteCpp/Statement.h>
-#include <SQLiteCpp/Transaction.h>
 
 #include <boost/algorithm/string/join.hpp>
 
-#include <sys/stat.h>
-
 #include <algorithm>
-#include <chrono>
 #include <ctime>
 #include <map>
 #include <optional>
 #include <set>
 #include <thread>
-#include <tuple>
 #include <utility>
 #include <vector>
 
 namespace orva::zophotos {
 
 namespace {
-
-/// The time between two looks.
-constexpr std::chrono::milliseconds INTERVAL(250);
 
 struct Progress {
   std::int64_t transcoded = 0;
@@ -53,9 +46,6 @@ struct Difference {
   std::int64_t added = 0;
   std::int64_t removed = 0;
 };
-
-/// Identifies a file independent of its name.
-using FileIdentity = std::tuple<dev_t, ino_t>;
 
 std::int64_t Number(SQLite::Database& database, const char* sql) {
   return database.execAndGet(sql).getInt64();
@@ -122,58 +112,60 @@ std::string Describe(const Progress* before, const Progress& now) {
   return std::to_string(now.transcoded) + " of " + Count(now.total, "photo") + " transcoded";
 }
 
+/// What has changed between two states.
+struct Change {
+  State before;
+  Difference folders;
+  Difference files;
+  std::set<std::string> volumes;
+};
+
 class Watch {
 public:
-  Watch(const FindPath& findPath, Form form) : findPath_(findPath), form_(form) {}
+  Watch(const FindPath& findPath, Form form) : database_(findPath), form_(form) {}
 
   /// Looks once and prints what has changed since the last time. False if the output cannot be
   /// written.
   bool Look() {
     try {
-      const std::string path = findPath_();
-      if (!database_ || path != path_ || Identify(path) != identity_) {
-        Open(path);
-      } else if (Version(*database_) != version_) {
-        PrintChange();
-      }
+      PrintNews();
       delay_.clear();
     } catch (const Failure& failure) {
       Lose(failure.what());
     } catch (const SQLite::Exception& error) {
       if (IsLocked(error)) {
-        Delay(Explain(error, path_));
+        Delay(Explain(error, database_.Path()));
       } else {
-        Lose(Explain(error, path_));
+        Lose(Explain(error, database_.Path()));
       }
     }
     return static_cast<bool>(std::cout.flush());
   }
 
 private:
-  static std::optional<FileIdentity> Identify(const std::string& path) {
-    struct stat status {};
-    if (stat(path.c_str(), &status) != 0) {
-      return std::nullopt;
+  /// Prints whether the database was opened, or what has changed in it. Prints after the
+  /// transaction, because a reader of the output may be slow.
+  void PrintNews() {
+    bool isOpened = false;
+    std::optional<Change> change;
+    database_.Look([&](SQLite::Database& database, bool isNew) {
+      isOpened = isNew;
+      if (isNew) {
+        state_ = ReadState(database);
+      } else {
+        change = Update(database);
+      }
+    });
+    if (isOpened) {
+      PrintOpened();
+    } else if (change) {
+      PrintChange(*change);
     }
-    return FileIdentity(status.st_dev, status.st_ino);
   }
 
-  static std::int64_t Version(SQLite::Database& database) {
-    return Number(database, "PRAGMA data_version");
-  }
-
-  void Open(const std::string& path) {
-    path_ = path;
-    database_.reset();
-    identity_ = Identify(path);
-    SQLite::Database database = OpenDatabase(path);
-    {
-      const SQLite::Transaction oneState(database);
-      state_ = ReadState(database);
-      version_ = Version(database);
-    }
-    database_ = std::move(database);
+  void PrintOpened() {
     loss_.clear();
+    const std::string& path = database_.Path();
     Print("opened",
           "watching " + Printable(path) + ": " + Count(state_.folders.count, "folder") + ", " +
               Count(state_.files.count, "file"),
@@ -184,7 +176,7 @@ private:
 
   /// Prints once why the database is lost, and closes it.
   void Lose(const std::string& reason) {
-    database_.reset();
+    database_.Close();
     if (reason != loss_) {
       loss_ = reason;
       Print("lost", Printable(reason), {{"reason", ToUtf8(reason)}});
@@ -199,31 +191,30 @@ private:
     }
   }
 
-  void PrintChange() {
-    std::set<std::string> changed;
-    Difference folders;
-    Difference files;
-    State before;
-    {
-      const SQLite::Transaction oneState(*database_);
-      State now = ReadState(*database_);
-      version_ = Version(*database_);
-      folders = Compare(state_.folders, now.folders);
-      files = Compare(state_.files, now.files);
-      AddVolumes(*database_,
-                 "SELECT volume FROM Folders WHERE folder_id > ? ORDER BY folder_id LIMIT 10000",
-                 state_.folders, changed);
-      AddVolumes(*database_,
-                 "SELECT volume FROM Files WHERE file_id > ? ORDER BY file_id LIMIT 10000",
-                 state_.files, changed);
-      for (const auto& [volume, progress] : now.volumes) {
-        const auto known = state_.volumes.find(volume);
-        if (known == state_.volumes.end() || known->second != progress) {
-          changed.insert(volume);
-        }
+  /// Reads the new state and returns what has changed.
+  Change Update(SQLite::Database& database) {
+    State now = ReadState(database);
+    Change change{.before = {},
+                  .folders = Compare(state_.folders, now.folders),
+                  .files = Compare(state_.files, now.files),
+                  .volumes = {}};
+    AddVolumes(database,
+               "SELECT volume FROM Folders WHERE folder_id > ? ORDER BY folder_id LIMIT 10000",
+               state_.folders, change.volumes);
+    AddVolumes(database, "SELECT volume FROM Files WHERE file_id > ? ORDER BY file_id LIMIT 10000",
+               state_.files, change.volumes);
+    for (const auto& [volume, progress] : now.volumes) {
+      const auto known = state_.volumes.find(volume);
+      if (known == state_.volumes.end() || known->second != progress) {
+        change.volumes.insert(volume);
       }
-      before = std::exchange(state_, std::move(now));
     }
+    change.before = std::exchange(state_, std::move(now));
+    return change;
+  }
+
+  void PrintChange(const Change& change) {
+    const auto& [before, folders, files, changed] = change;
     std::vector<std::string> parts{Describe("added", folders.added, files.added),
                                    Describe("removed", folders.removed, files.removed)};
     Json volumes = Json::array();
@@ -259,12 +250,8 @@ private:
     }
   }
 
-  const FindPath& findPath_;
+  LiveDatabase database_;
   Form form_;
-  std::string path_;
-  std::optional<FileIdentity> identity_;
-  std::optional<SQLite::Database> database_; ///< empty while there is none
-  std::int64_t version_ = 0;
   State state_;
   std::string loss_;  ///< the last reason that Lose printed; empty while there is a database
   std::string delay_; ///< the last reason that Delay printed; empty while it can be read
@@ -275,7 +262,7 @@ private:
 ExitStatus WatchDatabase(const FindPath& findPath, Form form) {
   Watch watch(findPath, form);
   while (watch.Look()) {
-    std::this_thread::sleep_for(INTERVAL);
+    std::this_thread::sleep_for(LOOK_INTERVAL);
   }
   return ExitStatus::Failed;
 }

@@ -1,7 +1,7 @@
+#include "Activity.h"
 #include "Commands.h"
 #include "Locator.h"
 #include "MergedDatabase.h"
-#include "Suggestion.h"
 #include "Text.h"
 
 #include "commandline/Parse.h"
@@ -25,23 +25,22 @@ using orva::commandline::UsageError;
 class Options {
 public:
   Options() {
-    app_.require_subcommand(0, 1);
-    app_.fallthrough();
-    app_.set_version_flag("--version", "zophotos " PROGRAM_VERSION);
+    orva::commandline::SetUp(app_);
     app_.add_option("--database", database_,
                     "Read this database instead of the one named by the daemon's locator file")
         ->type_name("FILE")
         ->check(orva::commandline::NotEmpty());
     app_.add_flag("--json", json_, "Print JSON: one object, or one object per line");
     app_.add_flag("--escape", escape_,
-                  "Escape the names that ls and find print also if the output is not a terminal");
+                  "Escape the names that ls, find and failed print also if the output is not a "
+                  "terminal");
     app_.add_option("--color", color_, "Print folders in a colour; auto: on a terminal")
         ->type_name("auto|always|never")
-        ->check(CLI::IsMember({"auto", "always", "never"}));
+        ->check(orva::commandline::OneOf({"auto", "always", "never"}));
     app_.footer(
         "Without a command, zophotos shows the status.\n"
-        "Exit status: 0 success; 1 damaged, or nothing found; 2 wrong command line; 3 no database "
-        "now;\n4 locked, try again; 5 any other error. See zophotos(1).");
+        "Exit status: 0 success; 1 damaged, incomplete or not found; 2 wrong command line;\n3 no "
+        "database now; 4 locked, try again; 5 any other error. See zophotos(1).");
     AddCommands();
   }
 
@@ -53,7 +52,7 @@ public:
         return false;
       }
     } catch (const UsageError& error) {
-      throw UsageError(Explain(error));
+      throw UsageError(error.what() + DashHint(), error.Command());
     }
     if (help_->parsed()) {
       std::cout << Help();
@@ -62,16 +61,19 @@ public:
     return true;
   }
 
-  /// The command whose help is likely to tell what is wrong with the command line.
-  std::string CommandToTry() const {
-    const CLI::App* const command = Command();
-    return command == nullptr || command == help_ ? "zophotos" : "zophotos " + command->get_name();
-  }
-
   /// Runs the command. Throws Failure.
   ExitStatus Run() const {
     if (watch_->parsed()) {
       return WatchDatabase([this] { return FindPath(); }, OutputForm());
+    }
+    if (follow_) {
+      return FollowStatus([this] { return FindPath(); },
+                          {.services = database_.empty(), .redraws = IsCapableTerminal()},
+                          OutputForm());
+    }
+    if (failed_->parsed()) {
+      return ListFailedPhotos([this] { return FindPath(); }, Services(), path_, Escapes(),
+                              OutputForm());
     }
     const std::string path = FindPath();
     try {
@@ -85,21 +87,29 @@ public:
 private:
   std::string FindPath() const { return database_.empty() ? FindDatabase() : database_; }
 
+  /// What the services of this machine are doing; nothing for another machine's database.
+  Activity Services() const { return database_.empty() ? ReadActivity() : Activity(); }
+
   Form OutputForm() const { return json_ ? Form::Json : Form::Text; }
 
   /// Whether to escape names where each is a line of its own.
   bool Escapes() const { return escape_ || Colors() || IsTerminal(); }
 
+  static std::string Variable(const char* name) {
+    const char* const value = std::getenv(name);
+    return value == nullptr ? "" : value;
+  }
+
+  /// Whether the output is a terminal with colours and a cursor that moves.
+  static bool IsCapableTerminal() {
+    const std::string terminal = Variable("TERM");
+    return IsTerminal() && !terminal.empty() && terminal != "dumb";
+  }
+
   /// Whether to print folders in a colour.
   bool Colors() const {
-    const auto variable = [](const char* name) {
-      const char* const value = std::getenv(name);
-      return std::string(value == nullptr ? "" : value);
-    };
-    const std::string terminal = variable("TERM");
     return color_ == "always" ||
-           (color_ == "auto" && IsTerminal() && variable("NO_COLOR").empty() && !terminal.empty() &&
-            terminal != "dumb");
+           (color_ == "auto" && IsCapableTerminal() && Variable("NO_COLOR").empty());
   }
 
   /// The command on the command line; null if there is none.
@@ -108,53 +118,14 @@ private:
     return commands.empty() ? nullptr : commands.front();
   }
 
-  std::vector<std::string> CommandNames() const {
-    std::vector<std::string> names;
-    for (const CLI::App* const command : app_.get_subcommands({})) {
-      names.push_back(command->get_name());
-    }
-    return names;
-  }
-
-  /// The names of the options that the command line may have.
-  std::vector<std::string> OptionNames() const {
-    std::vector<std::string> names;
-    for (const CLI::App* const app : {Command(), static_cast<const CLI::App*>(&app_)}) {
-      if (app != nullptr) {
-        for (const CLI::Option* const option : app->get_options()) {
-          for (const std::string& name : option->get_lnames()) {
-            names.push_back("--" + name);
-          }
-        }
-      }
-    }
-    return names;
-  }
-
-  /// The message for an unknown command or option, otherwise that of `error`.
-  std::string Explain(const UsageError& error) const {
+  /// How to search for a name that was taken for an unknown option; otherwise empty.
+  std::string DashHint() const {
     const std::vector<std::string> rest = app_.remaining(true);
-    if (rest.empty()) {
-      return error.what();
+    if (!find_->parsed() || rest.empty() || !rest.front().starts_with('-')) {
+      return "";
     }
-    const std::string& word = rest.front();
-    if (word.starts_with('-')) {
-      std::string text = "unknown option '" + word + "'" + DidYouMean(word, OptionNames());
-      if (find_->parsed()) {
-        text += "; to search for a name that begins with a dash: zophotos find -- '" + word + "'";
-      }
-      return text;
-    }
-    return Command() == nullptr ? UnknownCommand(word) : error.what();
-  }
-
-  std::string UnknownCommand(const std::string& word) const {
-    return "unknown command '" + word + "'" + DidYouMean(word, CommandNames());
-  }
-
-  static std::string DidYouMean(const std::string& word, const std::vector<std::string>& names) {
-    const auto suggestion = Suggest(word, names);
-    return suggestion ? "; did you mean '" + *suggestion + "'?" : "";
+    return "; to search for a name that begins with a dash: zophotos find -- '" + rest.front() +
+           "'";
   }
 
   /// The help that the command `help` prints.
@@ -165,7 +136,7 @@ private:
     const auto commands = app_.get_subcommands(
         [this](const CLI::App* command) { return command->get_name() == topic_; });
     if (commands.empty()) {
-      throw UsageError(UnknownCommand(topic_));
+      throw UsageError(orva::commandline::UnknownCommand(app_, topic_), app_.get_name());
     }
     return commands.front()->help(app_.get_name());
   }
@@ -173,7 +144,7 @@ private:
   ExitStatus RunOn(const std::string& path) const {
     const Form form = OutputForm();
     if (Command() == nullptr || status_->parsed()) {
-      return ShowStatus(path, form);
+      return ShowStatus(path, Services(), form);
     }
     if (ls_->parsed()) {
       return List(path, {.path = path_, .isLong = long_, .escapes = Escapes(), .colors = Colors()},
@@ -196,6 +167,8 @@ private:
 
   void AddCommands() {
     status_ = app_.add_subcommand("status", "Show the database and the progress of each volume");
+    status_->add_flag("-f,--follow", follow_,
+                      "Show the progress again after each change until interrupted");
     ls_ = app_.add_subcommand("ls", "List a folder, or show a file");
     ls_->add_flag("-l,--long", long_, "Add times, numbers of files and volumes");
     ls_->add_flag_callback(
@@ -227,12 +200,17 @@ private:
             },
             "Find only files (f) or only folders (d)")
         ->type_name("f|d")
-        ->check(CLI::IsMember({"f", "d"}));
+        ->check(orva::commandline::OneOf({"f", "d"}));
     find_->callback([this] {
       if (search_.nullTerminated && json_) {
-        throw CLI::ValidationError("find", "--null and --json cannot be combined");
+        throw UsageError("--null and --json cannot be combined");
       }
     });
+    failed_ = app_.add_subcommand("failed",
+                                  "List the photos that could not be rendered, with the reasons");
+    failed_->add_option("PATH", path_,
+                        "Only photos of this volume or in this folder, absolute or relative to "
+                        "/shares");
     check_ = app_.add_subcommand("check", "Check the database for damage");
     watch_ = app_.add_subcommand("watch", "Print a line for each change until interrupted");
     AddExport();
@@ -250,9 +228,8 @@ private:
     export_->add_flag("--jsonl", jsonLines_, "Print one JSON object per line, like --json");
     export_->callback([this] {
       if (csv_ && (jsonLines_ || json_)) {
-        throw CLI::ValidationError("export", std::string("--csv and ") +
-                                                 (jsonLines_ ? "--jsonl" : "--json") +
-                                                 " cannot be combined");
+        throw UsageError(std::string("--csv and ") + (jsonLines_ ? "--jsonl" : "--json") +
+                         " cannot be combined");
       }
     });
   }
@@ -262,16 +239,18 @@ private:
   CLI::App* ls_ = nullptr;
   CLI::App* tree_ = nullptr;
   CLI::App* find_ = nullptr;
+  CLI::App* failed_ = nullptr;
   CLI::App* check_ = nullptr;
   CLI::App* watch_ = nullptr;
   CLI::App* export_ = nullptr;
   CLI::App* help_ = nullptr;
   std::string database_;
   std::string color_ = "auto";
-  std::string path_;  ///< of ls and tree
+  std::string path_;  ///< of ls, tree and failed
   std::string topic_; ///< of help
   std::size_t levels_ = std::numeric_limits<std::size_t>::max();
   Search search_;
+  bool follow_ = false;
   bool json_ = false;
   bool escape_ = false;
   bool long_ = false;
@@ -288,12 +267,11 @@ int Finish(ExitStatus status) {
 }
 
 ExitStatus Run(std::vector<std::string> arguments) {
-  Options options;
   try {
+    Options options;
     return options.Parse(std::move(arguments)) ? options.Run() : ExitStatus::Success;
   } catch (const UsageError& error) {
-    std::cerr << "zophotos: " << Printable(error.what()) << "\nTry '" << options.CommandToTry()
-              << " --help'.\n";
+    orva::commandline::Report(error, Printable);
     return ExitStatus::Usage;
   } catch (const Failure& failure) {
     std::cerr << "zophotos: " << Printable(failure.what()) << '\n';

@@ -2,7 +2,7 @@
 
 _zophotos() {
   local current=${COMP_WORDS[COMP_CWORD]} previous=${COMP_WORDS[COMP_CWORD - 1]}
-  local commands='status ls tree find check watch export help'
+  local commands='status ls tree find failed check watch export help'
   local words='--database --json --escape --color --version --help -h'
   local command='' i
   for ((i = 1; i < COMP_CWORD; i++)); do
@@ -34,6 +34,7 @@ _zophotos() {
   esac
   case $command in
     '') words+=" $commands" ;;
+    status) words+=' --follow -f' ;;
     ls) words+=' --long -l -1' ;;
     tree) words+=' --level -L' ;;
     find) words+=' --ignore-case --null --type -i -0' ;;

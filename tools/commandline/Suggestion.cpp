@@ -4,7 +4,7 @@
 #include <cstddef>
 #include <numeric>
 
-namespace orva::zophotos {
+namespace orva::commandline {
 
 namespace {
 
@@ -46,4 +46,9 @@ std::optional<std::string> Suggest(const std::string& word, const std::vector<st
   return nearest;
 }
 
-} // namespace orva::zophotos
+std::string DidYouMean(const std::string& word, const std::vector<std::string>& names) {
+  const auto suggestion = Suggest(word, names);
+  return suggestion ? "; did you mean '" + *suggestion + "'?" : "";
+}
+
+} // namespace orva::commandline

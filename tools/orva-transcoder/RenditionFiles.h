@@ -1,0 +1,69 @@
+#pragma once
+
+#include "orvautil/FileDescriptor.h"
+
+#include <sys/stat.h>
+
+#include <cstddef>
+#include <functional>
+#include <map>
+#include <string>
+#include <vector>
+
+namespace orva::catalog {
+class VolumeRoot;
+} // namespace orva::catalog
+
+// The renditions on a volume. Other users may rename and replace everything there at any time, so
+// each step goes through the descriptor of the folder that it works in, and no existing file is
+// opened for writing. Used by one thread at a time.
+namespace orva::transcoder {
+
+/// Writes renditions to a volume: first all under temporary names, then Publish. Temporary files
+/// that were not published are removed with the object. Failures that concern the whole volume,
+/// such as a full one, are thrown as util::Exception.
+class RenditionWriter {
+public:
+  explicit RenditionWriter(const catalog::VolumeRoot& root) : root_(root) {}
+  RenditionWriter(const RenditionWriter&) = delete;
+  RenditionWriter& operator=(const RenditionWriter&) = delete;
+  ~RenditionWriter();
+
+  /// Copies `content`, the rendition of the file `id`. It gets the owner and group of `photo`, and
+  /// of its mode what allows reading.
+  void Add(long long id, const util::FileDescriptor& content, const struct stat& photo);
+
+  /// Writes all of them to the medium and gives them their names. Returns the ids of those whose
+  /// name is taken by a folder.
+  std::vector<long long> Publish();
+
+private:
+  struct Unpublished {
+    long long id;
+    util::FileDescriptor file;
+  };
+
+  const util::FileDescriptor& FolderOf(long long id);
+
+  const catalog::VolumeRoot& root_;
+  std::map<long long, util::FileDescriptor> folders_; ///< by the number in their names
+  std::vector<Unpublished> unpublished_;
+};
+
+/// Removes the rendition of the file `id` if there is one. Returns false when that fails.
+bool RemoveRendition(const catalog::VolumeRoot& root, long long id);
+
+/// Examines the folder with the rendition of the file `first`: `expected` are the ids of the
+/// photos, in order, that must have a rendition there. Returns those that have none. Removes the
+/// files of others, except those of which `isInUse` returns true.
+std::vector<long long> CheckFolder(const catalog::VolumeRoot& root, long long first,
+                                   const std::vector<long long>& expected,
+                                   const std::function<bool(long long)>& isInUse);
+
+/// Calls `visit` with the first id of each folder of renditions, and removes what is no folder.
+void ForEachFolder(const catalog::VolumeRoot& root, const std::function<void(long long)>& visit);
+
+/// Removes the folder with the rendition of the file `first`, if it is empty.
+void RemoveEmptyFolder(const catalog::VolumeRoot& root, long long first);
+
+} // namespace orva::transcoder

@@ -1,0 +1,342 @@
+#include "Transcoder.h"
+
+#include "Log.h"
+#include "Renderer.h"
+
+#include "orva-notify/Control.h"
+#include "orva-notify/Notification.h"
+#include "orvautil/Core.h"
+#include "orvautil/Exception.h"
+
+#include <poll.h>
+#include <sys/eventfd.h>
+#include <syslog.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <exception>
+#include <ranges>
+#include <system_error>
+#include <utility>
+
+namespace orva::transcoder {
+namespace {
+
+using notifications::Notification;
+
+constexpr long long MOST_STAGED = LARGEST_PHOTO + (64LL << 20); ///< bytes
+constexpr std::size_t ANNOUNCED_CHANGES = 500;
+constexpr std::chrono::seconds ANNOUNCE_INTERVAL(2);
+constexpr std::chrono::seconds STORE_AGAIN(1);
+constexpr std::chrono::seconds SEND_AGAIN(5);
+constexpr std::chrono::seconds ERROR_PAUSE(60);
+
+} // namespace
+
+Transcoder::Transcoder(const std::string& directory)
+    : staging_(directory + "/staging"),
+      processors_(std::max(std::thread::hardware_concurrency(), 1U)),
+      wake_(eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)), observer_(core::ORVA_NOTIFICATION_SOCKET),
+      status_(directory + "/status.json"), processor_(static_cast<std::ptrdiff_t>(processors_)) {
+  if (!wake_) {
+    throw util::Exception("no eventfd: " + std::generic_category().message(errno));
+  }
+  PrepareStaging(staging_);
+}
+
+void Transcoder::Run() {
+  for (;;) {
+    wakeAt_.reset();
+    hasMoreWork_ = false;
+    Receive();
+    StoreRendered();
+    LookAgain();
+    StageNext();
+    CheckRenditions();
+    Announce();
+    UpdateStatus();
+    Wait();
+  }
+}
+
+void Transcoder::Receive() {
+  for (const Notification& notification : observer_.Receive()) {
+    Handle(notification);
+  }
+}
+
+void Transcoder::Handle(const Notification& notification) {
+  using Event = Notification::Event;
+  const std::string& mountPoint = notification.mountPoint;
+  switch (notification.event) {
+  case Event::Connected:
+    // The service now names all volumes that are there.
+    volumes_.clear();
+    sendAgainAt_.reset();
+    return;
+  case Event::Plugged:
+    if (!volumes_.contains(mountPoint)) {
+      using Kind = catalog::VolumeRoot::Kind;
+      volumes_.emplace(
+          mountPoint,
+          Known{.volume =
+                    Volume(mountPoint, notification.isDirectory ? Kind::Directory : Kind::Mount),
+                .name = mountPoint.substr(0, std::max<std::size_t>(mountPoint.size() - 1, 1))});
+    }
+    break;
+  case Event::Unplugged:
+    volumes_.erase(mountPoint);
+    return;
+  case Event::Scanned:
+  case Event::TranscodedBatch:
+  case Event::End:
+  case Event::Purged:
+    break;
+  }
+  const auto known = volumes_.find(mountPoint);
+  if (known != volumes_.end()) {
+    known->second.isScanned = known->second.isScanned || notification.event != Event::Plugged;
+    known->second.volume.Look();
+  }
+}
+
+void Transcoder::StoreRendered() {
+  eventfd_t count = 0;
+  eventfd_read(wake_.Get(), &count);
+  std::erase_if(running_, [this](const auto& running) {
+    return IsRendered(*running) && StoreBatch(*running);
+  });
+}
+
+/// Returns false if that has to be done again.
+bool Transcoder::StoreBatch(Running& running) {
+  const Batch& batch = *running.batch;
+  if (!batch.error.empty()) {
+    if (batch.error != error_) {
+      error_ = batch.error;
+      Log(LOG_ERR, Printable(error_));
+    }
+    pausedUntil_ = Clock::now() + ERROR_PAUSE;
+    return true;
+  }
+  const auto known = volumes_.find(batch.mountPoint);
+  if (known == volumes_.end()) {
+    return true;
+  }
+  if (running.storeAgainAt && Clock::now() < *running.storeAgainAt) {
+    WakeAt(*running.storeAgainAt);
+    return false;
+  }
+  error_.clear();
+  Volume& volume = known->second.volume;
+  if (volume.Store(*running.batch) == Volume::Stored::Later) {
+    running.storeAgainAt = Clock::now() + STORE_AGAIN;
+    WakeAt(*running.storeAgainAt);
+    return false;
+  }
+  const std::size_t changes = volume.TakeChanges();
+  if (changes > 0) {
+    if (known->second.changes == 0) {
+      known->second.changedAt = Clock::now();
+    }
+    known->second.changes += changes;
+    known->second.isEndDue = true;
+  }
+  return true;
+}
+
+void Transcoder::LookAgain() {
+  if (pausedUntil_ && Clock::now() >= *pausedUntil_) {
+    pausedUntil_.reset();
+    for (auto& [mountPoint, known] : volumes_) {
+      known.volume.Look(); // for the photos of the batches that were lost
+    }
+  }
+  if (pausedUntil_) {
+    WakeAt(*pausedUntil_);
+  }
+  for (auto& [mountPoint, known] : volumes_) {
+    if (known.volume.LookAgainAt() && Clock::now() >= *known.volume.LookAgainAt()) {
+      known.volume.Look();
+    }
+    if (known.volume.LookAgainAt()) {
+      WakeAt(*known.volume.LookAgainAt());
+    }
+  }
+}
+
+/// Stages batches, from one volume after the other.
+void Transcoder::StageNext() {
+  while (!pausedUntil_ && running_.size() <= processors_) {
+    // The volumes after the last one, then the others.
+    auto next = volumes_.upper_bound(lastStaged_);
+    bool isStaged = false;
+    for (std::size_t i = 0; i < volumes_.size() && !isStaged; ++i) {
+      next = next == volumes_.end() ? volumes_.begin() : next;
+      isStaged = Stage(next->second);
+      ++next;
+    }
+    if (!isStaged) {
+      return;
+    }
+  }
+}
+
+bool Transcoder::Stage(Known& known) {
+  Volume& volume = known.volume;
+  if (!volume.HasWork()) {
+    return false;
+  }
+  auto batch = volume.Stage(staging_ + '/' + std::to_string(++batches_), FreeSpace(),
+                            InBatchOf(volume.MountPoint()));
+  if (!batch) {
+    hasMoreWork_ = hasMoreWork_ || (volume.HasWork() && running_.empty());
+    return false;
+  }
+  lastStaged_ = volume.MountPoint();
+  Start(std::move(batch));
+  return true;
+}
+
+void Transcoder::Start(std::unique_ptr<Batch> batch) {
+  running_.push_back(std::make_unique<Running>(Running{.batch = std::move(batch)}));
+  Running& running = *running_.back();
+  running.thread = std::jthread([this, &running] {
+    processor_.acquire();
+    Render(*running.batch);
+    processor_.release();
+    {
+      const std::lock_guard lock(mutex_);
+      running.isRendered = true;
+    }
+    eventfd_write(wake_.Get(), 1);
+  });
+}
+
+bool Transcoder::IsRendered(const Running& running) {
+  const std::lock_guard lock(mutex_);
+  return running.isRendered;
+}
+
+bool Transcoder::IsRendering(const std::string& mountPoint) const {
+  return std::ranges::any_of(running_, [&mountPoint](const auto& running) {
+    return running->batch->mountPoint == mountPoint;
+  });
+}
+
+Volume::IsInBatch Transcoder::InBatchOf(const std::string& mountPoint) const {
+  std::set<long long> ids;
+  for (const auto& running : running_) {
+    if (running->batch->mountPoint == mountPoint) {
+      for (const BatchPhoto& photo : running->batch->photos) {
+        ids.insert(photo.photo.id);
+      }
+    }
+  }
+  return [ids = std::move(ids)](long long id) { return ids.contains(id); };
+}
+
+long long Transcoder::FreeSpace() const {
+  long long space = MOST_STAGED;
+  for (const auto& running : running_) {
+    for (const BatchPhoto& photo : running->batch->photos) {
+      space -= photo.status.st_size <= LARGEST_PHOTO ? photo.status.st_size : 0;
+    }
+  }
+  return std::max(space, 0LL);
+}
+
+/// When there is nothing to stage.
+void Transcoder::CheckRenditions() {
+  if (running_.size() > processors_) {
+    return;
+  }
+  for (auto& [mountPoint, known] : volumes_) {
+    if (known.volume.HasUncheckedRenditions()) {
+      known.volume.CheckRenditions(InBatchOf(mountPoint));
+      hasMoreWork_ = true;
+      return;
+    }
+  }
+}
+
+void Transcoder::Announce() {
+  for (auto& [mountPoint, known] : volumes_) {
+    Announce(known);
+  }
+}
+
+void Transcoder::Announce(Known& known) {
+  using notify::Event;
+  if (!known.isScanned || !known.isEndDue) {
+    return;
+  }
+  if (sendAgainAt_ && Clock::now() < *sendAgainAt_) {
+    WakeAt(*sendAgainAt_);
+    return;
+  }
+  const bool isAtEnd = !known.volume.HasWork() && !known.volume.HasUncheckedRenditions() &&
+                       !IsRendering(known.volume.MountPoint());
+  if (isAtEnd) {
+    if (Send(notify::Compose(Event::End, known.name))) {
+      known.isEndDue = false;
+      known.changes = 0;
+    }
+  } else if (known.changes > 0) {
+    const auto due = known.changedAt + ANNOUNCE_INTERVAL;
+    if (known.changes < ANNOUNCED_CHANGES && Clock::now() < due) {
+      WakeAt(due);
+    } else if (Send(notify::Compose(Event::TranscodedBatch, known.name))) {
+      known.changes = 0;
+    }
+  }
+}
+
+bool Transcoder::Send(const std::string& message) {
+  try {
+    notify::Ask(core::ORVA_NOTIFICATION_SOCKET, {.message = message}, std::chrono::seconds(2));
+    sendAgainAt_.reset();
+    return true;
+  } catch (const std::exception&) {
+    // When the service is back, it is asked for the state of all volumes, which are then announced.
+    sendAgainAt_ = Clock::now() + SEND_AGAIN;
+    WakeAt(*sendAgainAt_);
+    return false;
+  }
+}
+
+void Transcoder::UpdateStatus() {
+  std::vector<VolumeStatus> volumes;
+  for (const auto& [mountPoint, known] : volumes_) {
+    volumes.push_back({.mountPoint = mountPoint,
+                       .waiting = known.volume.Waiting(),
+                       .failed = known.volume.Failed(),
+                       .isRendering = IsRendering(mountPoint)});
+  }
+  if (const auto time = status_.Update(volumes)) {
+    WakeAt(*time);
+  }
+}
+
+void Transcoder::WakeAt(Clock::time_point time) {
+  wakeAt_ = std::min(wakeAt_.value_or(time), time);
+}
+
+void Transcoder::Wait() {
+  std::array<pollfd, 2> events{pollfd{observer_.Descriptor(), POLLIN, 0},
+                               pollfd{wake_.Get(), POLLIN, 0}};
+  int timeout = -1;
+  if (hasMoreWork_) {
+    timeout = 0;
+  } else if (wakeAt_) {
+    const auto left = std::chrono::ceil<std::chrono::milliseconds>(*wakeAt_ - Clock::now());
+    timeout = static_cast<int>(std::max<long long>(left.count(), 0));
+  }
+  if (poll(events.data(), events.size(), timeout) == -1 && errno != EINTR) {
+    throw util::Exception("cannot wait: " + std::generic_category().message(errno));
+  }
+}
+
+} // namespace orva::transcoder

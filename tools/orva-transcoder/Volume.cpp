@@ -1,0 +1,439 @@
+#include "Volume.h"
+
+#include "Log.h"
+#include "Renderer.h"
+#include "RenditionFiles.h"
+
+#include "CatalogSchema.h"
+#include "CatalogWriter.h"
+#include "Classification.h"
+
+#include "orvadb/Transaction.h"
+#include "orvadb/VolumeDB.h"
+
+#include "orvautil/Core.h"
+#include "orvautil/Exception.h"
+#include "orvautil/FileDescriptor.h"
+
+#include <fcntl.h>
+#include <sys/sendfile.h>
+#include <sys/stat.h>
+#include <sys/statvfs.h>
+#include <syslog.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <ctime>
+#include <limits>
+#include <string_view>
+#include <system_error>
+#include <utility>
+
+namespace orva::transcoder {
+namespace {
+
+using catalog::RENDITIONS_PER_FOLDER;
+using catalog::VolumeRoot;
+using catalog::WaitingPhoto;
+
+constexpr std::size_t MOST_PHOTOS = 50;       // in a batch
+constexpr long long MOST_BYTES = 64LL << 20;  // of several photos in a batch
+constexpr std::size_t MOST_EXAMINED = 1000;   // photos in one piece of work
+constexpr std::size_t MOST_REMOVALS = 10'000; // in one piece of work
+constexpr std::chrono::seconds RETRY(60);
+constexpr std::chrono::milliseconds PIECE(200);
+
+constexpr std::array<std::string_view, 7> RAW_EXTENSIONS = {"arw", "cr2", "dng", "nef",
+                                                            "orf", "raf", "rw2"};
+
+std::string ErrorText(int error) {
+  return std::generic_category().message(error);
+}
+
+/// The volume's path on which it was mounted, without the separator at its end.
+std::string PathOf(const std::string& mountPoint) {
+  return mountPoint.substr(0, std::max<std::size_t>(mountPoint.size() - 1, 1));
+}
+
+bool IsBusy(std::string_view failure) {
+  return failure.find("database is locked") != std::string_view::npos;
+}
+
+bool IsSameTime(const timespec& a, const timespec& b) {
+  return a.tv_sec == b.tv_sec && a.tv_nsec == b.tv_nsec;
+}
+
+/// Whether both are the same file with the same content.
+bool IsSameContent(const struct stat& a, const struct stat& b) {
+  return a.st_dev == b.st_dev && a.st_ino == b.st_ino && a.st_size == b.st_size &&
+         IsSameTime(a.st_mtim, b.st_mtim);
+}
+
+/// Whether the file is the photo that the catalog describes.
+bool IsPhoto(const struct stat& status, const WaitingPhoto& photo) {
+  return S_ISREG(status.st_mode) && status.st_size == photo.size &&
+         status.st_mtim.tv_sec == photo.lastModifiedDate;
+}
+
+/// Whether a photo has the extension and the first bytes of a camera's raw format. Files with a
+/// wrong extension are rendered by their content.
+bool IsRaw(const std::string& path, const util::FileDescriptor& file) {
+  const std::string extension = catalog::ExtensionOf(path.substr(path.rfind('/') + 1));
+  std::array<char, 8> bytes{};
+  if (std::ranges::find(RAW_EXTENSIONS, extension) == RAW_EXTENSIONS.end() ||
+      pread(file.Get(), bytes.data(), bytes.size(), 0) != static_cast<ssize_t>(bytes.size())) {
+    return false;
+  }
+  const std::string_view begin(bytes.data(), bytes.size());
+  return begin.starts_with("II") || begin.starts_with("MM") || begin.starts_with("FUJI");
+}
+
+/// Copies `size` bytes. Returns 0 or an errno; EAGAIN if there are not exactly so many.
+int CopyExactly(const util::FileDescriptor& from, const util::FileDescriptor& to, long long size) {
+  off_t offset = 0;
+  while (offset < size) {
+    const ssize_t count =
+        sendfile(to.Get(), from.Get(), &offset, static_cast<std::size_t>(size - offset));
+    if (count == 0) {
+      return EAGAIN;
+    }
+    if (count == -1 && errno != EINTR) {
+      return errno;
+    }
+  }
+  char more = 0;
+  return pread(from.Get(), &more, 1, size) == 0 ? 0 : EAGAIN;
+}
+
+} // namespace
+
+Volume::Volume(std::string mountPoint, VolumeRoot::Kind kind)
+    : mountPoint_(std::move(mountPoint)), kind_(kind) {}
+
+std::size_t Volume::TakeChanges() {
+  return std::exchange(changes_, 0);
+}
+
+bool Volume::HasWork() const {
+  return !isExhausted_ && !lookAgainAt_;
+}
+
+bool Volume::HasUncheckedRenditions() const {
+  return !isChecked_ && !lookAgainAt_;
+}
+
+std::optional<Volume::Opened> Volume::Open() const {
+  VolumeRoot root(PathOf(mountPoint_), kind_);
+  struct statvfs fileSystem {};
+  if (fstatvfs(root.Descriptor(), &fileSystem) == 0 && (fileSystem.f_flag & ST_RDONLY) != 0) {
+    throw util::Exception(root.Path() + " is read-only: photos there are not rendered");
+  }
+  // The catalog is made, and made again if it is damaged, by the indexer.
+  const std::string path = core::GetCatalogPath(root.Path()).substr(root.Path().size() + 1);
+  const util::FileDescriptor file = root.Open(path, O_PATH);
+  struct stat status {};
+  if (!file || fstat(file.Get(), &status) != 0 || !S_ISREG(status.st_mode) || status.st_size == 0) {
+    return std::nullopt;
+  }
+  auto database = std::make_unique<db::VolumeDB>(root.Path(), true);
+  if (!root.IsInPlace() || !catalog::HasOwnSchema(*database)) {
+    return std::nullopt;
+  }
+  std::string identity = catalog::Identity(*database);
+  return Opened{std::move(root), std::move(database), std::move(identity)};
+}
+
+void Volume::Attempt(const std::function<void()>& work) {
+  try {
+    work();
+    problem_.clear();
+    lookAgainAt_.reset();
+    return;
+  } catch (const std::string& failure) { // the database layer's
+    Report(failure);
+  } catch (const std::exception& failure) {
+    Report(failure.what());
+  }
+}
+
+void Volume::Report(const std::string& problem) {
+  const bool isBusy = IsBusy(problem);
+  lookAgainAt_ = Clock::now() + (isBusy ? std::chrono::seconds(1) : RETRY);
+  if (!isBusy && problem != problem_) {
+    problem_ = problem;
+    Log(LOG_ERR, Printable(problem));
+  }
+}
+
+void Volume::Look() {
+  isExhausted_ = true;
+  lookAgainAt_.reset();
+  Attempt([this] {
+    const auto volume = Open();
+    if (!volume) {
+      waiting_ = failed_ = 0;
+      return;
+    }
+    Count(*volume->catalog);
+    if (identity_ != volume->identity) {
+      identity_ = volume->identity;
+      isChecked_ = false;
+      nextToCheck_ = 0;
+    }
+    last_.reset();
+    isExhausted_ = waiting_ == 0;
+    RemoveVanished(*volume);
+  });
+}
+
+void Volume::Count(const db::VolumeDB& catalog) {
+  waiting_ = static_cast<std::size_t>(catalog::CountWaiting(catalog));
+  failed_ = static_cast<std::size_t>(catalog::CountFailed(catalog));
+}
+
+void Volume::RemoveVanished(const Opened& volume) {
+  std::vector<long long> removed;
+  std::size_t count = 0;
+  do {
+    removed = catalog::RemovedFiles(*volume.catalog, MOST_REMOVALS);
+    std::vector<long long> done;
+    for (const long long id : removed) {
+      if (catalog::IsOnVolume(*volume.catalog, id) || RemoveRendition(volume.root, id)) {
+        done.push_back(id);
+      }
+    }
+    count = done.size();
+    if (count > 0) {
+      db::Transaction transaction(*volume.catalog, catalog::BUSY_TIMEOUT);
+      for (const long long id : done) {
+        catalog::ForgetRemovedFile(*volume.catalog, id);
+      }
+      transaction.Commit();
+    }
+  } while (count == MOST_REMOVALS);
+}
+
+std::unique_ptr<Batch> Volume::Stage(const std::string& path, long long space,
+                                     const IsInBatch& isInBatch) {
+  std::unique_ptr<Batch> batch;
+  Attempt([&] {
+    const auto volume = Open();
+    if (!volume || volume->identity != identity_) {
+      isExhausted_ = true; // until the next message
+      return;
+    }
+    Batch next{
+        .mountPoint = mountPoint_, .identity = volume->identity, .folder = StagingFolder(path)};
+    Room room{.space = space};
+    std::size_t examined = 0;
+    for (bool isFull = false; !isFull && examined < MOST_EXAMINED;) {
+      const auto photos = last_ ? catalog::NewestWaiting(*volume->catalog, MOST_PHOTOS, *last_)
+                                : catalog::NewestWaiting(*volume->catalog, MOST_PHOTOS);
+      for (const WaitingPhoto& photo : photos) {
+        isFull = !isInBatch(photo.id) && !StagePhoto(*volume, photo, next, room);
+        if (isFull) {
+          break;
+        }
+        ++examined;
+        last_ = photo;
+      }
+      if (!isFull && photos.size() < MOST_PHOTOS) {
+        isExhausted_ = true;
+        break;
+      }
+    }
+    if (!next.photos.empty()) {
+      batch = std::make_unique<Batch>(std::move(next));
+    }
+  });
+  return batch;
+}
+
+bool Volume::StagePhoto(const Opened& volume, const WaitingPhoto& photo, Batch& batch, Room& room) {
+  const std::size_t number = batch.photos.size();
+  if (number == MOST_PHOTOS) {
+    return false;
+  }
+  // To open a device may have an effect: look before.
+  struct stat status {};
+  const util::FileDescriptor entry = volume.root.Open(photo.path, O_PATH);
+  if (!entry || fstat(entry.Get(), &status) != 0 || !S_ISREG(status.st_mode)) {
+    return true; // the indexer will notice what has changed
+  }
+  const util::FileDescriptor file = volume.root.Open(photo.path, O_RDONLY);
+  if (!file || fstat(file.Get(), &status) != 0 || !IsPhoto(status, photo)) {
+    return true;
+  }
+  if (status.st_size > LARGEST_PHOTO) {
+    batch.photos.push_back(
+        {.photo = photo, .status = status, .failure = "the file is larger than 512 MiB"});
+    return true;
+  }
+  const long long limit = room.used == 0 ? room.space : std::min(room.space, MOST_BYTES);
+  if (room.used + status.st_size > limit) {
+    return false;
+  }
+  int error = CopyExactly(file, batch.folder.Add(number), status.st_size);
+  struct stat after {};
+  if (error == 0 && (fstat(file.Get(), &after) != 0 || !IsSameContent(status, after))) {
+    error = EAGAIN;
+  }
+  if (error != 0) {
+    batch.folder.Remove(number);
+  }
+  switch (error) {
+  case 0:
+    room.used += status.st_size;
+    batch.photos.push_back({.photo = photo, .status = status, .isRaw = IsRaw(photo.path, file)});
+    return true;
+  case ENOSPC: {
+    const bool isAlone = room.used == 0;
+    if (isAlone) {
+      Log(LOG_ERR, "no space in memory to copy " + Printable(mountPoint_ + photo.path));
+    }
+    return isAlone;
+  }
+  case EIO:
+    batch.photos.push_back(
+        {.photo = photo, .status = status, .failure = "cannot be read: " + ErrorText(error)});
+    return true;
+  default:
+    return true; // it is being written
+  }
+}
+
+Volume::Stored Volume::Store(Batch& batch) {
+  auto stored = Stored::Later;
+  Attempt([&] {
+    const auto volume = Open();
+    if (volume && volume->identity == batch.identity) {
+      const std::set<long long> written = WriteRenditions(*volume, batch);
+      MarkResults(*volume, batch, written);
+    }
+    stored = Stored::Done;
+  });
+  return stored == Stored::Later && problem_.empty() ? Stored::Later : Stored::Done;
+}
+
+std::set<long long> Volume::WriteRenditions(const Opened& volume, Batch& batch) {
+  RenditionWriter writer(volume.root);
+  std::set<long long> written;
+  for (std::size_t number = 0; number < batch.photos.size(); ++number) {
+    BatchPhoto& photo = batch.photos[number];
+    const util::FileDescriptor file = volume.root.Open(photo.photo.path, O_PATH);
+    struct stat status {};
+    photo.isOutdated =
+        !file || fstat(file.Get(), &status) != 0 || !IsSameContent(status, photo.status);
+    if (photo.isOutdated || !photo.failure.empty()) {
+      continue;
+    }
+    const util::FileDescriptor rendition = batch.folder.OpenOutput(number);
+    if (IsRendition(rendition)) {
+      writer.Add(photo.photo.id, rendition, status);
+      written.insert(photo.photo.id);
+    }
+  }
+  for (const long long id : writer.Publish()) {
+    written.erase(id);
+    ReportObstacle(catalog::RenditionPath(id) + " is a folder: it stays, and its photo waits");
+  }
+  return written;
+}
+
+void Volume::MarkResults(const Opened& volume, const Batch& batch,
+                         const std::set<long long>& written) {
+  std::vector<long long> withoutRendition;
+  std::size_t changes = 0;
+  {
+    db::Transaction transaction(*volume.catalog, catalog::BUSY_TIMEOUT);
+    const std::time_t stamp = catalog::NextStamp(*volume.catalog, std::time(nullptr));
+    for (const BatchPhoto& photo : batch.photos) {
+      const long long id = photo.photo.id;
+      if (photo.isOutdated) {
+        continue;
+      }
+      if (!photo.failure.empty()) {
+        if (catalog::MarkFailed(*volume.catalog, photo.photo, photo.failure, stamp)) {
+          withoutRendition.push_back(id);
+          ++changes;
+        }
+      } else if (written.contains(id)) {
+        if (catalog::MarkFinished(*volume.catalog, photo.photo, stamp)) {
+          ++changes;
+        } else if (!catalog::IsOnVolume(*volume.catalog, id)) {
+          withoutRendition.push_back(id); // its removal was perhaps handled before
+        }
+      }
+    }
+    if (changes > 0) {
+      transaction.Commit();
+    }
+  }
+  changes_ += changes;
+  for (const long long id : withoutRendition) {
+    RemoveRendition(volume.root, id);
+  }
+  Count(*volume.catalog);
+}
+
+void Volume::CheckRenditions(const IsInBatch& isInBatch) {
+  Attempt([&] {
+    const auto volume = Open();
+    if (!volume || volume->identity != identity_) {
+      isChecked_ = true; // until the next message
+      identity_.clear();
+      return;
+    }
+    const auto end = Clock::now() + PIECE;
+    while (!isChecked_ && Clock::now() < end) {
+      CheckNextFolder(*volume, isInBatch);
+    }
+  });
+}
+
+void Volume::CheckNextFolder(const Opened& volume, const IsInBatch& isInBatch) {
+  constexpr long long LAST = std::numeric_limits<long long>::max() - RENDITIONS_PER_FOLDER;
+  const db::VolumeDB& catalog = *volume.catalog;
+  const std::vector<long long> next = catalog::ListedPhotos(catalog, nextToCheck_, 1);
+  if (next.empty() || next.front() > LAST) {
+    RemoveOtherFolders(volume, isInBatch);
+    isChecked_ = true;
+    return;
+  }
+  const long long first = next.front() - next.front() % RENDITIONS_PER_FOLDER;
+  nextToCheck_ = first + RENDITIONS_PER_FOLDER;
+  auto expected = catalog::ListedPhotos(catalog, first, RENDITIONS_PER_FOLDER);
+  std::erase_if(expected, [this](long long id) { return id >= nextToCheck_; });
+  const auto missing = CheckFolder(volume.root, first, expected, isInBatch);
+  if (!missing.empty()) {
+    db::Transaction transaction(catalog, catalog::BUSY_TIMEOUT);
+    for (const long long id : missing) {
+      catalog::MarkMissing(catalog, id);
+    }
+    transaction.Commit();
+    Count(catalog);
+    last_.reset();
+    isExhausted_ = false;
+  }
+}
+
+void Volume::RemoveOtherFolders(const Opened& volume, const IsInBatch& isInBatch) {
+  ForEachFolder(volume.root, [&](long long first) {
+    const auto listed = catalog::ListedPhotos(*volume.catalog, first, 1);
+    if (listed.empty() || listed.front() >= first + RENDITIONS_PER_FOLDER) {
+      CheckFolder(volume.root, first, {}, isInBatch);
+      RemoveEmptyFolder(volume.root, first);
+    }
+  });
+}
+
+void Volume::ReportObstacle(const std::string& text) {
+  if (!hasReportedObstacle_) {
+    hasReportedObstacle_ = true;
+    Log(LOG_ERR, Printable(mountPoint_ + text));
+  }
+}
+
+} // namespace orva::transcoder
