@@ -548,7 +548,7 @@ TEST_F(IndexerTest, HasNoOptionsButHelpAndVersion) {
   EXPECT_THAT(help.output, HasSubstr("Exit status"));
   const Outcome wrong = test::Run({program, "now"});
   EXPECT_EQ(wrong.status, 2);
-  EXPECT_THAT(wrong.output + wrong.error, HasSubstr("unexpected argument 'now'"));
+  EXPECT_THAT(wrong.output + wrong.error, HasSubstr("'now'\nTry 'orva-indexer --help'.\n"));
 }
 
 } // namespace
