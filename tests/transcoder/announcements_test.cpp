@@ -165,8 +165,7 @@ TEST(TranscoderCommandLine, HasOnlyHelpAndVersion) {
   EXPECT_THAT(test::Run({program, "--version"}).output, testing::StartsWith("orva-transcoder "));
   const Outcome wrong = test::Run({program, "stray"});
   EXPECT_EQ(wrong.status, 2);
-  EXPECT_EQ(wrong.error, "orva-transcoder: unexpected argument 'stray'\n"
-                         "Try 'orva-transcoder --help'.\n");
+  EXPECT_THAT(wrong.error, HasSubstr("'stray'\nTry 'orva-transcoder --help'.\n"));
 }
 
 TEST(TranscoderCommandLine, AWorkingFolderThatCannotBeUsedIsAFailure) {
