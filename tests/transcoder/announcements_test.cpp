@@ -41,10 +41,10 @@ TEST_F(Announcements, NothingIsAnnouncedBeforeTheVolumeWasScanned) {
   Announce("plugged");
   ASSERT_TRUE(Await([this] { return Waiting() == 0; }));
   Announce("scanned");
-  std::string line = Service().ReadLineWith("sent to 1 client: ");
+  std::string line = Service().ReadLineWith("sent to ");
   while (line.find("Scanned") == std::string::npos) {
     EXPECT_EQ(line.find("End"), std::string::npos) << line;
-    line = Service().ReadLineWith("sent to 1 client: ");
+    line = Service().ReadLineWith("sent to ");
   }
   EXPECT_TRUE(AwaitSent("\"End\""));
 }
@@ -165,8 +165,7 @@ TEST(TranscoderCommandLine, HasOnlyHelpAndVersion) {
   EXPECT_THAT(test::Run({program, "--version"}).output, testing::StartsWith("orva-transcoder "));
   const Outcome wrong = test::Run({program, "stray"});
   EXPECT_EQ(wrong.status, 2);
-  EXPECT_EQ(wrong.error, "orva-transcoder: unexpected argument 'stray'\n"
-                         "Try 'orva-transcoder --help'.\n");
+  EXPECT_THAT(wrong.error, HasSubstr("'stray'\nTry 'orva-transcoder --help'.\n"));
 }
 
 TEST(TranscoderCommandLine, AWorkingFolderThatCannotBeUsedIsAFailure) {

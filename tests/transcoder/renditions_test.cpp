@@ -73,6 +73,19 @@ TEST_F(Renditions, GetTheOwnerOfThePhotoAndItsPermissionToRead) {
   EXPECT_EQ(StatusOf(Rendition("open.jpg")).st_mode & 07777, 0444U);
 }
 
+TEST_F(Renditions, OfPhotosInAPrivateFolderArePrivate) {
+  fs::create_directories(At("private/below"));
+  fs::create_directories(At("group/below"));
+  Copy("private/below/a.jpg");
+  Copy("group/below/a.jpg");
+  chmod(At("private").c_str(), 0700);
+  chmod(At("group").c_str(), 0750);
+  AddAllWaiting({"private/below/a.jpg", "group/below/a.jpg"});
+  RenderAll();
+  EXPECT_EQ(StatusOf(Rendition("private/below/a.jpg")).st_mode & 07777, 0400U);
+  EXPECT_EQ(StatusOf(Rendition("group/below/a.jpg")).st_mode & 07777, 0440U);
+}
+
 TEST_F(Renditions, AFailedPhotoIsNotTriedAgainUntilItChanges) {
   WriteBytes(At("a.jpg"), "no image");
   Copy("b.jpg");
@@ -234,8 +247,31 @@ TEST_F(Renditions, NothingIsWrittenWhereNothingIsMounted) {
   EXPECT_TRUE(fs::exists(Rendition("a.jpg")));
 }
 
+TEST_F(Renditions, AVolumeThatBecomesFullIsReportedOnceAndTriedAgain) {
+  // There is enough space for one rendition, but not for all.
+  RunChecked({"vips", "gaussnoise", "/tmp/noise.v", "1500", "1500", "--sigma", "90"});
+  RunChecked({"vips", "cast", "/tmp/noise.v", "/tmp/noise.jpg", "uchar"});
+  Lines names;
+  for (int i = 0; i < 40; ++i) {
+    names.push_back(std::to_string(i) + ".jpg");
+    fs::copy_file("/tmp/noise.jpg", At(names.back()));
+  }
+  AddAllWaiting(names);
+  TheVolume().Resize(TheVolume().Used() + (5 << 20));
+  Announce("scanned");
+  ASSERT_TRUE(Await([this] {
+    return testing::Matches(Contains(HasSubstr("No space left on device")))(Logged());
+  })) << testing::PrintToString(Logged());
+  EXPECT_GT(Waiting(), 0);
+  TheVolume().Resize(1e9);
+  RenderAll();
+  for (const std::string& name : names) {
+    EXPECT_EQ(HeaderOf(Rendition(name)).width, 1024);
+  }
+}
+
 TEST_F(Renditions, AFullVolumeIsReportedOnceAndTriedAgain) {
-  // Its rendition is larger than the free space, which is enough for the catalog.
+  // The free space is enough for the catalog.
   RunChecked({"vips", "gaussnoise", "/tmp/noise.v", "1000", "1000", "--sigma", "90"});
   RunChecked({"vips", "cast", "/tmp/noise.v", At("a.png"), "uchar"});
   AddWaiting("a.png");

@@ -8,6 +8,7 @@
 
 #include <gmock/gmock.h>
 
+#include <fcntl.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 
@@ -71,6 +72,12 @@ TEST_F(Sandbox, HasAnEnvironmentOfItsOwn) {
   const std::string environment = Shell("env").output;
   EXPECT_THAT(environment, Not(HasSubstr("SECRET")));
   EXPECT_THAT(environment, HasSubstr("VIPS_BLOCK_UNTRUSTED=1\n"));
+}
+
+TEST_F(Sandbox, InheritsNoOpenFiles) {
+  const util::FileDescriptor secret(open("/shares/secret", O_RDONLY)); // not close-on-exec
+  ASSERT_TRUE(secret);
+  EXPECT_NE(Shell("cat <&" + std::to_string(secret.Get())).output, "secret");
 }
 
 TEST_F(Sandbox, HasNoPrivilegesAndOwnsNothing) {

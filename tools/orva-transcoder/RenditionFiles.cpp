@@ -144,7 +144,8 @@ const FileDescriptor& RenditionWriter::FolderOf(long long id) {
   return folder;
 }
 
-void RenditionWriter::Add(long long id, const FileDescriptor& content, const struct stat& photo) {
+void RenditionWriter::Add(long long id, const FileDescriptor& content, const struct stat& photo,
+                          mode_t mode) {
   const FileDescriptor& folder = FolderOf(id);
   FileDescriptor file = MakeFile(folder, TemporaryName(id));
   if (!file) {
@@ -157,7 +158,7 @@ void RenditionWriter::Add(long long id, const FileDescriptor& content, const str
   }
   // Some file systems have no owners and modes.
   static_cast<void>(fchown(descriptor, photo.st_uid, photo.st_gid) == 0);
-  static_cast<void>(fchmod(descriptor, photo.st_mode & 0444) == 0);
+  static_cast<void>(fchmod(descriptor, mode) == 0);
 }
 
 std::vector<long long> RenditionWriter::Publish() {

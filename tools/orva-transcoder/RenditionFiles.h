@@ -30,8 +30,9 @@ public:
   ~RenditionWriter();
 
   /// Copies `content`, the rendition of the file `id`. It gets the owner and group of `photo`, and
-  /// of its mode what allows reading.
-  void Add(long long id, const util::FileDescriptor& content, const struct stat& photo);
+  /// may be read by those who `mode` says.
+  void Add(long long id, const util::FileDescriptor& content, const struct stat& photo,
+           mode_t mode);
 
   /// Writes all of them to the medium and gives them their names. Returns the ids of those whose
   /// name is taken by a folder.

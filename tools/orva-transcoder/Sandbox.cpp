@@ -16,6 +16,7 @@
 #include <csignal>
 #include <filesystem>
 #include <initializer_list>
+#include <limits>
 #include <system_error>
 #include <utility>
 
@@ -125,6 +126,8 @@ void BecomeSandboxUser() noexcept {
       dup2(error, STDERR_FILENO) == -1) {
     _exit(CANNOT_START);
   }
+  // Another thread may have opened a file that programs inherit.
+  close_range(STDERR_FILENO + 1, std::numeric_limits<unsigned>::max(), 0);
   BecomeSandboxUser();
   // As the signals were before this program changed them.
   sigset_t none;

@@ -90,6 +90,26 @@ bool IsRaw(const std::string& path, const util::FileDescriptor& file) {
   return begin.starts_with("II") || begin.starts_with("MM") || begin.starts_with("FUJI");
 }
 
+/// Who may read the photo at `path`: of its mode what allows reading, as far as the folders on the
+/// way let the same users pass.
+mode_t ReadersOf(const VolumeRoot& root, const std::string& path, const struct stat& photo) {
+  mode_t mode = photo.st_mode & (S_IRUSR | S_IRGRP | S_IROTH);
+  for (auto end = path.find('/'); end != std::string::npos; end = path.find('/', end + 1)) {
+    const util::FileDescriptor folder = root.Open(path.substr(0, end), O_PATH | O_DIRECTORY);
+    struct stat status {};
+    if (!folder || fstat(folder.Get(), &status) != 0) {
+      return mode & S_IRUSR;
+    }
+    if ((status.st_mode & S_IXOTH) == 0) {
+      mode &= ~static_cast<mode_t>(S_IROTH);
+      if ((status.st_mode & S_IXGRP) == 0 || status.st_gid != photo.st_gid) {
+        mode &= ~static_cast<mode_t>(S_IRGRP);
+      }
+    }
+  }
+  return mode;
+}
+
 /// Copies `size` bytes. Returns 0 or an errno; EAGAIN if there are not exactly so many.
 int CopyExactly(const util::FileDescriptor& from, const util::FileDescriptor& to, long long size) {
   off_t offset = 0;
@@ -148,7 +168,6 @@ std::optional<Volume::Opened> Volume::Open() const {
 void Volume::Attempt(const std::function<void()>& work) {
   try {
     work();
-    problem_.clear();
     lookAgainAt_.reset();
     return;
   } catch (const std::string& failure) { // the database layer's
@@ -159,9 +178,9 @@ void Volume::Attempt(const std::function<void()>& work) {
 }
 
 void Volume::Report(const std::string& problem) {
-  const bool isBusy = IsBusy(problem);
-  lookAgainAt_ = Clock::now() + (isBusy ? std::chrono::seconds(1) : RETRY);
-  if (!isBusy && problem != problem_) {
+  isBusy_ = IsBusy(problem);
+  lookAgainAt_ = Clock::now() + (isBusy_ ? std::chrono::seconds(1) : RETRY);
+  if (!isBusy_ && problem != problem_) {
     problem_ = problem;
     Log(LOG_ERR, Printable(problem));
   }
@@ -223,6 +242,12 @@ std::unique_ptr<Batch> Volume::Stage(const std::string& path, long long space,
     if (!volume || volume->identity != identity_) {
       isExhausted_ = true; // until the next message
       return;
+    }
+    // Does not render what cannot be written.
+    struct statvfs fileSystem {};
+    if (fstatvfs(volume->root.Descriptor(), &fileSystem) == 0 &&
+        fileSystem.f_bavail < LARGEST_RENDITION / fileSystem.f_frsize) {
+      throw util::Exception(volume->root.Path() + ": " + ErrorText(ENOSPC));
     }
     Batch next{
         .mountPoint = mountPoint_, .identity = volume->identity, .folder = StagingFolder(path)};
@@ -306,15 +331,17 @@ bool Volume::StagePhoto(const Opened& volume, const WaitingPhoto& photo, Batch& 
 
 Volume::Stored Volume::Store(Batch& batch) {
   auto stored = Stored::Later;
+  isBusy_ = false;
   Attempt([&] {
     const auto volume = Open();
     if (volume && volume->identity == batch.identity) {
       const std::set<long long> written = WriteRenditions(*volume, batch);
       MarkResults(*volume, batch, written);
+      problem_.clear();
     }
     stored = Stored::Done;
   });
-  return stored == Stored::Later && problem_.empty() ? Stored::Later : Stored::Done;
+  return isBusy_ ? stored : Stored::Done;
 }
 
 std::set<long long> Volume::WriteRenditions(const Opened& volume, Batch& batch) {
@@ -331,7 +358,8 @@ std::set<long long> Volume::WriteRenditions(const Opened& volume, Batch& batch) 
     }
     const util::FileDescriptor rendition = batch.folder.OpenOutput(number);
     if (IsRendition(rendition)) {
-      writer.Add(photo.photo.id, rendition, status);
+      writer.Add(photo.photo.id, rendition, status,
+                 ReadersOf(volume.root, photo.photo.path, status));
       written.insert(photo.photo.id);
     }
   }

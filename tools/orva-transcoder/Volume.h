@@ -109,7 +109,8 @@ private:
   long long nextToCheck_ = 0;                 ///< id
   bool isChecked_ = true;                     ///< all renditions are
   bool hasReportedObstacle_ = false;
-  std::string problem_; ///< as it was last logged
+  std::string problem_; ///< as it was last logged, until renditions are written again
+  bool isBusy_ = false; ///< another program used the catalog when work last failed
   std::optional<Clock::time_point> lookAgainAt_;
 };
 
