@@ -127,18 +127,24 @@ std::size_t Ask(const std::string& address, const Request& request, std::chrono:
 }
 
 void ControlConnection::ReadAvailable() {
+  while (IsOpen() && ReadChunk()) {
+  }
+}
+
+/// Returns false when there is no input for now.
+bool ControlConnection::ReadChunk() {
   std::vector<char> chunk(std::size_t{64} * 1024);
-  const ssize_t count = IsOpen() ? recv(Descriptor(), chunk.data(), chunk.size(), 0) : 0;
+  const ssize_t count = recv(Descriptor(), chunk.data(), chunk.size(), 0);
   if (count == -1 && IsTemporary(errno)) {
-    return;
+    return false;
   }
   if (count <= 0 || complete_ || handling_) {
     Close();
-    return;
+    return true;
   }
   input_.append(chunk.data(), static_cast<std::size_t>(count));
   if (!arriving_ && !ReadHeader()) {
-    return;
+    return true;
   }
   if (input_.size() == length_) {
     arriving_->message = std::move(input_);
@@ -146,6 +152,7 @@ void ControlConnection::ReadAvailable() {
   } else if (input_.size() > length_) {
     Close();
   }
+  return true;
 }
 
 bool ControlConnection::ReadHeader() {

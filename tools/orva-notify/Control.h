@@ -41,7 +41,7 @@ class ControlConnection : public util::Socket {
 public:
   explicit ControlConnection(util::FileDescriptor connection) : Socket(connection.Release()) {}
 
-  /// Reads the available input.
+  /// Reads all available input, also to notice a requester that has given up.
   void ReadAvailable();
 
   /// The request, once all of it has arrived, until AwaitHandling().
@@ -58,6 +58,7 @@ public:
   std::optional<std::size_t> Handled() const;
 
 private:
+  bool ReadChunk();
   bool ReadHeader();
   void WriteLine(std::size_t count);
 
