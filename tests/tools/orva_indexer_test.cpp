@@ -366,8 +366,8 @@ TEST_F(IndexerTest, RandomOperationsConvergeToWhatANewCatalogSays) {
   ASSERT_TRUE(Await([&] { return Count(Events(volume.Path()), "End") == 1; }));
   constexpr int SEED = 14;
   Operations operations(volume.Path(), SEED);
-  for (int round = 0; round < TestScale(3, 100); ++round) {
-    for (int i = 0; i < 100; ++i) {
+  for (int round = 0; round < TestScale(15, 200); ++round) {
+    for (int i = 0; i < TestScale(20, 50); ++i) {
       operations.Perform();
     }
     ASSERT_THAT(AwaitCatalog(volume.Path()), IsEmpty()) << "seed " << SEED << ", round " << round;

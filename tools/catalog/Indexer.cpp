@@ -5,7 +5,7 @@
 
 #include "orvadb/Transaction.h"
 
-#include <ranges>
+#include <iterator>
 #include <utility>
 #include <vector>
 
@@ -28,9 +28,8 @@ IndexSummary Indexer::Run() {
       progress_(indexer.Summary());
     }
     // The first one is next.
-    for (IndexedFolder& next : inside | std::views::reverse) {
-      waiting.push_back(std::move(next));
-    }
+    waiting.insert(waiting.end(), std::make_move_iterator(inside.rbegin()),
+                   std::make_move_iterator(inside.rend()));
   }
   indexer.DeleteUnreachableRows(indexer.Summary().folders, indexer.Summary().rows);
   transaction.Commit();

@@ -33,7 +33,7 @@ constexpr int MOST_SET_ASIDE = 3;
 
 /// Readers take stamps as 32-bit numbers.
 constexpr long long LAST_STAMP = std::numeric_limits<int>::max();
-constexpr long long DAY = 24 * 60 * 60;
+constexpr long long DAY = 86'400;
 
 /// No catalog has so many rows; the arithmetic on ids cannot overflow.
 constexpr long long LAST_ID = 1LL << 53;

@@ -21,7 +21,6 @@
 #include <array>
 #include <cerrno>
 #include <iterator>
-#include <ranges>
 #include <system_error>
 #include <utility>
 
@@ -424,8 +423,8 @@ void Volume::WalkNext(FolderIndexer& indexer) {
     walkedFolders_ += static_cast<long long>(inside.size());
     walkedFiles_ += indexer.Summary().rows - rows;
   }
-  // The first one is next.
-  for (Folder& next : inside | std::views::reverse) {
+  std::ranges::reverse(inside); // the first one is next
+  for (Folder& next : inside) {
     const bool isUnknown = watches_ && !watches_->Has(next.path);
     if (task.recursive || isUnknown) {
       ready_.push_back({.path = std::move(next.path), .recursive = true, .revived = next.revived});
