@@ -4,7 +4,9 @@
 #include "Generator.h"
 #include "Indexer.h"
 #include "Options.h"
+#include "Renditions.h"
 #include "Sql.h"
+#include "VolumeRoot.h"
 
 #include "commandline/UsageError.h"
 
@@ -28,6 +30,7 @@
 #include <unistd.h>
 
 #include <array>
+#include <cerrno>
 #include <cstdio>
 #include <cstdlib>
 #include <filesystem>
@@ -569,6 +572,202 @@ TEST_F(OrvaCatalog, AVolumeThatCannotBeReadIsAFailure) {
     EXPECT_THROW(indexer.Run(), util::Exception);
   }
   EXPECT_EQ(Number("SELECT isDeleted FROM Files"), 0);
+}
+
+// --- Index: photos that wait, and single folders ------------------------------------------------
+
+class OrvaCatalogFolders : public OrvaCatalog {
+protected:
+  using Hooks = catalog::FolderIndexer::Hooks;
+
+  /// Updates the folder at `path`. Returns the paths of the folders in it.
+  Lines Update(const std::string& path, std::time_t now = NOW, Hooks hooks = {}) const {
+    const auto database = Open();
+    const catalog::VolumeRoot root(volume_.native(), catalog::VolumeRoot::Kind::Directory);
+    db::Transaction transaction(*database, 0);
+    catalog::FolderIndexer indexer(*database, root, catalog::NewPhotos::Waiting, now,
+                                   std::move(hooks));
+    Lines inside;
+    for (const catalog::IndexedFolder& folder : indexer.Update(indexer.Find(path).value())) {
+      inside.push_back(folder.path);
+    }
+    transaction.Commit();
+    return inside;
+  }
+
+  /// The transcoder's part: what `mark` does with the photo that waits.
+  template <typename Mark>
+  void MarkWaiting(std::time_t now, Mark mark) const {
+    const auto database = Open();
+    db::Transaction transaction(*database, 0);
+    const auto waiting = catalog::NewestWaiting(*database, 10);
+    ASSERT_EQ(waiting.size(), 1U);
+    EXPECT_TRUE(mark(*database, waiting.front(), catalog::NextStamp(*database, now)));
+    transaction.Commit();
+  }
+  void Finish(std::time_t now) const { MarkWaiting(now, catalog::MarkFinished); }
+  void Fail(std::time_t now) const {
+    MarkWaiting(now,
+                [](const db::DB& database, const catalog::WaitingPhoto& photo, std::time_t stamp) {
+                  return catalog::MarkFailed(database, photo, "reason", stamp);
+                });
+  }
+
+  /// "path|isDeleted|status|status of the transcoding" of all files.
+  Lines States() const {
+    return Query("SELECT f.path, f.isDeleted, f.status, ifnull(t.status, '-') FROM Files f "
+                 "LEFT JOIN Transcodings t ON t.sourceId = f.id ORDER BY f.path",
+                 4);
+  }
+};
+
+TEST_F(OrvaCatalogFolders, OnlyTheGivenFolderIsUpdated) {
+  Write("Pictures/Deep/a.jpg");
+  Write("Pictures/b.jpg");
+  Write("c.jpg");
+  EXPECT_EQ(Update(""), Lines{"Pictures/"});
+  EXPECT_EQ(Query("SELECT path FROM Files"), Lines{"c.jpg"});
+  EXPECT_EQ(Update("Pictures/"), Lines{"Pictures/Deep/"});
+  EXPECT_EQ(Query("SELECT path FROM Files ORDER BY path"), (Lines{"Pictures/b.jpg", "c.jpg"}));
+}
+
+TEST_F(OrvaCatalogFolders, AFolderWithoutChangesWritesNothing) {
+  Write("a.jpg");
+  Update("");
+  const long long stamp = Number("SELECT newestStamp FROM Identity");
+  Update("", NOW + 10);
+  EXPECT_EQ(Number("SELECT newestStamp FROM Identity"), stamp);
+}
+
+TEST_F(OrvaCatalogFolders, TheTimeOfTheFolderItselfIsUpdated) {
+  Write("Pictures/a.jpg");
+  Update("");
+  SetTime("Pictures", NOW - 77);
+  Update("Pictures/");
+  EXPECT_EQ(Number("SELECT lastModifiedDate FROM Folders"), NOW - 77);
+}
+
+TEST_F(OrvaCatalogFolders, NewPhotosWait) {
+  Write("a.jpg");
+  Write("b.txt");
+  Update("");
+  EXPECT_EQ(States(), (Lines{"a.jpg|0|1|-", "b.txt|0|1|-"}));
+  EXPECT_EQ(catalog::CountWaiting(*Open()), 1);
+}
+
+TEST_F(OrvaCatalogFolders, AChangedPhotoWaitsAndStaysListed) {
+  Write("a.jpg");
+  Update("");
+  Finish(NOW + 1);
+  SetTime("a.jpg", NOW - 5);
+  Update("", NOW + 10);
+  EXPECT_EQ(States(), Lines{"a.jpg|0|1|1"});
+  EXPECT_EQ(ChangedSince(NOW + 1), Lines{});
+}
+
+TEST_F(OrvaCatalogFolders, AChangedPhotoThatHadFailedWaitsAgain) {
+  Write("a.jpg");
+  Update("");
+  Fail(NOW + 1);
+  EXPECT_EQ(catalog::CountFailed(*Open()), 1);
+  SetTime("a.jpg", NOW - 5);
+  Update("", NOW + 10);
+  EXPECT_EQ(catalog::CountFailed(*Open()), 0);
+  EXPECT_EQ(catalog::CountWaiting(*Open()), 1);
+}
+
+TEST_F(OrvaCatalogFolders, AVanishedPhotoLeavesTheMergedDatabaseAndItsRenditionIsRemoved) {
+  Write("a.jpg");
+  Write("Pictures/b.jpg");
+  Index();
+  Remove("a.jpg");
+  Remove("Pictures");
+  Update("", NOW + 10);
+  EXPECT_EQ(States(), (Lines{"Pictures/b.jpg|1|1|0", "a.jpg|1|1|0"}));
+  EXPECT_EQ(catalog::RemovedFiles(*Open(), 10).size(), 2U);
+}
+
+TEST_F(OrvaCatalogFolders, APhotoThatComesBackWaits) {
+  Write("a.jpg");
+  Index();
+  Remove("a.jpg");
+  Index(NOW + 10);
+  Write("a.jpg");
+  Update("", NOW + 20);
+  EXPECT_EQ(States(), Lines{"a.jpg|0|1|0"});
+  EXPECT_EQ(ChangedSince(NOW + 10), Lines{});
+}
+
+TEST_F(OrvaCatalogFolders, TheSecondRowOfAFailedPhotoStaysUntilThePhotoIsFinished) {
+  Write("a.jpg");
+  Update("");
+  Finish(NOW + 1);
+  SetTime("a.jpg", NOW - 5);
+  Update("", NOW + 2);
+  Fail(NOW + 3);
+  EXPECT_EQ(States(), (Lines{"/a.jpg|1|1|0", "a.jpg|0|2|3"}));
+  Update("", NOW + 4); // it is no file of the folder
+  EXPECT_EQ(States(), (Lines{"/a.jpg|1|1|0", "a.jpg|0|2|3"}));
+  SetTime("a.jpg", NOW - 4);
+  Index(NOW + 5);
+  EXPECT_EQ(States(), Lines{"a.jpg|0|3|1"});
+  EXPECT_EQ(Number("SELECT count(*) FROM Transcodings"), 1);
+}
+
+TEST_F(OrvaCatalogFolders, AFileThatIsNotCompleteKeepsItsRow) {
+  Write("a.jpg");
+  Write("b.jpg");
+  Update("");
+  Write("a.jpg", "longer content");
+  Write("b.jpg", "longer content");
+  Write("c.jpg");
+  const auto isComplete = [](const catalog::IndexedFolder&, const std::string& name,
+                             const catalog::FolderIndexer::FileState&) { return name == "b.jpg"; };
+  Update("", NOW + 10, {.isComplete = isComplete});
+  EXPECT_EQ(Query("SELECT path, size FROM Files ORDER BY path", 2), (Lines{"a.jpg|7", "b.jpg|14"}));
+}
+
+TEST_F(OrvaCatalogFolders, AFolderIsOpenBeforeItIsListed) {
+  Write("a.jpg");
+  const auto opened = [this](const catalog::IndexedFolder& folder, int descriptor) {
+    EXPECT_EQ(folder.path, "");
+    EXPECT_NE(descriptor, -1);
+    Write("b.jpg");
+  };
+  Update("", NOW, {.opened = opened});
+  EXPECT_EQ(Query("SELECT path FROM Files ORDER BY path"), (Lines{"a.jpg", "b.jpg"}));
+}
+
+TEST_F(OrvaCatalogFolders, RowsThatNoFolderLeadsToAreMarkedDeleted) {
+  Write("a.jpg");
+  Index();
+  catalog::Execute(*Open(),
+                   "INSERT INTO Folders VALUES(5, 6, 'X/Y/', 'Y', 4, 1, 0, 0, 0, 0, 1, 1)");
+  catalog::Execute(*Open(), "INSERT INTO Folders VALUES(6, 5, 'X/', 'X', 4, 1, 0, 0, 0, 0, 1, 1)");
+  catalog::Execute(*Open(), "INSERT INTO Files VALUES(5, 6, 'X/x.jpg', 'x.jpg', 3, 1, 0, 0, 0, 0, "
+                            "3, 1, 'jpg', 1)");
+  EXPECT_EQ(Index(NOW + 10).deleted, 1);
+  EXPECT_EQ(Number("SELECT count(*) FROM Folders WHERE isDeleted = 0"), 0);
+  EXPECT_EQ(Query("SELECT path FROM Files WHERE isDeleted = 0"), Lines{"a.jpg"});
+}
+
+TEST_F(OrvaCatalog, APathOfAVolumeIsOpenedWithoutLinks) {
+  using catalog::VolumeRoot;
+  Write("Pictures/a.jpg");
+  fs::create_directory_symlink("Pictures", volume_ / "Link");
+  const VolumeRoot root(volume_.native(), VolumeRoot::Kind::Directory);
+  EXPECT_TRUE(root.Open("", O_RDONLY | O_DIRECTORY));
+  EXPECT_TRUE(root.Open("Pictures/a.jpg", O_RDONLY));
+  EXPECT_TRUE(root.Open("Pictures", O_PATH | O_DIRECTORY));
+  EXPECT_FALSE(root.Open("Link", O_RDONLY));
+  EXPECT_EQ(errno, ELOOP);
+  EXPECT_FALSE(root.Open("Link/a.jpg", O_RDONLY));
+  EXPECT_EQ(errno, ELOOP);
+  EXPECT_FALSE(root.Open("../volume", O_RDONLY));
+  EXPECT_EQ(errno, EXDEV);
+  EXPECT_THROW(VolumeRoot(volume_.native(), VolumeRoot::Kind::Mount), util::Exception);
+  EXPECT_THROW(VolumeRoot((volume_ / "Link").native(), VolumeRoot::Kind::Directory),
+               util::Exception);
 }
 
 // --- Generate ----------------------------------------------------------------------------------

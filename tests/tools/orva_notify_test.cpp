@@ -354,15 +354,17 @@ TEST(MountInfo, HoldsOnlyWhatIsDirectlyBelowShares) {
                         "32 31 0:7 / /shares/B/inner rw - tmpfs none rw\n"
                         "33 22 0:8 / /sharesX/C rw - tmpfs none rw\n"
                         "34 30 0:9 /sub /shares/A ro - ext4 /dev/sda rw\n"),
-              ElementsAre(Pair("/shares/A", 34), Pair("/shares/B", 31)));
+              ElementsAre(Pair("/shares/A", MountIdentity{34, "0:9"}),
+                          Pair("/shares/B", MountIdentity{31, "0:6"})));
 }
 
 TEST(MountInfo, DecodesTheKernelsEscapes) {
   EXPECT_THAT(VolumesOf("31 1 0:6 /a\\040b /shares/My\\040Photos\\011\\012\\134040 rw - tmpfs x y\n"
                         "32 1 0:6 / /shares/tail\\04 rw - tmpfs x y\n"
                         "33 1 0:6 / /shares/form\ffeed rw - tmpfs x y\n"),
-              ElementsAre(Pair("/shares/My Photos\t\n\\040", 31), Pair("/shares/form\ffeed", 33),
-                          Pair("/shares/tail\\04", 32)));
+              ElementsAre(Pair("/shares/My Photos\t\n\\040", MountIdentity{31, "0:6"}),
+                          Pair("/shares/form\ffeed", MountIdentity{33, "0:6"}),
+                          Pair("/shares/tail\\04", MountIdentity{32, "0:6"})));
 }
 
 TEST(MountInfo, HoldsTheTopMountAndNoHiddenOnes) {
@@ -370,19 +372,26 @@ TEST(MountInfo, HoldsTheTopMountAndNoHiddenOnes) {
                         "32 1 0:7 / /shares rw - tmpfs x y\n"
                         "33 32 0:8 / /shares/B rw - tmpfs x y\n"
                         "34 33 0:9 / /shares/B rw - tmpfs x y\n"),
-              ElementsAre(Pair("/shares/B", 34)));
+              ElementsAre(Pair("/shares/B", MountIdentity{34, "0:9"})));
 }
 
 TEST(MountInfo, SkipsMalformedLines) {
   EXPECT_THAT(VolumesOf("\nnonsense\n31 1 0:6\n32 1 0:6 / /shares/A rw - tmpfs x y\n"),
-              ElementsAre(Pair("/shares/A", 32)));
+              ElementsAre(Pair("/shares/A", MountIdentity{32, "0:6"})));
 }
 
 TEST(MountInfo, AnotherMountOnAMountPointIsUnpluggedAndPlugged) {
-  const VolumeChanges changes = Compare({{"/shares/A", 1}, {"/shares/B", 2}, {"/shares/C", 3}},
-                                        {{"/shares/B", 2}, {"/shares/C", 7}, {"/shares/D", 8}});
+  const VolumeChanges changes =
+      Compare({{"/shares/A", {1, "8:1"}}, {"/shares/B", {2, "8:2"}}, {"/shares/C", {3, "8:3"}}},
+              {{"/shares/B", {2, "8:2"}}, {"/shares/C", {7, "8:3"}}, {"/shares/D", {8, "8:4"}}});
   EXPECT_THAT(changes.unplugged, ElementsAre("/shares/A", "/shares/C"));
   EXPECT_THAT(changes.plugged, ElementsAre("/shares/C", "/shares/D"));
+}
+
+TEST(MountInfo, AnotherDiskWithTheNumberOfAnEarlierMountIsUnpluggedAndPlugged) {
+  const VolumeChanges changes = Compare({{"/shares/A", {1, "8:1"}}}, {{"/shares/A", {1, "8:17"}}});
+  EXPECT_THAT(changes.unplugged, ElementsAre("/shares/A"));
+  EXPECT_THAT(changes.plugged, ElementsAre("/shares/A"));
 }
 
 TEST_F(OrvaNotify, SendsEveryMessageToEachClient) {

@@ -87,18 +87,20 @@ TEST_F(ZophotosActivity, IsInTheJsonOfEachVolume) {
   WriteVolumes(INDEXER_FOLDER, IndexerVolume("/shares/A/", "walking", "12") + "," +
                                    IndexerVolume("/shares/E", "walking", "1"));
   EXPECT_EQ(
-      R"({"files":3,"folders":3,"folders_waiting":12,"merged_up_to":"1970-01-01T00:33:22Z","state":"walking","total":3,"transcoded":3,"volume":"/shares/A/"})",
+      R"({"files":3,"folders":3,"folders_waiting":12,"gone":false,"merged_up_to":"1970-01-01T00:33:22Z","state":"walking","total":3,"transcoded":3,"volume":"/shares/A/"})",
       VolumeInJson("/shares/A/").dump());
   EXPECT_EQ(
-      R"({"files":0,"folders":1,"folders_waiting":null,"merged_up_to":null,"state":null,"total":0,"transcoded":0,"volume":"/shares/C/"})",
+      R"({"files":0,"folders":1,"folders_waiting":null,"gone":false,"merged_up_to":null,"state":null,"total":0,"transcoded":0,"volume":"/shares/C/"})",
       VolumeInJson("/shares/C/").dump());
   EXPECT_EQ(
-      R"({"files":0,"folders":0,"folders_waiting":1,"merged_up_to":null,"state":"walking","total":0,"transcoded":0,"volume":"/shares/E/"})",
+      R"({"files":0,"folders":0,"folders_waiting":1,"gone":false,"merged_up_to":null,"state":"walking","total":0,"transcoded":0,"volume":"/shares/E/"})",
       VolumeInJson("/shares/E/").dump());
   WriteVolumes(TRANSCODER_FOLDER, TranscoderVolume("/shares/E/", "5", "2", "true"));
-  EXPECT_THAT(Zophotos({"status", "--json"}).output,
-              HasSubstr(R"("merged_up_to":null,"state":"walking","folders_waiting":1,"waiting":5,)"
-                        R"("failed":2,"rendering":true}]})"));
+  EXPECT_THAT(
+      Zophotos({"status", "--json"}).output,
+      HasSubstr(
+          R"("merged_up_to":null,"gone":false,"state":"walking","folders_waiting":1,"waiting":5,)"
+          R"("failed":2,"rendering":true}]})"));
   EXPECT_THAT(VolumeInJson("/shares/A/").dump(), HasSubstr(R"("failed":null,)"));
 }
 

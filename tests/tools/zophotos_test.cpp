@@ -1,5 +1,6 @@
 // What zophotos prints of a sound database.
 
+#include "Terminal.h"
 #include "ZophotosTest.h"
 
 #include <filesystem>
@@ -48,12 +49,12 @@ TEST_F(ZophotosStatus, ShowsTheProgressOfEachVolume) {
 TEST_F(ZophotosStatus, PrintsOneObjectInJson) {
   ExpectOutput(
       Zophotos({"status", "--json"}),
-      R"({"database":"/shares/A//.zophotos/zophotos.db","version":"2.0",)"
-      R"("stamped":"1970-01-01T00:16:40Z","volumes":[)"
-      R"({"volume":"/shares/A/","transcoded":3,"total":3,"folders":3,"files":3,"merged_up_to":"1970-01-01T00:33:22Z"},)"
-      R"({"volume":"/shares/B/","transcoded":1,"total":3,"folders":2,"files":1,"merged_up_to":"1970-01-01T00:33:23Z"},)"
-      R"({"volume":"/shares/C/","transcoded":0,"total":0,"folders":1,"files":0,"merged_up_to":null},)"
-      R"({"volume":"/shares/D/","transcoded":0,"total":1,"folders":1,"files":0,"merged_up_to":null}]})"
+      R"({"database":"/shares/A//.zophotos/zophotos.db","master":"/shares/A/","version":"2.0",)"
+      R"("stamped":null,"volumes":[)"
+      R"({"volume":"/shares/A/","transcoded":3,"total":3,"folders":3,"files":3,"merged_up_to":"1970-01-01T00:33:22Z","gone":false},)"
+      R"({"volume":"/shares/B/","transcoded":1,"total":3,"folders":2,"files":1,"merged_up_to":"1970-01-01T00:33:23Z","gone":false},)"
+      R"({"volume":"/shares/C/","transcoded":0,"total":0,"folders":1,"files":0,"merged_up_to":null,"gone":false},)"
+      R"({"volume":"/shares/D/","transcoded":0,"total":1,"folders":1,"files":0,"merged_up_to":null,"gone":false}]})"
       "\n");
 }
 
@@ -100,7 +101,7 @@ TEST_F(ZophotosStatus, ShowsAnUnpluggedVolumeAsGone) {
   EXPECT_THAT(
       Zophotos({"status", "--json"}).output,
       HasSubstr(
-          R"({"volume":"/shares/B/","transcoded":1,"total":3,"folders":0,"files":0,"merged_up_to":null},)"));
+          R"({"volume":"/shares/B/","transcoded":1,"total":3,"folders":0,"files":0,"merged_up_to":null,"gone":true},)"));
 }
 
 TEST_F(ZophotosStatus, SaysThatThereIsNoMasterYet) {
@@ -112,6 +113,12 @@ TEST_F(ZophotosStatus, SaysThatThereIsNoMasterYet) {
               AllOf(HasSubstr("\nMaster    none yet\n"), Not(HasSubstr("(master)"))));
   EXPECT_THAT(Zophotos({"--database", "/shares/.zophotos/zophotos.db"}).output,
               HasSubstr("\nMaster    /shares\n"));
+  EXPECT_THAT(Zophotos({"--json", "--database", "/shares//.zophotos/zophotos.db"}).output,
+              HasSubstr(R"("master":null,)"));
+  EXPECT_THAT(Zophotos({"--json", "--database", "/shares/.zophotos/zophotos.db"}).output,
+              HasSubstr(R"("master":"/shares",)"));
+  Copy();
+  EXPECT_THAT(OnCopy({"--json"}).output, HasSubstr(R"("master":null,)"));
 }
 
 TEST_F(ZophotosStatus, PrintsLocalTimesInText) {
@@ -255,6 +262,17 @@ TEST_F(ZophotosList, ReportsAMissingFolder) {
               "zophotos: there is no folder or file /elsewhere\n");
 }
 
+TEST_F(ZophotosList, SaysThatAVolumeIsGone) {
+  appliance.Handle(Unplugged(b.Path()));
+  const std::string error = "zophotos: the volume /shares/B/ is gone: it was unplugged, or purged "
+                            "and not merged again yet\n";
+  for (const char* const path : {"B", "/shares/B/", "B/Old/1.jpg"}) {
+    ExpectError(Zophotos({"ls", path}), 1, error);
+    ExpectError(Zophotos({"tree", path}), 1, error);
+  }
+  ExpectError(Zophotos({"ls", "BB"}), 1, "zophotos: there is no folder or file /shares/BB\n");
+}
+
 TEST_F(ZophotosList, PrintsNothingForAnEmptyFolder) {
   ExpectOutput(Zophotos({"ls", "C"}), "");
   ExpectOutput(Zophotos({"ls", "C", "--json"}), "");
@@ -364,6 +382,13 @@ TEST_F(ZophotosTree, ReportsAMissingFolder) {
   ExpectError(Zophotos({"tree", "A/Pict"}), 1, "zophotos: there is no folder /shares/A/Pict/\n");
 }
 
+TEST_F(ZophotosTree, RefusesAFile) {
+  for (const char* const file : {"A/Pictures/b.jpg", "A//Pictures/./b.jpg"}) {
+    ExpectError(Zophotos({"tree", file}), 1,
+                "zophotos: /shares/A/Pictures/b.jpg is a file, not a folder\n");
+  }
+}
+
 TEST_F(ZophotosFind, FindsTextWithoutWildcardsAnywhereInNames) {
   ExpectOutput(Zophotos({"find", "umm"}), "/shares/A/Pictures/Summer/\n");
   ExpectOutput(Zophotos({"find", ".jpg"}), "/shares/A/top.jpg\n"
@@ -443,6 +468,18 @@ TEST_F(ZophotosFind, PrintsNothingIfNothingMatches) {
   ExpectError(Zophotos({"find", "absent"}), 1, "");
   ExpectError(Zophotos({"find", "--json", "absent"}), 1, "");
   ExpectError(Zophotos({"find", "-0", "absent"}), 1, "");
+}
+
+TEST_F(ZophotosFind, NamesTheOptionForCaseOnATerminalIfItHelps) {
+  const Terminal terminal(80);
+  const Lines hint{"zophotos: nothing matches; with -i, which ignores case, something does"};
+  EXPECT_EQ(hint, terminal.Run({"find", "TOP*"}));
+  EXPECT_EQ(hint, terminal.Run({"find", "--json", "PICTURES"}));
+  EXPECT_EQ(Lines(), terminal.Run({"find", "absent"}));
+  EXPECT_EQ(Lines(), terminal.Run({"find", "-i", "absent"}));
+  EXPECT_EQ(Lines(), terminal.Run({"find", "--type", "f", "PICTURES"}));
+  EXPECT_EQ(Lines{"/shares/A/top.jpg"}, terminal.Run({"find", "top"}));
+  ExpectError(Zophotos({"find", "TOP*"}), 1, "");
 }
 
 TEST_F(ZophotosFind, PrintsOneObjectPerLineInJson) {
@@ -557,6 +594,18 @@ TEST_F(ZophotosExport, QuotesSpecialCharactersInCsv) {
                                                 rest + "\"/shares/A/2/\\." + rest +
                                                 "\"/shares/A/3/x\n\x1b[\uFFFD\\.jpg" + rest +
                                                 "\"/shares/A/4/n\uFFFD\rl" + rest);
+}
+
+TEST_F(ZophotosExport, EscapesCsvOnATerminalAndOnRequest) {
+  const Database copy = Copy();
+  copy.Run("DELETE FROM Files");
+  AddRows(copy, "'/shares/A/3\"/'", ODD_NAME_SQL);
+  const Lines lines{
+      "path,volume,modified,created",
+      R"("/shares/A/3""/x\x0a\x1b[\xff\\.jpg","/shares/A/",1970-01-01T00:00:05Z,1970-01-01T00:00:06Z)"};
+  EXPECT_EQ(lines, Terminal(200).Run(OnCopyArguments({"export"})));
+  EXPECT_EQ(lines, SplitLines(OnCopy({"--escape", "export"}).output));
+  EXPECT_EQ(OnCopy({"export"}).output, OnCopy({"--color", "always", "export"}).output);
 }
 
 TEST_F(ZophotosExport, EscapesSpecialCharactersInJson) {

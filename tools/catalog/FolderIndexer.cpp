@@ -281,7 +281,10 @@ FolderIndexer::FileChanges FolderIndexer::CompareFiles(const IndexedFolder& fold
          hooks_.isComplete(folder, file.name,
                            {.size = file.size, .statusChanged = file.statusChanged}))) {
       changes.written.push_back({.entry = &file, .row = std::move(row)});
+      ++summary_.rows;
+      return true;
     }
+    return false;
   };
   const auto addBefore = [&](const std::string_view* name) {
     for (; entry != listing.files.end() && (name == nullptr || entry->name < *name); ++entry) {
@@ -320,8 +323,10 @@ FolderIndexer::FileChanges FolderIndexer::CompareFiles(const IndexedFolder& fold
       }
       continue;
     }
-    if (known.isDeleted || folder.revived || !IsUpToDate(row, folder, *entry)) {
-      write(*entry, std::move(known));
+    const bool isDeleted = known.isDeleted;
+    const bool isChanged = isDeleted || folder.revived || !IsUpToDate(row, folder, *entry);
+    if (!(isChanged && write(*entry, std::move(known))) && !isDeleted) {
+      ++summary_.rows; // it stays as it is
     }
     ++entry;
   }

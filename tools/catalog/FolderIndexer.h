@@ -23,6 +23,7 @@ struct IndexSummary {
   long long folders = 0; ///< on the volume
   long long files = 0;   ///< on the volume
   long long photos = 0;  ///< of the files
+  long long rows = 0;    ///< of these files; those that may not be entered yet have none
 
   // Numbers of files that were changed in the catalog.
   long long added = 0;
@@ -91,8 +92,8 @@ public:
   std::optional<IndexedFolder> Find(const std::string& path) const;
 
   /// Marks rows deleted that no folder leads to. Only a damaged or crafted catalog has such rows,
-  /// so they are looked for only if there are more rows than the `folders` and `files` that a walk
-  /// of the whole volume has found. Returns the number of files that are not marked deleted. Throws
+  /// so they are looked for only if there are other numbers of rows than a walk of the whole volume
+  /// has found. Returns the number of files that are not marked deleted. Throws
   /// CatalogError for a damaged catalog.
   long long DeleteUnreachableRows(long long folders, long long files);
 

@@ -32,7 +32,7 @@ IndexSummary Indexer::Run() {
       waiting.push_back(std::move(next));
     }
   }
-  indexer.DeleteUnreachableRows(indexer.Summary().folders, indexer.Summary().files);
+  indexer.DeleteUnreachableRows(indexer.Summary().folders, indexer.Summary().rows);
   transaction.Commit();
   return indexer.Summary();
 }

@@ -16,7 +16,7 @@ namespace orva::indexer {
 Announcer::Announcer(const std::string& address, Done done)
     : address_(notify::ControlAddress(address)), done_(std::move(done)) {}
 
-void Announcer::Announce(const Announcement& announcement) {
+bool Announcer::Announce(const Announcement& announcement) {
   const auto waiting = queue_.begin() + (socket_ ? 1 : 0);
   const bool isQueued =
       std::any_of(waiting, queue_.end(), [&announcement](const Announcement& queued) {
@@ -25,6 +25,7 @@ void Announcer::Announce(const Announcement& announcement) {
   if (!isQueued) {
     queue_.push_back(announcement);
   }
+  return !isQueued;
 }
 
 void Announcer::Forget(const std::string& mountPoint) {

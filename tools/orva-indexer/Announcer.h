@@ -29,8 +29,9 @@ public:
   /// For the service of the notification socket `address`.
   Announcer(const std::string& address, Done done);
 
-  /// Queues an announcement. One that still waits is not queued again.
-  void Announce(const Announcement& announcement);
+  /// Queues an announcement. One that still waits is not queued again. Returns whether it was
+  /// queued.
+  bool Announce(const Announcement& announcement);
 
   /// Forgets what waits for a volume.
   void Forget(const std::string& mountPoint);

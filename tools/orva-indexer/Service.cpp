@@ -194,12 +194,7 @@ void Service::HandleNotifications() {
     Handle(notification);
   }
   if (locator_.HasChanged()) {
-    for (const auto& [mountPoint, known] : volumes_) {
-      const auto master = Master();
-      if (known->isScanned && master && IsPurgeOwed(*known, *master)) {
-        PurgeOrEnd(*known);
-      }
-    }
+    CheckPurges();
   }
   if (Clock::now() >= announceAgain_) {
     AnnounceAgain();
@@ -224,7 +219,7 @@ void Service::Handle(const notifications::Notification& notification) {
       Known& known = *found->second;
       if (known.echoes > 0) {
         --known.echoes;
-      } else if (!known.volume.Identity().empty()) {
+      } else if (known.volume.IsWalked()) {
         known.volume.ReadStamp();
       }
     }
@@ -290,19 +285,30 @@ std::time_t Service::LatestStamp() const {
 
 void Service::AnnounceResult(Known& known, const Volume::Result& result) {
   known.hasChanged = known.hasChanged || result.hasChanged;
-  if (known.volume.Identity().empty()) {
+  if (!known.volume.IsWalked()) {
     return; // Scanned comes first
   }
   if (result.isFirstWalk) {
     known.hasChanged = false;
     AnnounceScanned(known);
-  } else if (known.hasChanged && known.isScanned) {
+    CheckPurges(); // if this is the master, it is known only now
+  } else if (known.isScanned) {
+    AnnounceChanges(known);
+  }
+}
+
+void Service::AnnounceChanges(Known& known) {
+  const bool isIdle = known.volume.IsIdle();
+  if (known.hasChanged && !isIdle) {
     known.hasChanged = false;
-    Announce(known, known.volume.IsIdle() ? Event::End : Event::TranscodedBatch);
-  } else if (const auto master = Master(); master && known.isScanned) {
-    if (!IsPurgeOwed(known, *master)) {
-      Remember(known, *master); // stamps of the transcoder
-    }
+    known.isEndDue = true;
+    Announce(known, Event::TranscodedBatch);
+  } else if (known.hasChanged || (known.isEndDue && isIdle)) {
+    known.hasChanged = false;
+    known.isEndDue = false;
+    Announce(known, Event::End);
+  } else if (const auto master = Master(); master && !IsPurgeOwed(known, *master)) {
+    Remember(known, *master); // stamps of the transcoder
   }
 }
 
@@ -311,7 +317,8 @@ void Service::AnnounceAgain() {
   announceAgain_ = Clock::time_point::max();
   for (const auto& [mountPoint, known] : volumes_) {
     known->echoes = 0;
-    if (!known->volume.Identity().empty()) {
+    known->purgedFor.clear();
+    if (known->volume.IsWalked()) {
       AnnounceScanned(*known);
     }
   }
@@ -323,7 +330,10 @@ void Service::AnnounceScanned(Known& known) {
 }
 
 void Service::Announce(Known& known, Event event, bool handled) {
-  announcer_.Announce({.event = event, .mountPoint = known.volume.Path(), .handled = handled});
+  if (announcer_.Announce(
+          {.event = event, .mountPoint = known.volume.Path(), .handled = handled})) {
+    ++known.echoes;
+  }
 }
 
 /// One announcement is done; the next ones about the volume follow.
@@ -338,7 +348,6 @@ void Service::Announced(const Announcer::Announcement& announcement,
     return;
   }
   Known& known = *found->second;
-  ++known.echoes;
   const auto master = Master();
   switch (announcement.event) {
   case Event::Scanned:
@@ -349,17 +358,30 @@ void Service::Announced(const Announcer::Announcement& announcement,
       Announce(known, Event::End); // no daemon: it writes the locator file when it starts
     }
     break;
-  case Event::Purged:
-    if (*clients > 0 && master == known.purgedFor) {
+  case Event::Purged: {
+    const std::string purgedFor = std::exchange(known.purgedFor, {});
+    if (*clients > 0 && master == purgedFor) {
       Remember(known, *master);
       Announce(known, Event::End);
     } else if (*clients > 0) {
       PurgeOrEnd(known); // another volume has become the master
     }
     break;
+  }
   default:
     if (*clients > 0 && master && !IsPurgeOwed(known, *master)) {
       Remember(known, *master);
+    }
+  }
+}
+
+/// The master has changed, or its identity has become known.
+void Service::CheckPurges() {
+  const auto master = Master();
+  for (const auto& [mountPoint, known] : volumes_) {
+    if (master && known->isScanned && known->volume.IsWalked() && known->purgedFor != *master &&
+        IsPurgeOwed(*known, *master)) {
+      PurgeOrEnd(*known);
     }
   }
 }
@@ -381,12 +403,20 @@ bool Service::IsPurgeOwed(const Known& known, const std::string& master) const {
          remembered->newestStamp > known.volume.NewestStamp();
 }
 
+/// If that fails, the volume is announced as purged again, which is always right.
 void Service::Remember(const Known& known, const std::string& master) {
-  const RememberedCatalogs::Catalog now{.identity = known.volume.Identity(),
-                                        .newestStamp = known.volume.NewestStamp()};
-  const auto before = remembered_.Find(master, known.volume.MountPoint());
-  if (!before || before->identity != now.identity || before->newestStamp != now.newestStamp) {
-    remembered_.Store(master, known.volume.MountPoint(), now);
+  try {
+    const RememberedCatalogs::Catalog now{.identity = known.volume.Identity(),
+                                          .newestStamp = known.volume.NewestStamp()};
+    const auto before = remembered_.Find(master, known.volume.MountPoint());
+    if (!before || before->identity != now.identity || before->newestStamp != now.newestStamp) {
+      remembered_.Store(master, known.volume.MountPoint(), now);
+    }
+    isStateFailureLogged_ = false;
+  } catch (const std::string& failure) {
+    if (!std::exchange(isStateFailureLogged_, true)) {
+      LogError("Cannot write to " + settings_.stateDirectory + ": " + Printable(failure));
+    }
   }
 }
 

@@ -42,7 +42,8 @@ private:
     Volume volume;
     bool isScanned = false;  ///< it was
     bool hasChanged = false; ///< since the last announcement
-    std::string purgedFor{}; ///< master for which Purged is being announced
+    bool isEndDue = false;   ///< after a batch
+    std::string purgedFor{}; ///< master for which Purged is being announced; else empty
     int echoes = 0;          ///< announcements of ours that come back
   };
 
@@ -56,9 +57,11 @@ private:
   void AnnounceAgain();
   void WorkOnNext();
   void AnnounceResult(Known& known, const Volume::Result& result);
+  void AnnounceChanges(Known& known);
   void AnnounceScanned(Known& known);
   void Announce(Known& known, notify::Event event, bool handled = false);
   void Announced(const Announcer::Announcement& announcement, std::optional<std::size_t> clients);
+  void CheckPurges();
   void PurgeOrEnd(Known& known);
   bool IsPurgeOwed(const Known& known, const std::string& master) const;
   void Remember(const Known& known, const std::string& master);
@@ -83,6 +86,7 @@ private:
   Clock::time_point statusWritten_{};
   std::string status_; ///< what was published last
   bool isStatusDue_ = true;
+  bool isStateFailureLogged_ = false;
 };
 
 } // namespace orva::indexer

@@ -97,8 +97,6 @@ bool IsProductFolder(const FolderWatches::Event& event) {
 
 } // namespace
 
-const std::string Volume::NO_IDENTITY;
-
 Volume::Volume(std::string mountPoint, VolumeRoot::Kind kind)
     : mountPoint_(std::move(mountPoint)), path_(util::Path(mountPoint_).Basic()), kind_(kind),
       name_("Volume " + Printable(mountPoint_)) {
@@ -107,7 +105,7 @@ Volume::Volume(std::string mountPoint, VolumeRoot::Kind kind)
 
 bool Volume::IsInPlace() const {
   struct stat status = {};
-  return lstat(path_.c_str(), &status) == 0 &&
+  return !isUnmounted_ && lstat(path_.c_str(), &status) == 0 &&
          (inode_ == 0 || (status.st_dev == device_ && status.st_ino == inode_));
 }
 
@@ -125,8 +123,8 @@ void Volume::ReadEvents() {
   if (!watches_) {
     return;
   }
-  eventsRead_ = Clock::now();
   for (const FolderWatches::Event& event : watches_->Read()) {
+    eventsRead_ = Clock::now();
     Handle(event);
     if (!watches_) {
       return;
@@ -230,6 +228,7 @@ void Volume::WalkAll() {
   walkTime_ = {};
   walkedFolders_ = 0;
   walkedFiles_ = 0;
+  unreadable_ = 0;
 }
 
 Clock::time_point Volume::NextWork() const {
@@ -295,13 +294,14 @@ Volume::Result Volume::Work(const std::function<void()>& pulse, std::time_t late
       if (!root->IsInPlace()) {
         return {.isGone = true};
       }
-      Fail(Trouble::Unusable, std::string("not indexed: ") + error.what());
+      Fail(Trouble::Unusable, std::string("not indexed: ") + error.what(),
+           error.Problem() == CatalogProblem::Other);
     }
   } catch (const util::Exception& error) { // the root cannot be read
     if (!root->IsInPlace()) {
       return {.isGone = true};
     }
-    Fail(Trouble::Unusable, std::string("not indexed: ") + error.what());
+    Fail(Trouble::Unusable, std::string("not indexed: ") + error.what(), true);
   }
   return {};
 }
@@ -347,6 +347,10 @@ Volume::Result Volume::WorkOn(const VolumeRoot& root, const std::function<void()
     newestStamp_ = newestStamp;
     result.hasChanged = indexer.HasChanged();
     files_ += indexer.Summary().added + indexer.Summary().revived - indexer.Summary().deleted;
+    if (const auto& unreadable = indexer.Summary().unreadable; !unreadable.empty()) {
+      unreadable_ += static_cast<long long>(unreadable.size());
+      unreadableExample_ = unreadable.front();
+    }
     // An event may have begun another walk.
     if (isEnd && ready_.empty()) {
       FinishWalk(result, files);
@@ -414,11 +418,11 @@ void Volume::WalkNext(FolderIndexer& indexer) {
     return;
   }
   folder->revived = task.revived;
-  const long long files = indexer.Summary().files;
+  const long long rows = indexer.Summary().rows;
   std::vector<Folder> inside = indexer.Update(*folder);
   if (isWalkingAll_) {
     walkedFolders_ += static_cast<long long>(inside.size());
-    walkedFiles_ += indexer.Summary().files - files;
+    walkedFiles_ += indexer.Summary().rows - rows;
   }
   // The first one is next.
   for (Folder& next : inside | std::views::reverse) {
@@ -438,6 +442,11 @@ void Volume::FinishWalk(Result& result, long long files) {
     LogInfo(name_ + FormatString(": walked %lld folders, %lld files in %.1f s%s", walkedFolders_,
                                  files_, std::chrono::duration<double>(walkTime_).count(),
                                  watches_ ? "" : "; its changes are looked for on a timer"));
+  }
+  if (result.isFirstWalk && unreadable_ > 0) {
+    LogError(name_ +
+             FormatString(": %lld files or folders cannot be read, for example ", unreadable_) +
+             Printable(unreadableExample_));
   }
   Recover();
 }
@@ -504,9 +513,10 @@ bool Volume::IsComplete(const Folder& folder, const std::string& name,
 
 // --- Trouble -----------------------------------------------------------------------------------
 
-void Volume::Fail(Trouble trouble, const std::string& reason) {
+/// `isMedium`: perhaps the medium was pulled, and is unmounted next.
+void Volume::Fail(Trouble trouble, const std::string& reason, bool isMedium) {
   if (std::exchange(trouble_, trouble) == Trouble::None) {
-    LogError(name_ + ": " + Printable(reason));
+    (isMedium ? LogInfo : LogError)(name_ + ": " + Printable(reason));
   }
   StartAgain();
   watches_.reset();
@@ -526,7 +536,7 @@ void Volume::Recover() {
 VolumeStatus Volume::Status() const {
   const char* const state = trouble_ == Trouble::ReadOnly   ? "read-only"
                             : trouble_ == Trouble::Unusable ? "unusable"
-                            : !ready_.empty()               ? "walking"
+                            : !IsIdle()                     ? "walking"
                             : watches_                      ? "watching"
                                                             : "timed";
   return {.mountPoint = mountPoint_,

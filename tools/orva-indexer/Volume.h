@@ -47,8 +47,12 @@ public:
   /// The path of the volume, without a separator at its end.
   const std::string& Path() const noexcept { return path_; }
 
-  /// The identity of its catalog and the newest stamp in it; empty until the first walk has ended.
-  const std::string& Identity() const noexcept { return isWalked_ ? identity_ : NO_IDENTITY; }
+  /// The identity of its catalog; empty until it was opened.
+  const std::string& Identity() const noexcept { return identity_; }
+
+  /// Whether the catalog with this identity was walked wholly.
+  bool IsWalked() const noexcept { return isWalked_; }
+
   std::time_t NewestStamp() const noexcept { return newestStamp_; }
 
   /// Whether the volume at the path is still the one that was walked.
@@ -67,7 +71,7 @@ public:
   Clock::time_point NextWork() const;
 
   /// Whether no folder is being walked or waits to be walked now.
-  bool IsIdle() const noexcept { return ready_.empty(); }
+  bool IsIdle() const noexcept { return ready_.empty() && !isWalkingAll_; }
 
   /// Walks folders for at most two seconds and commits. Calls `pulse` often. `latest` is the time
   /// of the latest stamp that its catalog may have.
@@ -127,10 +131,8 @@ private:
   void GiveUpWatches(int error);
   bool IsComplete(const Folder& folder, const std::string& name,
                   const catalog::FolderIndexer::FileState& state);
-  void Fail(Trouble trouble, const std::string& reason);
+  void Fail(Trouble trouble, const std::string& reason, bool isMedium = false);
   void Recover();
-
-  static const std::string NO_IDENTITY;
 
   const std::string mountPoint_;
   const std::string path_;
@@ -162,6 +164,8 @@ private:
   Clock::duration walkTime_{}; ///< of work, without pauses
   long long walkedFolders_ = 0;
   long long walkedFiles_ = 0;
+  long long unreadable_ = 0; ///< folders and files, in this walk
+  std::string unreadableExample_;
   long long files_ = 0; ///< on the volume, as far as known
   Trouble trouble_ = Trouble::None;
   bool isRetry_ = false; ///< of a volume with trouble, which is not watched yet

@@ -31,9 +31,9 @@ std::string DecodeOctal(const std::string& text) {
 /// The mount points of the mounts that are in `volumes` and not in `others`.
 std::vector<std::string> MountPointsOnlyIn(const Volumes& volumes, const Volumes& others) {
   std::vector<std::string> mountPoints;
-  for (const auto& [mountPoint, id] : volumes) {
+  for (const auto& [mountPoint, identity] : volumes) {
     const auto other = others.find(mountPoint);
-    if (other == others.end() || other->second != id) {
+    if (other == others.end() || other->second != identity) {
       mountPoints.push_back(mountPoint);
     }
   }
@@ -54,9 +54,9 @@ Volumes ReadVolumes(std::istream& mountInfo) {
   while (std::getline(mountInfo, line)) {
     // Fields are separated by spaces only: the kernel does not escape other white space.
     std::istringstream fields(line);
-    int id = 0;
-    std::string parent, device, root, mountPoint;
-    fields >> id >> parent >> device;
+    MountIdentity identity;
+    std::string parent, root, mountPoint;
+    fields >> identity.number >> parent >> identity.device;
     fields.get();
     std::getline(fields, root, ' ');
     if (!std::getline(fields, mountPoint, ' ')) {
@@ -66,7 +66,7 @@ Volumes ReadVolumes(std::istream& mountInfo) {
     if (mountPoint == SHARES) {
       volumes.clear(); // this mount hides those below the earlier one
     } else if (IsDirectlyBelowShares(mountPoint)) {
-      volumes[mountPoint] = id; // the last of several mounts on one mount point is visible
+      volumes[mountPoint] = identity; // the last of several mounts on one mount point is visible
     }
   }
   return volumes;

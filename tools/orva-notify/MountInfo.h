@@ -7,8 +7,16 @@
 
 namespace orva::notify {
 
-/// The mounted volumes: mount points with the identifiers of their mounts.
-using Volumes = std::map<std::string, int>;
+/// A mount. The kernel gives the number of an earlier mount to the next one, which may be of
+/// another disk.
+struct MountIdentity {
+  int number = 0;
+  std::string device{}; ///< "MAJOR:MINOR"
+  bool operator==(const MountIdentity&) const = default;
+};
+
+/// The mounted volumes, by mount point.
+using Volumes = std::map<std::string, MountIdentity>;
 
 /// Whether `path`, which is canonical, is directly below /shares.
 bool IsDirectlyBelowShares(const std::string& path);

@@ -57,6 +57,7 @@ struct Search {
   bool colors = false;         ///< print folders in a colour; needs `escapes`
   bool folders = true;         ///< find folders
   bool files = true;           ///< find files
+  bool hints = false; ///< say on standard error if only the case keeps a name from matching
 };
 
 /// Finds files and folders by their names.
@@ -73,8 +74,8 @@ ExitStatus CheckDatabase(const std::string& path, Form form);
 
 enum class ExportFormat { Csv, JsonLines };
 
-/// Prints every file with its full path.
-ExitStatus ExportFiles(const std::string& path, ExportFormat format);
+/// Prints every file with its full path. `escapes`: texts in CSV are for people.
+ExitStatus ExportFiles(const std::string& path, ExportFormat format, bool escapes);
 
 /// Prints a line for each change until the output cannot be written. An exception from `findPath`
 /// is a change, too.

@@ -7,9 +7,9 @@ namespace orva::zophotos {
 namespace {
 
 /// A text as a CSV field. Always quoted, so that readers take no name for something else.
-std::string Quoted(const std::string& text) {
+std::string Quoted(const std::string& text, bool escapes) {
   std::string field = "\"";
-  for (const char byte : ToUtf8(text)) {
+  for (const char byte : escapes ? Printable(text) : ToUtf8(text)) {
     field += byte;
     if (byte == '"') {
       field += byte;
@@ -18,8 +18,8 @@ std::string Quoted(const std::string& text) {
   return field + '"';
 }
 
-void PrintCsv(const Item& item, const std::string& path) {
-  std::cout << Quoted(path) << ',' << Quoted(item.volume) << ','
+void PrintCsv(const Item& item, const std::string& path, bool escapes) {
+  std::cout << Quoted(path, escapes) << ',' << Quoted(item.volume, escapes) << ','
             << IsoTime(item.modified).value_or("") << ',' << IsoTime(item.created).value_or("")
             << '\n';
 }
@@ -33,14 +33,19 @@ void PrintJson(const Item& item, const std::string& path) {
 
 } // namespace
 
-ExitStatus ExportFiles(const std::string& path, ExportFormat format) {
+ExitStatus ExportFiles(const std::string& path, ExportFormat format, bool escapes) {
   SQLite::Database database = CopyDatabase(path);
   if (format == ExportFormat::Csv) {
     std::cout << "path,volume,modified,created\n";
   }
-  Walk(database, [format](const Item& item) {
-    if (item.file) {
-      (format == ExportFormat::Csv ? PrintCsv : PrintJson)(item, item.folder + *item.file);
+  Walk(database, [format, escapes](const Item& item) {
+    if (!item.file) {
+      return;
+    }
+    if (format == ExportFormat::Csv) {
+      PrintCsv(item, item.folder + *item.file, escapes);
+    } else {
+      PrintJson(item, item.folder + *item.file);
     }
   });
   return ExitStatus::Success;

@@ -86,21 +86,30 @@ void Print(const std::string& path, const Item& item, bool isFolder, const Searc
 ExitStatus FindItems(const std::string& path, const Search& search, Form form) {
   SQLite::Database database = CopyDatabase(path);
   const Matcher matcher(search.pattern, search.ignoreCase);
+  const Matcher ignoringCase(search.pattern, true);
   bool found = false;
+  bool foundIgnoringCase = search.ignoreCase || !search.hints;
+  const auto matches = [&](const std::string& item) {
+    const bool match = matcher.Matches(item);
+    found = found || match;
+    foundIgnoringCase = foundIgnoringCase || found || ignoringCase.Matches(item);
+    return match;
+  };
   std::optional<std::int64_t> folderId;
   Walk(database, [&](const Item& item) {
     if (folderId != item.folderId) {
       folderId = item.folderId;
-      if (search.folders && matcher.Matches(item.folder.substr(0, item.folder.size() - 1))) {
-        found = true;
+      if (search.folders && matches(item.folder.substr(0, item.folder.size() - 1))) {
         Print(item.folder, item, true, search, form);
       }
     }
-    if (search.files && item.file && matcher.Matches(item.folder + *item.file)) {
-      found = true;
+    if (search.files && item.file && matches(item.folder + *item.file)) {
       Print(item.folder + *item.file, item, false, search, form);
     }
   });
+  if (search.hints && !search.ignoreCase && !found && foundIgnoringCase) {
+    std::cerr << "zophotos: nothing matches; with -i, which ignores case, something does\n";
+  }
   return found ? ExitStatus::Success : ExitStatus::Negative;
 }
 

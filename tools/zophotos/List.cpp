@@ -122,7 +122,7 @@ std::vector<Entry> Read(SQLite::Database& database, const std::string& item) {
       return entries;
     }
   }
-  throw Failure(ExitStatus::Negative, "there is no folder or file " + spellings.front());
+  ThrowMissing(database, spellings, "there is no folder or file " + spellings.front());
 }
 
 void PrintJson(const Entry& entry) {

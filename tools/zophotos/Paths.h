@@ -24,4 +24,18 @@ std::string EndOfFolder(const std::string& path);
 std::optional<std::string> FindFolder(SQLite::Database& database,
                                       const std::vector<std::string>& spellings);
 
+/// Whether there is a file at `path`. Throws SQLite::Exception.
+bool IsFile(SQLite::Database& database, const std::string& path);
+
+/// The volume that is gone, if one of `spellings` is its path or one on it: only its statistics are
+/// left. Throws SQLite::Exception.
+std::optional<std::string> FindGoneVolume(SQLite::Database& database,
+                                          const std::vector<std::string>& spellings);
+
+/// Throws a Failure that says why there is nothing at `spellings`: `missing`, unless the volume is
+/// gone.
+[[noreturn]] void ThrowMissing(SQLite::Database& database,
+                               const std::vector<std::string>& spellings,
+                               const std::string& missing);
+
 } // namespace orva::zophotos

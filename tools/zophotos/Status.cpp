@@ -61,13 +61,23 @@ std::string LocalTimeOrDash(std::int64_t seconds, std::int64_t none) {
   return seconds == none ? "-" : LocalTime(seconds);
 }
 
+/// Whether the daemon has no master volume yet: it keeps its database there then.
+bool HasNoMaster(const std::optional<std::string>& mountPoint) {
+  return mountPoint == "/shares/";
+}
+
 /// The daemon's master volume.
 std::string Master(const std::string& path) {
   const auto mountPoint = MountPoint(path);
-  if (mountPoint == "/shares/") {
+  if (HasNoMaster(mountPoint)) {
     return "none yet";
   }
   return mountPoint ? Printable(*mountPoint) : "-";
+}
+
+Json JsonMaster(const std::string& path) {
+  const auto mountPoint = MountPoint(path);
+  return mountPoint && !HasNoMaster(mountPoint) ? Json(ToUtf8(*mountPoint)) : Json();
 }
 
 void AddRow(Table& table, const std::string& name, const VolumeStatus& volume, int barWidth) {
@@ -154,13 +164,15 @@ void PrintStatusJson(const std::string& path, const std::optional<Row>& row,
     const VolumeStatus status = volume.status.value_or(VolumeStatus());
     Json object{{"volume", ToUtf8(name)}, {"transcoded", status.transcoded},
                 {"total", status.total},  {"folders", status.folders},
-                {"files", status.files},  {"merged_up_to", JsonStamp(status.mergedUpTo)}};
+                {"files", status.files},  {"merged_up_to", JsonStamp(status.mergedUpTo)},
+                {"gone", status.isGone}};
     AddActivity(object, services, volume.activity);
     list.push_back(std::move(object));
   }
   PrintLine({{"database", ToUtf8(path)},
+             {"master", JsonMaster(path)},
              {"version", row ? Json(ToUtf8(row->version)) : Json()},
-             {"stamped", row ? JsonTime(row->stamp) : Json()},
+             {"stamped", row && row->stamp != NEVER_EMPTIED ? JsonTime(row->stamp) : Json()},
              {"volumes", std::move(list)}});
 }
 

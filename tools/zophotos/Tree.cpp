@@ -131,7 +131,12 @@ ExitStatus ShowTree(const std::string& path, const std::string& folder, std::siz
   const std::vector<std::string> spellings = Spellings(folder);
   const auto top = FindFolder(database, spellings);
   if (!top) {
-    throw Failure(ExitStatus::Negative, "there is no folder " + FolderPath(spellings.front()));
+    const auto file = std::ranges::find_if(
+        spellings, [&](const std::string& spelling) { return IsFile(database, spelling); });
+    if (file != spellings.end()) {
+      throw Failure(ExitStatus::Negative, *file + " is a file, not a folder");
+    }
+    ThrowMissing(database, spellings, "there is no folder " + FolderPath(spellings.front()));
   }
   const std::vector<StoredFolder> folders = ReadFolders(database, *top);
   std::vector<Node> nodes = MakeTree(folders, *top);

@@ -8,6 +8,8 @@
 
 #include <SQLiteCpp/Exception.h>
 
+#include <unistd.h>
+
 #include <cstdlib>
 #include <exception>
 #include <iostream>
@@ -32,8 +34,8 @@ public:
         ->check(orva::commandline::NotEmpty());
     app_.add_flag("--json", json_, "Print JSON: one object, or one object per line");
     app_.add_flag("--escape", escape_,
-                  "Escape the names that ls, find and failed print also if the output is not a "
-                  "terminal");
+                  "Escape the names that ls, find, failed and export print also if the output is "
+                  "not a terminal");
     app_.add_option("--color", color_, "Print folders in a colour; auto: on a terminal")
         ->type_name("auto|always|never")
         ->check(orva::commandline::OneOf({"auto", "always", "never"}));
@@ -157,12 +159,14 @@ private:
       Search search = search_;
       search.escapes = Escapes();
       search.colors = Colors();
+      search.hints = isatty(STDERR_FILENO) != 0;
       return FindItems(path, search, form);
     }
     if (check_->parsed()) {
       return CheckDatabase(path, form);
     }
-    return ExportFiles(path, jsonLines_ || json_ ? ExportFormat::JsonLines : ExportFormat::Csv);
+    return ExportFiles(path, jsonLines_ || json_ ? ExportFormat::JsonLines : ExportFormat::Csv,
+                       escape_ || IsTerminal());
   }
 
   void AddCommands() {

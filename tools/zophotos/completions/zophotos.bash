@@ -2,12 +2,21 @@
 
 _zophotos() {
   local current=${COMP_WORDS[COMP_CWORD]} previous=${COMP_WORDS[COMP_CWORD - 1]}
+  # bash makes three words of --color=auto.
+  if [[ $current == '=' ]]; then
+    current=''
+  elif [[ $previous == '=' ]]; then
+    previous=${COMP_WORDS[COMP_CWORD - 2]}
+  fi
   local commands='status ls tree find failed check watch export help'
   local words='--database --json --escape --color --version --help -h'
   local command='' i
   for ((i = 1; i < COMP_CWORD; i++)); do
     case ${COMP_WORDS[i]} in
-      --database | --color) ((++i)) ;;
+      --database | --color)
+        ((++i))
+        [[ ${COMP_WORDS[i]-} != '=' ]] || ((++i))
+        ;;
       -*) ;;
       *)
         command=${COMP_WORDS[i]}
@@ -39,7 +48,11 @@ _zophotos() {
     tree) words+=' --level -L' ;;
     find) words+=' --ignore-case --null --type -i -0' ;;
     export) words+=' --csv --jsonl' ;;
-    help) words=$commands ;;
+    help)
+      words=$commands
+      # It has one argument.
+      [[ $previous == help ]] || return 0
+      ;;
   esac
   if [[ -z $command && $current != -* ]]; then
     words=$commands

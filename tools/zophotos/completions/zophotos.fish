@@ -21,6 +21,11 @@ function __zophotos_command
     return 1
 end
 
+# Whether the command is help, and has no argument yet.
+function __zophotos_needs_topic
+    contains help (__zophotos_command); and test (commandline -opc)[-1] = help
+end
+
 set -l commands status ls tree find failed check watch export help
 set -l first 'not __zophotos_command >/dev/null'
 
@@ -41,7 +46,7 @@ complete -c zophotos -n $first -a check -d 'Check the database for damage'
 complete -c zophotos -n $first -a watch -d 'Print a line for each change until interrupted'
 complete -c zophotos -n $first -a export -d 'Print every file with its full path'
 complete -c zophotos -n $first -a help -d 'Print help, or the help of a command'
-complete -c zophotos -n 'contains help (__zophotos_command)' -a "$commands"
+complete -c zophotos -n __zophotos_needs_topic -a "$commands"
 
 complete -c zophotos -n 'contains status (__zophotos_command)' -s f -l follow -d 'Show the progress again after each change'
 complete -c zophotos -n 'contains ls (__zophotos_command)' -s l -l long -d 'Add times, numbers of files and volumes'
