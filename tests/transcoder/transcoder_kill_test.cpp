@@ -6,6 +6,7 @@
 #include <gmock/gmock.h>
 
 #include <chrono>
+#include <csignal>
 #include <random>
 #include <thread>
 
@@ -70,6 +71,8 @@ TEST_F(TranscoderKill, ProgramsInTheSandboxEndWithTheService) {
   Announce("scanned");
   const auto isRendering = [] { return test::Run({"pidof", "vipsthumbnail"}).status == 0; };
   ASSERT_TRUE(Await(isRendering));
+  // It cannot end by itself.
+  ASSERT_EQ(kill(std::stoi(RunChecked({"pidof", "-s", "vipsthumbnail"})), SIGSTOP), 0);
   KillTranscoder();
   EXPECT_TRUE(Await([&] { return !isRendering(); }));
 }
