@@ -73,7 +73,7 @@ std::optional<Options> ParseOptions(const std::vector<std::string>& arguments) {
       ->type_name("SECONDS")
       ->capture_default_str()
       ->transform(commandline::Decimal(1, MAXIMUM));
-  if (!commandline::Parse(app, arguments)) {
+  if (!commandline::Parse(app, arguments, false)) {
     return std::nullopt;
   }
 

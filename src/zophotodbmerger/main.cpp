@@ -5,6 +5,7 @@
 #include "StateMachine.h"
 
 #include "orvautil/Core.h"
+#include "orvautil/FormatString.h"
 #include "orvautil/LoggerMgr.h"
 #include "orvautil/Path.h"
 #include "orvautil/Singleton.h"
@@ -48,20 +49,41 @@ void OpenStandardDescriptors() {
   close(descriptor);
 }
 
-/// Prints the version or the usage. Returns the exit status.
+constexpr const char USAGE[] =
+    "usage: zophotodbmerger [--help | --version]\n\n"
+    "Without an option, runs as the daemon that merges the photo catalogs of all volumes into\n"
+    "one database. See zophotodbmerger(8).\n"
+    "  --help, -h  prints this text\n"
+    "  --version   prints the version\n";
+
+/// `text` with an escape for each control character, so that it cannot control the terminal.
+std::string EscapeControls(std::string_view text) {
+  std::string escaped;
+  for (const char character : text) {
+    const auto byte = static_cast<unsigned char>(character);
+    escaped += byte < 0x20 || byte == 0x7F ? util::FormatString("\\x%02x", byte)
+                                           : std::string(1, character);
+  }
+  return escaped;
+}
+
+/// Prints the version or the usage, or what is wrong. Returns the exit status.
 int AnswerArguments(const std::vector<std::string_view>& arguments) {
-  if (arguments == std::vector<std::string_view>{"--version"}) {
-    std::cout << "zophotodbmerger " PROGRAM_VERSION "\n";
+  const std::string_view first = arguments.front();
+  const bool isVersion = first == "--version";
+  const bool isKnown = isVersion || first == "--help" || first == "-h";
+  if (isKnown && arguments.size() == 1) {
+    std::cout << (isVersion ? "zophotodbmerger " PROGRAM_VERSION "\n" : USAGE);
     return EXIT_SUCCESS;
   }
-  const bool isAsked = arguments == std::vector<std::string_view>{"--help"};
-  (isAsked ? std::cout : std::cerr)
-      << "usage: zophotodbmerger [--help | --version]\n\n"
-         "Without an option, runs as the daemon that merges the photo catalogs of all volumes into\n"
-         "one database. See zophotodbmerger(8).\n"
-         "  --help     prints this text\n"
-         "  --version  prints the version\n";
-  return isAsked ? EXIT_SUCCESS : 2;
+  std::cerr << "zophotodbmerger: "
+            << (!isKnown && first.starts_with('-')
+                    ? "unknown option: " + EscapeControls(first)
+                    : "unexpected argument: '" + EscapeControls(isKnown ? arguments[1] : first) +
+                          "'")
+            << "\nTry 'zophotodbmerger --help'.\n\n"
+            << USAGE;
+  return 2;
 }
 
 void ListenUntilTheServiceEnds() {

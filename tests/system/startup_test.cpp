@@ -266,11 +266,13 @@ Outcome RunWith(const Lines& arguments) {
 const char* const USAGE = "usage: zophotodbmerger [--help | --version]\n";
 
 TEST_F(StartUp, HelpAndVersionArePrinted) {
-  const Outcome help = RunWith({"--help"});
-  EXPECT_EQ(Exited(0), help.status);
-  EXPECT_THAT(help.output, ::testing::StartsWith(USAGE));
-  EXPECT_THAT(help.output, ::testing::HasSubstr("See zophotodbmerger(8)."));
-  EXPECT_EQ("", help.error);
+  for (const char* const option : {"--help", "-h"}) {
+    const Outcome help = RunWith({option});
+    EXPECT_EQ(Exited(0), help.status);
+    EXPECT_THAT(help.output, ::testing::StartsWith(USAGE));
+    EXPECT_THAT(help.output, ::testing::HasSubstr("See zophotodbmerger(8)."));
+    EXPECT_EQ("", help.error);
+  }
 
   const Outcome version = RunWith({"--version"});
   EXPECT_EQ(Exited(0), version.status);
@@ -280,12 +282,21 @@ TEST_F(StartUp, HelpAndVersionArePrinted) {
 }
 
 TEST_F(StartUp, OtherArgumentsAreRefused) {
-  for (const Lines& arguments : {Lines{"-h"}, Lines{"start"}, Lines{""}, Lines{"--help", "--help"},
-                                 Lines{"--version", "x"}, Lines{"--"}}) {
+  const std::vector<std::pair<Lines, std::string>> examples = {
+      {{"-x"}, "unknown option: -x"},
+      {{"start"}, "unexpected argument: 'start'"},
+      {{""}, "unexpected argument: ''"},
+      {{"--help", "--help"}, "unexpected argument: '--help'"},
+      {{"--version", "x"}, "unexpected argument: 'x'"},
+      {{"--"}, "unknown option: --"},
+      {{"\x1b[2J\xc3\xa4\n"}, "unexpected argument: '\\x1b[2J\xc3\xa4\\x0a'"}};
+  for (const auto& [arguments, message] : examples) {
     const Outcome outcome = RunWith(arguments);
     EXPECT_EQ(Exited(2), outcome.status) << arguments[0];
     EXPECT_EQ("", outcome.output);
-    EXPECT_THAT(outcome.error, ::testing::StartsWith(USAGE));
+    EXPECT_THAT(outcome.error,
+                ::testing::StartsWith("zophotodbmerger: " + message +
+                                      "\nTry 'zophotodbmerger --help'.\n\n" + USAGE));
   }
   EXPECT_THAT(appliance.TakeLog(), IsEmpty());
 }

@@ -72,6 +72,24 @@ TEST_P(CommandLines, PrintHelp) {
   }
 }
 
+TEST_P(CommandLines, PrintHelpWithACommand) {
+  const Outcome help = Run({"help"});
+  EXPECT_EQ(0, help.status);
+  EXPECT_EQ("", help.error);
+  EXPECT_EQ(Run({"--help"}).output, help.output);
+  EXPECT_THAT(help.output, HasSubstr("\n  help "));
+
+  const std::string& command = GetParam().command.front();
+  const Outcome more = Run({"help", command});
+  EXPECT_EQ(0, more.status);
+  EXPECT_EQ("", more.error);
+  EXPECT_EQ(Run({command, "--help"}).output, more.output);
+
+  ExpectRefused({"help", GetParam().misspelled}, "unknown command: '" + GetParam().misspelled +
+                                                     "'; did you mean '" + command + "'?");
+  ExpectRefused({"help", command, "more"}, "unexpected argument: 'more'", "help");
+}
+
 TEST_P(CommandLines, PrintTheVersion) {
   const Outcome outcome = Run({"--version"});
   EXPECT_EQ(0, outcome.status);

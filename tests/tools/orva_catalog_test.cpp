@@ -946,6 +946,40 @@ TEST_F(OrvaCatalog, ProgressIsShownOnATerminalAndErased) {
             progress + volume_.native());
 }
 
+TEST_F(OrvaCatalog, TheProgramSaysThatItMayNotWrite) {
+  const std::string command = "setpriv --bounding-set=-all --inh-caps=-all " +
+                              test::ProgramPath("orva-catalog") + " index " + volume_.native() +
+                              " 2>&1";
+  const std::string error = "orva-catalog: cannot write " + core::GetCatalogPath(volume_.native()) +
+                            ": Permission denied\n";
+  const auto refused = [&] {
+    const Outcome outcome = RunShell(command);
+    return outcome.status == 1 && outcome.output == error;
+  };
+  // The volume, the catalog's folder and the catalog.
+  fs::permissions(volume_, fs::perms(0555));
+  EXPECT_TRUE(refused());
+  fs::permissions(volume_, fs::perms(0755));
+  EXPECT_EQ(RunShell(command).status, 0);
+  const fs::path catalog = core::GetCatalogPath(volume_.native());
+  fs::permissions(catalog.parent_path(), fs::perms(0555));
+  EXPECT_TRUE(refused());
+  fs::permissions(catalog.parent_path(), fs::perms(0755));
+  fs::permissions(catalog, fs::perms(0444));
+  EXPECT_TRUE(refused());
+}
+
+TEST_F(OrvaCatalog, TheProgramNamesNoSourceInAnErrorOfTheDatabase) {
+  const fs::path catalog = core::GetCatalogPath(volume_.native());
+  fs::create_directory(catalog.parent_path());
+  std::ofstream(catalog) << std::string(1000, 'x');
+  const Outcome outcome = RunProgram("index " + volume_.native());
+  EXPECT_EQ(outcome.status, 1);
+  EXPECT_EQ(outcome.output.rfind("orva-catalog: file is not a database (extended code 26) in ", 0),
+            0U)
+      << outcome.output;
+}
+
 TEST_F(OrvaCatalog, TheProgramGeneratesAndRestamps) {
   const Outcome made = RunProgram("generate " + volume_.native() +
                                   " --files 25 --per-folder 10 --names unique --tree flat");

@@ -452,6 +452,27 @@ TEST_F(OrvaNotify, SendFailsWhenNoServiceListens) {
                               ": No such file or directory");
 }
 
+TEST_F(OrvaNotify, SendSaysThatItLacksPermission) {
+  Serve();
+  const std::string socket = ORVA_NOTIFICATION_SOCKET + ".control";
+  std::filesystem::permissions(socket, std::filesystem::perms::none);
+  const Outcome outcome = test::Run({"setpriv", "--bounding-set=-all", "--inh-caps=-all",
+                                     ProgramPath("orva-notify"), "send", "plugged", "/shares/A"});
+  EXPECT_EQ(outcome.status, 1);
+  EXPECT_EQ(outcome.output, "");
+  EXPECT_EQ(outcome.error, "orva-notify: permission denied for the control socket " + socket +
+                               "; run it as root\n");
+}
+
+TEST_F(OrvaNotify, EachCommandsHelpSaysWhenItReturns) {
+  const std::string send = test::Run({ProgramPath("orva-notify"), "send", "--help"}).output;
+  EXPECT_THAT(send, testing::HasSubstr("\nReturns when the message is queued for every client"));
+  EXPECT_THAT(send, testing::Not(testing::HasSubstr("connections are closed")));
+  const std::string drop = test::Run({ProgramPath("orva-notify"), "drop", "--help"}).output;
+  EXPECT_THAT(drop, testing::HasSubstr("\nReturns when all connections are closed"));
+  EXPECT_THAT(drop, testing::Not(testing::HasSubstr("queued")));
+}
+
 TEST_F(OrvaNotify, TheExitStatusDistinguishesWrongUsageFromFailure) {
   const Answer wrong = RunNotify({"send", "exploded", "/shares/A"});
   EXPECT_EQ(wrong.status, 2);

@@ -4,6 +4,7 @@
 
 #include <algorithm>
 #include <charconv>
+#include <iostream>
 #include <system_error>
 #include <utility>
 
@@ -29,6 +30,27 @@ std::vector<std::string> OptionNames(const CLI::App& app) {
     }
   }
   return names;
+}
+
+/// Adds the command help.
+CLI::App* AddHelp(CLI::App& app) {
+  CLI::App* const help = app.add_subcommand("help", "Print help, or the help of a command");
+  help->add_option("COMMAND")->description("The command");
+  help->footer("Options of all commands: " + app.get_name() + " --help");
+  return help;
+}
+
+/// The help of `app`, or of its command `topic`. Throws UsageError.
+std::string HelpText(const CLI::App& app, const std::string& topic) {
+  if (topic.empty()) {
+    return app.get_formatter()->make_help(&app, app.get_name(), CLI::AppFormatMode::Normal);
+  }
+  const auto commands = app.get_subcommands(
+      [&topic](const CLI::App* command) { return command->get_name() == topic; });
+  if (commands.empty()) {
+    throw UsageError(UnknownCommand(app, topic), app.get_name());
+  }
+  return commands.front()->help(app.get_name());
 }
 
 /// The message for an unknown option, command or operand; otherwise that of `error`.
@@ -110,6 +132,7 @@ void SetUp(CLI::App& app) {
 }
 
 bool Parse(CLI::App& app, std::vector<std::string> arguments, bool needsCommand) {
+  const CLI::App* const help = app.get_subcommands({}).empty() ? nullptr : AddHelp(app);
   const auto fail = [&app](const std::string& message) {
     const CLI::App* const command = CommandOf(app);
     throw UsageError(message,
@@ -136,6 +159,11 @@ bool Parse(CLI::App& app, std::vector<std::string> arguments, bool needsCommand)
     fail(Explain(app, error));
   } catch (const UsageError& error) {
     fail(error.what());
+  }
+  if (help != nullptr && help->parsed()) {
+    const auto topic = help->get_option("COMMAND")->results();
+    std::cout << HelpText(app, topic.empty() ? "" : topic.front());
+    return false;
   }
   return true;
 }

@@ -20,8 +20,9 @@ CLI::Validator OneOf(std::vector<std::string> words);
 /// For Option::check: refuses an empty value.
 CLI::Validator NotEmpty();
 
-/// Gives `app` what all programs have: commands, --version, and options that may be before or after
-/// a command and whose last value counts. To be called before commands and options are added.
+/// Gives `app` what all programs with commands have: --version, and options that may be before or
+/// after a command and whose last value counts. Parse adds the command help. To be called before
+/// commands and options are added.
 void SetUp(CLI::App& app);
 
 /// Has `app` read the arguments that follow the program's name. Returns false when they ask for

@@ -12,13 +12,18 @@
 #include "orvautil/Exception.h"
 #include "orvautil/Path.h"
 
+#include <fcntl.h>
 #include <unistd.h>
 
+#include <cerrno>
 #include <chrono>
+#include <cstring>
 #include <ctime>
 #include <exception>
 #include <filesystem>
 #include <iostream>
+#include <memory>
+#include <regex>
 #include <string>
 #include <vector>
 
@@ -34,6 +39,34 @@ std::string FindVolume(const std::string& mountPoint) {
     throw util::Exception(mountPoint + " is not a directory");
   }
   return volume;
+}
+
+/// Throws if this user may not write the volume's catalog.
+void RequirePermission(const std::string& volume) {
+  const std::string catalog = core::GetCatalogPath(volume);
+  // SQLite makes further files in the catalog's folder, which is made in the volume.
+  for (std::filesystem::path path = catalog;; path = path.parent_path()) {
+    if (faccessat(AT_FDCWD, path.c_str(), W_OK, AT_EACCESS) == 0) {
+      if (std::filesystem::is_directory(path)) {
+        return;
+      }
+    } else if (errno == EACCES || errno == EROFS) {
+      throw util::Exception("cannot write " + catalog + ": " + std::strerror(errno));
+    } else if (errno != ENOENT || path == volume) {
+      return;
+    }
+  }
+}
+
+std::unique_ptr<db::VolumeDB> OpenCatalog(const std::string& volume) {
+  RequirePermission(volume);
+  return catalog::OpenCatalog(volume);
+}
+
+/// A message of the database layer without the place in its source.
+std::string WithoutPlace(const std::string& message) {
+  static const std::regex place("^[^ ]*:[0-9]+: ");
+  return std::regex_replace(message, place, "", std::regex_constants::format_first_only);
 }
 
 /// "1 folder, 2 files, 1 photo"
@@ -69,7 +102,7 @@ private:
 };
 
 void Index(const std::string& volume) {
-  const auto database = catalog::OpenCatalog(volume);
+  const auto database = OpenCatalog(volume);
   catalog::IndexSummary summary;
   {
     ProgressLine line;
@@ -87,7 +120,7 @@ void Index(const std::string& volume) {
 }
 
 void Generate(const std::string& volume, const catalog::GeneratorPlan& plan) {
-  const auto database = catalog::OpenCatalog(volume);
+  const auto database = OpenCatalog(volume);
   const long long folders = catalog::Generate(*database, plan, std::time(nullptr));
   catalog::Checkpoint(*database);
   std::cout << volume << ": generated " << Count(plan.files, "photo") << " in "
@@ -98,7 +131,7 @@ void Restamp(const std::string& volume) {
   if (!std::filesystem::exists(core::GetCatalogPath(volume))) {
     throw util::Exception(volume + " has no catalog");
   }
-  const auto database = catalog::OpenCatalog(volume);
+  const auto database = OpenCatalog(volume);
   const long long count = catalog::Restamp(*database, std::time(nullptr));
   catalog::Checkpoint(*database);
   std::cout << volume << ": stamped " << Count(count, "transcoding") << " again\n";
@@ -132,7 +165,7 @@ int main(int argc, char** argv) {
   } catch (const std::exception& error) {
     std::cerr << "orva-catalog: " << error.what() << '\n';
   } catch (const std::string& error) { // the database layer's
-    std::cerr << "orva-catalog: " << error << '\n';
+    std::cerr << "orva-catalog: " << WithoutPlace(error) << '\n';
   }
   return 1;
 }

@@ -112,6 +112,8 @@ private:
     send_->add_flag("--handled", command_.handled,
                     "Return only when every client has handled the message");
     AddRequestOptions(*send_);
+    send_->footer("Returns when the message is queued for every client, and prints the number of "
+                  "clients.\nObservers are not counted.");
   }
 
   void AddDrop() {
@@ -119,6 +121,8 @@ private:
         app_.add_subcommand("drop", "Close the connections of all clients; the service continues "
                                     "to listen");
     AddRequestOptions(*drop_);
+    drop_->footer("Returns when all connections are closed, and prints the number of clients.\n"
+                  "Observers are not counted.");
   }
 
   void AddRequestOptions(CLI::App& request) {
@@ -132,9 +136,6 @@ private:
         ->type_name("SECONDS")
         ->capture_default_str()
         ->transform(commandline::Decimal(0, MAXIMUM_NUMBER));
-    request.footer("Returns when the message is queued for every client, or, for drop, when all "
-                   "connections are\nclosed, and prints the number of clients. Observers are not "
-                   "counted.");
   }
 
   CLI::App app_{"Stands in for the appliance's notification service on machines without the "

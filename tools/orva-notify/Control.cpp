@@ -103,6 +103,10 @@ std::size_t Ask(const std::string& address, const Request& request, std::chrono:
   }
   const auto deadline = Clock::now() + wait;
   util::ClientSocket socket(util::Socket::Address(ControlAddress(address)), true);
+  if (!socket.IsOpen() && errno == EACCES) {
+    throw util::Exception("permission denied for the control socket " + ControlAddress(address) +
+                          "; run it as root");
+  }
   if (!socket.IsOpen()) {
     throw util::Exception(
         util::FormatString("no orva-notify serves %s: %s", address.c_str(), strerror(errno)));

@@ -56,10 +56,6 @@ public:
     } catch (const UsageError& error) {
       throw UsageError(error.what() + DashHint(), error.Command());
     }
-    if (help_->parsed()) {
-      std::cout << Help();
-      return false;
-    }
     return true;
   }
 
@@ -128,19 +124,6 @@ private:
     }
     return "; to search for a name that begins with a dash: zophotos find -- '" + rest.front() +
            "'";
-  }
-
-  /// The help that the command `help` prints.
-  std::string Help() const {
-    if (topic_.empty()) {
-      return app_.get_formatter()->make_help(&app_, app_.get_name(), CLI::AppFormatMode::Normal);
-    }
-    const auto commands = app_.get_subcommands(
-        [this](const CLI::App* command) { return command->get_name() == topic_; });
-    if (commands.empty()) {
-      throw UsageError(orva::commandline::UnknownCommand(app_, topic_), app_.get_name());
-    }
-    return commands.front()->help(app_.get_name());
   }
 
   ExitStatus RunOn(const std::string& path) const {
@@ -218,8 +201,6 @@ private:
     check_ = app_.add_subcommand("check", "Check the database for damage");
     watch_ = app_.add_subcommand("watch", "Print a line for each change until interrupted");
     AddExport();
-    help_ = app_.add_subcommand("help", "Print help, or the help of a command");
-    help_->add_option("COMMAND", topic_, "The command");
     for (CLI::App* const command : app_.get_subcommands({})) {
       command->footer("Options of all commands: zophotos --help");
     }
@@ -247,11 +228,9 @@ private:
   CLI::App* check_ = nullptr;
   CLI::App* watch_ = nullptr;
   CLI::App* export_ = nullptr;
-  CLI::App* help_ = nullptr;
   std::string database_;
   std::string color_ = "auto";
-  std::string path_;  ///< of ls, tree and failed
-  std::string topic_; ///< of help
+  std::string path_; ///< of ls, tree and failed
   std::size_t levels_ = std::numeric_limits<std::size_t>::max();
   Search search_;
   bool follow_ = false;
