@@ -60,7 +60,7 @@ std::string Explain(const CLI::App& app, const CLI::ParseError& error) {
     const std::string option = rest.front().substr(0, rest.front().find('='));
     return "unknown option: " + option + DidYouMean(option, OptionNames(app));
   }
-  if (!rest.empty() && CommandOf(app) == nullptr) {
+  if (!rest.empty() && CommandOf(app) == nullptr && !app.get_subcommands({}).empty()) {
     return UnknownCommand(app, rest.front());
   }
   std::string message = error.what();

@@ -62,8 +62,8 @@ int main(int count, char* arguments[]) {
     }
     return 0;
   } catch (const commandline::UsageError& error) {
-    std::cerr << "orva-indexer: " << error.what() << "\nTry 'orva-indexer --help'.\n";
-    return 2;
+    commandline::Report(error);
+    return commandline::EXIT_USAGE;
   } catch (const std::exception& error) {
     indexer::LogError(error.what());
     std::cerr << "orva-indexer: " << error.what() << '\n';

@@ -17,8 +17,6 @@ namespace {
 
 using namespace orva;
 
-constexpr int EXIT_USAGE = 2;
-
 /// Returns false when the user has asked for help or the version.
 bool ParseArguments(const std::vector<std::string>& arguments) {
   CLI::App app("Makes a rendition of each photo on all volumes: a JPEG of at most 1,024 pixels.",
@@ -45,8 +43,8 @@ int main(int count, char* arguments[]) {
     }
     return EXIT_SUCCESS;
   } catch (const commandline::UsageError& error) {
-    std::cerr << "orva-transcoder: " << error.what() << "\nTry 'orva-transcoder --help'.\n";
-    return EXIT_USAGE;
+    commandline::Report(error);
+    return commandline::EXIT_USAGE;
   } catch (const std::exception& error) {
     transcoder::Log(LOG_ERR, error.what());
     std::cerr << "orva-transcoder: " << error.what() << '\n';
