@@ -58,7 +58,7 @@ protected:
   ExpectSetAside(const std::map<std::string, std::function<void(const std::string&)>>& crafts) {
     std::map<std::string, std::unique_ptr<Volume>> volumes;
     for (const auto& [name, craft] : crafts) {
-      const auto volume =
+      Volume* const volume =
           volumes.emplace(name, std::make_unique<Volume>(name, "16m")).first->second.get();
       for (int file = 0; file < 300; ++file) {
         Write(volume->Path() + "/Pictures/" + std::to_string(file) + ".jpg");
@@ -298,7 +298,7 @@ TEST_F(HostileIndexerTest, AtMostThreeCatalogsAreKeptAside) {
   EXPECT_THAT(names,
               ElementsAre("orva.db.set-aside-1", "orva.db.set-aside-2", "orva.db.set-aside-3"));
   std::ranges::sort(identities);
-  EXPECT_EQ(std::ranges::unique(identities).begin(), identities.end());
+  EXPECT_EQ(std::ranges::adjacent_find(identities), identities.end());
 }
 
 } // namespace

@@ -478,7 +478,7 @@ protected:
     for (const std::string& name : names) {
       expected.push_back(name + "|" + volume + "/");
     }
-    const Lines differences = AwaitCatalog(volume);
+    Lines differences = AwaitCatalog(volume);
     if (!differences.empty()) {
       return differences;
     }

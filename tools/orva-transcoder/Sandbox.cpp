@@ -209,6 +209,7 @@ Ending RunInSandbox(const std::vector<std::string>& command, const SandboxFolder
   std::vector<std::string> words = SandboxOptions(folders);
   words.insert(words.end(), command.begin(), command.end());
   std::vector<char*> arguments;
+  arguments.reserve(words.size() + 1);
   for (std::string& word : words) {
     arguments.push_back(word.data());
   }

@@ -27,13 +27,13 @@ using Clock = std::chrono::steady_clock;
 constexpr std::chrono::seconds REPORT_INTERVAL(1);
 
 /// What a report shows.
-struct Report {
+struct ProgressReport {
   std::string path;   ///< of the database
   std::string reason; ///< why it cannot be read at the moment; empty if it can
   VolumeStatuses volumes;
   Activity services;
 
-  bool operator==(const Report&) const = default;
+  bool operator==(const ProgressReport&) const = default;
 };
 
 /// Reads little, since this keeps a merge from committing.
@@ -63,7 +63,8 @@ Rendering TotalRendering(const Activity& services) {
   return total;
 }
 
-Table MakeTable(const Report& report, int barWidth, std::optional<std::size_t> terminalWidth) {
+Table MakeTable(const ProgressReport& report, int barWidth,
+                std::optional<std::size_t> terminalWidth) {
   const bool hasServices = report.services.indexer || report.services.transcoder;
   std::vector<Table::Column> columns{
       {.heading = "VOLUME"}, {.heading = "TRANSCODED"}, {.heading = "PHOTOS", .right = true}};
@@ -94,7 +95,7 @@ Table MakeTable(const Report& report, int barWidth, std::optional<std::size_t> t
 }
 
 /// The report for people, in lines of at most `width` columns.
-std::string Text(const Report& report, std::optional<std::size_t> width) {
+std::string Text(const ProgressReport& report, std::optional<std::size_t> width) {
   const std::size_t limit = width.value_or(std::string::npos);
   std::ostringstream text;
   text << Shorten(LocalTime(std::time(nullptr)) + "  " +
@@ -111,7 +112,7 @@ std::string Text(const Report& report, std::optional<std::size_t> width) {
   return text.str();
 }
 
-void PrintJson(const Report& report) {
+void PrintJson(const ProgressReport& report) {
   Json volumes = Json::array();
   for (const auto& [name, volume] : Combine(report.volumes, report.services)) {
     const VolumeStatus status = volume.status.value_or(VolumeStatus());
@@ -194,9 +195,9 @@ private:
   const Form form_;
   ActivityWatch watch_;
   bool servicesChanged_ = true;
-  Report report_;
-  std::optional<Report> printed_; ///< nothing before the first one
-  Clock::time_point nextReport_;  ///< not before this time
+  ProgressReport report_;
+  std::optional<ProgressReport> printed_; ///< nothing before the first one
+  Clock::time_point nextReport_;          ///< not before this time
   Screen screen_;
 };
 
