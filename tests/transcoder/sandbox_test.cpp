@@ -33,7 +33,10 @@ protected:
     }
     WriteBytes("/tmp/in/file", "content");
     fs::create_directories("/tmp/out");
-    fs::permissions("/tmp/out", fs::perms::all);
+    // Its own permissions do not protect the input.
+    for (const char* const path : {"/tmp/out", "/tmp/in", "/tmp/in/file"}) {
+      fs::permissions(path, fs::perms::all);
+    }
     WriteBytes("/shares/secret", "secret");
   }
 
@@ -113,9 +116,11 @@ TEST_F(Sandbox, HasNoNetworkAndNoOtherProcesses) {
 TEST_F(Sandbox, IsEndedWhenItTakesTooLong) {
   const Ending sleeping = Shell("sleep 1000", {.time = std::chrono::seconds(1)});
   EXPECT_TRUE(sleeping.wasTooSlow);
-  const Ending working = Shell("while :; do :; done", {.processorTime = std::chrono::seconds(1)});
+  const Ending working = Shell("while :; do :; done", {.processorTime = std::chrono::seconds(1),
+                                                       .time = std::chrono::seconds(40)});
   EXPECT_TRUE(working.wasTooSlow);
-  // Neither is a process that stays behind waited for.
+  EXPECT_EQ(working.status, 128 + SIGXCPU);
+  // Background processes end with the program.
   const Ending left = Shell("sleep 1000 & exit 0", {.time = std::chrono::seconds(2)});
   EXPECT_NE(test::Run({"pidof", "sleep"}).status, 0) << left.status;
 }
