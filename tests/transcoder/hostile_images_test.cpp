@@ -53,7 +53,8 @@ std::string Tiff(std::uint32_t width, std::uint32_t height) {
   std::string bytes = RawFile("", 1);
   for (const auto& [offset, number] : {std::pair{18, width}, std::pair{30, height}}) {
     for (int i = 0; i < 4; ++i) {
-      bytes.at(static_cast<std::size_t>(offset + i)) = static_cast<char>(number >> (8 * i) & 0xFF);
+      bytes.at(static_cast<std::size_t>(offset) + static_cast<std::size_t>(i)) =
+          static_cast<char>(number >> (8 * i) & 0xFF);
     }
   }
   return bytes;
