@@ -48,6 +48,11 @@ void MakePhoto(const std::string& path, int width, int height, const std::string
   RunChecked({"vips", "copy", Scratch("colour.v"), path + options, "--interpretation", "srgb"});
 }
 
+void MakeSlowPhoto(const std::string& path) {
+  RunChecked(
+      {"vips", "black", path + "[interlace,compression=1]", "14000", "14000", "--bands", "3"});
+}
+
 void MakeQuarters(const std::string& path, int orientation) {
   const auto patch = [](const std::string& name, const std::string& colour) {
     RunChecked({"vips", "black", Scratch("black.v"), "60", "40", "--bands", "3"});

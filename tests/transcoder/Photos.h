@@ -14,6 +14,9 @@ std::string RunChecked(const std::vector<std::string>& arguments);
 /// are those of libvips for the format: "[interlace]".
 void MakePhoto(const std::string& path, int width, int height, const std::string& options = "");
 
+/// Makes a PNG that takes seconds to render and little time to make.
+void MakeSlowPhoto(const std::string& path);
+
 /// Makes a JPEG with a colour in each quarter, and the EXIF orientation 1 to 8.
 void MakeQuarters(const std::string& path, int orientation);
 

@@ -71,7 +71,7 @@ TEST_F(Announcements, AfterARestartTheEndIsAnnouncedAgain) {
 }
 
 TEST_F(Announcements, WhatIsDoneWithoutAServiceIsAnnouncedLater) {
-  MakePhoto(At("a.png"), 12000, 12000);
+  MakeSlowPhoto(At("a.png"));
   AddWaiting("a.png");
   Announce("scanned");
   ASSERT_TRUE(Await([] { return Status().find("\"rendering\":true") != std::string::npos; }));
@@ -101,7 +101,7 @@ TEST_F(Announcements, TheStatusFileTellsWhatIsGoingOn) {
   AddPhotos(2);
   WriteBytes(At("bad.jpg"), "bad");
   AddWaiting("bad.jpg");
-  MakePhoto(At("slow.png"), 12000, 12000);
+  MakeSlowPhoto(At("slow.png"));
   AddWaiting("slow.png");
   Announce("scanned");
   ASSERT_TRUE(Await([] { return Status().find("\"rendering\":true") != std::string::npos; }));

@@ -192,7 +192,7 @@ TEST_F(Renditions, APhotoThatDiffersFromTheCatalogWaitsForTheIndexer) {
 }
 
 TEST_F(Renditions, APhotoThatIsReplacedWhileItIsRenderedIsRenderedAgain) {
-  MakePhoto(At("a.png"), 12000, 12000);
+  MakeSlowPhoto(At("a.png"));
   AddWaiting("a.png");
   Announce("scanned");
   ASSERT_TRUE(Await([] { return Status().find("\"rendering\":true") != std::string::npos; }));
@@ -204,7 +204,7 @@ TEST_F(Renditions, APhotoThatIsReplacedWhileItIsRenderedIsRenderedAgain) {
 }
 
 TEST_F(Renditions, APhotoThatVanishesWhileItIsRenderedLeavesNoRendition) {
-  MakePhoto(At("a.png"), 12000, 12000);
+  MakeSlowPhoto(At("a.png"));
   AddWaiting("a.png");
   Announce("scanned");
   ASSERT_TRUE(Await([] { return Status().find("\"rendering\":true") != std::string::npos; }));
@@ -217,7 +217,7 @@ TEST_F(Renditions, APhotoThatVanishesWhileItIsRenderedLeavesNoRendition) {
 }
 
 TEST_F(Renditions, TheVolumeCanBeUnmountedBetweenTwoPiecesOfWork) {
-  MakePhoto(At("a.png"), 12000, 12000);
+  MakeSlowPhoto(At("a.png"));
   AddWaiting("a.png");
   Announce("scanned");
   ASSERT_TRUE(Await([] { return Status().find("\"rendering\":true") != std::string::npos; }));

@@ -19,10 +19,11 @@ namespace fs = std::filesystem;
 using TranscoderKill = TranscoderTest;
 
 TEST_F(TranscoderKill, AtAnyInstantNothingIsListedWithoutARendition) {
-  const int kills = TestScale(15, 50);
+  const int kills = TestScale(10, 50);
+  const int count = TestScale(120, 300);
   MakePhoto("/tmp/photo.jpg", 1200, 800);
   Lines names;
-  for (int i = 0; i < 300; ++i) {
+  for (int i = 0; i < count; ++i) {
     names.push_back(std::to_string(i) + ".jpg");
     fs::copy_file("/tmp/photo.jpg", At(names.back()));
   }
@@ -35,20 +36,20 @@ TEST_F(TranscoderKill, AtAnyInstantNothingIsListedWithoutARendition) {
     const std::size_t files = random() % 100;
     Await([&] {
       std::error_code ignored;
-      std::size_t count = 0;
+      std::size_t found = 0;
       for (auto entry =
                fs::recursive_directory_iterator(std::string(RUNTIME) + "/staging", ignored);
            !ignored && entry != fs::recursive_directory_iterator(); entry.increment(ignored)) {
-        ++count;
+        ++found;
       }
-      return Waiting() <= std::max(photos, 0LL) || count > files;
+      return Waiting() <= std::max(photos, 0LL) || found > files;
     });
     KillTranscoder();
     for (const std::string& id : Query("SELECT sourceId FROM Transcodings WHERE status = 1")) {
       ASSERT_GT(fs::file_size(RenditionOf(std::stoll(id))), 100U) << id;
     }
     // Some wait again, so that there is always work.
-    if (Waiting() < 100) {
+    if (Waiting() < count / 3) {
       AddAllWaiting(names);
     }
     StartTranscoder();
@@ -59,14 +60,14 @@ TEST_F(TranscoderKill, AtAnyInstantNothingIsListedWithoutARendition) {
     ASSERT_EQ(StateOf(name), "finished");
     ASSERT_EQ(HeaderOf(Rendition(name)).width, 1024);
   }
-  EXPECT_TRUE(Await([this] {
+  EXPECT_TRUE(Await([&] {
     return std::distance(fs::directory_iterator(At(".orva/renditions/0")),
-                         fs::directory_iterator()) == 300;
+                         fs::directory_iterator()) == count;
   }));
 }
 
 TEST_F(TranscoderKill, ProgramsInTheSandboxEndWithTheService) {
-  MakePhoto(At("slow.png"), 15000, 15000);
+  MakeSlowPhoto(At("slow.png"));
   AddWaiting("slow.png");
   Announce("scanned");
   const auto isRendering = [] { return test::Run({"pidof", "vipsthumbnail"}).status == 0; };

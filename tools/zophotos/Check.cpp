@@ -161,7 +161,7 @@ Json ToJson(const std::vector<Finding>& findings) {
 ExitStatus CheckDatabase(const std::string& path, Form form) {
   const Report report = Examine(path);
   const bool isSound = report.damage.empty();
-  if (form == Form::Json) {
+  if (form == Form::JsonText) {
     PrintLine({{"database", ToUtf8(path)},
                {"sound", isSound},
                {"damage", ToJson(report.damage)},

@@ -11,7 +11,7 @@ namespace orva::zophotos {
 struct Activity;
 
 /// Text for people, or JSON for programs: one object, or one object per line from a list.
-enum class Form { Text, Json };
+enum class Form { Text, JsonText };
 
 /// Returns the merged database's current path, which may change while a command runs.
 using FindPath = std::function<std::string()>;

@@ -218,7 +218,7 @@ bool Print(FailedPhotos& photos, bool escapes, Form form) {
   photos.ForEach([&](const std::string& path, const std::string& volume,
                      const std::string& reason) {
     any = true;
-    if (form == Form::Json) {
+    if (form == Form::JsonText) {
       PrintLine({{"path", ToUtf8(path)}, {"volume", ToUtf8(volume)}, {"reason", ToUtf8(reason)}});
     } else {
       std::cout << (escapes ? Printable(path) : path) << '\t' << Printable(reason) << '\n';

@@ -70,7 +70,7 @@ void Print(const std::string& path, const Item& item, bool isFolder, const Searc
            Form form) {
   if (search.nullTerminated) {
     std::cout << path << '\0';
-  } else if (form == Form::Json) {
+  } else if (form == Form::JsonText) {
     PrintLine({{"type", isFolder ? "folder" : "file"},
                {"path", ToUtf8(path)},
                {"volume", ToUtf8(item.volume)},

@@ -180,7 +180,7 @@ private:
   }
 
   void Print() {
-    if (form_ == Form::Json) {
+    if (form_ == Form::JsonText) {
       PrintJson(report_);
     } else if (following_.redraws) {
       screen_.Show(Text(report_, TerminalWidth()));

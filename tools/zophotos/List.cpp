@@ -169,11 +169,11 @@ ExitStatus List(const std::string& path, const Listing& listing, Form form) {
     // Sorting takes long for a folder that holds most of a library.
     SQLite::Database database = CopyDatabase(path);
     entries = Read(database, listing.path);
-    if (listing.isLong || form == Form::Json) {
+    if (listing.isLong || form == Form::JsonText) {
       CountFilesBelow(database, entries);
     }
   }
-  if (form == Form::Json) {
+  if (form == Form::JsonText) {
     for (const Entry& entry : entries) {
       PrintJson(entry);
     }

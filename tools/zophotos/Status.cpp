@@ -181,8 +181,8 @@ void PrintStatusJson(const std::string& path, const std::optional<Row>& row,
 ExitStatus ShowStatus(const std::string& path, const Activity& services, Form form) {
   // Counting reads every row, which takes long.
   SQLite::Database database = CopyDatabase(path);
-  (form == Form::Json ? PrintStatusJson : PrintStatusText)(path, ReadRow(database),
-                                                           ReadVolumes(database), services);
+  (form == Form::JsonText ? PrintStatusJson : PrintStatusText)(path, ReadRow(database),
+                                                               ReadVolumes(database), services);
   return ExitStatus::Success;
 }
 

@@ -141,7 +141,7 @@ ExitStatus ShowTree(const std::string& path, const std::string& folder, std::siz
   const std::vector<StoredFolder> folders = ReadFolders(database, *top);
   std::vector<Node> nodes = MakeTree(folders, *top);
   std::erase_if(nodes, [levels](const Node& node) { return node.depth > levels; });
-  if (form == Form::Json) {
+  if (form == Form::JsonText) {
     PrintTreeJson(nodes);
   } else {
     PrintTreeText(nodes, colors);

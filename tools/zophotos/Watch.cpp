@@ -241,7 +241,7 @@ private:
 
   void Print(const char* event, const std::string& text, const Json& details) const {
     const std::time_t now = std::time(nullptr);
-    if (form_ == Form::Json) {
+    if (form_ == Form::JsonText) {
       Json line{{"time", JsonTime(now)}, {"event", event}};
       line.update(details);
       PrintLine(line);

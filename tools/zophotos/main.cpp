@@ -88,7 +88,7 @@ private:
   /// What the services of this machine are doing; nothing for another machine's database.
   Activity Services() const { return database_.empty() ? ReadActivity() : Activity(); }
 
-  Form OutputForm() const { return json_ ? Form::Json : Form::Text; }
+  Form OutputForm() const { return json_ ? Form::JsonText : Form::Text; }
 
   /// Whether to escape names where each is a line of its own.
   bool Escapes() const { return escape_ || Colors() || IsTerminal(); }
