@@ -182,7 +182,9 @@ void IndexerTest::PlugDirectory(const std::string& directory) {
 
 Lines IndexerTest::Query(const std::string& volume, const std::string& sql) {
   try {
-    return Database(CatalogOf(volume)).Run(sql);
+    Database catalog(CatalogOf(volume));
+    catalog.setBusyTimeout(5000); // the indexer locks it for moments
+    return catalog.Run(sql);
   } catch (const SQLite::Exception&) {
     return {};
   }
