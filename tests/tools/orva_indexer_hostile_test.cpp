@@ -76,10 +76,10 @@ protected:
                   fs::file_type::not_found)
           << name;
       // The indexer may be about to change it, and lock it for a moment.
-      EXPECT_TRUE(Await([&] {
-        return Query(volume->Path(), "PRAGMA integrity_check") == Lines{"ok"} &&
-               Query(volume->Path(), "SELECT count(*) FROM sqlite_schema WHERE type IN "
-                                     "('trigger', 'view')") == Lines{"0"};
+      EXPECT_TRUE(Await([path = volume->Path()] {
+        return Query(path, "PRAGMA integrity_check") == Lines{"ok"} &&
+               Query(path, "SELECT count(*) FROM sqlite_schema WHERE type IN "
+                           "('trigger', 'view')") == Lines{"0"};
       })) << name;
     }
     StopIndexer();
