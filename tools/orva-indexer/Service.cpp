@@ -3,6 +3,8 @@
 #include "Log.h"
 #include "StatusFile.h"
 
+#include "orva-notify/Descriptors.h"
+#include "orva-notify/MountInfo.h"
 #include "orvautil/Exception.h"
 #include "orvautil/Path.h"
 
@@ -13,13 +15,10 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <charconv>
-#include <csignal>
 #include <ctime>
 #include <filesystem>
 #include <fstream>
 #include <set>
-#include <sstream>
 #include <system_error>
 #include <utility>
 
@@ -39,63 +38,23 @@ constexpr auto ANNOUNCE_RETRY = 30s;
 constexpr char SHARES[] = "/shares";
 constexpr char NO_VOLUME[] = "-";
 
-util::FileDescriptor Checked(int descriptor, const char* what) {
-  if (descriptor == -1) {
-    throw util::Exception(std::string("cannot open ") + what + ": " +
-                          std::generic_category().message(errno));
-  }
-  return util::FileDescriptor(descriptor);
-}
-
-util::FileDescriptor CatchStopSignals() {
-  sigset_t signals;
-  sigemptyset(&signals);
-  sigaddset(&signals, SIGINT);
-  sigaddset(&signals, SIGTERM);
-  sigprocmask(SIG_BLOCK, &signals, nullptr);
-  return Checked(signalfd(-1, &signals, SFD_NONBLOCK | SFD_CLOEXEC), "signals");
-}
-
 constexpr char MOUNT_INFO[] = "/proc/self/mountinfo";
 
 util::FileDescriptor OpenMountInfo() {
-  return Checked(open(MOUNT_INFO, O_RDONLY | O_CLOEXEC), MOUNT_INFO);
-}
-
-/// The kernel writes some bytes as a backslash and three octal digits.
-std::string DecodeOctal(const std::string& text) {
-  std::string decoded;
-  for (std::size_t i = 0; i < text.size(); ++i) {
-    int byte = 0;
-    if (text[i] == '\\' && i + 3 < text.size() &&
-        std::from_chars(&text[i + 1], &text[i + 4], byte, 8).ptr == &text[i + 4]) {
-      decoded += static_cast<char>(byte);
-      i += 3;
-    } else {
-      decoded += text[i];
-    }
-  }
-  return decoded;
+  return notify::CheckedDescriptor(open(MOUNT_INFO, O_RDONLY | O_CLOEXEC), MOUNT_INFO);
 }
 
 std::set<std::string> ReadMountPoints() {
-  std::set<std::string> mountPoints;
   std::ifstream table(MOUNT_INFO);
-  for (std::string line; std::getline(table, line);) {
-    std::istringstream fields(line);
-    std::string field;
-    for (int number = 0; number < 5 && std::getline(fields, field, ' '); ++number) {
-    }
-    mountPoints.insert(DecodeOctal(field));
-  }
-  return mountPoints;
+  return notify::ReadMountPoints(table);
 }
 
 } // namespace
 
 Service::Service(Settings settings)
-    : settings_(std::move(settings)), signals_(CatchStopSignals()), mountInfo_(OpenMountInfo()),
-      remembered_(settings_.stateDirectory), observer_(settings_.notificationSocket),
+    : settings_(std::move(settings)), signals_(notify::CatchStopSignals()),
+      mountInfo_(OpenMountInfo()), remembered_(settings_.stateDirectory),
+      observer_(settings_.notificationSocket),
       announcer_(settings_.notificationSocket,
                  [this](const Announcer::Announcement& announcement,
                         std::optional<std::size_t> clients) { Announced(announcement, clients); }) {

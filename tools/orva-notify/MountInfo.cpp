@@ -72,6 +72,18 @@ Volumes ReadVolumes(std::istream& mountInfo) {
   return volumes;
 }
 
+std::set<std::string> ReadMountPoints(std::istream& mountInfo) {
+  std::set<std::string> mountPoints;
+  for (std::string line; std::getline(mountInfo, line);) {
+    std::istringstream fields(line);
+    std::string field;
+    for (int number = 0; number < 5 && std::getline(fields, field, ' '); ++number) {
+    }
+    mountPoints.insert(DecodeOctal(field));
+  }
+  return mountPoints;
+}
+
 VolumeChanges Compare(const Volumes& before, const Volumes& now) {
   return {.unplugged = MountPointsOnlyIn(before, now), .plugged = MountPointsOnlyIn(now, before)};
 }

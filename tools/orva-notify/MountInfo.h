@@ -2,6 +2,7 @@
 
 #include <iosfwd>
 #include <map>
+#include <set>
 #include <string>
 #include <vector>
 
@@ -24,6 +25,9 @@ bool IsDirectlyBelowShares(const std::string& path);
 /// Reads a table in the format of /proc/self/mountinfo. Returns the visible mount points directly
 /// below /shares. Malformed lines are skipped.
 Volumes ReadVolumes(std::istream& mountInfo);
+
+/// All mount points of such a table.
+std::set<std::string> ReadMountPoints(std::istream& mountInfo);
 
 struct VolumeChanges {
   std::vector<std::string> unplugged;

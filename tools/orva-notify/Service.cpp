@@ -1,6 +1,7 @@
 #include "orva-notify/Service.h"
 
 #include "commandline/Count.h"
+#include "orva-notify/Descriptors.h"
 #include "orva-notify/Notification.h"
 #include "orvautil/Exception.h"
 #include "orvautil/FormatString.h"
@@ -12,7 +13,6 @@
 #include <algorithm>
 #include <array>
 #include <cerrno>
-#include <csignal>
 #include <cstring>
 #include <iostream>
 #include <utility>
@@ -37,22 +37,6 @@ std::string Printable(const std::string& text) {
 
 std::string CountOfClients(std::size_t count) {
   return commandline::Count(static_cast<long long>(count), "client");
-}
-
-util::FileDescriptor CheckedDescriptor(int descriptor, const char* what) {
-  if (descriptor == -1) {
-    throw util::Exception(FormatString("cannot open %s: %s", what, strerror(errno)));
-  }
-  return util::FileDescriptor(descriptor);
-}
-
-util::FileDescriptor CatchStopSignals() {
-  sigset_t signals;
-  sigemptyset(&signals);
-  sigaddset(&signals, SIGINT);
-  sigaddset(&signals, SIGTERM);
-  sigprocmask(SIG_BLOCK, &signals, nullptr);
-  return CheckedDescriptor(signalfd(-1, &signals, SFD_NONBLOCK | SFD_CLOEXEC), "signals");
 }
 
 template <typename Connection>
