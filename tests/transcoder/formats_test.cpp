@@ -57,9 +57,9 @@ TEST_F(Formats, EachFormatIsRenderedAsAJpegOfAtMost1024Pixels) {
     DecodeAll(Rendition(name));
   }
   // The same colours as the original.
-  const auto original = PixelOf(Rendition("a.jpg"), 1000, 700);
+  const auto original = Pixels(Rendition("a.jpg")).At(1000, 700);
   for (const char* const name : {"f.webp", "g.tiff", "j.png", "l.jpg", "m.jpg", "n.heic"}) {
-    const auto pixel = PixelOf(Rendition(name), 1000, 700);
+    const auto pixel = Pixels(Rendition(name)).At(1000, 700);
     for (std::size_t band = 0; band < 3; ++band) {
       // Printing inks show fewer colours.
       EXPECT_LE(std::abs(pixel.at(band) - original.at(band)), name[0] == 'l' ? 40 : 6)
@@ -86,8 +86,9 @@ TEST_F(Formats, EveryOrientationIsUpright) {
     EXPECT_EQ(header.width, i < 4 ? 120 : 80);
     const int right = header.width - 10;
     const int bottom = header.height - 10;
-    EXPECT_EQ(std::string({QuarterOf(rendition, 10, 10), QuarterOf(rendition, right, 10),
-                           QuarterOf(rendition, 10, bottom), QuarterOf(rendition, right, bottom)}),
+    const Pixels pixels(rendition);
+    EXPECT_EQ(std::string({pixels.QuarterAt(10, 10), pixels.QuarterAt(right, 10),
+                           pixels.QuarterAt(10, bottom), pixels.QuarterAt(right, bottom)}),
               seen.at(i));
   }
 }
@@ -108,7 +109,7 @@ TEST_F(Formats, TransparentPartsAreWhite) {
   RunChecked({"vips", "copy", "/tmp/t.v", At("transparent.png")});
   AddWaiting("transparent.png");
   RenderAll();
-  EXPECT_EQ(PixelOf(Rendition("transparent.png"), 25, 25), (std::array{255, 255, 255}));
+  EXPECT_EQ(Pixels(Rendition("transparent.png")).At(25, 25), (std::array{255, 255, 255}));
 }
 
 TEST_F(Formats, RenditionsHaveNoMetadata) {
@@ -147,9 +148,9 @@ TEST_F(Formats, RawPhotosAreRenderedFromTheirPreview) {
   RenderAll();
   // The preview's own orientation counts first, then that of the raw photo.
   EXPECT_EQ(HeaderOf(Rendition("own.nef")).width, 120);
-  EXPECT_EQ(QuarterOf(Rendition("own.nef"), 10, 10), 'Y');
+  EXPECT_EQ(Pixels(Rendition("own.nef")).QuarterAt(10, 10), 'Y');
   EXPECT_EQ(HeaderOf(Rendition("raw.DNG")).width, 80);
-  EXPECT_EQ(QuarterOf(Rendition("raw.DNG"), 10, 10), 'B');
+  EXPECT_EQ(Pixels(Rendition("raw.DNG")).QuarterAt(10, 10), 'B');
   EXPECT_EQ(StateOf("none.cr2"), "failed: no preview in this raw photo");
 }
 
