@@ -19,15 +19,15 @@ using Formats = TranscoderTest;
 TEST_F(Formats, EachFormatIsRenderedAsAJpegOfAtMost1024Pixels) {
   const Lines names = {"a.jpg", "b.jpeg", "c.png", "d.png", "e.png", "f.webp", "g.tiff", "h.tif",
                        "i.gif", "j.png",  "k.jpg", "l.jpg", "m.jpg", "n.heic", "o.heif", "p.jpe"};
-  MakePhoto(At("a.jpg"), 2000, 1500);
-  MakePhoto(At("b.jpeg"), 1500, 2000, "[interlace]");
+  MakePhoto(At("a.jpg"), 1200, 900);
+  MakePhoto(At("b.jpeg"), 900, 1200, "[interlace]");
   MakePhoto(At("c.png"), 1025, 40);
-  MakePhoto(At("d.png"), 2000, 1500, "[palette]");
-  MakePhoto(At("e.png"), 2000, 1500, "[interlace]");
-  MakePhoto(At("f.webp"), 2000, 1500);
-  MakePhoto(At("g.tiff"), 2000, 1500, "[compression=deflate,tile]");
-  MakePhoto(At("h.tif"), 2000, 3000, "[page-height=1500]"); // two pages
-  MakePhoto(At("i.gif"), 2000, 3000, "[page-height=1500]");
+  MakePhoto(At("d.png"), 1200, 900, "[palette]");
+  MakePhoto(At("e.png"), 1200, 900, "[interlace]");
+  MakePhoto(At("f.webp"), 1200, 900);
+  MakePhoto(At("g.tiff"), 1200, 900, "[compression=deflate,tile]");
+  MakePhoto(At("h.tif"), 1200, 1800, "[page-height=900]"); // two pages
+  MakePhoto(At("i.gif"), 1200, 1800, "[page-height=900]");
   // 16 bits for each channel
   RunChecked({"vips", "linear", At("a.jpg"), "/tmp/wide.v", "256", "0"});
   RunChecked({"vips", "cast", "/tmp/wide.v", "/tmp/ushort.v", "ushort"});
@@ -37,10 +37,10 @@ TEST_F(Formats, EachFormatIsRenderedAsAJpegOfAtMost1024Pixels) {
       {"vips", "icc_transform", At("a.jpg"), At("l.jpg"), "cmyk", "--input-profile", "srgb"});
   // A profile other than sRGB
   RunChecked({"vips", "icc_transform", At("a.jpg"), At("m.jpg"), "p3", "--input-profile", "srgb"});
-  MakePhoto(At("n.heic"), 2000, 1500);
-  MakePhoto(At("o.heic"), 1500, 2000);
+  MakePhoto(At("n.heic"), 1200, 900);
+  MakePhoto(At("o.heic"), 900, 1200);
   std::filesystem::rename(At("o.heic"), At("o.heif"));
-  MakePhoto(At("p.jpg"), 2000, 1500);
+  MakePhoto(At("p.jpg"), 1200, 900);
   std::filesystem::rename(At("p.jpg"), At("p.jpe"));
   AddAllWaiting(names);
   RenderAll();
