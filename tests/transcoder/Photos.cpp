@@ -2,6 +2,7 @@
 
 #include "support/Program.h"
 
+#include <algorithm>
 #include <cstdint>
 #include <filesystem>
 #include <fstream>
@@ -24,6 +25,19 @@ void Append(std::string& bytes, std::uint32_t number, int count) {
   }
 }
 
+char Sample(double value) {
+  return static_cast<char>(static_cast<unsigned char>(value));
+}
+
+/// Has libvips write an image of three bands; `pixels` are row by row.
+void MakeImage(const std::string& output, int width, int height, const std::string& pixels) {
+  const std::string bitmap = Scratch("pixels.ppm");
+  std::ofstream(bitmap, std::ios::binary) << "P6\n"
+                                          << width << ' ' << height << "\n255\n"
+                                          << pixels;
+  RunChecked({"vips", "copy", bitmap, output});
+}
+
 } // namespace
 
 std::string RunChecked(const std::vector<std::string>& arguments) {
@@ -35,17 +49,17 @@ std::string RunChecked(const std::vector<std::string>& arguments) {
 }
 
 void MakePhoto(const std::string& path, int width, int height, const std::string& options) {
-  const std::string w = std::to_string(width);
-  const std::string h = std::to_string(height);
-  RunChecked({"vips", "identity", Scratch("row.v")});
-  RunChecked({"vips", "resize", Scratch("row.v"), Scratch("wide.v"), std::to_string(width / 256.0),
-              "--vscale", h});
-  RunChecked({"vips", "bandjoin",
-              Scratch("wide.v") + ' ' + Scratch("wide.v") + ' ' + Scratch("wide.v"),
-              Scratch("three.v")});
-  RunChecked({"vips", "linear", Scratch("three.v"), Scratch("colour.v"), "0.8 0.5 0.2", "10 60 90",
-              "--uchar"});
-  RunChecked({"vips", "copy", Scratch("colour.v"), path + options, "--interpretation", "srgb"});
+  std::string row;
+  for (int x = 0; x < width; ++x) {
+    const double shade = 255.0 * x / std::max(width - 1, 1);
+    row += {Sample(0.8 * shade + 10), Sample(0.5 * shade + 60), Sample(0.2 * shade + 90)};
+  }
+  std::string pixels;
+  pixels.reserve(row.size() * static_cast<std::size_t>(height));
+  for (int y = 0; y < height; ++y) {
+    pixels += row;
+  }
+  MakeImage(path + options, width, height, pixels);
 }
 
 void MakeSlowPhoto(const std::string& path) {
@@ -54,24 +68,21 @@ void MakeSlowPhoto(const std::string& path) {
 }
 
 void MakeQuarters(const std::string& path, int orientation) {
-  const auto patch = [](const std::string& name, const std::string& colour) {
-    RunChecked({"vips", "black", Scratch("black.v"), "60", "40", "--bands", "3"});
-    RunChecked({"vips", "linear", Scratch("black.v"), Scratch(name), "1 1 1", colour, "--uchar"});
-    return Scratch(name) + ' ';
+  const auto row = [](const std::string& left, const std::string& right) {
+    std::string pixels;
+    for (int x = 0; x < 120; ++x) {
+      pixels += x < 60 ? left : right;
+    }
+    return pixels;
   };
-  const std::string patches = patch("red.v", "250 0 0") + patch("green.v", "0 250 0") +
-                              patch("blue.v", "0 0 250") + patch("yellow.v", "250 250 0");
-  RunChecked({"vips", "arrayjoin", patches, Scratch("quarters.v"), "--across", "2"});
-  RunChecked({"vips", "copy", Scratch("quarters.v"), path + "[Q=95]", "--interpretation", "srgb"});
-  RunChecked({"exiv2", "-M", "set Exif.Image.Orientation " + std::to_string(orientation), path});
-}
-
-char QuarterOf(const std::string& path, int x, int y) {
-  const auto [red, green, blue] = PixelOf(path, x, y);
-  if (blue > 128) {
-    return 'B';
+  const std::string above = row({'\xFA', 0, 0}, {0, '\xFA', 0});
+  const std::string below = row({0, 0, '\xFA'}, {'\xFA', '\xFA', 0});
+  std::string pixels;
+  for (int y = 0; y < 80; ++y) {
+    pixels += y < 40 ? above : below;
   }
-  return red > 128 ? (green > 128 ? 'Y' : 'R') : 'G';
+  MakeImage(path + "[Q=95]", 120, 80, pixels);
+  RunChecked({"exiv2", "-M", "set Exif.Image.Orientation " + std::to_string(orientation), path});
 }
 
 ImageHeader HeaderOf(const std::string& path) {
@@ -88,12 +99,41 @@ void DecodeAll(const std::string& path) {
   RunChecked({"vips", "avg", path + "[fail-on=warning]"});
 }
 
-std::array<int, 3> PixelOf(const std::string& path, int x, int y) {
-  std::istringstream values(
-      RunChecked({"vips", "getpoint", path, std::to_string(x), std::to_string(y)}));
+Pixels::Pixels(const std::string& path) {
+  const std::string bitmap = Scratch("decoded.ppm");
+  RunChecked({"vips", "copy", path, bitmap});
+  std::ifstream file(bitmap, std::ios::binary);
+  std::string word;
+  while (file >> word && word != "255") {
+    if (word.starts_with('#')) {
+      std::getline(file, word);
+    } else {
+      header_.push_back(word);
+    }
+  }
+  file.get();
+  samples_.assign(std::istreambuf_iterator<char>(file), {});
+  if (header_.size() != 3 || header_.front() != "P6") {
+    throw std::runtime_error(path + " has not three bands");
+  }
+}
+
+std::array<int, 3> Pixels::At(int x, int y) const {
+  const int offset = 3 * (y * std::stoi(header_.at(1)) + x);
   std::array<int, 3> pixel{};
-  values >> pixel[0] >> pixel[1] >> pixel[2];
+  for (int band = 0; band < 3; ++band) {
+    pixel.at(static_cast<std::size_t>(band)) =
+        static_cast<unsigned char>(samples_.at(static_cast<std::size_t>(offset + band)));
+  }
   return pixel;
+}
+
+char Pixels::QuarterAt(int x, int y) const {
+  const auto [red, green, blue] = At(x, y);
+  if (blue > 128) {
+    return 'B';
+  }
+  return red > 128 ? (green > 128 ? 'Y' : 'R') : 'G';
 }
 
 std::string ReadBytes(const std::string& path) {

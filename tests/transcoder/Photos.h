@@ -20,9 +20,6 @@ void MakeSlowPhoto(const std::string& path);
 /// Makes a JPEG with a colour in each quarter, and the EXIF orientation 1 to 8.
 void MakeQuarters(const std::string& path, int orientation);
 
-/// A colour of MakeQuarters: 'R', 'G', 'B' or 'Y'.
-char QuarterOf(const std::string& path, int x, int y);
-
 /// What libvips says of an image.
 struct ImageHeader {
   int width = 0;
@@ -36,8 +33,21 @@ ImageHeader HeaderOf(const std::string& path);
 /// Decodes all of an image. Throws std::runtime_error when that fails.
 void DecodeAll(const std::string& path);
 
-/// The colour of a pixel.
-std::array<int, 3> PixelOf(const std::string& path, int x, int y);
+/// The pixels of an image of three bands.
+class Pixels {
+public:
+  /// Throws std::runtime_error when the image cannot be read.
+  explicit Pixels(const std::string& path);
+
+  /// The colour of a pixel.
+  std::array<int, 3> At(int x, int y) const;
+  /// A colour of MakeQuarters: 'R', 'G', 'B' or 'Y'.
+  char QuarterAt(int x, int y) const;
+
+private:
+  std::vector<std::string> header_; ///< "P6", width, height
+  std::string samples_;
+};
 
 std::string ReadBytes(const std::string& path);
 void WriteBytes(const std::string& path, const std::string& bytes);

@@ -13,12 +13,12 @@
 #include "support/Programs.h"
 #include "system/Deadline.h"
 
+#include <poll.h>
 #include <sys/stat.h>
 
 #include <chrono>
 #include <ctime>
 #include <stdexcept>
-#include <thread>
 
 namespace orva::test {
 
@@ -166,13 +166,13 @@ void TranscoderTest::RenderAll() const {
   ASSERT_TRUE(Await([this] { return Waiting() == 0; })) << Status();
 }
 
-bool TranscoderTest::Await(const std::function<bool()>& condition) {
+bool TranscoderTest::Await(const std::function<bool()>& condition, int pause) {
   const auto end = std::chrono::steady_clock::now() + DEADLINE;
   while (!condition()) {
     if (std::chrono::steady_clock::now() > end) {
       return false;
     }
-    std::this_thread::yield();
+    poll(nullptr, 0, pause);
   }
   return true;
 }

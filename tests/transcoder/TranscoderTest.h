@@ -64,8 +64,9 @@ protected:
   /// Announces that the volume was scanned, and waits until no photo waits.
   void RenderAll() const;
 
-  /// Waits until the condition holds; false after the deadline.
-  static bool Await(const std::function<bool()>& condition);
+  /// Waits until the condition holds; false after the deadline. Looks again after `pause`
+  /// milliseconds, and leaves the processors to the programs meanwhile.
+  static bool Await(const std::function<bool()>& condition, int pause = 5);
   /// Waits until the service has sent this message after the ones that were read before.
   bool AwaitSent(const std::string& text);
 

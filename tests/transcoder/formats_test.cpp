@@ -19,15 +19,15 @@ using Formats = TranscoderTest;
 TEST_F(Formats, EachFormatIsRenderedAsAJpegOfAtMost1024Pixels) {
   const Lines names = {"a.jpg", "b.jpeg", "c.png", "d.png", "e.png", "f.webp", "g.tiff", "h.tif",
                        "i.gif", "j.png",  "k.jpg", "l.jpg", "m.jpg", "n.heic", "o.heif", "p.jpe"};
-  MakePhoto(At("a.jpg"), 2000, 1500);
-  MakePhoto(At("b.jpeg"), 1500, 2000, "[interlace]");
+  MakePhoto(At("a.jpg"), 1200, 900);
+  MakePhoto(At("b.jpeg"), 900, 1200, "[interlace]");
   MakePhoto(At("c.png"), 1025, 40);
-  MakePhoto(At("d.png"), 2000, 1500, "[palette]");
-  MakePhoto(At("e.png"), 2000, 1500, "[interlace]");
-  MakePhoto(At("f.webp"), 2000, 1500);
-  MakePhoto(At("g.tiff"), 2000, 1500, "[compression=deflate,tile]");
-  MakePhoto(At("h.tif"), 2000, 3000, "[page-height=1500]"); // two pages
-  MakePhoto(At("i.gif"), 2000, 3000, "[page-height=1500]");
+  MakePhoto(At("d.png"), 1200, 900, "[palette]");
+  MakePhoto(At("e.png"), 1200, 900, "[interlace]");
+  MakePhoto(At("f.webp"), 1200, 900);
+  MakePhoto(At("g.tiff"), 1200, 900, "[compression=deflate,tile]");
+  MakePhoto(At("h.tif"), 1200, 1800, "[page-height=900]"); // two pages
+  MakePhoto(At("i.gif"), 1200, 1800, "[page-height=900]");
   // 16 bits for each channel
   RunChecked({"vips", "linear", At("a.jpg"), "/tmp/wide.v", "256", "0"});
   RunChecked({"vips", "cast", "/tmp/wide.v", "/tmp/ushort.v", "ushort"});
@@ -37,10 +37,10 @@ TEST_F(Formats, EachFormatIsRenderedAsAJpegOfAtMost1024Pixels) {
       {"vips", "icc_transform", At("a.jpg"), At("l.jpg"), "cmyk", "--input-profile", "srgb"});
   // A profile other than sRGB
   RunChecked({"vips", "icc_transform", At("a.jpg"), At("m.jpg"), "p3", "--input-profile", "srgb"});
-  MakePhoto(At("n.heic"), 2000, 1500);
-  MakePhoto(At("o.heic"), 1500, 2000);
+  MakePhoto(At("n.heic"), 1200, 900);
+  MakePhoto(At("o.heic"), 900, 1200);
   std::filesystem::rename(At("o.heic"), At("o.heif"));
-  MakePhoto(At("p.jpg"), 2000, 1500);
+  MakePhoto(At("p.jpg"), 1200, 900);
   std::filesystem::rename(At("p.jpg"), At("p.jpe"));
   AddAllWaiting(names);
   RenderAll();
@@ -57,9 +57,9 @@ TEST_F(Formats, EachFormatIsRenderedAsAJpegOfAtMost1024Pixels) {
     DecodeAll(Rendition(name));
   }
   // The same colours as the original.
-  const auto original = PixelOf(Rendition("a.jpg"), 1000, 700);
+  const auto original = Pixels(Rendition("a.jpg")).At(1000, 700);
   for (const char* const name : {"f.webp", "g.tiff", "j.png", "l.jpg", "m.jpg", "n.heic"}) {
-    const auto pixel = PixelOf(Rendition(name), 1000, 700);
+    const auto pixel = Pixels(Rendition(name)).At(1000, 700);
     for (std::size_t band = 0; band < 3; ++band) {
       // Printing inks show fewer colours.
       EXPECT_LE(std::abs(pixel.at(band) - original.at(band)), name[0] == 'l' ? 40 : 6)
@@ -86,8 +86,9 @@ TEST_F(Formats, EveryOrientationIsUpright) {
     EXPECT_EQ(header.width, i < 4 ? 120 : 80);
     const int right = header.width - 10;
     const int bottom = header.height - 10;
-    EXPECT_EQ(std::string({QuarterOf(rendition, 10, 10), QuarterOf(rendition, right, 10),
-                           QuarterOf(rendition, 10, bottom), QuarterOf(rendition, right, bottom)}),
+    const Pixels pixels(rendition);
+    EXPECT_EQ(std::string({pixels.QuarterAt(10, 10), pixels.QuarterAt(right, 10),
+                           pixels.QuarterAt(10, bottom), pixels.QuarterAt(right, bottom)}),
               seen.at(i));
   }
 }
@@ -108,7 +109,7 @@ TEST_F(Formats, TransparentPartsAreWhite) {
   RunChecked({"vips", "copy", "/tmp/t.v", At("transparent.png")});
   AddWaiting("transparent.png");
   RenderAll();
-  EXPECT_EQ(PixelOf(Rendition("transparent.png"), 25, 25), (std::array{255, 255, 255}));
+  EXPECT_EQ(Pixels(Rendition("transparent.png")).At(25, 25), (std::array{255, 255, 255}));
 }
 
 TEST_F(Formats, RenditionsHaveNoMetadata) {
@@ -147,9 +148,9 @@ TEST_F(Formats, RawPhotosAreRenderedFromTheirPreview) {
   RenderAll();
   // The preview's own orientation counts first, then that of the raw photo.
   EXPECT_EQ(HeaderOf(Rendition("own.nef")).width, 120);
-  EXPECT_EQ(QuarterOf(Rendition("own.nef"), 10, 10), 'Y');
+  EXPECT_EQ(Pixels(Rendition("own.nef")).QuarterAt(10, 10), 'Y');
   EXPECT_EQ(HeaderOf(Rendition("raw.DNG")).width, 80);
-  EXPECT_EQ(QuarterOf(Rendition("raw.DNG"), 10, 10), 'B');
+  EXPECT_EQ(Pixels(Rendition("raw.DNG")).QuarterAt(10, 10), 'B');
   EXPECT_EQ(StateOf("none.cr2"), "failed: no preview in this raw photo");
 }
 

@@ -9,10 +9,15 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
+#include <csignal>
+#include <sstream>
+#include <thread>
 
 namespace {
 
+namespace test = orva::test;
 using namespace orva::test;
 using testing::Contains;
 using testing::HasSubstr;
@@ -214,6 +219,39 @@ TEST_F(Renditions, APhotoThatVanishesWhileItIsRenderedLeavesNoRendition) {
   ASSERT_TRUE(Await([] { return Status().find("\"rendering\":true") == std::string::npos; }));
   EXPECT_TRUE(Await([this] { return Number("SELECT count(*) FROM Removals") == 0; }));
   EXPECT_FALSE(fs::exists(RenditionOf(1)));
+}
+
+TEST_F(Renditions, AShortQueueIsSharedOutAmongTheProcessors) {
+  MakePhoto("/tmp/photo.jpg", 2000, 1500);
+  Lines names;
+  for (int i = 0; i < 40; ++i) {
+    names.push_back(std::to_string(i) + ".jpg");
+  }
+  CopyAll(names);
+  AddAllWaiting(names);
+  Announce("scanned");
+  // The programs stop, so the first batch does not end.
+  std::string programs;
+  ASSERT_TRUE(Await([&programs] {
+    programs = test::Run({"pidof", "vipsthumbnail"}).output;
+    return !programs.empty();
+  }));
+  const auto signal = [&programs](int number) {
+    std::istringstream ids(programs);
+    for (pid_t id = 0; ids >> id;) {
+      EXPECT_EQ(kill(id, number), 0);
+    }
+  };
+  signal(SIGSTOP);
+  const unsigned processors = std::max(std::thread::hardware_concurrency(), 1U);
+  const std::string first = std::string(RUNTIME) + "/staging/1/in";
+  EXPECT_EQ(std::distance(fs::directory_iterator(first), fs::directory_iterator()),
+            std::max(40 / processors, 10U));
+  signal(SIGCONT);
+  RenderAll();
+  for (const std::string& name : names) {
+    EXPECT_EQ(StateOf(name), "finished");
+  }
 }
 
 TEST_F(Renditions, TheVolumeCanBeUnmountedBetweenTwoPiecesOfWork) {

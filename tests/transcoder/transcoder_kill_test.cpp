@@ -34,7 +34,7 @@ TEST_F(TranscoderKill, AtAnyInstantNothingIsListedWithoutARendition) {
     // At a random point of the work: after so many photos, and so many files in memory.
     const long long photos = Waiting() - static_cast<long long>(random() % 60);
     const std::size_t files = random() % 100;
-    Await([&] {
+    const auto isReached = [&] {
       std::error_code ignored;
       std::size_t found = 0;
       for (auto entry =
@@ -43,7 +43,8 @@ TEST_F(TranscoderKill, AtAnyInstantNothingIsListedWithoutARendition) {
         ++found;
       }
       return Waiting() <= std::max(photos, 0LL) || found > files;
-    });
+    };
+    Await(isReached, 0);
     KillTranscoder();
     for (const std::string& id : Query("SELECT sourceId FROM Transcodings WHERE status = 1")) {
       ASSERT_GT(fs::file_size(RenditionOf(std::stoll(id))), 100U) << id;

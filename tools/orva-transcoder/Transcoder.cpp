@@ -26,7 +26,12 @@ namespace {
 
 using notifications::Notification;
 
-constexpr long long MOST_STAGED = LARGEST_PHOTO + (64LL << 20); ///< bytes
+constexpr long long MOST_STAGED = LARGEST_PHOTO + (64LL << 20); // bytes of all batches
+constexpr long long MOST_BYTES = 128LL << 20;                   // of several photos in a batch
+// Photos in a batch. The programs of each batch take about as long to start as two photos to
+// render.
+constexpr std::size_t MOST_PHOTOS = 50;
+constexpr std::size_t FEWEST_PHOTOS = 10;
 constexpr std::size_t ANNOUNCED_CHANGES = 500;
 constexpr std::chrono::seconds ANNOUNCE_INTERVAL(2);
 constexpr std::chrono::seconds STORE_AGAIN(1);
@@ -189,7 +194,7 @@ bool Transcoder::Stage(Known& known) {
   if (!volume.HasWork()) {
     return false;
   }
-  auto batch = volume.Stage(staging_ + '/' + std::to_string(++batches_), FreeSpace(),
+  auto batch = volume.Stage(staging_ + '/' + std::to_string(++batches_), LimitsOfNext(volume),
                             InBatchOf(volume.MountPoint()));
   if (!batch) {
     hasMoreWork_ = hasMoreWork_ || (volume.HasWork() && running_.empty());
@@ -246,6 +251,21 @@ long long Transcoder::FreeSpace() const {
     }
   }
   return std::max(space, 0LL);
+}
+
+/// A batch takes one processor's share of the photos that wait, and of the memory: so all
+/// processors work until the last photo.
+BatchLimits Transcoder::LimitsOfNext(const Volume& volume) const {
+  std::size_t staged = 0;
+  for (const auto& running : running_) {
+    staged += running->batch->mountPoint == volume.MountPoint() ? running->batch->photos.size() : 0;
+  }
+  const std::size_t waiting = volume.Waiting() - std::min(staged, volume.Waiting());
+  const auto batches = static_cast<long long>(processors_ + 1);
+  const long long space = FreeSpace();
+  return {.photos = std::clamp(waiting / processors_, FEWEST_PHOTOS, MOST_PHOTOS),
+          .bytes = std::min({space, MOST_BYTES, MOST_STAGED / batches}),
+          .space = space};
 }
 
 /// When there is nothing to stage.

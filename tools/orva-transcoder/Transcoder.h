@@ -76,6 +76,7 @@ private:
   bool IsRendering(const std::string& mountPoint) const;
   Volume::IsInBatch InBatchOf(const std::string& mountPoint) const;
   long long FreeSpace() const;
+  BatchLimits LimitsOfNext(const Volume& volume) const;
 
   const std::string staging_;
   const std::size_t processors_;

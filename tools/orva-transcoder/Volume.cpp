@@ -38,8 +38,7 @@ using catalog::RENDITIONS_PER_FOLDER;
 using catalog::VolumeRoot;
 using catalog::WaitingPhoto;
 
-constexpr std::size_t MOST_PHOTOS = 50;       // in a batch
-constexpr long long MOST_BYTES = 64LL << 20;  // of several photos in a batch
+constexpr std::size_t MOST_LISTED = 50;       // waiting photos in one query
 constexpr std::size_t MOST_EXAMINED = 1000;   // photos in one piece of work
 constexpr std::size_t MOST_REMOVALS = 10'000; // in one piece of work
 constexpr std::chrono::seconds RETRY(60);
@@ -234,7 +233,7 @@ void Volume::RemoveVanished(const Opened& volume) {
   } while (count == MOST_REMOVALS);
 }
 
-std::unique_ptr<Batch> Volume::Stage(const std::string& path, long long space,
+std::unique_ptr<Batch> Volume::Stage(const std::string& path, const BatchLimits& limits,
                                      const IsInBatch& isInBatch) {
   std::unique_ptr<Batch> batch;
   Attempt([&] {
@@ -251,11 +250,11 @@ std::unique_ptr<Batch> Volume::Stage(const std::string& path, long long space,
     }
     Batch next{
         .mountPoint = mountPoint_, .identity = volume->identity, .folder = StagingFolder(path)};
-    Room room{.space = space};
+    Room room{.limits = limits};
     std::size_t examined = 0;
     for (bool isFull = false; !isFull && examined < MOST_EXAMINED;) {
-      const auto photos = last_ ? catalog::NewestWaiting(*volume->catalog, MOST_PHOTOS, *last_)
-                                : catalog::NewestWaiting(*volume->catalog, MOST_PHOTOS);
+      const auto photos = last_ ? catalog::NewestWaiting(*volume->catalog, MOST_LISTED, *last_)
+                                : catalog::NewestWaiting(*volume->catalog, MOST_LISTED);
       for (const WaitingPhoto& photo : photos) {
         isFull = !isInBatch(photo.id) && !StagePhoto(*volume, photo, next, room);
         if (isFull) {
@@ -264,7 +263,7 @@ std::unique_ptr<Batch> Volume::Stage(const std::string& path, long long space,
         ++examined;
         last_ = photo;
       }
-      if (!isFull && photos.size() < MOST_PHOTOS) {
+      if (!isFull && photos.size() < MOST_LISTED) {
         isExhausted_ = true;
         break;
       }
@@ -278,7 +277,7 @@ std::unique_ptr<Batch> Volume::Stage(const std::string& path, long long space,
 
 bool Volume::StagePhoto(const Opened& volume, const WaitingPhoto& photo, Batch& batch, Room& room) {
   const std::size_t number = batch.photos.size();
-  if (number == MOST_PHOTOS) {
+  if (number >= room.limits.photos) {
     return false;
   }
   // To open a device may have an effect: look before.
@@ -296,7 +295,7 @@ bool Volume::StagePhoto(const Opened& volume, const WaitingPhoto& photo, Batch& 
         {.photo = photo, .status = status, .failure = "the file is larger than 512 MiB"});
     return true;
   }
-  const long long limit = room.used == 0 ? room.space : std::min(room.space, MOST_BYTES);
+  const long long limit = room.used == 0 ? room.limits.space : room.limits.bytes;
   if (room.used + status.st_size > limit) {
     return false;
   }

@@ -19,6 +19,13 @@ class VolumeDB;
 
 namespace orva::transcoder {
 
+/// How much one batch may take.
+struct BatchLimits {
+  std::size_t photos = 0;
+  long long bytes = 0; ///< for the copies of several photos
+  long long space = 0; ///< bytes for the copy of a single photo
+};
+
 /// A volume whose photos are rendered. Each operation is one piece of work: it opens the volume and
 /// its catalog and closes both before it returns. Nothing is thrown; what fails is logged once and
 /// tried again later. Used by one thread.
@@ -43,7 +50,7 @@ public:
 
   /// Copies the next photos that wait to a new folder at `path`. Returns nothing if there are none
   /// now, or if there is no space for the copies.
-  std::unique_ptr<Batch> Stage(const std::string& path, long long space,
+  std::unique_ptr<Batch> Stage(const std::string& path, const BatchLimits& limits,
                                const IsInBatch& isInBatch);
 
   /// Result of Store.
@@ -75,10 +82,10 @@ private:
     std::unique_ptr<db::VolumeDB> catalog;
     std::string identity{};
   };
-  /// Bytes for the copies of a batch.
+  /// What is left for a batch.
   struct Room {
-    long long space = 0; ///< all that there are
-    long long used = 0;
+    BatchLimits limits;
+    long long used = 0; ///< bytes of the copies
   };
 
   /// Returns nothing if the catalog is missing or not one of ours.
