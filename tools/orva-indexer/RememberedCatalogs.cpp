@@ -1,9 +1,8 @@
 #include "RememberedCatalogs.h"
 
-#include "Log.h"
-
 #include "Sql.h"
 #include "UntrustedCatalog.h"
+#include "service/Log.h"
 
 #include <filesystem>
 #include <system_error>
@@ -24,7 +23,8 @@ RememberedCatalogs::RememberedCatalogs(const std::string& directory) {
       throw;
     }
     // Every catalog will be announced as purged, which is always right.
-    LogError("The catalogs that were announced are not known any more: " + Printable(failure));
+    service::LogError("The catalogs that were announced are not known any more: " +
+                      service::Printable(failure));
     database_.Close();
     for (const char* const suffix : {"", "-journal", "-wal", "-shm"}) {
       std::filesystem::remove(path + suffix, ignored);

@@ -7,6 +7,7 @@
 
 #include "notifications/Observer.h"
 #include "orvautil/FileDescriptor.h"
+#include "service/StatusFile.h"
 
 #include <chrono>
 #include <map>
@@ -83,9 +84,8 @@ private:
   bool isStopped_ = false;
   Clock::time_point inputRead_{};
   Clock::time_point announceAgain_ = Clock::time_point::max();
-  Clock::time_point statusWritten_{};
-  std::string status_; ///< what was published last
-  bool isStatusDue_ = true;
+  service::StatusFile status_;
+  Clock::time_point statusDue_ = Clock::time_point::max(); ///< when it is too early to write it
   bool isStateFailureLogged_ = false;
 };
 

@@ -1,7 +1,5 @@
 #include "Volume.h"
 
-#include "Log.h"
-
 #include "CatalogSchema.h"
 #include "Sql.h"
 
@@ -12,6 +10,7 @@
 #include "orvautil/Exception.h"
 #include "orvautil/FormatString.h"
 #include "orvautil/Path.h"
+#include "service/Log.h"
 
 #include <sys/inotify.h>
 #include <sys/stat.h>
@@ -31,6 +30,9 @@ using namespace std::chrono_literals;
 using catalog::CatalogProblem;
 using catalog::FolderIndexer;
 using catalog::VolumeRoot;
+using service::LogError;
+using service::LogInfo;
+using service::Printable;
 using util::FormatString;
 
 /// A folder is walked when it was quiet for QUIET, or LATEST after its first event.

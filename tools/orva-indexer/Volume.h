@@ -1,7 +1,6 @@
 #pragma once
 
 #include "FolderWatches.h"
-#include "StatusFile.h"
 
 #include "FolderIndexer.h"
 #include "UntrustedCatalog.h"
@@ -10,6 +9,7 @@
 #include <sys/types.h>
 
 #include <chrono>
+#include <cstddef>
 #include <ctime>
 #include <functional>
 #include <map>
@@ -23,6 +23,14 @@
 namespace orva::indexer {
 
 using Clock = std::chrono::steady_clock;
+
+/// What the indexer does with a volume.
+struct VolumeStatus {
+  std::string mountPoint; ///< ends in "/"
+  const char* state = ""; ///< "walking", "watching", "timed", "read-only" or "unusable"
+  std::size_t foldersWaiting = 0;
+  long long files = 0;
+};
 
 /// One volume: the folders that wait to be walked, the watches that add to them, and the work on
 /// its catalog. Nothing of the volume is open between two calls. On the program's thread.

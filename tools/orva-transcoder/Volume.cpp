@@ -1,6 +1,5 @@
 #include "Volume.h"
 
-#include "Log.h"
 #include "Renderer.h"
 #include "RenditionFiles.h"
 
@@ -14,12 +13,12 @@
 #include "orvautil/Core.h"
 #include "orvautil/Exception.h"
 #include "orvautil/FileDescriptor.h"
+#include "service/Log.h"
 
 #include <fcntl.h>
 #include <sys/sendfile.h>
 #include <sys/stat.h>
 #include <sys/statvfs.h>
-#include <syslog.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -37,6 +36,8 @@ namespace {
 using catalog::RENDITIONS_PER_FOLDER;
 using catalog::VolumeRoot;
 using catalog::WaitingPhoto;
+using service::LogError;
+using service::Printable;
 
 constexpr std::size_t MOST_PHOTOS = 50;       // in a batch
 constexpr long long MOST_BYTES = 64LL << 20;  // of several photos in a batch
@@ -182,7 +183,7 @@ void Volume::Report(const std::string& problem) {
   lookAgainAt_ = Clock::now() + (isBusy_ ? std::chrono::seconds(1) : RETRY);
   if (!isBusy_ && problem != problem_) {
     problem_ = problem;
-    Log(LOG_ERR, Printable(problem));
+    LogError(Printable(problem));
   }
 }
 
@@ -316,7 +317,7 @@ bool Volume::StagePhoto(const Opened& volume, const WaitingPhoto& photo, Batch& 
   case ENOSPC: {
     const bool isAlone = room.used == 0;
     if (isAlone) {
-      Log(LOG_ERR, "no space in memory to copy " + Printable(mountPoint_ + photo.path));
+      LogError("no space in memory to copy " + Printable(mountPoint_ + photo.path));
     }
     return isAlone;
   }
@@ -460,7 +461,7 @@ void Volume::RemoveOtherFolders(const Opened& volume, const IsInBatch& isInBatch
 void Volume::ReportObstacle(const std::string& text) {
   if (!hasReportedObstacle_) {
     hasReportedObstacle_ = true;
-    Log(LOG_ERR, Printable(mountPoint_ + text));
+    LogError(Printable(mountPoint_ + text));
   }
 }
 
