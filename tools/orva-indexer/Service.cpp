@@ -28,13 +28,13 @@ namespace {
 using namespace std::chrono_literals;
 using catalog::VolumeRoot;
 using notify::Event;
-using service::LogError;
 using service::LogInfo;
 using service::Printable;
 using Notice = notifications::Notification::Event;
 
 constexpr auto INPUT_INTERVAL = 100ms;
 constexpr auto ANNOUNCE_RETRY = 30s;
+constexpr auto MASTER_QUIET = 2s;
 
 /// A master at /shares itself is no volume.
 constexpr char SHARES[] = "/shares";
@@ -92,7 +92,7 @@ void Service::Wait() {
   add(observer_.Descriptor(), POLLIN);
   add(announcer_.Descriptor(), announcer_.Events());
   add(locator_.Descriptor(), POLLIN);
-  auto next = std::min(announceAgain_, statusDue_);
+  auto next = std::min({announceAgain_, checkPurges_, statusDue_});
   for (const auto& [mountPoint, known] : volumes_) {
     next = std::min(next, known->volume.NextWork());
     add(known->volume.Descriptor(now), POLLIN);
@@ -153,6 +153,9 @@ void Service::HandleNotifications() {
     Handle(notification);
   }
   if (locator_.HasChanged()) {
+    CheckPurgesSoon();
+  }
+  if (Clock::now() >= checkPurges_) {
     CheckPurges();
   }
   if (Clock::now() >= announceAgain_) {
@@ -247,7 +250,7 @@ void Service::AnnounceResult(Known& known, const Volume::Result& result) {
   if (result.isFirstWalk) {
     known.hasChanged = false;
     AnnounceScanned(known);
-    CheckPurges(); // if this is the master, it is known only now
+    CheckPurgesSoon(); // if this is the master, it is known only now
   } else if (known.isScanned) {
     AnnounceChanges(known);
   }
@@ -331,8 +334,14 @@ void Service::Announced(const Announcer::Announcement& announcement,
   }
 }
 
-/// The master has changed, or its identity has become known.
+/// The master has changed, or its identity has become known. A daemon that starts has several
+/// masters one after the other, until it knows all volumes.
+void Service::CheckPurgesSoon() {
+  checkPurges_ = Clock::now() + MASTER_QUIET;
+}
+
 void Service::CheckPurges() {
+  checkPurges_ = Clock::time_point::max();
   const auto master = Master();
   for (const auto& [mountPoint, known] : volumes_) {
     if (master && known->isScanned && known->volume.IsWalked() && known->purgedFor != *master &&
@@ -359,21 +368,10 @@ bool Service::IsPurgeOwed(const Known& known, const std::string& master) const {
          remembered->newestStamp > known.volume.NewestStamp();
 }
 
-/// If that fails, the volume is announced as purged again, which is always right.
 void Service::Remember(const Known& known, const std::string& master) {
-  try {
-    const RememberedCatalogs::Catalog now{.identity = known.volume.Identity(),
-                                          .newestStamp = known.volume.NewestStamp()};
-    const auto before = remembered_.Find(master, known.volume.MountPoint());
-    if (!before || before->identity != now.identity || before->newestStamp != now.newestStamp) {
-      remembered_.Store(master, known.volume.MountPoint(), now);
-    }
-    isStateFailureLogged_ = false;
-  } catch (const std::string& failure) {
-    if (!std::exchange(isStateFailureLogged_, true)) {
-      LogError("Cannot write to " + settings_.stateDirectory + ": " + Printable(failure));
-    }
-  }
+  remembered_.Store(
+      master, known.volume.MountPoint(),
+      {.identity = known.volume.Identity(), .newestStamp = known.volume.NewestStamp()});
 }
 
 /// The identity of the catalog on the master volume; nothing while that is not known.

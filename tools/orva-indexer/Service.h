@@ -62,6 +62,7 @@ private:
   void AnnounceScanned(Known& known);
   void Announce(Known& known, notify::Event event, bool handled = false);
   void Announced(const Announcer::Announcement& announcement, std::optional<std::size_t> clients);
+  void CheckPurgesSoon();
   void CheckPurges();
   void PurgeOrEnd(Known& known);
   bool IsPurgeOwed(const Known& known, const std::string& master) const;
@@ -84,9 +85,9 @@ private:
   bool isStopped_ = false;
   Clock::time_point inputRead_{};
   Clock::time_point announceAgain_ = Clock::time_point::max();
+  Clock::time_point checkPurges_ = Clock::time_point::max();
   service::StatusFile status_;
   Clock::time_point statusDue_ = Clock::time_point::max(); ///< when it is too early to write it
-  bool isStateFailureLogged_ = false;
 };
 
 } // namespace orva::indexer
