@@ -267,6 +267,22 @@ TEST_F(IndexerTest, AtTheWatchLimitTheVolumeIsWalkedOnATimer) {
   EXPECT_EQ(LogLines("fs.inotify.max_user_watches").size(), 1U);
 }
 
+TEST_F(IndexerTest, WhereThereAreNoEventsTheVolumeIsWalkedOnATimer) {
+  const Volume volume("A", "64m");
+  Write(volume.Path() + "/Pictures/a.jpg");
+  StartService();
+  StartIndexerIn({"PROBE_FILE_SYSTEM=0x65735546", "PROBE_CLOCK_SPEED=100"}); // FUSE
+  EXPECT_TRUE(AwaitLog("its changes are looked for on a timer"));
+  EXPECT_TRUE(Await([&] { return State(volume.Path()) == "timed"; }));
+  Write(volume.Path() + "/Pictures/New/b.jpg");
+  fs::remove(volume.Path() + "/Pictures/a.jpg");
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  Write(volume.Path() + "/Pictures/New/c.jpg");
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  EXPECT_TRUE(Await([&] { return State(volume.Path()) == "timed"; }));
+  EXPECT_THAT(ErrorLines(), IsEmpty());
+}
+
 TEST_F(IndexerTest, AMountBelowTheVolumeIsFollowed) {
   const Volume volume("A", "64m");
   Write(volume.Path() + "/Inside/a.jpg");
@@ -392,6 +408,53 @@ TEST_F(IndexerTest, AKilledIndexerConvergesAfterItsStart) {
   EXPECT_THAT(ErrorLines(), IsEmpty());
 }
 
+// --- The clock ---------------------------------------------------------------------------------
+
+TEST_F(IndexerTest, FilesAndFoldersFromTheFutureAndThePastAreEnteredOnce) {
+  const Volume volume("A", "64m");
+  const auto setTime = [&](const std::string& name, std::time_t time) {
+    const std::array<timespec, 2> times{timespec{.tv_sec = time, .tv_nsec = 0},
+                                        timespec{.tv_sec = time, .tv_nsec = 0}};
+    EXPECT_EQ(utimensat(AT_FDCWD, (volume.Path() + name).c_str(), times.data(), 0), 0);
+  };
+  constexpr std::time_t IN_2100 = 4'102'444'800;
+  Write(volume.Path() + "/Future/a.jpg");
+  Write(volume.Path() + "/Past/a.jpg");
+  setTime("/Future/a.jpg", IN_2100);
+  setTime("/Future", IN_2100);
+  setTime("/Past/a.jpg", -IN_2100);
+  setTime("/Past", -IN_2100);
+  StartService();
+  StartIndexer();
+  ASSERT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  EXPECT_THAT(Query(volume.Path(), "SELECT path, lastModifiedDate FROM Files ORDER BY path"),
+              ElementsAre("Future/a.jpg|4102444800", "Past/a.jpg|-4102444800"));
+  constexpr char STAMPS[] = "SELECT path, lastUpdatedDate FROM Files WHERE name = 'a.jpg'";
+  const Lines stamps = Query(volume.Path(), STAMPS);
+  EXPECT_THAT(Query(volume.Path(), "SELECT newestStamp < 4000000000 FROM Identity"),
+              ElementsAre("1"));
+  // A change is noticed although the folder's time stays.
+  Write(volume.Path() + "/Future/b.jpg");
+  setTime("/Future", IN_2100);
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  // What has not changed is not written again.
+  EXPECT_EQ(Query(volume.Path(), STAMPS), stamps);
+}
+
+TEST_F(IndexerTest, FilesAreEnteredAfterTheClockWasSetBack) {
+  const Volume volume("A", "64m");
+  Write(volume.Path() + "/Pictures/a.jpg");
+  StartService();
+  StartIndexerIn({"PROBE_CLOCK_OFFSET=-86400"}); // all files were changed tomorrow
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  EXPECT_TRUE(Await([&] { return State(volume.Path()) == "watching"; }));
+  Write(volume.Path() + "/Pictures/b.jpg");
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  Write(volume.Path() + "/Pictures/b.jpg", "other content");
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  EXPECT_THAT(ErrorLines(), IsEmpty());
+}
+
 // --- Volumes that cannot be written ------------------------------------------------------------
 
 TEST_F(IndexerTest, AReadOnlyVolumeIsIndexedWhenItBecomesWritable) {
@@ -432,9 +495,13 @@ protected:
   ~IndexerAndDaemonTest() override { StopDaemon(); }
 
   void Start() {
+    StartServiceAndDaemon();
+    StartIndexer();
+  }
+
+  void StartServiceAndDaemon() {
     StartService();
     daemon_ = std::make_unique<DaemonProcess>("/tmp/daemon", "/tmp/daemon.out");
-    StartIndexer();
   }
 
   /// Ends all programs, the service first.
@@ -484,6 +551,19 @@ protected:
     return merged == expected ? Lines() : merged;
   }
 
+  /// Waits until the indexer remembers the catalogs of the volume and of the master.
+  bool AwaitRemembered() {
+    return Await([] {
+      try {
+        Database state(std::string(STATE_DIRECTORY) + "/catalogs.db");
+        return state.Run("SELECT count(DISTINCT mountPoint) FROM Catalogs "
+                         "WHERE master <> '-'") == Lines{"2"};
+      } catch (const SQLite::Exception&) {
+        return false;
+      }
+    });
+  }
+
 private:
   void StopDaemon() {
     if (daemon_ && daemon_->IsRunning()) {
@@ -531,6 +611,88 @@ TEST_F(IndexerAndDaemonTest, ACatalogFromABackupIsMergedFromTheBeginning) {
   Start();
   // Nothing in the catalog says that the merged database has b.jpg.
   EXPECT_THAT(AwaitMerged(volume.Path(), {"c.jpg"}), IsEmpty());
+}
+
+TEST_F(IndexerAndDaemonTest, ACatalogIsKnownAgainWhenTheClockStartsYearsLate) {
+  const Volume volume("Disk", "64m");
+  Write(volume.Path() + "/a.jpg");
+  Start();
+  ASSERT_THAT(AwaitMerged(volume.Path(), {"a.jpg"}), IsEmpty());
+  Send("end", volume.Path()); // the indexer reads the stamp that the photo has got
+  Stop();
+  const Lines identity = Query(volume.Path(), "SELECT identity FROM Identity");
+  Write(volume.Path() + "/b.jpg");
+  StartServiceAndDaemon();
+  StartIndexerIn({"PROBE_CLOCK_OFFSET=-300000000"});
+  EXPECT_THAT(AwaitMerged(volume.Path(), {"a.jpg", "b.jpg"}), IsEmpty());
+  EXPECT_EQ(Query(volume.Path(), "SELECT identity FROM Identity"), identity);
+  EXPECT_THAT(ErrorLines(), Not(Contains(HasSubstr("renamed"))));
+}
+
+TEST_F(IndexerAndDaemonTest, ARestartOfAllProgramsPurgesNothing) {
+  const Volume volume("Disk", "64m");
+  Write(volume.Path() + "/a.jpg");
+  Start();
+  ASSERT_THAT(AwaitMerged(volume.Path(), {"a.jpg"}), IsEmpty());
+  ASSERT_TRUE(AwaitRemembered());
+  Lines names = {"a.jpg"};
+  for (const std::string name : {"b.jpg", "c.jpg", "d.jpg"}) {
+    names.push_back(name);
+    Stop();
+    const long purged = Count(Events(volume.Path()), "Purged");
+    Write(volume.Path() + "/" + name);
+    Start();
+    ASSERT_THAT(AwaitMerged(volume.Path(), names), IsEmpty());
+    EXPECT_EQ(Count(Events(volume.Path()), "Purged"), purged);
+  }
+}
+
+// --- The indexer's own state -------------------------------------------------------------------
+
+/// The indexer with a state directory that cannot be used.
+class IndexerWithoutStateTest : public IndexerAndDaemonTest {
+protected:
+  /// `repair` makes it usable.
+  void ExpectThatItIsUsedWhenItIsRepaired(const std::function<void()>& repair) {
+    const auto purges = [this] { return Count(Events("/shares/Disk"), "Purged"); };
+    const auto errors = [this] {
+      Lines lines = ErrorLines();
+      std::erase_if(lines, [](const std::string& line) { return !line.starts_with("/tmp/state"); });
+      return lines;
+    };
+    const Volume volume("Disk", "64m");
+    Write(volume.Path() + "/a.jpg");
+    Start();
+    ASSERT_THAT(AwaitMerged(volume.Path(), {"a.jpg"}), IsEmpty());
+    ASSERT_TRUE(Await([&] { return purges() > 0; }));
+    Write(volume.Path() + "/b.jpg");
+    ASSERT_THAT(AwaitMerged(volume.Path(), {"a.jpg", "b.jpg"}), IsEmpty());
+    const long purged = purges();
+    EXPECT_THAT(errors(), ElementsAre(HasSubstr("/tmp/state cannot be used")));
+
+    repair();
+    Write(volume.Path() + "/c.jpg");
+    ASSERT_THAT(AwaitMerged(volume.Path(), {"a.jpg", "b.jpg", "c.jpg"}), IsEmpty());
+    ASSERT_TRUE(AwaitRemembered());
+    StopIndexer();
+    StartIndexer();
+    Write(volume.Path() + "/d.jpg");
+    EXPECT_THAT(AwaitMerged(volume.Path(), {"a.jpg", "b.jpg", "c.jpg", "d.jpg"}), IsEmpty());
+    EXPECT_EQ(purges(), purged);
+    EXPECT_EQ(errors().size(), 1U);
+  }
+};
+
+TEST_F(IndexerWithoutStateTest, ItGoesOnWithoutADirectory) {
+  Write(STATE_DIRECTORY); // a file, so that no directory can be made
+  ExpectThatItIsUsedWhenItIsRepaired([] { fs::remove(STATE_DIRECTORY); });
+}
+
+TEST_F(IndexerWithoutStateTest, ItGoesOnWithADirectoryThatIsReadOnly) {
+  fs::create_directory(STATE_DIRECTORY);
+  ASSERT_EQ(mount("state", STATE_DIRECTORY, "tmpfs", MS_RDONLY, "size=1m"), 0);
+  ExpectThatItIsUsedWhenItIsRepaired(
+      [] { ASSERT_EQ(mount("state", STATE_DIRECTORY, "tmpfs", MS_REMOUNT, "size=1m"), 0); });
 }
 
 // --- Command line ------------------------------------------------------------------------------
