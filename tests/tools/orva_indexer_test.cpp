@@ -1,5 +1,6 @@
 #include "IndexerTest.h"
 
+#include "support/OtherUsers.h"
 #include "support/Programs.h"
 #include "support/TestScale.h"
 #include "system/DaemonProcess.h"
@@ -42,6 +43,17 @@ using testing::Not;
 /// The number of events called `name`.
 long Count(const Lines& events, const std::string& name) {
   return std::ranges::count(events, name);
+}
+
+/// Marks all photos of a catalog finished, as the transcoder does.
+void FinishPhotos(const std::string& volume) {
+  const auto database = catalog::OpenCatalog(volume);
+  db::Transaction transaction(*database, catalog::BUSY_TIMEOUT);
+  const std::time_t stamp = catalog::NextStamp(*database, std::time(nullptr));
+  for (const auto& photo : catalog::NewestWaiting(*database, 1000)) {
+    catalog::MarkFinished(*database, photo, stamp);
+  }
+  transaction.Commit();
 }
 
 // --- Volumes -----------------------------------------------------------------------------------
@@ -485,6 +497,136 @@ TEST_F(IndexerTest, AFullVolumeIsIndexedWhenThereIsSpace) {
   EXPECT_EQ(LogLines(": full").size(), 1U);
 }
 
+// --- Renditions --------------------------------------------------------------------------------
+
+/// The indexer and a volume with a photo whose rendition is finished.
+class RenditionAccessTest : public IndexerTest {
+protected:
+  RenditionAccessTest() { Write(Photo()); }
+
+  std::string Photo() const { return volume_.Path() + "/Holiday/Beach/a.jpg"; }
+  std::string Rendition() const { return volume_.Path() + "/.orva/renditions/0/1.jpg"; }
+
+  /// Starts the indexer, and makes the rendition.
+  void Start(mode_t mode = 0444) {
+    StartService();
+    StartIndexer();
+    ASSERT_THAT(AwaitCatalog(volume_.Path()), IsEmpty());
+    Finish(mode);
+    ASSERT_EQ(Status(), "3");
+  }
+
+  void Finish(mode_t mode) {
+    fs::remove(Rendition());
+    Write(Rendition());
+    ASSERT_EQ(chmod(Rendition().c_str(), mode), 0);
+    FinishPhotos(volume_.Path());
+  }
+
+  std::string Status() const {
+    const Lines status = Query(volume_.Path(), "SELECT status FROM Files WHERE name = 'a.jpg'");
+    return status.size() == 1 ? status.front() : "unknown";
+  }
+  bool AwaitWaiting() {
+    return Await([this] { return Status() == "1"; });
+  }
+
+  /// The status after the folder was listed once more.
+  std::string LaterStatus() {
+    Write(volume_.Path() + "/Holiday/Beach/" + std::to_string(++files_) + ".txt");
+    EXPECT_THAT(AwaitCatalog(volume_.Path()), IsEmpty());
+    return Status();
+  }
+
+  const Volume& TheVolume() const { return volume_; }
+
+private:
+  const Volume volume_{"A", "64m"};
+  int files_ = 0;
+};
+
+TEST_F(RenditionAccessTest, APhotoThatBecomesPrivateIsRenderedAgain) {
+  Start();
+  ASSERT_EQ(chmod(Photo().c_str(), 0600), 0);
+  EXPECT_TRUE(AwaitWaiting());
+  // Merged databases keep it meanwhile.
+  EXPECT_THAT(Query(TheVolume().Path(), "SELECT status FROM Transcodings"), ElementsAre("1"));
+  Finish(0400);
+  EXPECT_EQ(LaterStatus(), "3");
+  ASSERT_EQ(chmod(Photo().c_str(), 0640), 0);
+  EXPECT_TRUE(AwaitWaiting());
+}
+
+TEST_F(RenditionAccessTest, OtherChangesOfAPhotosModeDoNotMatter) {
+  Start();
+  ASSERT_EQ(chmod(Photo().c_str(), 0766), 0);
+  EXPECT_EQ(LaterStatus(), "3");
+}
+
+TEST_F(RenditionAccessTest, PhotosBelowAFolderThatBecomesPrivateAreRenderedAgain) {
+  Start();
+  ASSERT_EQ(chmod((TheVolume().Path() + "/Holiday").c_str(), 0700), 0);
+  EXPECT_TRUE(AwaitWaiting());
+  Finish(0400);
+  EXPECT_EQ(LaterStatus(), "3");
+  ASSERT_EQ(chmod((TheVolume().Path() + "/Holiday").c_str(), 0755), 0);
+  EXPECT_TRUE(AwaitWaiting());
+}
+
+TEST_F(RenditionAccessTest, AChangeWhileTheIndexerDoesNotRunIsNoticed) {
+  Start();
+  StopIndexer();
+  ASSERT_EQ(chmod(Photo().c_str(), 0600), 0);
+  StartIndexer();
+  EXPECT_TRUE(AwaitWaiting());
+}
+
+TEST_F(RenditionAccessTest, TheModeDoesNotMatterWhereItCouldNotBeSet) {
+  Start(0644);
+  ASSERT_EQ(chmod(Photo().c_str(), 0600), 0);
+  EXPECT_EQ(LaterStatus(), "3");
+}
+
+TEST_F(RenditionAccessTest, WhatIsNotARenditionDoesNotMatter) {
+  Start();
+  fs::remove(Rendition());
+  EXPECT_EQ(LaterStatus(), "3");
+  fs::create_symlink("/tmp/elsewhere", Rendition());
+  EXPECT_EQ(LaterStatus(), "3");
+  fs::remove(Rendition());
+  fs::create_directory(Rendition());
+  EXPECT_EQ(LaterStatus(), "3");
+  fs::remove_all(TheVolume().Path() + "/.orva/renditions");
+  EXPECT_EQ(LaterStatus(), "3");
+}
+
+TEST_F(RenditionAccessTest, APhotoWithAnotherOwnerIsRenderedAgain) {
+  if (!HasOtherUsers()) {
+    GTEST_SKIP() << NO_OTHER_USERS;
+  }
+  Start();
+  ASSERT_EQ(chown(Photo().c_str(), 1234, 2345), 0);
+  EXPECT_TRUE(AwaitWaiting());
+  // A file system where the owner cannot be set: it stays as it is.
+  Finish(0444);
+  EXPECT_EQ(LaterStatus(), "3");
+}
+
+TEST_F(RenditionAccessTest, TheGroupOfAFolderDecidesWhatTheGroupOfAPhotoMayRead) {
+  if (!HasOtherUsers()) {
+    GTEST_SKIP() << NO_OTHER_USERS;
+  }
+  const std::string folder = TheVolume().Path() + "/Holiday/Beach";
+  ASSERT_EQ(chown(folder.c_str(), 0, 2345), 0);
+  ASSERT_EQ(chmod(folder.c_str(), 0750), 0);
+  ASSERT_EQ(chown(Photo().c_str(), 0, 2345), 0);
+  Start(0440);
+  ASSERT_EQ(chown(Rendition().c_str(), 0, 2345), 0);
+  EXPECT_EQ(LaterStatus(), "3");
+  ASSERT_EQ(chown(folder.c_str(), 0, 3456), 0);
+  EXPECT_TRUE(AwaitWaiting());
+}
+
 // --- The merged database -----------------------------------------------------------------------
 
 /// The indexer and the daemon, with a master volume that keeps its merged database. It is plugged
@@ -510,17 +652,6 @@ protected:
     Service().Signal(SIGTERM);
     Service().WaitForEnd();
     StopDaemon();
-  }
-
-  /// Marks all photos of a catalog finished, as the transcoder does.
-  static void FinishPhotos(const std::string& volume) {
-    const auto database = catalog::OpenCatalog(volume);
-    db::Transaction transaction(*database, catalog::BUSY_TIMEOUT);
-    const std::time_t stamp = catalog::NextStamp(*database, std::time(nullptr));
-    for (const auto& photo : catalog::NewestWaiting(*database, 1000)) {
-      catalog::MarkFinished(*database, photo, stamp);
-    }
-    transaction.Commit();
   }
 
   /// "file's name|volume" of all merged photos.

@@ -420,6 +420,7 @@ void Volume::WalkNext(FolderIndexer& indexer) {
   }
   folder->revived = task.revived;
   const long long rows = indexer.Summary().rows;
+  hasOtherAccess_ = false;
   std::vector<Folder> inside = indexer.Update(*folder);
   if (isWalkingAll_) {
     walkedFolders_ += static_cast<long long>(inside.size());
@@ -428,7 +429,7 @@ void Volume::WalkNext(FolderIndexer& indexer) {
   std::ranges::reverse(inside); // the first one is next
   for (Folder& next : inside) {
     const bool isUnknown = watches_ && !watches_->Has(next.path);
-    if (task.recursive || isUnknown) {
+    if (task.recursive || isUnknown || hasOtherAccess_) {
       ready_.push_back({.path = std::move(next.path), .recursive = true, .revived = next.revived});
     }
   }
@@ -456,6 +457,8 @@ void Volume::Opened(const Folder& folder, int descriptor) {
   if (watches_ && !watches_->Add(folder.path, descriptor)) {
     GiveUpWatches(errno);
   }
+  // Who may read the photos below depends on it.
+  hasOtherAccess_ = watches_ && watches_->HasOtherAccess(folder.path, descriptor);
 }
 
 void Volume::GiveUpWatches(int error) {

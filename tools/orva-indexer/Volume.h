@@ -161,6 +161,7 @@ private:
   Clock::time_point notBefore_{}; ///< no work earlier
   Clock::time_point nextWalk_{};  ///< of all folders, where they are not watched
   bool isStampWanted_ = false;
+  bool hasOtherAccess_ = false; ///< the folder that is walked lets other users pass than before
 
   dev_t device_ = 0; ///< of the root, as it was walked
   ino_t inode_ = 0;

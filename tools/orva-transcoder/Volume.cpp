@@ -6,6 +6,7 @@
 #include "CatalogSchema.h"
 #include "CatalogWriter.h"
 #include "Classification.h"
+#include "RenditionAccess.h"
 
 #include "orvadb/Transaction.h"
 #include "orvadb/VolumeDB.h"
@@ -58,6 +59,12 @@ std::string PathOf(const std::string& mountPoint) {
   return mountPoint.substr(0, std::max<std::size_t>(mountPoint.size() - 1, 1));
 }
 
+/// The path of the folder that contains the file at `path`; empty for the root.
+std::string FolderOf(const std::string& path) {
+  const auto end = path.rfind('/');
+  return end == std::string::npos ? std::string() : path.substr(0, end);
+}
+
 bool IsBusy(std::string_view failure) {
   return failure.find("database is locked") != std::string_view::npos;
 }
@@ -89,26 +96,6 @@ bool IsRaw(const std::string& path, const util::FileDescriptor& file) {
   }
   const std::string_view begin(bytes.data(), bytes.size());
   return begin.starts_with("II") || begin.starts_with("MM") || begin.starts_with("FUJI");
-}
-
-/// Who may read the photo at `path`: of its mode what allows reading, as far as the folders on the
-/// way let the same users pass.
-mode_t ReadersOf(const VolumeRoot& root, const std::string& path, const struct stat& photo) {
-  mode_t mode = photo.st_mode & (S_IRUSR | S_IRGRP | S_IROTH);
-  for (auto end = path.find('/'); end != std::string::npos; end = path.find('/', end + 1)) {
-    const util::FileDescriptor folder = root.Open(path.substr(0, end), O_PATH | O_DIRECTORY);
-    struct stat status {};
-    if (!folder || fstat(folder.Get(), &status) != 0) {
-      return mode & S_IRUSR;
-    }
-    if ((status.st_mode & S_IXOTH) == 0) {
-      mode &= ~static_cast<mode_t>(S_IROTH);
-      if ((status.st_mode & S_IXGRP) == 0 || status.st_gid != photo.st_gid) {
-        mode &= ~static_cast<mode_t>(S_IRGRP);
-      }
-    }
-  }
-  return mode;
 }
 
 /// Copies `size` bytes. Returns 0 or an errno; EAGAIN if there are not exactly so many.
@@ -360,7 +347,8 @@ std::set<long long> Volume::WriteRenditions(const Opened& volume, Batch& batch) 
     const util::FileDescriptor rendition = batch.folder.OpenOutput(number);
     if (IsRendition(rendition)) {
       writer.Add(photo.photo.id, rendition, status,
-                 ReadersOf(volume.root, photo.photo.path, status));
+                 catalog::RenditionAccess(volume.root, FolderOf(photo.photo.path))
+                     .ModeFor(status.st_mode, status.st_gid));
       written.insert(photo.photo.id);
     }
   }
