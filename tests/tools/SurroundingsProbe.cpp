@@ -28,40 +28,43 @@ long long Speed() {
 
 } // namespace
 
-extern "C" {
+// The names of the C library.
+int GetClock(clockid_t clock, timespec* now) __asm__("clock_gettime");
+time_t GetTime(time_t* result) __asm__("time");
+int Poll(pollfd* descriptors, nfds_t count, int timeout) __asm__("poll");
+int GetFileSystem(int descriptor, struct statfs* status) __asm__("fstatfs");
 
-int clock_gettime(clockid_t clock, timespec* time) noexcept {
-  const auto result = static_cast<int>(syscall(SYS_clock_gettime, clock, time));
+int GetClock(clockid_t clock, timespec* now) {
+  const auto result = static_cast<int>(syscall(SYS_clock_gettime, clock, now));
   if (result == 0 && clock == CLOCK_REALTIME) {
-    time->tv_sec += Setting("PROBE_CLOCK_OFFSET", 0);
+    now->tv_sec += Setting("PROBE_CLOCK_OFFSET", 0);
   } else if (result == 0 && clock == CLOCK_MONOTONIC) {
-    const long long fast = (time->tv_sec * NANOSECONDS + time->tv_nsec) * Speed();
-    *time = {.tv_sec = fast / NANOSECONDS, .tv_nsec = fast % NANOSECONDS};
+    const long long fast = (now->tv_sec * NANOSECONDS + now->tv_nsec) * Speed();
+    *now = {.tv_sec = fast / NANOSECONDS, .tv_nsec = fast % NANOSECONDS};
   }
   return result;
 }
 
-time_t time(time_t* result) noexcept {
+time_t GetTime(time_t* result) {
   timespec now{};
-  clock_gettime(CLOCK_REALTIME, &now);
+  GetClock(CLOCK_REALTIME, &now);
   if (result != nullptr) {
     *result = now.tv_sec;
   }
   return now.tv_sec;
 }
 
-int poll(pollfd* descriptors, nfds_t count, int timeout) {
+int Poll(pollfd* descriptors, nfds_t count, int timeout) {
   if (timeout > 0) {
     timeout = static_cast<int>((timeout + Speed() - 1) / Speed());
   }
-  static const auto next = reinterpret_cast<decltype(&poll)>(dlsym(RTLD_NEXT, "poll"));
+  static const auto next = reinterpret_cast<decltype(&Poll)>(dlsym(RTLD_NEXT, "poll"));
   return next(descriptors, count, timeout);
 }
 
-int fstatfs(int descriptor, struct statfs* status) noexcept {
+int GetFileSystem(int descriptor, struct statfs* status) {
   const auto result = static_cast<int>(syscall(SYS_fstatfs, descriptor, status));
   status->f_type = static_cast<decltype(status->f_type)>(
       Setting("PROBE_FILE_SYSTEM", static_cast<long long>(status->f_type)));
   return result;
-}
 }

@@ -53,10 +53,9 @@ bool RenditionAccess::IsOutdated(long long id, const PhotoAccess& photo) {
     number_ = id / RENDITIONS_PER_FOLDER;
     renditions_ = root_.Open(RenditionFolder(id), O_PATH | O_DIRECTORY);
   }
-  const std::string path = RenditionPath(id);
   struct stat rendition {};
-  if (!renditions_ || fstatat(renditions_.Get(), path.c_str() + path.rfind('/') + 1, &rendition,
-                              AT_SYMLINK_NOFOLLOW) != 0) {
+  if (!renditions_ ||
+      fstatat(renditions_.Get(), RenditionName(id).c_str(), &rendition, AT_SYMLINK_NOFOLLOW) != 0) {
     return false;
   }
   // A rendition has permissions to read only. If it has others, they could not be set.
