@@ -66,7 +66,7 @@ protected:
 
   static std::string Content() {
     std::ifstream file(std::string(DIRECTORY) + "/status.json");
-    return std::string(std::istreambuf_iterator<char>(file), {});
+    return {std::istreambuf_iterator<char>(file), {}};
   }
 
   static constexpr char DIRECTORY[] = "/tmp/runtime";
