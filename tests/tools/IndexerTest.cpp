@@ -76,6 +76,12 @@ void IndexerTest::StartIndexer(Program::Arguments prefix) {
   }
 }
 
+void IndexerTest::StartIndexerIn(const Program::Arguments& surroundings) {
+  Program::Arguments prefix = {"env", "LD_PRELOAD=" + ProgramPath("libsurroundings_probe.so")};
+  prefix.insert(prefix.end(), surroundings.begin(), surroundings.end());
+  StartIndexer(prefix);
+}
+
 void IndexerTest::StopIndexer() {
   indexer_->Signal(SIGTERM);
   EXPECT_EQ(indexer_->WaitForEnd(), 0);

@@ -31,6 +31,9 @@ protected:
   /// Starts the indexer. `prefix` is a command that starts it.
   void StartIndexer(Program::Arguments prefix = {});
 
+  /// Starts the indexer in other surroundings, which SurroundingsProbe.cpp describes.
+  void StartIndexerIn(const Program::Arguments& surroundings);
+
   /// Stops the indexer as systemd does, and expects that it ends well.
   void StopIndexer();
 

@@ -1,5 +1,6 @@
 #include "IndexerTest.h"
 
+#include "support/OtherUsers.h"
 #include "support/Programs.h"
 #include "support/TestScale.h"
 #include "system/DaemonProcess.h"
@@ -42,6 +43,17 @@ using testing::Not;
 /// The number of events called `name`.
 long Count(const Lines& events, const std::string& name) {
   return std::ranges::count(events, name);
+}
+
+/// Marks all photos of a catalog finished, as the transcoder does.
+void FinishPhotos(const std::string& volume) {
+  const auto database = catalog::OpenCatalog(volume);
+  db::Transaction transaction(*database, catalog::BUSY_TIMEOUT);
+  const std::time_t stamp = catalog::NextStamp(*database, std::time(nullptr));
+  for (const auto& photo : catalog::NewestWaiting(*database, 1000)) {
+    catalog::MarkFinished(*database, photo, stamp);
+  }
+  transaction.Commit();
 }
 
 // --- Volumes -----------------------------------------------------------------------------------
@@ -267,6 +279,22 @@ TEST_F(IndexerTest, AtTheWatchLimitTheVolumeIsWalkedOnATimer) {
   EXPECT_EQ(LogLines("fs.inotify.max_user_watches").size(), 1U);
 }
 
+TEST_F(IndexerTest, WhereThereAreNoEventsTheVolumeIsWalkedOnATimer) {
+  const Volume volume("A", "64m");
+  Write(volume.Path() + "/Pictures/a.jpg");
+  StartService();
+  StartIndexerIn({"PROBE_FILE_SYSTEM=0x65735546", "PROBE_CLOCK_SPEED=100"}); // FUSE
+  EXPECT_TRUE(AwaitLog("its changes are looked for on a timer"));
+  EXPECT_TRUE(Await([&] { return State(volume.Path()) == "timed"; }));
+  Write(volume.Path() + "/Pictures/New/b.jpg");
+  fs::remove(volume.Path() + "/Pictures/a.jpg");
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  Write(volume.Path() + "/Pictures/New/c.jpg");
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  EXPECT_TRUE(Await([&] { return State(volume.Path()) == "timed"; }));
+  EXPECT_THAT(ErrorLines(), IsEmpty());
+}
+
 TEST_F(IndexerTest, AMountBelowTheVolumeIsFollowed) {
   const Volume volume("A", "64m");
   Write(volume.Path() + "/Inside/a.jpg");
@@ -392,6 +420,53 @@ TEST_F(IndexerTest, AKilledIndexerConvergesAfterItsStart) {
   EXPECT_THAT(ErrorLines(), IsEmpty());
 }
 
+// --- The clock ---------------------------------------------------------------------------------
+
+TEST_F(IndexerTest, FilesAndFoldersFromTheFutureAndThePastAreEnteredOnce) {
+  const Volume volume("A", "64m");
+  const auto setTime = [&](const std::string& name, std::time_t time) {
+    const std::array<timespec, 2> times{timespec{.tv_sec = time, .tv_nsec = 0},
+                                        timespec{.tv_sec = time, .tv_nsec = 0}};
+    EXPECT_EQ(utimensat(AT_FDCWD, (volume.Path() + name).c_str(), times.data(), 0), 0);
+  };
+  constexpr std::time_t IN_2100 = 4'102'444'800;
+  Write(volume.Path() + "/Future/a.jpg");
+  Write(volume.Path() + "/Past/a.jpg");
+  setTime("/Future/a.jpg", IN_2100);
+  setTime("/Future", IN_2100);
+  setTime("/Past/a.jpg", -IN_2100);
+  setTime("/Past", -IN_2100);
+  StartService();
+  StartIndexer();
+  ASSERT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  EXPECT_THAT(Query(volume.Path(), "SELECT path, lastModifiedDate FROM Files ORDER BY path"),
+              ElementsAre("Future/a.jpg|4102444800", "Past/a.jpg|-4102444800"));
+  constexpr char STAMPS[] = "SELECT path, lastUpdatedDate FROM Files WHERE name = 'a.jpg'";
+  const Lines stamps = Query(volume.Path(), STAMPS);
+  EXPECT_THAT(Query(volume.Path(), "SELECT newestStamp < 4000000000 FROM Identity"),
+              ElementsAre("1"));
+  // A change is noticed although the folder's time stays.
+  Write(volume.Path() + "/Future/b.jpg");
+  setTime("/Future", IN_2100);
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  // What has not changed is not written again.
+  EXPECT_EQ(Query(volume.Path(), STAMPS), stamps);
+}
+
+TEST_F(IndexerTest, FilesAreEnteredAfterTheClockWasSetBack) {
+  const Volume volume("A", "64m");
+  Write(volume.Path() + "/Pictures/a.jpg");
+  StartService();
+  StartIndexerIn({"PROBE_CLOCK_OFFSET=-86400"}); // all files were changed tomorrow
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  EXPECT_TRUE(Await([&] { return State(volume.Path()) == "watching"; }));
+  Write(volume.Path() + "/Pictures/b.jpg");
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  Write(volume.Path() + "/Pictures/b.jpg", "other content");
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  EXPECT_THAT(ErrorLines(), IsEmpty());
+}
+
 // --- Volumes that cannot be written ------------------------------------------------------------
 
 TEST_F(IndexerTest, AReadOnlyVolumeIsIndexedWhenItBecomesWritable) {
@@ -422,6 +497,136 @@ TEST_F(IndexerTest, AFullVolumeIsIndexedWhenThereIsSpace) {
   EXPECT_EQ(LogLines(": full").size(), 1U);
 }
 
+// --- Renditions --------------------------------------------------------------------------------
+
+/// The indexer and a volume with a photo whose rendition is finished.
+class RenditionAccessTest : public IndexerTest {
+protected:
+  RenditionAccessTest() { Write(Photo()); }
+
+  std::string Photo() const { return volume_.Path() + "/Holiday/Beach/a.jpg"; }
+  std::string Rendition() const { return volume_.Path() + "/.orva/renditions/0/1.jpg"; }
+
+  /// Starts the indexer, and makes the rendition.
+  void Start(mode_t mode = 0444) {
+    StartService();
+    StartIndexer();
+    ASSERT_THAT(AwaitCatalog(volume_.Path()), IsEmpty());
+    Finish(mode);
+    ASSERT_EQ(Status(), "3");
+  }
+
+  void Finish(mode_t mode) {
+    fs::remove(Rendition());
+    Write(Rendition());
+    ASSERT_EQ(chmod(Rendition().c_str(), mode), 0);
+    FinishPhotos(volume_.Path());
+  }
+
+  std::string Status() const {
+    const Lines status = Query(volume_.Path(), "SELECT status FROM Files WHERE name = 'a.jpg'");
+    return status.size() == 1 ? status.front() : "unknown";
+  }
+  bool AwaitWaiting() {
+    return Await([this] { return Status() == "1"; });
+  }
+
+  /// The status after the folder was listed once more.
+  std::string LaterStatus() {
+    Write(volume_.Path() + "/Holiday/Beach/" + std::to_string(++files_) + ".txt");
+    EXPECT_THAT(AwaitCatalog(volume_.Path()), IsEmpty());
+    return Status();
+  }
+
+  const Volume& TheVolume() const { return volume_; }
+
+private:
+  const Volume volume_{"A", "64m"};
+  int files_ = 0;
+};
+
+TEST_F(RenditionAccessTest, APhotoThatBecomesPrivateIsRenderedAgain) {
+  Start();
+  ASSERT_EQ(chmod(Photo().c_str(), 0600), 0);
+  EXPECT_TRUE(AwaitWaiting());
+  // Merged databases keep it meanwhile.
+  EXPECT_THAT(Query(TheVolume().Path(), "SELECT status FROM Transcodings"), ElementsAre("1"));
+  Finish(0400);
+  EXPECT_EQ(LaterStatus(), "3");
+  ASSERT_EQ(chmod(Photo().c_str(), 0640), 0);
+  EXPECT_TRUE(AwaitWaiting());
+}
+
+TEST_F(RenditionAccessTest, OtherChangesOfAPhotosModeDoNotMatter) {
+  Start();
+  ASSERT_EQ(chmod(Photo().c_str(), 0766), 0);
+  EXPECT_EQ(LaterStatus(), "3");
+}
+
+TEST_F(RenditionAccessTest, PhotosBelowAFolderThatBecomesPrivateAreRenderedAgain) {
+  Start();
+  ASSERT_EQ(chmod((TheVolume().Path() + "/Holiday").c_str(), 0700), 0);
+  EXPECT_TRUE(AwaitWaiting());
+  Finish(0400);
+  EXPECT_EQ(LaterStatus(), "3");
+  ASSERT_EQ(chmod((TheVolume().Path() + "/Holiday").c_str(), 0755), 0);
+  EXPECT_TRUE(AwaitWaiting());
+}
+
+TEST_F(RenditionAccessTest, AChangeWhileTheIndexerDoesNotRunIsNoticed) {
+  Start();
+  StopIndexer();
+  ASSERT_EQ(chmod(Photo().c_str(), 0600), 0);
+  StartIndexer();
+  EXPECT_TRUE(AwaitWaiting());
+}
+
+TEST_F(RenditionAccessTest, TheModeDoesNotMatterWhereItCouldNotBeSet) {
+  Start(0644);
+  ASSERT_EQ(chmod(Photo().c_str(), 0600), 0);
+  EXPECT_EQ(LaterStatus(), "3");
+}
+
+TEST_F(RenditionAccessTest, WhatIsNotARenditionDoesNotMatter) {
+  Start();
+  fs::remove(Rendition());
+  EXPECT_EQ(LaterStatus(), "3");
+  fs::create_symlink("/tmp/elsewhere", Rendition());
+  EXPECT_EQ(LaterStatus(), "3");
+  fs::remove(Rendition());
+  fs::create_directory(Rendition());
+  EXPECT_EQ(LaterStatus(), "3");
+  fs::remove_all(TheVolume().Path() + "/.orva/renditions");
+  EXPECT_EQ(LaterStatus(), "3");
+}
+
+TEST_F(RenditionAccessTest, APhotoWithAnotherOwnerIsRenderedAgain) {
+  if (!HasOtherUsers()) {
+    GTEST_SKIP() << NO_OTHER_USERS;
+  }
+  Start();
+  ASSERT_EQ(chown(Photo().c_str(), 1234, 2345), 0);
+  EXPECT_TRUE(AwaitWaiting());
+  // A file system where the owner cannot be set: it stays as it is.
+  Finish(0444);
+  EXPECT_EQ(LaterStatus(), "3");
+}
+
+TEST_F(RenditionAccessTest, TheGroupOfAFolderDecidesWhatTheGroupOfAPhotoMayRead) {
+  if (!HasOtherUsers()) {
+    GTEST_SKIP() << NO_OTHER_USERS;
+  }
+  const std::string folder = TheVolume().Path() + "/Holiday/Beach";
+  ASSERT_EQ(chown(folder.c_str(), 0, 2345), 0);
+  ASSERT_EQ(chmod(folder.c_str(), 0750), 0);
+  ASSERT_EQ(chown(Photo().c_str(), 0, 2345), 0);
+  Start(0440);
+  ASSERT_EQ(chown(Rendition().c_str(), 0, 2345), 0);
+  EXPECT_EQ(LaterStatus(), "3");
+  ASSERT_EQ(chown(folder.c_str(), 0, 3456), 0);
+  EXPECT_TRUE(AwaitWaiting());
+}
+
 // --- The merged database -----------------------------------------------------------------------
 
 /// The indexer and the daemon, with a master volume that keeps its merged database. It is plugged
@@ -432,9 +637,13 @@ protected:
   ~IndexerAndDaemonTest() override { StopDaemon(); }
 
   void Start() {
+    StartServiceAndDaemon();
+    StartIndexer();
+  }
+
+  void StartServiceAndDaemon() {
     StartService();
     daemon_ = std::make_unique<DaemonProcess>("/tmp/daemon", "/tmp/daemon.out");
-    StartIndexer();
   }
 
   /// Ends all programs, the service first.
@@ -443,17 +652,6 @@ protected:
     Service().Signal(SIGTERM);
     Service().WaitForEnd();
     StopDaemon();
-  }
-
-  /// Marks all photos of a catalog finished, as the transcoder does.
-  static void FinishPhotos(const std::string& volume) {
-    const auto database = catalog::OpenCatalog(volume);
-    db::Transaction transaction(*database, catalog::BUSY_TIMEOUT);
-    const std::time_t stamp = catalog::NextStamp(*database, std::time(nullptr));
-    for (const auto& photo : catalog::NewestWaiting(*database, 1000)) {
-      catalog::MarkFinished(*database, photo, stamp);
-    }
-    transaction.Commit();
   }
 
   /// "file's name|volume" of all merged photos.
@@ -482,6 +680,19 @@ protected:
     Await([&] { return Merged() == expected; });
     Lines merged = Merged();
     return merged == expected ? Lines() : merged;
+  }
+
+  /// Waits until the indexer remembers the catalogs of the volume and of the master.
+  bool AwaitRemembered() {
+    return Await([] {
+      try {
+        Database state(std::string(STATE_DIRECTORY) + "/catalogs.db");
+        return state.Run("SELECT count(DISTINCT mountPoint) FROM Catalogs "
+                         "WHERE master <> '-'") == Lines{"2"};
+      } catch (const SQLite::Exception&) {
+        return false;
+      }
+    });
   }
 
 private:
@@ -531,6 +742,88 @@ TEST_F(IndexerAndDaemonTest, ACatalogFromABackupIsMergedFromTheBeginning) {
   Start();
   // Nothing in the catalog says that the merged database has b.jpg.
   EXPECT_THAT(AwaitMerged(volume.Path(), {"c.jpg"}), IsEmpty());
+}
+
+TEST_F(IndexerAndDaemonTest, ACatalogIsKnownAgainWhenTheClockStartsYearsLate) {
+  const Volume volume("Disk", "64m");
+  Write(volume.Path() + "/a.jpg");
+  Start();
+  ASSERT_THAT(AwaitMerged(volume.Path(), {"a.jpg"}), IsEmpty());
+  Send("end", volume.Path()); // the indexer reads the stamp that the photo has got
+  Stop();
+  const Lines identity = Query(volume.Path(), "SELECT identity FROM Identity");
+  Write(volume.Path() + "/b.jpg");
+  StartServiceAndDaemon();
+  StartIndexerIn({"PROBE_CLOCK_OFFSET=-300000000"});
+  EXPECT_THAT(AwaitMerged(volume.Path(), {"a.jpg", "b.jpg"}), IsEmpty());
+  EXPECT_EQ(Query(volume.Path(), "SELECT identity FROM Identity"), identity);
+  EXPECT_THAT(ErrorLines(), Not(Contains(HasSubstr("renamed"))));
+}
+
+TEST_F(IndexerAndDaemonTest, ARestartOfAllProgramsPurgesNothing) {
+  const Volume volume("Disk", "64m");
+  Write(volume.Path() + "/a.jpg");
+  Start();
+  ASSERT_THAT(AwaitMerged(volume.Path(), {"a.jpg"}), IsEmpty());
+  ASSERT_TRUE(AwaitRemembered());
+  Lines names = {"a.jpg"};
+  for (const std::string name : {"b.jpg", "c.jpg", "d.jpg"}) {
+    names.push_back(name);
+    Stop();
+    const long purged = Count(Events(volume.Path()), "Purged");
+    Write(volume.Path() + "/" + name);
+    Start();
+    ASSERT_THAT(AwaitMerged(volume.Path(), names), IsEmpty());
+    EXPECT_EQ(Count(Events(volume.Path()), "Purged"), purged);
+  }
+}
+
+// --- The indexer's own state -------------------------------------------------------------------
+
+/// The indexer with a state directory that cannot be used.
+class IndexerWithoutStateTest : public IndexerAndDaemonTest {
+protected:
+  /// `repair` makes it usable.
+  void ExpectThatItIsUsedWhenItIsRepaired(const std::function<void()>& repair) {
+    const auto purges = [this] { return Count(Events("/shares/Disk"), "Purged"); };
+    const auto errors = [this] {
+      Lines lines = ErrorLines();
+      std::erase_if(lines, [](const std::string& line) { return !line.starts_with("/tmp/state"); });
+      return lines;
+    };
+    const Volume volume("Disk", "64m");
+    Write(volume.Path() + "/a.jpg");
+    Start();
+    ASSERT_THAT(AwaitMerged(volume.Path(), {"a.jpg"}), IsEmpty());
+    ASSERT_TRUE(Await([&] { return purges() > 0; }));
+    Write(volume.Path() + "/b.jpg");
+    ASSERT_THAT(AwaitMerged(volume.Path(), {"a.jpg", "b.jpg"}), IsEmpty());
+    const long purged = purges();
+    EXPECT_THAT(errors(), ElementsAre(HasSubstr("/tmp/state cannot be used")));
+
+    repair();
+    Write(volume.Path() + "/c.jpg");
+    ASSERT_THAT(AwaitMerged(volume.Path(), {"a.jpg", "b.jpg", "c.jpg"}), IsEmpty());
+    ASSERT_TRUE(AwaitRemembered());
+    StopIndexer();
+    StartIndexer();
+    Write(volume.Path() + "/d.jpg");
+    EXPECT_THAT(AwaitMerged(volume.Path(), {"a.jpg", "b.jpg", "c.jpg", "d.jpg"}), IsEmpty());
+    EXPECT_EQ(purges(), purged);
+    EXPECT_EQ(errors().size(), 1U);
+  }
+};
+
+TEST_F(IndexerWithoutStateTest, ItGoesOnWithoutADirectory) {
+  Write(STATE_DIRECTORY); // a file, so that no directory can be made
+  ExpectThatItIsUsedWhenItIsRepaired([] { fs::remove(STATE_DIRECTORY); });
+}
+
+TEST_F(IndexerWithoutStateTest, ItGoesOnWithADirectoryThatIsReadOnly) {
+  fs::create_directory(STATE_DIRECTORY);
+  ASSERT_EQ(mount("state", STATE_DIRECTORY, "tmpfs", MS_RDONLY, "size=1m"), 0);
+  ExpectThatItIsUsedWhenItIsRepaired(
+      [] { ASSERT_EQ(mount("state", STATE_DIRECTORY, "tmpfs", MS_REMOUNT, "size=1m"), 0); });
 }
 
 // --- Command line ------------------------------------------------------------------------------

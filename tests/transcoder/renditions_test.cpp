@@ -78,6 +78,17 @@ TEST_F(Renditions, GetTheOwnerOfThePhotoAndItsPermissionToRead) {
   EXPECT_EQ(StatusOf(Rendition("open.jpg")).st_mode & 07777, 0444U);
 }
 
+TEST_F(Renditions, OfAPhotoThatBecomesPrivateBecomesPrivate) {
+  Copy("a.jpg");
+  AddWaiting("a.jpg");
+  RenderAll();
+  ASSERT_EQ(StatusOf(Rendition("a.jpg")).st_mode & 07777, 0444U);
+  chmod(At("a.jpg").c_str(), 0600);
+  AddWaiting("a.jpg"); // the indexer does so
+  RenderAll();
+  EXPECT_EQ(StatusOf(Rendition("a.jpg")).st_mode & 07777, 0400U);
+}
+
 TEST_F(Renditions, OfPhotosInAPrivateFolderArePrivate) {
   fs::create_directories(At("private/below"));
   fs::create_directories(At("group/below"));

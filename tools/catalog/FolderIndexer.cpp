@@ -185,7 +185,10 @@ void FolderIndexer::Examine(const IndexedFolder& folder, int descriptor, const c
     listing.files.push_back({.name = name,
                              .lastModifiedDate = found.st_mtime,
                              .size = found.st_size,
-                             .statusChanged = found.st_ctim});
+                             .access = {.mode = found.st_mode,
+                                        .owner = found.st_uid,
+                                        .group = found.st_gid,
+                                        .changed = found.st_ctim}});
   }
 }
 
@@ -279,7 +282,7 @@ FolderIndexer::FileChanges FolderIndexer::CompareFiles(const IndexedFolder& fold
     if (file.isKnown &&
         (!hooks_.isComplete ||
          hooks_.isComplete(folder, file.name,
-                           {.size = file.size, .statusChanged = file.statusChanged}))) {
+                           {.size = file.size, .statusChanged = file.access.changed}))) {
       changes.written.push_back({.entry = &file, .row = std::move(row)});
       ++summary_.rows;
       return true;
@@ -297,6 +300,7 @@ FolderIndexer::FileChanges FolderIndexer::CompareFiles(const IndexedFolder& fold
                     "isBackup, isHidden, isSystem FROM Files INDEXED BY Files_folder "
                     "WHERE folderId = ? ORDER BY name");
   row.BindInt64(1, folder.id);
+  RenditionAccess renditions(volume_, folder.path);
   std::vector<std::pair<std::string, long long>> tombstones; ///< of names in this folder
   std::size_t count = 0;
   while (row.Fetch()) {
@@ -324,7 +328,9 @@ FolderIndexer::FileChanges FolderIndexer::CompareFiles(const IndexedFolder& fold
       continue;
     }
     const bool isDeleted = known.isDeleted;
-    const bool isChanged = isDeleted || folder.revived || !IsUpToDate(row, folder, *entry);
+    const bool isChanged = isDeleted || folder.revived || !IsUpToDate(row, folder, *entry) ||
+                           (known.status == RENDERED && newPhotos_ == NewPhotos::Waiting &&
+                            renditions.IsOutdated(known.id, entry->access));
     if (!(isChanged && write(*entry, std::move(known))) && !isDeleted) {
       ++summary_.rows; // it stays as it is
     }

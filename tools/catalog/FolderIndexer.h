@@ -1,6 +1,7 @@
 #pragma once
 
 #include "Classification.h"
+#include "RenditionAccess.h"
 
 #include <ctime>
 #include <functional>
@@ -110,7 +111,7 @@ private:
     bool isKnown = true; ///< false: its row must stay as it is
     std::time_t lastModifiedDate = 0;
     long long size = 0;
-    timespec statusChanged{};
+    PhotoAccess access{}; ///< of a file
   };
   /// What the catalog says about one of them.
   struct FolderRow {

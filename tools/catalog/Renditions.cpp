@@ -156,8 +156,12 @@ std::string RenditionFolder(long long fileId) {
   return util::FormatString("%s/%lld", RENDITIONS, fileId / RENDITIONS_PER_FOLDER);
 }
 
+std::string RenditionName(long long fileId) {
+  return std::to_string(fileId) + ".jpg";
+}
+
 std::string RenditionPath(long long fileId) {
-  return util::FormatString("%s/%lld.jpg", RenditionFolder(fileId).c_str(), fileId);
+  return RenditionFolder(fileId) + '/' + RenditionName(fileId);
 }
 
 } // namespace orva::catalog

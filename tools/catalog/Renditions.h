@@ -58,11 +58,12 @@ bool IsOnVolume(const db::DB& catalog, long long fileId);
 /// Says that the file's rendition is removed.
 void ForgetRemovedFile(const db::DB& catalog, long long fileId);
 
-/// Folder of the renditions and path of a file's rendition, relative to the volume. A folder has at
+/// Name and path of a file's rendition, and its folder, relative to the volume. A folder has at
 /// most RENDITIONS_PER_FOLDER: some file systems allow only 65,536 entries.
 inline constexpr char RENDITIONS[] = ".orva/renditions";
 inline constexpr long long RENDITIONS_PER_FOLDER = 1000;
 std::string RenditionFolder(long long fileId);
+std::string RenditionName(long long fileId);
 std::string RenditionPath(long long fileId);
 
 } // namespace orva::catalog

@@ -3,6 +3,7 @@
 #include "orvautil/FormatString.h"
 
 #include <sys/inotify.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <array>
@@ -31,9 +32,9 @@ bool FolderWatches::Add(const std::string& path, int descriptor) {
     return false;
   }
   const auto former = byPath_.find(path);
-  if (former != byPath_.end() && former->second != watch) {
-    byWatch_.erase(former->second);
-    inotify_rm_watch(inotify_.Get(), former->second);
+  if (former != byPath_.end() && former->second.watch != watch) {
+    byWatch_.erase(former->second.watch);
+    inotify_rm_watch(inotify_.Get(), former->second.watch);
   }
   // A folder has one watch, also when it was moved.
   const auto elsewhere = byWatch_.find(watch);
@@ -41,15 +42,30 @@ bool FolderWatches::Add(const std::string& path, int descriptor) {
     byPath_.erase(elsewhere->second);
   }
   byWatch_[watch] = path;
-  byPath_[path] = watch;
+  byPath_[path].watch = watch;
   return true;
+}
+
+bool FolderWatches::HasOtherAccess(const std::string& path, int descriptor) {
+  const auto entry = byPath_.find(path);
+  struct stat status {};
+  if (entry == byPath_.end() || fstat(descriptor, &status) != 0) {
+    return false;
+  }
+  const Watched former = entry->second;
+  entry->second = {.watch = former.watch,
+                   .isAccessKnown = true,
+                   .passing = status.st_mode & (S_IXGRP | S_IXOTH),
+                   .group = status.st_gid};
+  return former.isAccessKnown &&
+         (former.passing != entry->second.passing || former.group != entry->second.group);
 }
 
 void FolderWatches::Forget(const std::string& path) {
   auto entry = byPath_.lower_bound(path);
   while (entry != byPath_.end() && entry->first.starts_with(path)) {
-    byWatch_.erase(entry->second);
-    inotify_rm_watch(inotify_.Get(), entry->second);
+    byWatch_.erase(entry->second.watch);
+    inotify_rm_watch(inotify_.Get(), entry->second.watch);
     entry = byPath_.erase(entry);
   }
 }

@@ -2,6 +2,8 @@
 
 #include "orvautil/FileDescriptor.h"
 
+#include <sys/types.h>
+
 #include <cstdint>
 #include <map>
 #include <string>
@@ -31,6 +33,10 @@ public:
   /// says why not.
   bool Add(const std::string& path, int descriptor);
 
+  /// Whether the open folder `descriptor`, which is watched at `path`, lets other users pass than
+  /// at the last call for this path.
+  bool HasOtherAccess(const std::string& path, int descriptor);
+
   /// Whether the folder at `path` is watched.
   bool Has(const std::string& path) const { return byPath_.contains(path); }
 
@@ -42,9 +48,16 @@ public:
   std::vector<Event> Read();
 
 private:
+  struct Watched {
+    int watch = -1;
+    bool isAccessKnown = false;
+    mode_t passing = 0; ///< who may pass
+    gid_t group = 0;
+  };
+
   util::FileDescriptor inotify_;
   std::unordered_map<int, std::string> byWatch_;
-  std::map<std::string, int> byPath_;
+  std::map<std::string, Watched> byPath_;
 };
 
 } // namespace orva::indexer

@@ -1,68 +1,105 @@
 #include "RememberedCatalogs.h"
 
-#include "Log.h"
-
 #include "Sql.h"
 #include "UntrustedCatalog.h"
+#include "service/Log.h"
 
+#include <algorithm>
 #include <filesystem>
 #include <system_error>
 
 namespace orva::indexer {
 
 using catalog::Execute;
-using catalog::SelectNumber;
 
-RememberedCatalogs::RememberedCatalogs(const std::string& directory) {
-  std::error_code ignored;
-  std::filesystem::create_directories(directory, ignored);
-  const std::string path = directory + "/catalogs.db";
+RememberedCatalogs::RememberedCatalogs(std::string directory) : directory_(std::move(directory)) {
+  Save();
+}
+
+std::optional<RememberedCatalogs::Catalog>
+RememberedCatalogs::Find(const std::string& master, const std::string& mountPoint) const {
+  const auto found = catalogs_.find({master, mountPoint});
+  return found == catalogs_.end() ? std::nullopt : std::optional(found->second);
+}
+
+void RememberedCatalogs::Store(const std::string& master, const std::string& mountPoint,
+                               const Catalog& catalog) {
+  const Key key(master, mountPoint);
+  Catalog& stored = catalogs_[key];
+  if (stored != catalog) {
+    stored = catalog;
+    unsaved_.insert(key);
+  }
+  if (!unsaved_.empty()) {
+    Save();
+  }
+}
+
+std::time_t RememberedCatalogs::NewestStamp() const {
+  std::time_t newest = 0;
+  for (const auto& [key, catalog] : catalogs_) {
+    newest = std::max(newest, catalog.newestStamp);
+  }
+  return newest;
+}
+
+/// If that fails, the volumes are announced as purged after a restart, which is always right.
+void RememberedCatalogs::Save() {
   try {
-    Prepare(path);
+    if (database_.GetPath().empty()) {
+      Open();
+    }
+    for (auto key = unsaved_.begin(); key != unsaved_.end(); key = unsaved_.erase(key)) {
+      const Catalog& catalog = catalogs_.at(*key);
+      Execute(database_,
+              "INSERT OR REPLACE INTO Catalogs(master, mountPoint, identity, newestStamp) "
+              "VALUES(?, ?, ?, ?)",
+              key->first, key->second, catalog.identity, catalog.newestStamp);
+    }
+    hasFailed_ = false;
+  } catch (const std::string& failure) {
+    database_.Close();
+    if (!std::exchange(hasFailed_, true)) {
+      service::LogError(directory_ + " cannot be used. After a restart, all volumes are merged " +
+                        "from the beginning: " + service::Printable(failure));
+    }
+  }
+}
+
+void RememberedCatalogs::Open() {
+  std::error_code ignored;
+  std::filesystem::create_directories(directory_, ignored);
+  const std::string path = directory_ + "/catalogs.db";
+  try {
+    Read(path);
   } catch (const std::string& failure) {
     if (catalog::ProblemOf(failure) != catalog::CatalogProblem::Foreign) {
       throw;
     }
     // Every catalog will be announced as purged, which is always right.
-    LogError("The catalogs that were announced are not known any more: " + Printable(failure));
+    service::LogError("The catalogs that were announced are not known any more: " +
+                      service::Printable(failure));
     database_.Close();
     for (const char* const suffix : {"", "-journal", "-wal", "-shm"}) {
       std::filesystem::remove(path + suffix, ignored);
     }
-    Prepare(path);
+    Read(path);
   }
 }
 
-void RememberedCatalogs::Prepare(const std::string& path) {
+/// Creates the database if there is none. What is known already is newer.
+void RememberedCatalogs::Read(const std::string& path) {
   database_.Open(path);
   Execute(database_,
           "CREATE TABLE IF NOT EXISTS Catalogs(master TEXT NOT NULL, mountPoint TEXT NOT NULL, "
           "identity TEXT NOT NULL, newestStamp INTEGER NOT NULL, PRIMARY KEY(master, mountPoint))");
-  SelectNumber(database_, "SELECT count(*) FROM Catalogs");
-}
-
-std::optional<RememberedCatalogs::Catalog>
-RememberedCatalogs::Find(const std::string& master, const std::string& mountPoint) const {
-  db::Statement row(database_, "SELECT identity, newestStamp FROM Catalogs "
-                               "WHERE master = ? AND mountPoint = ?");
-  row.BindText(1, master);
-  row.BindText(2, mountPoint);
-  if (!row.Fetch()) {
-    return std::nullopt;
-  }
-  return Catalog{.identity = row.GetText(0), .newestStamp = row.GetTime(1)};
-}
-
-void RememberedCatalogs::Store(const std::string& master, const std::string& mountPoint,
-                               const Catalog& catalog) const {
-  Execute(database_,
-          "INSERT OR REPLACE INTO Catalogs(master, mountPoint, identity, newestStamp) "
-          "VALUES(?, ?, ?, ?)",
-          master, mountPoint, catalog.identity, catalog.newestStamp);
-}
-
-std::time_t RememberedCatalogs::NewestStamp() const {
-  return SelectNumber(database_, "SELECT max(newestStamp) FROM Catalogs");
+  std::map<Key, Catalog> stored;
+  catalog::ForEachRow(database_, "SELECT master, mountPoint, identity, newestStamp FROM Catalogs",
+                      [&stored](const db::Statement& row) {
+                        stored[{row.GetText(0), row.GetText(1)}] = {.identity = row.GetText(2),
+                                                                    .newestStamp = row.GetTime(3)};
+                      });
+  catalogs_.merge(stored);
 }
 
 } // namespace orva::indexer

@@ -3,38 +3,50 @@
 #include "orvadb/DB.h"
 
 #include <ctime>
+#include <map>
 #include <optional>
+#include <set>
 #include <string>
+#include <utility>
 
 namespace orva::indexer {
 
 /// Which catalog was last announced at a mount point, and up to which stamp, for each master: each
-/// has a merged database of its own. Kept in a database of the indexer's own, over restarts.
-/// Failures are thrown as std::string.
+/// has a merged database of its own. Kept in a database of the indexer's own, over restarts. While
+/// that cannot be used, which is logged once, they are kept in memory. On the program's thread.
 class RememberedCatalogs {
 public:
   struct Catalog {
     std::string identity;
     std::time_t newestStamp = 0;
+
+    bool operator==(const Catalog&) const = default;
   };
 
-  /// Opens the database in `directory`; makes it again if it is damaged.
-  explicit RememberedCatalogs(const std::string& directory);
+  /// Reads the database in `directory`; makes it again if it is damaged.
+  explicit RememberedCatalogs(std::string directory);
 
   /// The catalog that was last announced at `mountPoint`. `master` is the identity of the catalog
   /// on the master volume.
   std::optional<Catalog> Find(const std::string& master, const std::string& mountPoint) const;
 
-  void Store(const std::string& master, const std::string& mountPoint,
-             const Catalog& catalog) const;
+  void Store(const std::string& master, const std::string& mountPoint, const Catalog& catalog);
 
   /// The newest stamp of all; 0 if there is none. The clock was there once.
   std::time_t NewestStamp() const;
 
 private:
-  void Prepare(const std::string& path);
+  using Key = std::pair<std::string, std::string>; ///< master and mount point
 
-  db::DB database_;
+  void Open();
+  void Read(const std::string& path);
+  void Save();
+
+  const std::string directory_;
+  db::DB database_; ///< closed while it cannot be used
+  std::map<Key, Catalog> catalogs_;
+  std::set<Key> unsaved_;
+  bool hasFailed_ = false;
 };
 
 } // namespace orva::indexer

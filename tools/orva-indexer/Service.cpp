@@ -1,12 +1,12 @@
 #include "Service.h"
 
-#include "Log.h"
-#include "StatusFile.h"
-
 #include "orva-notify/Descriptors.h"
 #include "orva-notify/MountInfo.h"
 #include "orvautil/Exception.h"
 #include "orvautil/Path.h"
+#include "service/Log.h"
+
+#include <nlohmann/json.hpp>
 
 #include <fcntl.h>
 #include <poll.h>
@@ -28,11 +28,13 @@ namespace {
 using namespace std::chrono_literals;
 using catalog::VolumeRoot;
 using notify::Event;
+using service::LogInfo;
+using service::Printable;
 using Notice = notifications::Notification::Event;
 
 constexpr auto INPUT_INTERVAL = 100ms;
-constexpr auto STATUS_INTERVAL = 1s;
 constexpr auto ANNOUNCE_RETRY = 30s;
+constexpr auto MASTER_QUIET = 2s;
 
 /// A master at /shares itself is no volume.
 constexpr char SHARES[] = "/shares";
@@ -57,7 +59,8 @@ Service::Service(Settings settings)
       observer_(settings_.notificationSocket),
       announcer_(settings_.notificationSocket,
                  [this](const Announcer::Announcement& announcement,
-                        std::optional<std::size_t> clients) { Announced(announcement, clients); }) {
+                        std::optional<std::size_t> clients) { Announced(announcement, clients); }),
+      status_(settings_.runtimeDirectory) {
   std::error_code ignored;
   std::filesystem::create_directories(settings_.runtimeDirectory, ignored);
 }
@@ -89,16 +92,13 @@ void Service::Wait() {
   add(observer_.Descriptor(), POLLIN);
   add(announcer_.Descriptor(), announcer_.Events());
   add(locator_.Descriptor(), POLLIN);
-  auto next = announceAgain_;
+  auto next = std::min({announceAgain_, checkPurges_, statusDue_});
   for (const auto& [mountPoint, known] : volumes_) {
     next = std::min(next, known->volume.NextWork());
     add(known->volume.Descriptor(now), POLLIN);
     if (descriptors.back().fd == -1) {
       next = std::min(next, known->volume.NextEvents());
     }
-  }
-  if (isStatusDue_) {
-    next = std::min(next, statusWritten_ + STATUS_INTERVAL);
   }
   int timeout = -1;
   if (next != Clock::time_point::max()) {
@@ -153,6 +153,9 @@ void Service::HandleNotifications() {
     Handle(notification);
   }
   if (locator_.HasChanged()) {
+    CheckPurgesSoon();
+  }
+  if (Clock::now() >= checkPurges_) {
     CheckPurges();
   }
   if (Clock::now() >= announceAgain_) {
@@ -197,14 +200,12 @@ void Service::Plug(const std::string& mountPoint, bool isDirectory) {
   LogInfo("Volume " + Printable(mountPoint) + ": walking");
   const auto known = volumes_.emplace(mountPoint, std::make_unique<Known>(mountPoint, kind)).first;
   known->second->volume.HandleMounts(ReadMountPoints());
-  isStatusDue_ = true;
 }
 
 void Service::Forget(const std::string& mountPoint) {
   if (volumes_.erase(mountPoint) > 0) {
     LogInfo("Volume " + Printable(mountPoint) + ": gone");
     announcer_.Forget(util::Path(mountPoint).Basic());
-    isStatusDue_ = true;
   }
 }
 
@@ -227,7 +228,6 @@ void Service::WorkOnNext() {
   working_ = &known;
   const Volume::Result result = known.volume.Work([this] { Pulse(); }, LatestStamp());
   working_ = nullptr;
-  isStatusDue_ = true;
   if (result.isGone) {
     Forget(lastWorked_);
   } else {
@@ -250,7 +250,7 @@ void Service::AnnounceResult(Known& known, const Volume::Result& result) {
   if (result.isFirstWalk) {
     known.hasChanged = false;
     AnnounceScanned(known);
-    CheckPurges(); // if this is the master, it is known only now
+    CheckPurgesSoon(); // if this is the master, it is known only now
   } else if (known.isScanned) {
     AnnounceChanges(known);
   }
@@ -334,8 +334,14 @@ void Service::Announced(const Announcer::Announcement& announcement,
   }
 }
 
-/// The master has changed, or its identity has become known.
+/// The master has changed, or its identity has become known. A daemon that starts has several
+/// masters one after the other, until it knows all volumes.
+void Service::CheckPurgesSoon() {
+  checkPurges_ = Clock::now() + MASTER_QUIET;
+}
+
 void Service::CheckPurges() {
+  checkPurges_ = Clock::time_point::max();
   const auto master = Master();
   for (const auto& [mountPoint, known] : volumes_) {
     if (master && known->isScanned && known->volume.IsWalked() && known->purgedFor != *master &&
@@ -362,21 +368,10 @@ bool Service::IsPurgeOwed(const Known& known, const std::string& master) const {
          remembered->newestStamp > known.volume.NewestStamp();
 }
 
-/// If that fails, the volume is announced as purged again, which is always right.
 void Service::Remember(const Known& known, const std::string& master) {
-  try {
-    const RememberedCatalogs::Catalog now{.identity = known.volume.Identity(),
-                                          .newestStamp = known.volume.NewestStamp()};
-    const auto before = remembered_.Find(master, known.volume.MountPoint());
-    if (!before || before->identity != now.identity || before->newestStamp != now.newestStamp) {
-      remembered_.Store(master, known.volume.MountPoint(), now);
-    }
-    isStateFailureLogged_ = false;
-  } catch (const std::string& failure) {
-    if (!std::exchange(isStateFailureLogged_, true)) {
-      LogError("Cannot write to " + settings_.stateDirectory + ": " + Printable(failure));
-    }
-  }
+  remembered_.Store(
+      master, known.volume.MountPoint(),
+      {.identity = known.volume.Identity(), .newestStamp = known.volume.NewestStamp()});
 }
 
 /// The identity of the catalog on the master volume; nothing while that is not known.
@@ -397,21 +392,17 @@ std::optional<std::string> Service::Master() const {
 // --- Status ------------------------------------------------------------------------------------
 
 void Service::PublishStatus() {
-  const auto now = Clock::now();
-  const bool isIdle = working_ == nullptr && std::ranges::all_of(volumes_, [](const auto& entry) {
-                        return entry.second->volume.IsIdle();
-                      });
-  if (!(isStatusDue_ || working_ != nullptr) ||
-      (now - statusWritten_ < STATUS_INTERVAL && !isIdle)) {
-    return;
-  }
-  std::vector<VolumeStatus> status;
+  nlohmann::ordered_json list = nlohmann::ordered_json::array();
+  bool isBusy = working_ != nullptr;
   for (const auto& [mountPoint, known] : volumes_) {
-    status.push_back(known->volume.Status());
+    const VolumeStatus status = known->volume.Status();
+    list.push_back({{"mountPoint", status.mountPoint},
+                    {"state", status.state},
+                    {"foldersWaiting", status.foldersWaiting},
+                    {"files", status.files}});
+    isBusy = isBusy || !known->volume.IsIdle();
   }
-  WriteStatus(settings_.runtimeDirectory, status);
-  statusWritten_ = now;
-  isStatusDue_ = false;
+  statusDue_ = status_.Update(list, isBusy).value_or(Clock::time_point::max());
 }
 
 } // namespace orva::indexer

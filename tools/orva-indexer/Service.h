@@ -7,6 +7,7 @@
 
 #include "notifications/Observer.h"
 #include "orvautil/FileDescriptor.h"
+#include "service/StatusFile.h"
 
 #include <chrono>
 #include <map>
@@ -61,6 +62,7 @@ private:
   void AnnounceScanned(Known& known);
   void Announce(Known& known, notify::Event event, bool handled = false);
   void Announced(const Announcer::Announcement& announcement, std::optional<std::size_t> clients);
+  void CheckPurgesSoon();
   void CheckPurges();
   void PurgeOrEnd(Known& known);
   bool IsPurgeOwed(const Known& known, const std::string& master) const;
@@ -83,10 +85,9 @@ private:
   bool isStopped_ = false;
   Clock::time_point inputRead_{};
   Clock::time_point announceAgain_ = Clock::time_point::max();
-  Clock::time_point statusWritten_{};
-  std::string status_; ///< what was published last
-  bool isStatusDue_ = true;
-  bool isStateFailureLogged_ = false;
+  Clock::time_point checkPurges_ = Clock::time_point::max();
+  service::StatusFile status_;
+  Clock::time_point statusDue_ = Clock::time_point::max(); ///< when it is too early to write it
 };
 
 } // namespace orva::indexer

@@ -1,7 +1,5 @@
 #include "Volume.h"
 
-#include "Log.h"
-
 #include "CatalogSchema.h"
 #include "Sql.h"
 
@@ -12,6 +10,7 @@
 #include "orvautil/Exception.h"
 #include "orvautil/FormatString.h"
 #include "orvautil/Path.h"
+#include "service/Log.h"
 
 #include <sys/inotify.h>
 #include <sys/stat.h>
@@ -31,6 +30,9 @@ using namespace std::chrono_literals;
 using catalog::CatalogProblem;
 using catalog::FolderIndexer;
 using catalog::VolumeRoot;
+using service::LogError;
+using service::LogInfo;
+using service::Printable;
 using util::FormatString;
 
 /// A folder is walked when it was quiet for QUIET, or LATEST after its first event.
@@ -418,6 +420,7 @@ void Volume::WalkNext(FolderIndexer& indexer) {
   }
   folder->revived = task.revived;
   const long long rows = indexer.Summary().rows;
+  hasOtherAccess_ = false;
   std::vector<Folder> inside = indexer.Update(*folder);
   if (isWalkingAll_) {
     walkedFolders_ += static_cast<long long>(inside.size());
@@ -426,7 +429,7 @@ void Volume::WalkNext(FolderIndexer& indexer) {
   std::ranges::reverse(inside); // the first one is next
   for (Folder& next : inside) {
     const bool isUnknown = watches_ && !watches_->Has(next.path);
-    if (task.recursive || isUnknown) {
+    if (task.recursive || isUnknown || hasOtherAccess_) {
       ready_.push_back({.path = std::move(next.path), .recursive = true, .revived = next.revived});
     }
   }
@@ -454,6 +457,8 @@ void Volume::Opened(const Folder& folder, int descriptor) {
   if (watches_ && !watches_->Add(folder.path, descriptor)) {
     GiveUpWatches(errno);
   }
+  // Who may read the photos below depends on it.
+  hasOtherAccess_ = watches_ && watches_->HasOtherAccess(folder.path, descriptor);
 }
 
 void Volume::GiveUpWatches(int error) {

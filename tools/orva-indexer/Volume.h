@@ -1,7 +1,6 @@
 #pragma once
 
 #include "FolderWatches.h"
-#include "StatusFile.h"
 
 #include "FolderIndexer.h"
 #include "UntrustedCatalog.h"
@@ -10,6 +9,7 @@
 #include <sys/types.h>
 
 #include <chrono>
+#include <cstddef>
 #include <ctime>
 #include <functional>
 #include <map>
@@ -23,6 +23,14 @@
 namespace orva::indexer {
 
 using Clock = std::chrono::steady_clock;
+
+/// What the indexer does with a volume.
+struct VolumeStatus {
+  std::string mountPoint; ///< ends in "/"
+  const char* state = ""; ///< "walking", "watching", "timed", "read-only" or "unusable"
+  std::size_t foldersWaiting = 0;
+  long long files = 0;
+};
 
 /// One volume: the folders that wait to be walked, the watches that add to them, and the work on
 /// its catalog. Nothing of the volume is open between two calls. On the program's thread.
@@ -153,6 +161,7 @@ private:
   Clock::time_point notBefore_{}; ///< no work earlier
   Clock::time_point nextWalk_{};  ///< of all folders, where they are not watched
   bool isStampWanted_ = false;
+  bool hasOtherAccess_ = false; ///< the folder that is walked lets other users pass than before
 
   dev_t device_ = 0; ///< of the root, as it was walked
   ino_t inode_ = 0;

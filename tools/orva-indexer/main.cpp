@@ -1,9 +1,9 @@
-#include "Log.h"
 #include "Service.h"
 
 #include "commandline/Parse.h"
 #include "commandline/UsageError.h"
 #include "orvautil/Core.h"
+#include "service/Log.h"
 
 #include <sys/resource.h>
 #include <sys/stat.h>
@@ -65,10 +65,10 @@ int main(int count, char* arguments[]) {
     commandline::Report(error);
     return commandline::EXIT_USAGE;
   } catch (const std::exception& error) {
-    indexer::LogError(error.what());
+    service::LogError(error.what());
     std::cerr << "orva-indexer: " << error.what() << '\n';
   } catch (const std::string& error) { // the database layer's
-    indexer::LogError(error);
+    service::LogError(error);
     std::cerr << "orva-indexer: " << error << '\n';
   }
   return 1;

@@ -1,10 +1,10 @@
 #include "Renderer.h"
 
-#include "Log.h"
 #include "Sandbox.h"
 
 #include "orvautil/Exception.h"
 #include "orvautil/FormatString.h"
+#include "service/Log.h"
 
 #include <sys/stat.h>
 #include <unistd.h>
@@ -114,7 +114,8 @@ std::string LastMessage(std::string_view error) {
     TakeText(last, program);
   }
   static const std::regex COPY("\"?/in/[0-9]+\"?");
-  return Printable(std::regex_replace(std::string(last.substr(0, 1000)), COPY, "the file"));
+  return service::Printable(
+      std::regex_replace(std::string(last.substr(0, 1000)), COPY, "the file"));
 }
 
 bool Contains(std::string_view text, std::string_view part) {

@@ -1,16 +1,17 @@
 #include "Transcoder.h"
 
-#include "Log.h"
 #include "Renderer.h"
 
 #include "orva-notify/Control.h"
 #include "orva-notify/Notification.h"
 #include "orvautil/Core.h"
 #include "orvautil/Exception.h"
+#include "service/Log.h"
+
+#include <nlohmann/json.hpp>
 
 #include <poll.h>
 #include <sys/eventfd.h>
-#include <syslog.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -44,7 +45,7 @@ Transcoder::Transcoder(const std::string& directory)
     : staging_(directory + "/staging"),
       processors_(std::max(std::thread::hardware_concurrency(), 1U)),
       wake_(eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)), observer_(core::ORVA_NOTIFICATION_SOCKET),
-      status_(directory + "/status.json"), processor_(static_cast<std::ptrdiff_t>(processors_)) {
+      status_(directory), processor_(static_cast<std::ptrdiff_t>(processors_)) {
   if (!wake_) {
     throw util::Exception("no eventfd: " + std::generic_category().message(errno));
   }
@@ -121,7 +122,7 @@ bool Transcoder::StoreBatch(Running& running) {
   if (!batch.error.empty()) {
     if (batch.error != error_) {
       error_ = batch.error;
-      Log(LOG_ERR, Printable(error_));
+      service::LogError(service::Printable(error_));
     }
     pausedUntil_ = Clock::now() + ERROR_PAUSE;
     return true;
@@ -328,14 +329,16 @@ bool Transcoder::Send(const std::string& message) {
 }
 
 void Transcoder::UpdateStatus() {
-  std::vector<VolumeStatus> volumes;
+  nlohmann::ordered_json volumes = nlohmann::ordered_json::array();
+  bool isBusy = false;
   for (const auto& [mountPoint, known] : volumes_) {
-    volumes.push_back({.mountPoint = mountPoint,
-                       .waiting = known.volume.Waiting(),
-                       .failed = known.volume.Failed(),
-                       .isRendering = IsRendering(mountPoint)});
+    volumes.push_back({{"mountPoint", mountPoint},
+                       {"waiting", known.volume.Waiting()},
+                       {"failed", known.volume.Failed()},
+                       {"rendering", IsRendering(mountPoint)}});
+    isBusy = isBusy || IsRendering(mountPoint);
   }
-  if (const auto time = status_.Update(volumes)) {
+  if (const auto time = status_.Update(volumes, isBusy)) {
     WakeAt(*time);
   }
 }

@@ -1,11 +1,11 @@
 #pragma once
 
 #include "Batch.h"
-#include "StatusFile.h"
 #include "Volume.h"
 
 #include "notifications/Observer.h"
 #include "orvautil/FileDescriptor.h"
+#include "service/StatusFile.h"
 
 #include <chrono>
 #include <cstddef>
@@ -82,7 +82,7 @@ private:
   const std::size_t processors_;
   util::FileDescriptor wake_; ///< an eventfd: a batch was rendered
   notifications::Observer observer_;
-  StatusFile status_;
+  service::StatusFile status_;
   std::map<std::string, Known> volumes_; ///< by mount point
   std::string lastStaged_;               ///< mount point
   unsigned long long batches_ = 0;       ///< so far

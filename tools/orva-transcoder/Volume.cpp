@@ -1,12 +1,12 @@
 #include "Volume.h"
 
-#include "Log.h"
 #include "Renderer.h"
 #include "RenditionFiles.h"
 
 #include "CatalogSchema.h"
 #include "CatalogWriter.h"
 #include "Classification.h"
+#include "RenditionAccess.h"
 
 #include "orvadb/Transaction.h"
 #include "orvadb/VolumeDB.h"
@@ -14,12 +14,12 @@
 #include "orvautil/Core.h"
 #include "orvautil/Exception.h"
 #include "orvautil/FileDescriptor.h"
+#include "service/Log.h"
 
 #include <fcntl.h>
 #include <sys/sendfile.h>
 #include <sys/stat.h>
 #include <sys/statvfs.h>
-#include <syslog.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -37,6 +37,8 @@ namespace {
 using catalog::RENDITIONS_PER_FOLDER;
 using catalog::VolumeRoot;
 using catalog::WaitingPhoto;
+using service::LogError;
+using service::Printable;
 
 constexpr std::size_t MOST_LISTED = 50;       // waiting photos in one query
 constexpr std::size_t MOST_EXAMINED = 1000;   // photos in one piece of work
@@ -54,6 +56,12 @@ std::string ErrorText(int error) {
 /// The volume's path on which it was mounted, without the separator at its end.
 std::string PathOf(const std::string& mountPoint) {
   return mountPoint.substr(0, std::max<std::size_t>(mountPoint.size() - 1, 1));
+}
+
+/// The path of the folder that contains the file at `path`; empty for the root.
+std::string FolderOf(const std::string& path) {
+  const auto end = path.rfind('/');
+  return end == std::string::npos ? std::string() : path.substr(0, end);
 }
 
 bool IsBusy(std::string_view failure) {
@@ -87,26 +95,6 @@ bool IsRaw(const std::string& path, const util::FileDescriptor& file) {
   }
   const std::string_view begin(bytes.data(), bytes.size());
   return begin.starts_with("II") || begin.starts_with("MM") || begin.starts_with("FUJI");
-}
-
-/// Who may read the photo at `path`: of its mode what allows reading, as far as the folders on the
-/// way let the same users pass.
-mode_t ReadersOf(const VolumeRoot& root, const std::string& path, const struct stat& photo) {
-  mode_t mode = photo.st_mode & (S_IRUSR | S_IRGRP | S_IROTH);
-  for (auto end = path.find('/'); end != std::string::npos; end = path.find('/', end + 1)) {
-    const util::FileDescriptor folder = root.Open(path.substr(0, end), O_PATH | O_DIRECTORY);
-    struct stat status {};
-    if (!folder || fstat(folder.Get(), &status) != 0) {
-      return mode & S_IRUSR;
-    }
-    if ((status.st_mode & S_IXOTH) == 0) {
-      mode &= ~static_cast<mode_t>(S_IROTH);
-      if ((status.st_mode & S_IXGRP) == 0 || status.st_gid != photo.st_gid) {
-        mode &= ~static_cast<mode_t>(S_IRGRP);
-      }
-    }
-  }
-  return mode;
 }
 
 /// Copies `size` bytes. Returns 0 or an errno; EAGAIN if there are not exactly so many.
@@ -181,7 +169,7 @@ void Volume::Report(const std::string& problem) {
   lookAgainAt_ = Clock::now() + (isBusy_ ? std::chrono::seconds(1) : RETRY);
   if (!isBusy_ && problem != problem_) {
     problem_ = problem;
-    Log(LOG_ERR, Printable(problem));
+    LogError(Printable(problem));
   }
 }
 
@@ -315,7 +303,7 @@ bool Volume::StagePhoto(const Opened& volume, const WaitingPhoto& photo, Batch& 
   case ENOSPC: {
     const bool isAlone = room.used == 0;
     if (isAlone) {
-      Log(LOG_ERR, "no space in memory to copy " + Printable(mountPoint_ + photo.path));
+      LogError("no space in memory to copy " + Printable(mountPoint_ + photo.path));
     }
     return isAlone;
   }
@@ -358,7 +346,8 @@ std::set<long long> Volume::WriteRenditions(const Opened& volume, Batch& batch) 
     const util::FileDescriptor rendition = batch.folder.OpenOutput(number);
     if (IsRendition(rendition)) {
       writer.Add(photo.photo.id, rendition, status,
-                 ReadersOf(volume.root, photo.photo.path, status));
+                 catalog::RenditionAccess(volume.root, FolderOf(photo.photo.path))
+                     .ModeFor(status.st_mode, status.st_gid));
       written.insert(photo.photo.id);
     }
   }
@@ -459,7 +448,7 @@ void Volume::RemoveOtherFolders(const Opened& volume, const IsInBatch& isInBatch
 void Volume::ReportObstacle(const std::string& text) {
   if (!hasReportedObstacle_) {
     hasReportedObstacle_ = true;
-    Log(LOG_ERR, Printable(mountPoint_ + text));
+    LogError(Printable(mountPoint_ + text));
   }
 }
 

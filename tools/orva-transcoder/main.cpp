@@ -1,10 +1,8 @@
-#include "Log.h"
 #include "Transcoder.h"
 
 #include "commandline/Parse.h"
 #include "commandline/UsageError.h"
-
-#include <syslog.h>
+#include "service/Log.h"
 
 #include <csignal>
 #include <cstdlib>
@@ -46,7 +44,7 @@ int main(int count, char* arguments[]) {
     commandline::Report(error);
     return commandline::EXIT_USAGE;
   } catch (const std::exception& error) {
-    transcoder::Log(LOG_ERR, error.what());
+    service::LogError(error.what());
     std::cerr << "orva-transcoder: " << error.what() << '\n';
     return EXIT_FAILURE;
   }

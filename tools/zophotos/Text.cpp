@@ -212,8 +212,4 @@ std::optional<std::string> IsoTime(std::int64_t seconds) {
   return year.data() + Format("-%m-%dT%H:%M:%SZ", fields);
 }
 
-std::string Count(std::int64_t number, const std::string& noun) {
-  return std::to_string(number) + " " + noun + (number == 1 ? "" : "s");
-}
-
 } // namespace orva::zophotos

@@ -1,5 +1,7 @@
 #pragma once
 
+#include "commandline/Count.h"
+
 #include <cstddef>
 #include <cstdint>
 #include <optional>
@@ -7,6 +9,8 @@
 #include <string_view>
 
 namespace orva::zophotos {
+
+using commandline::Count;
 
 /// Makes the C library handle all Unicode characters, independent of the user's locale.
 void UseUtf8();
@@ -47,8 +51,5 @@ std::string LocalTime(std::int64_t seconds);
 
 /// "2026-11-21T08:15:00Z", for programs; nothing outside the years 1 to 9999.
 std::optional<std::string> IsoTime(std::int64_t seconds);
-
-/// "1 file", "2 files".
-std::string Count(std::int64_t number, const std::string& noun);
 
 } // namespace orva::zophotos
