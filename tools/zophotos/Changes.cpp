@@ -184,10 +184,10 @@ void PrintFeed(PhotoListReader* delivered, PhotoListReader& pending, ExportForma
   PrintEnd(feed, rows, pending.Photos(), format);
 }
 
-/// Waits until standard output has everything, and the disk, if it is a file.
-void FinishOutput() {
+/// Waits until the disk has standard output, if that is a file.
+void SynchroniseOutput() {
   struct stat status {};
-  if (!std::cout.flush() || fstat(STDOUT_FILENO, &status) != 0 ||
+  if (fstat(STDOUT_FILENO, &status) != 0 ||
       (S_ISREG(status.st_mode) && fsync(STDOUT_FILENO) != 0)) {
     throw Failure(ExitStatus::Failed, "cannot write to standard output");
   }
@@ -210,7 +210,10 @@ ExitStatus ExportChanges(const std::string& path, const Changes& changes, Export
     throw Failure(ExitStatus::Failed, changes.state + ".next was changed by another program");
   }
   PrintFeed(delivered ? &*delivered : nullptr, *pending, format, escapes);
-  FinishOutput();
+  if (!std::cout.flush()) {
+    return ExitStatus::Failed; // reported when the program ends
+  }
+  SynchroniseOutput();
   state.Deliver(*pending);
   return ExitStatus::Success;
 }

@@ -151,7 +151,7 @@ void Walk(SQLite::Database& copy, const std::function<void(const Item&)>& visit)
 
 void WalkPhotos(SQLite::Database& copy, const std::function<void(const Photo&)>& visit) {
   // The default of 2 MiB makes SQLite sort in many small parts.
-  copy.exec("PRAGMA cache_size = -16384");
+  copy.exec("PRAGMA cache_size = -8192");
   // Results of || are texts, which are sorted by their bytes.
   SQLite::Statement query(
       copy,
