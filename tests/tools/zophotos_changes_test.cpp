@@ -526,6 +526,16 @@ TEST_F(ZophotosChanges, ReaderThatEndsEarlyGetsTheFeedAgain) {
   EXPECT_THAT(line, HasSubstr(Feed().id));
 }
 
+TEST_F(ZophotosChanges, FeedIsNotWrittenIntoItsFilesIfTheOutputIsClosed) {
+  Arguments command{"sh", "-c", "exec \"$@\" <&- >&-", "sh"};
+  for (const std::string& argument :
+       ZophotosCommand(OnCopyArguments({"export", "--changes", STATE}))) {
+    command.push_back(argument);
+  }
+  ExpectFailure(test::Run(command), 5, "cannot write to standard output");
+  EXPECT_FALSE(fs::exists(STATE));
+}
+
 TEST_F(ZophotosChanges, SecondExportWithTheSameStateIsRefused) {
   AddFiles(Database(COPY), 20'000, "1", "'name' || i");
   Program first(ZophotosCommand(OnCopyArguments({"export", "--changes", STATE})));
@@ -627,12 +637,14 @@ TEST_F(ZophotosChanges, StateTakesAtMostFortyBytesPerPhoto) {
     copy.Run("DELETE FROM Files");
     AddFiles(copy, photos, "1", name);
     copy.Run("UPDATE Files SET modified_date = abs(random()) % 500000000");
+    copy.Run("UPDATE Files SET created_date = modified_date"); // as the daemon does
   };
-  // Names as cameras, people and synchronization programs make them.
+  // Names as cameras, people and synchronization programs make them, and SHA-256 hashes.
   for (const char* const name :
        {"'IMG_' || i || '.JPG'", "'Summer holiday in the mountains with friends, ' || i || '.jpg'",
         "lower(hex(randomblob(4)) || '-' || hex(randomblob(2)) || '-' || hex(randomblob(2)) || '-' "
-        "|| hex(randomblob(2)) || '-' || hex(randomblob(6))) || '.jpg'"}) {
+        "|| hex(randomblob(2)) || '-' || hex(randomblob(6))) || '.jpg'",
+        "lower(hex(randomblob(32))) || '.jpg'"}) {
     replaceFiles(name);
     Feed();
     EXPECT_LE(fs::file_size(STATE), 40 * photos) << name;
