@@ -20,14 +20,14 @@ namespace {
 /// The beginning of each file. Its last character is the version of the format.
 constexpr std::string_view MAGIC = "zophotos feed 1\n";
 /// Magic, flags, number, id, previous, time, database.
-constexpr std::size_t HEADER_SIZE = MAGIC.size() + 8 + 8 + 16 + 16 + 8 + 3 * 8;
+constexpr std::size_t HEADER_SIZE = MAGIC.size() + 8 + 8 + 16 + 16 + 8 + 8 + 8 + 8;
 /// Number of photos, checksum.
 constexpr std::size_t TRAILER_SIZE = 8 + 4;
 constexpr std::size_t CHECKSUM_SIZE = 4;
 /// The photos are in blocks of two parts, the numbers and the texts. Two sizes are before each
 /// part: its own, and that of its bytes in the file. They are compressed if the second one is
 /// smaller.
-constexpr std::size_t PART_HEADER_SIZE = 2 * 8;
+constexpr std::size_t PART_HEADER_SIZE = 8 + 8;
 /// A block ends with the photo that reaches this size.
 constexpr std::size_t BLOCK_SIZE = 65536;
 
@@ -86,13 +86,13 @@ void PutDifference(std::string& bytes, std::int64_t time, std::int64_t from) {
 }
 
 std::size_t CommonPrefix(std::string_view a, std::string_view b) {
-  const auto end = std::mismatch(a.begin(), a.end(), b.begin(), b.end()).first;
-  return static_cast<std::size_t>(end - a.begin());
+  return static_cast<std::size_t>(std::mismatch(a.begin(), a.end(), b.begin(), b.end()).first -
+                                  a.begin());
 }
 
 std::size_t CommonSuffix(std::string_view a, std::string_view b) {
-  const auto end = std::mismatch(a.rbegin(), a.rend(), b.rbegin(), b.rend()).first;
-  return static_cast<std::size_t>(end - a.rbegin());
+  return static_cast<std::size_t>(std::mismatch(a.rbegin(), a.rend(), b.rbegin(), b.rend()).first -
+                                  a.rbegin());
 }
 
 std::string HeaderBytes(const Feed& feed) {
