@@ -21,8 +21,8 @@ bool IsAddressCharacter(char c) {
 }
 
 bool IsPort(std::string_view text) {
-  return text.empty() ||
-         (text.starts_with(':') && text.size() <= 6 && std::ranges::all_of(text.substr(1), IsDigit));
+  return text.empty() || (text.starts_with(':') && text.size() <= 6 &&
+                          std::ranges::all_of(text.substr(1), IsDigit));
 }
 
 std::string LowerCase(std::string_view text) {
@@ -38,14 +38,13 @@ std::string LowerCase(std::string_view text) {
 std::string HostName(std::string_view header) {
   const std::string text = LowerCase(header);
   const bool isBracketed = text.starts_with('[');
-  const std::size_t end =
-      isBracketed ? text.find(']') : std::min(text.find(':'), text.size());
-  if (end == std::string::npos || !IsPort(std::string_view(text).substr(end + (isBracketed ? 1 : 0)))) {
+  const std::size_t end = isBracketed ? text.find(']') : std::min(text.find(':'), text.size());
+  if (end == std::string::npos ||
+      !IsPort(std::string_view(text).substr(end + (isBracketed ? 1 : 0)))) {
     return {};
   }
   const std::string name = isBracketed ? text.substr(1, end - 1) : text.substr(0, end);
-  return std::ranges::all_of(name, isBracketed ? IsAddressCharacter : IsHostCharacter) ? name
-                                                                                       : "";
+  return std::ranges::all_of(name, isBracketed ? IsAddressCharacter : IsHostCharacter) ? name : "";
 }
 
 AllowedHosts::AllowedHosts(const std::vector<std::string>& names)

@@ -12,8 +12,8 @@ namespace orva::web {
 /// header. Const operations may run in any thread.
 class AllowedHosts {
 public:
-  /// The names of the loopback, and `names`: host names or addresses without a port. An IPv6 address
-  /// has brackets or not.
+  /// The names of the loopback, and `names`: host names or addresses without a port. An IPv6
+  /// address has brackets or not.
   explicit AllowedHosts(const std::vector<std::string>& names);
 
   /// Whether the Host header `header` names this server, with any port.
@@ -27,8 +27,8 @@ private:
   std::set<std::string> names_; ///< in lower case
 };
 
-/// The host in a Host header, in lower case and without the port and brackets; empty for a malformed
-/// one.
+/// The host in a Host header, in lower case and without the port and brackets; empty for a
+/// malformed one.
 std::string HostName(std::string_view header);
 
 } // namespace orva::web

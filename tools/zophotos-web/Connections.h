@@ -30,7 +30,10 @@ public:
     /// A response of `size` bytes is sent.
     void SendResponse(std::uint64_t size);
     /// Events are sent, for any time.
-    void SendEvents() { isWaiting_ = false; deadline_ = Clock::time_point::max(); }
+    void SendEvents() {
+      isWaiting_ = false;
+      deadline_ = Clock::time_point::max();
+    }
 
     int Socket() const noexcept { return socket_; }
 
@@ -42,7 +45,8 @@ public:
     std::atomic<Clock::time_point> deadline_{};
   };
 
-  /// From `crowd` connections on, a new one displaces the one that has waited longest for a request.
+  /// From `crowd` connections on, a new one displaces the one that has waited longest for a
+  /// request.
   explicit Connections(std::size_t crowd) : crowd_(crowd) {}
 
   /// The connection at `socket`, until it is removed. Its socket stays open until then.

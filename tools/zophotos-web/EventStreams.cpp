@@ -39,10 +39,12 @@ MHD_Response* EventStreams::Open(MHD_Connection* connection) {
   if (isClosed_ || streams_.size() >= MOST) {
     return nullptr;
   }
-  streams_.push_back(
-      {.all = *this, .connection = connection, .unsent = "retry: 3000\n\n", .sentActivity = activity_});
-  MHD_Response* const response = MHD_create_response_from_callback(MHD_SIZE_UNKNOWN, BLOCK, &Read,
-                                                                   &streams_.back(), &Free);
+  streams_.push_back({.all = *this,
+                      .connection = connection,
+                      .unsent = "retry: 3000\n\n",
+                      .sentActivity = activity_});
+  MHD_Response* const response =
+      MHD_create_response_from_callback(MHD_SIZE_UNKNOWN, BLOCK, &Read, &streams_.back(), &Free);
   if (response == nullptr) {
     streams_.pop_back();
   }

@@ -78,8 +78,8 @@ std::string_view Trim(std::string_view text) {
 } // namespace
 
 const std::string* Target::Find(std::string_view name) const {
-  const auto found = std::ranges::find(parameters, name,
-                                       [](const auto& parameter) { return parameter.first; });
+  const auto found =
+      std::ranges::find(parameters, name, [](const auto& parameter) { return parameter.first; });
   return found == parameters.end() ? nullptr : &found->second;
 }
 

@@ -20,8 +20,8 @@ namespace {
 constexpr std::size_t CONNECTION_MEMORY = 16 << 10; // bytes: bounds the headers of a request
 constexpr unsigned SILENCE = 30;                    // seconds
 
-/// What all responses have. Nothing may be loaded from elsewhere, and no other site may show or read
-/// what we send.
+/// What all responses have. Nothing may be loaded from elsewhere, and no other site may show or
+/// read what we send.
 constexpr std::array<std::pair<const char*, const char*>, 7> SECURITY{
     {{"Content-Security-Policy", "default-src 'self'; object-src 'none'; base-uri 'none'; "
                                  "form-action 'self'; frame-ancestors 'none'"},
@@ -39,7 +39,7 @@ using MhdResponse = std::unique_ptr<MHD_Response, ResponseReleaser>;
 
 /// A request, from its first line until the response is sent.
 struct Exchange {
-  std::string text; ///< the target as it was sent
+  std::string text;                 ///< the target as it was sent
   std::optional<Request> request{}; ///< nothing until it is checked
 };
 
@@ -138,7 +138,8 @@ void RunClock(const std::stop_token& stop, const std::function<void()>& tick) {
   std::mutex mutex;
   std::unique_lock lock(mutex);
   std::condition_variable_any changed;
-  while (!changed.wait_for(lock, stop, std::chrono::seconds(1), [&] { return stop.stop_requested(); })) {
+  while (!changed.wait_for(lock, stop, std::chrono::seconds(1),
+                           [&] { return stop.stop_requested(); })) {
     tick();
   }
 }
@@ -175,7 +176,8 @@ std::optional<Refusal> Check(const Headers& headers, const AllowedHosts& hosts, 
 } // namespace
 
 struct Server::Calls {
-  static void* Begin(void* /*server*/, const char* target, MHD_Connection* /*connection*/) noexcept {
+  static void* Begin(void* /*server*/, const char* target,
+                     MHD_Connection* /*connection*/) noexcept {
     try {
       return std::make_unique<Exchange>(Exchange{.text = target}).release(); // until End
     } catch (const std::bad_alloc&) {
@@ -316,11 +318,11 @@ Server::Server(util::FileDescriptor listener, AllowedHosts hosts, Handlers handl
       {MHD_OPTION_STRICT_FOR_CLIENT, 1, nullptr},
       {MHD_OPTION_SIGPIPE_HANDLED_BY_APP, 1, nullptr},
       {MHD_OPTION_END, 0, nullptr}};
-  daemon_ = MHD_start_daemon(
-      MHD_USE_EPOLL_INTERNAL_THREAD | MHD_USE_SUSPEND_RESUME, 0, nullptr, nullptr, &Calls::Handle,
-      this, MHD_OPTION_ARRAY, options.data(), MHD_OPTION_URI_LOG_CALLBACK, &Calls::Begin, this,
-      MHD_OPTION_NOTIFY_COMPLETED, &Calls::End, this, MHD_OPTION_NOTIFY_CONNECTION, &Calls::Notify,
-      this, MHD_OPTION_END);
+  daemon_ = MHD_start_daemon(MHD_USE_EPOLL_INTERNAL_THREAD | MHD_USE_SUSPEND_RESUME, 0, nullptr,
+                             nullptr, &Calls::Handle, this, MHD_OPTION_ARRAY, options.data(),
+                             MHD_OPTION_URI_LOG_CALLBACK, &Calls::Begin, this,
+                             MHD_OPTION_NOTIFY_COMPLETED, &Calls::End, this,
+                             MHD_OPTION_NOTIFY_CONNECTION, &Calls::Notify, this, MHD_OPTION_END);
   if (daemon_ == nullptr) {
     throw std::runtime_error("cannot start the HTTP server");
   }

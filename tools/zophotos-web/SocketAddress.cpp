@@ -129,8 +129,7 @@ util::FileDescriptor SocketAddress::Listen() const {
   util::FileDescriptor listener(
       socket(address_.ss_family, SOCK_STREAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0));
   const int on = 1;
-  if (!listener ||
-      setsockopt(listener.Get(), SOL_SOCKET, SO_REUSEADDR, &on, sizeof on) != 0 ||
+  if (!listener || setsockopt(listener.Get(), SOL_SOCKET, SO_REUSEADDR, &on, sizeof on) != 0 ||
       bind(listener.Get(), reinterpret_cast<const sockaddr*>(&address_), size_) != 0 ||
       listen(listener.Get(), SOMAXCONN) != 0) {
     ThrowError("cannot listen on " + Url());

@@ -39,22 +39,25 @@ std::optional<VolumeRoot> OpenRoot(const std::string& path) {
 }
 
 std::optional<VolumeFile> Open(const VolumeRoot& volume, const std::string& path) {
-  VolumeFile result{.file = volume.Open(path, O_RDONLY)};
+  VolumeFile result;
+  result.file = volume.Open(path, O_RDONLY);
   struct stat status {};
   if (!result.file || fstat(result.file.Get(), &status) != 0 || !S_ISREG(status.st_mode)) {
     return std::nullopt;
   }
   result.size = static_cast<std::uint64_t>(status.st_size);
-  result.tag = util::FormatString("\"%llx-%llx-%llx.%lx\"",
-                                  static_cast<unsigned long long>(status.st_ino),
-                                  static_cast<unsigned long long>(status.st_size),
-                                  static_cast<unsigned long long>(status.st_mtim.tv_sec),
-                                  static_cast<unsigned long>(status.st_mtim.tv_nsec));
+  result.tag =
+      util::FormatString("\"%llx-%llx-%llx.%lx\"", static_cast<unsigned long long>(status.st_ino),
+                         static_cast<unsigned long long>(status.st_size),
+                         static_cast<unsigned long long>(status.st_mtim.tv_sec),
+                         static_cast<unsigned long>(status.st_mtim.tv_nsec));
   return result;
 }
 
 bool IsEqualFolded(std::string_view a, std::string_view b) {
-  const auto fold = [](char c) { return c >= 'A' && c <= 'Z' ? static_cast<char>(c - 'A' + 'a') : c; };
+  const auto fold = [](char c) {
+    return c >= 'A' && c <= 'Z' ? static_cast<char>(c - 'A' + 'a') : c;
+  };
   return std::ranges::equal(a, b, {}, fold, fold);
 }
 
