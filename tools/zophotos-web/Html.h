@@ -23,8 +23,8 @@ public:
   template <typename Pointer>
   requires std::is_same_v<Pointer, const char*> Html& operator<<(const Pointer&) = delete;
 
-  /// A text, for content and for attributes in double quotes. Bytes that are not UTF-8 become
-  /// U+FFFD.
+  /// A text, for content and for attributes in double quotes. Bytes that are not UTF-8, and
+  /// control characters, become U+FFFD.
   Html& operator<<(const std::string& text);
 
   Html& operator<<(std::int64_t number);

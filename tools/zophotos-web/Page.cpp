@@ -338,7 +338,8 @@ Html VolumeStart(const Volume& volume) {
   if (volume.isGone) {
     html << " gone";
   }
-  html << "\" data-volume=\"" << volume.mountPoint << "\">";
+  // The script has the name from JSON, in UTF-8.
+  html << "\" data-volume=\"" << NameText(zophotos::ToUtf8(volume.mountPoint)) << "\">";
   return html;
 }
 
@@ -527,7 +528,7 @@ Html VolumeCard(const Volume& volume) {
        << R"(</b> photos transcoded</p><p class="rest">)"
        << number("waiting", volume.waiting, "waiting") << " "
        << number("failed", volume.failed, "failed") << R"(</p><p class="activity">)"
-       << volume.activity << R"(</p><p class="merged"><span>Merged up to</span> <b>)"
+       << NameText(volume.activity) << R"(</p><p class="merged"><span>Merged up to</span> <b>)"
        << (volume.mergedUpTo == 0 ? "-" : zophotos::LocalTime(volume.mergedUpTo))
        << R"(</b></p><p class="absent">Not plugged in. Its photos are back when it is.</p></li>)"
        << "\n";
@@ -624,12 +625,12 @@ std::string VolumesPage(const Site& site) {
 
 std::string ErrorPage(int status, const std::string& text) {
   Html main;
-  main << "<section class=\"empty\"><h1>" << text << "</h1><p>Error " << status
+  main << "<section class=\"empty\"><h1>" << NameText(text) << "</h1><p>Error " << status
        << R"(. <a href="/">All photos</a></p></section>)"
        << "\n";
   Site site;
   site.snapshot.state = SnapshotStatus::State::Current;
-  return Document(site, Section::None, text, main);
+  return Document(site, Section::None, NameText(text), main);
 }
 
 } // namespace orva::web

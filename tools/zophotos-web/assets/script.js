@@ -690,7 +690,7 @@ function fillVolume(item, volume) {
   };
   const total = Math.max(volume.total, 0);
   const done = Math.min(Math.max(volume.transcoded, 0), total);
-  item.dataset.volume = volume.volume;
+  item.dataset.volume = shown(volume.volume);
   item.classList.toggle("gone", volume.gone);
   item.querySelector(".volume-link").href = `/search?volume=${encodeURIComponent(volume.volume)}`;
   item.querySelector("progress").max = Math.max(total, 1);
@@ -714,8 +714,8 @@ async function updateVolumes(list) {
   const most = list.closest(".strip") === null ? volumes.length : 24;
   let place = list.firstElementChild;
   for (const volume of volumes.slice(0, most)) {
-    let item = items.get(volume.volume);
-    items.delete(volume.volume);
+    let item = items.get(shown(volume.volume));
+    items.delete(shown(volume.volume));
     if (item === undefined) {
       item = cloneOf("volume");
     }
