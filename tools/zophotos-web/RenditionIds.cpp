@@ -23,6 +23,14 @@ constexpr std::size_t MOST_AT_ONCE = 200;
 /// After a catalog could not be read.
 constexpr std::chrono::seconds PAUSE(5);
 
+/// The reason in an error message of the database layer, without the place in the source and the
+/// statement.
+std::string ReasonOf(const std::string& message) {
+  const std::size_t colon = message.find(": ");
+  const std::size_t begin = colon == std::string::npos ? 0 : colon + 2;
+  return message.substr(begin, message.find(" (extended code ", begin) - begin);
+}
+
 } // namespace
 
 const std::int64_t* RenditionIds::Found::Find(PhotoId photo) const {
@@ -145,7 +153,7 @@ void RenditionIds::LookUp(Volume& known, const Identity& catalog, PhotoId photo,
     const std::lock_guard lock(mutex_);
     known.nextTry = Clock::now() + PAUSE;
     if (!std::exchange(known.hasFailed, true)) {
-      log_("cannot read the catalog of " + path.root + ": " + reason);
+      log_("cannot read the catalog of " + path.root + ": " + ReasonOf(reason));
     }
   }
 }

@@ -84,7 +84,8 @@ const std::string* Target::Find(std::string_view name) const {
 }
 
 std::optional<Target> ParseTarget(std::string_view text) {
-  if (!text.starts_with('/')) {
+  const auto isGraphic = [](char c) { return c > ' ' && c <= '~'; };
+  if (!text.starts_with('/') || !std::ranges::all_of(text, isGraphic)) {
     return std::nullopt;
   }
   Target target;

@@ -19,7 +19,8 @@ struct Target {
 };
 
 /// Parses the target of a request line. Returns nothing for one that is malformed: without a path,
-/// with an incomplete escape, with too many parameters or with one parameter twice.
+/// with characters that are not ASCII, with an incomplete escape, with too many parameters or with
+/// one parameter twice.
 std::optional<Target> ParseTarget(std::string_view text);
 
 /// A number as we print it: decimal, without leading zeros or a plus sign. Nothing for any other

@@ -47,6 +47,7 @@ struct Exchange {
 struct Headers {
   int hosts = 0;
   std::string host;
+  bool areMalformed = false;
   bool hasBody = false;
   bool isFromOtherSite = false;
   bool isNavigation = false;
@@ -59,11 +60,18 @@ bool IsEqual(std::string_view text, std::string_view lower) {
   });
 }
 
+bool IsNameCharacter(char c) {
+  return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9') || c == '-' ||
+         c == '_';
+}
+
 MHD_Result Collect(void* headers, MHD_ValueKind /*kind*/, const char* key, std::size_t keySize,
                    const char* value, std::size_t valueSize) {
   Headers& all = *static_cast<Headers*>(headers);
   const std::string_view name(key, keySize);
   const std::string_view text(value == nullptr ? "" : value, valueSize);
+  // Others may read "Content-Length :" as we do not.
+  all.areMalformed = all.areMalformed || !std::ranges::all_of(name, IsNameCharacter);
   if (IsEqual(name, "host")) {
     ++all.hosts;
     all.host = text;
@@ -160,6 +168,9 @@ std::optional<Refusal> Check(const Headers& headers, const AllowedHosts& hosts, 
     return Refusal{MHD_HTTP_MISDIRECTED_REQUEST,
                    "This server is not known by the name in the Host header. The option --host "
                    "gives it another name."};
+  }
+  if (headers.areMalformed) {
+    return Refusal{MHD_HTTP_BAD_REQUEST, "A header of the request is malformed."};
   }
   if (headers.hasBody) {
     return Refusal{MHD_HTTP_BAD_REQUEST, "A request must not have a body."};
@@ -315,7 +326,6 @@ Server::Server(util::FileDescriptor listener, AllowedHosts hosts, Handlers handl
       {MHD_OPTION_CONNECTION_LIMIT, static_cast<std::intptr_t>(limit_), nullptr},
       {MHD_OPTION_CONNECTION_MEMORY_LIMIT, CONNECTION_MEMORY, nullptr},
       {MHD_OPTION_CONNECTION_TIMEOUT, SILENCE, nullptr},
-      {MHD_OPTION_STRICT_FOR_CLIENT, 1, nullptr},
       {MHD_OPTION_SIGPIPE_HANDLED_BY_APP, 1, nullptr},
       {MHD_OPTION_END, 0, nullptr}};
   daemon_ = MHD_start_daemon(MHD_USE_EPOLL_INTERNAL_THREAD | MHD_USE_SUSPEND_RESUME, 0, nullptr,

@@ -1,0 +1,32 @@
+B=/work/wt/15B/build/release/bin
+$B/zophotos-web --listen 127.0.0.1:8480 --cache /tmp/cache & W=$!
+for i in $(seq 50); do curl -s -o /dev/null http://127.0.0.1:8480/ && break; sleep 0.1; done
+t() { printf "$1" | timeout 3 nc -q1 127.0.0.1 8480 | grep -aE '^HTTP|error'; echo "--- $1"; }
+t 'GET /api/status HTTP/1.1\r\n\r\n'
+t 'GET /api/status HTTP/1.1\r\nHost: localhost\r\nHost: localhost\r\n\r\n'
+t 'GET /api/status HTTP/1.1\r\nHost : localhost\r\n\r\n'
+t 'GET /api/status HTTP/1.1\r\nHost: localhost\r\nContent-Length: -1\r\n\r\n'
+t 'GET /api/status HTTP/1.1\r\nHost: localhost\r\nContent-Length: 5\r\nContent-Length: 6\r\n\r\n'
+t 'GET /api/status HTTP/1.1\r\nHost: localhost\r\nContent-Length : 5\r\n\r\n'
+t 'GET /api/status HTTP/1.1\r\nHost: localhost\r\nTransfer-Encoding: xchunked\r\n\r\n'
+t 'GET /api/status HTTP/1.1\r\nHost: localhost\r\nTransfer-Encoding:\tchunked\r\n\r\n5\r\nGET /\r\n'
+t 'GET /api/status HTTP/1.1\nHost: localhost\n\n'
+t 'GET /api/status HTTP/1.1\rHost: localhost\r\r'
+t 'GET /api/status\0x HTTP/1.1\r\nHost: localhost\r\n\r\n'
+t 'GET /api/st\0x HTTP/1.1\r\nHost: loc\0alhost\r\n\r\n'
+t 'GET /api/status HTTP/1.1\r\nHost: localhost\r\n X: folded\r\n\r\n'
+t 'GET  /api/status  HTTP/1.1\r\nHost: localhost\r\n\r\n'
+t 'GET /api/status HTTP/9.9\r\nHost: localhost\r\n\r\n'
+t 'GET /api/status\r\nHost: localhost\r\n\r\n'
+t 'get /api/status HTTP/1.1\r\nHost: localhost\r\n\r\n'
+t 'GET /api/status HTTP/1.1\r\nHost: localhost\r\nExpect: 100-continue\r\nContent-Length: 4\r\n\r\n'
+t 'GET /photos/..%%2f..%%2fetc/passwd HTTP/1.1\r\nHost: localhost\r\n\r\n'
+t 'GET /api/photos/1/../../etc HTTP/1.1\r\nHost: localhost\r\n\r\n'
+t '\r\n\r\nGET /api/status HTTP/1.1\r\nHost: localhost\r\n\r\n'
+t '\x16\x03\x01\x02\x00\x01\x00\x01\xfc\x03\x03'
+t 'GET /api/status HTTP/1.1\r\nHost: localhost\r\nConnection: Upgrade\r\nUpgrade: h2c\r\n\r\n'
+t 'OPTIONS * HTTP/1.1\r\nHost: localhost\r\n\r\n'
+t 'CONNECT evil:80 HTTP/1.1\r\nHost: localhost\r\n\r\n'
+t 'TRACE / HTTP/1.1\r\nHost: localhost\r\n\r\n'
+t 'GET /api/status?%%zz HTTP/1.1\r\nHost: localhost\r\n\r\n'
+kill $W; wait $W; echo status $?
