@@ -4,6 +4,14 @@
 
 namespace orva::web {
 
+namespace {
+
+bool IsControl(char character) {
+  return static_cast<unsigned char>(character) < ' ' || character == '\x7f';
+}
+
+} // namespace
+
 Html& Html::operator<<(const std::string& text) {
   for (const char character : zophotos::ToUtf8(text)) {
     switch (character) {
@@ -23,7 +31,7 @@ Html& Html::operator<<(const std::string& text) {
       text_ += "&#39;";
       break;
     default:
-      text_ += character;
+      text_ += IsControl(character) ? "\uFFFD" : std::string(1, character);
     }
   }
   return *this;

@@ -4,6 +4,7 @@
 #include <cstdint>
 #include <string>
 #include <string_view>
+#include <type_traits>
 
 namespace orva::web {
 
@@ -18,8 +19,12 @@ public:
     return *this;
   }
 
-  /// A text, for content and for attributes in double quotes. Bytes that are not UTF-8 become
-  /// U+FFFD.
+  /// Neither markup nor a text: a pointer may be meant as either.
+  template <typename Pointer>
+  requires std::is_same_v<Pointer, const char*> Html& operator<<(const Pointer&) = delete;
+
+  /// A text, for content and for attributes in double quotes. Bytes that are not UTF-8, and
+  /// control characters, become U+FFFD.
   Html& operator<<(const std::string& text);
 
   Html& operator<<(std::int64_t number);
