@@ -303,8 +303,8 @@ TEST_F(WebServer, SendsEventsWhenThereAreSome) {
   server->Events().PublishVersion(8);
   first.ReadUntil("event: change\ndata: 8\n\n");
   second.ReadUntil("event: change\ndata: 8\n\n");
-  server->Events().PublishActivity();
-  first.ReadUntil("event: activity\ndata:\n\n");
+  server->Events().PublishVolumes();
+  first.ReadUntil("event: volumes\ndata: 8\n\n");
   server->Events().PublishVersion(9);
   first.ReadUntil("event: change\ndata: 9\n\n");
 }
