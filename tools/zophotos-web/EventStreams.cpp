@@ -12,9 +12,9 @@ void EventStreams::PublishVersion(std::int64_t version) {
   }
 }
 
-void EventStreams::PublishActivity() {
+void EventStreams::PublishVolumes() {
   const std::lock_guard lock(mutex_);
-  ++activity_;
+  ++volumes_;
   ResumeAll();
 }
 
@@ -42,7 +42,7 @@ MHD_Response* EventStreams::Open(MHD_Connection* connection) {
   streams_.push_back({.all = *this,
                       .connection = connection,
                       .unsent = "retry: 3000\n\n",
-                      .sentActivity = activity_});
+                      .sentVolumes = volumes_});
   MHD_Response* const response =
       MHD_create_response_from_callback(MHD_SIZE_UNKNOWN, BLOCK, &Read, &streams_.back(), &Free);
   if (response == nullptr) {
@@ -85,9 +85,9 @@ void EventStreams::Collect(Stream& stream) const {
     stream.unsent += "event: change\ndata: " + std::to_string(version_) + "\n\n";
     stream.sentVersion = version_;
   }
-  if (stream.sentActivity != activity_) {
-    stream.unsent += "event: activity\ndata:\n\n";
-    stream.sentActivity = activity_;
+  if (stream.sentVolumes != volumes_) {
+    stream.unsent += "event: volumes\ndata: " + std::to_string(version_) + "\n\n";
+    stream.sentVolumes = volumes_;
   }
   if (stream.unsent.empty() && Clock::now() - stream.lastSent >= SILENCE) {
     stream.unsent = ":\n\n";

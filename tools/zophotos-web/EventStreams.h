@@ -30,8 +30,9 @@ public:
   /// latest version first.
   void PublishVersion(std::int64_t version);
 
-  /// Sends "event: activity" to all streams: what the services do with the volumes has changed.
-  void PublishActivity();
+  /// Sends "event: volumes" with the same version to all streams: what the services do with the
+  /// volumes has changed.
+  void PublishVolumes();
 
   /// Sends the comments that are due.
   void KeepAlive();
@@ -49,9 +50,9 @@ private:
   struct Stream {
     EventStreams& all;
     MHD_Connection* connection;
-    std::string unsent{};           ///< text that did not fit
-    std::int64_t sentVersion = -1;  ///< -1: none
-    std::uint64_t sentActivity = 0; ///< counts as activity_ does
+    std::string unsent{};          ///< text that did not fit
+    std::int64_t sentVersion = -1; ///< -1: none
+    std::uint64_t sentVolumes = 0; ///< counts as volumes_ does
     Clock::time_point lastSent = Clock::now();
     bool isSuspended = false;
   };
@@ -66,7 +67,7 @@ private:
   std::mutex mutex_;
   std::list<Stream> streams_;
   std::int64_t version_ = 0;
-  std::uint64_t activity_ = 0; ///< how often it has changed
+  std::uint64_t volumes_ = 0; ///< how often it has changed
   bool isClosed_ = false;
 };
 

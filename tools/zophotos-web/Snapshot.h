@@ -34,20 +34,16 @@ public:
   /// Uses `directory`, which is created if its parent exists. Continues with the snapshot that is
   /// there; what is damaged, of another version or of unknown origin is removed. Throws
   /// std::runtime_error if another process uses the directory, or if it cannot be used.
-  Snapshot(std::string directory, FindPath findPath);
+  Snapshot(const std::string& directory, FindPath findPath);
   ~Snapshot();
   Snapshot(const Snapshot&) = delete;
   Snapshot& operator=(const Snapshot&) = delete;
 
   /// Brings the snapshot up to date if the locator or the merged database has changed. Locks the
-  /// merged database for about 20 milliseconds at a time. Returns whether readers see a change.
-  /// Errors of the merged database become the status. Throws only if the directory cannot be
-  /// written. One thread; `stop` ends a long update early.
+  /// merged database for about 20 milliseconds at a time, and does not keep it open afterwards.
+  /// Returns whether readers see a change. Errors become the status; after an error, the next try
+  /// may be a minute later. One thread; `stop` ends a long update early.
   bool Update(const std::stop_token& stop = {});
-
-  /// Closes the merged database, so that its volume can be unmounted. The next update opens it
-  /// again.
-  void Close();
 
   /// Any thread.
   SnapshotStatus Status() const;
@@ -55,6 +51,9 @@ public:
   /// The path of the snapshot's file that readers are to read. It changes when a new snapshot is
   /// complete; the former file is then removed, but can be read while it is open. Any thread.
   std::string File() const;
+
+  /// For readers that found damage in the file: the next update replaces it. Any thread.
+  void ReportDamage() const;
 
 private:
   class Implementation;

@@ -22,7 +22,7 @@ void Updater::Run(const std::stop_token& stop) {
       Log(error.what());
     }
     if (services.Wait(zophotos::LOOK_INTERVAL)) {
-      events_.PublishActivity();
+      events_.PublishVolumes();
     }
   }
 }
@@ -32,7 +32,7 @@ void Updater::Update(const std::stop_token& stop) {
   events_.PublishVersion(reader_.Version());
   const SnapshotStatus status = snapshot_.Status();
   if (std::exchange(state_, status.state) != status.state) {
-    events_.PublishActivity();
+    events_.PublishVolumes();
   }
   Log(status.state == SnapshotStatus::State::Failed ? status.reason : "");
 }
