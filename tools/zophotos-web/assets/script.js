@@ -626,6 +626,13 @@ class Tree {
     }
   }
 
+  // The top of the tree is a single folder.
+  openOnly() {
+    if (this.list.children.length === 1) {
+      this.list.querySelector(".toggle")?.click();
+    }
+  }
+
   addButton(item) {
     if (!("folders" in item.dataset)) {
       return;
@@ -847,7 +854,7 @@ function start() {
   }
   const tree = document.querySelector(".tree > ul");
   if (tree !== null) {
-    new Tree(tree);
+    new Tree(tree).openOnly();
   }
   addEventListener("keydown", (event) => {
     if (event.key === "/" && !event.target.matches("input, select")) {
