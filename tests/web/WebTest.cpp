@@ -89,14 +89,16 @@ bool WebTest::AwaitPhotos(std::size_t count) const {
 
 Lines WebTest::Paths(const std::string& query) const {
   Lines paths;
-  for (const Json& photo : GetJson("/api/photos" + query).at("photos")) {
+  const Json list = GetJson("/api/photos" + query);
+  for (const Json& photo : list.at("photos")) {
     paths.push_back(photo.at("path"));
   }
   return paths;
 }
 
 std::string WebTest::IdOf(const std::string& path) const {
-  for (const Json& photo : GetJson("/api/photos?count=200").at("photos")) {
+  const Json list = GetJson("/api/photos?count=200");
+  for (const Json& photo : list.at("photos")) {
     if (photo.at("path") == path) {
       return photo.at("id");
     }

@@ -194,7 +194,7 @@ TEST_F(WebApi, ServesPagesAndAssets) {
     EXPECT_EQ(200, response.status) << target;
     EXPECT_EQ("text/html; charset=utf-8", response.Header("content-type"));
     EXPECT_EQ("no-store", response.Header("cache-control"));
-    EXPECT_THAT(response.body, AllOf(HasSubstr("<!DOCTYPE html>"), HasSubstr("</html>")));
+    EXPECT_THAT(response.body, AllOf(HasSubstr("<!doctype html>"), HasSubstr("</html>")));
   }
   for (const char* const target : {"/style.css", "/script.js", "/icon.svg"}) {
     const HttpResponse response = Get(target);

@@ -167,6 +167,7 @@ TEST_F(WebHostile, LockedCatalogsDelayNobody) {
   const std::string target = Target(ONE, "/rendition");
   onA.Rows().Run("PRAGMA journal_mode = DELETE");
   onA.Rows().Run("BEGIN EXCLUSIVE");
+  onA.Rows().Run("UPDATE Files SET lastUpdatedDate = 1");
   HttpConnection waiting(port);
   waiting.Send(HttpGet(target));
   EXPECT_EQ(200, Get("/").status);
@@ -207,7 +208,7 @@ TEST_F(WebHostile, AddressesOfOtherMachinesAreRefused) {
   const auto run = [](const Program::Arguments& options) {
     Program::Arguments arguments{ProgramPath("zophotos-web"), "--cache", "/tmp/other"};
     arguments.insert(arguments.end(), options.begin(), options.end());
-    return Run(arguments);
+    return test::Run(arguments);
   };
   for (const char* const address : {"0.0.0.0:0", "[::]:0"}) {
     const Outcome outcome = run({"--listen", address});
@@ -218,12 +219,15 @@ TEST_F(WebHostile, AddressesOfOtherMachinesAreRefused) {
   EXPECT_EQ(2, run({"--host", "a b"}).status);
   StopWeb();
   fs::remove_all("/tmp/cache");
-  StartWeb({"--listen", "0.0.0.0:0", "--allow-everybody", "--host", "photos.example.org"});
+  web = std::make_unique<Program>(
+      Program::Arguments{ProgramPath("zophotos-web"), "--cache", "/tmp/cache", "--listen",
+                         "0.0.0.0:0", "--allow-everybody", "--host", "photos.example.org"});
+  EXPECT_THAT(web->ReadLineWith("listening on"), HasSubstr("http://0.0.0.0:"));
 }
 
 TEST_F(WebHostile, OneCacheHasOneServer) {
   const Outcome outcome =
-      Run({ProgramPath("zophotos-web"), "--listen", "127.0.0.1:0", "--cache", "/tmp/cache"});
+      test::Run({ProgramPath("zophotos-web"), "--listen", "127.0.0.1:0", "--cache", "/tmp/cache"});
   EXPECT_EQ(1, outcome.status);
   EXPECT_TRUE(AwaitPhotos(3));
 }
