@@ -338,6 +338,7 @@ TEST(Combine, AddsWhatTheServicesDoToTheVolumes) {
   EXPECT_THAT(volumes[1].activity, HasSubstr("12 folders waiting"));
   EXPECT_TRUE(volumes[2].isGone);
   EXPECT_EQ(volumes[2].state, "watching");
+  EXPECT_EQ(volumes[2].activity, "");
 }
 
 TEST(FindAsset, HasTheFilesOfAllPages) {

@@ -354,10 +354,11 @@ Html Strip(const std::vector<Volume>& volumes) {
     return html;
   };
   Html html;
+  html << "<nav class=\"strip\" aria-label=\"Volumes\"";
   if (volumes.empty()) {
-    return html;
+    html << " hidden";
   }
-  html << "<nav class=\"strip\" aria-label=\"Volumes\"><ul>";
+  html << "><ul>";
   for (std::size_t i = 0; i < std::min(volumes.size(), MOST_IN_STRIP); ++i) {
     html << item(volumes[i]);
   }
@@ -372,17 +373,20 @@ Html Strip(const std::vector<Volume>& volumes) {
 /// What to do when there are no photos.
 Html Empty(const Site& site) {
   Html html;
-  html << "<section class=\"empty\" id=\"empty\">";
+  const bool isPreparing = std::ranges::any_of(site.volumes, [](const Volume& volume) {
+    return !volume.isGone && (volume.total > 0 || volume.waiting.value_or(0) > 0);
+  });
+  html << "<section class=\"empty\" id=\"empty\" data-kind=\"";
   if (site.snapshot.state == SnapshotStatus::State::Building) {
-    html << "<h2>One moment</h2><p>The photos appear here as soon as their list is built.</p>";
-  } else if (std::ranges::any_of(site.volumes, [](const Volume& volume) {
-               return !volume.isGone && (volume.total > 0 || volume.waiting.value_or(0) > 0);
-             })) {
-    html << "<h2>The photos are being prepared</h2><p>A photo appears here when its rendition, a "
-            "small copy of it, is made. <a href=\"/volumes\">See how far the volumes are</a>.</p>";
+    html << "building\"><h2>One moment</h2><p>The photos appear here as soon as their list is "
+            "built.</p>";
+  } else if (isPreparing) {
+    html
+        << "preparing\"><h2>The photos are being prepared</h2><p>A photo appears here when its rendition, a "
+           "small copy of it, is made. <a href=\"/volumes\">See how far the volumes are</a>.</p>";
   } else {
     html
-        << "<h2>No photos yet</h2><ul>"
+        << "none\"><h2>No photos yet</h2><ul>"
            "<li>Copy photos to <code>/shares/Photos</code>, or</li>"
            "<li>plug in a disk with photos. It has to be mounted directly below "
            "<code>/shares</code>.</li></ul>"

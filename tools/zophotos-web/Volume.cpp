@@ -4,6 +4,7 @@
 #include "zophotos/Text.h"
 
 #include <map>
+#include <string_view>
 #include <utility>
 
 namespace orva::web {
@@ -20,9 +21,14 @@ void AddActivity(Volume& volume, const zophotos::VolumeActivity& activity) {
     volume.failed = activity.rendering->failed;
     volume.isRendering = activity.rendering->isActive;
   }
-  if (const std::string text = Describe(activity); text != "-") {
-    volume.activity = text;
+  // To be watched is what every volume is.
+  std::string text = Describe(activity);
+  for (const std::string_view usual : {"watched; ", "watched", "-"}) {
+    if (text.starts_with(usual)) {
+      text.erase(0, usual.size());
+    }
   }
+  volume.activity = text;
 }
 
 } // namespace

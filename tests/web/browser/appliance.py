@@ -50,14 +50,14 @@ class Appliance:
             os.makedirs(directory, exist_ok=True)
 
     def start(self, name, *arguments, **environment):
-        log = open(f"/tmp/{name}.log", "ab")
-        self.services[name] = subprocess.Popen(
-            [os.path.join(self.programs, name), *arguments],
-            stdin=subprocess.DEVNULL,
-            stdout=log,
-            stderr=log,
-            env={**os.environ, **environment},
-        )
+        with open(f"/tmp/{name}.log", "ab") as log:
+            self.services[name] = subprocess.Popen(
+                [os.path.join(self.programs, name), *arguments],
+                stdin=subprocess.DEVNULL,
+                stdout=log,
+                stderr=log,
+                env={**os.environ, **environment},
+            )
 
     def service(self, name):
         return self.services[name]

@@ -19,13 +19,15 @@
 //   /api/volumes                {"volumes": [VOLUME, ...]}
 //   /api/status                 {"state": "no_database", "building", "current" or "failed",
 //                               "done": 0, "total": 0, "reason": text, "version": 1}
-//   /api/events                 "event: change", when the photos have changed, with the version as
-//                               its data; "event: volumes", when only the services' work has
+//   /api/events                 "event: change" with the version as its data, first and after each
+//                               change of the photos; "event: activity" when the work of the services
+//                               has changed
 
 const COUNT = 100; // photos of a request
 const MOST = 600; // photos in a grid at a time: those far away are removed and fetched again
 const NEAR = 1500; // pixels from an end of the grid at which more photos are fetched
-const CALM = 1000; // milliseconds between two updates
+const CALM = 500; // milliseconds between two updates
+const MOST_IN_STRIP = 24; // volumes above the newest photos
 const MONTHS = ["January", "February", "March", "April", "May", "June", "July", "August",
   "September", "October", "November", "December"];
 
@@ -624,6 +626,13 @@ class Tree {
     }
   }
 
+  // The top of the tree is a single folder.
+  openOnly() {
+    if (this.list.children.length === 1) {
+      this.list.querySelector(".toggle")?.click();
+    }
+  }
+
   addButton(item) {
     if (!("folders" in item.dataset)) {
       return;
@@ -708,17 +717,14 @@ function fillVolume(item, volume) {
   set(".merged b", volume.local_merged_up_to ?? "-");
 }
 
-async function updateVolumes(list) {
-  const { volumes } = await fetchJson("/api/volumes");
+function updateVolumes(list, volumes) {
   const items = new Map([...list.children].map((item) => [item.dataset.volume, item]));
-  const most = list.closest(".strip") === null ? volumes.length : 24;
+  const strip = list.closest(".strip");
   let place = list.firstElementChild;
-  for (const volume of volumes.slice(0, most)) {
-    let item = items.get(shown(volume.volume));
-    items.delete(shown(volume.volume));
-    if (item === undefined) {
-      item = cloneOf("volume");
-    }
+  for (const volume of strip === null ? volumes : volumes.slice(0, MOST_IN_STRIP)) {
+    const name = shown(volume.volume);
+    const item = items.get(name) ?? cloneOf("volume");
+    items.delete(name);
     fillVolume(item, volume);
     if (item === place) {
       place = place.nextElementSibling;
@@ -726,16 +732,38 @@ async function updateVolumes(list) {
       list.insertBefore(item, place);
     }
   }
-  for (const [volume, item] of items) {
-    if (volume !== undefined) {
+  for (const [name, item] of items) {
+    if (name !== undefined) {
       item.remove();
     }
   }
+  strip?.toggleAttribute("hidden", list.children.length === 0);
 }
 
-async function updateNotice() {
+// What the page says when it has nothing to show.
+async function updateEmpty(status, volumes, grid, list) {
+  const empty = document.getElementById("empty");
+  if (empty === null) {
+    return;
+  }
+  const isPreparing = volumes.some((volume) =>
+    !volume.gone && (volume.total > 0 || volume.waiting > 0));
+  const kind = status.state === "building" ? "building" : isPreparing ? "preparing" : "none";
+  const hasFolders = async () => (await fetchJson("/api/folders?count=1")).folders.length > 0;
+  if (grid !== null) {
+    empty.hidden = grid.photos.length > 0;
+  } else if (list !== null) {
+    empty.hidden = list.children.length > 0;
+  } else if (await hasFolders()) {
+    location.reload();
+  }
+  if (!empty.hidden && kind !== empty.dataset.kind) {
+    location.reload();
+  }
+}
+
+function updateNotice(status) {
   const notice = document.getElementById("notice");
-  const status = await fetchJson("/api/status");
   const text = {
     building: status.total > 0
       ? `The list of photos is being built: ${grouped(status.done)} of about ${grouped(status.total)}.`
@@ -750,75 +778,68 @@ async function updateNotice() {
     paragraph.textContent = text;
     notice.replaceChildren(...(text === undefined ? [] : [paragraph]));
   }
-  const hasChanged = notice.dataset.state !== status.state;
   notice.dataset.state = status.state;
-  return hasChanged;
 }
 
 // Follows the changes of the photos and the volumes while the page can be seen. A hidden page needs
 // no connection, of which browsers have only a few.
 function follow(grid) {
-  const volumes = document.querySelector(".strip ul, ul.volumes");
+  const list = document.querySelector(".strip ul, ul.volumes");
   let source = null;
-  let hasPhotos = false; // the photos may have changed since the last update
-  let isPending = false;
+  let arePhotosDue = false;
+  let isPlanned = false;
   let last = 0;
 
   const update = async () => {
-    isPending = false;
+    isPlanned = false;
     last = performance.now();
-    const arePhotos = hasPhotos;
-    hasPhotos = false;
+    const withPhotos = arePhotosDue;
+    arePhotosDue = false;
+    let isBuilding = false;
     try {
-      const hasChanged = await updateNotice();
-      if (document.getElementById("empty") !== null && (arePhotos || hasChanged)) {
-        location.reload();
-        return;
+      const status = await fetchJson("/api/status");
+      const { volumes } = await fetchJson("/api/volumes");
+      isBuilding = status.state === "building";
+      updateNotice(status);
+      if (list !== null) {
+        updateVolumes(list, volumes);
       }
-      if (volumes !== null) {
-        await updateVolumes(volumes);
-      }
-      if (arePhotos && grid !== null) {
+      if (withPhotos && grid !== null) {
         await grid.refresh();
       }
+      await updateEmpty(status, volumes, grid, list);
     } catch {
-      // The server is away. The next event comes when it is back.
+      // The server is away. It sends an event when it is back.
     }
-    if (document.getElementById("notice").dataset.state === "building") {
+    if (isBuilding) {
       plan(true);
     }
   };
-  const plan = (arePhotos) => {
-    hasPhotos ||= arePhotos;
-    if (!isPending && !document.hidden) {
-      isPending = true;
+  const plan = (withPhotos) => {
+    arePhotosDue ||= withPhotos;
+    if (!isPlanned && !document.hidden) {
+      isPlanned = true;
       setTimeout(update, Math.max(0, last + CALM - performance.now()));
     }
   };
-  const connect = (isFirst) => {
+  const connect = () => {
     if (document.hidden) {
       source?.close();
       source = null;
     } else if (source === null) {
       source = new EventSource("/api/events");
       source.addEventListener("change", () => plan(true));
-      source.addEventListener("volumes", () => plan(false));
-      if (!isFirst) {
-        plan(true);
-      }
+      source.addEventListener("activity", () => plan(false));
     }
   };
-  document.addEventListener("visibilitychange", () => connect(false));
+  document.addEventListener("visibilitychange", connect);
   // A page in the browser's cache of pages has no connection either.
   addEventListener("pagehide", () => {
     source?.close();
     source = null;
   });
-  addEventListener("pageshow", (event) => connect(!event.persisted));
-  connect(true);
-  if (document.getElementById("notice").dataset.state === "building") {
-    plan(true);
-  }
+  addEventListener("pageshow", connect);
+  connect();
 }
 
 function start() {
@@ -833,7 +854,7 @@ function start() {
   }
   const tree = document.querySelector(".tree > ul");
   if (tree !== null) {
-    new Tree(tree);
+    new Tree(tree).openOnly();
   }
   addEventListener("keydown", (event) => {
     if (event.key === "/" && !event.target.matches("input, select")) {
