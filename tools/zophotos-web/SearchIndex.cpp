@@ -16,9 +16,11 @@ namespace {
 /// Bytes of a word that count.
 constexpr std::size_t LONGEST_WORD = 64;
 
-/// A prefix is frequent if more photos than this have it. Finding the photos of others takes at
-/// most some 30 milliseconds.
-constexpr std::int64_t FREQUENT = 64'000;
+/// A prefix of so many bytes is frequent if more photos than this have it. To collect so many
+/// photos takes some 20 milliseconds. There are few short prefixes.
+constexpr std::int64_t FrequentFrom(std::size_t length) {
+  return length == 1 ? 8'000 : length == 2 ? 32'000 : 64'000;
+}
 constexpr std::size_t LONGEST_PREFIX = 16;
 
 constexpr std::int64_t SAMPLED_PHOTOS = 20'000;
@@ -323,7 +325,7 @@ std::vector<std::string> PrefixSample::Frequent() const {
         count += word->second;
       }
       // A single word, or words with a longer common prefix, are searched for under their own name.
-      if (count * interval_ > FREQUENT && std::next(begin) != end &&
+      if (count * interval_ > FrequentFrom(length) && std::next(begin) != end &&
           IsBoundary(begin->first, length) &&
           CommonPrefix(begin->first, std::prev(end)->first) == length) {
         prefixes.emplace_back(prefix);

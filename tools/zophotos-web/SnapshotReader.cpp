@@ -27,7 +27,6 @@ namespace {
 /// Rows of one answer.
 constexpr std::size_t MOST_ROWS = 1'000;
 constexpr std::size_t MOST_ANCESTORS = 100;
-constexpr std::size_t MOST_MONTHS = 1'200;
 
 constexpr std::int64_t SMALLEST = std::numeric_limits<std::int64_t>::min();
 constexpr std::int64_t LARGEST = std::numeric_limits<std::int64_t>::max();
@@ -66,16 +65,17 @@ int LimitOf(std::size_t count) {
   return static_cast<int>(std::min(count, MOST_ROWS));
 }
 
-/// The month that contains a time, and its first second.
+/// The month that contains a time, and the first second after it.
 std::pair<Month, std::int64_t> MonthOf(std::int64_t seconds) {
   const std::time_t time = seconds;
   std::tm fields{};
   localtime_r(&time, &fields);
   const Month month{.year = fields.tm_year + 1900, .month = fields.tm_mon + 1};
+  fields.tm_mon += 1;
   fields.tm_mday = 1;
   fields.tm_hour = fields.tm_min = fields.tm_sec = 0;
   fields.tm_isdst = -1;
-  return {month, std::min<std::int64_t>(std::mktime(&fields), seconds)};
+  return {month, std::max<std::int64_t>(std::mktime(&fields), seconds + 1)};
 }
 
 } // namespace
@@ -222,21 +222,23 @@ public:
     std::vector<Month> months;
     const auto expression =
         Expression({.folder = filter.folder, .volume = filter.volume, .words = {}, .times = {}});
+    // From the oldest one: FTS5 finds a place in a long list faster in this direction.
     Range range;
-    while (expression && months.size() < MOST_MONTHS) {
-      const std::vector<PhotoId> newest = Ids(*expression, range, true, 1);
-      if (newest.empty()) {
+    while (expression) {
+      const std::vector<PhotoId> oldest = Ids(*expression, range, false, 1);
+      if (oldest.empty()) {
         break;
       }
-      const auto [month, begin] = MonthOf(SecondsOf(newest.front()));
+      const auto [month, end] = MonthOf(SecondsOf(oldest.front()));
       if (months.empty() || months.back() != month) {
         months.push_back(month);
       }
-      if (MakePhotoId(begin, 0) == SMALLEST) {
+      if (end != Clamp32(end)) {
         break;
       }
-      range.last = MakePhotoId(begin, 0) - 1;
+      range.first = MakePhotoId(end, 0);
     }
+    std::ranges::reverse(months);
     return months;
   }
 

@@ -97,8 +97,8 @@ public:
   /// By mount point; at most 1,000.
   std::vector<VolumeRow> Volumes();
 
-  /// The months that have photos, in local time, newest first; at most 1,200. Only the folder and
-  /// the volume of the filter count.
+  /// The months that have photos, in local time, newest first. Only the folder and the volume
+  /// of the filter count.
   std::vector<Month> Months(const Filter& filter);
 
   /// Grows with each change that readers can see, also over restarts of the program.
