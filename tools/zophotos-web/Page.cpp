@@ -248,7 +248,7 @@ Html Viewer(const PhotoView& view) {
   }
   html << R"(><p class="missing" hidden>This photo cannot be shown at the moment.</p>)"
        << step(view.older, "older", "Older photo") << R"(</div><div class="facts">)"
-       << R"(<h1 id="photo-name">)" << Name(photo.name)
+       << R"(<h1 id="photo-name" aria-live="polite">)" << Name(photo.name)
        << R"(</h1><dl><div><dt>Time</dt><dd><time)";
   if (!iso.empty()) {
     html << " datetime=\"" << iso << "\"";
