@@ -1,0 +1,246 @@
+// zophotos-web with hostile volumes, databases and clients.
+
+#include "WebTest.h"
+
+#include "hostile/SpecialFile.h"
+#include "support/OtherUsers.h"
+#include "support/Programs.h"
+
+#include <poll.h>
+#include <sys/mount.h>
+
+#include <chrono>
+#include <filesystem>
+#include <fstream>
+#include <list>
+
+namespace orva::test {
+namespace {
+
+namespace fs = std::filesystem;
+using ::testing::HasSubstr;
+using ::testing::IsEmpty;
+using ::testing::Not;
+
+class WebHostile : public WebTest {
+protected:
+  std::string Target(const std::string& path, const std::string& file) const {
+    return "/photos/" + IdOf(path) + file;
+  }
+
+  /// Kibibytes of a line of the program's status.
+  long Memory(const std::string& name) const {
+    std::ifstream status("/proc/" + std::to_string(web->Pid()) + "/status");
+    for (std::string line; std::getline(status, line);) {
+      if (line.starts_with(name + ":")) {
+        return std::stol(line.substr(name.size() + 1));
+      }
+    }
+    return -1;
+  }
+
+  static inline const std::string ONE = "/shares/A/sea/one.jpg";
+};
+
+/// What a volume may have in the place of a file.
+class WebSpecialPlaces : public WebHostile, public ::testing::WithParamInterface<SpecialKind> {};
+
+TEST_P(WebSpecialPlaces, AreNeverSent) {
+  Write("/tmp/secret", "secret");
+  const std::string original = Target(ONE, "/original");
+  const std::string rendition = Target(ONE, "/rendition");
+  const SpecialFile first(GetParam(), ONE, "/tmp/secret");
+  const SpecialFile second(GetParam(), RenditionOf(onA, a.Path(), "sea/one.jpg"), "/tmp/secret");
+  for (const std::string& target : {original, rendition}) {
+    const HttpResponse response = Get(target);
+    EXPECT_EQ(404, response.status) << target;
+    EXPECT_THAT(response.body, Not(HasSubstr("secret")));
+  }
+  EXPECT_EQ("rendition of top.jpg", Get(Target("/shares/A/top.jpg", "/rendition")).body);
+}
+
+INSTANTIATE_TEST_SUITE_P(Kinds, WebSpecialPlaces, ::testing::ValuesIn(SPECIAL_KINDS),
+                         [](const auto& kind) { return NameOf(kind.param); });
+
+TEST_F(WebHostile, FoldersThatBecomeLinksAreNotFollowed) {
+  Write("/tmp/other/one.jpg", "secret");
+  const std::string original = Target(ONE, "/original");
+  fs::rename("/shares/A/sea", "/shares/A/away");
+  fs::create_directory_symlink("/tmp/other", "/shares/A/sea");
+  EXPECT_EQ(404, Get(original).status);
+  const std::string rendition = Target(ONE, "/rendition");
+  fs::rename("/shares/A/.orva/renditions", "/shares/A/renditions");
+  fs::create_directory_symlink("../renditions", "/shares/A/.orva/renditions");
+  EXPECT_EQ(404, Get(rendition).status);
+}
+
+TEST_F(WebHostile, CraftedDatabasesLeadNowhereElse) {
+  Write("/tmp/secret.jpg", "secret");
+  Write("/shares/secret.jpg", "secret");
+  appliance.Shutdown();
+  const Database merged("/shares/A//.zophotos/zophotos.db");
+  merged.Run("UPDATE Folders SET name = '/shares/A/../../tmp/' WHERE name = '/shares/A/sea/'");
+  merged.Run("INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT "
+             "folder_id, '../secret.jpg', 5, volume, 6 FROM Folders WHERE name = '/shares/A/'");
+  merged.Run("INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT "
+             "folder_id, '.orva/orva.db', 5, volume, 6 FROM Folders WHERE name = '/shares/A/'");
+  merged.Run("INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT "
+             "folder_id, 'secret.jpg', 5, '/', 6 FROM Folders WHERE name = '/shares/'");
+  merged.Run(
+      "INSERT INTO Folders(parent_folder_id, name, modified_date, volume) VALUES(1, '/tmp/', "
+      "0, '/tmp/'), (1, '/shares/A/x/', 0, '/shares/')");
+  merged.Run("INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT "
+             "folder_id, 'secret.jpg', 5, volume, 6 FROM Folders WHERE name = '/tmp/'");
+  StopWeb();
+  fs::remove_all("/tmp/cache");
+  // The daemon's end empties the locator.
+  std::ofstream("/tmp/zophotodbmerger.conf") << LocatorOn(a.Path());
+  StartWeb();
+  const auto end = std::chrono::steady_clock::now() + DEADLINE;
+  while (GetJson("/api/status").at("state") != "current" &&
+         std::chrono::steady_clock::now() < end) {
+    poll(nullptr, 0, 20);
+  }
+  const Json photos = GetJson("/api/photos").at("photos");
+  EXPECT_FALSE(photos.empty());
+  for (const Json& photo : photos) {
+    const std::string id = photo.at("id");
+    for (const char* const file : {"/rendition", "/original"}) {
+      const HttpResponse response = Get("/photos/" + id + file);
+      EXPECT_THAT(response.body, Not(HasSubstr("secret"))) << photo;
+      EXPECT_THAT(response.body, Not(HasSubstr("SQLite format"))) << photo;
+    }
+    EXPECT_EQ(200, Get("/photos/" + id).status) << photo;
+  }
+}
+
+TEST_F(WebHostile, VolumesPulledDuringADownloadEndNothingElse) {
+  const Volume b("B", "300m");
+  Catalog onB(b);
+  AddPhoto(onB, b.Path(), "large.jpg", 5, 2010);
+  fs::resize_file("/shares/B/large.jpg", 200 << 20);
+  appliance.Handle(Plugged(b.Path()));
+  appliance.Handle(Scanned(b.Path()));
+  Merge(b);
+  ASSERT_TRUE(AwaitPhotos(4));
+  HttpConnection download(port);
+  const std::string target = Target("/shares/B/large.jpg", "/original");
+  download.Send(HttpGet(target));
+  EXPECT_EQ(200, download.ReadHeaders().status);
+  // As a disk that is pulled: the files that are open go on without it.
+  ASSERT_EQ(0, umount2("/shares/B", MNT_DETACH));
+  EXPECT_EQ(404, Get(target).status);
+  EXPECT_EQ("rendition of sea/one.jpg", Get(Target(ONE, "/rendition")).body);
+  appliance.Handle(Unplugged(b.Path()));
+  EXPECT_TRUE(AwaitPhotos(3));
+}
+
+TEST_F(WebHostile, DownloadsOfFilesThatBecomeShorterEnd) {
+  fs::resize_file(ONE, 100 << 20);
+  HttpConnection download(port);
+  download.Send(HttpGet(Target(ONE, "/original")));
+  EXPECT_EQ(200, download.ReadHeaders().status);
+  fs::resize_file(ONE, 10);
+  EXPECT_GT(std::size_t{100} << 20, download.ReadToEnd().size());
+  EXPECT_EQ(200, Get("/").status);
+}
+
+TEST_F(WebHostile, VolumesCanBeUnmountedAfterEachRequest) {
+  const Volume b("B", "10m");
+  {
+    Catalog onB(b);
+    onB.Rows().Run("PRAGMA journal_mode = WAL");
+    AddPhoto(onB, b.Path(), "b.jpg", 5, 2010);
+  }
+  appliance.Handle(Plugged(b.Path()));
+  appliance.Handle(Scanned(b.Path()));
+  Merge(b);
+  ASSERT_TRUE(AwaitPhotos(4));
+  EXPECT_EQ("rendition of b.jpg", Get(Target("/shares/B/b.jpg", "/rendition")).body);
+  EXPECT_EQ("original of b.jpg", Get(Target("/shares/B/b.jpg", "/original")).body);
+  EXPECT_THAT(OpenOn(b.Path()), IsEmpty());
+  appliance.Handle(Unplugged(b.Path()));
+  EXPECT_EQ(0, umount("/shares/B"));
+}
+
+TEST_F(WebHostile, LockedCatalogsDelayNobody) {
+  const std::string target = Target(ONE, "/rendition");
+  onA.Rows().Run("PRAGMA journal_mode = DELETE");
+  onA.Rows().Run("BEGIN EXCLUSIVE");
+  onA.Rows().Run("UPDATE Files SET lastUpdatedDate = 1");
+  HttpConnection waiting(port);
+  waiting.Send(HttpGet(target));
+  EXPECT_EQ(200, Get("/").status);
+  EXPECT_EQ(404, waiting.Read().status);
+  onA.Rows().Run("ROLLBACK");
+}
+
+TEST_F(WebHostile, UsersSeeOnlyWhatTheirServerMayRead) {
+  if (!HasOtherUsers()) {
+    GTEST_SKIP() << NO_OTHER_USERS;
+  }
+  const std::string rendition = RenditionOf(onA, a.Path(), "sea/one.jpg");
+  fs::permissions(ONE, fs::perms::owner_read);
+  fs::permissions(rendition, fs::perms::owner_read);
+  StopWeb();
+  fs::remove_all("/tmp/cache");
+  StartWeb({}, {"setpriv", "--reuid=65534", "--regid=65534", "--clear-groups"});
+  ASSERT_TRUE(AwaitPhotos(3));
+  EXPECT_EQ("rendition of top.jpg", Get(Target("/shares/A/top.jpg", "/rendition")).body);
+  EXPECT_EQ(404, Get(Target(ONE, "/rendition")).status);
+  EXPECT_EQ(404, Get(Target(ONE, "/original")).status);
+}
+
+TEST_F(WebHostile, AThousandConnectionsTakeLittleMemory) {
+  std::list<HttpConnection> clients;
+  const std::string target = Target(ONE, "/rendition");
+  for (int i = 0; i < 1'000; ++i) {
+    clients.emplace_back(port).Send(HttpGet(target, "X: " + std::string(10'000, 'x') + "\r\n"));
+    EXPECT_EQ(200, clients.back().Read().status);
+  }
+  EXPECT_EQ(200, Get("/").status);
+  if (!AreProgramsSanitized()) {
+    EXPECT_LT(Memory("VmHWM"), 96 << 10);
+  }
+}
+
+TEST_F(WebHostile, AddressesOfOtherMachinesAreRefused) {
+  const auto run = [](const Program::Arguments& options) {
+    Program::Arguments arguments{ProgramPath("zophotos-web"), "--cache", "/tmp/other"};
+    arguments.insert(arguments.end(), options.begin(), options.end());
+    return test::Run(arguments);
+  };
+  for (const char* const address : {"0.0.0.0:0", "[::]:0"}) {
+    const Outcome outcome = run({"--listen", address});
+    EXPECT_EQ(1, outcome.status);
+    EXPECT_THAT(outcome.error + outcome.output, HasSubstr("--allow-everybody"));
+  }
+  EXPECT_EQ(2, run({"--listen", "example.org:80"}).status);
+  EXPECT_EQ(2, run({"--host", "a b"}).status);
+  StopWeb();
+  fs::remove_all("/tmp/cache");
+  web = std::make_unique<Program>(
+      Program::Arguments{ProgramPath("zophotos-web"), "--cache", "/tmp/cache", "--listen",
+                         "0.0.0.0:0", "--allow-everybody", "--host", "photos.example.org"});
+  EXPECT_THAT(web->ReadLineWith("listening on"), HasSubstr("http://0.0.0.0:"));
+}
+
+TEST_F(WebHostile, OneCacheHasOneServer) {
+  const Outcome outcome =
+      test::Run({ProgramPath("zophotos-web"), "--listen", "127.0.0.1:0", "--cache", "/tmp/cache"});
+  EXPECT_EQ(1, outcome.status);
+  EXPECT_TRUE(AwaitPhotos(3));
+}
+
+TEST_F(WebHostile, SocketsOfSystemdAreServed) {
+  StopWeb();
+  web = std::make_unique<Program>(
+      Program::Arguments{"systemd-socket-activate", "--listen=127.0.0.1:8480",
+                         ProgramPath("zophotos-web"), "--cache", "/tmp/cache"});
+  web->ReadLineWith("Listening on");
+  port = 8480;
+  EXPECT_TRUE(AwaitPhotos(3));
+}
+
+} // namespace
+} // namespace orva::test

@@ -1,0 +1,331 @@
+// The directory of the snapshot: what is found there at the start, and after a crash or kill.
+
+#include "SnapshotTest.h"
+
+#include <gmock/gmock.h>
+
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <csignal>
+#include <ctime>
+#include <filesystem>
+#include <fstream>
+#include <thread>
+
+namespace orva::test {
+namespace {
+
+namespace fs = std::filesystem;
+using ::testing::ElementsAre;
+using ::testing::HasSubstr;
+using ::testing::IsEmpty;
+
+const std::string A = "/shares/A/";
+
+class CachedSnapshot : public SnapshotTest {
+protected:
+  void SetUp() override {
+    merged_.emplace(MERGED);
+    folder_ = merged_->AddVolume(A);
+    merged_->AddFile(folder_, "1.jpg", 1, A);
+  }
+
+  /// The files in the directory.
+  static std::vector<std::string> Files() {
+    std::vector<std::string> names;
+    for (const auto& entry : fs::directory_iterator(CACHE)) {
+      names.push_back(entry.path().filename().string());
+    }
+    std::ranges::sort(names);
+    return names;
+  }
+
+  void Stop() {
+    reader_.reset();
+    snapshot_.reset();
+  }
+
+  /// The path of the present snapshot, which no process uses any more.
+  std::string Leave() {
+    Start();
+    Update();
+    std::string file = snapshot_->File();
+    Stop();
+    return file;
+  }
+
+  /// Starts again and expects that the snapshot is built again.
+  void ExpectRebuilt() {
+    Start();
+    EXPECT_THAT(Names(), IsEmpty());
+    EXPECT_TRUE(Update());
+    EXPECT_THAT(Names(), ElementsAre("1.jpg"));
+  }
+
+  std::optional<MergedFile> merged_;
+  std::int64_t folder_ = 0;
+};
+
+TEST_F(CachedSnapshot, IsForItsOwnerOnly) {
+  Start();
+  struct stat status {};
+  ASSERT_EQ(stat(CACHE.c_str(), &status), 0);
+  EXPECT_EQ(status.st_mode & 0777U, 0700U);
+  Stop();
+  ASSERT_EQ(chmod(CACHE.c_str(), 0755), 0);
+  Start();
+  ASSERT_EQ(stat(CACHE.c_str(), &status), 0);
+  EXPECT_EQ(status.st_mode & 0777U, 0700U);
+}
+
+TEST_F(CachedSnapshot, IsReadAgainWithoutReadingAnUnchangedDatabase) {
+  const std::string file = Leave();
+  Start();
+  EXPECT_EQ(snapshot_->File(), file);
+  EXPECT_THAT(Names(), ElementsAre("1.jpg"));
+  EXPECT_FALSE(Update());
+  EXPECT_EQ(snapshot_->File(), file);
+  EXPECT_EQ(snapshot_->Status().state, web::SnapshotStatus::State::Current);
+}
+
+TEST_F(CachedSnapshot, ContinuesAfterChangesInTheMeantime) {
+  const std::string file = Leave();
+  merged_->AddFile(folder_, "2.jpg", 2, A);
+  Start();
+  EXPECT_THAT(Names(), ElementsAre("1.jpg"));
+  EXPECT_TRUE(Update());
+  EXPECT_EQ(snapshot_->File(), file);
+  EXPECT_THAT(Names(), ElementsAre("2.jpg", "1.jpg"));
+}
+
+TEST_F(CachedSnapshot, TheVersionGrowsOverRestarts) {
+  Start();
+  Update();
+  const std::int64_t version = reader_->Version();
+  Stop();
+  fs::remove_all(CACHE);
+  Start();
+  Update();
+  EXPECT_GT(reader_->Version(), version);
+}
+
+TEST_F(CachedSnapshot, ASecondProcessIsRefused) {
+  Start();
+  try {
+    const web::Snapshot second(CACHE, FindPath());
+    FAIL();
+  } catch (const std::runtime_error& error) {
+    EXPECT_EQ(std::string(error.what()),
+              "cannot use the cache directory /tmp/cache: another process uses it");
+  }
+}
+
+TEST_F(CachedSnapshot, ADirectoryThatCannotBeUsedIsAnError) {
+  for (const char* const path : {"/tmp/missing/cache", "/dev/null"}) {
+    EXPECT_THROW(web::Snapshot(path, FindPath()), std::runtime_error) << path;
+  }
+  fs::create_directories(CACHE);
+  fs::create_symlink("/tmp/elsewhere", CACHE + "/lock");
+  EXPECT_THROW(web::Snapshot(CACHE, FindPath()), std::runtime_error);
+  EXPECT_FALSE(fs::exists("/tmp/elsewhere"));
+}
+
+TEST_F(CachedSnapshot, LeavesOtherFilesAlone) {
+  fs::create_directories(CACHE);
+  std::ofstream(CACHE + "/letter.txt") << "text";
+  Leave();
+  EXPECT_THAT(Files(), ::testing::Contains("letter.txt"));
+}
+
+TEST_F(CachedSnapshot, WhatIsNoSnapshotIsRemoved) {
+  fs::create_directories(CACHE + "/snapshot-3.db");
+  std::ofstream(CACHE + "/snapshot-4.db") << std::string(100'000, 'x');
+  std::ofstream(CACHE + "/snapshot-5.db") << "";
+  fs::create_symlink("/etc/passwd", CACHE + "/snapshot-6.db");
+  fs::create_symlink("/tmp", CACHE + "/snapshot-7.db");
+  std::ofstream(CACHE + "/snapshot-8.db-wal") << "wal";
+  std::ofstream(CACHE + "/snapshot-99999999999999999999999.db") << "x";
+  fs::copy_file(MERGED, CACHE + "/snapshot-9.db");
+  ExpectRebuilt();
+  Stop();
+  EXPECT_EQ(Files().size(), 2U); // the lock and the snapshot
+  EXPECT_TRUE(fs::exists("/etc/passwd"));
+  EXPECT_TRUE(fs::exists(MERGED));
+}
+
+TEST_F(CachedSnapshot, OneOfAnotherVersionIsReplaced) {
+  SQLite::Database(Leave(), SQLite::OPEN_READWRITE).exec("PRAGMA user_version = 77");
+  ExpectRebuilt();
+}
+
+TEST_F(CachedSnapshot, OneOfAnotherStartOfTheSystemIsReplaced) {
+  SQLite::Database(Leave(), SQLite::OPEN_READWRITE).exec("UPDATE State SET boot = 'other'");
+  ExpectRebuilt();
+}
+
+TEST_F(CachedSnapshot, AnIncompleteOneIsReplaced) {
+  SQLite::Database(Leave(), SQLite::OPEN_READWRITE).exec("UPDATE State SET isComplete = 0");
+  ExpectRebuilt();
+}
+
+TEST_F(CachedSnapshot, ATruncatedOneIsReplaced) {
+  const std::string file = Leave();
+  fs::resize_file(file, 4096);
+  Start();
+  Update();
+  try {
+    Names();
+  } catch (const std::exception&) {
+  }
+  Update();
+  EXPECT_THAT(Names(), ElementsAre("1.jpg"));
+}
+
+TEST_F(CachedSnapshot, ADamagedPageIsNoticedByReadersAndReplaced) {
+  merged_->Run("BEGIN");
+  for (int i = 0; i < 2'000; ++i) {
+    merged_->AddFile(folder_, "Photo_" + std::to_string(i) + ".jpg", i, A);
+  }
+  merged_->Run("COMMIT");
+  const std::string file = Leave();
+  const auto size = fs::file_size(file);
+  for (std::uintmax_t page = 2; page < size / 4096; ++page) {
+    std::fstream bytes(file, std::ios::in | std::ios::out | std::ios::binary);
+    bytes.seekp(static_cast<std::streamoff>(page * 4096));
+    bytes << std::string(4096, '\xA5');
+  }
+  Start();
+  for (int i = 0; i < 5; ++i) {
+    Update();
+    try {
+      ReadAll(*snapshot_);
+      Names(WithWords("photo"));
+    } catch (const std::exception&) {
+    }
+  }
+  EXPECT_EQ(snapshot_->Status().state, web::SnapshotStatus::State::Current);
+  EXPECT_EQ(ReadAll(*snapshot_), ReadAll(*BuildAnother()));
+  EXPECT_EQ(Names(WithWords("photo 1999")).size(), 1U);
+}
+
+TEST_F(CachedSnapshot, ReadersOfTheFormerFileContinueWithTheNewOne) {
+  Start();
+  Update();
+  web::SnapshotReader former(*snapshot_);
+  EXPECT_EQ(former.Photos({}, std::nullopt, 10).size(), 1U);
+  path_ = "/tmp/other/zophotos.db";
+  MergedFile other(path_);
+  Update();
+  EXPECT_THAT(former.Photos({}, std::nullopt, 10), IsEmpty());
+}
+
+/// Readers in threads see states that agree in themselves while the snapshot changes and is
+/// replaced.
+TEST_F(CachedSnapshot, ReadersInThreadsSeeConsistentStates) {
+  Start();
+  Update();
+  std::atomic<bool> end = false;
+  std::vector<std::jthread> threads;
+  std::atomic<int> reads = 0;
+  threads.reserve(3);
+  for (int i = 0; i < 3; ++i) {
+    threads.emplace_back([&] {
+      web::SnapshotReader reader(*snapshot_);
+      std::int64_t version = 0;
+      while (!end) {
+        const std::size_t searched = reader.Photos(WithWords("jpg"), std::nullopt, 1000).size();
+        EXPECT_TRUE(searched == 1 || searched % 10 == 0) << searched;
+        const std::int64_t next = reader.Version();
+        EXPECT_GE(next, version);
+        version = next;
+        ++reads;
+      }
+    });
+  }
+  for (int round = 0; round < 30; ++round) {
+    merged_->Run("BEGIN");
+    merged_->Run("DELETE FROM Files");
+    for (int i = 0; i < 10 * (round % 5); ++i) {
+      merged_->AddFile(folder_, std::to_string(i) + ".jpg", i, A);
+    }
+    merged_->Run("COMMIT");
+    if (round % 7 == 6) {
+      fs::copy_file(MERGED, "/tmp/merged/copy");
+      merged_.reset();
+      fs::rename("/tmp/merged/copy", MERGED);
+      merged_.emplace(MERGED);
+    }
+    Update();
+    for (const int before = reads; reads < before + 5;) {
+      std::this_thread::yield();
+    }
+  }
+  end = true;
+}
+
+/// Kills a process that builds or updates the snapshot after `microseconds`. Returns whether it was
+/// still at work.
+bool KillAfter(long microseconds, const std::function<void()>& work) {
+  const pid_t child = fork();
+  if (child == 0) {
+    timer_t timer{};
+    sigevent event{};
+    event.sigev_notify = SIGEV_SIGNAL;
+    event.sigev_signo = SIGKILL;
+    const itimerspec after{.it_interval = {},
+                           .it_value = {.tv_sec = microseconds / 1'000'000,
+                                        .tv_nsec = microseconds % 1'000'000 * 1000}};
+    if (timer_create(CLOCK_MONOTONIC, &event, &timer) == 0 &&
+        timer_settime(timer, 0, &after, nullptr) == 0) {
+      work();
+    }
+    _exit(0);
+  }
+  int status = 0;
+  waitpid(child, &status, 0);
+  return WIFSIGNALED(status);
+}
+
+TEST_F(CachedSnapshot, IsCompleteAfterAKillAtAnyInstantOfTheBuild) {
+  merged_->Run("BEGIN");
+  for (int i = 0; i < 3'000; ++i) {
+    merged_->AddFile(folder_, "Photo_" + std::to_string(i) + ".jpg", i, A);
+  }
+  merged_->Run("COMMIT");
+  const Shown expected = ReadAll(*BuildAnother());
+  long delay = 100;
+  for (bool isKilled = true; isKilled; delay += delay / 4) {
+    isKilled = KillAfter(delay, [this] { web::Snapshot(CACHE, FindPath()).Update(); });
+    Start();
+    EXPECT_THAT(Names().size(), ::testing::AnyOf(0U, 1000U));
+    Update();
+    ASSERT_EQ(ReadAll(*snapshot_), expected) << delay;
+    Stop();
+    fs::remove_all(CACHE);
+  }
+}
+
+TEST_F(CachedSnapshot, ContinuesAfterAKillAtAnyInstantOfAnUpdate) {
+  Leave();
+  long delay = 100;
+  int number = 0;
+  for (bool isKilled = true; isKilled; delay += delay / 4) {
+    merged_->Run("BEGIN");
+    merged_->Run("DELETE FROM Files WHERE file_id % 3 = 0");
+    for (int i = 0; i < 300; ++i) {
+      ++number;
+      merged_->AddFile(folder_, "Photo_" + std::to_string(number) + ".jpg", number, A);
+    }
+    merged_->Run("COMMIT");
+    isKilled = KillAfter(delay, [this] { web::Snapshot(CACHE, FindPath()).Update(); });
+    Start();
+    Update();
+    ASSERT_EQ(ReadAll(*snapshot_), ReadAll(*BuildAnother())) << delay;
+    Stop();
+  }
+}
+
+} // namespace
+} // namespace orva::test

@@ -1,0 +1,398 @@
+#include "Router.h"
+
+#include "FileName.h"
+#include "Json.h"
+#include "Query.h"
+#include "zophotos-web/Assets.h"
+
+#include "zophotos/Activity.h"
+
+#include <algorithm>
+#include <optional>
+#include <utility>
+
+namespace orva::web {
+namespace {
+
+constexpr std::size_t PAGE = 100; // photos or folders
+constexpr std::string_view API = "/api/";
+
+constexpr int NOT_MODIFIED = 304;
+constexpr int BAD_REQUEST = 400;
+constexpr int NOT_FOUND = 404;
+
+/// A document whose content changes: nobody keeps it.
+Response Document(std::string type, std::string text) {
+  return {
+      .type = std::move(type), .body = std::move(text), .headers = {{"Cache-Control", "no-store"}}};
+}
+
+Response Html(std::string text) {
+  return Document("text/html; charset=utf-8", std::move(text));
+}
+
+Response JsonText(const Json& document) {
+  return Document("application/json", ToText(document));
+}
+
+Response NoPhoto(const Target& target) {
+  return Router::Refuse(NOT_FOUND, target.path, "There is no such photo.");
+}
+
+Response NoFolder(const Target& target) {
+  return Router::Refuse(NOT_FOUND, target.path, "There is no such folder.");
+}
+
+/// A response that is kept, but only used after the server was asked whether it is still current.
+std::vector<std::pair<std::string, std::string>> KeptHeaders(std::string_view tag) {
+  return {{"ETag", std::string(tag)}, {"Cache-Control", "private, no-cache"}};
+}
+
+Response NotModified(std::string_view tag) {
+  return {.status = NOT_MODIFIED, .headers = KeptHeaders(tag)};
+}
+
+Response ServeAsset(const Asset& asset, const Request& request) {
+  if (Matches(request.ifNoneMatch, asset.etag)) {
+    return NotModified(asset.etag);
+  }
+  return {.type = std::string(asset.type),
+          .body = std::string(asset.content),
+          .headers = KeptHeaders(asset.etag)};
+}
+
+/// Removes `prefix` from `text`. Returns whether it was there.
+bool Skip(std::string_view& text, std::string_view prefix) {
+  if (!text.starts_with(prefix)) {
+    return false;
+  }
+  text.remove_prefix(prefix.size());
+  return true;
+}
+
+/// Removes one of the two ends of a list that has one item more than wanted. Returns whether it
+/// had.
+template <typename Item>
+bool Trim(std::vector<Item>& items, std::size_t count, bool atBegin) {
+  const bool more = items.size() > count;
+  if (more) {
+    items.erase(atBegin ? items.begin() : items.end() - 1);
+  }
+  return more;
+}
+
+template <typename Item>
+Json Array(const std::vector<Item>& items) {
+  Json array = Json::array();
+  for (const Item& item : items) {
+    array.push_back(ToJson(item));
+  }
+  return array;
+}
+
+Json IdOf(const std::vector<Photo>& photos) {
+  return photos.empty() ? Json() : Json(std::to_string(photos.front().id));
+}
+
+/// The path of the folder that a list of folders continues after.
+std::string PathAfter(const Readers::Lease& reader, const std::optional<std::int64_t>& folder) {
+  const auto found = folder ? reader->FindFolder(*folder) : std::nullopt;
+  return found ? found->path : "";
+}
+
+/// The part of the file that the request asks for.
+Response ServeFile(VolumeFile file, const Request& request, const std::string& type) {
+  Response response{.type = type, .headers = KeptHeaders(file.tag)};
+  const bool isRanged =
+      !request.range.empty() && (request.ifRange.empty() || request.ifRange == file.tag);
+  const auto range = isRanged ? ParseRange(request.range, file.size) : std::nullopt;
+  const ByteRange part = range.value_or(ByteRange());
+  const std::string size = std::to_string(file.size);
+  response.headers.emplace_back("Accept-Ranges", "bytes");
+  if (!range) {
+    response.body = FilePart{.file = std::move(file.file), .offset = 0, .size = file.size};
+  } else if (part.count == 0) {
+    response.status = 416;
+    response.headers.emplace_back("Content-Range", "bytes */" + size);
+  } else {
+    response.status = 206;
+    response.headers.emplace_back("Content-Range", "bytes " + std::to_string(part.first) + '-' +
+                                                       std::to_string(part.first + part.count - 1) +
+                                                       '/' + size);
+    response.body =
+        FilePart{.file = std::move(file.file), .offset = part.first, .size = part.count};
+  }
+  return response;
+}
+
+} // namespace
+
+Response Router::Answer(const Request& request) {
+  std::string_view path = request.target.path;
+  try {
+    if (Skip(path, API)) {
+      return AnswerJson(request, path);
+    }
+    if (const Asset* const asset = FindAsset(path)) {
+      return ServeAsset(*asset, request);
+    }
+    return AnswerPage(request, path);
+  } catch (const BadQuery& error) {
+    return Refuse(BAD_REQUEST, request.target.path, error.what());
+  }
+}
+
+Response Router::Refuse(int status, std::string_view path, const std::string& reason) {
+  Response response =
+      path.starts_with(API) ? JsonText({{"error", reason}}) : Html(ErrorPage(status, reason));
+  response.status = status;
+  return response;
+}
+
+Response Router::AnswerPage(const Request& request, std::string_view path) {
+  const Target& target = request.target;
+  if (path == "/") {
+    return NewestView(target);
+  }
+  if (path == "/search") {
+    return SearchView(target);
+  }
+  if (path == "/folders") {
+    return FoldersView(target, std::nullopt);
+  }
+  if (path == "/volumes") {
+    return Html(VolumesPage(MakeSite()));
+  }
+  if (Skip(path, "/folders/")) {
+    const auto id = ParseNumber(path);
+    return id ? FoldersView(target, id) : NoFolder(target);
+  }
+  if (Skip(path, "/photos/")) {
+    const std::size_t end = std::min(path.find('/'), path.size());
+    const auto id = ParseNumber(path.substr(0, end));
+    return id ? AnswerPhoto(request, *id, path.substr(end)) : NoPhoto(target);
+  }
+  return Refuse(NOT_FOUND, target.path, "There is no such page.");
+}
+
+Response Router::AnswerPhoto(const Request& request, PhotoId id, std::string_view rest) {
+  if (rest.empty()) {
+    return PhotoView(request.target, id);
+  }
+  if (rest == "/rendition") {
+    return Rendition(request, id);
+  }
+  if (rest == "/original") {
+    return Original(request, id);
+  }
+  return Refuse(NOT_FOUND, request.target.path, "There is no such page.");
+}
+
+Response Router::AnswerJson(const Request& request, std::string_view path) {
+  const Target& target = request.target;
+  if (path == "photos") {
+    return PhotosJson(target);
+  }
+  if (path == "folders") {
+    return FoldersJson(target);
+  }
+  if (path == "months") {
+    return MonthsJson(target);
+  }
+  if (path == "volumes") {
+    return VolumesJson();
+  }
+  if (path == "status") {
+    return StatusJson();
+  }
+  if (path == "events") {
+    // A proxy must not wait until it has more.
+    return {.type = "text/event-stream",
+            .body = EventStream(),
+            .headers = {{"Cache-Control", "no-store"}, {"X-Accel-Buffering", "no"}}};
+  }
+  if (Skip(path, "photos/")) {
+    const auto id = ParseNumber(path);
+    return id ? PhotoJson(target, *id) : NoPhoto(target);
+  }
+  if (Skip(path, "folders/")) {
+    const auto id = ParseNumber(path);
+    return id ? FolderJson(*id) : NoFolder(target);
+  }
+  return Refuse(NOT_FOUND, target.path, "There is no such resource.");
+}
+
+Response Router::NewestView(const Target& target) {
+  return Html(NewestPage(MakeSite(), MakeList(target, {}, PAGE)));
+}
+
+Response Router::SearchView(const Target& target) {
+  const Selection selection = ParseSelection(target);
+  const Filter filter = ToFilter(selection);
+  const std::vector<Month> months = Readers::Lease(readers_)->Months({});
+  return Html(SearchPage(MakeSite(), selection, months, MakeList(target, filter, PAGE)));
+}
+
+Response Router::FoldersView(const Target& target, std::optional<std::int64_t> folder) {
+  FolderView view;
+  {
+    const Readers::Lease reader(readers_);
+    if (folder) {
+      view.folder = reader->FindFolder(*folder);
+      if (!view.folder) {
+        return NoFolder(target);
+      }
+      view.ancestors = reader->Ancestors(*folder);
+    }
+    view.folders = reader->Folders(folder.value_or(-1),
+                                   PathAfter(reader, ParseId(target, "after_folder")), PAGE + 1);
+    view.hasMoreFolders = Trim(view.folders, PAGE, false);
+  }
+  if (folder) {
+    view.list = MakeList(target, {.folder = folder, .volume = {}, .words = {}, .times = {}}, PAGE);
+  }
+  return Html(FolderPage(MakeSite(), view));
+}
+
+Response Router::PhotoView(const Target& target, PhotoId id) {
+  web::PhotoView view;
+  view.selection = ParseSelection(target);
+  {
+    const Filter filter = ToFilter(view.selection);
+    const Readers::Lease reader(readers_);
+    auto photo = reader->Find(id);
+    if (!photo) {
+      return NoPhoto(target);
+    }
+    view.photo = std::move(*photo);
+    const auto newer = reader->PhotosAfter(filter, id, 1);
+    const auto older = reader->Photos(filter, id, 1);
+    view.newer = newer.empty() ? std::nullopt : std::optional(newer.front().id);
+    view.older = older.empty() ? std::nullopt : std::optional(older.front().id);
+  }
+  return Html(PhotoPage(MakeSite(), view));
+}
+
+Response Router::Rendition(const Request& request, PhotoId id) {
+  const auto photo = Readers::Lease(readers_)->Find(id);
+  if (!photo) {
+    return NoPhoto(request.target);
+  }
+  auto file = files_.OpenRendition(*photo);
+  if (!file) {
+    return Refuse(NOT_FOUND, request.target.path, "The rendition of this photo cannot be read.");
+  }
+  return Matches(request.ifNoneMatch, file->tag)
+             ? NotModified(file->tag)
+             : Response{.type = "image/jpeg",
+                        .body = FilePart{.file = std::move(file->file), .size = file->size},
+                        .headers = KeptHeaders(file->tag)};
+}
+
+Response Router::Original(const Request& request, PhotoId id) {
+  const auto photo = Readers::Lease(readers_)->Find(id);
+  if (!photo) {
+    return NoPhoto(request.target);
+  }
+  auto file = files_.OpenOriginal(*photo);
+  if (!file) {
+    return Refuse(NOT_FOUND, request.target.path, "This photo cannot be read.");
+  }
+  if (Matches(request.ifNoneMatch, file->tag)) {
+    return NotModified(file->tag);
+  }
+  // The browser saves it, whatever it is.
+  Response response = ServeFile(std::move(*file), request, "application/octet-stream");
+  response.headers.emplace_back("Content-Disposition", Attachment(photo->name));
+  return response;
+}
+
+Response Router::PhotosJson(const Target& target) {
+  const PhotoList list = MakeList(target, ToFilter(ParseSelection(target)), ParseCount(target));
+  const bool isNewer = ParseId(target, "after").has_value();
+  return JsonText(
+      {{"photos", Array(list.photos)}, {"more", isNewer ? list.hasNewer : list.hasOlder}});
+}
+
+Response Router::PhotoJson(const Target& target, PhotoId id) {
+  const Filter filter = ToFilter(ParseSelection(target));
+  const Readers::Lease reader(readers_);
+  const auto photo = reader->Find(id);
+  if (!photo) {
+    return NoPhoto(target);
+  }
+  Json document = ToJson(*photo);
+  document["newer"] = IdOf(reader->PhotosAfter(filter, id, 1));
+  document["older"] = IdOf(reader->Photos(filter, id, 1));
+  return JsonText(document);
+}
+
+Response Router::FoldersJson(const Target& target) {
+  const std::size_t count = ParseCount(target);
+  const Readers::Lease reader(readers_);
+  auto folders = reader->Folders(ParseId(target, "parent").value_or(-1),
+                                 PathAfter(reader, ParseId(target, "after")), count + 1);
+  const bool more = Trim(folders, count, false);
+  return JsonText({{"folders", Array(folders)}, {"more", more}});
+}
+
+Response Router::FolderJson(std::int64_t id) {
+  const Readers::Lease reader(readers_);
+  const auto folder = reader->FindFolder(id);
+  if (!folder) {
+    return Refuse(NOT_FOUND, API, "There is no such folder.");
+  }
+  Json document = ToJson(*folder);
+  document["ancestors"] = Array(reader->Ancestors(id));
+  return JsonText(document);
+}
+
+Response Router::MonthsJson(const Target& target) {
+  const Filter filter = ToFilter(ParseSelection(target));
+  return JsonText({{"months", Array(Readers::Lease(readers_)->Months(filter))}});
+}
+
+Response Router::VolumesJson() {
+  return JsonText({{"volumes", Array(MakeSite().volumes)}});
+}
+
+Response Router::StatusJson() {
+  Json document = ToJson(snapshot_.Status());
+  document["version"] = Readers::Lease(readers_)->Version();
+  return JsonText(document);
+}
+
+/// What all pages show.
+Site Router::MakeSite() {
+  return {.snapshot = snapshot_.Status(),
+          .volumes = Combine(Readers::Lease(readers_)->Volumes(), zophotos::ReadActivity())};
+}
+
+/// The part of a list that the request asks for: the newest photos, those before one, or those
+/// after one.
+PhotoList Router::MakeList(const Target& target, const Filter& filter, std::size_t count) {
+  const auto before = ParseId(target, "before");
+  const auto after = ParseId(target, "after");
+  if (before && after) {
+    throw BadQuery("The parameters before and after cannot be combined.");
+  }
+  PhotoList list;
+  const Readers::Lease reader(readers_);
+  if (after) {
+    list.photos = reader->PhotosAfter(filter, *after, count + 1);
+    list.hasNewer = Trim(list.photos, count, true);
+    const PhotoId last = list.photos.empty() ? *after : list.photos.back().id;
+    list.hasOlder = !reader->Photos(filter, last, 1).empty();
+  } else {
+    list.photos = reader->Photos(filter, before, count + 1);
+    list.hasOlder = Trim(list.photos, count, false);
+    if (before) {
+      const PhotoId first = list.photos.empty() ? *before : list.photos.front().id;
+      list.hasNewer = !reader->PhotosAfter(filter, first, 1).empty();
+    }
+  }
+  files_.Expect(list.photos);
+  return list;
+}
+
+} // namespace orva::web

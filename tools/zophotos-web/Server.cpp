@@ -1,0 +1,355 @@
+#include "Server.h"
+
+#include <microhttpd.h>
+
+#include <sys/resource.h>
+
+#include <algorithm>
+#include <array>
+#include <chrono>
+#include <condition_variable>
+#include <mutex>
+#include <optional>
+#include <stdexcept>
+#include <string_view>
+#include <utility>
+
+namespace orva::web {
+namespace {
+
+constexpr std::size_t CONNECTION_MEMORY = 16 << 10; // bytes: bounds the headers of a request
+constexpr unsigned SILENCE = 30;                    // seconds
+
+/// What all responses have. Nothing may be loaded from elsewhere, and no other site may show or
+/// read what we send.
+constexpr std::array<std::pair<const char*, const char*>, 7> SECURITY{
+    {{"Content-Security-Policy", "default-src 'self'; object-src 'none'; base-uri 'none'; "
+                                 "form-action 'self'; frame-ancestors 'none'"},
+     {"X-Content-Type-Options", "nosniff"},
+     {"X-Frame-Options", "DENY"},
+     {"Referrer-Policy", "no-referrer"},
+     {"Cross-Origin-Resource-Policy", "same-origin"},
+     {"Cross-Origin-Opener-Policy", "same-origin"},
+     {"Permissions-Policy", "camera=(), geolocation=(), microphone=()"}}};
+
+struct ResponseReleaser {
+  void operator()(MHD_Response* response) const noexcept { MHD_destroy_response(response); }
+};
+using MhdResponse = std::unique_ptr<MHD_Response, ResponseReleaser>;
+
+/// A request, from its first line until the response is sent.
+struct Exchange {
+  std::string text;                 ///< the target as it was sent
+  std::optional<Request> request{}; ///< nothing until it is checked
+};
+
+/// The headers that matter to us.
+struct Headers {
+  int hosts = 0;
+  std::string host;
+  bool areMalformed = false;
+  bool hasBody = false;
+  bool isFromOtherSite = false;
+  bool isNavigation = false;
+  Request request{};
+};
+
+bool IsEqual(std::string_view text, std::string_view lower) {
+  return std::ranges::equal(text, lower, [](char a, char b) {
+    return (a >= 'A' && a <= 'Z' ? static_cast<char>(a - 'A' + 'a') : a) == b;
+  });
+}
+
+bool IsNameCharacter(char c) {
+  return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9') || c == '-' ||
+         c == '_';
+}
+
+MHD_Result Collect(void* headers, MHD_ValueKind /*kind*/, const char* key, std::size_t keySize,
+                   const char* value, std::size_t valueSize) {
+  Headers& all = *static_cast<Headers*>(headers);
+  const std::string_view name(key, keySize);
+  const std::string_view text(value == nullptr ? "" : value, valueSize);
+  // Others may read "Content-Length :" as we do not.
+  all.areMalformed = all.areMalformed || !std::ranges::all_of(name, IsNameCharacter);
+  if (IsEqual(name, "host")) {
+    ++all.hosts;
+    all.host = text;
+  } else if (IsEqual(name, "transfer-encoding") ||
+             (IsEqual(name, "content-length") && text != "0")) {
+    all.hasBody = true;
+  } else if (IsEqual(name, "sec-fetch-site")) {
+    all.isFromOtherSite = text == "cross-site" || text == "same-site";
+  } else if (IsEqual(name, "sec-fetch-mode")) {
+    all.isNavigation = text == "navigate";
+  } else if (IsEqual(name, "if-none-match")) {
+    all.request.ifNoneMatch = text;
+  } else if (IsEqual(name, "if-range")) {
+    all.request.ifRange = text;
+  } else if (IsEqual(name, "range")) {
+    all.request.range = text;
+  }
+  return MHD_YES;
+}
+
+void ReleaseText(void* text) {
+  std::unique_ptr<std::string>(static_cast<std::string*>(text)).reset();
+}
+
+MhdResponse MakeTextBody(std::string text) {
+  auto owner = std::make_unique<std::string>(std::move(text));
+  MhdResponse response(MHD_create_response_from_buffer_with_free_callback_cls(
+      owner->size(), owner->data(), &ReleaseText, owner.get()));
+  if (response) {
+    static_cast<void>(owner.release()); // by ReleaseText
+  }
+  return response;
+}
+
+MhdResponse MakeFileBody(FilePart part) {
+  MhdResponse response(
+      MHD_create_response_from_fd_at_offset64(part.size, part.file.Get(), part.offset));
+  if (response) {
+    static_cast<void>(part.file.Release());
+  }
+  return response;
+}
+
+Connections::Connection* ConnectionOf(MHD_Connection* connection) {
+  const MHD_ConnectionInfo* const info =
+      MHD_get_connection_info(connection, MHD_CONNECTION_INFO_SOCKET_CONTEXT);
+  return static_cast<Connections::Connection*>(info->socket_context);
+}
+
+int SocketOf(MHD_Connection* connection) {
+  return MHD_get_connection_info(connection, MHD_CONNECTION_INFO_CONNECTION_FD)->connect_fd;
+}
+
+/// As many connections as this process may have open files for: each may send a file.
+unsigned ConnectionLimit(unsigned wanted) {
+  constexpr rlim_t RESERVE = 64;
+  rlimit limit{};
+  if (getrlimit(RLIMIT_NOFILE, &limit) != 0) {
+    return wanted;
+  }
+  const rlim_t needed = 2 * rlim_t{wanted} + RESERVE;
+  if (limit.rlim_cur < needed) {
+    limit.rlim_cur = std::min(limit.rlim_max, needed);
+    setrlimit(RLIMIT_NOFILE, &limit);
+  }
+  const rlim_t possible = limit.rlim_cur > RESERVE ? (limit.rlim_cur - RESERVE) / 2 : 1;
+  return static_cast<unsigned>(std::clamp<rlim_t>(possible, Server::THREADS, wanted));
+}
+
+/// Calls `tick` each second until the thread is to stop.
+void RunClock(const std::stop_token& stop, const std::function<void()>& tick) {
+  std::mutex mutex;
+  std::unique_lock lock(mutex);
+  std::condition_variable_any changed;
+  while (!changed.wait_for(lock, stop, std::chrono::seconds(1),
+                           [&] { return stop.stop_requested(); })) {
+    tick();
+  }
+}
+
+/// What is wrong with a request, for the client.
+struct Refusal {
+  int status;
+  const char* reason;
+};
+
+/// Why a request is refused; nothing if it is not.
+std::optional<Refusal> Check(const Headers& headers, const AllowedHosts& hosts, int socket,
+                             std::string_view method) {
+  if (headers.hosts != 1) {
+    return Refusal{MHD_HTTP_BAD_REQUEST, "The request must have one Host header."};
+  }
+  if (!hosts.Contains(headers.host) && !AllowedHosts::IsLocalAddress(headers.host, socket)) {
+    return Refusal{MHD_HTTP_MISDIRECTED_REQUEST,
+                   "This server is not known by the name in the Host header. The option --host "
+                   "gives it another name."};
+  }
+  if (headers.areMalformed) {
+    return Refusal{MHD_HTTP_BAD_REQUEST, "A header of the request is malformed."};
+  }
+  if (headers.hasBody) {
+    return Refusal{MHD_HTTP_BAD_REQUEST, "A request must not have a body."};
+  }
+  if (method != "GET" && method != "HEAD") {
+    return Refusal{MHD_HTTP_METHOD_NOT_ALLOWED, "Only GET and HEAD are allowed."};
+  }
+  if (headers.isFromOtherSite && !headers.isNavigation) {
+    return Refusal{MHD_HTTP_FORBIDDEN, "Pages of other sites may not use this server."};
+  }
+  return std::nullopt;
+}
+
+} // namespace
+
+struct Server::Calls {
+  static void* Begin(void* /*server*/, const char* target,
+                     MHD_Connection* /*connection*/) noexcept {
+    try {
+      return std::make_unique<Exchange>(Exchange{.text = target}).release(); // until End
+    } catch (const std::bad_alloc&) {
+      return nullptr;
+    }
+  }
+
+  static void End(void* /*server*/, MHD_Connection* connection, void** exchange,
+                  MHD_RequestTerminationCode /*code*/) noexcept {
+    std::unique_ptr<Exchange>(static_cast<Exchange*>(*exchange)).reset();
+    *exchange = nullptr;
+    if (Connections::Connection* const current = ConnectionOf(connection)) {
+      current->ExpectRequest();
+    }
+  }
+
+  static void Notify(void* server, MHD_Connection* connection, void** context,
+                     MHD_ConnectionNotificationCode code) noexcept {
+    Server& self = *static_cast<Server*>(server);
+    if (code == MHD_CONNECTION_NOTIFY_STARTED) {
+      *context = &self.connections_.Add(SocketOf(connection));
+    } else if (*context != nullptr) {
+      self.connections_.Remove(*static_cast<Connections::Connection*>(*context));
+      *context = nullptr;
+    }
+  }
+
+  /// Called when the headers of a request are read, and again when it is complete.
+  static MHD_Result Handle(void* server, MHD_Connection* connection, const char* /*url*/,
+                           const char* method, const char* /*version*/, const char* /*upload*/,
+                           std::size_t* /*uploadSize*/, void** exchange) noexcept {
+    Server& self = *static_cast<Server*>(server);
+    auto* const current = static_cast<Exchange*>(*exchange);
+    if (current == nullptr) {
+      return MHD_NO; // no memory: ends the connection
+    }
+    try {
+      if (current->request) {
+        return Send(self, connection, Answer(self, *current->request));
+      }
+      const auto refusal = CheckRequest(self, connection, method, *current);
+      return refusal ? Refuse(self, connection, *refusal, current->text) : MHD_YES;
+    } catch (const std::exception& error) {
+      self.handlers_.log(error.what());
+    }
+    return MHD_NO;
+  }
+
+  /// Fills the request in.
+  static std::optional<Refusal> CheckRequest(const Server& self, MHD_Connection* connection,
+                                             std::string_view method, Exchange& exchange) {
+    Headers headers;
+    MHD_get_connection_values_n(connection, MHD_HEADER_KIND, &Collect, &headers);
+    auto refusal = Check(headers, self.hosts_, SocketOf(connection), method);
+    auto target = ParseTarget(exchange.text);
+    if (!refusal && !target) {
+      refusal = {MHD_HTTP_BAD_REQUEST, "The address is malformed."};
+    }
+    if (!refusal) {
+      headers.request.target = std::move(*target);
+      exchange.request = std::move(headers.request);
+    }
+    return refusal;
+  }
+
+  static Response Answer(const Server& self, const Request& request) {
+    try {
+      return self.handlers_.answer(request);
+    } catch (const std::exception& error) {
+      self.handlers_.log(error.what());
+    } catch (const std::string& error) { // the database layer's
+      self.handlers_.log(error);
+    }
+    return self.handlers_.refuse(MHD_HTTP_INTERNAL_SERVER_ERROR, request.target.path,
+                                 "This failed. The log of zophotos-web says why.");
+  }
+
+  /// Ends the connection: what follows the headers is not read.
+  static MHD_Result Refuse(Server& self, MHD_Connection* connection, const Refusal& refusal,
+                           const std::string& target) {
+    Response response = self.handlers_.refuse(refusal.status, target, refusal.reason);
+    response.headers.emplace_back("Connection", "close");
+    if (refusal.status == MHD_HTTP_METHOD_NOT_ALLOWED) {
+      response.headers.emplace_back("Allow", "GET, HEAD");
+    }
+    return Send(self, connection, std::move(response));
+  }
+
+  static MhdResponse MakeBody(Server& self, MHD_Connection* connection, Response& response) {
+    Connections::Connection& current = *ConnectionOf(connection);
+    if (auto* const part = std::get_if<FilePart>(&response.body)) {
+      current.SendResponse(part->size);
+      return MakeFileBody(std::move(*part));
+    }
+    if (auto* const text = std::get_if<std::string>(&response.body)) {
+      current.SendResponse(text->size());
+      return MakeTextBody(std::move(*text));
+    }
+    MhdResponse events(self.events_.Open(connection));
+    if (events) {
+      current.SendEvents();
+    }
+    return events;
+  }
+
+  static MHD_Result Send(Server& self, MHD_Connection* connection, Response response) {
+    MhdResponse body = MakeBody(self, connection, response);
+    if (!body && std::holds_alternative<EventStream>(response.body)) {
+      response = self.handlers_.refuse(MHD_HTTP_SERVICE_UNAVAILABLE, "/api/events",
+                                       "Too many clients wait for events.");
+      body = MakeBody(self, connection, response);
+    }
+    if (!body) {
+      return MHD_NO;
+    }
+    for (const auto& [name, value] : SECURITY) {
+      MHD_add_response_header(body.get(), name, value);
+    }
+    if (!response.type.empty()) {
+      MHD_add_response_header(body.get(), "Content-Type", response.type.c_str());
+    }
+    for (const auto& [name, value] : response.headers) {
+      MHD_add_response_header(body.get(), name.c_str(), value.c_str());
+    }
+    return MHD_queue_response(connection, static_cast<unsigned>(response.status), body.get());
+  }
+};
+
+Server::Server(util::FileDescriptor listener, AllowedHosts hosts, Handlers handlers)
+    : hosts_(std::move(hosts)), handlers_(std::move(handlers)),
+      limit_(ConnectionLimit(MOST_CONNECTIONS)), connections_(limit_ - limit_ / 8) {
+  std::vector<MHD_OptionItem> options{
+      {MHD_OPTION_LISTEN_SOCKET, listener.Get(), nullptr},
+      {MHD_OPTION_THREAD_POOL_SIZE, THREADS, nullptr},
+      {MHD_OPTION_CONNECTION_LIMIT, static_cast<std::intptr_t>(limit_), nullptr},
+      {MHD_OPTION_CONNECTION_MEMORY_LIMIT, CONNECTION_MEMORY, nullptr},
+      {MHD_OPTION_CONNECTION_TIMEOUT, SILENCE, nullptr},
+      {MHD_OPTION_SIGPIPE_HANDLED_BY_APP, 1, nullptr},
+      {MHD_OPTION_END, 0, nullptr}};
+  daemon_ = MHD_start_daemon(MHD_USE_EPOLL_INTERNAL_THREAD | MHD_USE_SUSPEND_RESUME, 0, nullptr,
+                             nullptr, &Calls::Handle, this, MHD_OPTION_ARRAY, options.data(),
+                             MHD_OPTION_URI_LOG_CALLBACK, &Calls::Begin, this,
+                             MHD_OPTION_NOTIFY_COMPLETED, &Calls::End, this,
+                             MHD_OPTION_NOTIFY_CONNECTION, &Calls::Notify, this, MHD_OPTION_END);
+  if (daemon_ == nullptr) {
+    throw std::runtime_error("cannot start the HTTP server");
+  }
+  static_cast<void>(listener.Release()); // the daemon owns it
+  clock_ = std::jthread([this](const std::stop_token& stop) {
+    RunClock(stop, [this] {
+      connections_.ShutDownLate();
+      events_.KeepAlive();
+    });
+  });
+}
+
+Server::~Server() {
+  clock_.request_stop();
+  clock_.join();
+  events_.Close();
+  MHD_stop_daemon(daemon_);
+}
+
+} // namespace orva::web

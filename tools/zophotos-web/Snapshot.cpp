@@ -1,0 +1,449 @@
+#include "Snapshot.h"
+
+#include "CacheDirectory.h"
+#include "MergedSource.h"
+#include "SnapshotFile.h"
+
+#include "zophotos/Failure.h"
+#include "zophotos/MergedDatabase.h"
+#include "zophotos/Text.h"
+
+#include <SQLiteCpp/Exception.h>
+
+#include <algorithm>
+#include <atomic>
+#include <chrono>
+#include <cstddef>
+#include <fstream>
+#include <iostream>
+#include <mutex>
+#include <optional>
+#include <utility>
+#include <vector>
+
+namespace orva::web {
+
+namespace {
+
+using Clock = std::chrono::steady_clock;
+using State = SnapshotStatus::State;
+
+/// Bytes of photos to sort in memory while a snapshot is built.
+constexpr std::size_t LARGEST_BATCH = 16 << 20;
+
+/// Changed photos after which a snapshot is built again. That is faster than to make so many
+/// changes, and the search index again knows the frequent prefixes.
+std::int64_t MostChanges(std::int64_t photos) {
+  return std::max<std::int64_t>(20'000, photos / 8);
+}
+
+/// Ends an update because the caller wants it to stop.
+struct Stopped {};
+
+void StopIfAsked(const std::stop_token& stop) {
+  if (stop.stop_requested()) {
+    throw Stopped();
+  }
+}
+
+/// Identifies the present start of the system. After another one, a snapshot may be damaged: it is
+/// written without waiting for the disk. Empty if unknown.
+std::string BootId() {
+  std::string id;
+  std::getline(std::ifstream("/proc/sys/kernel/random/boot_id"), id);
+  return id;
+}
+
+/// Milliseconds since the epoch.
+std::int64_t Now() {
+  using namespace std::chrono;
+  return duration_cast<milliseconds>(system_clock::now().time_since_epoch()).count();
+}
+
+void Log(const std::string& line) {
+  std::cerr << "zophotos-web: " + zophotos::Printable(line) + '\n';
+}
+
+/// Finds what is missing among the ids of the merged database.
+template <typename Id>
+class Missing {
+public:
+  explicit Missing(std::vector<Id> ids) : ids_(std::move(ids)) {
+    if (!std::ranges::is_sorted(ids_)) {
+      std::ranges::sort(ids_);
+    }
+  }
+
+  void Check(std::int64_t id) {
+    if (!std::ranges::binary_search(ids_, static_cast<Id>(id))) {
+      missing_.push_back(id);
+    }
+  }
+
+  const std::vector<std::int64_t>& Ids() const noexcept { return missing_; }
+
+private:
+  std::vector<Id> ids_;
+  std::vector<std::int64_t> missing_;
+};
+
+} // namespace
+
+class Snapshot::Implementation {
+public:
+  Implementation(const std::string& directory, FindPath findPath)
+      : directory_(directory), findPath_(std::move(findPath)), boot_(BootId()) {
+    std::vector<std::uint64_t> numbers = directory_.Numbers();
+    for (; !numbers.empty() && !file_; numbers.pop_back()) {
+      number_ = std::max(number_, numbers.back());
+      if (TryOpen(numbers.back())) {
+        number_ = numbers.back();
+      }
+    }
+    if (file_) {
+      directory_.RemoveOthers(number_);
+    } else {
+      PublishEmpty();
+    }
+  }
+
+  bool Update(const std::stop_token& stop) {
+    const std::int64_t before = file_->State().version;
+    if (damaged_.exchange(false)) {
+      Log("the snapshot " + File() + " is damaged; building it again");
+      mustBuild_ = true;
+    }
+    try {
+      UpdateFrom(FindDatabase(), stop);
+    } catch (const Stopped&) {
+      Discard();
+    } catch (const zophotos::Failure& failure) {
+      Discard();
+      Fail(failure);
+    } catch (const SQLite::Exception& error) {
+      Discard();
+      mustBuild_ = mustBuild_ || zophotos::IsDamage(error);
+      FailLater(std::string("cannot write the snapshot: ") + error.what());
+    }
+    return file_->State().version != before;
+  }
+
+  SnapshotStatus Status() const {
+    const std::lock_guard lock(mutex_);
+    return status_;
+  }
+
+  std::string File() const {
+    const std::lock_guard lock(mutex_);
+    return path_;
+  }
+
+  void ReportDamage() { damaged_ = true; }
+
+private:
+  bool TryOpen(std::uint64_t number) {
+    auto file = SnapshotFile::Open(directory_.File(number));
+    if (!file || boot_.empty() || file->State().boot != boot_) {
+      return false;
+    }
+    file_.emplace(std::move(*file));
+    path_ = file_->Path();
+    return true;
+  }
+
+  void SetStatus(State state, const std::string& reason = {}) {
+    const std::lock_guard lock(mutex_);
+    status_ = {.state = state, .done = 0, .total = 0, .reason = reason};
+  }
+
+  /// Undoes an update that did not end.
+  void Discard() {
+    try {
+      file_->Rollback();
+    } catch (const SQLite::Exception&) {
+      mustBuild_ = true;
+    }
+    directory_.RemoveOthers(number_);
+  }
+
+  /// An error here is no reason for a pause.
+  std::string FindDatabase() {
+    try {
+      return findPath_();
+    } catch (const zophotos::Failure&) {
+      pause_ = {};
+      throw;
+    }
+  }
+
+  void Fail(const zophotos::Failure& failure) {
+    if (failure.Status() == zophotos::ExitStatus::NoDatabase) {
+      if (mustBuild_ || !IsEmpty()) {
+        PublishEmpty();
+        mustBuild_ = false;
+      }
+      SetStatus(State::NoDatabase, failure.what());
+    } else if (failure.Status() != zophotos::ExitStatus::Locked) {
+      FailLater(failure.what());
+    }
+  }
+
+  void FailLater(const std::string& reason) {
+    constexpr std::chrono::seconds longest(60);
+    pause_ = std::clamp<std::chrono::seconds>(pause_ * 2, std::chrono::seconds(1), longest);
+    nextTry_ = Clock::now() + pause_;
+    if (Status().reason != reason) {
+      Log(reason);
+    }
+    SetStatus(State::Failed, reason);
+  }
+
+  void Succeed() {
+    pause_ = {};
+    nextTry_ = {};
+    SetStatus(State::Current);
+  }
+
+  void UpdateFrom(const std::string& path, const std::stop_token& stop) {
+    const auto identity = Identify(path);
+    if (identity == failed_ && Clock::now() < nextTry_) {
+      return;
+    }
+    failed_ = identity;
+    if (!mustBuild_ && identity && *identity == file_->State().source) {
+      file_->Tidy();
+      Succeed();
+      return;
+    }
+    MergedSource source(path);
+    const bool isOther = !identity || identity->file != file_->State().source.file;
+    if (mustBuild_ || isOther || !Continue(source, *identity, stop)) {
+      Build(source, identity.value_or(SourceIdentity()), stop);
+    }
+    Succeed();
+  }
+
+  /// Adds what is new in the merged database and removes what it does not have any more. Its rows
+  /// never change, and ids are never used twice. Returns whether that was possible.
+  bool Continue(MergedSource& source, const SourceIdentity& identity, const std::stop_token& stop) {
+    SnapshotState& state = file_->State();
+    const std::int64_t version = source.DataVersion();
+    const std::int64_t mostChanges = MostChanges(state.photos);
+    const std::int64_t changesBefore = state.changes;
+    file_->Begin();
+    bool hasChanged = false;
+    MergedRows rows;
+    PhotoBatch batch;
+    for (bool more = true; more;) {
+      StopIfAsked(stop);
+      rows.Clear();
+      more = source.ReadMore(state.position, rows);
+      hasChanged = hasChanged || !rows.folders.empty();
+      AddRows(*file_, rows, batch, nullptr);
+      batch.Sort();
+      file_->AddPhotos(batch, true);
+      batch.Clear();
+      if (state.changes > mostChanges) {
+        file_->Rollback();
+        return false;
+      }
+    }
+    const MergedSource::Summary summary = source.ReadSummary();
+    const std::int64_t folders = state.folders;
+    if (summary.lastFile < state.position.file ||
+        !RemoveMissing(source, summary, mostChanges, stop)) {
+      file_->Rollback();
+      return false;
+    }
+    hasChanged = hasChanged || state.folders != folders;
+    if (hasChanged) {
+      file_->AdoptFolders();
+    }
+    hasChanged = file_->ReplaceStatistics(summary.statistics) || hasChanged ||
+                 state.changes != changesBefore;
+    SetSource(state, identity, summary, version);
+    if (summary.dataVersion == version) {
+      state.filesLeftOut = summary.files - state.photos;
+      state.foldersLeftOut = summary.folders - state.folders;
+    }
+    if (hasChanged) {
+      state.version = std::max(state.version + 1, Now());
+    }
+    file_->Commit();
+    return true;
+  }
+
+  /// Counts are enough to see that something is missing: everything new has been added.
+  bool RemoveMissing(MergedSource& source, const MergedSource::Summary& summary,
+                     std::int64_t mostChanges, const std::stop_token& stop) {
+    const SnapshotState& state = file_->State();
+    if (summary.files != state.photos + state.filesLeftOut) {
+      std::vector<std::uint32_t> ids;
+      ids.reserve(static_cast<std::size_t>(std::max<std::int64_t>(state.photos, 0)));
+      for (std::int64_t after = 0; source.ReadFileIds(after, ids);) {
+        StopIfAsked(stop);
+      }
+      Missing<std::uint32_t> missing(std::move(ids));
+      file_->ForEachPhoto([&](std::int64_t id) { missing.Check(id); });
+      if (state.changes + static_cast<std::int64_t>(missing.Ids().size()) > mostChanges) {
+        return false;
+      }
+      file_->RemovePhotos(missing.Ids());
+    }
+    if (summary.folders != state.folders + state.foldersLeftOut) {
+      std::vector<std::int64_t> ids;
+      for (std::int64_t after = 0; source.ReadFolderIds(after, ids);) {
+        StopIfAsked(stop);
+      }
+      Missing<std::int64_t> missing(std::move(ids));
+      file_->ForEachFolder([&](std::int64_t id) { missing.Check(id); });
+      for (const std::int64_t id : missing.Ids()) {
+        StopIfAsked(stop);
+        file_->RemoveFolder(id);
+      }
+    }
+    return true;
+  }
+
+  /// Makes a new snapshot next to the present one and replaces that.
+  void Build(MergedSource& source, const SourceIdentity& identity, const std::stop_token& stop) {
+    SetStatus(State::Building);
+    directory_.RemoveOthers(number_);
+    SnapshotFile file = SnapshotFile::Create(directory_.File(number_ + 1));
+    SnapshotState& state = file.State();
+    const std::int64_t version = source.DataVersion();
+    const std::int64_t total = source.ReadSummary().files;
+    const auto show = [&](std::int64_t done) {
+      StopIfAsked(stop);
+      const std::lock_guard lock(mutex_);
+      status_.done = std::min(done / 2, total);
+      status_.total = total;
+    };
+    file.Begin();
+    PrefixSample sample(total);
+    CopyRows(source, file, sample, show);
+    file.SetFrequentPrefixes(sample.Frequent());
+    file.AdoptFolders();
+    file.IndexAll([&](std::int64_t done) { show(state.photos + done); });
+    const MergedSource::Summary summary = source.ReadSummary();
+    file.ReplaceStatistics(summary.statistics);
+    SetSource(state, identity, summary, version);
+    if (state.filesLeftOut != 0 || state.foldersLeftOut != 0) {
+      Log("left out " + zophotos::Count(state.filesLeftOut, "file") + " and " +
+          zophotos::Count(state.foldersLeftOut, "folder") +
+          " that the daemon cannot have merged: " + identity.file);
+    }
+    Publish(std::move(file));
+    mustBuild_ = false;
+  }
+
+  void CopyRows(MergedSource& source, SnapshotFile& file, PrefixSample& sample,
+                const std::function<void(std::int64_t)>& show) {
+    MergedRows rows;
+    PhotoBatch batch;
+    const auto flush = [&] {
+      batch.Sort();
+      file.AddPhotos(batch, false);
+      batch.Clear();
+    };
+    std::int64_t done = 0;
+    for (bool more = true; more;) {
+      rows.Clear();
+      more = source.ReadMore(file.State().position, rows);
+      AddRows(file, rows, batch, &sample);
+      if (batch.Bytes() > LARGEST_BATCH) {
+        flush();
+      }
+      done += static_cast<std::int64_t>(rows.Files());
+      show(done);
+    }
+    flush();
+  }
+
+  static void AddRows(SnapshotFile& file, const MergedRows& rows, PhotoBatch& batch,
+                      PrefixSample* sample) {
+    for (const FolderRow& folder : rows.folders) {
+      file.AddFolder(folder);
+    }
+    for (std::size_t i = 0; i < rows.Files(); ++i) {
+      const FileRow row = rows.File(i);
+      if (file.Collect(row, batch) && sample != nullptr && sample->Next()) {
+        sample->Add(file.SearchText(row.folder, 0, row.name));
+      }
+    }
+  }
+
+  /// Remembers what the snapshot agrees with, if nothing was changed while it was read.
+  static void SetSource(SnapshotState& state, const SourceIdentity& identity,
+                        const MergedSource::Summary& summary, std::int64_t version) {
+    // Otherwise another file may have come to this path before it was opened.
+    const bool isSameFile = summary.identity && summary.identity->file == identity.file;
+    state.source = isSameFile ? identity : SourceIdentity();
+    state.source.content =
+        isSameFile && summary.dataVersion == version ? summary.identity->content : std::string();
+  }
+
+  bool IsEmpty() { return file_->State().source.file.empty() && file_->State().folders == 0; }
+
+  void PublishEmpty() {
+    SnapshotFile file = SnapshotFile::Create(directory_.File(number_ + 1));
+    file.Begin();
+    Publish(std::move(file));
+  }
+
+  /// Ends the transaction of a new snapshot, and makes it the present one.
+  void Publish(SnapshotFile file) {
+    const std::int64_t former = file_ ? file_->State().version : 0;
+    file.State().version = std::max(former + 1, Now());
+    file.State().boot = boot_;
+    file.Commit();
+    file.Complete();
+    file_.reset();
+    file_.emplace(std::move(file));
+    ++number_;
+    {
+      const std::lock_guard lock(mutex_);
+      path_ = file_->Path();
+    }
+    directory_.RemoveOthers(number_);
+  }
+
+  CacheDirectory directory_;
+  const FindPath findPath_;
+  const std::string boot_;
+  std::uint64_t number_ = 0; ///< of the present file
+  std::optional<SnapshotFile> file_;
+  bool mustBuild_ = false;
+
+  std::optional<SourceIdentity> failed_; ///< what the last try was for
+  std::chrono::seconds pause_{};
+  Clock::time_point nextTry_;
+
+  mutable std::mutex mutex_;
+  SnapshotStatus status_;
+  std::string path_;
+  std::atomic<bool> damaged_ = false;
+};
+
+Snapshot::Snapshot(const std::string& directory, FindPath findPath)
+    : implementation_(std::make_unique<Implementation>(directory, std::move(findPath))) {}
+
+Snapshot::~Snapshot() = default;
+
+bool Snapshot::Update(const std::stop_token& stop) {
+  return implementation_->Update(stop);
+}
+
+SnapshotStatus Snapshot::Status() const {
+  return implementation_->Status();
+}
+
+std::string Snapshot::File() const {
+  return implementation_->File();
+}
+
+void Snapshot::ReportDamage() const {
+  implementation_->ReportDamage();
+}
+
+} // namespace orva::web
