@@ -212,10 +212,11 @@ private:
     }
     failed_ = identity;
     if (!mustBuild_ && identity && *identity == file_->State().source) {
-      file_->Tidy();
+      isTidy_ = isTidy_ || !file_->Tidy();
       Succeed();
       return;
     }
+    isTidy_ = false;
     MergedSource source(path);
     const bool isOther = !identity || identity->file != file_->State().source.file;
     if (mustBuild_ || isOther || !Continue(source, *identity, stop)) {
@@ -415,6 +416,7 @@ private:
   std::uint64_t number_ = 0; ///< of the present file
   std::optional<SnapshotFile> file_;
   bool mustBuild_ = false;
+  bool isTidy_ = false; ///< the search index, since the last change
 
   std::optional<SourceIdentity> failed_; ///< what the last try was for
   std::chrono::seconds pause_{};

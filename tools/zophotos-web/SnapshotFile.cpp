@@ -29,7 +29,7 @@ constexpr int MOST_LEVELS = 32;
 /// Bytes of new entries that FTS5 collects in memory.
 constexpr int COLLECTED_ENTRIES = 4 << 20;
 
-constexpr int PAGES_TO_TIDY = 500;
+constexpr int PAGES_TO_TIDY = 100;
 
 constexpr const char* TABLES = R"(
 CREATE TABLE State(version INTEGER, folder INTEGER, file INTEGER, photos INTEGER, folders INTEGER,

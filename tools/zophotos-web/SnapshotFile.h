@@ -133,7 +133,8 @@ public:
   /// Makes the file safe to be read while it is written.
   void Complete();
 
-  /// Merges parts of the search index for some milliseconds. Returns whether there is more to do.
+  /// Merges parts of the search index for some milliseconds. Returns whether there may be more to
+  /// do.
   bool Tidy();
 
 private:

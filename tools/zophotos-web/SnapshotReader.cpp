@@ -131,11 +131,14 @@ public:
     if (filter.folder && *filter.folder <= 0) {
       return std::nullopt;
     }
-    return MatchExpression(terms, frequent_, [this](const std::string& from) {
-      SQLite::Statement& query = Prepared("SELECT term FROM temp.Words WHERE term >= ? LIMIT 1");
-      query.bind(1, from);
-      return query.executeStep() ? std::optional(query.getColumn(0).getString()) : std::nullopt;
-    });
+    return MatchExpression(terms, frequent_,
+                           [this](const std::string& from) { return NextWord(from); });
+  }
+
+  std::int64_t Version() {
+    SQLite::Statement& query = Prepared("SELECT version FROM State");
+    query.executeStep();
+    return query.getColumn(0).getInt64();
   }
 
   /// The ids of the newest photos in a range, newest first, or of the oldest, oldest first.
@@ -257,6 +260,27 @@ private:
     Statements& statements_;
   };
 
+  /// The smallest word of the index that is not smaller than `from`. The answers for the present
+  /// version are kept: FTS5 reads all photos of a word to find the next one.
+  std::optional<std::string> NextWord(const std::string& from) {
+    constexpr std::size_t mostWords = 1'000;
+    const std::int64_t version = Version();
+    if (version != wordsVersion_ || nextWords_.size() >= mostWords) {
+      nextWords_.clear();
+      wordsVersion_ = version;
+    }
+    const auto found = nextWords_.find(from);
+    if (found != nextWords_.end()) {
+      return found->second;
+    }
+    SQLite::Statement& query = Prepared("SELECT term FROM temp.Words WHERE term >= ? LIMIT 1");
+    query.bind(1, from);
+    const auto word =
+        query.executeStep() ? std::optional(query.getColumn(0).getString()) : std::nullopt;
+    nextWords_.emplace(from, word);
+    return word;
+  }
+
   void Open(const std::string& path) {
     Close();
     database_.emplace(OpenForReading(path));
@@ -269,6 +293,7 @@ private:
   void Close() {
     statements_.clear();
     database_.reset();
+    nextWords_.clear();
   }
 
   const Snapshot& snapshot_;
@@ -276,6 +301,8 @@ private:
   std::optional<SQLite::Database> database_;
   Statements statements_;
   FrequentPrefixes frequent_;
+  std::map<std::string, std::optional<std::string>> nextWords_;
+  std::int64_t wordsVersion_ = 0;
 };
 
 SnapshotReader::SnapshotReader(const Snapshot& snapshot)
@@ -382,11 +409,7 @@ std::vector<Month> SnapshotReader::Months(const Filter& filter) {
 }
 
 std::int64_t SnapshotReader::Version() {
-  return implementation_->Read([&] {
-    SQLite::Statement& query = implementation_->Prepared("SELECT version FROM State");
-    query.executeStep();
-    return query.getColumn(0).getInt64();
-  });
+  return implementation_->Read([&] { return implementation_->Version(); });
 }
 
 } // namespace orva::web
