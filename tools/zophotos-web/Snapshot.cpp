@@ -74,8 +74,9 @@ public:
     }
   }
 
-  void Check(std::int64_t id) {
-    if (!std::ranges::binary_search(ids_, static_cast<Id>(id))) {
+  /// Looks for the row with the id `row` of the photo or folder `id`.
+  void Check(std::int64_t id, std::int64_t row) {
+    if (!std::ranges::binary_search(ids_, static_cast<Id>(row))) {
       missing_.push_back(id);
     }
   }
@@ -211,10 +212,11 @@ private:
     }
     failed_ = identity;
     if (!mustBuild_ && identity && *identity == file_->State().source) {
-      file_->Tidy();
+      isTidy_ = isTidy_ || !file_->Tidy();
       Succeed();
       return;
     }
+    isTidy_ = false;
     MergedSource source(path);
     const bool isOther = !identity || identity->file != file_->State().source.file;
     if (mustBuild_ || isOther || !Continue(source, *identity, stop)) {
@@ -284,7 +286,7 @@ private:
         StopIfAsked(stop);
       }
       Missing<std::uint32_t> missing(std::move(ids));
-      file_->ForEachPhoto([&](std::int64_t id) { missing.Check(id); });
+      file_->ForEachPhoto([&](std::int64_t id) { missing.Check(id, id & 0x7FFF'FFFF); });
       if (state.changes + static_cast<std::int64_t>(missing.Ids().size()) > mostChanges) {
         return false;
       }
@@ -296,7 +298,7 @@ private:
         StopIfAsked(stop);
       }
       Missing<std::int64_t> missing(std::move(ids));
-      file_->ForEachFolder([&](std::int64_t id) { missing.Check(id); });
+      file_->ForEachFolder([&](std::int64_t id) { missing.Check(id, id); });
       for (const std::int64_t id : missing.Ids()) {
         StopIfAsked(stop);
         file_->RemoveFolder(id);
@@ -414,6 +416,7 @@ private:
   std::uint64_t number_ = 0; ///< of the present file
   std::optional<SnapshotFile> file_;
   bool mustBuild_ = false;
+  bool isTidy_ = false; ///< the search index, since the last change
 
   std::optional<SourceIdentity> failed_; ///< what the last try was for
   std::chrono::seconds pause_{};

@@ -29,7 +29,7 @@ constexpr int MOST_LEVELS = 32;
 /// Bytes of new entries that FTS5 collects in memory.
 constexpr int COLLECTED_ENTRIES = 4 << 20;
 
-constexpr int PAGES_TO_TIDY = 500;
+constexpr int PAGES_TO_TIDY = 100;
 
 constexpr const char* TABLES = R"(
 CREATE TABLE State(version INTEGER, folder INTEGER, file INTEGER, photos INTEGER, folders INTEGER,
@@ -277,7 +277,7 @@ void SnapshotFile::AddPhotos(const PhotoBatch& batch, bool index) {
     insert.bind(3, row.volume);
     BindText(insert, 4, name);
     if (insert.exec() == 0) {
-      ++state_.filesLeftOut; // only a crafted database has two rows with the same lower 32 bits
+      ++state_.filesLeftOut; // only a crafted database has two rows with the same lower bits
       continue;
     }
     ++state_.photos;

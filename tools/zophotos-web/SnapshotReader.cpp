@@ -28,7 +28,7 @@ namespace {
 constexpr std::size_t MOST_ROWS = 1'000;
 constexpr std::size_t MOST_ANCESTORS = 100;
 
-constexpr std::int64_t SMALLEST = std::numeric_limits<std::int64_t>::min();
+constexpr std::int64_t SMALLEST = 0;
 constexpr std::int64_t LARGEST = std::numeric_limits<std::int64_t>::max();
 
 /// Ids from `first` to `last`.
@@ -55,10 +55,6 @@ Range RangeOf(const Filter& filter) {
                            .last = MakePhotoId(Clamp32(last), -1)};
   }
   return {.first = MakePhotoId(first, 0), .last = MakePhotoId(last, -1)};
-}
-
-std::int64_t SecondsOf(PhotoId id) {
-  return id >> 32;
 }
 
 int LimitOf(std::size_t count) {
@@ -135,11 +131,14 @@ public:
     if (filter.folder && *filter.folder <= 0) {
       return std::nullopt;
     }
-    return MatchExpression(terms, frequent_, [this](const std::string& from) {
-      SQLite::Statement& query = Prepared("SELECT term FROM temp.Words WHERE term >= ? LIMIT 1");
-      query.bind(1, from);
-      return query.executeStep() ? std::optional(query.getColumn(0).getString()) : std::nullopt;
-    });
+    return MatchExpression(terms, frequent_,
+                           [this](const std::string& from) { return NextWord(from); });
+  }
+
+  std::int64_t Version() {
+    SQLite::Statement& query = Prepared("SELECT version FROM State");
+    query.executeStep();
+    return query.getColumn(0).getInt64();
   }
 
   /// The ids of the newest photos in a range, newest first, or of the oldest, oldest first.
@@ -181,7 +180,7 @@ public:
                 .path = query.getColumn(1).getString(),
                 .name = query.getColumn(2).getString(),
                 .volume = query.getColumn(3).getString(),
-                .modified = SecondsOf(id)};
+                .modified = TimeOf(id)};
     photo.path += photo.name;
     return photo;
   }
@@ -229,7 +228,7 @@ public:
       if (oldest.empty()) {
         break;
       }
-      const auto [month, end] = MonthOf(SecondsOf(oldest.front()));
+      const auto [month, end] = MonthOf(TimeOf(oldest.front()));
       if (months.empty() || months.back() != month) {
         months.push_back(month);
       }
@@ -261,6 +260,27 @@ private:
     Statements& statements_;
   };
 
+  /// The smallest word of the index that is not smaller than `from`. The answers for the present
+  /// version are kept: FTS5 reads all photos of a word to find the next one.
+  std::optional<std::string> NextWord(const std::string& from) {
+    constexpr std::size_t mostWords = 1'000;
+    const std::int64_t version = Version();
+    if (version != wordsVersion_ || nextWords_.size() >= mostWords) {
+      nextWords_.clear();
+      wordsVersion_ = version;
+    }
+    const auto found = nextWords_.find(from);
+    if (found != nextWords_.end()) {
+      return found->second;
+    }
+    SQLite::Statement& query = Prepared("SELECT term FROM temp.Words WHERE term >= ? LIMIT 1");
+    query.bind(1, from);
+    const auto word =
+        query.executeStep() ? std::optional(query.getColumn(0).getString()) : std::nullopt;
+    nextWords_.emplace(from, word);
+    return word;
+  }
+
   void Open(const std::string& path) {
     Close();
     database_.emplace(OpenForReading(path));
@@ -273,6 +293,7 @@ private:
   void Close() {
     statements_.clear();
     database_.reset();
+    nextWords_.clear();
   }
 
   const Snapshot& snapshot_;
@@ -280,6 +301,8 @@ private:
   std::optional<SQLite::Database> database_;
   Statements statements_;
   FrequentPrefixes frequent_;
+  std::map<std::string, std::optional<std::string>> nextWords_;
+  std::int64_t wordsVersion_ = 0;
 };
 
 SnapshotReader::SnapshotReader(const Snapshot& snapshot)
@@ -292,7 +315,7 @@ std::vector<Photo> SnapshotReader::Photos(const Filter& filter, std::optional<Ph
   return implementation_->Read([&]() -> std::vector<Photo> {
     Range range = RangeOf(filter);
     if (before) {
-      if (*before == SMALLEST) {
+      if (*before <= SMALLEST) {
         return {};
       }
       range.last = std::min(range.last, *before - 1);
@@ -386,11 +409,7 @@ std::vector<Month> SnapshotReader::Months(const Filter& filter) {
 }
 
 std::int64_t SnapshotReader::Version() {
-  return implementation_->Read([&] {
-    SQLite::Statement& query = implementation_->Prepared("SELECT version FROM State");
-    query.executeStep();
-    return query.getColumn(0).getInt64();
-  });
+  return implementation_->Read([&] { return implementation_->Version(); });
 }
 
 } // namespace orva::web
