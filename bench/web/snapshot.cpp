@@ -39,6 +39,7 @@ constexpr int PAIRS = 3;
 constexpr int MERGES = 20;
 constexpr int BATCH = 100;
 constexpr int REPETITIONS = 15;
+constexpr int READERS = 2;
 constexpr std::size_t PAGE = 100;
 constexpr std::chrono::seconds LIMIT(120);
 constexpr double LONGEST_WAIT = 10; ///< seconds until a merge counts as undone
@@ -140,6 +141,7 @@ private:
 
   void Read(const std::string& what, const std::function<void()>& read) {
     std::vector<double> times;
+    times.reserve(REPETITIONS);
     for (int i = 0; i < REPETITIONS; ++i) {
       times.push_back(Seconds(read) * 1000);
     }
@@ -206,7 +208,8 @@ private:
       }
     });
     std::vector<std::jthread> readers;
-    for (int i = 0; i < 2; ++i) {
+    readers.reserve(READERS);
+    for (int i = 0; i < READERS; ++i) {
       readers.emplace_back([this](const std::stop_token& stop) {
         web::SnapshotReader reader(*snapshot_);
         std::optional<web::PhotoId> before;

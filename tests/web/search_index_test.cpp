@@ -12,7 +12,6 @@ namespace {
 
 using ::testing::IsEmpty;
 using ::testing::Optional;
-using ::testing::UnorderedElementsAre;
 using web::AppendWords;
 using web::FrequentPrefixes;
 

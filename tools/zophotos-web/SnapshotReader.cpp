@@ -275,8 +275,7 @@ private:
     }
     SQLite::Statement& query = Prepared("SELECT term FROM temp.Words WHERE term >= ? LIMIT 1");
     query.bind(1, from);
-    const auto word =
-        query.executeStep() ? std::optional(query.getColumn(0).getString()) : std::nullopt;
+    auto word = query.executeStep() ? std::optional(query.getColumn(0).getString()) : std::nullopt;
     nextWords_.emplace(from, word);
     return word;
   }
