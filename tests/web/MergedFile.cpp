@@ -18,8 +18,12 @@ std::string WithDirectory(const std::string& path) {
 
 MergedFile::MergedFile(const std::string& path)
     : database_(WithDirectory(path), SQLite::OPEN_READWRITE | SQLite::OPEN_CREATE, 60'000) {
+  database_.exec("PRAGMA synchronous = OFF");
+  if (database_.tableExists("Files")) {
+    return;
+  }
   database_.exec(
-      "PRAGMA synchronous = OFF; BEGIN;"
+      "BEGIN;"
       "CREATE TABLE Status(id INTEGER PRIMARY KEY AUTOINCREMENT, mc_version CHAR(16) NOT NULL, "
       "mdate INTEGER NOT NULL, desc CHAR(80), etype INTEGER);"
       "CREATE TABLE Statistics(id INTEGER PRIMARY KEY AUTOINCREMENT, volume TEXT NOT NULL, "

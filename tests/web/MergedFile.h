@@ -11,7 +11,7 @@ namespace orva::test {
 /// A merged database with the daemon's tables, which a test changes as the daemon does.
 class MergedFile {
 public:
-  /// Creates the file at `path`, and its directory.
+  /// Opens the file at `path`, which is created, with its directory, if it does not exist.
   explicit MergedFile(const std::string& path);
 
   /// Adds a volume's top folder and statistics. Returns the folder's id.

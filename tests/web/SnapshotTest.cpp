@@ -2,6 +2,8 @@
 
 #include "zophotos/Failure.h"
 
+#include <filesystem>
+
 namespace orva::test {
 
 Shown ReadAll(const web::Snapshot& snapshot) {
@@ -50,6 +52,12 @@ web::Filter WithWords(const std::string& words) {
   web::Filter filter;
   filter.words = words;
   return filter;
+}
+
+SnapshotTest::SnapshotTest() {
+  for (const std::string& path : {std::filesystem::path(MERGED).parent_path().string(), CACHE}) {
+    std::filesystem::remove_all(path);
+  }
 }
 
 void SnapshotTest::Start() {

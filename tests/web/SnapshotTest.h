@@ -40,6 +40,9 @@ web::Filter WithWords(const std::string& words);
 /// A merged database at a path that the locator names.
 class SnapshotTest : public ::testing::Test {
 protected:
+  /// Removes what a test before this one left.
+  SnapshotTest();
+
   /// Makes the snapshot in CACHE.
   void Start();
 

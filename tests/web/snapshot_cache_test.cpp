@@ -226,15 +226,14 @@ TEST_F(CachedSnapshot, ReadersOfTheFormerFileContinueWithTheNewOne) {
 TEST_F(CachedSnapshot, ReadersInThreadsSeeConsistentStates) {
   Start();
   Update();
-  std::atomic<bool> end = false;
-  std::vector<std::jthread> threads;
   std::atomic<int> reads = 0;
+  std::vector<std::jthread> threads;
   threads.reserve(3);
   for (int i = 0; i < 3; ++i) {
-    threads.emplace_back([&] {
+    threads.emplace_back([&](const std::stop_token& stop) {
       web::SnapshotReader reader(*snapshot_);
       std::int64_t version = 0;
-      while (!end) {
+      while (!stop.stop_requested()) {
         const std::size_t searched = reader.Photos(WithWords("jpg"), std::nullopt, 1000).size();
         EXPECT_TRUE(searched == 1 || searched % 10 == 0) << searched;
         const std::int64_t next = reader.Version();
@@ -262,7 +261,6 @@ TEST_F(CachedSnapshot, ReadersInThreadsSeeConsistentStates) {
       std::this_thread::yield();
     }
   }
-  end = true;
 }
 
 /// Kills a process that builds or updates the snapshot after `microseconds`. Returns whether it was

@@ -63,7 +63,7 @@ protected:
 };
 
 TEST_F(HostileDatabase, NamesAreKeptByteForByte) {
-  const std::vector<std::string> names{"<script>alert(1)</script>.jpg",
+  const std::vector<std::string> names{"<img src=x onerror=alert(1)>.jpg",
                                        "\xFF\xFE.jpg",
                                        "a\nb\r\t\x1B[31m.jpg",
                                        "\u202Egpj.exe",
@@ -79,8 +79,8 @@ TEST_F(HostileDatabase, NamesAreKeptByteForByte) {
     EXPECT_THAT(names, ::testing::Contains(photo.name));
     EXPECT_EQ(photo.path, A + photo.name);
   }
-  EXPECT_THAT(Names(WithWords("\"<script>\" OR alert")), SizeIs(0));
-  EXPECT_THAT(Names(WithWords("<script> alert")), SizeIs(1));
+  EXPECT_THAT(Names(WithWords("\"<img>\" OR alert")), SizeIs(0));
+  EXPECT_THAT(Names(WithWords("<img> alert")), SizeIs(1));
 }
 
 TEST_F(HostileDatabase, RowsThatTheDaemonCannotHaveMergedAreLeftOut) {
@@ -146,7 +146,7 @@ TEST_F(HostileDatabase, IdsOfAllSizesAreRead) {
   merged_->Run("INSERT INTO Files VALUES(-5, 2, 'negative.jpg', 1, '/shares/A/', 0)");
   merged_->Run("INSERT INTO Files VALUES(0, 2, 'zero.jpg', 1, '/shares/A/', 0)");
   merged_->Run(
-      "INSERT INTO Files VALUES(4294967297, 2, 'same lower bits.jpg', 50, '/shares/A/', 0)");
+      "INSERT INTO Files VALUES(2147483649, 2, 'same lower bits.jpg', 50, '/shares/A/', 0)");
   merged_->Run("INSERT INTO Files VALUES(9223372036854775806, 2, 'large.jpg', 2, '/shares/A/', 0)");
   Start();
   Update();

@@ -383,7 +383,7 @@ bool MergedSource::ReadFileIds(std::int64_t& after, std::vector<std::uint32_t>& 
     LockedTime time;
     return ReadRows(database_, "SELECT file_id FROM Files WHERE file_id > ? ORDER BY file_id",
                     NEXT_FILE, after, time, [&](std::int64_t id, const SQLite::Statement*) {
-                      ids.push_back(static_cast<std::uint32_t>(id));
+                      ids.push_back(static_cast<std::uint32_t>(id & 0x7FFF'FFFF));
                     });
   });
 }

@@ -96,7 +96,7 @@ public:
   bool ReadMore(Position& position, MergedRows& rows);
 
   /// Appends ids of rows that are larger than `after`, which it advances. Returns whether there
-  /// are more. Of files only the lower 32 bits.
+  /// are more. Of files only the lower 31 bits.
   bool ReadFolderIds(std::int64_t& after, std::vector<std::int64_t>& ids);
   bool ReadFileIds(std::int64_t& after, std::vector<std::uint32_t>& ids);
 

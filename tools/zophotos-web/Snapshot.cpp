@@ -74,8 +74,9 @@ public:
     }
   }
 
-  void Check(std::int64_t id) {
-    if (!std::ranges::binary_search(ids_, static_cast<Id>(id))) {
+  /// Looks for the row with the id `row` of the photo or folder `id`.
+  void Check(std::int64_t id, std::int64_t row) {
+    if (!std::ranges::binary_search(ids_, static_cast<Id>(row))) {
       missing_.push_back(id);
     }
   }
@@ -284,7 +285,7 @@ private:
         StopIfAsked(stop);
       }
       Missing<std::uint32_t> missing(std::move(ids));
-      file_->ForEachPhoto([&](std::int64_t id) { missing.Check(id); });
+      file_->ForEachPhoto([&](std::int64_t id) { missing.Check(id, id & 0x7FFF'FFFF); });
       if (state.changes + static_cast<std::int64_t>(missing.Ids().size()) > mostChanges) {
         return false;
       }
@@ -296,7 +297,7 @@ private:
         StopIfAsked(stop);
       }
       Missing<std::int64_t> missing(std::move(ids));
-      file_->ForEachFolder([&](std::int64_t id) { missing.Check(id); });
+      file_->ForEachFolder([&](std::int64_t id) { missing.Check(id, id); });
       for (const std::int64_t id : missing.Ids()) {
         StopIfAsked(stop);
         file_->RemoveFolder(id);

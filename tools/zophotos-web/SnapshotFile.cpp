@@ -277,7 +277,7 @@ void SnapshotFile::AddPhotos(const PhotoBatch& batch, bool index) {
     insert.bind(3, row.volume);
     BindText(insert, 4, name);
     if (insert.exec() == 0) {
-      ++state_.filesLeftOut; // only a crafted database has two rows with the same lower 32 bits
+      ++state_.filesLeftOut; // only a crafted database has two rows with the same lower bits
       continue;
     }
     ++state_.photos;

@@ -24,10 +24,16 @@ SQLite::Database OpenForReading(const std::string& path);
 /// The frequent prefixes of the search index in an open snapshot.
 FrequentPrefixes ReadFrequentPrefixes(SQLite::Database& database);
 
-/// A photo's id from the time and the lower 32 bits of its row's id.
+/// A photo's id: the time and the lower 31 bits of its row's id. Never negative: FTS5 (SQLite 3.40)
+/// writes beyond its memory when it merges lists with negative ids.
 constexpr std::int64_t MakePhotoId(std::int64_t modified, std::int64_t file) {
-  return static_cast<std::int64_t>((static_cast<std::uint64_t>(modified) << 32U) |
-                                   (static_cast<std::uint64_t>(file) & 0xFFFFFFFFU));
+  constexpr std::int64_t smallestTime = -0x8000'0000LL;
+  return (modified - smallestTime) << 31 | (file & 0x7FFF'FFFF);
+}
+
+/// The time in a photo's id.
+constexpr std::int64_t TimeOf(std::int64_t id) {
+  return (id >> 31) - 0x8000'0000LL;
 }
 
 /// What a snapshot's file says about itself.

@@ -28,7 +28,7 @@ namespace {
 constexpr std::size_t MOST_ROWS = 1'000;
 constexpr std::size_t MOST_ANCESTORS = 100;
 
-constexpr std::int64_t SMALLEST = std::numeric_limits<std::int64_t>::min();
+constexpr std::int64_t SMALLEST = 0;
 constexpr std::int64_t LARGEST = std::numeric_limits<std::int64_t>::max();
 
 /// Ids from `first` to `last`.
@@ -55,10 +55,6 @@ Range RangeOf(const Filter& filter) {
                            .last = MakePhotoId(Clamp32(last), -1)};
   }
   return {.first = MakePhotoId(first, 0), .last = MakePhotoId(last, -1)};
-}
-
-std::int64_t SecondsOf(PhotoId id) {
-  return id >> 32;
 }
 
 int LimitOf(std::size_t count) {
@@ -181,7 +177,7 @@ public:
                 .path = query.getColumn(1).getString(),
                 .name = query.getColumn(2).getString(),
                 .volume = query.getColumn(3).getString(),
-                .modified = SecondsOf(id)};
+                .modified = TimeOf(id)};
     photo.path += photo.name;
     return photo;
   }
@@ -229,7 +225,7 @@ public:
       if (oldest.empty()) {
         break;
       }
-      const auto [month, end] = MonthOf(SecondsOf(oldest.front()));
+      const auto [month, end] = MonthOf(TimeOf(oldest.front()));
       if (months.empty() || months.back() != month) {
         months.push_back(month);
       }
@@ -292,7 +288,7 @@ std::vector<Photo> SnapshotReader::Photos(const Filter& filter, std::optional<Ph
   return implementation_->Read([&]() -> std::vector<Photo> {
     Range range = RangeOf(filter);
     if (before) {
-      if (*before == SMALLEST) {
+      if (*before <= SMALLEST) {
         return {};
       }
       range.last = std::min(range.last, *before - 1);

@@ -12,8 +12,8 @@
 
 namespace orva::web {
 
-/// Identifies a photo in the snapshot, and sorts by modification time: the upper 32 bits are the
-/// time. A photo has another id after the election of another master or a purge of its volume.
+/// Identifies a photo in the snapshot, and sorts by modification time. Never negative. A photo has
+/// another id after the election of another master or a purge of its volume.
 using PhotoId = std::int64_t;
 
 struct Photo {
