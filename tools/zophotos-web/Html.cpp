@@ -31,7 +31,11 @@ Html& Html::operator<<(const std::string& text) {
       text_ += "&#39;";
       break;
     default:
-      text_ += IsControl(character) ? "\uFFFD" : std::string(1, character);
+      if (IsControl(character)) {
+        text_ += "\uFFFD";
+      } else {
+        text_ += character;
+      }
     }
   }
   return *this;

@@ -214,7 +214,7 @@ Html Tile(const Photo& photo, const Selection& selection) {
 /// Opens a month's part of a grid.
 Html MonthStart(const std::string& key) {
   Html html;
-  html << "<section class=\"month\" data-month=\"" << key << "\"><h2>" << MonthTitle(key)
+  html << R"(<section class="month" data-month=")" << key << "\"><h2>" << MonthTitle(key)
        << "</h2><ol class=\"grid\">\n";
   return html;
 }
@@ -248,7 +248,7 @@ Html Viewer(const PhotoView& view) {
   }
   html << R"(><p class="missing" hidden>This photo cannot be shown at the moment.</p>)"
        << step(view.older, "older", "Older photo") << R"(</div><div class="facts">)"
-       << R"(<h1 id="photo-name">)" << Name(photo.name)
+       << R"(<h1 id="photo-name" aria-live="polite">)" << Name(photo.name)
        << R"(</h1><dl><div><dt>Time</dt><dd><time)";
   if (!iso.empty()) {
     html << " datetime=\"" << iso << "\"";
@@ -269,7 +269,7 @@ Html Viewer(const PhotoView& view) {
 /// A list of photos in a grid. `path` is the address of the view without the list's parameters.
 Html Photos(const PhotoList& list, const std::string& path, const Selection& selection) {
   Html html;
-  html << "<div class=\"photos\" data-query=\"" << Address("", selection) << "\"";
+  html << R"(<div class="photos" data-query=")" << Address("", selection) << "\"";
   if (list.hasNewer) {
     html << " data-newer";
   }
@@ -312,7 +312,7 @@ Html Photos(const PhotoList& list, const std::string& path, const Selection& sel
 Html Progress(const Volume& volume) {
   const std::int64_t total = std::max<std::int64_t>(volume.total, 0);
   Html html;
-  html << "<progress aria-label=\"Transcoded photos\" max=\"" << std::max<std::int64_t>(total, 1)
+  html << R"(<progress aria-label="Transcoded photos" max=")" << std::max<std::int64_t>(total, 1)
        << "\" value=\"" << std::clamp<std::int64_t>(volume.transcoded, 0, total)
        << "\"></progress>";
   return html;
@@ -354,7 +354,7 @@ Html Strip(const std::vector<Volume>& volumes) {
     return html;
   };
   Html html;
-  html << "<nav class=\"strip\" aria-label=\"Volumes\"";
+  html << R"(<nav class="strip" aria-label="Volumes")";
   if (volumes.empty()) {
     html << " hidden";
   }
@@ -376,7 +376,7 @@ Html Empty(const Site& site) {
   const bool isPreparing = std::ranges::any_of(site.volumes, [](const Volume& volume) {
     return !volume.isGone && (volume.total > 0 || volume.waiting.value_or(0) > 0);
   });
-  html << "<section class=\"empty\" id=\"empty\" data-kind=\"";
+  html << R"(<section class="empty" id="empty" data-kind=")";
   if (site.snapshot.state == SnapshotStatus::State::Building) {
     html << "building\"><h2>One moment</h2><p>The photos appear here as soon as their list is "
             "built.</p>";
@@ -461,7 +461,7 @@ Html SearchForm(const Site& site, const Selection& selection, const std::vector<
 Html Calendar(const std::vector<Month>& months) {
   Html html;
   std::optional<int> year;
-  html << "<section class=\"calendar\" aria-label=\"Months with photos\">";
+  html << R"(<section class="calendar" aria-label="Months with photos">)";
   for (const Month& month : months) {
     Selection time;
     time.year = month.year;

@@ -57,6 +57,7 @@ std::vector<Volume> Combine(const std::vector<VolumeRow>& rows,
     AddActivity(volume, activity);
   }
   std::vector<Volume> list;
+  list.reserve(volumes.size());
   for (auto& [mountPoint, volume] : volumes) {
     list.push_back(std::move(volume));
   }

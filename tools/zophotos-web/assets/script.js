@@ -27,6 +27,7 @@ const COUNT = 100; // photos of a request
 const MOST = 600; // photos in a grid at a time: those far away are removed and fetched again
 const NEAR = 1500; // pixels from an end of the grid at which more photos are fetched
 const CALM = 500; // milliseconds between two updates
+const RETRY = 30000; // milliseconds until the next try when the server has too many clients
 const MOST_IN_STRIP = 24; // volumes above the newest photos
 const MONTHS = ["January", "February", "March", "April", "May", "June", "July", "August",
   "September", "October", "November", "December"];
@@ -258,6 +259,7 @@ class Grid {
     }
     this.photos = photos;
     this.arrange();
+    document.querySelector(".nothing")?.toggleAttribute("hidden", photos.length > 0);
     if (focused !== document.activeElement && focused.isConnected) {
       focused.focus({ preventScroll: true });
     }
@@ -830,6 +832,13 @@ function follow(grid) {
       source = new EventSource("/api/events");
       source.addEventListener("change", () => plan(true));
       source.addEventListener("activity", () => plan(false));
+      source.addEventListener("error", () => {
+        // The browser connects again after a lost connection, but not after a refused one.
+        if (source?.readyState === EventSource.CLOSED) {
+          source = null;
+          setTimeout(connect, RETRY);
+        }
+      });
     }
   };
   document.addEventListener("visibilitychange", connect);
