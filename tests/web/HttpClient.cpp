@@ -83,7 +83,7 @@ std::string HttpConnection::ReadUntil(const std::string& text) {
       throw std::runtime_error("the server ended the connection after: " + input_);
     }
   }
-  const std::string read = input_.substr(0, found + text.size());
+  std::string read = input_.substr(0, found + text.size());
   input_.erase(0, read.size());
   return read;
 }

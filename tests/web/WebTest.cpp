@@ -106,13 +106,23 @@ std::string WebTest::IdOf(const std::string& path) const {
   return {};
 }
 
-Lines WebTest::OpenOn(const std::string& volume) const {
+Lines WebTest::AwaitNothingOpenBelow(const std::string& path) const {
+  const auto end = std::chrono::steady_clock::now() + DEADLINE;
+  Lines open = OpenBelow(path);
+  while (!open.empty() && std::chrono::steady_clock::now() < end) {
+    poll(nullptr, 0, 20);
+    open = OpenBelow(path);
+  }
+  return open;
+}
+
+Lines WebTest::OpenBelow(const std::string& path) const {
   Lines open;
   for (const auto& entry : fs::directory_iterator("/proc/" + std::to_string(web->Pid()) + "/fd")) {
     std::error_code closed;
-    const std::string path = fs::read_symlink(entry, closed);
-    if (path.starts_with(volume)) {
-      open.push_back(path);
+    const std::string file = fs::read_symlink(entry, closed);
+    if (file.starts_with(path)) {
+      open.push_back(file);
     }
   }
   return open;

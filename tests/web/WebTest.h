@@ -54,8 +54,9 @@ protected:
   /// The id of the photo at `path`; empty if there is none.
   std::string IdOf(const std::string& path) const;
 
-  /// What zophotos-web has open on a volume.
-  Lines OpenOn(const std::string& volume) const;
+  /// Waits until zophotos-web has nothing open below `path`, as after each response. Returns what
+  /// it has open there after the deadline.
+  Lines AwaitNothingOpenBelow(const std::string& path) const;
 
   /// Where a rendition is.
   static std::string RenditionOf(const Catalog& catalog, const std::string& volume,
@@ -67,6 +68,9 @@ protected:
   Catalog onA{a};
   std::unique_ptr<Program> web;
   std::uint16_t port = 0;
+
+private:
+  Lines OpenBelow(const std::string& path) const;
 };
 
 } // namespace orva::test

@@ -162,7 +162,7 @@ TEST_F(WebApi, SendsRenditionsAsImages) {
   EXPECT_EQ(304, Get(target, "If-None-Match: " + tag + "\r\n").status);
   Write(RenditionOf(onA, a.Path(), "sea/one.jpg"), "another rendition");
   EXPECT_EQ("another rendition", Get(target, "If-None-Match: " + tag + "\r\n").body);
-  EXPECT_THAT(OpenOn(a.Path() + "/.orva"), IsEmpty());
+  EXPECT_THAT(AwaitNothingOpenBelow(a.Path() + "/.orva"), IsEmpty());
 }
 
 TEST_F(WebApi, SendsOriginalsAsAttachments) {

@@ -314,6 +314,7 @@ TEST_F(WebFiles, GiveUpOnCatalogsThatTakeTooLong) {
   }
   // Each of them reads the whole table.
   std::vector<Photo> photos;
+  photos.reserve(200);
   for (int i = 0; i < 200; ++i) {
     photos.push_back(PhotoAt(std::to_string(i), "/shares/B/"));
   }

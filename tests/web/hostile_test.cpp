@@ -158,7 +158,7 @@ TEST_F(WebHostile, VolumesCanBeUnmountedAfterEachRequest) {
   ASSERT_TRUE(AwaitPhotos(4));
   EXPECT_EQ("rendition of b.jpg", Get(Target("/shares/B/b.jpg", "/rendition")).body);
   EXPECT_EQ("original of b.jpg", Get(Target("/shares/B/b.jpg", "/original")).body);
-  EXPECT_THAT(OpenOn(b.Path()), IsEmpty());
+  EXPECT_THAT(AwaitNothingOpenBelow(b.Path()), IsEmpty());
   appliance.Handle(Unplugged(b.Path()));
   EXPECT_EQ(0, umount("/shares/B"));
 }

@@ -125,8 +125,10 @@ TEST(WebFileName, IsSafeInAHeader) {
   EXPECT_EQ("attachment; filename=\"a b.jpg\"; filename*=UTF-8''a%20b.jpg", Attachment("a b.jpg"));
   EXPECT_EQ("attachment; filename=\"__.jpg\"; filename*=UTF-8''%C3%A9.jpg",
             Attachment("\xc3\xa9.jpg"));
-  for (const char* const name :
-       {"a\"b\r\nX: y", "\xe2\x80\xae.jpg", "\xff\xfe", "\\\"\\", "..", ""}) {
+  const std::string mark = std::string("\xe2\x80") + '\xae'; // reverses the direction
+  for (const std::string& name :
+       {std::string("a\"b\r\nX: y"), mark + ".jpg", std::string("\xff\xfe"), std::string(R"(\"\)"),
+        std::string(".."), std::string()}) {
     const std::string value = Attachment(name);
     EXPECT_EQ(std::string::npos, value.find_first_of("\r\n\\")) << value;
     EXPECT_EQ(2, std::count(value.begin(), value.end(), '"')) << value;

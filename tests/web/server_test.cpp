@@ -238,8 +238,9 @@ TEST_F(WebServer, NeverTakesABodyForARequest) {
         std::string("X: y\r\n Content-Length: 5"),
         std::string("Expect: 100-continue\r\n"
                     "Content-Length: 5")}) {
-    const std::string output =
-        AnswerTo("GET /a HTTP/1.1\r\nHost: localhost\r\n" + headers + "\r\n\r\n" + smuggled);
+    std::string bytes = HttpGet("/a", headers + "\r\n");
+    bytes += smuggled;
+    const std::string output = AnswerTo(bytes);
     EXPECT_EQ(std::string::npos, output.find("content of")) << headers << '\n' << output;
   }
   EXPECT_THAT(Requests(), IsEmpty());

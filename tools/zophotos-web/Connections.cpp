@@ -12,8 +12,8 @@ void Connections::Connection::ExpectRequest() {
 }
 
 void Connections::Connection::SendResponse(std::uint64_t size) {
-  // Even the largest file leaves the deadline far from an overflow.
-  const std::uint64_t seconds = std::min<std::uint64_t>(size / BYTES_PER_SECOND, 7 * 86'400);
+  constexpr std::uint64_t WEEK = 604'800;
+  const std::uint64_t seconds = std::min(size / BYTES_PER_SECOND, WEEK);
   isWaiting_ = false;
   deadline_ = Clock::now() + RESPONSE_TIME + std::chrono::seconds(seconds);
 }

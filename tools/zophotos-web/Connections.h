@@ -20,7 +20,7 @@ public:
   static constexpr std::chrono::seconds REQUEST_TIME{30};
   /// A response may take this long, and a second more for each so many bytes.
   static constexpr std::chrono::seconds RESPONSE_TIME{30};
-  static constexpr std::uint64_t BYTES_PER_SECOND = 16 << 10;
+  static constexpr std::uint64_t BYTES_PER_SECOND = 16'384;
 
   class Connection {
   public:

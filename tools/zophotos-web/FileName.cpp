@@ -7,7 +7,7 @@
 namespace orva::web {
 namespace {
 
-bool IsPlain(char c) {
+bool IsPlainCharacter(char c) {
   return (c >= '0' && c <= '9') || (c >= 'A' && c <= 'Z') || (c >= 'a' && c <= 'z') || c == '.' ||
          c == '-' || c == '_';
 }
@@ -16,15 +16,15 @@ bool IsPlain(char c) {
 std::string AsciiName(std::string_view name) {
   std::string ascii;
   for (const char c : name) {
-    ascii += IsPlain(c) || c == ' ' ? c : '_';
+    ascii += IsPlainCharacter(c) || c == ' ' ? c : '_';
   }
   return ascii;
 }
 
-std::string PercentEncoded(std::string_view name) {
+std::string EncodeName(std::string_view name) {
   std::string encoded;
   for (const char c : name) {
-    if (IsPlain(c)) {
+    if (IsPlainCharacter(c)) {
       encoded += c;
     } else {
       encoded += util::FormatString("%%%02X", static_cast<unsigned char>(c));
@@ -44,7 +44,7 @@ std::string Attachment(std::string_view name) {
     }
   }
   return "attachment; filename=\"" + AsciiName(printable) + "\"; filename*=UTF-8''" +
-         PercentEncoded(printable);
+         EncodeName(printable);
 }
 
 } // namespace orva::web

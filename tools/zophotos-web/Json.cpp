@@ -16,14 +16,14 @@ Json OrNull(const std::optional<Value>& value) {
 }
 
 /// The last component of a folder's path.
-std::string_view NameOf(std::string_view path) {
+std::string_view FolderName(std::string_view path) {
   if (path.ends_with('/')) {
     path.remove_suffix(1);
   }
   return path.substr(path.rfind('/') + 1);
 }
 
-const char* NameOf(SnapshotStatus::State state) {
+const char* StateName(SnapshotStatus::State state) {
   switch (state) {
   case SnapshotStatus::State::NoDatabase:
     return "no_database";
@@ -52,7 +52,7 @@ Json ToJson(const Photo& photo) {
 Json ToJson(const Folder& folder) {
   return {{"id", std::to_string(folder.id)},
           {"parent", folder.parent == -1 ? Json() : Json(std::to_string(folder.parent))},
-          {"name", ToUtf8(NameOf(folder.path))},
+          {"name", ToUtf8(FolderName(folder.path))},
           {"path", ToUtf8(folder.path)},
           {"volume", ToUtf8(folder.volume)},
           {"has_folders", folder.hasFolders},
@@ -81,7 +81,7 @@ Json ToJson(const Month& month) {
 }
 
 Json ToJson(const SnapshotStatus& status) {
-  return {{"state", NameOf(status.state)},
+  return {{"state", StateName(status.state)},
           {"done", status.done},
           {"total", status.total},
           {"reason", ToUtf8(status.reason)}};

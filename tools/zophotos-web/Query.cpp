@@ -10,10 +10,10 @@ namespace orva::web {
 namespace {
 
 constexpr int LAST_YEAR = 9999;
-constexpr int MONTHS = 12;
+constexpr int MONTHS_PER_YEAR = 12;
 
 /// The value of a parameter; empty if it is missing.
-std::string_view Text(const Target& target, const char* name) {
+std::string_view ValueOf(const Target& target, const char* name) {
   const std::string* const value = target.Find(name);
   return value == nullptr ? std::string_view() : std::string_view(*value);
 }
@@ -33,7 +33,7 @@ void ParseMonth(std::string_view text, Selection& selection) {
   selection.year = ParseDigits(text.substr(0, YEAR_DIGITS), YEAR_DIGITS, 1, LAST_YEAR);
   const std::string_view rest = text.substr(std::min(YEAR_DIGITS, text.size()));
   if (rest.starts_with('-')) {
-    selection.month = ParseDigits(rest.substr(1), 2, 1, MONTHS);
+    selection.month = ParseDigits(rest.substr(1), 2, 1, MONTHS_PER_YEAR);
   }
   if (!selection.year || (!rest.empty() && !selection.month)) {
     throw BadQuery("A month is written as 2026-11, or 2026 for the whole year.");
@@ -54,14 +54,14 @@ std::int64_t BeginOfMonth(int year, int month) {
 
 Selection ParseSelection(const Target& target) {
   Selection selection;
-  selection.words = Text(target, "words");
-  if (const std::string_view volume = Text(target, "volume"); !volume.empty()) {
+  selection.words = ValueOf(target, "words");
+  if (const std::string_view volume = ValueOf(target, "volume"); !volume.empty()) {
     selection.volume = volume;
   }
   selection.folder = ParseId(target, "folder");
-  if (const std::string_view month = Text(target, "month"); !month.empty()) {
+  if (const std::string_view month = ValueOf(target, "month"); !month.empty()) {
     ParseMonth(month, selection);
-  } else if (const std::string_view year = Text(target, "year"); !year.empty()) {
+  } else if (const std::string_view year = ValueOf(target, "year"); !year.empty()) {
     ParseMonth(year.substr(0, year.find('-')), selection);
   }
   return selection;
@@ -74,7 +74,7 @@ Filter ToFilter(const Selection& selection) {
                 .times = std::nullopt};
   if (selection.year) {
     const int first = selection.month.value_or(1);
-    const int last = selection.month.value_or(MONTHS);
+    const int last = selection.month.value_or(MONTHS_PER_YEAR);
     filter.times = std::pair(BeginOfMonth(*selection.year, first),
                              BeginOfMonth(*selection.year, last + 1) - 1);
   }

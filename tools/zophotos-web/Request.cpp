@@ -22,7 +22,7 @@ int HexDigit(char c) {
 }
 
 /// Decodes a name or value of the query, as forms encode it.
-std::optional<std::string> Decode(std::string_view text) {
+std::optional<std::string> DecodeFormText(std::string_view text) {
   std::string bytes;
   for (std::size_t i = 0; i < text.size(); ++i) {
     if (text[i] == '+') {
@@ -43,7 +43,7 @@ std::optional<std::string> Decode(std::string_view text) {
 }
 
 /// Removes the text up to `separator` from `text`, and the separator, and returns it.
-std::string_view Take(std::string_view& text, char separator) {
+std::string_view TakeUpTo(std::string_view& text, char separator) {
   const std::size_t end = std::min(text.find(separator), text.size());
   const std::string_view part = text.substr(0, end);
   text.remove_prefix(std::min(end + 1, text.size()));
@@ -52,8 +52,8 @@ std::string_view Take(std::string_view& text, char separator) {
 
 bool AddParameter(Target& target, std::string_view text) {
   std::string_view rest = text;
-  const auto name = Decode(Take(rest, '='));
-  const auto value = Decode(rest);
+  const auto name = DecodeFormText(TakeUpTo(rest, '='));
+  const auto value = DecodeFormText(rest);
   if (!name || !value || target.Find(*name) != nullptr ||
       target.parameters.size() == MOST_PARAMETERS) {
     return false;
@@ -69,7 +69,7 @@ std::optional<std::uint64_t> ParsePosition(std::string_view text) {
                                                                   : std::nullopt;
 }
 
-std::string_view Trim(std::string_view text) {
+std::string_view TrimBlanks(std::string_view text) {
   const std::size_t first = std::min(text.find_first_not_of(" \t"), text.size());
   text.remove_prefix(first);
   return text.substr(0, text.find_last_not_of(" \t") + 1);
@@ -89,9 +89,9 @@ std::optional<Target> ParseTarget(std::string_view text) {
     return std::nullopt;
   }
   Target target;
-  target.path = Take(text, '?');
+  target.path = TakeUpTo(text, '?');
   while (!text.empty()) {
-    const std::string_view parameter = Take(text, '&');
+    const std::string_view parameter = TakeUpTo(text, '&');
     if (!parameter.empty() && !AddParameter(target, parameter)) {
       return std::nullopt;
     }
@@ -141,7 +141,7 @@ std::optional<ByteRange> ParseRange(std::string_view text, std::uint64_t size) {
 
 bool Matches(std::string_view text, std::string_view tag) {
   while (!text.empty()) {
-    std::string_view other = Trim(Take(text, ','));
+    std::string_view other = TrimBlanks(TakeUpTo(text, ','));
     if (other.starts_with("W/")) {
       other.remove_prefix(2);
     }

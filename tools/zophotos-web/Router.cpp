@@ -14,7 +14,7 @@
 namespace orva::web {
 namespace {
 
-constexpr std::size_t PAGE = 100; // photos or folders
+constexpr std::size_t PAGE_SIZE = 100; // photos or folders
 constexpr std::string_view API = "/api/";
 
 constexpr int NOT_MODIFIED = 304;
@@ -22,17 +22,17 @@ constexpr int BAD_REQUEST = 400;
 constexpr int NOT_FOUND = 404;
 
 /// A document whose content changes: nobody keeps it.
-Response Document(std::string type, std::string text) {
+Response DataDocument(std::string type, std::string text) {
   return {
       .type = std::move(type), .body = std::move(text), .headers = {{"Cache-Control", "no-store"}}};
 }
 
-Response Html(std::string text) {
-  return Document("text/html; charset=utf-8", std::move(text));
+Response HtmlDocument(std::string text) {
+  return DataDocument("text/html; charset=utf-8", std::move(text));
 }
 
 Response JsonText(const Json& document) {
-  return Document("application/json", ToText(document));
+  return DataDocument("application/json", ToText(document));
 }
 
 Response NoPhoto(const Target& target) {
@@ -73,7 +73,7 @@ bool Skip(std::string_view& text, std::string_view prefix) {
 /// Removes one of the two ends of a list that has one item more than wanted. Returns whether it
 /// had.
 template <typename Item>
-bool Trim(std::vector<Item>& items, std::size_t count, bool atBegin) {
+bool CutOff(std::vector<Item>& items, std::size_t count, bool atBegin) {
   const bool more = items.size() > count;
   if (more) {
     items.erase(atBegin ? items.begin() : items.end() - 1);
@@ -90,7 +90,7 @@ Json Array(const std::vector<Item>& items) {
   return array;
 }
 
-Json IdOf(const std::vector<Photo>& photos) {
+Json FirstId(const std::vector<Photo>& photos) {
   return photos.empty() ? Json() : Json(std::to_string(photos.front().id));
 }
 
@@ -143,8 +143,8 @@ Response Router::Answer(const Request& request) {
 }
 
 Response Router::Refuse(int status, std::string_view path, const std::string& reason) {
-  Response response =
-      path.starts_with(API) ? JsonText({{"error", reason}}) : Html(ErrorPage(status, reason));
+  Response response = path.starts_with(API) ? JsonText({{"error", reason}})
+                                            : HtmlDocument(ErrorPage(status, reason));
   response.status = status;
   return response;
 }
@@ -161,7 +161,7 @@ Response Router::AnswerPage(const Request& request, std::string_view path) {
     return FoldersView(target, std::nullopt);
   }
   if (path == "/volumes") {
-    return Html(VolumesPage(MakeSite()));
+    return HtmlDocument(VolumesPage(MakeSite()));
   }
   if (Skip(path, "/folders/")) {
     const auto id = ParseNumber(path);
@@ -223,14 +223,15 @@ Response Router::AnswerJson(const Request& request, std::string_view path) {
 }
 
 Response Router::NewestView(const Target& target) {
-  return Html(NewestPage(MakeSite(), MakeList(target, {}, PAGE)));
+  return HtmlDocument(NewestPage(MakeSite(), MakeList(target, {}, PAGE_SIZE)));
 }
 
 Response Router::SearchView(const Target& target) {
   const Selection selection = ParseSelection(target);
   const Filter filter = ToFilter(selection);
   const std::vector<Month> months = Readers::Lease(readers_)->Months({});
-  return Html(SearchPage(MakeSite(), selection, months, MakeList(target, filter, PAGE)));
+  return HtmlDocument(
+      SearchPage(MakeSite(), selection, months, MakeList(target, filter, PAGE_SIZE)));
 }
 
 Response Router::FoldersView(const Target& target, std::optional<std::int64_t> folder) {
@@ -244,14 +245,15 @@ Response Router::FoldersView(const Target& target, std::optional<std::int64_t> f
       }
       view.ancestors = reader->Ancestors(*folder);
     }
-    view.folders = reader->Folders(folder.value_or(-1),
-                                   PathAfter(reader, ParseId(target, "after_folder")), PAGE + 1);
-    view.hasMoreFolders = Trim(view.folders, PAGE, false);
+    view.folders = reader->Folders(
+        folder.value_or(-1), PathAfter(reader, ParseId(target, "after_folder")), PAGE_SIZE + 1);
+    view.hasMoreFolders = CutOff(view.folders, PAGE_SIZE, false);
   }
   if (folder) {
-    view.list = MakeList(target, {.folder = folder, .volume = {}, .words = {}, .times = {}}, PAGE);
+    view.list =
+        MakeList(target, {.folder = folder, .volume = {}, .words = {}, .times = {}}, PAGE_SIZE);
   }
-  return Html(FolderPage(MakeSite(), view));
+  return HtmlDocument(FolderPage(MakeSite(), view));
 }
 
 Response Router::PhotoView(const Target& target, PhotoId id) {
@@ -270,7 +272,7 @@ Response Router::PhotoView(const Target& target, PhotoId id) {
     view.newer = newer.empty() ? std::nullopt : std::optional(newer.front().id);
     view.older = older.empty() ? std::nullopt : std::optional(older.front().id);
   }
-  return Html(PhotoPage(MakeSite(), view));
+  return HtmlDocument(PhotoPage(MakeSite(), view));
 }
 
 Response Router::Rendition(const Request& request, PhotoId id) {
@@ -322,8 +324,8 @@ Response Router::PhotoJson(const Target& target, PhotoId id) {
     return NoPhoto(target);
   }
   Json document = ToJson(*photo);
-  document["newer"] = IdOf(reader->PhotosAfter(filter, id, 1));
-  document["older"] = IdOf(reader->Photos(filter, id, 1));
+  document["newer"] = FirstId(reader->PhotosAfter(filter, id, 1));
+  document["older"] = FirstId(reader->Photos(filter, id, 1));
   return JsonText(document);
 }
 
@@ -332,7 +334,7 @@ Response Router::FoldersJson(const Target& target) {
   const Readers::Lease reader(readers_);
   auto folders = reader->Folders(ParseId(target, "parent").value_or(-1),
                                  PathAfter(reader, ParseId(target, "after")), count + 1);
-  const bool more = Trim(folders, count, false);
+  const bool more = CutOff(folders, count, false);
   return JsonText({{"folders", Array(folders)}, {"more", more}});
 }
 
@@ -380,12 +382,12 @@ PhotoList Router::MakeList(const Target& target, const Filter& filter, std::size
   const Readers::Lease reader(readers_);
   if (after) {
     list.photos = reader->PhotosAfter(filter, *after, count + 1);
-    list.hasNewer = Trim(list.photos, count, true);
+    list.hasNewer = CutOff(list.photos, count, true);
     const PhotoId last = list.photos.empty() ? *after : list.photos.back().id;
     list.hasOlder = !reader->Photos(filter, last, 1).empty();
   } else {
     list.photos = reader->Photos(filter, before, count + 1);
-    list.hasOlder = Trim(list.photos, count, false);
+    list.hasOlder = CutOff(list.photos, count, false);
     if (before) {
       const PhotoId first = list.photos.empty() ? *before : list.photos.front().id;
       list.hasNewer = !reader->PhotosAfter(filter, first, 1).empty();

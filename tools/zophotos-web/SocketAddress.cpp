@@ -41,7 +41,7 @@ bool IsLoopbackAddress(const in6_addr& address) {
                            : IN6_IS_ADDR_LOOPBACK(&address) != 0;
 }
 
-std::string Text(int family, const void* address) {
+std::string AddressText(int family, const void* address) {
   std::array<char, INET6_ADDRSTRLEN> text{};
   return inet_ntop(family, address, text.data(), text.size()) == nullptr ? "" : text.data();
 }
@@ -104,14 +104,14 @@ bool SocketAddress::IsLoopback() const {
 std::string SocketAddress::Host() const {
   if (address_.ss_family == AF_INET) {
     const auto ipv4 = Get<sockaddr_in>(address_);
-    return Text(AF_INET, &ipv4.sin_addr);
+    return AddressText(AF_INET, &ipv4.sin_addr);
   }
   if (address_.ss_family != AF_INET6) {
     return {};
   }
   const auto ipv6 = Get<sockaddr_in6>(address_);
-  return IsMapped(ipv6.sin6_addr) ? Text(AF_INET, &ipv6.sin6_addr.s6_addr[12])
-                                  : Text(AF_INET6, &ipv6.sin6_addr);
+  return IsMapped(ipv6.sin6_addr) ? AddressText(AF_INET, &ipv6.sin6_addr.s6_addr[12])
+                                  : AddressText(AF_INET6, &ipv6.sin6_addr);
 }
 
 std::string SocketAddress::Url() const {

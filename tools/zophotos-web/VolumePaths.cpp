@@ -14,7 +14,7 @@ bool IsName(std::string_view text) {
 }
 
 /// The folder of the volume without its separator; empty if it is not directly below /shares.
-std::string_view Root(std::string_view mountPoint) {
+std::string_view RootOf(std::string_view mountPoint) {
   if (!mountPoint.starts_with(SHARES) || !mountPoint.ends_with('/')) {
     return {};
   }
@@ -38,7 +38,7 @@ bool HasOnlyNames(std::string_view path) {
 } // namespace
 
 std::optional<VolumePath> Locate(const Photo& photo) {
-  const std::string_view root = Root(photo.volume);
+  const std::string_view root = RootOf(photo.volume);
   if (root.empty() || !photo.path.starts_with(photo.volume) ||
       photo.path.find('\0') != std::string::npos) {
     return std::nullopt;
