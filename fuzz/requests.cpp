@@ -45,7 +45,7 @@ void Execute(const std::string& path, const char* sql) {
 }
 
 /// A volume with two photos, and a merged database that also names files elsewhere. The ids of the
-/// photos are 4294967297 to 4294967301.
+/// photos are 4611686020574871553 to 4611686020574871557.
 void MakeVolume() {
   Write("/shares/A/a.jpg", "original");
   Write("/shares/A/sea/b.jpg", "original");
@@ -176,7 +176,7 @@ int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
 
   const Client other;
   other.Send(
-      "GET /photos/4294967297/original HTTP/1.1\r\nHost: localhost\r\nConnection: close\r\n\r\n");
+      "GET /photos/4611686020574871553/original HTTP/1.1\r\nHost: localhost\r\nConnection: close\r\n\r\n");
   Require(other.Receive(EVENTUALLY).ends_with("\r\n\r\noriginal"), "others are served");
   return 0;
 }
