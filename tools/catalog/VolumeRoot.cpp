@@ -9,7 +9,9 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <cstddef>
 #include <cstdint>
+#include <string_view>
 #include <system_error>
 #include <utility>
 
@@ -20,6 +22,37 @@ bool IsMountPoint(int folder) {
   struct statx status {};
   return statx(folder, "", AT_EMPTY_PATH | AT_NO_AUTOMOUNT, STATX_TYPE, &status) == 0 &&
          (status.stx_attributes & STATX_ATTR_MOUNT_ROOT) != 0;
+}
+
+/// What openat2 does with RESOLVE_BENEATH and RESOLVE_NO_SYMLINKS, for systems that refuse it:
+/// opens one component after the other, each without following a link. Refuses ".." and empty
+/// components.
+util::FileDescriptor OpenByComponents(int root, std::string_view path, int flags, mode_t mode) {
+  constexpr int FOLDER = O_PATH | O_NOFOLLOW | O_CLOEXEC;
+  util::FileDescriptor folder(openat(root, ".", FOLDER));
+  while (folder) {
+    const std::size_t end = path.find('/');
+    const std::string name(path.substr(0, end));
+    if (name.empty() || name == "..") {
+      errno = EXDEV;
+      break;
+    }
+    if (end == std::string_view::npos) {
+      return util::FileDescriptor(openat(folder.Get(), name.c_str(), flags, mode));
+    }
+    path.remove_prefix(end + 1);
+    // The next step refuses what is no folder.
+    folder.Reset(openat(folder.Get(), name.c_str(), FOLDER));
+    struct stat status {};
+    if (folder && fstat(folder.Get(), &status) == 0 && S_ISLNK(status.st_mode)) {
+      errno = ELOOP;
+      break;
+    }
+    if (path.empty()) { // "folder/"
+      path = ".";
+    }
+  }
+  return {};
 }
 
 } // namespace
@@ -39,11 +72,17 @@ util::FileDescriptor VolumeRoot::Open(const std::string& path, int flags, mode_t
   open_how how{};
   // openat2 refuses flags without a meaning.
   const int waiting = (flags & O_PATH) != 0 ? 0 : O_NONBLOCK | O_NOCTTY;
-  how.flags = static_cast<std::uint64_t>(flags | waiting | O_NOFOLLOW | O_CLOEXEC);
+  flags |= waiting | O_NOFOLLOW | O_CLOEXEC;
+  how.flags = static_cast<std::uint64_t>(flags);
   how.mode = mode;
   how.resolve = RESOLVE_BENEATH | RESOLVE_NO_SYMLINKS;
-  return util::FileDescriptor(static_cast<int>(
-      syscall(SYS_openat2, root_.Get(), path.empty() ? "." : path.c_str(), &how, sizeof how)));
+  const std::string relative = path.empty() ? "." : path;
+  util::FileDescriptor file(
+      static_cast<int>(syscall(SYS_openat2, root_.Get(), relative.c_str(), &how, sizeof how)));
+  // systemd refuses openat2 to services with RestrictSUIDSGID=yes, so to those with
+  // DynamicUser=yes.
+  return file || errno != ENOSYS ? std::move(file)
+                                 : OpenByComponents(root_.Get(), relative, flags, mode);
 }
 
 bool VolumeRoot::IsInPlace() const {

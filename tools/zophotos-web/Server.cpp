@@ -349,6 +349,8 @@ Server::~Server() {
   clock_.request_stop();
   clock_.join();
   events_.Close();
+  // libmicrohttpd would shut the socket down, and systemd could not go on listening.
+  const util::FileDescriptor listener(MHD_quiesce_daemon(daemon_));
   MHD_stop_daemon(daemon_);
 }
 
