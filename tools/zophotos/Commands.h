@@ -77,6 +77,18 @@ enum class ExportFormat { Csv, JsonLines };
 /// Prints every file with its full path. `escapes`: texts in CSV are for people.
 ExitStatus ExportFiles(const std::string& path, ExportFormat format, bool escapes);
 
+/// What ExportChanges exports.
+struct Changes {
+  std::string state;  ///< path of the file that remembers the last feed
+  bool whole = false; ///< begin with all photos
+};
+
+/// Prints a feed: the photos that were added and removed since the feed that STATE remembers, or
+/// all photos if STATE remembers none of this database. Then STATE remembers this feed. A feed that
+/// may have been printed only in part is printed again.
+ExitStatus ExportChanges(const std::string& path, const Changes& changes, ExportFormat format,
+                         bool escapes);
+
 /// Prints a line for each change until the output cannot be written. An exception from `findPath`
 /// is a change, too.
 ExitStatus WatchDatabase(const FindPath& findPath, Form form);

@@ -1,51 +1,28 @@
 #include "Commands.h"
-#include "Json.h"
 #include "MergedDatabase.h"
+#include "PhotoLines.h"
 
 namespace orva::zophotos {
-
-namespace {
-
-/// A text as a CSV field. Always quoted, so that readers take no name for something else.
-std::string Quoted(const std::string& text, bool escapes) {
-  std::string field = "\"";
-  for (const char byte : escapes ? Printable(text) : ToUtf8(text)) {
-    field += byte;
-    if (byte == '"') {
-      field += byte;
-    }
-  }
-  return field + '"';
-}
-
-void PrintCsv(const Item& item, const std::string& path, bool escapes) {
-  std::cout << Quoted(path, escapes) << ',' << Quoted(item.volume, escapes) << ','
-            << IsoTime(item.modified).value_or("") << ',' << IsoTime(item.created).value_or("")
-            << '\n';
-}
-
-void PrintJson(const Item& item, const std::string& path) {
-  PrintLine({{"path", ToUtf8(path)},
-             {"volume", ToUtf8(item.volume)},
-             {"modified", JsonTime(item.modified)},
-             {"created", JsonTime(item.created)}});
-}
-
-} // namespace
 
 ExitStatus ExportFiles(const std::string& path, ExportFormat format, bool escapes) {
   SQLite::Database database = CopyDatabase(path);
   if (format == ExportFormat::Csv) {
-    std::cout << "path,volume,modified,created\n";
+    std::cout << CSV_HEADINGS << '\n';
   }
   Walk(database, [format, escapes](const Item& item) {
     if (!item.file) {
       return;
     }
+    const Photo photo{.path = item.folder + *item.file,
+                      .volume = item.volume,
+                      .modified = item.modified,
+                      .created = item.created};
     if (format == ExportFormat::Csv) {
-      PrintCsv(item, item.folder + *item.file, escapes);
+      std::cout << CsvFields(photo, escapes) << '\n';
     } else {
-      PrintJson(item, item.folder + *item.file);
+      Json line;
+      AddMembers(line, photo);
+      PrintLine(line);
     }
   });
   return ExitStatus::Success;

@@ -1,5 +1,7 @@
 #pragma once
 
+#include "Photo.h"
+
 #include <SQLiteCpp/Database.h>
 
 #include <cstdint>
@@ -37,6 +39,10 @@ struct Item {
 /// Calls `visit` for each file that has a folder and for each folder without files, ordered by
 /// folder and name, in constant memory. Throws SQLite::Exception.
 void Walk(SQLite::Database& copy, const std::function<void(const Item&)>& visit);
+
+/// Calls `visit` for each file that has a folder, ordered by path, byte by byte, in constant
+/// memory. The photo is valid during the call. Throws SQLite::Exception.
+void WalkPhotos(SQLite::Database& copy, const std::function<void(const Photo&)>& visit);
 
 /// The message for the user about an SQLite error while reading the database at `path`.
 std::string Explain(const SQLite::Exception& error, const std::string& path);

@@ -148,8 +148,10 @@ private:
     if (check_->parsed()) {
       return CheckDatabase(path, form);
     }
-    return ExportFiles(path, jsonLines_ || json_ ? ExportFormat::JsonLines : ExportFormat::Csv,
-                       escape_ || IsTerminal());
+    const ExportFormat format = jsonLines_ || json_ ? ExportFormat::JsonLines : ExportFormat::Csv;
+    const bool escapes = escape_ || IsTerminal();
+    return changes_.state.empty() ? ExportFiles(path, format, escapes)
+                                  : ExportChanges(path, changes_, format, escapes);
   }
 
   void AddCommands() {
@@ -211,7 +213,18 @@ private:
     export_->add_flag("--csv", csv_,
                       "Print comma-separated values with a line of headings (the default)");
     export_->add_flag("--jsonl", jsonLines_, "Print one JSON object per line, like --json");
+    export_
+        ->add_option("--changes", changes_.state,
+                     "Print only the files that were added and removed since the last export with "
+                     "this file, which is created or replaced")
+        ->type_name("STATE")
+        ->check(orva::commandline::NotEmpty());
+    export_->add_flag("--whole", changes_.whole,
+                      "With --changes: print all files, for a reader that has missed changes");
     export_->callback([this] {
+      if (changes_.whole && changes_.state.empty()) {
+        throw UsageError("--whole needs --changes");
+      }
       if (csv_ && (jsonLines_ || json_)) {
         throw UsageError(std::string("--csv and ") + (jsonLines_ ? "--jsonl" : "--json") +
                          " cannot be combined");
@@ -233,6 +246,7 @@ private:
   std::string path_; ///< of ls, tree and failed
   std::size_t levels_ = std::numeric_limits<std::size_t>::max();
   Search search_;
+  Changes changes_;
   bool follow_ = false;
   bool json_ = false;
   bool escape_ = false;

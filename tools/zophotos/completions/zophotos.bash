@@ -26,7 +26,7 @@ _zophotos() {
   done
   COMPREPLY=()
   case $previous in
-    --database)
+    --database | --changes)
       compopt -o filenames 2>/dev/null || true # fails outside a completion
       mapfile -t COMPREPLY < <(compgen -f -- "$current")
       return
@@ -47,7 +47,7 @@ _zophotos() {
     ls) words+=' --long -l -1' ;;
     tree) words+=' --level -L' ;;
     find) words+=' --ignore-case --null --type -i -0' ;;
-    export) words+=' --csv --jsonl' ;;
+    export) words+=' --csv --jsonl --changes --whole' ;;
     help)
       words=$commands
       # It has one argument.

@@ -57,3 +57,5 @@ complete -c zophotos -n 'contains find (__zophotos_command)' -s 0 -l null -d 'En
 complete -c zophotos -n 'contains find (__zophotos_command)' -l type -x -a 'f d' -d 'Find only files or folders'
 complete -c zophotos -n 'contains export (__zophotos_command)' -l csv -d 'Print comma-separated values'
 complete -c zophotos -n 'contains export (__zophotos_command)' -l jsonl -d 'Print one JSON object per line'
+complete -c zophotos -n 'contains export (__zophotos_command)' -l changes -r -F -d 'Print only the changes since the last export with this file'
+complete -c zophotos -n 'contains export (__zophotos_command)' -l whole -d 'With --changes, print all files'
