@@ -24,9 +24,7 @@ namespace orva::test {
 namespace {
 
 namespace fs = std::filesystem;
-using ::testing::ContainsRegex;
 using ::testing::ElementsAre;
-using ::testing::EndsWith;
 using ::testing::HasSubstr;
 using ::testing::MatchesRegex;
 using ::testing::StartsWith;
@@ -196,36 +194,30 @@ TEST_F(ZophotosChanges, LostStateGivesAWholeFeed) {
 }
 
 TEST_F(ZophotosChanges, AnotherDatabaseGivesAWholeFeed) {
-  const auto expectWhole = [] {
-    EXPECT_FALSE(Feed().isWhole);
-    return [] {
-      EXPECT_TRUE(Feed().isWhole);
-      EXPECT_FALSE(Feed().isWhole);
-    };
-  };
   Feed();
-  auto check = expectWhole(); // a file made anew
+  const auto expectWhole = [](const std::string& what) {
+    SCOPED_TRACE(what);
+    EXPECT_TRUE(Feed().isWhole);
+    EXPECT_FALSE(Feed().isWhole);
+  };
   fs::copy_file(COPY, COPY + ".new");
   fs::rename(COPY + ".new", COPY);
-  check();
-  check = expectWhole(); // the same with the same inode
+  expectWhole("a file made anew");
   const std::string content = Content(COPY);
-  const std::string old = content;
   Database(COPY).Run("INSERT INTO Files(file_id, folder_id, name, modified_date, volume, "
                      "created_date) VALUES(1000, 1, 'x', 1, 'y', 2)");
   EXPECT_FALSE(Feed().isWhole);
-  Save(COPY, old);
-  check();
-  check = expectWhole(); // emptied
+  Save(COPY, content);
+  expectWhole("a file with the same inode, where smaller ids are used again");
   Database(COPY).Run("UPDATE Status SET mdate = mdate + 1");
-  check();
-  check = expectWhole(); // another master
-  fs::rename("/tmp/copy", "/tmp/other");
-  const Outcome other =
-      Zophotos({"--database", "/tmp/other/zophotos.db", "export", "--changes", STATE});
-  fs::rename("/tmp/other", "/tmp/copy");
-  EXPECT_TRUE(ParsedFeed(other.output).isWhole);
-  check();
+  expectWhole("the same file, emptied");
+  fs::create_directory("/tmp/other");
+  fs::rename(COPY, "/tmp/other/zophotos.db");
+  const ParsedFeed other(
+      Zophotos({"--database", "/tmp/other/zophotos.db", "export", "--changes", STATE}).output);
+  EXPECT_TRUE(other.isWhole);
+  fs::rename("/tmp/other/zophotos.db", COPY);
+  expectWhole("another master");
 }
 
 TEST_F(ZophotosChanges, DatabaseUnderAnotherNameIsTheSame) {
@@ -526,6 +518,16 @@ TEST_F(ZophotosChanges, ReaderThatEndsEarlyGetsTheFeedAgain) {
   EXPECT_THAT(line, HasSubstr(Feed().id));
 }
 
+TEST_F(ZophotosChanges, FeedIsNotWrittenIntoItsFilesIfTheOutputIsClosed) {
+  Arguments command{"sh", "-c", "exec \"$@\" <&- >&-", "sh"};
+  for (const std::string& argument :
+       ZophotosCommand(OnCopyArguments({"export", "--changes", STATE}))) {
+    command.push_back(argument);
+  }
+  ExpectFailure(test::Run(command), 5, "cannot write to standard output");
+  EXPECT_FALSE(fs::exists(STATE));
+}
+
 TEST_F(ZophotosChanges, SecondExportWithTheSameStateIsRefused) {
   AddFiles(Database(COPY), 20'000, "1", "'name' || i");
   Program first(ZophotosCommand(OnCopyArguments({"export", "--changes", STATE})));
@@ -627,12 +629,14 @@ TEST_F(ZophotosChanges, StateTakesAtMostFortyBytesPerPhoto) {
     copy.Run("DELETE FROM Files");
     AddFiles(copy, photos, "1", name);
     copy.Run("UPDATE Files SET modified_date = abs(random()) % 500000000");
+    copy.Run("UPDATE Files SET created_date = modified_date"); // as the daemon does
   };
-  // Names as cameras, people and synchronization programs make them.
+  // Names as cameras, people and synchronization programs make them, and SHA-256 hashes.
   for (const char* const name :
        {"'IMG_' || i || '.JPG'", "'Summer holiday in the mountains with friends, ' || i || '.jpg'",
         "lower(hex(randomblob(4)) || '-' || hex(randomblob(2)) || '-' || hex(randomblob(2)) || '-' "
-        "|| hex(randomblob(2)) || '-' || hex(randomblob(6))) || '.jpg'"}) {
+        "|| hex(randomblob(2)) || '-' || hex(randomblob(6))) || '.jpg'",
+        "lower(hex(randomblob(32))) || '.jpg'"}) {
     replaceFiles(name);
     Feed();
     EXPECT_LE(fs::file_size(STATE), 40 * photos) << name;

@@ -96,7 +96,7 @@ void MakeFeed(const ExportState& state, const std::optional<PhotoListReader>& de
   Feed feed{.id = NewId(), .time = std::time(nullptr)};
   const std::uint64_t file = HashFile(path);
   SQLite::Database copy = CopyDatabase(path);
-  // It may have been replaced meanwhile; 0 is the same as no other one.
+  // The file may have been replaced meanwhile. 0 is never taken for the same database.
   feed.database = Identify(copy, HashFile(path) == file ? file : 0);
   if (delivered) {
     const Feed& last = delivered->Header();
@@ -184,12 +184,16 @@ void PrintFeed(PhotoListReader* delivered, PhotoListReader& pending, ExportForma
   PrintEnd(feed, rows, pending.Photos(), format);
 }
 
+[[noreturn]] void ThrowOutputError() {
+  throw Failure(ExitStatus::Failed, "cannot write to standard output");
+}
+
 /// Waits until the disk has standard output, if that is a file.
 void SynchroniseOutput() {
   struct stat status {};
   if (fstat(STDOUT_FILENO, &status) != 0 ||
       (S_ISREG(status.st_mode) && fsync(STDOUT_FILENO) != 0)) {
-    throw Failure(ExitStatus::Failed, "cannot write to standard output");
+    ThrowOutputError();
   }
 }
 
@@ -197,6 +201,9 @@ void SynchroniseOutput() {
 
 ExitStatus ExportChanges(const std::string& path, const Changes& changes, ExportFormat format,
                          bool escapes) {
+  if (fcntl(STDOUT_FILENO, F_GETFD) == -1) {
+    ThrowOutputError(); // a file that is opened now would become standard output
+  }
   const ExportState state(changes.state);
   auto delivered = state.Delivered();
   auto pending = state.Pending();

@@ -97,12 +97,9 @@ std::optional<PhotoListReader> ExportState::Open(const std::string& suffix) cons
 }
 
 PhotoListWriter ExportState::Write(const std::string& suffix, const Feed& feed) const {
-  // Not O_TRUNC: what is there may be something else.
-  util::FileDescriptor file = OpenFile(suffix, O_WRONLY | O_CREAT);
-  if (ftruncate(file.Get(), 0) != 0) {
-    ThrowError("cannot write", suffix);
-  }
-  return {std::move(file), path_ + suffix, feed};
+  // A new file has the right owner and mode, and no other name.
+  Remove(suffix);
+  return {OpenFile(suffix, O_WRONLY | O_CREAT | O_EXCL), path_ + suffix, feed};
 }
 
 void ExportState::Rename(const std::string& suffix) const {

@@ -26,7 +26,8 @@ public:
   /// The feed that is pending; nothing if it is missing, damaged or incomplete. Throws Failure.
   std::optional<PhotoListReader> Pending() const { return Open(NEXT); }
 
-  /// Begins a feed, which is pending once it is finished. Throws Failure.
+  /// Begins a feed, which is pending once it is finished, instead of the former one. Throws
+  /// Failure.
   PhotoListWriter WritePending(const Feed& feed) const { return Write(NEXT, feed); }
 
   /// Removes a feed that could not be finished.

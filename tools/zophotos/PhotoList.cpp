@@ -20,21 +20,20 @@ namespace {
 /// The beginning of each file. Its last character is the version of the format.
 constexpr std::string_view MAGIC = "zophotos feed 1\n";
 /// Magic, flags, number, id, previous, time, database.
-constexpr std::size_t HEADER_SIZE = MAGIC.size() + 8 + 8 + 16 + 16 + 8 + 3 * 8;
+constexpr std::size_t HEADER_SIZE = MAGIC.size() + 8 + 8 + 16 + 16 + 8 + 8 + 8 + 8;
 /// Number of photos, checksum.
 constexpr std::size_t TRAILER_SIZE = 8 + 4;
 constexpr std::size_t CHECKSUM_SIZE = 4;
-/// Two numbers before each block: the size of its photos, and the size of its bytes in the file.
-/// They are compressed if the second one is smaller.
-constexpr std::size_t BLOCK_HEADER_SIZE = 2 * 8;
+/// The photos are in blocks of two parts, the numbers and the texts. Two sizes are before each
+/// part: its own, and that of its bytes in the file. They are compressed if the second one is
+/// smaller.
+constexpr std::size_t PART_HEADER_SIZE = 8 + 8;
 /// A block ends with the photo that reaches this size.
 constexpr std::size_t BLOCK_SIZE = 65536;
 
 /// Photos that take so many bytes on average are not compressed, because that would take longer
 /// than to write them.
 constexpr std::size_t SMALL_PHOTO = 20;
-/// zlib's fastest. Higher levels take three times as long to save a tenth.
-constexpr int LEVEL = 1;
 /// No data can be compressed better than by this factor.
 constexpr std::uint64_t BEST_COMPRESSION = 1032;
 
@@ -86,9 +85,14 @@ void PutDifference(std::string& bytes, std::int64_t time, std::int64_t from) {
   PutNumber(bytes, (difference << 1U) ^ (0 - sign));
 }
 
-std::size_t CommonPrefix(const std::string& a, const std::string& b) {
-  const auto end = std::mismatch(a.begin(), a.end(), b.begin(), b.end()).first;
-  return static_cast<std::size_t>(end - a.begin());
+std::size_t CommonPrefix(std::string_view a, std::string_view b) {
+  return static_cast<std::size_t>(std::mismatch(a.begin(), a.end(), b.begin(), b.end()).first -
+                                  a.begin());
+}
+
+std::size_t CommonSuffix(std::string_view a, std::string_view b) {
+  return static_cast<std::size_t>(std::mismatch(a.rbegin(), a.rend(), b.rbegin(), b.rend()).first -
+                                  a.rbegin());
 }
 
 std::string HeaderBytes(const Feed& feed) {
@@ -120,12 +124,40 @@ Feed ParseHeader(std::string_view bytes) {
   return feed;
 }
 
-const Bytef* Unsigned(const char* bytes) {
-  return reinterpret_cast<const Bytef*>(bytes);
+Bytef* Unsigned(char* bytes) {
+  return reinterpret_cast<Bytef*>(bytes);
+}
+
+std::string Deflate(std::string& bytes, int strategy) {
+  // zlib's fastest level. Higher ones take three times as long to save a tenth.
+  constexpr int level = 1;
+  constexpr int memoryLevel = 8;
+  z_stream stream{};
+  if (deflateInit2(&stream, level, Z_DEFLATED, MAX_WBITS, memoryLevel, strategy) != Z_OK) {
+    throw std::bad_alloc();
+  }
+  std::string compressed(deflateBound(&stream, bytes.size()), '\0');
+  // SQLite has no texts that are larger than these numbers.
+  stream.next_in = Unsigned(bytes.data());
+  stream.avail_in = static_cast<uInt>(bytes.size());
+  stream.next_out = Unsigned(compressed.data());
+  stream.avail_out = static_cast<uInt>(compressed.size());
+  deflate(&stream, Z_FINISH);
+  compressed.resize(stream.total_out);
+  deflateEnd(&stream);
+  return compressed;
+}
+
+/// The smaller result of two strategies. Random names, as in UUIDs, have no repeated texts.
+std::string Compress(std::string& bytes) {
+  std::string repeated = Deflate(bytes, Z_DEFAULT_STRATEGY);
+  std::string random = Deflate(bytes, Z_HUFFMAN_ONLY);
+  return random.size() < repeated.size() ? random : repeated;
 }
 
 std::uint32_t Checksum(std::uint32_t before, std::string_view bytes) {
-  return static_cast<std::uint32_t>(crc32_z(before, Unsigned(bytes.data()), bytes.size()));
+  return static_cast<std::uint32_t>(
+      crc32_z(before, reinterpret_cast<const Bytef*>(bytes.data()), bytes.size()));
 }
 
 } // namespace
@@ -136,28 +168,33 @@ PhotoListWriter::PhotoListWriter(util::FileDescriptor file, std::string name, co
 }
 
 void PhotoListWriter::Add(const Photo& photo) {
-  const std::size_t common = CommonPrefix(photo_.path, photo.path);
-  PutNumber(block_, common);
-  PutNumber(block_, photo.path.size() - common);
-  block_.append(photo.path, common);
+  const std::string_view last = photo_.path;
+  const std::string_view path = photo.path;
+  const std::size_t prefix = CommonPrefix(last, path);
+  const std::size_t suffix = CommonSuffix(last.substr(prefix), path.substr(prefix));
+  const std::size_t middle = path.size() - prefix - suffix;
+  PutNumber(numbers_, prefix);
+  PutNumber(numbers_, suffix);
+  PutNumber(numbers_, middle);
+  texts_ += path.substr(prefix, middle);
   if (photo.volume == photo_.volume) {
-    PutNumber(block_, 0);
+    PutNumber(numbers_, 0);
   } else {
-    PutNumber(block_, photo.volume.size() + 1);
-    block_ += photo.volume;
+    PutNumber(numbers_, photo.volume.size() + 1);
+    texts_ += photo.volume;
   }
-  PutDifference(block_, photo.modified, photo_.modified);
-  PutDifference(block_, photo.created, photo.modified);
+  PutDifference(numbers_, photo.modified, photo_.modified);
+  PutDifference(numbers_, photo.created, photo.modified);
   photo_ = photo;
   ++photos_;
   ++photosInBlock_;
-  if (block_.size() >= BLOCK_SIZE) {
+  if (numbers_.size() + texts_.size() >= BLOCK_SIZE) {
     WriteBlock();
   }
 }
 
 void PhotoListWriter::Finish() {
-  if (!block_.empty()) {
+  if (photosInBlock_ > 0) {
     WriteBlock();
   }
   std::string trailer;
@@ -172,25 +209,17 @@ void PhotoListWriter::Finish() {
 }
 
 void PhotoListWriter::WriteBlock() {
-  std::string compressed;
-  std::string_view bytes = block_;
-  if (block_.size() > photosInBlock_ * SMALL_PHOTO) {
-    uLongf size = compressBound(block_.size());
-    compressed.resize(size);
-    auto* const begin = reinterpret_cast<Bytef*>(compressed.data());
-    if (compress2(begin, &size, Unsigned(block_.data()), block_.size(), LEVEL) != Z_OK) {
-      throw std::bad_alloc();
-    }
-    if (size < block_.size()) {
-      bytes = std::string_view(compressed).substr(0, size);
-    }
+  const bool isLarge = numbers_.size() + texts_.size() > photosInBlock_ * SMALL_PHOTO;
+  for (std::string* const part : {&numbers_, &texts_}) {
+    const std::string compressed = isLarge ? Compress(*part) : *part;
+    const std::string& bytes = compressed.size() < part->size() ? compressed : *part;
+    std::string header;
+    PutFixed(header, part->size());
+    PutFixed(header, bytes.size());
+    Write(header);
+    Write(bytes);
+    part->clear();
   }
-  std::string header;
-  PutFixed(header, block_.size());
-  PutFixed(header, bytes.size());
-  Write(header);
-  Write(bytes);
-  block_.clear();
   photosInBlock_ = 0;
 }
 
@@ -256,19 +285,19 @@ const Photo* PhotoListReader::Next() {
     return nullptr;
   }
   --left_;
-  if (position_ == block_.size()) {
-    ReadBlock();
+  if (numbers_.IsAtEnd()) {
+    ReadPart(numbers_);
+    ReadPart(texts_);
   }
-  const std::uint64_t common = Number();
-  if (common > photo_.path.size()) {
+  const std::uint64_t prefix = Number();
+  const std::uint64_t suffix = Number();
+  if (prefix > photo_.path.size() || suffix > photo_.path.size() - prefix) {
     ThrowDamaged();
   }
-  photo_.path.resize(common);
-  AppendBytes(photo_.path, Number());
+  photo_.path.replace(prefix, photo_.path.size() - prefix - suffix, Text(Number()));
   const std::uint64_t volume = Number();
   if (volume > 0) {
-    photo_.volume.clear();
-    AppendBytes(photo_.volume, volume - 1);
+    photo_.volume = Text(volume - 1);
   }
   photo_.modified = TakeTime(photo_.modified);
   photo_.created = TakeTime(photo_.modified);
@@ -293,36 +322,31 @@ std::string_view PhotoListReader::Read(std::uint64_t offset, std::uint64_t size)
   return std::string_view(buffer_).substr(0, done);
 }
 
-void PhotoListReader::ReadBlock() {
+void PhotoListReader::ReadPart(Part& part) {
   const std::uint64_t end = size_ - TRAILER_SIZE;
-  std::string_view header =
-      Read(offset_, std::min<std::uint64_t>(BLOCK_HEADER_SIZE, end - offset_));
-  if (header.size() != BLOCK_HEADER_SIZE) {
+  std::string_view header = Read(offset_, std::min<std::uint64_t>(PART_HEADER_SIZE, end - offset_));
+  if (header.size() != PART_HEADER_SIZE) {
     ThrowDamaged();
   }
-  offset_ += BLOCK_HEADER_SIZE;
+  offset_ += PART_HEADER_SIZE;
   const std::uint64_t size = TakeFixed(header);
   const std::uint64_t stored = TakeFixed(header);
-  if (stored == 0 || stored > end - offset_ || size < stored || size / BEST_COMPRESSION > stored) {
+  if (stored > end - offset_ || size < stored || size / BEST_COMPRESSION > stored ||
+      Read(offset_, stored).size() != stored) {
     ThrowDamaged();
   }
-  const std::string_view bytes = Read(offset_, stored);
   offset_ += stored;
-  if (bytes.size() != stored) {
+  part.position = 0;
+  if (stored == size) {
+    part.bytes = buffer_;
+    return;
+  }
+  part.bytes.resize(size);
+  uLongf result = size;
+  if (uncompress(Unsigned(part.bytes.data()), &result, Unsigned(buffer_.data()), stored) != Z_OK ||
+      result != size) {
     ThrowDamaged();
   }
-  block_.resize(size);
-  if (stored == size) {
-    bytes.copy(block_.data(), size);
-  } else {
-    uLongf result = size;
-    if (uncompress(reinterpret_cast<Bytef*>(block_.data()), &result, Unsigned(bytes.data()),
-                   stored) != Z_OK ||
-        result != size) {
-      ThrowDamaged();
-    }
-  }
-  position_ = 0;
 }
 
 void PhotoListReader::ThrowDamaged() const {
@@ -332,10 +356,10 @@ void PhotoListReader::ThrowDamaged() const {
 std::uint64_t PhotoListReader::Number() {
   std::uint64_t number = 0;
   for (unsigned shift = 0; shift < 64; shift += 7) {
-    if (position_ == block_.size()) {
+    if (numbers_.IsAtEnd()) {
       ThrowDamaged();
     }
-    const auto byte = static_cast<unsigned char>(block_[position_++]);
+    const auto byte = static_cast<unsigned char>(numbers_.bytes[numbers_.position++]);
     number |= static_cast<std::uint64_t>(byte & 0x7FU) << shift;
     if (byte < 0x80U) {
       return number;
@@ -350,12 +374,13 @@ std::int64_t PhotoListReader::TakeTime(std::int64_t from) {
   return static_cast<std::int64_t>(static_cast<std::uint64_t>(from) + difference);
 }
 
-void PhotoListReader::AppendBytes(std::string& text, std::uint64_t size) {
-  if (size > block_.size() - position_) {
+std::string_view PhotoListReader::Text(std::uint64_t size) {
+  if (size > texts_.bytes.size() - texts_.position) {
     ThrowDamaged();
   }
-  text.append(block_, position_, size);
-  position_ += size;
+  const std::string_view text = std::string_view(texts_.bytes).substr(texts_.position, size);
+  texts_.position += size;
+  return text;
 }
 
 } // namespace orva::zophotos

@@ -49,13 +49,14 @@ public:
   void Finish();
 
 private:
-  /// Writes the photos that were added last.
   void WriteBlock();
   void Write(std::string_view bytes);
 
   util::FileDescriptor file_;
   std::string name_;
-  std::string block_;
+  // The photos that were added last.
+  std::string numbers_;
+  std::string texts_;
   std::size_t photosInBlock_ = 0;
   std::uint64_t photos_ = 0;
   std::uint32_t checksum_ = 0;
@@ -79,18 +80,27 @@ public:
   const Photo* Next();
 
 private:
+  /// A part of a block.
+  struct Part {
+    std::string bytes;
+    std::size_t position = 0;
+
+    bool IsAtEnd() const { return position == bytes.size(); }
+  };
+
   PhotoListReader(util::FileDescriptor file, std::string name);
 
   /// Whether the file has a valid header, trailer and checksum.
   bool Check();
   /// Reads the bytes at `offset`; fewer at the end of the file. They are valid until the next call.
   std::string_view Read(std::uint64_t offset, std::uint64_t size);
-  void ReadBlock();
+  void ReadPart(Part& part);
   [[noreturn]] void ThrowDamaged() const;
   std::uint64_t Number();
   /// Reads a time that is stored as the difference from another one.
   std::int64_t TakeTime(std::int64_t from);
-  void AppendBytes(std::string& text, std::uint64_t size);
+  /// The next text; valid until the next part is read.
+  std::string_view Text(std::uint64_t size);
 
   util::FileDescriptor file_;
   std::string name_;
@@ -100,9 +110,9 @@ private:
   std::uint64_t left_ = 0;   ///< photos that were not read yet
   std::uint64_t offset_ = 0; ///< of the next block
   std::string buffer_;       ///< bytes of the file
-  std::string block_;
-  std::size_t position_ = 0; ///< in the block
-  Photo photo_;              ///< the last one
+  Part numbers_;
+  Part texts_;
+  Photo photo_; ///< the last one
 };
 
 } // namespace orva::zophotos
