@@ -88,7 +88,7 @@ stop_postgresql() {
 await_gone() { await eval "! kill -0 $1"; }
 
 # Waiting too long for a lock is an error.
-servers=/tmp/server
+servers=${servers:-/tmp/server}
 use_postgresql() {
   export PGHOST=$servers PGUSER=postgres PGDATABASE=fleet PGTZ=UTC
   export PGOPTIONS="-c lock_timeout=${deadline}s"
@@ -142,10 +142,35 @@ on_shard() { curl --silent --show-error --fail-with-body "http://shard$1:8123/" 
 
 kill_shard() {
   kill -KILL "${shards[$1]}"
-  wait "${shards[$1]}" || true
+  wait "${shards[$1]}" 2>/dev/null || true
 }
 
 stop_shard() {
   kill "${shards[$1]}"
   wait "${shards[$1]}"
+}
+
+# --- The content -------------------------------------------------------------------------------
+
+# exported DATABASE APPLIANCE: its photos in the form and order of an export.
+exported() {
+  case $1 in
+  postgresql)
+    sql postgres --set appliance="$2" <<'END'
+COPY (SELECT path, volume, to_char(modified, 'YYYY-MM-DD"T"HH24:MI:SS"Z"') AS modified,
+             to_char(created, 'YYYY-MM-DD"T"HH24:MI:SS"Z"') AS created
+        FROM photos
+       WHERE appliance = :'appliance'
+       ORDER BY regexp_replace(path, '[^/]*$', ''), path, modified)
+  TO STDOUT (FORMAT csv, HEADER, FORCE_QUOTE (path, volume));
+END
+    ;;
+  clickhouse)
+    echo path,volume,modified,created
+    on_shard 1 "SELECT concat('\"', replaceAll(path, '\"', '\"\"'), '\",\"', volume, '\",', modified, ',', created)
+        FROM fleet.photos WHERE appliance = '${2//\'/\\\'}'
+       GROUP BY path, volume, modified, created, copy HAVING sum(sign) > 0
+       ORDER BY replaceRegexpOne(path, '[^/]*\$', ''), path, modified FORMAT TSVRaw"
+    ;;
+  esac
 }
