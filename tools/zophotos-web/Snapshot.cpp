@@ -64,6 +64,8 @@ void Log(const std::string& line) {
   std::cerr << "zophotos-web: " + zophotos::Printable(line) + '\n';
 }
 
+} // namespace
+
 /// Finds what is missing among the ids of the merged database.
 template <typename Id>
 class Missing {
@@ -87,8 +89,6 @@ private:
   std::vector<Id> ids_;
   std::vector<std::int64_t> missing_;
 };
-
-} // namespace
 
 class Snapshot::Implementation {
 public:
