@@ -180,6 +180,29 @@ TEST_F(IndexerTest, AChangeIsAnnouncedOnce) {
   EXPECT_EQ(Count(Events(volume.Path()), "Scanned"), 1);
 }
 
+TEST_F(IndexerTest, PhotosThatArriveOneByOneTakeFewStamps) {
+  const Volume volume("A", "64m");
+  fs::create_directory(volume.Path() + "/Pictures");
+  StartService();
+  StartIndexer();
+  ASSERT_TRUE(Await([&] { return Count(Events(volume.Path()), "End") == 1; }));
+  constexpr char NEWEST[] = "SELECT newestStamp FROM Identity";
+  const std::time_t begin = std::time(nullptr);
+  int photos = 0;
+  ASSERT_TRUE(Await([&] { // checks about 20 times a second
+    Write(volume.Path() + "/Pictures/" + std::to_string(photos) + ".jpg");
+    return ++photos == 250;
+  }));
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  // One stamp, and one announcement, in two seconds.
+  const Lines newest = Query(volume.Path(), NEWEST);
+  const std::time_t now = std::time(nullptr);
+  ASSERT_EQ(newest.size(), 1U);
+  EXPECT_LE(std::stoll(newest.front()), now + 1);
+  EXPECT_LE(Count(Events(volume.Path()), "End"), (now - begin) / 2 + 3);
+  EXPECT_THAT(Events(volume.Path()), Not(Contains("TranscodedBatch")));
+}
+
 TEST_F(IndexerTest, AFileWaitsWhileItIsWrittenAndOthersDoNot) {
   const Volume volume("A", "64m");
   StartService();
