@@ -49,8 +49,18 @@ void RememberedCatalogs::ForgetNewer(const std::string& mountPoint, const Catalo
   }
 }
 
+void RememberedCatalogs::StoreStamp(std::time_t stamp) {
+  if (stamp > NewestStamp()) {
+    newestStamp_ = stamp;
+    isStampUnsaved_ = true;
+  }
+  if (isStampUnsaved_) {
+    Save();
+  }
+}
+
 std::time_t RememberedCatalogs::NewestStamp() const {
-  std::time_t newest = 0;
+  std::time_t newest = newestStamp_;
   for (const auto& [key, catalog] : catalogs_) {
     newest = std::max(newest, catalog.newestStamp);
   }
@@ -69,6 +79,11 @@ void RememberedCatalogs::Save() {
               "INSERT OR REPLACE INTO Catalogs(master, mountPoint, identity, newestStamp) "
               "VALUES(?, ?, ?, ?)",
               key->first, key->second, catalog.identity, catalog.newestStamp);
+    }
+    if (isStampUnsaved_) {
+      Execute(database_, "INSERT OR REPLACE INTO Clock(id, newestStamp) VALUES(0, ?)",
+              newestStamp_);
+      isStampUnsaved_ = false;
     }
     hasFailed_ = false;
   } catch (const std::string& failure) {
@@ -107,6 +122,10 @@ void RememberedCatalogs::Read(const std::string& path) {
   Execute(database_,
           "CREATE TABLE IF NOT EXISTS Catalogs(master TEXT NOT NULL, mountPoint TEXT NOT NULL, "
           "identity TEXT NOT NULL, newestStamp INTEGER NOT NULL, PRIMARY KEY(master, mountPoint))");
+  Execute(database_, "CREATE TABLE IF NOT EXISTS Clock(id INTEGER PRIMARY KEY, "
+                     "newestStamp INTEGER NOT NULL)");
+  newestStamp_ = std::max<std::time_t>(
+      newestStamp_, catalog::SelectNumber(database_, "SELECT newestStamp FROM Clock"));
   std::map<Key, Catalog> stored;
   catalog::ForEachRow(database_, "SELECT master, mountPoint, identity, newestStamp FROM Catalogs",
                       [&stored](const db::Statement& row) {

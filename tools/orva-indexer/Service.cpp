@@ -28,6 +28,7 @@ namespace {
 using namespace std::chrono_literals;
 using catalog::VolumeRoot;
 using notify::Event;
+using service::LogError;
 using service::LogInfo;
 using service::Printable;
 using Notice = notifications::Notification::Event;
@@ -41,6 +42,12 @@ constexpr char SHARES[] = "/shares";
 constexpr char NO_VOLUME[] = "-";
 
 constexpr char MOUNT_INFO[] = "/proc/self/mountinfo";
+
+/// Whether the mount point is /shares, or above it.
+bool ContainsVolumes(const std::string& mountPoint) {
+  const std::string path = std::filesystem::path(mountPoint + '/').lexically_normal();
+  return (std::string(SHARES) + '/').starts_with(path);
+}
 
 util::FileDescriptor OpenMountInfo() {
   return notify::CheckedDescriptor(open(MOUNT_INFO, O_RDONLY | O_CLOEXEC), MOUNT_INFO);
@@ -197,6 +204,10 @@ void Service::Plug(const std::string& mountPoint, bool isDirectory) {
     }
     Forget(mountPoint);
   }
+  if (ContainsVolumes(mountPoint)) {
+    LogError("Volume " + Printable(mountPoint) + ": not indexed: the volumes are below it");
+    return;
+  }
   LogInfo("Volume " + Printable(mountPoint) + ": walking");
   const auto known = volumes_.emplace(mountPoint, std::make_unique<Known>(mountPoint, kind)).first;
   known->second->volume.HandleMounts(ReadMountPoints());
@@ -230,7 +241,7 @@ void Service::WorkOnNext() {
     remembered_.ForgetNewer(working_->volume.MountPoint(),
                             {.identity = identity, .newestStamp = newestStamp});
   };
-  const Volume::Result result = known.volume.Work([this] { Pulse(); }, found, LatestStamp());
+  const Volume::Result result = known.volume.Work([this] { Pulse(); }, found, LatestStamp(known));
   working_ = nullptr;
   if (result.isGone) {
     Forget(lastWorked_);
@@ -239,9 +250,9 @@ void Service::WorkOnNext() {
   }
 }
 
-std::time_t Service::LatestStamp() const {
-  // Without a battery the clock may be years late after a start.
-  return std::max(std::time(nullptr), remembered_.NewestStamp());
+std::time_t Service::LatestStamp(const Known& known) const {
+  // Without a battery the clock may be years late after a start, and it may be set back later.
+  return std::max({std::time(nullptr), remembered_.NewestStamp(), known.volume.NewestStamp()});
 }
 
 // --- Announcements -----------------------------------------------------------------------------
@@ -335,6 +346,7 @@ void Service::Announced(const Announcer::Announcement& announcement,
     if (*clients > 0 && master && !IsPurgeOwed(known, *master)) {
       Remember(known, *master);
     }
+    remembered_.StoreStamp(known.volume.NewestStamp());
   }
 }
 

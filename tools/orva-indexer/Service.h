@@ -68,7 +68,7 @@ private:
   bool IsPurgeOwed(const Known& known, const std::string& master) const;
   void Remember(const Known& known, const std::string& master);
   std::optional<std::string> Master() const;
-  std::time_t LatestStamp() const;
+  std::time_t LatestStamp(const Known& known) const;
   void PublishStatus();
 
   const Settings settings_;
