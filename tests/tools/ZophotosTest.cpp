@@ -3,12 +3,16 @@
 #include "support/Programs.h"
 #include "system/Deadline.h"
 
+#include <sys/mount.h>
+
+#include <cerrno>
 #include <chrono>
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
 #include <sstream>
 #include <stdexcept>
+#include <system_error>
 #include <thread>
 
 namespace orva::test {
@@ -96,6 +100,16 @@ void AwaitLooks(const Program& program) {
     ASSERT_LT(std::chrono::steady_clock::now(), end) << "the program does not look";
     std::this_thread::yield();
   }
+}
+
+EmptyStateFolder::EmptyStateFolder() {
+  if (mount("state", "/var/lib", "tmpfs", 0, nullptr) != 0) {
+    throw std::system_error(errno, std::generic_category(), "/var/lib");
+  }
+}
+
+EmptyStateFolder::~EmptyStateFolder() {
+  umount2("/var/lib", MNT_DETACH);
 }
 
 void ZophotosTest::SetUp() {

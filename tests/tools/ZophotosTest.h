@@ -52,6 +52,16 @@ void AddFiles(const Database& copy, int count, const std::string& folderId,
 /// Waits until a running zophotos has looked for changes, or tried to, several times.
 void AwaitLooks(const Program& program);
 
+/// An empty folder /var/lib for the life of the object. The machine's own may say that the services
+/// are installed.
+class EmptyStateFolder {
+public:
+  EmptyStateFolder();
+  EmptyStateFolder(const EmptyStateFolder&) = delete;
+  EmptyStateFolder& operator=(const EmptyStateFolder&) = delete;
+  ~EmptyStateFolder();
+};
+
 /// zophotos and the daemon, which has merged four volumes into A: A has all of its photos
 /// transcoded, B one of three, C has no photos, and D has one that is not transcoded.
 class ZophotosTest : public SystemTest {
@@ -69,6 +79,7 @@ protected:
 
   static inline const std::string MERGED = "/shares/A//.zophotos/zophotos.db";
 
+  const EmptyStateFolder stateFolder;
   const Volume a{"A", "150g"};
   const Volume b{"B", "120g"};
   const Volume c{"C", "1g"};

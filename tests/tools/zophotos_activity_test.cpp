@@ -79,8 +79,26 @@ TEST_F(ZophotosActivity, NamesTheCommandThatListsFailedPhotos) {
             "VOLUME      WAITING  FAILED  ACTIVITY\n"
             "/shares/A/        0       2  -\n"
             "\n"
-            "'zophotos failed' lists the failed photos with the reasons.\n",
+            "'zophotos failed' lists the failed photos with the reasons.\n"
+            "\n"
+            "orva-indexer does not run.\n",
             Added());
+}
+
+TEST_F(ZophotosActivity, NamesTheServicesThatDoNotRun) {
+  WriteVolumes(INDEXER_FOLDER, "");
+  EXPECT_EQ("\norva-transcoder does not run.\n", Added());
+  WriteVolumes(TRANSCODER_FOLDER, "");
+  EXPECT_EQ("", Added());
+  fs::remove_all(INDEXER_FOLDER);
+  EXPECT_EQ("\norva-indexer does not run.\n", Added());
+  fs::remove_all(TRANSCODER_FOLDER);
+  EXPECT_EQ("", Added());
+  fs::create_directories("/var/lib/zophotodbmerger-standalone");
+  EXPECT_EQ("\norva-indexer and orva-transcoder do not run.\n", Added());
+  EXPECT_EQ(plainJson, Zophotos({"status", "--json"}).output);
+  Copy();
+  EXPECT_THAT(OnCopy({"status"}).output, Not(HasSubstr("not run")));
 }
 
 TEST_F(ZophotosActivity, IsInTheJsonOfEachVolume) {

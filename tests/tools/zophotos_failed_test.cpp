@@ -101,7 +101,18 @@ TEST_F(ZophotosFailed, ListsThePhotosAtAPath) {
                  old + "/shares/B/a.jpg\ttoo large: 20000 x 20000 pixels\n");
   }
   ExpectOutput(Zophotos({"failed", "/shares"}), Zophotos({"failed"}).output);
+}
+
+TEST_F(ZophotosFailed, ReportsAPathWithNothing) {
+  const std::string error = "zophotos: there is no folder or file /shares/B/Ol\n";
+  ExpectError(Zophotos({"failed", "B/Ol"}), 1, error);
+  ExpectError(Zophotos({"failed", "--json", "B/Ol"}), 1, error);
+  fs::create_directories("/shares/B/Ol");
   ExpectOutput(Zophotos({"failed", "B/Ol"}), NONE);
+  std::ofstream("/shares/B/Ol/x.jpg");
+  ExpectOutput(Zophotos({"failed", "B/Ol/x.jpg"}), NONE);
+  ExpectError(Zophotos({"failed", "B/Ol/x.jpg/y"}), 1,
+              "zophotos: there is no folder or file /shares/B/Ol/x.jpg/y\n");
 }
 
 TEST_F(ZophotosFailed, ReportsAPathThatIsOnNoVolume) {

@@ -10,6 +10,7 @@ namespace orva::test {
 namespace {
 
 using ::testing::AllOf;
+using ::testing::EndsWith;
 using ::testing::HasSubstr;
 using ::testing::Not;
 using ::testing::StartsWith;
@@ -94,10 +95,10 @@ TEST_F(ZophotosStatus, RoundsPercentagesDown) {
 
 TEST_F(ZophotosStatus, ShowsAnUnpluggedVolumeAsGone) {
   appliance.Handle(Unplugged(b.Path()));
-  EXPECT_THAT(
-      Zophotos({"status"}).output,
-      AllOf(HasSubstr("/shares/B/           gone                   -        0      0  -\n"),
-            HasSubstr("TOTAL                ███████░░░  75 %     3/4        5      3  -\n")));
+  EXPECT_THAT(Zophotos({"status"}).output,
+              AllOf(HasSubstr("/shares/B/           gone                   -        0      0  -\n"),
+                    HasSubstr("TOTAL                ███████░░░  75 %     3/4        5      3  -\n"),
+                    EndsWith("\ngone: unplugged, or purged and not merged again yet.\n")));
   EXPECT_THAT(
       Zophotos({"status", "--json"}).output,
       HasSubstr(

@@ -24,6 +24,10 @@ using Document = nlohmann::json;
 constexpr const char* INDEXER = "/run/orva-indexer";
 constexpr const char* TRANSCODER = "/run/orva-transcoder";
 
+/// The package with both services has this folder while it is installed. An appliance, with
+/// services of its own, does not have it.
+constexpr const char* PACKAGE = "/var/lib/zophotodbmerger-standalone";
+
 /// The content of a regular file of at most 1 MiB.
 std::optional<std::string> ReadFile(const std::string& path) {
   constexpr std::size_t limit = 1 << 20;
@@ -109,7 +113,22 @@ std::string Describe(const Indexing& indexing) {
 } // namespace
 
 Activity ReadActivity() {
-  return {.indexer = Read(INDEXER, &ReadIndexing), .transcoder = Read(TRANSCODER, &ReadRendering)};
+  return {.indexer = Read(INDEXER, &ReadIndexing),
+          .transcoder = Read(TRANSCODER, &ReadRendering),
+          .areInstalled = access(PACKAGE, F_OK) == 0};
+}
+
+std::string DescribeStopped(const Activity& activity) {
+  if (activity.indexer && activity.transcoder) {
+    return "";
+  }
+  if (activity.transcoder) {
+    return "orva-indexer does not run.";
+  }
+  if (activity.indexer) {
+    return "orva-transcoder does not run.";
+  }
+  return activity.areInstalled ? "orva-indexer and orva-transcoder do not run." : "";
 }
 
 std::map<std::string, VolumeActivity> VolumesOf(const Activity& activity) {

@@ -33,6 +33,7 @@ struct Rendering {
 struct Activity {
   std::optional<std::map<std::string, Indexing>> indexer;     ///< nothing if it does not run
   std::optional<std::map<std::string, Rendering>> transcoder; ///< nothing if it does not run
+  bool areInstalled = false; ///< the services belong to this machine
 
   bool operator==(const Activity&) const = default;
 };
@@ -43,6 +44,10 @@ struct VolumeActivity {
   const Indexing* indexing = nullptr;
   const Rendering* rendering = nullptr;
 };
+
+/// The services that do not run although they are installed or the other one runs:
+/// "orva-indexer does not run."; empty if there is none.
+std::string DescribeStopped(const Activity& activity);
 
 /// Reads the status files of the services. A missing or malformed file counts as a service that
 /// does not run: systemd removes the file when the service ends.

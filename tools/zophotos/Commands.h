@@ -65,7 +65,8 @@ ExitStatus FindItems(const std::string& path, const Search& search, Form form);
 
 /// Lists the photos that could not be rendered, with the reasons, from the catalogs of the volumes
 /// that the merged database or a service names. `path` selects those of a volume, or in a folder,
-/// see Spellings; all if it is empty. `escapes` is as in Listing.
+/// see Spellings; all if it is empty. Throws Failure if nothing is there. `escapes` is as in
+/// Listing.
 ExitStatus ListFailedPhotos(const FindPath& findPath, const Activity& services,
                             const std::string& path, bool escapes, Form form);
 

@@ -30,6 +30,11 @@ namespace orva::zophotos {
 
 namespace {
 
+bool IsMissing(const std::string& path) {
+  struct stat status {};
+  return lstat(path.c_str(), &status) != 0 && (errno == ENOENT || errno == ENOTDIR);
+}
+
 /// Whether a merged database may name this volume: a folder directly in the shares root. The
 /// database is untrusted, and reading a catalog in WAL mode creates files next to it.
 bool IsInSharesRoot(const std::string& mountPoint) {
@@ -96,6 +101,17 @@ public:
   bool Touches(const std::string& mountPoint) const {
     return IsAny([&](const std::string& folder) {
       return mountPoint.starts_with(folder) || folder.starts_with(mountPoint);
+    });
+  }
+
+  /// Whether all photos are selected, or one of `volumes` can have the path: the path is a mount
+  /// point or above one, or there is a file or folder.
+  bool IsKnown(const std::set<std::string>& volumes) const {
+    return IsAny([&](const std::string& folder) {
+      return std::ranges::any_of(
+                 volumes,
+                 [&](const std::string& mountPoint) { return mountPoint.starts_with(folder); }) ||
+             !IsMissing(folder.substr(0, folder.size() - 1));
     });
   }
 
@@ -197,8 +213,7 @@ std::string Reason(const std::string& message) {
 /// read, or if there is none: the volume is unplugged or not indexed yet.
 std::optional<std::string> Read(const std::string& mountPoint, const std::string& catalog,
                                 const Selection& selection, FailedPhotos& photos) {
-  struct stat status {};
-  if (lstat(catalog.c_str(), &status) != 0 && (errno == ENOENT || errno == ENOTDIR)) {
+  if (IsMissing(catalog)) {
     return std::nullopt;
   }
   if (access(catalog.c_str(), R_OK) != 0 && errno == EACCES) {
@@ -227,9 +242,10 @@ bool Print(FailedPhotos& photos, bool escapes, Form form) {
   return any;
 }
 
-/// Lists the failed photos of `volumes`.
+/// Lists the failed photos of `volumes`. Throws Failure with `missing` if nothing is known at the
+/// selected path.
 ExitStatus ListFailed(const std::set<std::string>& volumes, const Selection& selection,
-                      bool escapes, Form form) {
+                      const std::string& missing, bool escapes, Form form) {
   FailedPhotos photos;
   bool isComplete = true;
   for (const std::string& mountPoint : volumes) {
@@ -239,8 +255,11 @@ ExitStatus ListFailed(const std::set<std::string>& volumes, const Selection& sel
       std::cerr << "zophotos: " << Printable(catalog + ": " + *reason) << '\n';
     }
   }
-  if (!Print(photos, escapes, form) && isComplete && form == Form::Text) {
-    std::cout << "No photo has failed.\n";
+  if (!Print(photos, escapes, form) && isComplete) {
+    if (!selection.IsKnown(volumes)) {
+      throw Failure(ExitStatus::Negative, missing);
+    }
+    std::cout << (form == Form::Text ? "No photo has failed.\n" : "");
   }
   return isComplete ? ExitStatus::Success : ExitStatus::Negative;
 }
@@ -255,8 +274,10 @@ ExitStatus ListFailedPhotos(const FindPath& findPath, const Activity& services,
   if (!path.empty() && volumes.empty()) {
     throw Failure(ExitStatus::Negative, Spellings(path).front() + " is not on a volume");
   }
+  const std::string missing =
+      path.empty() ? "" : "there is no folder or file " + Spellings(path).front();
   try {
-    return ListFailed(volumes, selection, escapes, form);
+    return ListFailed(volumes, selection, missing, escapes, form);
   } catch (const SQLite::Exception& error) {
     throw Failure(ExitStatus::Failed, Explain(error, "the list"));
   }

@@ -23,6 +23,8 @@ struct Row {
 /// The time in the status row of a new database, which was never emptied.
 constexpr std::int64_t NEVER_EMPTIED = 1000;
 
+constexpr const char* GONE = "gone: unplugged, or purged and not merged again yet.";
+
 /// How the numbers of photos and files differ.
 constexpr const char* LEGEND[] = {
     "PHOTOS: transcoded / all of a volume, without hidden ones, at its last merge.",
@@ -100,7 +102,7 @@ Table MakeTable(const std::string& path, const VolumeStatuses& volumes, int barW
   return table;
 }
 
-void PrintLegend(std::optional<std::size_t> width) {
+void PrintLegend(bool anyIsGone, std::optional<std::size_t> width) {
   if (width &&
       std::ranges::any_of(LEGEND, [&](const char* line) { return Width(line) > *width; })) {
     return;
@@ -108,6 +110,9 @@ void PrintLegend(std::optional<std::size_t> width) {
   std::cout << '\n';
   for (const char* const line : LEGEND) {
     std::cout << line << '\n';
+  }
+  if (anyIsGone) {
+    std::cout << GONE << '\n';
   }
 }
 
@@ -121,10 +126,11 @@ void PrintVolumes(const std::string& path, const VolumeStatuses& volumes) {
   const Table table = MakeTable(path, volumes, 10);
   const bool fits = !width || table.NarrowestWidth() <= *width;
   (fits ? table : MakeTable(path, volumes, 0)).Print(std::cout, width);
-  PrintLegend(width);
+  PrintLegend(std::ranges::any_of(volumes, [](const auto& volume) { return volume.second.isGone; }),
+              width);
 }
 
-/// Prints what the services are doing.
+/// Prints what the services are doing with each volume.
 void PrintActivity(const Activity& services) {
   const auto volumes = VolumesOf(services);
   if (volumes.empty()) {
@@ -155,6 +161,9 @@ void PrintStatusText(const std::string& path, const std::optional<Row>& row,
             << (row ? LocalTimeOrDash(row->stamp, NEVER_EMPTIED) : "-") << "\n\n";
   PrintVolumes(path, volumes);
   PrintActivity(services);
+  if (const std::string stopped = DescribeStopped(services); !stopped.empty()) {
+    std::cout << '\n' << stopped << '\n';
+  }
 }
 
 void PrintStatusJson(const std::string& path, const std::optional<Row>& row,

@@ -54,7 +54,8 @@ public:
         return false;
       }
     } catch (const UsageError& error) {
-      throw UsageError(error.what() + DashHint(), error.Command());
+      const std::string hint = PlaceHint();
+      throw UsageError(hint.empty() ? error.what() + DashHint() : hint, error.Command());
     }
     return true;
   }
@@ -114,6 +115,21 @@ private:
   const CLI::App* Command() const {
     const auto commands = app_.get_subcommands();
     return commands.empty() ? nullptr : commands.front();
+  }
+
+  /// The message for an option of a command that is before the command, or without one; otherwise
+  /// empty.
+  std::string PlaceHint() const {
+    const std::vector<std::string> rest = app_.remaining(true);
+    if (rest.empty() || rest.front() == "--") {
+      return "";
+    }
+    const CLI::App& command = Command() == nullptr ? *status_ : *Command();
+    const std::string option = rest.front().substr(0, rest.front().find('='));
+    return option.starts_with('-') && command.get_option_no_throw(option) != nullptr
+               ? "option " + option + " belongs after the command: zophotos " + command.get_name() +
+                     " " + option
+               : "";
   }
 
   /// How to search for a name that was taken for an unknown option; otherwise empty.
