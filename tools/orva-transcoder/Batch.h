@@ -18,7 +18,8 @@ struct BatchPhoto {
   bool isRaw = false;    ///< of a camera: rendered from the preview in it
   /// Why there is no rendition; empty while it is not known, and when there is one.
   std::string failure{};
-  bool isOutdated = false; ///< the photo was changed since: the result is not used
+  bool isPostponed = false; ///< not rendered, for a reason that may pass: see Volume::Postpone
+  bool isOutdated = false;  ///< the photo was changed since: the result is not used
 };
 
 /// Photos of one volume that are rendered together.

@@ -48,6 +48,11 @@ constexpr std::size_t MOST_EXAMINED = 1000;   // photos in one piece of work
 constexpr std::size_t MOST_REMOVALS = 10'000; // in one piece of work
 constexpr std::chrono::seconds RETRY(60);
 constexpr std::chrono::milliseconds PIECE(200);
+// A photo is postponed for 15, 30, ... 480 s: 16 minutes. If the reason was a shortage of memory,
+// it has usually passed by then.
+constexpr int MOST_POSTPONEMENTS = 6;
+constexpr std::chrono::seconds FIRST_POSTPONEMENT(15);
+constexpr std::chrono::hours REMEMBERED(1); // after the end of a postponement
 
 constexpr std::array<std::string_view, 7> RAW_EXTENSIONS = {"arw", "cr2", "dng", "nef",
                                                             "orf", "raf", "rw2"};
@@ -198,6 +203,7 @@ bool Volume::IsThere() const {
 void Volume::Look() {
   isExhausted_ = true;
   lookAgainAt_.reset();
+  EndPostponements();
   Attempt([this] {
     const auto volume = Open();
     if (!volume) {
@@ -266,7 +272,8 @@ std::unique_ptr<Batch> Volume::Stage(const std::string& path, const BatchLimits&
       const auto photos = last_ ? catalog::NewestWaiting(*volume->catalog, MOST_LISTED, *last_)
                                 : catalog::NewestWaiting(*volume->catalog, MOST_LISTED);
       for (const WaitingPhoto& photo : photos) {
-        isFull = !isInBatch(photo.id) && !StagePhoto(*volume, photo, next, room);
+        isFull =
+            !isInBatch(photo.id) && !IsPostponed(photo) && !StagePhoto(*volume, photo, next, room);
         if (isFull) {
           break;
         }
@@ -283,6 +290,62 @@ std::unique_ptr<Batch> Volume::Stage(const std::string& path, const BatchLimits&
     }
   });
   return batch;
+}
+
+std::optional<Volume::Clock::time_point> Volume::LookAgainAt() const {
+  return lookAgainAt_ ? lookAgainAt_ : endPostponementsAt_;
+}
+
+bool Volume::Postpone(const WaitingPhoto& photo) {
+  Postponed& entry = postponed_[photo.id];
+  if (entry.lastModifiedDate != photo.lastModifiedDate || entry.size != photo.size) {
+    entry = {.lastModifiedDate = photo.lastModifiedDate, .size = photo.size};
+  }
+  if (entry.times == MOST_POSTPONEMENTS) {
+    postponed_.erase(photo.id);
+    return false;
+  }
+  entry.until = Clock::now() + FIRST_POSTPONEMENT * (1 << entry.times);
+  ++entry.times;
+  endPostponementsAt_ = std::min(endPostponementsAt_.value_or(entry.until), entry.until);
+  return true;
+}
+
+bool Volume::IsPostponed(const WaitingPhoto& photo) const {
+  const auto entry = postponed_.find(photo.id);
+  return entry != postponed_.end() && Clock::now() < entry->second.until &&
+         entry->second.lastModifiedDate == photo.lastModifiedDate &&
+         entry->second.size == photo.size;
+}
+
+/// Those that end later have to be ended then.
+void Volume::EndPostponements() {
+  const auto now = Clock::now();
+  endPostponementsAt_.reset();
+  std::erase_if(postponed_, [&](const auto& item) { return item.second.until + REMEMBERED < now; });
+  for (const auto& [id, entry] : postponed_) {
+    if (entry.until > now) {
+      endPostponementsAt_ = std::min(endPostponementsAt_.value_or(entry.until), entry.until);
+    }
+  }
+}
+
+/// The programs of the postponed photos were killed. Each of these photos was alone in its process.
+void Volume::FailPostponed(Batch& batch) {
+  for (BatchPhoto& photo : batch.photos) {
+    const auto number = static_cast<std::size_t>(&photo - batch.photos.data());
+    if (!std::exchange(photo.isPostponed, false) || photo.isOutdated) {
+      continue;
+    }
+    batch.folder.Remove(number);
+    if (postponed_.empty()) {
+      LogInfo("the program that renders " + Printable(mountPoint_ + photo.photo.path) +
+              " was killed: it is tried again");
+    }
+    if (!Postpone(photo.photo)) {
+      photo.failure = "needs too much memory: the program that renders it was killed repeatedly";
+    }
+  }
 }
 
 bool Volume::StagePhoto(const Opened& volume, const WaitingPhoto& photo, Batch& batch, Room& room) {
@@ -345,6 +408,7 @@ Volume::Stored Volume::Store(Batch& batch) {
     const auto volume = Open();
     if (volume && volume->identity == batch.identity) {
       const std::set<long long> written = WriteRenditions(*volume, batch);
+      FailPostponed(batch);
       MarkResults(*volume, batch, written);
       problem_.clear();
     }
@@ -362,7 +426,7 @@ std::set<long long> Volume::WriteRenditions(const Opened& volume, Batch& batch) 
     struct stat status {};
     photo.isOutdated =
         !file || fstat(file.Get(), &status) != 0 || !IsSameContent(status, photo.status);
-    if (photo.isOutdated || !photo.failure.empty()) {
+    if (photo.isOutdated || photo.isPostponed || !photo.failure.empty()) {
       continue;
     }
     const util::FileDescriptor rendition = batch.folder.OpenOutput(number);
