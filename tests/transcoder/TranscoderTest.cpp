@@ -53,6 +53,12 @@ void TranscoderTest::StartTranscoder() {
   service_->ReadLineWith("connected");
 }
 
+void TranscoderTest::RestartInFileSystem(const std::string& size) {
+  KillTranscoder();
+  RunChecked({"mount", "-t", "tmpfs", "-o", "size=" + size, "staging", RUNTIME});
+  StartTranscoder();
+}
+
 void TranscoderTest::Announce(const std::string& event, const std::string& mountPoint) {
   RunChecked({ProgramPath("orva-notify"), "send", event, mountPoint});
 }

@@ -25,6 +25,8 @@ protected:
 
   void StartService();
   void StartTranscoder();
+  /// Gives the transcoder a working folder in a file system of its own: "100m".
+  void RestartInFileSystem(const std::string& size);
   /// Kills the transcoder.
   void KillTranscoder() { transcoder_.reset(); }
   Program& Transcoder() { return *transcoder_; }

@@ -187,14 +187,14 @@ private:
     batch_.photos[number].failure = reason;
   }
 
-  /// The same for what a program has said. If no program works, or something else has killed it,
-  /// that is not due to the photo.
+  /// The same for what a program has said. If no program works, something else has killed it, or
+  /// the space for its output is used up, that is not due to the photo.
   void Fail(std::size_t number, const Ending& ending, const Limits& limits) {
     if (!isSandboxTested_) {
       TestSandbox();
       isSandboxTested_ = true;
     }
-    if (ending.WasKilled()) {
+    if (ending.WasKilled() || Contains(ending.error, "No space left on device")) {
       batch_.photos[number].isPostponed = true;
     } else {
       Fail(number, Reason(ending, limits));

@@ -16,6 +16,7 @@
 #include "orvautil/Core.h"
 #include "orvautil/Exception.h"
 #include "orvautil/FileDescriptor.h"
+#include "orvautil/FormatString.h"
 #include "service/Log.h"
 
 #include <fcntl.h>
@@ -53,6 +54,8 @@ constexpr std::chrono::milliseconds PIECE(200);
 constexpr int MOST_POSTPONEMENTS = 6;
 constexpr std::chrono::seconds FIRST_POSTPONEMENT(15);
 constexpr std::chrono::hours REMEMBERED(1); // after the end of a postponement
+
+constexpr char NO_SPACE[] = "no space in memory to copy the file";
 
 constexpr std::array<std::string_view, 7> RAW_EXTENSIONS = {"arw", "cr2", "dng", "nef",
                                                             "orf", "raf", "rw2"};
@@ -292,6 +295,13 @@ std::unique_ptr<Batch> Volume::Stage(const std::string& path, const BatchLimits&
   return batch;
 }
 
+/// Postpones the photo, or adds it to the batch as failed if that was done often enough.
+void Volume::LeaveOut(BatchPhoto photo, Batch& batch) {
+  if (!Postpone(photo.photo)) {
+    batch.photos.push_back(std::move(photo));
+  }
+}
+
 std::optional<Volume::Clock::time_point> Volume::LookAgainAt() const {
   return lookAgainAt_ ? lookAgainAt_ : endPostponementsAt_;
 }
@@ -368,9 +378,21 @@ bool Volume::StagePhoto(const Opened& volume, const WaitingPhoto& photo, Batch& 
         {.photo = photo, .status = status, .failure = "the file is larger than 512 MiB"});
     return true;
   }
+  if (status.st_size > room.limits.most) {
+    batch.photos.push_back({.photo = photo,
+                            .status = status,
+                            .failure = util::FormatString("the file is larger than the %lld MiB "
+                                                          "that copies of photos may take",
+                                                          room.limits.most >> 20)});
+    return true;
+  }
   const long long limit = room.used == 0 ? room.limits.space : room.limits.bytes;
   if (room.used + status.st_size > limit) {
-    return false;
+    if (!room.limits.isOnly || !batch.photos.empty()) {
+      return false; // until the other batches have ended
+    }
+    LeaveOut({.photo = photo, .status = status, .failure = NO_SPACE}, batch);
+    return true;
   }
   int error = CopyExactly(file, batch.folder.Add(number), status.st_size);
   struct stat after {};
@@ -385,13 +407,12 @@ bool Volume::StagePhoto(const Opened& volume, const WaitingPhoto& photo, Batch& 
     room.used += status.st_size;
     batch.photos.push_back({.photo = photo, .status = status, .isRaw = IsRaw(photo.path, file)});
     return true;
-  case ENOSPC: {
-    const bool isAlone = room.used == 0;
-    if (isAlone) {
-      LogError("no space in memory to copy " + Printable(mountPoint_ + photo.path));
+  case ENOSPC:
+    if (!room.limits.isOnly || !batch.photos.empty()) {
+      return false;
     }
-    return isAlone;
-  }
+    LeaveOut({.photo = photo, .status = status, .failure = NO_SPACE}, batch);
+    return true;
   case EIO:
     batch.photos.push_back(
         {.photo = photo, .status = status, .failure = "cannot be read: " + ErrorText(error)});

@@ -26,6 +26,8 @@ struct BatchLimits {
   std::size_t photos = 0;
   long long bytes = 0; ///< for the copies of several photos
   long long space = 0; ///< bytes for the copy of a single photo
+  long long most = 0;  ///< the same when nothing else is there
+  bool isOnly = true;  ///< there is no other batch
 };
 
 /// A volume whose photos are rendered. Each operation is one piece of work: it opens the volume and
@@ -109,6 +111,7 @@ private:
   bool IsPostponed(const catalog::WaitingPhoto& photo) const;
   void EndPostponements();
   void FailPostponed(Batch& batch);
+  void LeaveOut(BatchPhoto photo, Batch& batch);
   /// Adds the photo to the batch, or leaves it out until the next message. Returns false if the
   /// batch has no room for it.
   bool StagePhoto(const Opened& volume, const catalog::WaitingPhoto& photo, Batch& batch,
