@@ -28,6 +28,7 @@ namespace {
 using Numbers = std::vector<std::size_t>;
 
 constexpr long long MOST_PIXELS = 250'000'000;
+constexpr char KILLED[] = "the program that renders it was killed, perhaps for lack of memory";
 constexpr std::size_t LARGEST_PREVIEW = std::size_t{64} << 20;
 
 /// Writes the largest preview of each raw photo, "$@", to its output. A preview without an
@@ -172,11 +173,11 @@ public:
   }
 
 private:
-  /// The photos that are not postponed and have not failed.
+  /// The photos that have not failed and met no obstacle.
   Numbers Remaining() const {
     Numbers numbers;
     for (std::size_t number = 0; number < batch_.photos.size(); ++number) {
-      if (batch_.photos[number].failure.empty() && !batch_.photos[number].isPostponed) {
+      if (batch_.photos[number].failure.empty() && batch_.photos[number].obstacle.empty()) {
         numbers.push_back(number);
       }
     }
@@ -194,8 +195,10 @@ private:
       TestSandbox();
       isSandboxTested_ = true;
     }
-    if (ending.WasKilled() || Contains(ending.error, "No space left on device")) {
-      batch_.photos[number].isPostponed = true;
+    if (ending.WasKilled()) {
+      batch_.photos[number].obstacle = KILLED;
+    } else if (Contains(ending.error, "No space left on device")) {
+      batch_.photos[number].obstacle = "no space in memory to render it";
     } else {
       Fail(number, Reason(ending, limits));
     }
@@ -232,7 +235,7 @@ private:
         wasKilled = Extract({number}).WasKilled(); // it may be missing because of another photo
       }
       if (wasKilled) {
-        batch_.photos[number].isPostponed = true;
+        batch_.photos[number].obstacle = KILLED;
       } else if (HasOutput(number)) {
         batch_.folder.UseOutputAsInput(number);
       } else {

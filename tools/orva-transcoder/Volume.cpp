@@ -297,7 +297,7 @@ std::unique_ptr<Batch> Volume::Stage(const std::string& path, const BatchLimits&
 
 /// Postpones the photo, or adds it to the batch as failed if that was done often enough.
 void Volume::LeaveOut(BatchPhoto photo, Batch& batch) {
-  if (!Postpone(photo.photo)) {
+  if (!Postpone(photo.photo, photo.failure)) {
     batch.photos.push_back(std::move(photo));
   }
 }
@@ -306,7 +306,10 @@ std::optional<Volume::Clock::time_point> Volume::LookAgainAt() const {
   return lookAgainAt_ ? lookAgainAt_ : endPostponementsAt_;
 }
 
-bool Volume::Postpone(const WaitingPhoto& photo) {
+bool Volume::Postpone(const WaitingPhoto& photo, const std::string& reason) {
+  if (postponed_.empty()) {
+    LogInfo(Printable(mountPoint_ + photo.path) + " is tried again later: " + reason);
+  }
   Postponed& entry = postponed_[photo.id];
   if (entry.lastModifiedDate != photo.lastModifiedDate || entry.size != photo.size) {
     entry = {.lastModifiedDate = photo.lastModifiedDate, .size = photo.size};
@@ -340,20 +343,16 @@ void Volume::EndPostponements() {
   }
 }
 
-/// The programs of the postponed photos were killed. Each of these photos was alone in its process.
-void Volume::FailPostponed(Batch& batch) {
-  for (BatchPhoto& photo : batch.photos) {
-    const auto number = static_cast<std::size_t>(&photo - batch.photos.data());
-    if (!std::exchange(photo.isPostponed, false) || photo.isOutdated) {
+void Volume::PostponeOrFail(Batch& batch) {
+  for (std::size_t number = 0; number < batch.photos.size(); ++number) {
+    BatchPhoto& photo = batch.photos[number];
+    const std::string obstacle = std::exchange(photo.obstacle, {});
+    if (obstacle.empty() || photo.isOutdated) {
       continue;
     }
     batch.folder.Remove(number);
-    if (postponed_.empty()) {
-      LogInfo("the program that renders " + Printable(mountPoint_ + photo.photo.path) +
-              " was killed: it is tried again");
-    }
-    if (!Postpone(photo.photo)) {
-      photo.failure = "needs too much memory: the program that renders it was killed repeatedly";
+    if (!Postpone(photo.photo, obstacle)) {
+      photo.failure = obstacle;
     }
   }
 }
@@ -429,7 +428,7 @@ Volume::Stored Volume::Store(Batch& batch) {
     const auto volume = Open();
     if (volume && volume->identity == batch.identity) {
       const std::set<long long> written = WriteRenditions(*volume, batch);
-      FailPostponed(batch);
+      PostponeOrFail(batch);
       MarkResults(*volume, batch, written);
       problem_.clear();
     }
@@ -447,7 +446,7 @@ std::set<long long> Volume::WriteRenditions(const Opened& volume, Batch& batch) 
     struct stat status {};
     photo.isOutdated =
         !file || fstat(file.Get(), &status) != 0 || !IsSameContent(status, photo.status);
-    if (photo.isOutdated || photo.isPostponed || !photo.failure.empty()) {
+    if (photo.isOutdated || !photo.obstacle.empty() || !photo.failure.empty()) {
       continue;
     }
     const util::FileDescriptor rendition = batch.folder.OpenOutput(number);

@@ -107,10 +107,10 @@ private:
   void Count(const db::VolumeDB& catalog);
   void RemoveVanished(const Opened& volume);
   /// Leaves the photo out for some time. Returns false if that was done often enough.
-  bool Postpone(const catalog::WaitingPhoto& photo);
+  bool Postpone(const catalog::WaitingPhoto& photo, const std::string& reason);
   bool IsPostponed(const catalog::WaitingPhoto& photo) const;
   void EndPostponements();
-  void FailPostponed(Batch& batch);
+  void PostponeOrFail(Batch& batch);
   void LeaveOut(BatchPhoto photo, Batch& batch);
   /// Adds the photo to the batch, or leaves it out until the next message. Returns false if the
   /// batch has no room for it.
