@@ -45,11 +45,12 @@ void TranscoderTest::StartService() {
   service_->ReadLineWith("listening");
 }
 
-void TranscoderTest::StartTranscoder() {
+void TranscoderTest::StartTranscoder(const Lines& launcher) {
+  Program::Arguments command = launcher;
+  command.push_back(ProgramPath("orva-transcoder"));
   transcoder_ = std::make_unique<Program>(
-      Program::Arguments{ProgramPath("orva-transcoder")},
-      Program::Options{.errors = Program::Errors::Inherited,
-                       .environment = {"RUNTIME_DIRECTORY=" + std::string(RUNTIME)}});
+      command, Program::Options{.errors = Program::Errors::Inherited,
+                                .environment = {"RUNTIME_DIRECTORY=" + std::string(RUNTIME)}});
   service_->ReadLineWith("connected");
 }
 

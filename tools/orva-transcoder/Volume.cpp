@@ -365,10 +365,16 @@ bool Volume::StagePhoto(const Opened& volume, const WaitingPhoto& photo, Batch& 
   // To open a device may have an effect: look before.
   struct stat status {};
   const util::FileDescriptor entry = volume.root.Open(photo.path, O_PATH);
-  if (!entry || fstat(entry.Get(), &status) != 0 || !S_ISREG(status.st_mode)) {
+  if (!entry || fstat(entry.Get(), &status) != 0 || !IsPhoto(status, photo)) {
     return true; // the indexer will notice what has changed
   }
   const util::FileDescriptor file = volume.root.Open(photo.path, O_RDONLY);
+  const int problem = file ? 0 : errno;
+  if (problem == EACCES || problem == EPERM || problem == EIO) {
+    batch.photos.push_back(
+        {.photo = photo, .status = status, .failure = "cannot be opened: " + ErrorText(problem)});
+    return true;
+  }
   if (!file || fstat(file.Get(), &status) != 0 || !IsPhoto(status, photo)) {
     return true;
   }
