@@ -45,12 +45,19 @@ void TranscoderTest::StartService() {
   service_->ReadLineWith("listening");
 }
 
-void TranscoderTest::StartTranscoder() {
+void TranscoderTest::StartTranscoder(const Lines& launcher) {
+  Program::Arguments command = launcher;
+  command.push_back(ProgramPath("orva-transcoder"));
   transcoder_ = std::make_unique<Program>(
-      Program::Arguments{ProgramPath("orva-transcoder")},
-      Program::Options{.errors = Program::Errors::Inherited,
-                       .environment = {"RUNTIME_DIRECTORY=" + std::string(RUNTIME)}});
+      command, Program::Options{.errors = Program::Errors::Inherited,
+                                .environment = {"RUNTIME_DIRECTORY=" + std::string(RUNTIME)}});
   service_->ReadLineWith("connected");
+}
+
+void TranscoderTest::RestartInFileSystem(const std::string& size) {
+  KillTranscoder();
+  RunChecked({"mount", "-t", "tmpfs", "-o", "size=" + size, "staging", RUNTIME});
+  StartTranscoder();
 }
 
 void TranscoderTest::Announce(const std::string& event, const std::string& mountPoint) {

@@ -24,7 +24,10 @@ protected:
   void TearDown() override;
 
   void StartService();
-  void StartTranscoder();
+  /// `launcher`: a program with its options that runs it.
+  void StartTranscoder(const Lines& launcher = {});
+  /// Gives the transcoder a working folder in a file system of its own: "100m".
+  void RestartInFileSystem(const std::string& size);
   /// Kills the transcoder.
   void KillTranscoder() { transcoder_.reset(); }
   Program& Transcoder() { return *transcoder_; }

@@ -122,6 +122,14 @@ TEST_F(Sandbox, IsEndedWhenItTakesTooLong) {
   EXPECT_NE(test::Run({"pidof", "sleep"}).status, 0) << left.status;
 }
 
+TEST_F(Sandbox, AKillFromOutsideIsNotSlowness) {
+  const Ending killed = Shell("kill -KILL $$");
+  EXPECT_EQ(killed.status, 128 + SIGKILL);
+  EXPECT_FALSE(killed.wasTooSlow);
+  EXPECT_TRUE(killed.WasKilled());
+  EXPECT_FALSE(Shell("sleep 1000", {.time = std::chrono::seconds(1)}).WasKilled());
+}
+
 TEST_F(Sandbox, IsLimitedInMemoryAndInTheSizeOfFiles) {
   WriteBytes("/tmp/in/large", "$x = 'x'; $x = 'x' x (300 << 20);\n");
   EXPECT_EQ(Shell("perl /in/large", {.memory = 1U << 30}).status, 0);

@@ -79,4 +79,20 @@ TEST_F(TranscoderKill, ProgramsInTheSandboxEndWithTheService) {
   EXPECT_TRUE(Await([&] { return !isRendering(); }));
 }
 
+TEST_F(TranscoderKill, APhotoWhoseProgramIsKilledIsRenderedLater) {
+  MakeSlowPhoto(At("slow.png"));
+  AddWaiting("slow.png");
+  Announce("scanned");
+  std::string program;
+  ASSERT_TRUE(Await([&program] {
+    program = test::Run({"pidof", "-s", "vipsthumbnail"}).output;
+    return !program.empty();
+  }));
+  ASSERT_EQ(kill(std::stoi(program), SIGKILL), 0);
+  ASSERT_TRUE(AwaitSent("\"End\""));
+  EXPECT_EQ(StateOf("slow.png"), "waiting");
+  EXPECT_TRUE(Await([this] { return StateOf("slow.png") != "waiting"; }));
+  EXPECT_EQ(StateOf("slow.png"), "finished");
+}
+
 } // namespace

@@ -18,6 +18,8 @@ struct BatchPhoto {
   bool isRaw = false;    ///< of a camera: rendered from the preview in it
   /// Why there is no rendition; empty while it is not known, and when there is one.
   std::string failure{};
+  /// Why it was not rendered, if that may pass: it is tried again later. Otherwise empty.
+  std::string obstacle{};
   bool isOutdated = false; ///< the photo was changed since: the result is not used
 };
 

@@ -28,14 +28,16 @@ namespace {
 using Numbers = std::vector<std::size_t>;
 
 constexpr long long MOST_PIXELS = 250'000'000;
+constexpr char KILLED[] = "the program that renders it was killed, perhaps for lack of memory";
 constexpr std::size_t LARGEST_PREVIEW = std::size_t{64} << 20;
 
 /// Writes the largest preview of each raw photo, "$@", to its output. A preview without an
-/// orientation gets that of the photo.
+/// orientation gets that of the photo. Ends as exiv2 when that is killed.
 constexpr char PREVIEW_SCRIPT[] = R"sh(
 for n; do
   rm -f /tmp/*
   exiv2 -q -f -ep -l /tmp "/in/$n"
+  [ $? -ne 137 ] || exit 137
   preview=$(ls -S /tmp | head -n 1)
   [ -n "$preview" ] || continue
   if [ -z "$(exiv2 -q -Pv -K Exif.Image.Orientation "/tmp/$preview")" ]; then
@@ -128,8 +130,7 @@ std::string Reason(const Ending& ending, const Limits& limits) {
     return util::FormatString("took longer than %lld s",
                               static_cast<long long>(limits.processorTime.count()));
   }
-  if (ending.status == 128 + SIGKILL || Contains(ending.error, "out of memory") ||
-      Contains(ending.error, "unable to allocate") ||
+  if (Contains(ending.error, "out of memory") || Contains(ending.error, "unable to allocate") ||
       Contains(ending.error, "failed to allocate") ||
       Contains(ending.error, "nsufficient memory") ||
       Contains(ending.error, "annot allocate memory") || Contains(ending.error, "bad_alloc")) {
@@ -172,11 +173,11 @@ public:
   }
 
 private:
-  /// The photos that have not failed.
+  /// The photos that have not failed and met no obstacle.
   Numbers Remaining() const {
     Numbers numbers;
     for (std::size_t number = 0; number < batch_.photos.size(); ++number) {
-      if (batch_.photos[number].failure.empty()) {
+      if (batch_.photos[number].failure.empty() && batch_.photos[number].obstacle.empty()) {
         numbers.push_back(number);
       }
     }
@@ -187,13 +188,20 @@ private:
     batch_.photos[number].failure = reason;
   }
 
-  /// The same for what a program has said. Not the photo's fault if no program works.
+  /// The same for what a program has said. If no program works, something else has killed it, or
+  /// the space for its output is used up, that is not due to the photo.
   void Fail(std::size_t number, const Ending& ending, const Limits& limits) {
     if (!isSandboxTested_) {
       TestSandbox();
       isSandboxTested_ = true;
     }
-    Fail(number, Reason(ending, limits));
+    if (ending.WasKilled()) {
+      batch_.photos[number].obstacle = KILLED;
+    } else if (Contains(ending.error, "No space left on device")) {
+      batch_.photos[number].obstacle = "no space in memory to render it";
+    } else {
+      Fail(number, Reason(ending, limits));
+    }
   }
 
   static void TestSandbox() {
@@ -222,10 +230,13 @@ private:
     }
     Extract(raws);
     for (const std::size_t number : raws) {
+      bool wasKilled = false;
       if (!HasOutput(number)) {
-        Extract({number}); // it may be missing because of another photo
+        wasKilled = Extract({number}).WasKilled(); // it may be missing because of another photo
       }
-      if (HasOutput(number)) {
+      if (wasKilled) {
+        batch_.photos[number].obstacle = KILLED;
+      } else if (HasOutput(number)) {
         batch_.folder.UseOutputAsInput(number);
       } else {
         Fail(number, "no preview in this raw photo");
@@ -233,10 +244,10 @@ private:
     }
   }
 
-  void Extract(const Numbers& photos) const {
+  Ending Extract(const Numbers& photos) const {
     Limits limits = LimitsFor(photos.size());
     limits.fileSize = LARGEST_PREVIEW;
-    Run({"/usr/bin/sh", "-c", PREVIEW_SCRIPT, "sh"}, photos, "", limits);
+    return Run({"/usr/bin/sh", "-c", PREVIEW_SCRIPT, "sh"}, photos, "", limits);
   }
 
   bool HasOutput(std::size_t number) const {

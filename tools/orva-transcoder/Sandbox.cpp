@@ -236,9 +236,7 @@ Ending RunInSandbox(const std::vector<std::string>& command, const SandboxFolder
     ReadToEnd(output, error, ending, Clock::now() + std::chrono::seconds(10));
   }
   ending.status = process.Wait();
-  if (ending.status == 128 + SIGXCPU || ending.status == 128 + SIGKILL) {
-    ending.wasTooSlow = true; // also SIGKILL: the hard limit of processor time
-  }
+  ending.wasTooSlow = ending.wasTooSlow || ending.status == 128 + SIGXCPU;
   if (ending.status == CANNOT_START) {
     throw util::Exception("cannot start /usr/bin/bwrap, or as user " +
                           std::to_string(SANDBOX_USER));

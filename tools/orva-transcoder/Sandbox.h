@@ -3,6 +3,7 @@
 #include <sys/types.h>
 
 #include <chrono>
+#include <csignal>
 #include <cstddef>
 #include <string>
 #include <vector>
@@ -29,6 +30,9 @@ struct Ending {
   std::string error;  ///< the same of standard error
 
   bool IsSuccess() const noexcept { return status == 0; }
+  /// Something else than our limits has ended it: for example, the memory of the machine is used
+  /// up.
+  bool WasKilled() const noexcept { return status == 128 + SIGKILL && !wasTooSlow; }
 };
 
 /// Folders that a program in a sandbox sees.

@@ -6,6 +6,7 @@
 
 #include <fcntl.h>
 #include <sys/stat.h>
+#include <sys/statvfs.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -23,13 +24,20 @@ namespace {
   throw util::Exception(path + ": " + std::generic_category().message(errno));
 }
 
-/// Makes a folder that this process can write, and the sandbox can read.
-void MakeFolder(const std::string& path) {
-  if (mkdir(path.c_str(), 0700) != 0 || chmod(path.c_str(), 0750) != 0) {
+/// Lets only this process write the folder, and only the sandbox read it.
+void RestrictFolder(const std::string& path) {
+  if (chmod(path.c_str(), 0750) != 0) {
     ThrowError(path);
   }
   // Fails where that user does not exist: the sandbox then runs as this process's user.
   static_cast<void>(chown(path.c_str(), static_cast<uid_t>(-1), SANDBOX_USER) == 0);
+}
+
+void MakeFolder(const std::string& path) {
+  if (mkdir(path.c_str(), 0700) != 0) {
+    ThrowError(path);
+  }
+  RestrictFolder(path);
 }
 
 util::FileDescriptor MakeFile(const std::string& path, uid_t owner, gid_t group, mode_t mode) {
@@ -127,8 +135,24 @@ void StagingFolder::UseOutputAsInput(std::size_t number) const {
 }
 
 void PrepareStaging(const std::string& path) {
-  RemoveAll(path);
-  MakeFolder(path);
+  RemoveAll(path); // of a mount point, only what is in it
+  if (mkdir(path.c_str(), 0700) != 0 && errno != EEXIST) {
+    ThrowError(path);
+  }
+  RestrictFolder(path);
+}
+
+StagingSpace SpaceFor(const std::string& path) {
+  struct statvfs fileSystem {};
+  if (statvfs(path.c_str(), &fileSystem) != 0) {
+    ThrowError(path);
+  }
+  const auto bytes = [&](fsblkcnt_t blocks) {
+    return static_cast<long long>(blocks) * static_cast<long long>(fileSystem.f_frsize);
+  };
+  const long long reserve = bytes(fileSystem.f_blocks) / 4;
+  return {.now = std::max(bytes(fileSystem.f_bavail) - reserve, 0LL),
+          .most = bytes(fileSystem.f_blocks) - reserve};
 }
 
 } // namespace orva::transcoder

@@ -47,8 +47,18 @@ private:
   std::string path_;
 };
 
-/// Makes `path` an empty folder that other users cannot look into, except the sandbox. What an
-/// earlier run left there is removed. Throws util::Exception.
+/// Makes `path` an empty folder that other users cannot look into, except the sandbox. It may be a
+/// mount point. What an earlier run left there is removed. Throws util::Exception.
 void PrepareStaging(const std::string& path);
+
+/// Bytes in the file system of a staging folder. A quarter of it stays free of copies: for what the
+/// sandbox writes, and for other programs if the file system is shared.
+struct StagingSpace {
+  long long now = 0;  ///< that copies may take at this moment
+  long long most = 0; ///< that copies may ever take
+};
+
+/// Throws util::Exception.
+StagingSpace SpaceFor(const std::string& path);
 
 } // namespace orva::transcoder

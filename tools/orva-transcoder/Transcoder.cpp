@@ -263,10 +263,13 @@ BatchLimits Transcoder::LimitsOfNext(const Volume& volume) const {
   }
   const std::size_t waiting = volume.Waiting() - std::min(staged, volume.Waiting());
   const auto batches = static_cast<long long>(processors_) + 1;
-  const long long space = FreeSpace();
+  const StagingSpace fileSystem = SpaceFor(staging_);
+  const long long space = std::min(FreeSpace(), fileSystem.now);
   return {.photos = std::clamp(waiting / processors_, FEWEST_PHOTOS, MOST_PHOTOS),
           .bytes = std::min({space, MOST_BYTES, MOST_STAGED / batches}),
-          .space = space};
+          .space = space,
+          .most = fileSystem.most,
+          .isOnly = running_.empty()};
 }
 
 /// When there is nothing to stage.

@@ -16,6 +16,7 @@
 #include "orvautil/Core.h"
 #include "orvautil/Exception.h"
 #include "orvautil/FileDescriptor.h"
+#include "orvautil/FormatString.h"
 #include "service/Log.h"
 
 #include <fcntl.h>
@@ -48,6 +49,13 @@ constexpr std::size_t MOST_EXAMINED = 1000;   // photos in one piece of work
 constexpr std::size_t MOST_REMOVALS = 10'000; // in one piece of work
 constexpr std::chrono::seconds RETRY(60);
 constexpr std::chrono::milliseconds PIECE(200);
+// A photo is postponed for 15, 30, ... 480 s: 16 minutes. If the reason was a shortage of memory,
+// it has usually passed by then.
+constexpr int MOST_POSTPONEMENTS = 6;
+constexpr std::chrono::seconds FIRST_POSTPONEMENT(15);
+constexpr std::chrono::hours REMEMBERED(1); // after the end of a postponement
+
+constexpr char NO_SPACE[] = "no space in memory to copy the file";
 
 constexpr std::array<std::string_view, 7> RAW_EXTENSIONS = {"arw", "cr2", "dng", "nef",
                                                             "orf", "raf", "rw2"};
@@ -198,6 +206,7 @@ bool Volume::IsThere() const {
 void Volume::Look() {
   isExhausted_ = true;
   lookAgainAt_.reset();
+  EndPostponements();
   Attempt([this] {
     const auto volume = Open();
     if (!volume) {
@@ -266,7 +275,8 @@ std::unique_ptr<Batch> Volume::Stage(const std::string& path, const BatchLimits&
       const auto photos = last_ ? catalog::NewestWaiting(*volume->catalog, MOST_LISTED, *last_)
                                 : catalog::NewestWaiting(*volume->catalog, MOST_LISTED);
       for (const WaitingPhoto& photo : photos) {
-        isFull = !isInBatch(photo.id) && !StagePhoto(*volume, photo, next, room);
+        isFull =
+            !isInBatch(photo.id) && !IsPostponed(photo) && !StagePhoto(*volume, photo, next, room);
         if (isFull) {
           break;
         }
@@ -285,6 +295,68 @@ std::unique_ptr<Batch> Volume::Stage(const std::string& path, const BatchLimits&
   return batch;
 }
 
+/// Postpones the photo, or adds it to the batch as failed if that was done often enough.
+void Volume::LeaveOut(BatchPhoto photo, Batch& batch) {
+  if (!Postpone(photo.photo, photo.failure)) {
+    batch.photos.push_back(std::move(photo));
+  }
+}
+
+std::optional<Volume::Clock::time_point> Volume::LookAgainAt() const {
+  return lookAgainAt_ ? lookAgainAt_ : endPostponementsAt_;
+}
+
+bool Volume::Postpone(const WaitingPhoto& photo, const std::string& reason) {
+  if (postponed_.empty()) {
+    LogInfo(Printable(mountPoint_ + photo.path) + " is tried again later: " + reason);
+  }
+  Postponed& entry = postponed_[photo.id];
+  if (entry.lastModifiedDate != photo.lastModifiedDate || entry.size != photo.size) {
+    entry = {.lastModifiedDate = photo.lastModifiedDate, .size = photo.size};
+  }
+  if (entry.times == MOST_POSTPONEMENTS) {
+    postponed_.erase(photo.id);
+    return false;
+  }
+  entry.until = Clock::now() + FIRST_POSTPONEMENT * (1 << entry.times);
+  ++entry.times;
+  endPostponementsAt_ = std::min(endPostponementsAt_.value_or(entry.until), entry.until);
+  return true;
+}
+
+bool Volume::IsPostponed(const WaitingPhoto& photo) const {
+  const auto entry = postponed_.find(photo.id);
+  return entry != postponed_.end() && Clock::now() < entry->second.until &&
+         entry->second.lastModifiedDate == photo.lastModifiedDate &&
+         entry->second.size == photo.size;
+}
+
+/// Those that end later have to be ended then.
+void Volume::EndPostponements() {
+  const auto now = Clock::now();
+  endPostponementsAt_.reset();
+  std::erase_if(postponed_, [&](const auto& item) { return item.second.until + REMEMBERED < now; });
+  for (const auto& [id, entry] : postponed_) {
+    if (entry.until > now) {
+      endPostponementsAt_ = std::min(endPostponementsAt_.value_or(entry.until), entry.until);
+    }
+  }
+}
+
+void Volume::PostponeOrFail(Batch& batch) {
+  for (std::size_t number = 0; number < batch.photos.size(); ++number) {
+    BatchPhoto& photo = batch.photos[number];
+    const std::string obstacle = std::exchange(photo.obstacle, {});
+    if (obstacle.empty() || photo.isOutdated) {
+      continue;
+    }
+    batch.folder.Remove(number);
+    if (!Postpone(photo.photo, obstacle)) {
+      photo.failure = obstacle;
+    }
+  }
+}
+
 bool Volume::StagePhoto(const Opened& volume, const WaitingPhoto& photo, Batch& batch, Room& room) {
   const std::size_t number = batch.photos.size();
   if (number >= room.limits.photos) {
@@ -293,10 +365,16 @@ bool Volume::StagePhoto(const Opened& volume, const WaitingPhoto& photo, Batch& 
   // To open a device may have an effect: look before.
   struct stat status {};
   const util::FileDescriptor entry = volume.root.Open(photo.path, O_PATH);
-  if (!entry || fstat(entry.Get(), &status) != 0 || !S_ISREG(status.st_mode)) {
+  if (!entry || fstat(entry.Get(), &status) != 0 || !IsPhoto(status, photo)) {
     return true; // the indexer will notice what has changed
   }
   const util::FileDescriptor file = volume.root.Open(photo.path, O_RDONLY);
+  const int problem = file ? 0 : errno;
+  if (problem == EACCES || problem == EPERM || problem == EIO) {
+    batch.photos.push_back(
+        {.photo = photo, .status = status, .failure = "cannot be opened: " + ErrorText(problem)});
+    return true;
+  }
   if (!file || fstat(file.Get(), &status) != 0 || !IsPhoto(status, photo)) {
     return true;
   }
@@ -305,9 +383,21 @@ bool Volume::StagePhoto(const Opened& volume, const WaitingPhoto& photo, Batch& 
         {.photo = photo, .status = status, .failure = "the file is larger than 512 MiB"});
     return true;
   }
+  if (status.st_size > room.limits.most) {
+    batch.photos.push_back({.photo = photo,
+                            .status = status,
+                            .failure = util::FormatString("the file is larger than the %lld MiB "
+                                                          "that copies of photos may take",
+                                                          room.limits.most >> 20)});
+    return true;
+  }
   const long long limit = room.used == 0 ? room.limits.space : room.limits.bytes;
   if (room.used + status.st_size > limit) {
-    return false;
+    if (!room.limits.isOnly || !batch.photos.empty()) {
+      return false; // until the other batches have ended
+    }
+    LeaveOut({.photo = photo, .status = status, .failure = NO_SPACE}, batch);
+    return true;
   }
   int error = CopyExactly(file, batch.folder.Add(number), status.st_size);
   struct stat after {};
@@ -322,13 +412,12 @@ bool Volume::StagePhoto(const Opened& volume, const WaitingPhoto& photo, Batch& 
     room.used += status.st_size;
     batch.photos.push_back({.photo = photo, .status = status, .isRaw = IsRaw(photo.path, file)});
     return true;
-  case ENOSPC: {
-    const bool isAlone = room.used == 0;
-    if (isAlone) {
-      LogError("no space in memory to copy " + Printable(mountPoint_ + photo.path));
+  case ENOSPC:
+    if (!room.limits.isOnly || !batch.photos.empty()) {
+      return false;
     }
-    return isAlone;
-  }
+    LeaveOut({.photo = photo, .status = status, .failure = NO_SPACE}, batch);
+    return true;
   case EIO:
     batch.photos.push_back(
         {.photo = photo, .status = status, .failure = "cannot be read: " + ErrorText(error)});
@@ -345,6 +434,7 @@ Volume::Stored Volume::Store(Batch& batch) {
     const auto volume = Open();
     if (volume && volume->identity == batch.identity) {
       const std::set<long long> written = WriteRenditions(*volume, batch);
+      PostponeOrFail(batch);
       MarkResults(*volume, batch, written);
       problem_.clear();
     }
@@ -362,7 +452,7 @@ std::set<long long> Volume::WriteRenditions(const Opened& volume, Batch& batch) 
     struct stat status {};
     photo.isOutdated =
         !file || fstat(file.Get(), &status) != 0 || !IsSameContent(status, photo.status);
-    if (photo.isOutdated || !photo.failure.empty()) {
+    if (photo.isOutdated || !photo.obstacle.empty() || !photo.failure.empty()) {
       continue;
     }
     const util::FileDescriptor rendition = batch.folder.OpenOutput(number);

@@ -7,7 +7,9 @@
 
 #include <chrono>
 #include <cstddef>
+#include <ctime>
 #include <functional>
+#include <map>
 #include <memory>
 #include <optional>
 #include <set>
@@ -24,6 +26,8 @@ struct BatchLimits {
   std::size_t photos = 0;
   long long bytes = 0; ///< for the copies of several photos
   long long space = 0; ///< bytes for the copy of a single photo
+  long long most = 0;  ///< the same when nothing else is there
+  bool isOnly = true;  ///< there is no other batch
 };
 
 /// A volume whose photos are rendered. Each operation is one piece of work: it opens the volume and
@@ -70,7 +74,7 @@ public:
   void CheckRenditions(const IsInBatch& isInBatch);
 
   /// When the volume has to be looked at again although nothing was announced.
-  std::optional<Clock::time_point> LookAgainAt() const noexcept { return lookAgainAt_; }
+  std::optional<Clock::time_point> LookAgainAt() const;
 
   /// Photos that were finished or have failed since the last call.
   std::size_t TakeChanges();
@@ -81,6 +85,13 @@ private:
     catalog::VolumeRoot root;
     std::unique_ptr<db::VolumeDB> catalog;
     std::string identity{};
+  };
+  /// A photo that could not be rendered, for a reason that may pass.
+  struct Postponed {
+    std::time_t lastModifiedDate = 0;
+    long long size = 0;
+    int times = 0;
+    Clock::time_point until{};
   };
   /// What is left for a batch.
   struct Room {
@@ -95,6 +106,12 @@ private:
   void Report(const std::string& problem, bool isBusy);
   void Count(const db::VolumeDB& catalog);
   void RemoveVanished(const Opened& volume);
+  /// Leaves the photo out for some time. Returns false if that was done often enough.
+  bool Postpone(const catalog::WaitingPhoto& photo, const std::string& reason);
+  bool IsPostponed(const catalog::WaitingPhoto& photo) const;
+  void EndPostponements();
+  void PostponeOrFail(Batch& batch);
+  void LeaveOut(BatchPhoto photo, Batch& batch);
   /// Adds the photo to the batch, or leaves it out until the next message. Returns false if the
   /// batch has no room for it.
   bool StagePhoto(const Opened& volume, const catalog::WaitingPhoto& photo, Batch& batch,
@@ -115,8 +132,10 @@ private:
   std::size_t changes_ = 0;
   bool isExhausted_ = true;                   ///< all that wait were staged or left out
   std::optional<catalog::WaitingPhoto> last_; ///< that was staged or left out
-  long long nextToCheck_ = 0;                 ///< id
-  bool isChecked_ = true;                     ///< all renditions are
+  std::map<long long, Postponed> postponed_;  ///< by id
+  std::optional<Clock::time_point> endPostponementsAt_;
+  long long nextToCheck_ = 0; ///< id
+  bool isChecked_ = true;     ///< all renditions are
   bool hasReportedObstacle_ = false;
   std::string problem_; ///< as it was last logged, until renditions are written again
   bool isBusy_ = false; ///< another program used the catalog when work last failed
