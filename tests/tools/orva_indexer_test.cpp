@@ -173,6 +173,26 @@ TEST_F(IndexerTest, EverythingIsAnnouncedAgainWhenTheServiceComesBack) {
   EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
 }
 
+TEST_F(IndexerTest, AVolumeThatIsNotPluggedWhenTheServiceComesBackIsGone) {
+  const Volume volume("A", "64m");
+  fs::create_directory("/shares/Plain");
+  StartService();
+  StartIndexer();
+  PlugDirectory("/shares/Plain");
+  ASSERT_TRUE(Await([&] { return State("/shares/Plain") == "watching"; }));
+  ASSERT_TRUE(Await([&] { return State(volume.Path()) == "watching"; }));
+  Service().Signal(SIGTERM);
+  ASSERT_EQ(Service().WaitForEnd(), 0);
+  StartService();
+  EXPECT_TRUE(AwaitLog("/shares/Plain/: gone"));
+  EXPECT_TRUE(Await([&] { return State("/shares/Plain") == "absent"; }));
+  EXPECT_EQ(State(volume.Path()), "watching");
+  std::ifstream file("/tmp/orva-notify.out");
+  const std::string output(std::istreambuf_iterator<char>(file), {});
+  EXPECT_THAT(output, Not(HasSubstr("Name=\"Scanned\" MountPoint=\"/shares/Plain\"")));
+  fs::remove_all("/shares/Plain");
+}
+
 TEST_F(IndexerTest, StartsBeforeTheService) {
   const Volume volume("A", "64m");
   Write(volume.Path() + "/a.jpg");
@@ -550,10 +570,11 @@ TEST_F(IndexerTest, ACatalogThatNobodyMergesIsKnownAgainWhenTheClockWasSetBack) 
   StartService();
   StartIndexer();
   ASSERT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
-  ASSERT_TRUE(Await([&] { return Count(Events(volume.Path()), "End") == 1; }));
-  // The first one has been remembered before the next one is announced.
+  ASSERT_TRUE(Await([&] { return Count(Events(volume.Path()), "End") > 0; }));
+  // What was announced is remembered before the next announcement.
+  const long ends = Count(Events(volume.Path()), "End");
   Write(volume.Path() + "/b.jpg");
-  ASSERT_TRUE(Await([&] { return Count(Events(volume.Path()), "End") == 2; }));
+  ASSERT_TRUE(Await([&] { return Count(Events(volume.Path()), "End") > ends; }));
   StopIndexer();
   const Lines identity = Query(volume.Path(), "SELECT identity FROM Identity");
   Write(volume.Path() + "/c.jpg");

@@ -37,6 +37,9 @@ constexpr auto INPUT_INTERVAL = 100ms;
 constexpr auto ANNOUNCE_RETRY = 30s;
 constexpr auto MASTER_QUIET = 2s;
 
+/// The notification service sends the plugged volumes as soon as a client has connected.
+constexpr auto REPLAY_TIME = 5s;
+
 /// A master at /shares itself is no volume.
 constexpr char SHARES[] = "/shares";
 constexpr char NO_VOLUME[] = "-";
@@ -45,7 +48,7 @@ constexpr char MOUNT_INFO[] = "/proc/self/mountinfo";
 
 /// Whether the mount point is /shares, or above it.
 bool ContainsVolumes(const std::string& mountPoint) {
-  const std::string path = std::filesystem::path(mountPoint + '/').lexically_normal();
+  const std::string path = std::filesystem::path(mountPoint).lexically_normal();
   return (std::string(SHARES) + '/').starts_with(path);
 }
 
@@ -99,7 +102,7 @@ void Service::Wait() {
   add(observer_.Descriptor(), POLLIN);
   add(announcer_.Descriptor(), announcer_.Events());
   add(locator_.Descriptor(), POLLIN);
-  auto next = std::min({announceAgain_, checkPurges_, statusDue_});
+  auto next = std::min({announceAgain_, checkPurges_, replayEnd_, statusDue_});
   for (const auto& [mountPoint, known] : volumes_) {
     next = std::min(next, known->volume.NextWork());
     add(known->volume.Descriptor(now), POLLIN);
@@ -165,6 +168,9 @@ void Service::HandleNotifications() {
   if (Clock::now() >= checkPurges_) {
     CheckPurges();
   }
+  if (Clock::now() >= replayEnd_) {
+    ForgetOthers();
+  }
   if (Clock::now() >= announceAgain_) {
     AnnounceAgain();
   }
@@ -173,7 +179,7 @@ void Service::HandleNotifications() {
 void Service::Handle(const notifications::Notification& notification) {
   switch (notification.event) {
   case Notice::Connected:
-    AnnounceAgain();
+    AwaitReplay();
     break;
   case Notice::Plugged:
     Plug(notification.mountPoint, notification.isDirectory);
@@ -200,6 +206,7 @@ void Service::Plug(const std::string& mountPoint, bool isDirectory) {
   const auto found = volumes_.find(mountPoint);
   if (found != volumes_.end()) {
     if (found->second->volume.Kind() == kind && found->second->volume.IsInPlace()) {
+      Confirm(*found->second);
       return;
     }
     Forget(mountPoint);
@@ -211,6 +218,38 @@ void Service::Plug(const std::string& mountPoint, bool isDirectory) {
   LogInfo("Volume " + Printable(mountPoint) + ": walking");
   const auto known = volumes_.emplace(mountPoint, std::make_unique<Known>(mountPoint, kind)).first;
   known->second->volume.HandleMounts(ReadMountPoints());
+}
+
+/// The notification service was started again, or was not there. It sends the volumes that are
+/// plugged next.
+void Service::AwaitReplay() {
+  for (const auto& [mountPoint, known] : volumes_) {
+    known->isPlugged = false;
+    known->isScanned = false;
+    known->echoes = 0;
+    known->purgedFor.clear();
+  }
+  replayEnd_ = volumes_.empty() ? Clock::time_point::max() : Clock::now() + REPLAY_TIME;
+}
+
+/// The volume is plugged for the service that we are connected to.
+void Service::Confirm(Known& known) {
+  if (!std::exchange(known.isPlugged, true) && known.volume.IsWalked()) {
+    AnnounceScanned(known);
+  }
+}
+
+void Service::ForgetOthers() {
+  replayEnd_ = Clock::time_point::max();
+  std::vector<std::string> others;
+  for (const auto& [mountPoint, known] : volumes_) {
+    if (!known->isPlugged) {
+      others.push_back(mountPoint);
+    }
+  }
+  for (const std::string& mountPoint : others) {
+    Forget(mountPoint);
+  }
 }
 
 void Service::Forget(const std::string& mountPoint) {
@@ -259,7 +298,7 @@ std::time_t Service::LatestStamp(const Known& known) const {
 
 void Service::AnnounceResult(Known& known, const Volume::Result& result) {
   known.hasChanged = known.hasChanged || result.hasChanged;
-  if (!known.volume.IsWalked()) {
+  if (!known.volume.IsWalked() || !known.isPlugged) {
     return; // Scanned comes first
   }
   if (result.isFirstWalk) {
@@ -286,13 +325,13 @@ void Service::AnnounceChanges(Known& known) {
   }
 }
 
-/// The notification service was started again, or was not there.
+/// An announcement has failed.
 void Service::AnnounceAgain() {
   announceAgain_ = Clock::time_point::max();
   for (const auto& [mountPoint, known] : volumes_) {
     known->echoes = 0;
     known->purgedFor.clear();
-    if (known->volume.IsWalked()) {
+    if (known->isPlugged && known->volume.IsWalked()) {
       AnnounceScanned(*known);
     }
   }
