@@ -158,7 +158,7 @@ std::optional<Volume::Opened> Volume::Open() {
   if (!file || fstat(file.Get(), &status) != 0 || !S_ISREG(status.st_mode) || status.st_size == 0) {
     return std::nullopt;
   }
-  auto database = std::make_unique<db::VolumeDB>(root.Path(), true);
+  auto database = catalog::ConnectToCatalog(root);
   if (!root.IsInPlace() || !catalog::HasOwnSchema(*database) || !HasIdentity(*database)) {
     return std::nullopt;
   }
