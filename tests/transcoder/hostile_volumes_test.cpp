@@ -14,6 +14,7 @@
 
 #include <algorithm>
 #include <csignal>
+#include <sstream>
 
 namespace {
 
@@ -198,6 +199,27 @@ TEST_F(HostileVolumes, CatalogsOfOthersAreLeftAlone) {
   Announce("scanned");
   ASSERT_TRUE(AwaitSent("\"End\""));
   EXPECT_FALSE(fs::exists(At(".orva")));
+}
+
+TEST_F(HostileVolumes, LongTextsInACatalogTakeNoMemory) {
+  AddAllWaiting({});
+  Query("WITH N(n) AS (SELECT 1 UNION ALL SELECT n + 1 FROM N WHERE n < 12) "
+        "INSERT INTO Files(folderId, path, name, category, lastModifiedDate, isBackup, isHidden, "
+        "isSystem, isDeleted, status, lastUpdatedDate, ext, size) "
+        "SELECT -1, n || hex(zeroblob(7000000)), '', 3, 1, 0, 0, 0, 0, 1, 1, '', 1 FROM N");
+  ASSERT_EQ(Waiting(), 12);
+  Announce("scanned");
+  EXPECT_TRUE(Await([this] {
+    return testing::Matches(Contains(HasSubstr("string or blob too big")))(Logged());
+  })) << testing::PrintToString(Logged());
+  std::istringstream status(ReadBytes("/proc/" + std::to_string(Transcoder().Pid()) + "/status"));
+  std::string word;
+  while (status >> word && word != "VmHWM:") {
+  }
+  long long kibibytes = 0;
+  status >> kibibytes;
+  EXPECT_GT(kibibytes, 0);
+  EXPECT_LT(kibibytes, 100 << 10);
 }
 
 TEST_F(HostileVolumes, AnErrorOfTheDatabaseNamesItsVolume) {

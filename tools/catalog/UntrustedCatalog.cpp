@@ -26,6 +26,9 @@
 namespace orva::catalog {
 namespace {
 
+/// Bytes of the longest text or row. The longest of ours has a path twice, and a reason.
+constexpr int LONGEST_VALUE = 16 << 10;
+
 constexpr std::array<const char*, 4> SUFFIXES = {"", "-wal", "-shm", "-journal"};
 
 /// How many catalogs are kept that were set aside.
@@ -44,6 +47,13 @@ CatalogError Failure(int error, const std::string& what) {
                                                                       : CatalogProblem::Other;
   return {problem, what + ": " + std::generic_category().message(error)};
 }
+
+class LimitedCatalog : public db::VolumeDB {
+public:
+  explicit LimitedCatalog(const std::string& volume) : VolumeDB(volume, true) {
+    sqlite3_limit(Handle(), SQLITE_LIMIT_LENGTH, LONGEST_VALUE);
+  }
+};
 
 std::string HomeName() {
   return core::GetORVA_HOME("");
@@ -117,7 +127,7 @@ void RefuseImplausibleContent(const db::DB& catalog, std::time_t latest) {
 }
 
 std::unique_ptr<db::VolumeDB> Open(const VolumeRoot& volume, std::time_t latest) {
-  auto catalog = std::make_unique<db::VolumeDB>(volume.Path(), true);
+  auto catalog = ConnectToCatalog(volume);
   Require(HasOwnSchema(*catalog), "it has tables, indexes, triggers or views of others");
   Execute(*catalog, "PRAGMA cache_size = -16384");
   SelectNumber(*catalog, "PRAGMA journal_mode = WAL");
@@ -183,6 +193,10 @@ CatalogProblem ProblemOf(const std::string& failure) {
   default:
     return CatalogProblem::Foreign;
   }
+}
+
+std::unique_ptr<db::VolumeDB> ConnectToCatalog(const VolumeRoot& volume) {
+  return std::make_unique<LimitedCatalog>(volume.Path());
 }
 
 std::unique_ptr<db::VolumeDB> OpenUntrustedCatalog(const VolumeRoot& volume, std::time_t latest) {

@@ -40,6 +40,11 @@ private:
 /// What a failure of the database layer on a catalog means.
 CatalogProblem ProblemOf(const std::string& failure);
 
+/// Connects to the catalog of a volume that anybody may have prepared, for writing, and checks
+/// nothing. Values much longer than ours cannot be read: they would take much memory. Throws
+/// std::string.
+std::unique_ptr<db::VolumeDB> ConnectToCatalog(const VolumeRoot& volume);
+
 /// Opens the catalog of a volume that anybody may have prepared, for writing. Creates its folder,
 /// the catalog and its schema if they are missing. `latest` is the time of the latest stamp that a
 /// catalog may have, usually the present. Throws CatalogError.

@@ -226,10 +226,11 @@ std::vector<long long> CheckFolder(const catalog::VolumeRoot& root, long long fi
   return missing;
 }
 
-void ForEachFolder(const catalog::VolumeRoot& root, const std::function<void(long long)>& visit) {
+std::vector<long long> ListFolders(const catalog::VolumeRoot& root) {
+  std::vector<long long> folders;
   const FileDescriptor renditions = OpenFolder(root, catalog::RENDITIONS);
   if (!renditions) {
-    return;
+    return folders;
   }
   ForEachEntry(renditions, [&](const std::string& name) {
     if (unlinkat(renditions.Get(), name.c_str(), 0) == 0) {
@@ -238,9 +239,10 @@ void ForEachFolder(const catalog::VolumeRoot& root, const std::function<void(lon
     const auto number = NumberIn(name, [](long long n) { return std::to_string(n); });
     constexpr long long LARGEST = std::numeric_limits<long long>::max() / RENDITIONS_PER_FOLDER;
     if (number && *number >= 0 && *number < LARGEST) {
-      visit(*number * RENDITIONS_PER_FOLDER);
+      folders.push_back(*number * RENDITIONS_PER_FOLDER);
     }
   });
+  return folders;
 }
 
 void RemoveEmptyFolder(const catalog::VolumeRoot& root, long long first) {

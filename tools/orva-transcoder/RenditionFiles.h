@@ -61,8 +61,8 @@ std::vector<long long> CheckFolder(const catalog::VolumeRoot& root, long long fi
                                    const std::vector<long long>& expected,
                                    const std::function<bool(long long)>& isInUse);
 
-/// Calls `visit` with the first id of each folder of renditions, and removes what is no folder.
-void ForEachFolder(const catalog::VolumeRoot& root, const std::function<void(long long)>& visit);
+/// The first id of each folder of renditions. Removes what is no folder.
+std::vector<long long> ListFolders(const catalog::VolumeRoot& root);
 
 /// Removes the folder with the rendition of the file `first`, if it is empty.
 void RemoveEmptyFolder(const catalog::VolumeRoot& root, long long first);

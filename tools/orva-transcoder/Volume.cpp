@@ -158,7 +158,7 @@ std::optional<Volume::Opened> Volume::Open() {
   if (!file || fstat(file.Get(), &status) != 0 || !S_ISREG(status.st_mode) || status.st_size == 0) {
     return std::nullopt;
   }
-  auto database = std::make_unique<db::VolumeDB>(root.Path(), true);
+  auto database = catalog::ConnectToCatalog(root);
   if (!root.IsInPlace() || !catalog::HasOwnSchema(*database) || !HasIdentity(*database)) {
     return std::nullopt;
   }
@@ -218,6 +218,7 @@ void Volume::Look() {
       identity_ = volume->identity;
       isChecked_ = false;
       nextToCheck_ = 0;
+      otherFolders_.reset();
     }
     last_.reset();
     isExhausted_ = waiting_ == 0;
@@ -526,8 +527,7 @@ void Volume::CheckNextFolder(const Opened& volume, const IsInBatch& isInBatch) {
   const db::VolumeDB& catalog = *volume.catalog;
   const std::vector<long long> next = catalog::ListedPhotos(catalog, nextToCheck_, 1);
   if (next.empty() || next.front() > LAST) {
-    RemoveOtherFolders(volume, isInBatch);
-    isChecked_ = true;
+    CheckNextOtherFolder(volume, isInBatch);
     return;
   }
   const long long first = next.front() - next.front() % RENDITIONS_PER_FOLDER;
@@ -547,14 +547,21 @@ void Volume::CheckNextFolder(const Opened& volume, const IsInBatch& isInBatch) {
   }
 }
 
-void Volume::RemoveOtherFolders(const Opened& volume, const IsInBatch& isInBatch) {
-  ForEachFolder(volume.root, [&](long long first) {
+void Volume::CheckNextOtherFolder(const Opened& volume, const IsInBatch& isInBatch) {
+  if (!otherFolders_) {
+    otherFolders_ = ListFolders(volume.root);
+  } else if (otherFolders_->empty()) {
+    otherFolders_.reset();
+    isChecked_ = true;
+  } else {
+    const long long first = otherFolders_->back();
+    otherFolders_->pop_back();
     const auto listed = catalog::ListedPhotos(*volume.catalog, first, 1);
     if (listed.empty() || listed.front() >= first + RENDITIONS_PER_FOLDER) {
       CheckFolder(volume.root, first, {}, isInBatch);
       RemoveEmptyFolder(volume.root, first);
     }
-  });
+  }
 }
 
 void Volume::ReportObstacle(const std::string& text) {

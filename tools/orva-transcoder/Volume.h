@@ -14,6 +14,7 @@
 #include <optional>
 #include <set>
 #include <string>
+#include <vector>
 
 namespace orva::db {
 class VolumeDB;
@@ -121,7 +122,7 @@ private:
   void MarkResults(const Opened& volume, const Batch& batch, const std::set<long long>& written);
   void ReportObstacle(const std::string& text);
   void CheckNextFolder(const Opened& volume, const IsInBatch& isInBatch);
-  void RemoveOtherFolders(const Opened& volume, const IsInBatch& isInBatch);
+  void CheckNextOtherFolder(const Opened& volume, const IsInBatch& isInBatch);
 
   const std::string mountPoint_; ///< ends in "/"
   const catalog::VolumeRoot::Kind kind_;
@@ -135,7 +136,9 @@ private:
   std::map<long long, Postponed> postponed_;  ///< by id
   std::optional<Clock::time_point> endPostponementsAt_;
   long long nextToCheck_ = 0; ///< id
-  bool isChecked_ = true;     ///< all renditions are
+  /// First ids of the folders that are examined after those that the catalog needs.
+  std::optional<std::vector<long long>> otherFolders_;
+  bool isChecked_ = true; ///< all renditions are
   bool hasReportedObstacle_ = false;
   std::string problem_; ///< as it was last logged, until renditions are written again
   bool isBusy_ = false; ///< another program used the catalog when work last failed
