@@ -9,6 +9,9 @@
 
 #include "CatalogSchema.h"
 #include "Renditions.h"
+#include "UntrustedCatalog.h"
+#include "VolumeRoot.h"
+#include "orva-indexer/Volume.h"
 #include "orvadb/Transaction.h"
 #include "orvadb/VolumeDB.h"
 #include "orvautil/FileDescriptor.h"
@@ -25,6 +28,7 @@
 #include <csignal>
 #include <ctime>
 #include <fstream>
+#include <functional>
 #include <iterator>
 #include <random>
 #include <string>
@@ -420,6 +424,38 @@ TEST_F(IndexerTest, AKilledIndexerConvergesAfterItsStart) {
   EXPECT_THAT(ErrorLines(), IsEmpty());
 }
 
+// --- Busy catalogs -----------------------------------------------------------------------------
+
+TEST_F(IndexerTest, FoldersAreWalkedAgainIfTheirCommitFailsOnABusyCatalog) {
+  const Volume volume("A", "64m");
+  Write(volume.Path() + "/Pictures/a.jpg");
+  indexer::Volume indexed(volume.Path() + "/", catalog::VolumeRoot::Kind::Mount);
+  const auto work = [&indexed](const std::function<void()>& pulse) {
+    return indexed.Work(
+        pulse, [](const std::string&, std::time_t) {}, std::time(nullptr));
+  };
+  EXPECT_FALSE(work([] { throw std::string("database is locked (extended code 5)"); }).hasChanged);
+  ASSERT_LT(indexed.NextWork(), indexer::Clock::time_point::max());
+  EXPECT_TRUE(Await([&] {
+    if (indexed.NextWork() <= indexer::Clock::now()) {
+      work([] {});
+    }
+    return indexed.IsWalked() &&
+           Query(volume.Path(), "SELECT path FROM Files") == Lines{"Pictures/a.jpg"};
+  }));
+  EXPECT_THAT(ErrorLines(), IsEmpty());
+}
+
+TEST(CatalogProblem, ALockThatIsNotGrantedInTimeIsNoDamage) {
+  const auto problemOf = [](int code) {
+    return catalog::ProblemOf("failed (extended code " + std::to_string(code) + ") in \"SELECT\"");
+  };
+  EXPECT_EQ(problemOf(5), catalog::CatalogProblem::Busy);   // SQLITE_BUSY
+  EXPECT_EQ(problemOf(261), catalog::CatalogProblem::Busy); // SQLITE_BUSY_RECOVERY
+  EXPECT_EQ(problemOf(15), catalog::CatalogProblem::Busy);  // SQLITE_PROTOCOL
+  EXPECT_EQ(problemOf(11), catalog::CatalogProblem::Foreign);
+}
+
 // --- The clock ---------------------------------------------------------------------------------
 
 TEST_F(IndexerTest, FilesAndFoldersFromTheFutureAndThePastAreEnteredOnce) {
@@ -682,6 +718,19 @@ protected:
     return merged == expected ? Lines() : merged;
   }
 
+  /// Waits until the indexer remembers that all of the volume's catalog was announced.
+  bool AwaitAllRemembered(const std::string& volume) {
+    return Await([&volume] {
+      try {
+        Database state(std::string(STATE_DIRECTORY) + "/catalogs.db");
+        return state.Run("SELECT newestStamp FROM Catalogs WHERE master <> '-' AND mountPoint = '" +
+                         volume + "/'") == Query(volume, "SELECT newestStamp FROM Identity");
+      } catch (const SQLite::Exception&) {
+        return false;
+      }
+    });
+  }
+
   /// Waits until the indexer remembers the catalogs of the volume and of the master.
   bool AwaitRemembered() {
     return Await([] {
@@ -742,6 +791,34 @@ TEST_F(IndexerAndDaemonTest, ACatalogFromABackupIsMergedFromTheBeginning) {
   Start();
   // Nothing in the catalog says that the merged database has b.jpg.
   EXPECT_THAT(AwaitMerged(volume.Path(), {"c.jpg"}), IsEmpty());
+}
+
+TEST_F(IndexerAndDaemonTest, ACatalogFromABackupThatWasUpdatedSinceIsMergedFromTheBeginning) {
+  const Volume volume("Disk", "64m");
+  Write(volume.Path() + "/a.jpg");
+  Start();
+  ASSERT_THAT(AwaitMerged(volume.Path(), {"a.jpg"}), IsEmpty());
+  ASSERT_TRUE(AwaitAllRemembered(volume.Path()));
+  Stop();
+  fs::copy_file(CatalogOf(volume.Path()), "/tmp/backup.db");
+  Start();
+  Write(volume.Path() + "/b.jpg");
+  ASSERT_THAT(AwaitMerged(volume.Path(), {"a.jpg", "b.jpg"}), IsEmpty());
+  ASSERT_TRUE(AwaitAllRemembered(volume.Path()));
+  Stop();
+  fs::remove(volume.Path() + "/b.jpg");
+  fs::copy_file("/tmp/backup.db", CatalogOf(volume.Path()), fs::copy_options::overwrite_existing);
+  Write(volume.Path() + "/c.jpg");
+  // The catalog gets new stamps before anything can be announced as purged.
+  StartService();
+  StartIndexer();
+  ASSERT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  Indexer().Signal(SIGKILL);
+  Indexer().WaitForEnd();
+  Service().Signal(SIGTERM);
+  Service().WaitForEnd();
+  Start();
+  EXPECT_THAT(AwaitMerged(volume.Path(), {"a.jpg", "c.jpg"}), IsEmpty());
 }
 
 TEST_F(IndexerAndDaemonTest, ACatalogIsKnownAgainWhenTheClockStartsYearsLate) {

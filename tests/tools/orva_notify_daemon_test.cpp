@@ -196,6 +196,16 @@ TEST_F(OrvaNotifyDaemon, ANewMasterHasAllRowsOfTheRemainingVolumes) {
   EXPECT_EQ(FilesOf(b).size(), 0U);
 }
 
+TEST_F(OrvaNotifyDaemon, ADiskBecomesTheMasterAlthoughThereIsAPlainDirectory) {
+  fs::create_directories("/shares/Photos");
+  const Volume disk("Zoo", "150g");
+  Serve({"--watch", "--volume", "/shares/Photos"});
+  StartDaemon();
+  Handle(Scanned("/shares/Photos"));
+  EXPECT_EQ(Appliance::Locator(), "zophotos_db_path=/shares/Zoo//.zophotos/zophotos.db\n");
+  fs::remove_all("/shares/Photos");
+}
+
 TEST_F(OrvaNotifyDaemon, ADaemonThatIsKilledHasNotHandledTheMessage) {
   Serve();
   const Volume volume("A", "150g");

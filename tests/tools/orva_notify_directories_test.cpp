@@ -156,6 +156,23 @@ TEST_F(OrvaNotifyDirectory, WhatIsMountedThereIsAVolumeInItsPlace) {
   }
 }
 
+TEST_F(OrvaNotifyDirectory, IsAnnouncedAfterTheMounts) {
+  fs::create_directory(PHOTOS);
+  const TmpfsMount disk("/shares/Zoo");
+  ServeClient({"--watch", "--volume", PHOTOS});
+  EXPECT_EQ(Next(), Plugged("/shares/Zoo"));
+  EXPECT_EQ(Next(), PLUGGED);
+}
+
+TEST_F(OrvaNotifyDirectory, IsAnnouncedAfterTheMountsToAClientThatConnectsLater) {
+  fs::create_directory(PHOTOS);
+  ServeClient({"--watch", "--volume", PHOTOS});
+  EXPECT_EQ(Next(), PLUGGED);
+  const TmpfsMount disk("/shares/Zoo");
+  EXPECT_EQ(Next(), Plugged("/shares/Zoo"));
+  EXPECT_THAT(NotifyClient().ReadMessages(2), ElementsAre(Plugged("/shares/Zoo"), PLUGGED));
+}
+
 TEST_F(OrvaNotifyDirectory, OtherMountsAreNotAnnouncedWithoutWatch) {
   ServeClient();
   const TmpfsMount other("/shares/Other");

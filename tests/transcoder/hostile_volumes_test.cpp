@@ -200,6 +200,14 @@ TEST_F(HostileVolumes, CatalogsOfOthersAreLeftAlone) {
   EXPECT_FALSE(fs::exists(At(".orva")));
 }
 
+TEST_F(HostileVolumes, AnErrorOfTheDatabaseNamesItsVolume) {
+  fs::create_directories(At(".orva"));
+  WriteBytes(At(".orva/orva.db"), std::string(8192, 'x'));
+  Announce("scanned");
+  ASSERT_TRUE(Await([this] { return !Logged().empty(); }));
+  EXPECT_THAT(Logged(), testing::ElementsAre(testing::StartsWith(Root() + ": ")));
+}
+
 TEST_F(HostileVolumes, FoldersThatAreSwappedAllTheTimeAreNotLeft) {
   if (!HasOtherUsers()) {
     GTEST_SKIP() << NO_OTHER_USERS;

@@ -1,6 +1,8 @@
 #include "transcoder/Photos.h"
 #include "transcoder/TranscoderTest.h"
 
+#include "Sql.h"
+#include "orvadb/VolumeDB.h"
 #include "support/OtherUsers.h"
 
 #include <gmock/gmock.h>
@@ -17,6 +19,8 @@
 
 namespace {
 
+namespace catalog = orva::catalog;
+namespace db = orva::db;
 namespace test = orva::test;
 using namespace orva::test;
 using testing::Contains;
@@ -275,6 +279,35 @@ TEST_F(Renditions, TheVolumeCanBeUnmountedBetweenTwoPiecesOfWork) {
   ASSERT_TRUE(Await([] { return Status() == "{\"volumes\":[]}\n"; })) << Status();
   EXPECT_TRUE(fs::is_empty(Root()));
   EXPECT_TRUE(Await([] { return fs::is_empty(std::string(RUNTIME) + "/staging"); }));
+}
+
+TEST_F(Renditions, AVolumeThatIsUnmountedWhileMessagesWaitIsNoError) {
+  AddAllWaiting({});
+  Announce("scanned");
+  ASSERT_TRUE(AwaitSent("\"End\""));
+  Transcoder().Signal(SIGSTOP);
+  Announce("scanned");
+  ASSERT_EQ(umount2(Root().c_str(), 0), 0) << errno;
+  Transcoder().Signal(SIGCONT);
+  ASSERT_TRUE(Await([] { return Status() == "{\"volumes\":[]}\n"; })) << Status();
+  EXPECT_THAT(Logged(), testing::IsEmpty());
+}
+
+TEST_F(Renditions, ACatalogThatIsBeingMadeIsNoError) {
+  // As another program sees it between the file's first page and the commit of the tables.
+  fs::create_directories(At(".orva"));
+  {
+    const db::VolumeDB catalog(Root(), true);
+    catalog::SelectNumber(catalog, "PRAGMA journal_mode = WAL");
+  }
+  ASSERT_GT(fs::file_size(At(".orva/orva.db")), 0U);
+  Announce("scanned");
+  ASSERT_TRUE(AwaitSent("\"End\""));
+  EXPECT_THAT(Logged(), testing::IsEmpty());
+  Copy("a.jpg");
+  AddWaiting("a.jpg");
+  RenderAll();
+  EXPECT_TRUE(fs::exists(Rendition("a.jpg")));
 }
 
 TEST_F(Renditions, NothingIsWrittenWhereNothingIsMounted) {

@@ -171,6 +171,7 @@ CatalogProblem ProblemOf(const std::string& failure) {
     return CatalogProblem::Full;
   case SQLITE_BUSY:
   case SQLITE_LOCKED:
+  case SQLITE_PROTOCOL: // other programs open and close the log too often at this moment
     return CatalogProblem::Busy;
   case SQLITE_NOMEM:
     return CatalogProblem::Other;

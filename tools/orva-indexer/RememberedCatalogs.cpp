@@ -35,6 +35,20 @@ void RememberedCatalogs::Store(const std::string& master, const std::string& mou
   }
 }
 
+/// The stamps stay: they say how late it may be.
+void RememberedCatalogs::ForgetNewer(const std::string& mountPoint, const Catalog& catalog) {
+  for (auto& [key, stored] : catalogs_) {
+    if (key.second == mountPoint && stored.identity == catalog.identity &&
+        stored.newestStamp > catalog.newestStamp) {
+      stored.identity.clear();
+      unsaved_.insert(key);
+    }
+  }
+  if (!unsaved_.empty()) {
+    Save();
+  }
+}
+
 std::time_t RememberedCatalogs::NewestStamp() const {
   std::time_t newest = 0;
   for (const auto& [key, catalog] : catalogs_) {

@@ -32,6 +32,10 @@ public:
 
   void Store(const std::string& master, const std::string& mountPoint, const Catalog& catalog);
 
+  /// `catalog` was found at `mountPoint`. Forgets for all masters what was announced there of the
+  /// same catalog when it was newer: it was replaced by a copy of an earlier time.
+  void ForgetNewer(const std::string& mountPoint, const Catalog& catalog);
+
   /// The newest stamp of all; 0 if there is none. The clock was there once.
   std::time_t NewestStamp() const;
 

@@ -226,7 +226,11 @@ void Service::WorkOnNext() {
   lastWorked_ = next->first;
   Known& known = *next->second;
   working_ = &known;
-  const Volume::Result result = known.volume.Work([this] { Pulse(); }, LatestStamp());
+  const auto found = [this](const std::string& identity, std::time_t newestStamp) {
+    remembered_.ForgetNewer(working_->volume.MountPoint(),
+                            {.identity = identity, .newestStamp = newestStamp});
+  };
+  const Volume::Result result = known.volume.Work([this] { Pulse(); }, found, LatestStamp());
   working_ = nullptr;
   if (result.isGone) {
     Forget(lastWorked_);
@@ -364,8 +368,7 @@ void Service::PurgeOrEnd(Known& known) {
 /// Whether merged rows of the volume may come from another catalog.
 bool Service::IsPurgeOwed(const Known& known, const std::string& master) const {
   const auto remembered = remembered_.Find(master, known.volume.MountPoint());
-  return !remembered || remembered->identity != known.volume.Identity() ||
-         remembered->newestStamp > known.volume.NewestStamp();
+  return !remembered || remembered->identity != known.volume.Identity();
 }
 
 void Service::Remember(const Known& known, const std::string& master) {

@@ -218,6 +218,7 @@ void Volume::StartAgain() {
   }
   openFiles_.clear();
   looks_.clear();
+  isUncommitted_ = false;
   WalkAll();
 }
 
@@ -265,7 +266,8 @@ void Volume::TakeDue() {
 
 // --- Work --------------------------------------------------------------------------------------
 
-Volume::Result Volume::Work(const std::function<void()>& pulse, std::time_t latest) {
+Volume::Result Volume::Work(const std::function<void()>& pulse, const Found& found,
+                            std::time_t latest) {
   std::optional<VolumeRoot> root;
   try {
     root.emplace(path_, kind_);
@@ -276,13 +278,16 @@ Volume::Result Volume::Work(const std::function<void()>& pulse, std::time_t late
     return {.isGone = true};
   }
   try {
-    return WorkOn(*root, pulse, latest);
+    return WorkOn(*root, pulse, found, latest);
   } catch (const Interrupted&) {
     StartAgain();
     return {};
   } catch (const catalog::CatalogError& error) {
     switch (error.Problem()) {
     case CatalogProblem::Busy:
+      if (isUncommitted_) {
+        StartAgain();
+      }
       notBefore_ = Clock::now() + SHORT_RETRY;
       return {};
     case CatalogProblem::ReadOnly:
@@ -308,7 +313,7 @@ Volume::Result Volume::Work(const std::function<void()>& pulse, std::time_t late
 }
 
 Volume::Result Volume::WorkOn(const VolumeRoot& root, const std::function<void()>& pulse,
-                              std::time_t latest) {
+                              const Found& found, std::time_t latest) {
   Result result;
   struct stat status = {};
   if (fstat(root.Descriptor(), &status) == 0 &&
@@ -324,7 +329,7 @@ Volume::Result Volume::WorkOn(const VolumeRoot& root, const std::function<void()
   try {
     const auto begin = Clock::now();
     const auto database = OpenCatalog(root, latest);
-    CheckIdentity(*database);
+    CheckIdentity(*database, found);
     TakeDue();
     db::Transaction transaction(*database, catalog::BUSY_TIMEOUT);
     isStampWanted_ = false;
@@ -337,6 +342,7 @@ Volume::Result Volume::WorkOn(const VolumeRoot& root, const std::function<void()
                return IsComplete(folder, name, state);
              },
          .pulse = pulse});
+    isUncommitted_ = true;
     while (!ready_.empty() && Clock::now() - begin < MOST_WORK) {
       WalkNext(indexer);
     }
@@ -345,6 +351,7 @@ Volume::Result Volume::WorkOn(const VolumeRoot& root, const std::function<void()
     const long long files = isEnd ? indexer.DeleteUnreachableRows(walkedFolders_, walkedFiles_) : 0;
     const std::time_t newestStamp = catalog::NewestStamp(*database);
     transaction.Commit();
+    isUncommitted_ = false;
     newestStamp_ = newestStamp;
     result.hasChanged = indexer.HasChanged();
     files_ += indexer.Summary().added + indexer.Summary().revived - indexer.Summary().deleted;
@@ -394,14 +401,18 @@ void Volume::SetAside(const VolumeRoot& root, const std::string& reason) {
   StartAgain();
 }
 
-/// A catalog with another identity describes another content.
-void Volume::CheckIdentity(const db::DB& catalog) {
+/// A catalog with another identity describes another content, and so does an older one, which is a
+/// copy of an earlier time.
+void Volume::CheckIdentity(const db::DB& catalog, const Found& found) {
   const std::string identity = catalog::Identity(catalog);
-  if (identity != identity_) {
+  const std::time_t newestStamp = catalog::NewestStamp(catalog);
+  if (identity != identity_ || newestStamp < newestStamp_) {
+    found(identity, newestStamp);
     if (isWalked_) {
       StartAgain();
     }
     identity_ = identity;
+    newestStamp_ = newestStamp;
     isWalked_ = false;
   }
 }

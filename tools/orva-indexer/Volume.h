@@ -46,6 +46,10 @@ public:
   /// Thrown by a pulse to end a piece of work early.
   struct Interrupted {};
 
+  /// Called with the identity and the newest stamp of a catalog that was not there before, or that
+  /// has become older, before anything is written to it.
+  using Found = std::function<void(const std::string& identity, std::time_t newestStamp)>;
+
   /// For the volume at `mountPoint`, which ends in "/". The first walk is waiting.
   Volume(std::string mountPoint, catalog::VolumeRoot::Kind kind);
 
@@ -83,7 +87,7 @@ public:
 
   /// Walks folders for at most two seconds and commits. Calls `pulse` often. `latest` is the time
   /// of the latest stamp that its catalog may have.
-  Result Work(const std::function<void()>& pulse, std::time_t latest);
+  Result Work(const std::function<void()>& pulse, const Found& found, std::time_t latest);
 
   /// Something was mounted or unmounted: a volume that could not be written is tried again, and
   /// mount points below the volume are looked at. `mountPoints` are all that there are.
@@ -130,9 +134,9 @@ private:
   void TakeDue();
   std::unique_ptr<db::VolumeDB> OpenCatalog(const catalog::VolumeRoot& root, std::time_t latest);
   void SetAside(const catalog::VolumeRoot& root, const std::string& reason);
-  void CheckIdentity(const db::DB& catalog);
+  void CheckIdentity(const db::DB& catalog, const Found& found);
   Result WorkOn(const catalog::VolumeRoot& root, const std::function<void()>& pulse,
-                std::time_t latest);
+                const Found& found, std::time_t latest);
   void WalkNext(catalog::FolderIndexer& indexer);
   void FinishWalk(Result& result, long long files);
   void Opened(const Folder& folder, int descriptor);
@@ -154,7 +158,8 @@ private:
   std::set<std::string> mounts_; ///< below the volume, as paths of folders
   Clock::time_point eventsRead_{};
 
-  std::vector<Task> ready_; ///< the last one is next
+  std::vector<Task> ready_;    ///< the last one is next
+  bool isUncommitted_ = false; ///< folders were walked, and that is not committed
   std::map<std::string, Pending> pending_;
   std::unordered_map<std::string, OpenFile> openFiles_;
   std::unordered_map<std::string, Look> looks_;

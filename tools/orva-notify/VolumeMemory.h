@@ -20,8 +20,8 @@ public:
   /// known and there are too many.
   bool Remember(const Announcement& announcement);
 
-  /// What a new client has to be told: Plugged for the plugged volumes, then Scanned, then End for
-  /// the volumes of which this was announced.
+  /// What a new client has to be told: Plugged for the plugged volumes, mounts before directories,
+  /// then Scanned, then End for the volumes of which this was announced.
   std::vector<Announcement> Replay() const;
 
   /// End for each volume that has ended: a new master is filled with them.

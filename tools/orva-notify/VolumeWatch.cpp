@@ -65,6 +65,9 @@ std::vector<Announcement> VolumeWatch::TakeChanges() {
   for (const auto& mountPoint : changes.unplugged) {
     unplugged.push_back({.event = Event::Unplugged, .mountPoint = mountPoint});
   }
+  for (const auto& mountPoint : changes.plugged) {
+    plugged.push_back({.event = Event::Plugged, .mountPoint = mountPoint});
+  }
   for (auto& directory : directories_) {
     const auto identity = now.contains(directory.path) ? std::nullopt : Identify(directory.path);
     if (directory.identity && identity != directory.identity) {
@@ -75,9 +78,6 @@ std::vector<Announcement> VolumeWatch::TakeChanges() {
           {.event = Event::Plugged, .mountPoint = directory.path, .kind = VolumeKind::Directory});
     }
     directory.identity = identity;
-  }
-  for (const auto& mountPoint : changes.plugged) {
-    plugged.push_back({.event = Event::Plugged, .mountPoint = mountPoint});
   }
   volumes_ = now;
   std::ranges::copy(plugged, std::back_inserter(unplugged));

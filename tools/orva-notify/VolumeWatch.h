@@ -29,8 +29,9 @@ public:
   /// Polled with POLLIN for changes of directories; -1 when none is watched.
   int DirectoryEvents() const noexcept { return events_.Get(); }
 
-  /// The Unplugged and then the Plugged volumes since the last call. A volume that was replaced is
-  /// among both.
+  /// The Unplugged and then the Plugged volumes since the last call, mounts before directories: the
+  /// daemon elects a master when it hears of the first one. A volume that was replaced is among
+  /// both.
   std::vector<Announcement> TakeChanges();
 
 private:

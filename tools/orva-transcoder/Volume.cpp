@@ -7,6 +7,8 @@
 #include "CatalogWriter.h"
 #include "Classification.h"
 #include "RenditionAccess.h"
+#include "Sql.h"
+#include "UntrustedCatalog.h"
 
 #include "orvadb/Transaction.h"
 #include "orvadb/VolumeDB.h"
@@ -38,6 +40,7 @@ using catalog::RENDITIONS_PER_FOLDER;
 using catalog::VolumeRoot;
 using catalog::WaitingPhoto;
 using service::LogError;
+using service::LogInfo;
 using service::Printable;
 
 constexpr std::size_t MOST_LISTED = 50;       // waiting photos in one query
@@ -64,8 +67,10 @@ std::string FolderOf(const std::string& path) {
   return end == std::string::npos ? std::string() : path.substr(0, end);
 }
 
-bool IsBusy(std::string_view failure) {
-  return failure.find("database is locked") != std::string_view::npos;
+/// False while the indexer makes the catalog: the identity is committed with the tables.
+bool HasIdentity(const db::DB& catalog) {
+  return catalog::SelectNumber(catalog,
+                               "SELECT count(*) FROM sqlite_schema WHERE name = 'Identity'") > 0;
 }
 
 bool IsSameTime(const timespec& a, const timespec& b) {
@@ -131,8 +136,9 @@ bool Volume::HasUncheckedRenditions() const {
   return !isChecked_ && !lookAgainAt_;
 }
 
-std::optional<Volume::Opened> Volume::Open() const {
+std::optional<Volume::Opened> Volume::Open() {
   VolumeRoot root(PathOf(mountPoint_), kind_);
+  wasThere_ = true;
   struct statvfs fileSystem {};
   if (fstatvfs(root.Descriptor(), &fileSystem) == 0 && (fileSystem.f_flag & ST_RDONLY) != 0) {
     throw util::Exception(root.Path() + " is read-only: photos there are not rendered");
@@ -145,7 +151,7 @@ std::optional<Volume::Opened> Volume::Open() const {
     return std::nullopt;
   }
   auto database = std::make_unique<db::VolumeDB>(root.Path(), true);
-  if (!root.IsInPlace() || !catalog::HasOwnSchema(*database)) {
+  if (!root.IsInPlace() || !catalog::HasOwnSchema(*database) || !HasIdentity(*database)) {
     return std::nullopt;
   }
   std::string identity = catalog::Identity(*database);
@@ -158,18 +164,34 @@ void Volume::Attempt(const std::function<void()>& work) {
     lookAgainAt_.reset();
     return;
   } catch (const std::string& failure) { // the database layer's
-    Report(failure);
+    Report(failure, catalog::ProblemOf(failure) == catalog::CatalogProblem::Busy);
   } catch (const std::exception& failure) {
-    Report(failure.what());
+    Report(failure.what(), false);
   }
 }
 
-void Volume::Report(const std::string& problem) {
-  isBusy_ = IsBusy(problem);
+void Volume::Report(const std::string& problem, bool isBusy) {
+  isBusy_ = isBusy;
   lookAgainAt_ = Clock::now() + (isBusy_ ? std::chrono::seconds(1) : RETRY);
-  if (!isBusy_ && problem != problem_) {
-    problem_ = problem;
-    LogError(Printable(problem));
+  if (isBusy_ || problem == problem_) {
+    return;
+  }
+  problem_ = problem;
+  const std::string path = PathOf(mountPoint_);
+  const std::string line = Printable(problem.starts_with(path) ? problem : path + ": " + problem);
+  if (IsThere()) {
+    LogError(line);
+  } else if (!wasThere_) {
+    LogInfo(line);
+  } // else it was unmounted, and its Unplugged follows
+}
+
+bool Volume::IsThere() const {
+  try {
+    const VolumeRoot root(PathOf(mountPoint_), kind_);
+    return true;
+  } catch (const util::Exception&) {
+    return false;
   }
 }
 

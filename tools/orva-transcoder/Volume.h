@@ -88,10 +88,11 @@ private:
     long long used = 0; ///< bytes of the copies
   };
 
-  /// Returns nothing if the catalog is missing or not one of ours.
-  std::optional<Opened> Open() const;
+  /// Returns nothing if the catalog is missing, not one of ours, or just being made.
+  std::optional<Opened> Open();
+  bool IsThere() const;
   void Attempt(const std::function<void()>& work);
-  void Report(const std::string& problem);
+  void Report(const std::string& problem, bool isBusy);
   void Count(const db::VolumeDB& catalog);
   void RemoveVanished(const Opened& volume);
   /// Adds the photo to the batch, or leaves it out until the next message. Returns false if the
@@ -107,7 +108,8 @@ private:
 
   const std::string mountPoint_; ///< ends in "/"
   const catalog::VolumeRoot::Kind kind_;
-  std::string identity_; ///< of the catalog when it was last looked at
+  bool wasThere_ = false; ///< it was opened before
+  std::string identity_;  ///< of the catalog when it was last looked at
   std::size_t waiting_ = 0;
   std::size_t failed_ = 0;
   std::size_t changes_ = 0;

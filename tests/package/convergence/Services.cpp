@@ -48,8 +48,6 @@ const std::map<std::string, std::regex>& UsualLines() {
       {"orva-indexer",
        std::regex("Volume [^ ]*: (walking|gone|walked \\d+ folders, \\d+ files in [\\d.]+ s|"
                   "indexed again)")},
-      // It may look at a catalog that is being made.
-      {"orva-transcoder", std::regex(".*: no such table: Identity .*")},
       {"systemd",
        std::regex(
            "(Starting|Started|Stopping|Stopped) .*|.*: Deactivated successfully\\.|"
