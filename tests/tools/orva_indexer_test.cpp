@@ -432,7 +432,7 @@ TEST_F(IndexerTest, FoldersAreWalkedAgainIfTheirCommitFailsOnABusyCatalog) {
   indexer::Volume indexed(volume.Path() + "/", catalog::VolumeRoot::Kind::Mount);
   const auto work = [&indexed](const std::function<void()>& pulse) {
     return indexed.Work(
-        pulse, [](const std::string&, std::time_t) {}, std::time(nullptr));
+        pulse, [](const db::DB&) {}, std::time(nullptr));
   };
   EXPECT_FALSE(work([] { throw std::string("database is locked (extended code 5)"); }).hasChanged);
   ASSERT_LT(indexed.NextWork(), indexer::Clock::time_point::max());
@@ -819,6 +819,33 @@ TEST_F(IndexerAndDaemonTest, ACatalogFromABackupThatWasUpdatedSinceIsMergedFromT
   Service().WaitForEnd();
   Start();
   EXPECT_THAT(AwaitMerged(volume.Path(), {"a.jpg", "c.jpg"}), IsEmpty());
+}
+
+TEST_F(IndexerAndDaemonTest, ACatalogFromABackupIsRecognizedAlthoughTheTranscoderWasFirst) {
+  const Volume volume("Disk", "64m");
+  Write(volume.Path() + "/a.jpg");
+  Start();
+  ASSERT_THAT(AwaitMerged(volume.Path(), {"a.jpg"}), IsEmpty());
+  Write(volume.Path() + "/waiting.jpg");
+  ASSERT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  Stop();
+  fs::copy_file(CatalogOf(volume.Path()), "/tmp/backup.db");
+  Start();
+  Write(volume.Path() + "/b.jpg");
+  ASSERT_THAT(AwaitMerged(volume.Path(), {"a.jpg", "b.jpg", "waiting.jpg"}), IsEmpty());
+  ASSERT_TRUE(AwaitAllRemembered(volume.Path()));
+  Stop();
+  const auto newestStamp = [&volume] {
+    return std::stoll(Query(volume.Path(), "SELECT newestStamp FROM Identity").at(0));
+  };
+  const long long remembered = newestStamp();
+  fs::remove(volume.Path() + "/b.jpg");
+  fs::copy_file("/tmp/backup.db", CatalogOf(volume.Path()), fs::copy_options::overwrite_existing);
+  while (newestStamp() <= remembered) {
+    FinishPhotos(volume.Path());
+  }
+  Start();
+  EXPECT_THAT(AwaitMerged(volume.Path(), {"a.jpg", "waiting.jpg"}), IsEmpty());
 }
 
 TEST_F(IndexerAndDaemonTest, ACatalogIsKnownAgainWhenTheClockStartsYearsLate) {

@@ -226,9 +226,8 @@ void Service::WorkOnNext() {
   lastWorked_ = next->first;
   Known& known = *next->second;
   working_ = &known;
-  const auto found = [this](const std::string& identity, std::time_t newestStamp) {
-    remembered_.ForgetNewer(working_->volume.MountPoint(),
-                            {.identity = identity, .newestStamp = newestStamp});
+  const auto found = [this](const db::DB& catalog) {
+    remembered_.ForgetOtherStates(working_->volume.MountPoint(), catalog);
   };
   const Volume::Result result = known.volume.Work([this] { Pulse(); }, found, LatestStamp());
   working_ = nullptr;
@@ -372,9 +371,7 @@ bool Service::IsPurgeOwed(const Known& known, const std::string& master) const {
 }
 
 void Service::Remember(const Known& known, const std::string& master) {
-  remembered_.Store(
-      master, known.volume.MountPoint(),
-      {.identity = known.volume.Identity(), .newestStamp = known.volume.NewestStamp()});
+  remembered_.Store(master, known.volume.MountPoint(), known.volume.State());
 }
 
 /// The identity of the catalog on the master volume; nothing while that is not known.

@@ -1,6 +1,5 @@
 #include "Volume.h"
 
-#include "CatalogSchema.h"
 #include "Sql.h"
 
 #include "orvadb/Transaction.h"
@@ -349,10 +348,10 @@ Volume::Result Volume::WorkOn(const VolumeRoot& root, const std::function<void()
     walkTime_ += Clock::now() - begin;
     const bool isEnd = isWalkingAll_ && ready_.empty();
     const long long files = isEnd ? indexer.DeleteUnreachableRows(walkedFolders_, walkedFiles_) : 0;
-    const std::time_t newestStamp = catalog::NewestStamp(*database);
+    catalog::CatalogState state = catalog::StateOf(*database);
     transaction.Commit();
     isUncommitted_ = false;
-    newestStamp_ = newestStamp;
+    state_ = std::move(state);
     result.hasChanged = indexer.HasChanged();
     files_ += indexer.Summary().added + indexer.Summary().revived - indexer.Summary().deleted;
     if (const auto& unreadable = indexer.Summary().unreadable; !unreadable.empty()) {
@@ -401,18 +400,15 @@ void Volume::SetAside(const VolumeRoot& root, const std::string& reason) {
   StartAgain();
 }
 
-/// A catalog with another identity describes another content, and so does an older one, which is a
-/// copy of an earlier time.
+/// A catalog with another identity describes another content, and so does a copy of an earlier
+/// time, also after the transcoder has written to it.
 void Volume::CheckIdentity(const db::DB& catalog, const Found& found) {
-  const std::string identity = catalog::Identity(catalog);
-  const std::time_t newestStamp = catalog::NewestStamp(catalog);
-  if (identity != identity_ || newestStamp < newestStamp_) {
-    found(identity, newestStamp);
+  if (!catalog::HasBeenIn(catalog, state_)) {
+    found(catalog);
     if (isWalked_) {
       StartAgain();
     }
-    identity_ = identity;
-    newestStamp_ = newestStamp;
+    state_ = catalog::StateOf(catalog);
     isWalked_ = false;
   }
 }
