@@ -446,6 +446,44 @@ TEST_F(IndexerTest, FoldersAreWalkedAgainIfTheirCommitFailsOnABusyCatalog) {
   EXPECT_THAT(ErrorLines(), IsEmpty());
 }
 
+TEST_F(IndexerTest, ACatalogThatStaysLockedIsLoggedOnceAndUpdatedLater) {
+  const Volume locked("A", "64m");
+  const Volume other("B", "64m");
+  Write(locked.Path() + "/first.jpg");
+  Write(other.Path() + "/first.jpg");
+  StartService();
+  StartIndexer();
+  ASSERT_THAT(AwaitCatalog(locked.Path()), IsEmpty());
+  ASSERT_THAT(AwaitCatalog(other.Path()), IsEmpty());
+  {
+    Database writer(CatalogOf(locked.Path()));
+    writer.setBusyTimeout(5000);
+    writer.Run("BEGIN IMMEDIATE");
+    Write(locked.Path() + "/a.jpg");
+    EXPECT_TRUE(AwaitLog("/shares/A/: another program has locked its catalog"));
+    Write(other.Path() + "/b.jpg");
+    EXPECT_THAT(AwaitCatalog(other.Path()), IsEmpty());
+    EXPECT_THAT(Query(locked.Path(), "SELECT path FROM Files"), ElementsAre("first.jpg"));
+  }
+  EXPECT_THAT(AwaitCatalog(locked.Path()), IsEmpty());
+  EXPECT_THAT(ErrorLines(), ElementsAre(HasSubstr("locked")));
+}
+
+TEST_F(IndexerTest, ALockedCatalogIsTriedAgainAfterGrowingPauses) {
+  const Volume volume("A", "64m");
+  catalog::OpenCatalog(volume.Path());
+  indexer::Volume indexed(volume.Path() + "/", catalog::VolumeRoot::Kind::Mount);
+  const auto pause = [&indexed] {
+    indexed.Work([] {}, [](const db::DB&) {}, std::time(nullptr));
+    const auto now = indexer::Clock::now();
+    return indexed.NextWork() - now;
+  };
+  Database writer(CatalogOf(volume.Path()));
+  writer.Run("BEGIN IMMEDIATE");
+  const auto first = pause();
+  EXPECT_GT(pause(), first);
+}
+
 TEST(CatalogProblem, ALockThatIsNotGrantedInTimeIsNoDamage) {
   const auto problemOf = [](int code) {
     return catalog::ProblemOf("failed (extended code " + std::to_string(code) + ") in \"SELECT\"");

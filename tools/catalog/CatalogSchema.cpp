@@ -148,8 +148,8 @@ bool HasOwnSchema(const db::DB& catalog) {
   return own;
 }
 
-void CreateSchema(const db::DB& catalog) {
-  db::Transaction transaction(catalog, BUSY_TIMEOUT);
+void CreateSchema(const db::DB& catalog, unsigned busyTimeout) {
+  db::Transaction transaction(catalog, busyTimeout);
   CreateTables(catalog);
   CreateIndexes(catalog);
   transaction.Commit();

@@ -49,6 +49,15 @@ constexpr auto MOST_WORK = 2s;
 constexpr auto LONGEST_EMPTY = 8s;
 constexpr auto LONGEST_OPEN = 600s;
 
+/// How long a locked catalog is waited for, in milliseconds: all volumes wait then. The next
+/// attempts come after pauses, each twice as long as the one before.
+constexpr unsigned BUSY_TIMEOUT = 100;
+constexpr Clock::duration SHORTEST_BUSY_PAUSE = 250ms;
+constexpr Clock::duration LONGEST_BUSY_PAUSE = 8s;
+
+/// After this time, a locked catalog is logged.
+constexpr auto LONGEST_LOCK = 5s;
+
 constexpr auto RETRY = 60s;
 constexpr auto SHORT_RETRY = 1s;
 
@@ -287,7 +296,7 @@ Volume::Result Volume::Work(const std::function<void()>& pulse, const Found& fou
       if (isUncommitted_) {
         StartAgain();
       }
-      notBefore_ = Clock::now() + SHORT_RETRY;
+      WaitForLock();
       return {};
     case CatalogProblem::ReadOnly:
       Fail(Trouble::ReadOnly, "read-only; its catalog is not updated until this changes");
@@ -330,7 +339,7 @@ Volume::Result Volume::WorkOn(const VolumeRoot& root, const std::function<void()
     const auto database = OpenCatalog(root, latest);
     CheckIdentity(*database, found);
     TakeDue();
-    db::Transaction transaction(*database, catalog::BUSY_TIMEOUT);
+    db::Transaction transaction(*database, BUSY_TIMEOUT);
     isStampWanted_ = false;
     FolderIndexer indexer(
         *database, root, catalog::NewPhotos::Waiting, std::time(nullptr),
@@ -351,6 +360,9 @@ Volume::Result Volume::WorkOn(const VolumeRoot& root, const std::function<void()
     catalog::CatalogState state = catalog::StateOf(*database);
     transaction.Commit();
     isUncommitted_ = false;
+    busyPause_ = {};
+    lockedSince_.reset();
+    isLockLogged_ = false;
     state_ = std::move(state);
     result.hasChanged = indexer.HasChanged();
     files_ += indexer.Summary().added + indexer.Summary().revived - indexer.Summary().deleted;
@@ -380,7 +392,7 @@ Volume::Result Volume::WorkOn(const VolumeRoot& root, const std::function<void()
 }
 
 std::unique_ptr<db::VolumeDB> Volume::OpenCatalog(const VolumeRoot& root, std::time_t latest) {
-  auto database = catalog::OpenUntrustedCatalog(root, latest);
+  auto database = catalog::OpenUntrustedCatalog(root, latest, BUSY_TIMEOUT);
   if (!root.IsInPlace()) {
     throw catalog::CatalogError(CatalogProblem::Other, "the volume was replaced");
   }
@@ -533,6 +545,18 @@ void Volume::Fail(Trouble trouble, const std::string& reason, bool isMedium) {
   watches_.reset();
   isRetry_ = true;
   notBefore_ = Clock::now() + RETRY;
+}
+
+/// Another program has locked the catalog.
+void Volume::WaitForLock() {
+  const auto now = Clock::now();
+  busyPause_ = std::clamp(busyPause_ * 2, SHORTEST_BUSY_PAUSE, LONGEST_BUSY_PAUSE);
+  notBefore_ = now + busyPause_;
+  if (!lockedSince_) {
+    lockedSince_ = now;
+  } else if (now - *lockedSince_ >= LONGEST_LOCK && !std::exchange(isLockLogged_, true)) {
+    LogError(name_ + ": another program has locked its catalog; it is not updated until this ends");
+  }
 }
 
 /// A walk of all folders has ended.

@@ -147,6 +147,7 @@ private:
                   const catalog::FolderIndexer::FileState& state);
   void Fail(Trouble trouble, const std::string& reason, bool isMedium = false);
   void Recover();
+  void WaitForLock();
 
   const std::string mountPoint_;
   const std::string path_;
@@ -165,8 +166,11 @@ private:
   std::map<std::string, Pending> pending_;
   std::unordered_map<std::string, OpenFile> openFiles_;
   std::unordered_map<std::string, Look> looks_;
-  Clock::time_point notBefore_{}; ///< no work earlier
-  Clock::time_point nextWalk_{};  ///< of all folders, where they are not watched
+  Clock::time_point notBefore_{};                ///< no work earlier
+  Clock::time_point nextWalk_{};                 ///< of all folders, where they are not watched
+  Clock::duration busyPause_{};                  ///< before the next attempt to lock the catalog
+  std::optional<Clock::time_point> lockedSince_; ///< by another program
+  bool isLockLogged_ = false;
   bool isStampWanted_ = false;
   bool hasOtherAccess_ = false; ///< the folder that is walked lets other users pass than before
 
