@@ -424,6 +424,29 @@ TEST_F(IndexerTest, AKilledIndexerConvergesAfterItsStart) {
   EXPECT_THAT(ErrorLines(), IsEmpty());
 }
 
+// --- Pieces of work ----------------------------------------------------------------------------
+
+TEST_F(IndexerTest, AVolumeCanBeUnmountedBetweenTwoPiecesOfItsFirstWalk) {
+  const Volume volume("A", "64m");
+  for (const std::string folder : {"a", "b", "c"}) {
+    Write(volume.Path() + "/" + folder + "/photo.jpg");
+  }
+  indexer::Volume indexed(volume.Path() + "/", catalog::VolumeRoot::Kind::Mount);
+  const auto begin = indexer::Clock::now();
+  auto pulse = begin;
+  // As on a slow disk: the first folder takes all of the time of a piece of work.
+  indexed.Work(
+      [&] {
+        do {
+          pulse = indexer::Clock::now();
+        } while (pulse - begin < std::chrono::seconds(3));
+      },
+      [](const db::DB&) {}, std::time(nullptr));
+  EXPECT_FALSE(indexed.IsIdle());
+  EXPECT_GT(indexed.NextWork(), pulse);
+  EXPECT_EQ(umount2(volume.Path().c_str(), 0), 0);
+}
+
 // --- Busy catalogs -----------------------------------------------------------------------------
 
 TEST_F(IndexerTest, FoldersAreWalkedAgainIfTheirCommitFailsOnABusyCatalog) {

@@ -44,6 +44,9 @@ constexpr auto EVENT_INTERVAL = 100ms;
 /// How long a piece of work may take before its commit.
 constexpr auto MOST_WORK = 2s;
 
+/// Between two pieces of work, so that the volume can be unmounted.
+constexpr auto REST = 200ms;
+
 /// A file that was created but neither written nor closed may be a link, for which there is no
 /// other event. One that was written and not closed may have been truncated by its name.
 constexpr auto LONGEST_EMPTY = 8s;
@@ -286,7 +289,11 @@ Volume::Result Volume::Work(const std::function<void()>& pulse, const Found& fou
     return {.isGone = true};
   }
   try {
-    return WorkOn(*root, pulse, found, latest);
+    const Result result = WorkOn(*root, pulse, found, latest);
+    if (!ready_.empty()) {
+      notBefore_ = std::max(notBefore_, Clock::now() + REST);
+    }
+    return result;
   } catch (const Interrupted&) {
     StartAgain();
     return {};
