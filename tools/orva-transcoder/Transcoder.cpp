@@ -262,7 +262,7 @@ BatchLimits Transcoder::LimitsOfNext(const Volume& volume) const {
     staged += running->batch->mountPoint == volume.MountPoint() ? running->batch->photos.size() : 0;
   }
   const std::size_t waiting = volume.Waiting() - std::min(staged, volume.Waiting());
-  const auto batches = static_cast<long long>(processors_ + 1);
+  const auto batches = static_cast<long long>(processors_) + 1;
   const long long space = FreeSpace();
   return {.photos = std::clamp(waiting / processors_, FEWEST_PHOTOS, MOST_PHOTOS),
           .bytes = std::min({space, MOST_BYTES, MOST_STAGED / batches}),
