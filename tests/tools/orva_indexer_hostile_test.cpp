@@ -1,6 +1,8 @@
 #include "IndexerTest.h"
 
+#include "support/Programs.h"
 #include "system/Database.h"
+#include "system/PeakMemory.h"
 
 #include "CatalogSchema.h"
 #include "Indexer.h"
@@ -214,6 +216,31 @@ TEST_F(HostileIndexerTest, ACatalogThatLiesDescribesTheVolumeAfterTheWalk) {
   EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
   EXPECT_EQ(Query(volume.Path(), "SELECT identity FROM Identity"), identity);
   EXPECT_THAT(ErrorLines(), IsEmpty());
+}
+
+TEST_F(HostileIndexerTest, LongNamesInACatalogTakeLittleMemory) {
+  const Volume volume("A", "2g");
+  Write(volume.Path() + "/Pictures/a.jpg");
+  MakeCatalog(volume.Path());
+  // 40 MiB of names of folders, and twice as much of names of files.
+  const std::string names =
+      "WITH RECURSIVE n(i) AS (VALUES(100) UNION ALL SELECT i + 1 FROM n WHERE i < 119), "
+      "named(i, name) AS (SELECT i, format('%d%.*c', i, 2 << 20, 'x') FROM n) ";
+  Change(volume.Path(),
+         {names + "INSERT INTO Folders "
+                  "SELECT i, -1, name || '/', name, 4, 1, 0, 0, 0, 0, 1, 1 FROM named",
+          names + "INSERT INTO Files "
+                  "SELECT i, -1, name, name, 0, 1, 0, 0, 0, 0, 1, 1, '', 1 FROM named",
+          names +
+              "INSERT INTO Files "
+              "SELECT i + 20, -1, '/' || name, name, 0, 1, 0, 0, 0, 1, 1, 1, '', 1 FROM named"});
+  StartService();
+  StartIndexer();
+  EXPECT_TRUE(AwaitCatalog(volume.Path()).empty()); // the differences would be long
+  EXPECT_THAT(ErrorLines(), IsEmpty());
+  if (!AreProgramsSanitized()) {
+    EXPECT_LT(PeakOf(Indexer().Pid()), 96 << 10); // KiB
+  }
 }
 
 TEST_F(HostileIndexerTest, AVolumeIsNotIndexedWhileItsFolderOfTheProductIsNone) {

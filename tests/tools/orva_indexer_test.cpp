@@ -485,6 +485,29 @@ TEST_F(IndexerTest, AKilledIndexerConvergesAfterItsStart) {
   EXPECT_THAT(ErrorLines(), IsEmpty());
 }
 
+// --- Pieces of work ----------------------------------------------------------------------------
+
+TEST_F(IndexerTest, AVolumeCanBeUnmountedBetweenTwoPiecesOfItsFirstWalk) {
+  const Volume volume("A", "64m");
+  for (const std::string folder : {"a", "b", "c"}) {
+    Write(volume.Path() + "/" + folder + "/photo.jpg");
+  }
+  indexer::Volume indexed(volume.Path() + "/", catalog::VolumeRoot::Kind::Mount);
+  const auto begin = indexer::Clock::now();
+  auto pulse = begin;
+  // As on a slow disk: the first folder takes all of the time of a piece of work.
+  indexed.Work(
+      [&] {
+        do {
+          pulse = indexer::Clock::now();
+        } while (pulse - begin < std::chrono::seconds(3));
+      },
+      [](const db::DB&) {}, std::time(nullptr));
+  EXPECT_FALSE(indexed.IsIdle());
+  EXPECT_GT(indexed.NextWork(), pulse);
+  EXPECT_EQ(umount2(volume.Path().c_str(), 0), 0);
+}
+
 // --- Busy catalogs -----------------------------------------------------------------------------
 
 TEST_F(IndexerTest, FoldersAreWalkedAgainIfTheirCommitFailsOnABusyCatalog) {
@@ -493,7 +516,7 @@ TEST_F(IndexerTest, FoldersAreWalkedAgainIfTheirCommitFailsOnABusyCatalog) {
   indexer::Volume indexed(volume.Path() + "/", catalog::VolumeRoot::Kind::Mount);
   const auto work = [&indexed](const std::function<void()>& pulse) {
     return indexed.Work(
-        pulse, [](const std::string&, std::time_t) {}, std::time(nullptr));
+        pulse, [](const db::DB&) {}, std::time(nullptr));
   };
   EXPECT_FALSE(work([] { throw std::string("database is locked (extended code 5)"); }).hasChanged);
   ASSERT_LT(indexed.NextWork(), indexer::Clock::time_point::max());
@@ -505,6 +528,44 @@ TEST_F(IndexerTest, FoldersAreWalkedAgainIfTheirCommitFailsOnABusyCatalog) {
            Query(volume.Path(), "SELECT path FROM Files") == Lines{"Pictures/a.jpg"};
   }));
   EXPECT_THAT(ErrorLines(), IsEmpty());
+}
+
+TEST_F(IndexerTest, ACatalogThatStaysLockedIsLoggedOnceAndUpdatedLater) {
+  const Volume locked("A", "64m");
+  const Volume other("B", "64m");
+  Write(locked.Path() + "/first.jpg");
+  Write(other.Path() + "/first.jpg");
+  StartService();
+  StartIndexer();
+  ASSERT_THAT(AwaitCatalog(locked.Path()), IsEmpty());
+  ASSERT_THAT(AwaitCatalog(other.Path()), IsEmpty());
+  {
+    Database writer(CatalogOf(locked.Path()));
+    writer.setBusyTimeout(5000);
+    writer.Run("BEGIN IMMEDIATE");
+    Write(locked.Path() + "/a.jpg");
+    EXPECT_TRUE(AwaitLog("/shares/A/: another program has locked its catalog"));
+    Write(other.Path() + "/b.jpg");
+    EXPECT_THAT(AwaitCatalog(other.Path()), IsEmpty());
+    EXPECT_THAT(Query(locked.Path(), "SELECT path FROM Files"), ElementsAre("first.jpg"));
+  }
+  EXPECT_THAT(AwaitCatalog(locked.Path()), IsEmpty());
+  EXPECT_THAT(ErrorLines(), ElementsAre(HasSubstr("locked")));
+}
+
+TEST_F(IndexerTest, ALockedCatalogIsTriedAgainAfterGrowingPauses) {
+  const Volume volume("A", "64m");
+  catalog::OpenCatalog(volume.Path());
+  indexer::Volume indexed(volume.Path() + "/", catalog::VolumeRoot::Kind::Mount);
+  const auto pause = [&indexed] {
+    indexed.Work([] {}, [](const db::DB&) {}, std::time(nullptr));
+    const auto now = indexer::Clock::now();
+    return indexed.NextWork() - now;
+  };
+  Database writer(CatalogOf(volume.Path()));
+  writer.Run("BEGIN IMMEDIATE");
+  const auto first = pause();
+  EXPECT_GT(pause(), first);
 }
 
 TEST(CatalogProblem, ALockThatIsNotGrantedInTimeIsNoDamage) {
@@ -901,6 +962,33 @@ TEST_F(IndexerAndDaemonTest, ACatalogFromABackupThatWasUpdatedSinceIsMergedFromT
   Service().WaitForEnd();
   Start();
   EXPECT_THAT(AwaitMerged(volume.Path(), {"a.jpg", "c.jpg"}), IsEmpty());
+}
+
+TEST_F(IndexerAndDaemonTest, ACatalogFromABackupIsRecognizedAlthoughTheTranscoderWasFirst) {
+  const Volume volume("Disk", "64m");
+  Write(volume.Path() + "/a.jpg");
+  Start();
+  ASSERT_THAT(AwaitMerged(volume.Path(), {"a.jpg"}), IsEmpty());
+  Write(volume.Path() + "/waiting.jpg");
+  ASSERT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  Stop();
+  fs::copy_file(CatalogOf(volume.Path()), "/tmp/backup.db");
+  Start();
+  Write(volume.Path() + "/b.jpg");
+  ASSERT_THAT(AwaitMerged(volume.Path(), {"a.jpg", "b.jpg", "waiting.jpg"}), IsEmpty());
+  ASSERT_TRUE(AwaitAllRemembered(volume.Path()));
+  Stop();
+  const auto newestStamp = [&volume] {
+    return std::stoll(Query(volume.Path(), "SELECT newestStamp FROM Identity").at(0));
+  };
+  const long long remembered = newestStamp();
+  fs::remove(volume.Path() + "/b.jpg");
+  fs::copy_file("/tmp/backup.db", CatalogOf(volume.Path()), fs::copy_options::overwrite_existing);
+  while (newestStamp() <= remembered) {
+    FinishPhotos(volume.Path());
+  }
+  Start();
+  EXPECT_THAT(AwaitMerged(volume.Path(), {"a.jpg", "waiting.jpg"}), IsEmpty());
 }
 
 TEST_F(IndexerAndDaemonTest, ACatalogIsKnownAgainWhenTheClockStartsYearsLate) {

@@ -69,6 +69,7 @@ constexpr std::array TABLES = {
     "status INTEGER NOT NULL, "
     "lastUpdatedDate INTEGER NOT NULL)",
     "CREATE TABLE Identity(identity TEXT NOT NULL, newestStamp INTEGER NOT NULL)",
+    "CREATE TABLE Stamps(stamp INTEGER PRIMARY KEY, mark INTEGER NOT NULL)",
     "CREATE TABLE Failures(fileId INTEGER PRIMARY KEY, reason TEXT NOT NULL)",
     "CREATE TABLE Removals(fileId INTEGER PRIMARY KEY)",
 };
@@ -102,16 +103,25 @@ void CreateIfMissing(const db::DB& catalog, const char* definition) {
   }
 }
 
-std::string RandomIdentity() {
-  std::array<unsigned char, 16> bytes{};
-  if (getentropy(bytes.data(), bytes.size()) != 0) {
+void FillRandom(void* bytes, std::size_t size) {
+  if (getentropy(bytes, size) != 0) {
     throw util::Exception("no random numbers: " + std::generic_category().message(errno));
   }
+}
+
+std::string RandomIdentity() {
+  std::array<unsigned char, 16> bytes{};
+  FillRandom(bytes.data(), bytes.size());
   std::string identity;
   for (const unsigned char byte : bytes) {
     identity += util::FormatString("%02x", byte);
   }
   return identity;
+}
+
+/// The random number that was given out with a stamp; 0 if there is none.
+long long MarkOf(const db::DB& catalog, std::time_t stamp) {
+  return SelectNumber(catalog, "SELECT mark FROM Stamps WHERE stamp = ?", stamp);
 }
 
 } // namespace
@@ -138,8 +148,8 @@ bool HasOwnSchema(const db::DB& catalog) {
   return own;
 }
 
-void CreateSchema(const db::DB& catalog) {
-  db::Transaction transaction(catalog, BUSY_TIMEOUT);
+void CreateSchema(const db::DB& catalog, unsigned busyTimeout) {
+  db::Transaction transaction(catalog, busyTimeout);
   CreateTables(catalog);
   CreateIndexes(catalog);
   transaction.Commit();
@@ -183,6 +193,16 @@ void RenewIdentity(const db::DB& catalog) {
   Execute(catalog, "UPDATE Identity SET identity = ?", RandomIdentity());
 }
 
+CatalogState StateOf(const db::DB& catalog) {
+  const std::time_t newest = NewestStamp(catalog);
+  return {.identity = Identity(catalog), .newestStamp = newest, .mark = MarkOf(catalog, newest)};
+}
+
+bool HasBeenIn(const db::DB& catalog, const CatalogState& state) {
+  return Identity(catalog) == state.identity && NewestStamp(catalog) >= state.newestStamp &&
+         MarkOf(catalog, state.newestStamp) == state.mark;
+}
+
 std::time_t NewestStamp(const db::DB& catalog) {
   // The second one counts where an earlier version has written.
   return std::max(SelectNumber(catalog, "SELECT newestStamp FROM Identity"),
@@ -192,6 +212,12 @@ std::time_t NewestStamp(const db::DB& catalog) {
 std::time_t NextStamp(const db::DB& catalog, std::time_t now) {
   const std::time_t stamp = std::max<std::time_t>(now, NewestStamp(catalog) + 1);
   Execute(catalog, "UPDATE Identity SET newestStamp = ?", stamp);
+  long long mark = 0;
+  FillRandom(&mark, sizeof mark);
+  Execute(catalog, "INSERT OR REPLACE INTO Stamps(stamp, mark) VALUES(?, ?)", stamp, mark);
+  // A crafted catalog may have many of them. They are not all removed at once.
+  Execute(catalog, "DELETE FROM Stamps WHERE stamp IN "
+                   "(SELECT stamp FROM Stamps ORDER BY stamp DESC LIMIT 2 OFFSET 1000)");
   return stamp;
 }
 

@@ -24,8 +24,9 @@ std::unique_ptr<db::VolumeDB> OpenCatalog(const std::string& mountPoint);
 /// made, with the same definition. In others, writing a row may do anything.
 bool HasOwnSchema(const db::DB& catalog);
 
-/// Creates the tables, indexes and the identity that are missing.
-void CreateSchema(const db::DB& catalog);
+/// Creates the tables, indexes and the identity that are missing. Waits `busyTimeout` milliseconds
+/// for other programs.
+void CreateSchema(const db::DB& catalog, unsigned busyTimeout = BUSY_TIMEOUT);
 
 /// The two halves of CreateSchema: rows are inserted faster while there are no indexes.
 void CreateTables(const db::DB& catalog);
@@ -40,6 +41,21 @@ std::string Identity(const db::DB& catalog);
 
 /// Gives the catalog another identity: its content is replaced by another.
 void RenewIdentity(const db::DB& catalog);
+
+/// What tells a catalog from copies of it of an earlier time, and from what was made of these.
+struct CatalogState {
+  std::string identity{}; ///< empty: not known
+  std::time_t newestStamp = 0;
+  long long mark = 0; ///< the random number that was given out with this stamp; 0: there is none
+
+  bool operator==(const CatalogState&) const = default;
+};
+
+/// The present state of the catalog.
+CatalogState StateOf(const db::DB& catalog);
+
+/// Whether the catalog was in `state` once. Only the latest thousand stamps are known.
+bool HasBeenIn(const db::DB& catalog, const CatalogState& state);
 
 /// The newest stamp that was given out, seconds since the epoch; 0 in a new catalog.
 std::time_t NewestStamp(const db::DB& catalog);

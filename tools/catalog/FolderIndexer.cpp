@@ -29,10 +29,20 @@ namespace {
 /// How often the caller's pulse is called: once for so many names or rows.
 constexpr std::size_t NAMES_PER_PULSE = 256;
 
+/// Bytes of the longest name on any file system.
+constexpr std::size_t LONGEST_NAME = 1024;
+
 struct CloseDirectory {
   void operator()(DIR* directory) const noexcept { closedir(directory); }
 };
 using Directory = std::unique_ptr<DIR, CloseDirectory>;
+
+/// The entry with this name in a list that is sorted by names; null if there is none.
+const auto* FindName(const auto& entries, std::string_view name) {
+  const auto found = std::ranges::lower_bound(
+      entries, name, {}, [](const auto& entry) { return std::string_view(entry.name); });
+  return found != entries.end() && found->name == name ? &*found : nullptr;
+}
 
 /// True for the product's own folders in the root of a volume, which are not indexed.
 bool IsProductData(const IndexedFolder& folder, std::string_view name) {
@@ -49,6 +59,10 @@ bool IsJoined(std::string_view path, std::string_view folder, std::string_view n
               std::string_view end = {}) {
   return path.size() == folder.size() + name.size() + end.size() && path.starts_with(folder) &&
          path.substr(folder.size()).starts_with(name) && path.ends_with(end);
+}
+
+bool IsPhoto(std::string_view name) {
+  return CategoryOf(ExtensionOf(name)) == PHOTO;
 }
 
 /// A second row for a path begins with a separator, see Renditions.
@@ -194,53 +208,73 @@ void FolderIndexer::Examine(const IndexedFolder& folder, int descriptor, const c
 
 // --- Folders in it -----------------------------------------------------------------------------
 
-std::vector<FolderIndexer::FolderRow>
-FolderIndexer::ReadFolderRows(const IndexedFolder& folder) const {
-  std::vector<FolderRow> rows;
+/// Keeps nothing of a row but its id, unless its folder is on the volume.
+FolderIndexer::FolderRows FolderIndexer::ReadFolderRows(const IndexedFolder& folder,
+                                                        const Listing& listing) const {
+  FolderRows rows;
   db::Statement row(catalog_, "SELECT id, path, name, lastModifiedDate, isBackup, isHidden, "
                               "isSystem, isDeleted FROM Folders WHERE folderId = ?");
   row.BindInt64(1, folder.id);
+  std::size_t count = 0;
   while (row.Fetch()) {
+    Pulse(++count);
     const std::string_view path = row.GetTextView(1);
     const std::string_view name = row.GetTextView(2);
-    if (row.IsText(1) && row.IsText(2) && IsJoined(path, folder.path, name, "/")) {
-      rows.push_back({.name = std::string(name),
-                      .folder = {.id = row.GetInt64(0),
-                                 .path = std::string(path),
-                                 .flags = {.isBackup = row.GetBool(4),
-                                           .isHidden = row.GetBool(5),
-                                           .isSystem = row.GetBool(6)},
-                                 .lastModifiedDate = row.GetTime(3)},
-                      .isDeleted = row.GetBool(7)});
+    if (!row.IsText(1) || !row.IsText(2) || !IsJoined(path, folder.path, name, "/")) {
+      continue;
     }
-    Pulse(rows.size());
+    const long long id = row.GetInt64(0);
+    const bool isDeleted = row.GetBool(7);
+    if (const Entry* const entry = FindName(listing.folders, name); entry != nullptr) {
+      rows.known.push_back({.entry = entry,
+                            .folder = {.id = id,
+                                       .path = std::string(path),
+                                       .flags = {.isBackup = row.GetBool(4),
+                                                 .isHidden = row.GetBool(5),
+                                                 .isSystem = row.GetBool(6)},
+                                       .lastModifiedDate = row.GetTime(3)},
+                            .isDeleted = isDeleted});
+    } else if (!isDeleted && listing.isWhole) {
+      (name.size() > LONGEST_NAME ? rows.crafted : rows.vanished).push_back(id);
+    }
   }
-  std::ranges::sort(rows, {}, &FolderRow::name);
+  std::ranges::sort(rows.known, {}, [](const FolderRow& known) { return known.entry; });
   return rows;
 }
 
 std::vector<IndexedFolder> FolderIndexer::UpdateFolders(const IndexedFolder& folder,
                                                         const Listing& listing) {
-  const std::vector<FolderRow> rows = ReadFolderRows(folder);
+  const FolderRows rows = ReadFolderRows(folder, listing);
+  for (const long long id : rows.vanished) {
+    std::string path;
+    {
+      db::Statement row(catalog_, "SELECT path FROM Folders WHERE id = ?");
+      row.BindInt64(1, id);
+      path = row.Fetch() ? row.GetText(0) : std::string();
+    }
+    if (path.ends_with('/')) {
+      DeleteTree(path);
+    }
+    Pulse(0);
+  }
+  for (const long long id : rows.crafted) {
+    MarkFolderDeleted(id); // what is below it cannot be reached then
+    Pulse(0);
+  }
   std::vector<IndexedFolder> folders;
   folders.reserve(listing.folders.size());
-  auto row = rows.begin();
-  const auto deleteBefore = [&](const Entry* next) {
-    for (; row != rows.end() && (next == nullptr || row->name < next->name); ++row) {
-      if (!row->isDeleted && listing.isWhole) {
-        DeleteTree(row->folder.path);
-      }
-    }
-  };
+  auto row = rows.known.begin();
   for (const Entry& entry : listing.folders) {
-    deleteBefore(&entry);
-    const FolderRow* const known = row != rows.end() && row->name == entry.name ? &*row++ : nullptr;
+    while (row != rows.known.end() && row->entry < &entry) {
+      ++row; // in a damaged catalog, two rows may have one path
+    }
+    const FolderRow* const known =
+        row != rows.known.end() && row->entry == &entry ? &*row : nullptr;
     if (entry.isKnown) {
       folders.push_back(UpdateFolder(folder, entry, known));
     }
     Pulse(folders.size());
   }
-  deleteBefore(nullptr);
   return folders;
 }
 
@@ -301,7 +335,7 @@ FolderIndexer::FileChanges FolderIndexer::CompareFiles(const IndexedFolder& fold
                     "WHERE folderId = ? ORDER BY name");
   row.BindInt64(1, folder.id);
   RenditionAccess renditions(volume_, folder.path);
-  std::vector<std::pair<std::string, long long>> tombstones; ///< of names in this folder
+  std::vector<std::pair<const Entry*, long long>> tombstones;
   std::size_t count = 0;
   while (row.Fetch()) {
     Pulse(++count);
@@ -311,7 +345,10 @@ FolderIndexer::FileChanges FolderIndexer::CompareFiles(const IndexedFolder& fold
       continue;
     }
     if (IsTombstone(path)) {
-      tombstones.emplace_back(name, row.GetInt64(0));
+      const Entry* const file = FindName(listing.files, name);
+      if (file != nullptr && IsJoined(path.substr(1), folder.path, name)) {
+        tombstones.emplace_back(file, row.GetInt64(0));
+      }
       continue;
     }
     if (!IsJoined(path, folder.path, name)) {
@@ -322,7 +359,7 @@ FolderIndexer::FileChanges FolderIndexer::CompareFiles(const IndexedFolder& fold
     FileRow known{.id = row.GetInt64(0), .status = row.GetInt(6), .isDeleted = row.GetBool(5)};
     if (!isThere) {
       if (!known.isDeleted && listing.isWhole) {
-        known.name = name;
+        known.isPhoto = IsPhoto(name);
         changes.vanished.push_back(std::move(known));
       }
       continue;
@@ -338,17 +375,17 @@ FolderIndexer::FileChanges FolderIndexer::CompareFiles(const IndexedFolder& fold
   }
   addBefore(nullptr);
 
-  for (const auto& [name, id] : tombstones) {
+  for (const auto& [file, id] : tombstones) {
     const auto change = std::ranges::lower_bound(
-        changes.written, name, {},
+        changes.written, file->name, {},
         [](const FileChange& c) -> const auto& { return c.entry->name; });
-    if (change != changes.written.end() && change->entry->name == name && change->row) {
+    if (change != changes.written.end() && change->entry == file && change->row) {
       change->row->tombstone = id;
     }
   }
   for (const Entry& file : listing.files) {
     ++summary_.files;
-    if (CategoryOf(ExtensionOf(file.name)) == PHOTO) {
+    if (IsPhoto(file.name)) {
       ++summary_.photos;
     }
   }
@@ -410,13 +447,18 @@ void FolderIndexer::DeleteFile(const FileRow& file) {
           static_cast<int>(INDEXED), Stamp(), file.id);
   Execute(catalog_, "UPDATE Transcodings SET status = ?, lastUpdatedDate = ? WHERE sourceId = ?",
           static_cast<int>(WITHDRAWN), Stamp(), file.id);
-  if (CategoryOf(ExtensionOf(file.name)) == PHOTO) {
+  if (file.isPhoto) {
     Execute(catalog_, "INSERT OR IGNORE INTO Removals(fileId) VALUES(?)", file.id);
   }
   if (file.status == UNRENDERABLE) {
     Execute(catalog_, "DELETE FROM Failures WHERE fileId = ?", file.id);
   }
   ++summary_.deleted;
+}
+
+void FolderIndexer::MarkFolderDeleted(long long id) {
+  Execute(catalog_, "UPDATE Folders SET isDeleted = 1, lastUpdatedDate = ? WHERE id = ?", Stamp(),
+          id);
 }
 
 /// Marks a folder and all that is below it deleted.
@@ -467,7 +509,7 @@ void FolderIndexer::DeleteUnreachableFolders() {
   // Below a folder that is marked deleted here, others may have become unreachable.
   for (bool found = true; found;) {
     found = false;
-    std::vector<std::pair<long long, std::string>> rows;
+    std::vector<long long> ids;
     ForEachRow(catalog_,
                "SELECT f.id, f.path FROM Folders f "
                "LEFT JOIN Folders p ON p.id = f.folderId AND p.isDeleted = 0 "
@@ -477,13 +519,12 @@ void FolderIndexer::DeleteUnreachableFolders() {
                [&](const db::Statement& row) {
                  Pulse(0);
                  if (!IsLeftAlone(row.GetText(1))) {
-                   rows.emplace_back(row.GetInt64(0), row.GetText(1));
+                   ids.push_back(row.GetInt64(0));
                  }
                });
-    for (const auto& [id, path] : rows) {
+    for (const long long id : ids) {
       Pulse(0);
-      Execute(catalog_, "UPDATE Folders SET isDeleted = 1, lastUpdatedDate = ? WHERE id = ?",
-              Stamp(), id);
+      MarkFolderDeleted(id);
       found = true;
     }
   }
@@ -500,8 +541,9 @@ void FolderIndexer::DeleteUnreachableFiles() {
              [&](const db::Statement& row) {
                Pulse(0);
                if (!IsLeftAlone(row.GetText(1))) {
-                 files.push_back(
-                     {.id = row.GetInt64(0), .name = row.GetText(2), .status = row.GetInt(3)});
+                 files.push_back({.id = row.GetInt64(0),
+                                  .status = row.GetInt(3),
+                                  .isPhoto = IsPhoto(row.GetTextView(2))});
                }
              });
   for (const FileRow& file : files) {

@@ -4,6 +4,7 @@
 #include "RenditionAccess.h"
 
 #include <ctime>
+#include <deque>
 #include <functional>
 #include <optional>
 #include <string>
@@ -53,7 +54,8 @@ struct IndexedFolder {
 };
 
 /// Brings the rows of single folders up to date with the volume. Lists a folder and reads its rows;
-/// memory grows with the largest folder only. An object belongs to one transaction of its caller,
+/// memory grows with the largest folder on the
+/// volume only, whatever the catalog holds. An object belongs to one transaction of its caller,
 /// on the catalog's thread. Links are not followed; file systems mounted below the volume are.
 /// Failures of the database are thrown as std::string, others as util::Exception.
 class FolderIndexer {
@@ -115,20 +117,26 @@ private:
   };
   /// What the catalog says about one of them.
   struct FolderRow {
-    std::string name;
+    const Entry* entry = nullptr;
     IndexedFolder folder;
     bool isDeleted = false;
   };
+  /// The folders of the catalog that are in a folder.
+  struct FolderRows {
+    std::vector<FolderRow> known;    ///< by name
+    std::vector<long long> vanished; ///< ids
+    std::vector<long long> crafted;  ///< ids; their names are too long for any file system
+  };
   struct FileRow {
     long long id = 0;
-    std::string name{}; ///< only for a file that is not in the folder any more
     int status = 0;
+    bool isPhoto = false;
     bool isDeleted = false;
     long long tombstone = 0; ///< the id of a second row for the path; 0 if there is none
   };
   struct Listing {
     std::vector<Entry> folders; ///< by name
-    std::vector<Entry> files;   ///< by name
+    std::deque<Entry> files;    ///< by name
     bool isWhole = true;
   };
   /// A file whose row must be written.
@@ -138,7 +146,7 @@ private:
   };
   /// The differences between a folder and its rows.
   struct FileChanges {
-    std::vector<FileChange> written;
+    std::deque<FileChange> written;
     std::vector<FileRow> vanished;
   };
 
@@ -146,7 +154,7 @@ private:
   void Pulse(std::size_t count) const;
   Listing List(const IndexedFolder& folder, int descriptor);
   void Examine(const IndexedFolder& folder, int descriptor, const char* name, Listing& listing);
-  std::vector<FolderRow> ReadFolderRows(const IndexedFolder& folder) const;
+  FolderRows ReadFolderRows(const IndexedFolder& folder, const Listing& listing) const;
   std::vector<IndexedFolder> UpdateFolders(const IndexedFolder& folder, const Listing& listing);
   IndexedFolder UpdateFolder(const IndexedFolder& parent, const Entry& entry,
                              const FolderRow* known);
@@ -154,6 +162,7 @@ private:
   bool IsUpToDate(const db::Statement& row, const IndexedFolder& folder, const Entry& entry) const;
   void UpdateFile(const IndexedFolder& folder, const FileChange& change);
   void DeleteFile(const FileRow& file);
+  void MarkFolderDeleted(long long id);
   void DeleteTree(const std::string& path);
   void DeleteUnreachableFolders();
   void DeleteUnreachableFiles();

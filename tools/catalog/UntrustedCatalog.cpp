@@ -126,12 +126,14 @@ void RefuseImplausibleContent(const db::DB& catalog, std::time_t latest) {
   }
 }
 
-std::unique_ptr<db::VolumeDB> Open(const VolumeRoot& volume, std::time_t latest) {
+std::unique_ptr<db::VolumeDB> Open(const VolumeRoot& volume, std::time_t latest,
+                                   unsigned busyTimeout) {
   auto catalog = ConnectToCatalog(volume);
+  SelectNumber(*catalog, util::FormatString("PRAGMA busy_timeout = %u", busyTimeout).c_str());
   Require(HasOwnSchema(*catalog), "it has tables, indexes, triggers or views of others");
   Execute(*catalog, "PRAGMA cache_size = -16384");
   SelectNumber(*catalog, "PRAGMA journal_mode = WAL");
-  CreateSchema(*catalog);
+  CreateSchema(*catalog, busyTimeout);
   RefuseImplausibleContent(*catalog, latest);
   return catalog;
 }
@@ -199,11 +201,12 @@ std::unique_ptr<db::VolumeDB> ConnectToCatalog(const VolumeRoot& volume) {
   return std::make_unique<LimitedCatalog>(volume.Path());
 }
 
-std::unique_ptr<db::VolumeDB> OpenUntrustedCatalog(const VolumeRoot& volume, std::time_t latest) {
+std::unique_ptr<db::VolumeDB> OpenUntrustedCatalog(const VolumeRoot& volume, std::time_t latest,
+                                                   unsigned busyTimeout) {
   RefuseReadOnlyVolume(volume);
   RefuseSpecialFiles(OpenHome(volume).Get());
   try {
-    return Open(volume, latest);
+    return Open(volume, latest, busyTimeout);
   } catch (const std::string& failure) {
     throw CatalogError(ProblemOf(failure), failure);
   }

@@ -47,8 +47,10 @@ std::unique_ptr<db::VolumeDB> ConnectToCatalog(const VolumeRoot& volume);
 
 /// Opens the catalog of a volume that anybody may have prepared, for writing. Creates its folder,
 /// the catalog and its schema if they are missing. `latest` is the time of the latest stamp that a
-/// catalog may have, usually the present. Throws CatalogError.
-std::unique_ptr<db::VolumeDB> OpenUntrustedCatalog(const VolumeRoot& volume, std::time_t latest);
+/// catalog may have, usually the present. Waits `busyTimeout` milliseconds for other programs.
+/// Throws CatalogError.
+std::unique_ptr<db::VolumeDB> OpenUntrustedCatalog(const VolumeRoot& volume, std::time_t latest,
+                                                   unsigned busyTimeout);
 
 /// Renames the catalog and its logs, which nobody uses any more. Of the catalogs that were renamed
 /// before, the latest two are kept. Returns the new name. Throws CatalogError.

@@ -36,10 +36,11 @@ void RememberedCatalogs::Store(const std::string& master, const std::string& mou
 }
 
 /// The stamps stay: they say how late it may be.
-void RememberedCatalogs::ForgetNewer(const std::string& mountPoint, const Catalog& catalog) {
+void RememberedCatalogs::ForgetOtherStates(const std::string& mountPoint, const db::DB& catalog) {
+  const std::string identity = catalog::Identity(catalog);
   for (auto& [key, stored] : catalogs_) {
-    if (key.second == mountPoint && stored.identity == catalog.identity &&
-        stored.newestStamp > catalog.newestStamp) {
+    if (key.second == mountPoint && stored.identity == identity &&
+        !catalog::HasBeenIn(catalog, stored)) {
       stored.identity.clear();
       unsaved_.insert(key);
     }
@@ -76,9 +77,9 @@ void RememberedCatalogs::Save() {
     for (auto key = unsaved_.begin(); key != unsaved_.end(); key = unsaved_.erase(key)) {
       const Catalog& catalog = catalogs_.at(*key);
       Execute(database_,
-              "INSERT OR REPLACE INTO Catalogs(master, mountPoint, identity, newestStamp) "
-              "VALUES(?, ?, ?, ?)",
-              key->first, key->second, catalog.identity, catalog.newestStamp);
+              "INSERT OR REPLACE INTO Catalogs(master, mountPoint, identity, newestStamp, "
+              "mark) VALUES(?, ?, ?, ?, ?)",
+              key->first, key->second, catalog.identity, catalog.newestStamp, catalog.mark);
     }
     if (isStampUnsaved_) {
       Execute(database_, "INSERT OR REPLACE INTO Clock(id, newestStamp) VALUES(0, ?)",
@@ -121,16 +122,19 @@ void RememberedCatalogs::Read(const std::string& path) {
   database_.Open(path);
   Execute(database_,
           "CREATE TABLE IF NOT EXISTS Catalogs(master TEXT NOT NULL, mountPoint TEXT NOT NULL, "
-          "identity TEXT NOT NULL, newestStamp INTEGER NOT NULL, PRIMARY KEY(master, mountPoint))");
+          "identity TEXT NOT NULL, newestStamp INTEGER NOT NULL, mark INTEGER NOT NULL, "
+          "PRIMARY KEY(master, mountPoint))");
   Execute(database_, "CREATE TABLE IF NOT EXISTS Clock(id INTEGER PRIMARY KEY, "
                      "newestStamp INTEGER NOT NULL)");
   newestStamp_ = std::max<std::time_t>(
       newestStamp_, catalog::SelectNumber(database_, "SELECT newestStamp FROM Clock"));
   std::map<Key, Catalog> stored;
-  catalog::ForEachRow(database_, "SELECT master, mountPoint, identity, newestStamp FROM Catalogs",
+  catalog::ForEachRow(database_,
+                      "SELECT master, mountPoint, identity, newestStamp, mark FROM Catalogs",
                       [&stored](const db::Statement& row) {
                         stored[{row.GetText(0), row.GetText(1)}] = {.identity = row.GetText(2),
-                                                                    .newestStamp = row.GetTime(3)};
+                                                                    .newestStamp = row.GetTime(3),
+                                                                    .mark = row.GetInt64(4)};
                       });
   catalogs_.merge(stored);
 }

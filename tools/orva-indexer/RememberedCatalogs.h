@@ -1,5 +1,7 @@
 #pragma once
 
+#include "CatalogSchema.h"
+
 #include "orvadb/DB.h"
 
 #include <ctime>
@@ -16,12 +18,7 @@ namespace orva::indexer {
 /// that cannot be used, which is logged once, they are kept in memory. On the program's thread.
 class RememberedCatalogs {
 public:
-  struct Catalog {
-    std::string identity;
-    std::time_t newestStamp = 0;
-
-    bool operator==(const Catalog&) const = default;
-  };
+  using Catalog = catalog::CatalogState;
 
   /// Reads the database in `directory`; makes it again if it is damaged.
   explicit RememberedCatalogs(std::string directory);
@@ -33,8 +30,8 @@ public:
   void Store(const std::string& master, const std::string& mountPoint, const Catalog& catalog);
 
   /// `catalog` was found at `mountPoint`. Forgets for all masters what was announced there of the
-  /// same catalog when it was newer: it was replaced by a copy of an earlier time.
-  void ForgetNewer(const std::string& mountPoint, const Catalog& catalog);
+  /// same catalog in states that it was not in: it was replaced by a copy of an earlier time.
+  void ForgetOtherStates(const std::string& mountPoint, const db::DB& catalog);
 
   /// A catalog of ours has this stamp, also if nobody merges it.
   void StoreStamp(std::time_t stamp);

@@ -276,9 +276,8 @@ void Service::WorkOnNext() {
   lastWorked_ = next->first;
   Known& known = *next->second;
   working_ = &known;
-  const auto found = [this](const std::string& identity, std::time_t newestStamp) {
-    remembered_.ForgetNewer(working_->volume.MountPoint(),
-                            {.identity = identity, .newestStamp = newestStamp});
+  const auto found = [this](const db::DB& catalog) {
+    remembered_.ForgetOtherStates(working_->volume.MountPoint(), catalog);
   };
   const Volume::Result result = known.volume.Work([this] { Pulse(); }, found, LatestStamp(known));
   working_ = nullptr;
@@ -291,7 +290,7 @@ void Service::WorkOnNext() {
 
 std::time_t Service::LatestStamp(const Known& known) const {
   // Without a battery the clock may be years late after a start, and it may be set back later.
-  return std::max({std::time(nullptr), remembered_.NewestStamp(), known.volume.NewestStamp()});
+  return std::max({std::time(nullptr), remembered_.NewestStamp(), known.volume.State().newestStamp});
 }
 
 // --- Announcements -----------------------------------------------------------------------------
@@ -385,7 +384,7 @@ void Service::Announced(const Announcer::Announcement& announcement,
     if (*clients > 0 && master && !IsPurgeOwed(known, *master)) {
       Remember(known, *master);
     }
-    remembered_.StoreStamp(known.volume.NewestStamp());
+    remembered_.StoreStamp(known.volume.State().newestStamp);
   }
 }
 
@@ -423,9 +422,7 @@ bool Service::IsPurgeOwed(const Known& known, const std::string& master) const {
 }
 
 void Service::Remember(const Known& known, const std::string& master) {
-  remembered_.Store(
-      master, known.volume.MountPoint(),
-      {.identity = known.volume.Identity(), .newestStamp = known.volume.NewestStamp()});
+  remembered_.Store(master, known.volume.MountPoint(), known.volume.State());
 }
 
 /// The identity of the catalog on the master volume; nothing while that is not known.

@@ -1,6 +1,5 @@
 #include "Volume.h"
 
-#include "CatalogSchema.h"
 #include "Sql.h"
 
 #include "orvadb/Transaction.h"
@@ -51,10 +50,22 @@ constexpr auto MOST_WORK = 2s;
 /// work waits for the clock. If they are farther ahead, the clock was set back.
 constexpr std::time_t LONGEST_WAIT = 10; // seconds
 
+/// Between two pieces of work, so that the volume can be unmounted.
+constexpr auto REST = 200ms;
+
 /// A file that was created but neither written nor closed may be a link, for which there is no
 /// other event. One that was written and not closed may have been truncated by its name.
 constexpr auto LONGEST_EMPTY = 8s;
 constexpr auto LONGEST_OPEN = 600s;
+
+/// How long a locked catalog is waited for, in milliseconds: all volumes wait then. The next
+/// attempts come after pauses, each twice as long as the one before.
+constexpr unsigned BUSY_TIMEOUT = 100;
+constexpr Clock::duration SHORTEST_BUSY_PAUSE = 250ms;
+constexpr Clock::duration LONGEST_BUSY_PAUSE = 8s;
+
+/// After this time, a locked catalog is logged.
+constexpr auto LONGEST_LOCK = 5s;
 
 constexpr auto RETRY = 60s;
 constexpr auto SHORT_RETRY = 1s;
@@ -284,7 +295,11 @@ Volume::Result Volume::Work(const std::function<void()>& pulse, const Found& fou
     return {.isGone = true};
   }
   try {
-    return WorkOn(*root, pulse, found, latest);
+    const Result result = WorkOn(*root, pulse, found, latest);
+    if (!ready_.empty()) {
+      notBefore_ = std::max(notBefore_, Clock::now() + REST);
+    }
+    return result;
   } catch (const Interrupted&) {
     StartAgain();
     return {};
@@ -294,7 +309,7 @@ Volume::Result Volume::Work(const std::function<void()>& pulse, const Found& fou
       if (isUncommitted_) {
         StartAgain();
       }
-      notBefore_ = Clock::now() + SHORT_RETRY;
+      WaitForLock();
       return {};
     case CatalogProblem::ReadOnly:
       Fail(Trouble::ReadOnly, "read-only; its catalog is not updated until this changes");
@@ -337,7 +352,7 @@ Volume::Result Volume::WorkOn(const VolumeRoot& root, const std::function<void()
     const auto database = OpenCatalog(root, latest);
     CheckIdentity(*database, found);
     TakeDue();
-    db::Transaction transaction(*database, catalog::BUSY_TIMEOUT);
+    db::Transaction transaction(*database, BUSY_TIMEOUT);
     isStampWanted_ = false;
     FolderIndexer indexer(
         *database, root, catalog::NewPhotos::Waiting, std::time(nullptr),
@@ -355,10 +370,13 @@ Volume::Result Volume::WorkOn(const VolumeRoot& root, const std::function<void()
     walkTime_ += Clock::now() - begin;
     const bool isEnd = isWalkingAll_ && ready_.empty();
     const long long files = isEnd ? indexer.DeleteUnreachableRows(walkedFolders_, walkedFiles_) : 0;
-    const std::time_t newestStamp = catalog::NewestStamp(*database);
+    catalog::CatalogState state = catalog::StateOf(*database);
     transaction.Commit();
     isUncommitted_ = false;
-    newestStamp_ = newestStamp;
+    busyPause_ = {};
+    lockedSince_.reset();
+    isLockLogged_ = false;
+    state_ = std::move(state);
     result.hasChanged = indexer.HasChanged();
     if (result.hasChanged) {
       WaitForClock(begin);
@@ -392,14 +410,14 @@ Volume::Result Volume::WorkOn(const VolumeRoot& root, const std::function<void()
 /// After a commit that took a stamp, of a piece of work that began at `begin`.
 void Volume::WaitForClock(Clock::time_point begin) {
   notBefore_ = begin + MOST_WORK;
-  const std::time_t ahead = newestStamp_ - std::time(nullptr);
+  const std::time_t ahead = state_.newestStamp - std::time(nullptr);
   if (ahead > 0 && ahead <= LONGEST_WAIT) {
     notBefore_ = std::max(notBefore_, Clock::now() + std::chrono::seconds(ahead));
   }
 }
 
 std::unique_ptr<db::VolumeDB> Volume::OpenCatalog(const VolumeRoot& root, std::time_t latest) {
-  auto database = catalog::OpenUntrustedCatalog(root, latest);
+  auto database = catalog::OpenUntrustedCatalog(root, latest, BUSY_TIMEOUT);
   if (!root.IsInPlace()) {
     throw catalog::CatalogError(CatalogProblem::Other, "the volume was replaced");
   }
@@ -419,18 +437,15 @@ void Volume::SetAside(const VolumeRoot& root, const std::string& reason) {
   StartAgain();
 }
 
-/// A catalog with another identity describes another content, and so does an older one, which is a
-/// copy of an earlier time.
+/// A catalog with another identity describes another content, and so does a copy of an earlier
+/// time, also after the transcoder has written to it.
 void Volume::CheckIdentity(const db::DB& catalog, const Found& found) {
-  const std::string identity = catalog::Identity(catalog);
-  const std::time_t newestStamp = catalog::NewestStamp(catalog);
-  if (identity != identity_ || newestStamp < newestStamp_) {
-    found(identity, newestStamp);
+  if (!catalog::HasBeenIn(catalog, state_)) {
+    found(catalog);
     if (isWalked_) {
       StartAgain();
     }
-    identity_ = identity;
-    newestStamp_ = newestStamp;
+    state_ = catalog::StateOf(catalog);
     isWalked_ = false;
   }
 }
@@ -555,6 +570,18 @@ void Volume::Fail(Trouble trouble, const std::string& reason, bool isMedium) {
   watches_.reset();
   isRetry_ = true;
   notBefore_ = Clock::now() + RETRY;
+}
+
+/// Another program has locked the catalog.
+void Volume::WaitForLock() {
+  const auto now = Clock::now();
+  busyPause_ = std::clamp(busyPause_ * 2, SHORTEST_BUSY_PAUSE, LONGEST_BUSY_PAUSE);
+  notBefore_ = now + busyPause_;
+  if (!lockedSince_) {
+    lockedSince_ = now;
+  } else if (now - *lockedSince_ >= LONGEST_LOCK && !std::exchange(isLockLogged_, true)) {
+    LogError(name_ + ": another program has locked its catalog; it is not updated until this ends");
+  }
 }
 
 /// A walk of all folders has ended.

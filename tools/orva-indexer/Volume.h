@@ -2,6 +2,7 @@
 
 #include "FolderWatches.h"
 
+#include "CatalogSchema.h"
 #include "FolderIndexer.h"
 #include "UntrustedCatalog.h"
 #include "VolumeRoot.h"
@@ -46,9 +47,9 @@ public:
   /// Thrown by a pulse to end a piece of work early.
   struct Interrupted {};
 
-  /// Called with the identity and the newest stamp of a catalog that was not there before, or that
-  /// has become older, before anything is written to it.
-  using Found = std::function<void(const std::string& identity, std::time_t newestStamp)>;
+  /// Called with a catalog that was not there before, or that was replaced by a copy of an earlier
+  /// time, before the indexer gives out stamps in it.
+  using Found = std::function<void(const db::DB& catalog)>;
 
   /// For the volume at `mountPoint`, which ends in "/". The first walk is waiting.
   Volume(std::string mountPoint, catalog::VolumeRoot::Kind kind);
@@ -60,12 +61,13 @@ public:
   const std::string& Path() const noexcept { return path_; }
 
   /// The identity of its catalog; empty until it was opened.
-  const std::string& Identity() const noexcept { return identity_; }
+  const std::string& Identity() const noexcept { return state_.identity; }
 
   /// Whether the catalog with this identity was walked wholly.
   bool IsWalked() const noexcept { return isWalked_; }
 
-  std::time_t NewestStamp() const noexcept { return newestStamp_; }
+  /// The state of its catalog after the latest piece of work.
+  const catalog::CatalogState& State() const noexcept { return state_; }
 
   /// Whether the volume at the path is still the one that was walked.
   bool IsInPlace() const;
@@ -146,6 +148,7 @@ private:
                   const catalog::FolderIndexer::FileState& state);
   void Fail(Trouble trouble, const std::string& reason, bool isMedium = false);
   void Recover();
+  void WaitForLock();
 
   const std::string mountPoint_;
   const std::string path_;
@@ -164,15 +167,17 @@ private:
   std::map<std::string, Pending> pending_;
   std::unordered_map<std::string, OpenFile> openFiles_;
   std::unordered_map<std::string, Look> looks_;
-  Clock::time_point notBefore_{}; ///< no work earlier
-  Clock::time_point nextWalk_{};  ///< of all folders, where they are not watched
+  Clock::time_point notBefore_{};                ///< no work earlier
+  Clock::time_point nextWalk_{};                 ///< of all folders, where they are not watched
+  Clock::duration busyPause_{};                  ///< before the next attempt to lock the catalog
+  std::optional<Clock::time_point> lockedSince_; ///< by another program
+  bool isLockLogged_ = false;
   bool isStampWanted_ = false;
   bool hasOtherAccess_ = false; ///< the folder that is walked lets other users pass than before
 
   dev_t device_ = 0; ///< of the root, as it was walked
   ino_t inode_ = 0;
-  std::string identity_;
-  std::time_t newestStamp_ = 0;
+  catalog::CatalogState state_;
   bool isWalked_ = false;    ///< wholly, since the volume appeared or its catalog was replaced
   bool isWalkingAll_ = true; ///< a walk of all folders has not ended
   Clock::time_point walkBegin_{};
