@@ -102,6 +102,24 @@ TEST_F(IndexerTest, NothingIsWrittenWhereNothingIsMounted) {
   EXPECT_THAT(ErrorLines(), IsEmpty());
 }
 
+TEST_F(IndexerTest, TheFolderOfTheVolumesIsNoVolume) {
+  const Volume volume("A", "64m");
+  StartService();
+  StartIndexer();
+  Send("plugged", "/shares");
+  PlugDirectory("/shares/./");
+  PlugDirectory("/");
+  EXPECT_TRUE(Await([&] { return LogLines("not indexed").size() == 3; }));
+  EXPECT_THAT(LogLines("not indexed"),
+              ElementsAre("Volume /shares/: not indexed: the volumes are below it",
+                          "Volume /shares/./: not indexed: the volumes are below it",
+                          "Volume /: not indexed: the volumes are below it"));
+  EXPECT_TRUE(Await([&] { return Count(Events(volume.Path()), "End") == 1; }));
+  EXPECT_EQ(State("/shares"), "absent");
+  EXPECT_FALSE(fs::exists(CatalogOf("/shares")));
+  EXPECT_FALSE(fs::exists("/.orva"));
+}
+
 TEST_F(IndexerTest, AVolumeCanBeUnmountedWhileItIsWatched) {
   const Volume volume("A", "64m");
   Write(volume.Path() + "/Pictures/a.jpg");
@@ -155,6 +173,26 @@ TEST_F(IndexerTest, EverythingIsAnnouncedAgainWhenTheServiceComesBack) {
   EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
 }
 
+TEST_F(IndexerTest, AVolumeThatIsNotPluggedWhenTheServiceComesBackIsGone) {
+  const Volume volume("A", "64m");
+  fs::create_directory("/shares/Plain");
+  StartService();
+  StartIndexer();
+  PlugDirectory("/shares/Plain");
+  ASSERT_TRUE(Await([&] { return State("/shares/Plain") == "watching"; }));
+  ASSERT_TRUE(Await([&] { return State(volume.Path()) == "watching"; }));
+  Service().Signal(SIGTERM);
+  ASSERT_EQ(Service().WaitForEnd(), 0);
+  StartService();
+  EXPECT_TRUE(AwaitLog("/shares/Plain/: gone"));
+  EXPECT_TRUE(Await([&] { return State("/shares/Plain") == "absent"; }));
+  EXPECT_EQ(State(volume.Path()), "watching");
+  std::ifstream file("/tmp/orva-notify.out");
+  const std::string output(std::istreambuf_iterator<char>(file), {});
+  EXPECT_THAT(output, Not(HasSubstr("Name=\"Scanned\" MountPoint=\"/shares/Plain\"")));
+  fs::remove_all("/shares/Plain");
+}
+
 TEST_F(IndexerTest, StartsBeforeTheService) {
   const Volume volume("A", "64m");
   Write(volume.Path() + "/a.jpg");
@@ -178,6 +216,29 @@ TEST_F(IndexerTest, AChangeIsAnnouncedOnce) {
   EXPECT_THAT(Query(volume.Path(), "SELECT path FROM Files ORDER BY path"),
               ElementsAre("Pictures/a.jpg", "Pictures/b.jpg"));
   EXPECT_EQ(Count(Events(volume.Path()), "Scanned"), 1);
+}
+
+TEST_F(IndexerTest, PhotosThatArriveOneByOneTakeFewStamps) {
+  const Volume volume("A", "64m");
+  fs::create_directory(volume.Path() + "/Pictures");
+  StartService();
+  StartIndexer();
+  ASSERT_TRUE(Await([&] { return Count(Events(volume.Path()), "End") == 1; }));
+  constexpr char NEWEST[] = "SELECT newestStamp FROM Identity";
+  const std::time_t begin = std::time(nullptr);
+  int photos = 0;
+  ASSERT_TRUE(Await([&] { // checks about 20 times a second
+    Write(volume.Path() + "/Pictures/" + std::to_string(photos) + ".jpg");
+    return ++photos == 250;
+  }));
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  // One stamp, and one announcement, in two seconds.
+  const Lines newest = Query(volume.Path(), NEWEST);
+  const std::time_t now = std::time(nullptr);
+  ASSERT_EQ(newest.size(), 1U);
+  EXPECT_LE(std::stoll(newest.front()), now + 1);
+  EXPECT_LE(Count(Events(volume.Path()), "End"), (now - begin) / 2 + 3);
+  EXPECT_THAT(Events(volume.Path()), Not(Contains("TranscodedBatch")));
 }
 
 TEST_F(IndexerTest, AFileWaitsWhileItIsWrittenAndOthersDoNot) {
@@ -561,6 +622,26 @@ TEST_F(IndexerTest, FilesAreEnteredAfterTheClockWasSetBack) {
   EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
   Write(volume.Path() + "/Pictures/b.jpg", "other content");
   EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  EXPECT_THAT(ErrorLines(), IsEmpty());
+}
+
+TEST_F(IndexerTest, ACatalogThatNobodyMergesIsKnownAgainWhenTheClockWasSetBack) {
+  const Volume volume("A", "64m");
+  Write(volume.Path() + "/a.jpg");
+  StartService();
+  StartIndexer();
+  ASSERT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  ASSERT_TRUE(Await([&] { return Count(Events(volume.Path()), "End") > 0; }));
+  // What was announced is remembered before the next announcement.
+  const long ends = Count(Events(volume.Path()), "End");
+  Write(volume.Path() + "/b.jpg");
+  ASSERT_TRUE(Await([&] { return Count(Events(volume.Path()), "End") > ends; }));
+  StopIndexer();
+  const Lines identity = Query(volume.Path(), "SELECT identity FROM Identity");
+  Write(volume.Path() + "/c.jpg");
+  StartIndexerIn({"PROBE_CLOCK_OFFSET=-300000000"});
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  EXPECT_EQ(Query(volume.Path(), "SELECT identity FROM Identity"), identity);
   EXPECT_THAT(ErrorLines(), IsEmpty());
 }
 

@@ -14,7 +14,9 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <csignal>
+#include <cstdlib>
 #include <filesystem>
 #include <memory>
 #include <string>
@@ -129,6 +131,39 @@ TEST_F(OrvaNotifyDaemon, IsCompleteAgainAfterItWasKilled) {
     service_->WaitForEnd();
     fs::remove_all("/shares/Plain");
   }
+}
+
+TEST_F(OrvaNotifyDaemon, ADirectoryThatIsNoVolumeAfterARestartLeavesTheMergedDatabase) {
+  setenv("STATE_DIRECTORY", folder_.c_str(), 1);
+  fs::create_directory("/shares/Plain");
+  const Volume a("A", "150g");
+  Catalog onA(a);
+  Catalog onPlain("/shares/Plain");
+  AddPhotos(onA, 10);
+  AddPhotos(onPlain, 10);
+  const auto plain = [] {
+    return std::ranges::count_if(Content(), [](const std::string& line) {
+      return line.find("/shares/Plain") != std::string::npos &&
+             line.find(".jpg") != std::string::npos;
+    });
+  };
+  Serve({"--watch", "--volume", "/shares/Plain"});
+  StartDaemon();
+  Handle(Scanned(a.Path()));
+  Handle(End(a.Path()));
+  Handle(End("/shares/Plain"));
+  EXPECT_EQ(plain(), 10);
+  service_->Signal(SIGTERM);
+  EXPECT_EQ(service_->WaitForEnd(), 0);
+  EXPECT_EQ(daemon_->AwaitEnd(), Exited(0));
+  Serve({"--watch"});
+  StartDaemon();
+  Handle(Scanned(a.Path()));
+  Handle();
+  EXPECT_EQ(plain(), 0);
+  EXPECT_EQ(FilesOf(a).size(), 10U);
+  fs::remove_all("/shares/Plain");
+  unsetenv("STATE_DIRECTORY");
 }
 
 TEST_F(OrvaNotifyDaemon, IsCompleteAgainAfterItWasKilledWhileItIsTold) {

@@ -9,6 +9,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <cstdlib>
 #include <filesystem>
 #include <fstream>
 #include <memory>
@@ -21,6 +22,7 @@ using namespace orva::test;
 using notify::Event;
 using notify::VolumeKind;
 using testing::ElementsAre;
+using testing::HasSubstr;
 namespace fs = std::filesystem;
 
 const std::string PHOTOS = "/shares/Photos";
@@ -190,6 +192,51 @@ TEST_F(OrvaNotifyDirectory, AFileSystemOfTheSharesRootCanBeMountedAndUnmounted) 
   shares.Unmount();
   EXPECT_EQ(Next(), UNPLUGGED);
   EXPECT_EQ(Next(), PLUGGED);
+}
+
+TEST_F(OrvaNotifyDirectory, IsUnpluggedAfterARestartWithoutItsOption) {
+  setenv("STATE_DIRECTORY", folder_.c_str(), 1);
+  fs::create_directory(PHOTOS);
+  fs::create_directory("/shares/Second");
+  ServeClient({"--volume", PHOTOS, "--volume", "/shares/Second"});
+  EXPECT_EQ(Next(), PLUGGED);
+  service_.reset();
+  for (int time = 0; time < 2; ++time) { // until a client has handled it
+    Serve({"--volume", "/shares/Second"});
+    Ask({.message = Scanned("/shares/Second")});
+    service_.reset();
+  }
+  ServeClient({"--volume", "/shares/Second"});
+  EXPECT_THAT(Next(), HasSubstr("Name=\"Plugged\""));
+  // The daemon removes rows only after a volume was scanned.
+  Ask({.message = Scanned("/shares/Second")});
+  EXPECT_EQ(Next(), Scanned("/shares/Second"));
+  EXPECT_EQ(Next(), UNPLUGGED);
+  EXPECT_EQ(Next(), ""); // a client that reads this has handled everything before it
+  ExpectNothing();
+  ExpectNothing();
+  client_.reset();
+  service_.reset();
+  ServeClient({"--volume", "/shares/Second"});
+  EXPECT_THAT(Next(), HasSubstr("Name=\"Plugged\""));
+  Ask({.message = Scanned("/shares/Second")});
+  EXPECT_EQ(Next(), Scanned("/shares/Second"));
+  ExpectNothing();
+  fs::remove("/shares/Second");
+  unsetenv("STATE_DIRECTORY");
+}
+
+TEST_F(OrvaNotifyDirectory, ALineSaysWhyItIsNoVolume) {
+  fs::create_directory("/shares/Real");
+  fs::create_directory_symlink("/shares/Real", PHOTOS);
+  Serve({"--volume", PHOTOS, "--volume", "/shares/Missing"});
+  EXPECT_EQ(service_->ReadLine(), PHOTOS + " is not a directory: it is no volume");
+  EXPECT_EQ(service_->ReadLine(), "/shares/Missing does not exist: waiting for it");
+  fs::create_directory("/shares/Missing");
+  EXPECT_EQ(service_->ReadLineWith("seen"), "plugged seen: /shares/Missing");
+  fs::remove("/shares/Missing");
+  fs::remove(PHOTOS);
+  fs::remove("/shares/Real");
 }
 
 TEST_F(OrvaNotifyDirectory, APluggedByHandDoesNotMakeItAMount) {

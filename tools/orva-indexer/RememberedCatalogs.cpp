@@ -50,8 +50,18 @@ void RememberedCatalogs::ForgetOtherStates(const std::string& mountPoint, const 
   }
 }
 
+void RememberedCatalogs::StoreStamp(std::time_t stamp) {
+  if (stamp > NewestStamp()) {
+    newestStamp_ = stamp;
+    isStampUnsaved_ = true;
+  }
+  if (isStampUnsaved_) {
+    Save();
+  }
+}
+
 std::time_t RememberedCatalogs::NewestStamp() const {
-  std::time_t newest = 0;
+  std::time_t newest = newestStamp_;
   for (const auto& [key, catalog] : catalogs_) {
     newest = std::max(newest, catalog.newestStamp);
   }
@@ -70,6 +80,11 @@ void RememberedCatalogs::Save() {
               "INSERT OR REPLACE INTO Catalogs(master, mountPoint, identity, newestStamp, "
               "mark) VALUES(?, ?, ?, ?, ?)",
               key->first, key->second, catalog.identity, catalog.newestStamp, catalog.mark);
+    }
+    if (isStampUnsaved_) {
+      Execute(database_, "INSERT OR REPLACE INTO Clock(id, newestStamp) VALUES(0, ?)",
+              newestStamp_);
+      isStampUnsaved_ = false;
     }
     hasFailed_ = false;
   } catch (const std::string& failure) {
@@ -109,6 +124,10 @@ void RememberedCatalogs::Read(const std::string& path) {
           "CREATE TABLE IF NOT EXISTS Catalogs(master TEXT NOT NULL, mountPoint TEXT NOT NULL, "
           "identity TEXT NOT NULL, newestStamp INTEGER NOT NULL, mark INTEGER NOT NULL, "
           "PRIMARY KEY(master, mountPoint))");
+  Execute(database_, "CREATE TABLE IF NOT EXISTS Clock(id INTEGER PRIMARY KEY, "
+                     "newestStamp INTEGER NOT NULL)");
+  newestStamp_ = std::max<std::time_t>(
+      newestStamp_, catalog::SelectNumber(database_, "SELECT newestStamp FROM Clock"));
   std::map<Key, Catalog> stored;
   catalog::ForEachRow(database_,
                       "SELECT master, mountPoint, identity, newestStamp, mark FROM Catalogs",

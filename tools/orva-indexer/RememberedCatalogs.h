@@ -33,6 +33,9 @@ public:
   /// same catalog in states that it was not in: it was replaced by a copy of an earlier time.
   void ForgetOtherStates(const std::string& mountPoint, const db::DB& catalog);
 
+  /// A catalog of ours has this stamp, also if nobody merges it.
+  void StoreStamp(std::time_t stamp);
+
   /// The newest stamp of all; 0 if there is none. The clock was there once.
   std::time_t NewestStamp() const;
 
@@ -46,6 +49,8 @@ private:
   const std::string directory_;
   db::DB database_; ///< closed while it cannot be used
   std::map<Key, Catalog> catalogs_;
+  std::time_t newestStamp_ = 0; ///< of StoreStamp
+  bool isStampUnsaved_ = false;
   std::set<Key> unsaved_;
   bool hasFailed_ = false;
 };

@@ -28,6 +28,7 @@ namespace {
 using namespace std::chrono_literals;
 using catalog::VolumeRoot;
 using notify::Event;
+using service::LogError;
 using service::LogInfo;
 using service::Printable;
 using Notice = notifications::Notification::Event;
@@ -36,11 +37,20 @@ constexpr auto INPUT_INTERVAL = 100ms;
 constexpr auto ANNOUNCE_RETRY = 30s;
 constexpr auto MASTER_QUIET = 2s;
 
+/// The notification service sends the plugged volumes as soon as a client has connected.
+constexpr auto REPLAY_TIME = 5s;
+
 /// A master at /shares itself is no volume.
 constexpr char SHARES[] = "/shares";
 constexpr char NO_VOLUME[] = "-";
 
 constexpr char MOUNT_INFO[] = "/proc/self/mountinfo";
+
+/// Whether the mount point is /shares, or above it.
+bool ContainsVolumes(const std::string& mountPoint) {
+  const std::string path = std::filesystem::path(mountPoint).lexically_normal();
+  return (std::string(SHARES) + '/').starts_with(path);
+}
 
 util::FileDescriptor OpenMountInfo() {
   return notify::CheckedDescriptor(open(MOUNT_INFO, O_RDONLY | O_CLOEXEC), MOUNT_INFO);
@@ -92,7 +102,7 @@ void Service::Wait() {
   add(observer_.Descriptor(), POLLIN);
   add(announcer_.Descriptor(), announcer_.Events());
   add(locator_.Descriptor(), POLLIN);
-  auto next = std::min({announceAgain_, checkPurges_, statusDue_});
+  auto next = std::min({announceAgain_, checkPurges_, replayEnd_, statusDue_});
   for (const auto& [mountPoint, known] : volumes_) {
     next = std::min(next, known->volume.NextWork());
     add(known->volume.Descriptor(now), POLLIN);
@@ -158,6 +168,9 @@ void Service::HandleNotifications() {
   if (Clock::now() >= checkPurges_) {
     CheckPurges();
   }
+  if (Clock::now() >= replayEnd_) {
+    ForgetOthers();
+  }
   if (Clock::now() >= announceAgain_) {
     AnnounceAgain();
   }
@@ -166,7 +179,7 @@ void Service::HandleNotifications() {
 void Service::Handle(const notifications::Notification& notification) {
   switch (notification.event) {
   case Notice::Connected:
-    AnnounceAgain();
+    AwaitReplay();
     break;
   case Notice::Plugged:
     Plug(notification.mountPoint, notification.isDirectory);
@@ -193,13 +206,50 @@ void Service::Plug(const std::string& mountPoint, bool isDirectory) {
   const auto found = volumes_.find(mountPoint);
   if (found != volumes_.end()) {
     if (found->second->volume.Kind() == kind && found->second->volume.IsInPlace()) {
+      Confirm(*found->second);
       return;
     }
     Forget(mountPoint);
   }
+  if (ContainsVolumes(mountPoint)) {
+    LogError("Volume " + Printable(mountPoint) + ": not indexed: the volumes are below it");
+    return;
+  }
   LogInfo("Volume " + Printable(mountPoint) + ": walking");
   const auto known = volumes_.emplace(mountPoint, std::make_unique<Known>(mountPoint, kind)).first;
   known->second->volume.HandleMounts(ReadMountPoints());
+}
+
+/// The notification service was started again, or was not there. It sends the volumes that are
+/// plugged next.
+void Service::AwaitReplay() {
+  for (const auto& [mountPoint, known] : volumes_) {
+    known->isPlugged = false;
+    known->isScanned = false;
+    known->echoes = 0;
+    known->purgedFor.clear();
+  }
+  replayEnd_ = volumes_.empty() ? Clock::time_point::max() : Clock::now() + REPLAY_TIME;
+}
+
+/// The volume is plugged for the service that we are connected to.
+void Service::Confirm(Known& known) {
+  if (!std::exchange(known.isPlugged, true) && known.volume.IsWalked()) {
+    AnnounceScanned(known);
+  }
+}
+
+void Service::ForgetOthers() {
+  replayEnd_ = Clock::time_point::max();
+  std::vector<std::string> others;
+  for (const auto& [mountPoint, known] : volumes_) {
+    if (!known->isPlugged) {
+      others.push_back(mountPoint);
+    }
+  }
+  for (const std::string& mountPoint : others) {
+    Forget(mountPoint);
+  }
 }
 
 void Service::Forget(const std::string& mountPoint) {
@@ -229,7 +279,7 @@ void Service::WorkOnNext() {
   const auto found = [this](const db::DB& catalog) {
     remembered_.ForgetOtherStates(working_->volume.MountPoint(), catalog);
   };
-  const Volume::Result result = known.volume.Work([this] { Pulse(); }, found, LatestStamp());
+  const Volume::Result result = known.volume.Work([this] { Pulse(); }, found, LatestStamp(known));
   working_ = nullptr;
   if (result.isGone) {
     Forget(lastWorked_);
@@ -238,16 +288,17 @@ void Service::WorkOnNext() {
   }
 }
 
-std::time_t Service::LatestStamp() const {
-  // Without a battery the clock may be years late after a start.
-  return std::max(std::time(nullptr), remembered_.NewestStamp());
+std::time_t Service::LatestStamp(const Known& known) const {
+  // Without a battery the clock may be years late after a start, and it may be set back later.
+  return std::max(
+      {std::time(nullptr), remembered_.NewestStamp(), known.volume.State().newestStamp});
 }
 
 // --- Announcements -----------------------------------------------------------------------------
 
 void Service::AnnounceResult(Known& known, const Volume::Result& result) {
   known.hasChanged = known.hasChanged || result.hasChanged;
-  if (!known.volume.IsWalked()) {
+  if (!known.volume.IsWalked() || !known.isPlugged) {
     return; // Scanned comes first
   }
   if (result.isFirstWalk) {
@@ -274,13 +325,13 @@ void Service::AnnounceChanges(Known& known) {
   }
 }
 
-/// The notification service was started again, or was not there.
+/// An announcement has failed.
 void Service::AnnounceAgain() {
   announceAgain_ = Clock::time_point::max();
   for (const auto& [mountPoint, known] : volumes_) {
     known->echoes = 0;
     known->purgedFor.clear();
-    if (known->volume.IsWalked()) {
+    if (known->isPlugged && known->volume.IsWalked()) {
       AnnounceScanned(*known);
     }
   }
@@ -334,6 +385,7 @@ void Service::Announced(const Announcer::Announcement& announcement,
     if (*clients > 0 && master && !IsPurgeOwed(known, *master)) {
       Remember(known, *master);
     }
+    remembered_.StoreStamp(known.volume.State().newestStamp);
   }
 }
 

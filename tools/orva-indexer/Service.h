@@ -41,6 +41,7 @@ private:
         : volume(std::move(mountPoint), kind) {}
 
     Volume volume;
+    bool isPlugged = true;   ///< for the notification service that we are connected to
     bool isScanned = false;  ///< it was
     bool hasChanged = false; ///< since the last announcement
     bool isEndDue = false;   ///< after a batch
@@ -54,6 +55,9 @@ private:
   void HandleNotifications();
   void Handle(const notifications::Notification& notification);
   void Plug(const std::string& mountPoint, bool isDirectory);
+  void AwaitReplay();
+  void Confirm(Known& known);
+  void ForgetOthers();
   void Forget(const std::string& mountPoint);
   void AnnounceAgain();
   void WorkOnNext();
@@ -68,7 +72,7 @@ private:
   bool IsPurgeOwed(const Known& known, const std::string& master) const;
   void Remember(const Known& known, const std::string& master);
   std::optional<std::string> Master() const;
-  std::time_t LatestStamp() const;
+  std::time_t LatestStamp(const Known& known) const;
   void PublishStatus();
 
   const Settings settings_;
@@ -86,6 +90,7 @@ private:
   Clock::time_point inputRead_{};
   Clock::time_point announceAgain_ = Clock::time_point::max();
   Clock::time_point checkPurges_ = Clock::time_point::max();
+  Clock::time_point replayEnd_ = Clock::time_point::max(); ///< what is not plugged then is gone
   service::StatusFile status_;
   Clock::time_point statusDue_ = Clock::time_point::max(); ///< when it is too early to write it
 };

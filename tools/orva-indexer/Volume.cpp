@@ -41,11 +41,17 @@ constexpr auto LATEST = 8s;
 /// Events are not read more often, so that a large copy does not wake the program for each write.
 constexpr auto EVENT_INTERVAL = 100ms;
 
-/// How long a piece of work may take before its commit.
+/// How long a piece of work may take before its commit. After a commit that took a stamp, the next
+/// piece begins no earlier than this after the begin of the last one, so that stamps do not outrun
+/// the clock.
 constexpr auto MOST_WORK = 2s;
 
 /// Between two pieces of work, so that the volume can be unmounted.
 constexpr auto REST = 200ms;
+
+/// If the stamps are ahead of the clock all the same, because the transcoder takes some too, the
+/// work waits for the clock. If they are farther ahead, the clock was set back.
+constexpr std::time_t LONGEST_WAIT = 10; // seconds
 
 /// A file that was created but neither written nor closed may be a link, for which there is no
 /// other event. One that was written and not closed may have been truncated by its name.
@@ -372,6 +378,9 @@ Volume::Result Volume::WorkOn(const VolumeRoot& root, const std::function<void()
     isLockLogged_ = false;
     state_ = std::move(state);
     result.hasChanged = indexer.HasChanged();
+    if (result.hasChanged) {
+      WaitForClock(begin);
+    }
     files_ += indexer.Summary().added + indexer.Summary().revived - indexer.Summary().deleted;
     if (const auto& unreadable = indexer.Summary().unreadable; !unreadable.empty()) {
       unreadable_ += static_cast<long long>(unreadable.size());
@@ -396,6 +405,15 @@ Volume::Result Volume::WorkOn(const VolumeRoot& root, const std::function<void()
     throw;
   }
   return result;
+}
+
+/// After a commit that took a stamp, of a piece of work that began at `begin`.
+void Volume::WaitForClock(Clock::time_point begin) {
+  notBefore_ = begin + MOST_WORK;
+  const std::time_t ahead = state_.newestStamp - std::time(nullptr);
+  if (ahead > 0 && ahead <= LONGEST_WAIT) {
+    notBefore_ = std::max(notBefore_, Clock::now() + std::chrono::seconds(ahead));
+  }
 }
 
 std::unique_ptr<db::VolumeDB> Volume::OpenCatalog(const VolumeRoot& root, std::time_t latest) {

@@ -47,9 +47,9 @@ std::size_t EraseClosed(std::vector<std::unique_ptr<Connection>>& connections) {
 } // namespace
 
 Service::Service(const std::string& address, bool watch,
-                 const std::vector<std::string>& directories)
+                 const std::vector<std::string>& directories, const std::string& stateDirectory)
     : address_(address), signals_(CatchStopSignals()), control_(ControlAddress(address)),
-      notification_(address), volumes_(watch, directories),
+      notification_(address), volumes_(watch, directories), announced_(stateDirectory),
       readers_(CheckedDescriptor(epoll_create1(EPOLL_CLOEXEC), "epoll")) {}
 
 // Each turn tries every descriptor. Requests are read first and performed last: a client that
@@ -134,10 +134,15 @@ void Service::AcceptClients() {
     clients_.push_back(std::make_unique<Client>(std::move(connection), ++lastNumber_));
     Client& client = *clients_.back();
     Print(FormatString("client %u connected", client.Number()));
+    bool isScanned = false;
     for (const auto& announcement : memory_.Replay()) {
+      isScanned = isScanned || announcement.event == Event::Scanned;
       const std::string message = Compose(announcement);
       Queue(client, std::make_shared<const std::string>(Frame(message)));
       Print(FormatString("sent to client %u: %s", client.Number(), message.c_str()));
+    }
+    if (isScanned) {
+      SendGone();
     }
   }
 }
@@ -168,6 +173,7 @@ void Service::PerformRequests() {
   if (EraseClosed(requests_) > 0) {
     isFull_ = false;
   }
+  ForgetGone();
 }
 
 void Service::Perform(ControlConnection& request) {
@@ -181,6 +187,8 @@ void Service::Perform(ControlConnection& request) {
     Remember(*announcement);
     if (announcement->event == Event::Unplugged) {
       SendEnds();
+    } else if (announcement->event != Event::Plugged) {
+      SendGone();
     }
   }
   if (received.handled) {
@@ -205,6 +213,35 @@ void Service::Remember(const Announcement& announcement) {
     Print(FormatString("not remembered, %zu volumes or %zu bytes of mount points are the limit: ",
                        VolumeMemory::MAXIMUM_VOLUMES, VolumeMemory::MAXIMUM_BYTES) +
           Printable(announcement.mountPoint));
+  }
+  const bool isPlugged = announcement.event == Event::Plugged;
+  if (isPlugged && announcement.kind == VolumeKind::Directory) {
+    announced_.Add(announcement.mountPoint);
+  } else if (isPlugged || announcement.event == Event::Unplugged) {
+    announced_.Remove(announcement.mountPoint);
+  }
+}
+
+// The daemon removes the rows of an unplugged volume only after another one was scanned.
+void Service::SendGone() {
+  if (announced_.Gone().empty() || goneHandling_ || CountClients() == 0) {
+    return;
+  }
+  for (const std::string& path : announced_.Gone()) {
+    SendToAll(Compose(Event::Unplugged, path));
+  }
+  SendEnds();
+  goneHandling_ = QueueMarks();
+}
+
+void Service::ForgetGone() {
+  if (!goneHandling_ || goneHandling_.use_count() > 1) {
+    return;
+  }
+  if (std::exchange(goneHandling_, nullptr)->handled > 0) {
+    while (!announced_.Gone().empty()) {
+      announced_.Remove(std::string(*announced_.Gone().begin()));
+    }
   }
 }
 

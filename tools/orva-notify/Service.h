@@ -1,5 +1,6 @@
 #pragma once
 
+#include "orva-notify/AnnouncedDirectories.h"
 #include "orva-notify/Client.h"
 #include "orva-notify/Control.h"
 #include "orva-notify/ListeningSocket.h"
@@ -20,9 +21,11 @@ class Service {
 public:
   /// Listens on `address` for clients and on ControlAddress(address) for requests. From now on,
   /// SIGINT and SIGTERM stop the service. With `watch`, mounts and unmounts directly below /shares
-  /// are announced, and, in any case, the changes of `directories`; see VolumeWatch. Throws
-  /// util::Exception and std::filesystem::filesystem_error.
-  Service(const std::string& address, bool watch, const std::vector<std::string>& directories);
+  /// are announced, and, in any case, the changes of `directories`; see VolumeWatch.
+  /// `stateDirectory` is what AnnouncedDirectories keeps; empty for none. Throws util::Exception
+  /// and std::filesystem::filesystem_error.
+  Service(const std::string& address, bool watch, const std::vector<std::string>& directories,
+          const std::string& stateDirectory);
 
   /// Serves until SIGINT or SIGTERM.
   void Run();
@@ -41,6 +44,8 @@ private:
   void Announce(const Announcement& announcement);
   void Remember(const Announcement& announcement);
   void SendEnds();
+  void SendGone();
+  void ForgetGone();
   std::shared_ptr<const Handling> QueueMarks();
   std::size_t SendToAll(const std::string& message);
   std::size_t DropAll();
@@ -55,6 +60,8 @@ private:
   ListeningSocket notification_;
   VolumeWatch volumes_;
   VolumeMemory memory_;
+  AnnouncedDirectories announced_;
+  std::shared_ptr<const Handling> goneHandling_; ///< of SendGone
   util::FileDescriptor readers_; ///< of epoll: the clients that are waited for have read something
   std::vector<std::unique_ptr<Client>> clients_;
   std::vector<std::unique_ptr<ControlConnection>> requests_;

@@ -78,6 +78,7 @@ std::vector<Announcement> VolumeWatch::TakeChanges() {
           {.event = Event::Plugged, .mountPoint = directory.path, .kind = VolumeKind::Directory});
     }
     directory.identity = identity;
+    Report(directory, identity || now.contains(directory.path));
   }
   volumes_ = now;
   std::ranges::copy(plugged, std::back_inserter(unplugged));
@@ -119,6 +120,20 @@ void VolumeWatch::Warn(const char* directory) {
       errno == ENOSPC ? "the limit fs.inotify.max_user_watches is reached" : strerror(errno);
   if (!std::exchange(hasWarned_, true)) {
     std::cout << "cannot watch " << directory << ": " << reason << std::endl;
+  }
+}
+
+/// Prints why a directory is no volume, once for each reason.
+void VolumeWatch::Report(Directory& directory, bool isVolume) {
+  struct stat status {};
+  std::string problem;
+  if (!isVolume && lstat(directory.path.c_str(), &status) != 0) {
+    problem = errno == ENOENT ? " does not exist: waiting for it" : " cannot be accessed";
+  } else if (!isVolume && !S_ISDIR(status.st_mode)) {
+    problem = " is not a directory: it is no volume";
+  }
+  if (problem != std::exchange(directory.problem, problem) && !directory.problem.empty()) {
+    std::cout << directory.path << problem << std::endl;
   }
 }
 

@@ -47,12 +47,14 @@ private:
   struct Directory {
     std::string path;
     std::optional<Identity> identity{}; ///< while it is a volume
+    std::string problem{};              ///< why it is none, as it was printed
   };
 
   Volumes ReadMounts() const;
   void WatchParents();
   void Watch(const char* directory, int& watch);
   void Warn(const char* directory);
+  static void Report(Directory& directory, bool isVolume);
   static std::optional<Identity> Identify(const std::string& path);
 
   const bool mounts_;

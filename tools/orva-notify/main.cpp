@@ -55,7 +55,10 @@ std::string MessageOf(const CommandLine& command) {
 }
 
 void Serve(const CommandLine& command) {
-  Service(ORVA_NOTIFICATION_SOCKET, command.watch, command.directories).Run();
+  const char* const state = std::getenv("STATE_DIRECTORY"); // set by systemd
+  Service(ORVA_NOTIFICATION_SOCKET, command.watch, command.directories,
+          state != nullptr ? state : "")
+      .Run();
 }
 
 void PrintClients(const char* what, std::size_t count) {
