@@ -237,7 +237,8 @@ TEST_F(HostileIndexerTest, LongNamesInACatalogTakeLittleMemory) {
   StartService();
   StartIndexer();
   EXPECT_TRUE(AwaitCatalog(volume.Path()).empty()); // the differences would be long
-  EXPECT_THAT(ErrorLines(), IsEmpty());
+  // No file system has such names, so the catalog is made again.
+  EXPECT_THAT(ErrorLines(), ElementsAre(HasSubstr("string or blob too big")));
   if (!AreProgramsSanitized()) {
     EXPECT_LT(PeakOf(Indexer().Pid()), 96 << 10); // KiB
   }

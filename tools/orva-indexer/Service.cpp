@@ -290,7 +290,8 @@ void Service::WorkOnNext() {
 
 std::time_t Service::LatestStamp(const Known& known) const {
   // Without a battery the clock may be years late after a start, and it may be set back later.
-  return std::max({std::time(nullptr), remembered_.NewestStamp(), known.volume.State().newestStamp});
+  return std::max(
+      {std::time(nullptr), remembered_.NewestStamp(), known.volume.State().newestStamp});
 }
 
 // --- Announcements -----------------------------------------------------------------------------

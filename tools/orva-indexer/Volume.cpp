@@ -46,12 +46,12 @@ constexpr auto EVENT_INTERVAL = 100ms;
 /// the clock.
 constexpr auto MOST_WORK = 2s;
 
+/// Between two pieces of work, so that the volume can be unmounted.
+constexpr auto REST = 200ms;
+
 /// If the stamps are ahead of the clock all the same, because the transcoder takes some too, the
 /// work waits for the clock. If they are farther ahead, the clock was set back.
 constexpr std::time_t LONGEST_WAIT = 10; // seconds
-
-/// Between two pieces of work, so that the volume can be unmounted.
-constexpr auto REST = 200ms;
 
 /// A file that was created but neither written nor closed may be a link, for which there is no
 /// other event. One that was written and not closed may have been truncated by its name.
