@@ -723,8 +723,9 @@ protected:
     return Await([&volume] {
       try {
         Database state(std::string(STATE_DIRECTORY) + "/catalogs.db");
-        return state.Run("SELECT newestStamp FROM Catalogs WHERE master <> '-' AND mountPoint = '" +
-                         volume + "/'") == Query(volume, "SELECT newestStamp FROM Identity");
+        return state.Run(
+                   "SELECT max(newestStamp) FROM Catalogs WHERE master <> '-' AND mountPoint = '" +
+                   volume + "/'") == Query(volume, "SELECT newestStamp FROM Identity");
       } catch (const SQLite::Exception&) {
         return false;
       }

@@ -121,9 +121,9 @@ Pixels::Pixels(const std::string& path) {
 std::array<int, 3> Pixels::At(int x, int y) const {
   const int offset = 3 * (y * std::stoi(header_.at(1)) + x);
   std::array<int, 3> pixel{};
-  for (int band = 0; band < 3; ++band) {
-    pixel.at(static_cast<std::size_t>(band)) =
-        static_cast<unsigned char>(samples_.at(static_cast<std::size_t>(offset + band)));
+  for (std::size_t band = 0; band < pixel.size(); ++band) {
+    pixel.at(band) =
+        static_cast<unsigned char>(samples_.at(static_cast<std::size_t>(offset) + band));
   }
   return pixel;
 }

@@ -58,9 +58,9 @@ bool VolumeMemory::Remember(const Announcement& announcement) {
 std::vector<Announcement> VolumeMemory::Replay() const {
   auto announcements = Select(Event::Plugged, &Volume::plugged);
   // A daemon that starts elects a master when it hears of the first volume.
-  std::ranges::stable_partition(announcements, [](const Announcement& announcement) {
-    return announcement.kind == VolumeKind::Mount;
-  });
+  std::stable_partition(
+      announcements.begin(), announcements.end(),
+      [](const Announcement& announcement) { return announcement.kind == VolumeKind::Mount; });
   std::ranges::copy(Select(Event::Scanned, &Volume::scanned), std::back_inserter(announcements));
   std::ranges::copy(Ends(), std::back_inserter(announcements));
   return announcements;

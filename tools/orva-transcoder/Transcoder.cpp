@@ -262,7 +262,7 @@ BatchLimits Transcoder::LimitsOfNext(const Volume& volume) const {
     staged += running->batch->mountPoint == volume.MountPoint() ? running->batch->photos.size() : 0;
   }
   const std::size_t waiting = volume.Waiting() - std::min(staged, volume.Waiting());
-  const auto batches = static_cast<long long>(processors_ + 1);
+  const auto batches = static_cast<long long>(processors_) + 1;
   const StagingSpace fileSystem = SpaceFor(staging_);
   const long long space = std::min(FreeSpace(), fileSystem.now);
   return {.photos = std::clamp(waiting / processors_, FEWEST_PHOTOS, MOST_PHOTOS),
