@@ -31,6 +31,7 @@ namespace {
 
 namespace fs = std::filesystem;
 using testing::ElementsAre;
+using testing::HasSubstr;
 using testing::IsEmpty;
 using testing::SizeIs;
 
