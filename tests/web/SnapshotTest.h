@@ -14,6 +14,9 @@
 
 namespace orva::test {
 
+/// A volume of the merged databases.
+inline const std::string A = "/shares/A/";
+
 /// Where the tests' merged databases are, and the directory of the snapshot.
 inline const std::string MERGED = "/tmp/merged/zophotos.db";
 inline const std::string CACHE = "/tmp/cache";

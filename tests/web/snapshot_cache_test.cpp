@@ -21,8 +21,6 @@ namespace fs = std::filesystem;
 using ::testing::ElementsAre;
 using ::testing::IsEmpty;
 
-const std::string A = "/shares/A/";
-
 class CachedSnapshot : public SnapshotTest {
 protected:
   void SetUp() override {

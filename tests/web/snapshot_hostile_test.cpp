@@ -20,8 +20,6 @@ using ::testing::IsEmpty;
 using ::testing::SizeIs;
 using State = web::SnapshotStatus::State;
 
-const std::string A = "/shares/A/";
-
 class HostileDatabase : public SnapshotTest {
 protected:
   void SetUp() override {

@@ -19,7 +19,6 @@ using ::testing::IsEmpty;
 using ::testing::SizeIs;
 using State = web::SnapshotStatus::State;
 
-const std::string A = "/shares/A/";
 const std::string B = "/shares/B/";
 
 class ChangingSnapshot : public SnapshotTest {

@@ -44,7 +44,8 @@ const std::map<std::string, std::regex>& UsualLines() {
   static const std::map<std::string, std::regex> LINES = {
       {"orva-notify",
        std::regex("listening on .*|stopped|client \\d+ (connected|gone|is an observer)|"
-                  "sent to .*|(un)?plugged seen: .*|handled by .*")},
+                  "sent to .*|(un)?plugged seen: .*|handled by .*|"
+                  "/shares/[^ ]* does not exist: waiting for it")},
       {"orva-indexer",
        std::regex("Volume [^ ]*: (walking|gone|walked \\d+ folders, \\d+ files in [\\d.]+ s|"
                   "indexed again)")},
