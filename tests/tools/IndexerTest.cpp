@@ -19,6 +19,7 @@
 #include <array>
 #include <chrono>
 #include <csignal>
+#include <cstdlib>
 #include <ctime>
 #include <fstream>
 #include <iterator>
@@ -77,7 +78,12 @@ void IndexerTest::StartIndexer(Program::Arguments prefix) {
 }
 
 void IndexerTest::StartIndexerIn(const Program::Arguments& surroundings) {
-  Program::Arguments prefix = {"env", "LD_PRELOAD=" + ProgramPath("libsurroundings_probe.so")};
+  std::string asan = "ASAN_OPTIONS=verify_asan_link_order=0";
+  if (const char* const options = std::getenv("ASAN_OPTIONS")) {
+    asan += std::string(":") + options;
+  }
+  Program::Arguments prefix = {"env", asan,
+                               "LD_PRELOAD=" + ProgramPath("libsurroundings_probe.so")};
   prefix.insert(prefix.end(), surroundings.begin(), surroundings.end());
   StartIndexer(prefix);
 }

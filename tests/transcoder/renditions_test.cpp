@@ -211,9 +211,9 @@ TEST_F(Renditions, AreComparedWithTheCatalogWhenTheVolumeAppears) {
 TEST_F(Renditions, FoldersOfNoPhotoAreExaminedInPieces) {
   KillTranscoder();
   AddAllWaiting({});
-  constexpr std::size_t FOLDERS = 3;
-  for (std::size_t i = 0; i < FOLDERS; ++i) {
-    WriteBytes(RenditionOf(static_cast<long long>(1000 * i)), "of nothing");
+  constexpr long long FOLDERS = 3;
+  for (long long i = 0; i < FOLDERS; ++i) {
+    WriteBytes(RenditionOf(1000 * i), "of nothing");
   }
   orva::transcoder::Volume volume(Root() + '/', catalog::VolumeRoot::Kind::Mount);
   volume.Look();

@@ -317,7 +317,7 @@ FolderIndexer::FileChanges FolderIndexer::CompareFiles(const IndexedFolder& fold
         (!hooks_.isComplete ||
          hooks_.isComplete(folder, file.name,
                            {.size = file.size, .statusChanged = file.access.changed}))) {
-      changes.written.push_back({.entry = &file, .row = std::move(row)});
+      changes.written.push_back({.entry = &file, .row = row});
       ++summary_.rows;
       return true;
     }
@@ -360,7 +360,7 @@ FolderIndexer::FileChanges FolderIndexer::CompareFiles(const IndexedFolder& fold
     if (!isThere) {
       if (!known.isDeleted && listing.isWhole) {
         known.isPhoto = IsPhoto(name);
-        changes.vanished.push_back(std::move(known));
+        changes.vanished.push_back(known);
       }
       continue;
     }
@@ -368,7 +368,7 @@ FolderIndexer::FileChanges FolderIndexer::CompareFiles(const IndexedFolder& fold
     const bool isChanged = isDeleted || folder.revived || !IsUpToDate(row, folder, *entry) ||
                            (known.status == RENDERED && newPhotos_ == NewPhotos::Waiting &&
                             renditions.IsOutdated(known.id, entry->access));
-    if (!(isChanged && write(*entry, std::move(known))) && !isDeleted) {
+    if (!(isChanged && write(*entry, known)) && !isDeleted) {
       ++summary_.rows; // it stays as it is
     }
     ++entry;

@@ -124,11 +124,14 @@ private:
     if (rest.empty() || rest.front() == "--") {
       return "";
     }
-    const CLI::App& command = Command() == nullptr ? *status_ : *Command();
+    const CLI::App* command = Command();
+    if (command == nullptr) {
+      command = status_;
+    }
     const std::string option = rest.front().substr(0, rest.front().find('='));
-    return option.starts_with('-') && command.get_option_no_throw(option) != nullptr
-               ? "option " + option + " belongs after the command: zophotos " + command.get_name() +
-                     " " + option
+    return option.starts_with('-') && command->get_option_no_throw(option) != nullptr
+               ? "option " + option + " belongs after the command: zophotos " +
+                     command->get_name() + " " + option
                : "";
   }
 
