@@ -64,8 +64,7 @@ TEST_F(HostileDatabase, NamesAreKeptByteForByte) {
   const std::vector<std::string> names{"<img src=x onerror=alert(1)>.jpg",
                                        "\xFF\xFE.jpg",
                                        "a\nb\r\t\x1B[31m.jpg",
-                                       "\xE2\x80\xAE"
-                                       "gpj.exe",
+                                       "\u202Egpj.exe\u202C",
                                        "'\"&;.jpg",
                                        std::string(4096, 'n')};
   for (const std::string& name : names) {
