@@ -202,7 +202,7 @@ TEST_F(ZophotosChanges, AnotherDatabaseGivesAWholeFeed) {
   };
   fs::copy_file(COPY, COPY + ".new");
   fs::rename(COPY + ".new", COPY);
-  expectWhole("a file made anew");
+  expectWhole("a file that was created again");
   const std::string content = Content(COPY);
   Database(COPY).Run("INSERT INTO Files(file_id, folder_id, name, modified_date, volume, "
                      "created_date) VALUES(1000, 1, 'x', 1, 'y', 2)");
