@@ -14,6 +14,8 @@
 #include <optional>
 #include <regex>
 #include <string>
+#include <string_view>
+#include <utility>
 #include <vector>
 
 namespace orva::web {
@@ -107,22 +109,52 @@ const std::vector<View> VIEWS = {
     {"Volumes", [](const auto& name) { return VolumesPage(MakeSite(name)); }},
     {"Error", [](const auto& name) { return ErrorPage(404, name); }}};
 
+/// The length of the tag that html begins with, and the tag with the names of its attributes;
+/// nothing for what is no strict markup. The values are skipped without a regular expression:
+/// std::regex takes stack for each of their characters.
+std::optional<std::pair<std::size_t, std::string>> ReadTag(std::string_view html) {
+  static const std::regex start("<(!doctype html|/?[a-z][a-z0-9]*)");
+  static const std::regex attribute(" [a-zA-Z-]+");
+  static const std::regex end("/?>");
+  std::size_t at = 0;
+  std::cmatch match;
+  const auto reads = [&html, &at, &match](const std::regex& part) {
+    if (!std::regex_search(html.data() + at, html.data() + html.size(), match, part,
+                           std::regex_constants::match_continuous)) {
+      return false;
+    }
+    at += static_cast<std::size_t>(match.length());
+    return true;
+  };
+  if (!reads(start)) {
+    return std::nullopt;
+  }
+  std::string tag = match[1].str();
+  while (reads(attribute)) {
+    tag += match.str();
+    if (html.substr(at).starts_with("=\"")) {
+      at = html.find_first_of("\"<>", at + 2);
+      if (at == std::string_view::npos || html[at] != '"') {
+        return std::nullopt;
+      }
+      ++at;
+    }
+  }
+  return reads(end) ? std::optional(std::pair(at, tag)) : std::nullopt;
+}
+
 /// All tags of a document, with the names of their attributes. Fails for what is no strict markup.
 std::vector<std::string> TagsOf(const std::string& html) {
-  static const std::regex tag(
-      R"(<(!doctype html|/?[a-z][a-z0-9]*)((?: [a-zA-Z-]+(?:="[^"<>]*")?)*)/?>)");
-  static const std::regex value(R"(="[^"<>]*")");
   std::vector<std::string> tags;
   std::size_t at = 0;
   while ((at = html.find_first_of("<>", at)) != std::string::npos) {
-    std::smatch match;
-    const auto begin = html.begin() + static_cast<std::ptrdiff_t>(at);
-    if (!std::regex_search(begin, html.end(), match, tag, std::regex_constants::match_continuous)) {
+    const auto tag = ReadTag(std::string_view(html).substr(at));
+    if (!tag) {
       ADD_FAILURE() << "no markup: " << html.substr(at, 200);
       return tags;
     }
-    tags.push_back(match[1].str() + std::regex_replace(match[2].str(), value, ""));
-    at += static_cast<std::size_t>(match.length());
+    at += tag->first;
+    tags.push_back(tag->second);
   }
   return tags;
 }
