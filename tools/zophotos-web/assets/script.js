@@ -20,7 +20,7 @@
 //   /api/status                 {"state": "no_database", "building", "current" or "failed",
 //                               "done": 0, "total": 0, "reason": text, "version": 1}
 //   /api/events                 "event: change" with the version as its data, first and after each
-//                               change of the photos; "event: activity" when the work of the services
+//                               change of the photos; "event: volumes" when the work of the services
 //                               has changed
 
 const COUNT = 100; // photos of a request
@@ -831,7 +831,7 @@ function follow(grid) {
     } else if (source === null) {
       source = new EventSource("/api/events");
       source.addEventListener("change", () => plan(true));
-      source.addEventListener("activity", () => plan(false));
+      source.addEventListener("volumes", () => plan(false));
       source.addEventListener("error", () => {
         // The browser connects again after a lost connection, but not after a refused one.
         if (source?.readyState === EventSource.CLOSED) {
