@@ -86,6 +86,11 @@ function photoAddress(id, query) {
   return withQuery(`/photos/${id}`, query);
 }
 
+// JSON has only UTF-8: the server's own links also work for other names.
+function volumeAddress(volume) {
+  return `/search?volume=${encodeURIComponent(volume)}`;
+}
+
 function isNewer(a, b) {
   return BigInt(a) > BigInt(b);
 }
@@ -524,7 +529,7 @@ class Viewer {
       link.href = address;
       link.querySelector("bdi").textContent = shown(text);
     };
-    setLink(".volume-link", `/search?volume=${encodeURIComponent(photo.volume)}`, photo.volume);
+    setLink(".volume-link", volumeAddress(photo.volume), photo.volume);
     setLink(".folder-link", `/folders/${photo.folder}`,
       photo.path.slice(0, photo.path.lastIndexOf("/") + 1));
     this.article.querySelector(".original").href = `/photos/${photo.id}/original`;
@@ -750,7 +755,6 @@ function fillVolume(item, volume) {
   const done = Math.min(Math.max(volume.transcoded, 0), total);
   item.dataset.volume = shown(volume.volume);
   item.classList.toggle("gone", volume.gone);
-  item.querySelector(".volume-link").href = `/search?volume=${encodeURIComponent(volume.volume)}`;
   item.querySelector("progress").max = Math.max(total, 1);
   item.querySelector("progress").value = done;
   set(".name bdi", shown(lastComponent(volume.volume)));
@@ -767,13 +771,20 @@ function fillVolume(item, volume) {
 }
 
 function updateVolumes(list, volumes) {
-  const items = new Map([...list.children].map((item) => [item.dataset.volume, item]));
+  // Several may have the same name here, where it is not UTF-8.
+  const items = [...list.children].filter((item) => "volume" in item.dataset);
   const strip = list.closest(".strip");
   let place = list.firstElementChild;
   for (const volume of strip === null ? volumes : volumes.slice(0, MOST_IN_STRIP)) {
     const name = shown(volume.volume);
-    const item = items.get(name) ?? cloneOf("volume");
-    items.delete(name);
+    const at = items.findIndex((other) => other.dataset.volume === name);
+    let item = items[at];
+    if (at >= 0) {
+      items.splice(at, 1);
+    } else {
+      item = cloneOf("volume");
+      item.querySelector(".volume-link").href = volumeAddress(volume.volume);
+    }
     fillVolume(item, volume);
     if (item === place) {
       place = place.nextElementSibling;
@@ -781,10 +792,8 @@ function updateVolumes(list, volumes) {
       list.insertBefore(item, place);
     }
   }
-  for (const [name, item] of items) {
-    if (name !== undefined) {
-      item.remove();
-    }
+  for (const item of items) {
+    item.remove();
   }
   strip?.toggleAttribute("hidden", list.children.length === 0);
 }
