@@ -20,7 +20,7 @@
 //   /api/status                 {"state": "no_database", "building", "current" or "failed",
 //                               "done": 0, "total": 0, "reason": text, "version": 1}
 //   /api/events                 "event: change" with the version as its data, first and after each
-//                               change of the photos; "event: activity" when the work of the services
+//                               change of the photos; "event: volumes" when the work of the services
 //                               has changed
 
 const COUNT = 100; // photos of a request
@@ -84,6 +84,11 @@ function withQuery(address, query) {
 
 function photoAddress(id, query) {
   return withQuery(`/photos/${id}`, query);
+}
+
+// JSON has only UTF-8: the server's own links also work for other names.
+function volumeAddress(volume) {
+  return `/search?volume=${encodeURIComponent(volume)}`;
 }
 
 function isNewer(a, b) {
@@ -197,11 +202,12 @@ class Grid {
   async fetchPhotos(parameters) {
     const answer = await fetchJson(withQuery(`/api/photos?count=${COUNT}${parameters}`, this.query));
     const known = new Map(this.photos.map((photo) => [photo.id, photo]));
-    return {
-      more: answer.more,
-      photos: answer.photos.map((photo) => known.get(photo.id) ??
-        { id: photo.id, month: monthOf(photo), tile: makeTile(photo, this.query) }),
-    };
+    const photos = answer.photos.map((photo) => known.get(photo.id) ??
+      { id: photo.id, month: monthOf(photo), tile: makeTile(photo, this.query) });
+    for (const photo of photos) {
+      photo.tile.classList.remove("gone");
+    }
+    return { photos, more: answer.more };
   }
 
   async addOlder() {
@@ -354,7 +360,9 @@ class Grid {
     const isWhole = !isMore || !isNewer(all.at(-1).id, edge.id);
     for (const photo of seen) {
       const isKnown = isWhole || isNewer(photo.id, all.at(-1).id);
-      photo.tile.classList.toggle("gone", isKnown && !current.has(photo.id));
+      if (isKnown && !current.has(photo.id)) {
+        photo.tile.classList.add("gone");
+      }
     }
     const added = all.filter((photo) => isNewer(photo.id, edge.id) && !before.has(photo.id));
     this.tell(added.length, !isWhole || seen.some((photo) => photo.tile.matches(".gone")));
@@ -455,37 +463,79 @@ class Viewer {
 
   async show(id) {
     this.id = id;
-    const set = (selector, text) => {
-      this.article.querySelector(selector).textContent = text;
-    };
-    let photo;
-    try {
-      photo = await fetchJson(withQuery(`/api/photos/${id}`, this.query));
-    } catch {
-      if (this.id === id) {
-        this.setMissing(true);
-      }
-      return;
-    }
+    const photo = await this.fetchPhoto(id).catch(() => null);
     if (this.id !== id) {
       return;
     }
-    this.setMissing(false);
-    this.image.alt = shown(photo.name);
-    this.image.src = `/photos/${id}/rendition`;
-    set("h1 bdi", shown(photo.name));
-    set("time", photo.local_time);
-    if (photo.modified === null) {
-      this.article.querySelector("time").removeAttribute("datetime");
-    } else {
-      this.article.querySelector("time").dateTime = photo.modified;
+    if (photo === null) {
+      this.setMissing(true);
+      return;
     }
-    set(".volume-link bdi", shown(photo.volume));
-    this.article.querySelector(".volume-link").href =
-      `/search?volume=${encodeURIComponent(photo.volume)}`;
-    set(".folder-link bdi", shown(photo.path.slice(0, photo.path.lastIndexOf("/") + 1)));
-    this.article.querySelector(".folder-link").href = `/folders/${photo.folder}`;
-    this.article.querySelector(".original").href = `/photos/${id}/original`;
+    this.fill(photo);
+    this.setNeighbours(photo);
+  }
+
+  // Follows a change of the list. The photo stays on the screen, even if it has left.
+  async refresh() {
+    const id = this.id;
+    if (id === null) {
+      return;
+    }
+    const photo = await this.fetchPhoto(id);
+    if (this.id === id) {
+      if (this.image.hidden) {
+        this.fill(photo);
+      }
+      this.setNeighbours(photo);
+    }
+  }
+
+  // The photo with its neighbours; only the neighbours if the photo has left.
+  async fetchPhoto(id) {
+    try {
+      return await fetchJson(withQuery(`/api/photos/${id}`, this.query));
+    } catch {
+      const neighbour = async (direction) => {
+        const address = withQuery(`/api/photos?count=1&${direction}=${id}`, this.query);
+        return (await fetchJson(address)).photos[0]?.id ?? null;
+      };
+      return { newer: await neighbour("after"), older: await neighbour("before") };
+    }
+  }
+
+  fill(photo) {
+    const isThere = "id" in photo;
+    const name = isThere ? shown(photo.name) : "No longer there";
+    this.article.querySelector("h1 bdi").textContent = name;
+    document.title = name;
+    for (const selector of ["dl", ".original"]) {
+      this.article.querySelector(selector).hidden = !isThere;
+    }
+    this.setMissing(!isThere);
+    if (!isThere) {
+      return;
+    }
+    this.image.alt = name;
+    this.image.src = `/photos/${photo.id}/rendition`;
+    const time = this.article.querySelector("time");
+    time.textContent = photo.local_time;
+    if (photo.modified === null) {
+      time.removeAttribute("datetime");
+    } else {
+      time.dateTime = photo.modified;
+    }
+    const setLink = (selector, address, text) => {
+      const link = this.article.querySelector(selector);
+      link.href = address;
+      link.querySelector("bdi").textContent = shown(text);
+    };
+    setLink(".volume-link", volumeAddress(photo.volume), photo.volume);
+    setLink(".folder-link", `/folders/${photo.folder}`,
+      photo.path.slice(0, photo.path.lastIndexOf("/") + 1));
+    this.article.querySelector(".original").href = `/photos/${photo.id}/original`;
+  }
+
+  setNeighbours(photo) {
     for (const direction of ["newer", "older"]) {
       const link = this.link(direction);
       const isFocused = document.activeElement === link;
@@ -495,7 +545,6 @@ class Viewer {
         this.article.querySelector(".close").focus();
       }
     }
-    document.title = shown(photo.name);
     this.prefetch();
   }
 
@@ -596,6 +645,7 @@ function openInDialog(grid) {
     document.title = title;
     viewer.image.removeAttribute("src");
     grid.focus(viewer.id);
+    viewer.id = null;
   });
   dialog.addEventListener("cancel", (event) => {
     event.preventDefault();
@@ -606,6 +656,7 @@ function openInDialog(grid) {
     event.preventDefault();
     close();
   });
+  return viewer;
 }
 
 // The page of one photo: the keys lead to its neighbours and back to the list.
@@ -617,6 +668,7 @@ function followKeys(article) {
       location.assign(article.querySelector(".close").href);
     }
   });
+  return viewer;
 }
 
 // A list of folders, whose folders open in place.
@@ -703,7 +755,6 @@ function fillVolume(item, volume) {
   const done = Math.min(Math.max(volume.transcoded, 0), total);
   item.dataset.volume = shown(volume.volume);
   item.classList.toggle("gone", volume.gone);
-  item.querySelector(".volume-link").href = `/search?volume=${encodeURIComponent(volume.volume)}`;
   item.querySelector("progress").max = Math.max(total, 1);
   item.querySelector("progress").value = done;
   set(".name bdi", shown(lastComponent(volume.volume)));
@@ -720,13 +771,20 @@ function fillVolume(item, volume) {
 }
 
 function updateVolumes(list, volumes) {
-  const items = new Map([...list.children].map((item) => [item.dataset.volume, item]));
+  // Several may have the same name here, where it is not UTF-8.
+  const items = [...list.children].filter((item) => "volume" in item.dataset);
   const strip = list.closest(".strip");
   let place = list.firstElementChild;
   for (const volume of strip === null ? volumes : volumes.slice(0, MOST_IN_STRIP)) {
     const name = shown(volume.volume);
-    const item = items.get(name) ?? cloneOf("volume");
-    items.delete(name);
+    const at = items.findIndex((other) => other.dataset.volume === name);
+    let item = items[at];
+    if (at >= 0) {
+      items.splice(at, 1);
+    } else {
+      item = cloneOf("volume");
+      item.querySelector(".volume-link").href = volumeAddress(volume.volume);
+    }
     fillVolume(item, volume);
     if (item === place) {
       place = place.nextElementSibling;
@@ -734,10 +792,8 @@ function updateVolumes(list, volumes) {
       list.insertBefore(item, place);
     }
   }
-  for (const [name, item] of items) {
-    if (name !== undefined) {
-      item.remove();
-    }
+  for (const item of items) {
+    item.remove();
   }
   strip?.toggleAttribute("hidden", list.children.length === 0);
 }
@@ -785,7 +841,7 @@ function updateNotice(status) {
 
 // Follows the changes of the photos and the volumes while the page can be seen. A hidden page needs
 // no connection, of which browsers have only a few.
-function follow(grid) {
+function follow(grid, viewer) {
   const list = document.querySelector(".strip ul, ul.volumes");
   let source = null;
   let arePhotosDue = false;
@@ -809,6 +865,9 @@ function follow(grid) {
       if (withPhotos && grid !== null) {
         await grid.refresh();
       }
+      if (withPhotos) {
+        await viewer?.refresh();
+      }
       await updateEmpty(status, volumes, grid, list);
     } catch {
       // The server is away. It sends an event when it is back.
@@ -831,7 +890,7 @@ function follow(grid) {
     } else if (source === null) {
       source = new EventSource("/api/events");
       source.addEventListener("change", () => plan(true));
-      source.addEventListener("activity", () => plan(false));
+      source.addEventListener("volumes", () => plan(false));
       source.addEventListener("error", () => {
         // The browser connects again after a lost connection, but not after a refused one.
         if (source?.readyState === EventSource.CLOSED) {
@@ -854,13 +913,8 @@ function follow(grid) {
 function start() {
   const photos = document.querySelector(".photos");
   const grid = photos === null ? null : new Grid(photos);
-  if (grid !== null) {
-    openInDialog(grid);
-  }
   const article = document.querySelector("main > article.viewer");
-  if (article !== null) {
-    followKeys(article);
-  }
+  const viewer = grid !== null ? openInDialog(grid) : article !== null ? followKeys(article) : null;
   const tree = document.querySelector(".tree > ul");
   if (tree !== null) {
     new Tree(tree).openOnly();
@@ -877,7 +931,7 @@ function start() {
       event.target.closest("li").classList.add("missing");
     }
   }, true);
-  follow(grid);
+  follow(grid, viewer);
 }
 
 start();
