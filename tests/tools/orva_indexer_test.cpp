@@ -11,6 +11,7 @@
 #include "Renditions.h"
 #include "UntrustedCatalog.h"
 #include "VolumeRoot.h"
+#include "orva-indexer/Locator.h"
 #include "orva-indexer/Volume.h"
 #include "orvadb/Transaction.h"
 #include "orvadb/VolumeDB.h"
@@ -806,6 +807,17 @@ TEST_F(RenditionAccessTest, TheGroupOfAFolderDecidesWhatTheGroupOfAPhotoMayRead)
 }
 
 // --- The merged database -----------------------------------------------------------------------
+
+TEST(Locator, AFileOfAnotherUserNamesNoMaster) {
+  const std::string path = "/tmp/zophotodbmerger.conf";
+  std::ofstream(path) << "zophotos_db_path=/shares/A/.zophotos/zophotos.db\n";
+  EXPECT_EQ(indexer::Locator::Master(), "/shares/A");
+  if (!HasOtherUsers()) {
+    GTEST_SKIP() << NO_OTHER_USERS;
+  }
+  ASSERT_EQ(chown(path.c_str(), 1234, 0), 0);
+  EXPECT_EQ(indexer::Locator::Master(), std::nullopt);
+}
 
 /// The indexer and the daemon, with a master volume that keeps its merged database. It is plugged
 /// before the volumes of the tests, in the order of their names.
