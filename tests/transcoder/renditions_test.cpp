@@ -365,6 +365,23 @@ TEST_F(Renditions, NothingIsWrittenWhereNothingIsMounted) {
   EXPECT_TRUE(fs::exists(Rendition("a.jpg")));
 }
 
+TEST_F(Renditions, TheFolderOfTheVolumesIsNoVolume) {
+  UseRoot("/shares");
+  Copy("a.jpg");
+  AddWaiting("a.jpg");
+  AnnounceDirectory("/shares");
+  EXPECT_TRUE(Await([this] {
+    const Lines logged = Logged();
+    return std::ranges::find(logged, "/shares/: not rendered: the volumes are below it") !=
+           logged.end();
+  }));
+  UseRoot(TheVolume().Path());
+  Copy("b.jpg");
+  AddWaiting("b.jpg");
+  RenderAll();
+  EXPECT_FALSE(fs::exists("/shares/.orva/renditions"));
+}
+
 TEST_F(Renditions, AVolumeThatBecomesFullIsReportedOnceAndTriedAgain) {
   // There is enough space for one rendition, but not for all.
   RunChecked({"vips", "gaussnoise", "/tmp/noise.v", "1500", "1500", "--sigma", "90"});

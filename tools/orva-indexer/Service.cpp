@@ -46,12 +46,6 @@ constexpr char NO_VOLUME[] = "-";
 
 constexpr char MOUNT_INFO[] = "/proc/self/mountinfo";
 
-/// Whether the mount point is /shares, or above it.
-bool ContainsVolumes(const std::string& mountPoint) {
-  const std::string path = std::filesystem::path(mountPoint).lexically_normal();
-  return (std::string(SHARES) + '/').starts_with(path);
-}
-
 util::FileDescriptor OpenMountInfo() {
   return notify::CheckedDescriptor(open(MOUNT_INFO, O_RDONLY | O_CLOEXEC), MOUNT_INFO);
 }
@@ -211,7 +205,7 @@ void Service::Plug(const std::string& mountPoint, bool isDirectory) {
     }
     Forget(mountPoint);
   }
-  if (ContainsVolumes(mountPoint)) {
+  if (notify::ContainsShares(mountPoint)) {
     LogError("Volume " + Printable(mountPoint) + ": not indexed: the volumes are below it");
     return;
   }

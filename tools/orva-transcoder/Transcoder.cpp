@@ -3,6 +3,7 @@
 #include "Renderer.h"
 
 #include "orva-notify/Control.h"
+#include "orva-notify/MountInfo.h"
 #include "orva-notify/Notification.h"
 #include "orvautil/Core.h"
 #include "orvautil/Exception.h"
@@ -83,7 +84,10 @@ void Transcoder::Handle(const Notification& notification) {
     sendAgainAt_.reset();
     return;
   case Event::Plugged:
-    if (!volumes_.contains(mountPoint)) {
+    if (notify::ContainsShares(mountPoint)) {
+      service::LogError(service::Printable(mountPoint) +
+                        ": not rendered: the volumes are below it");
+    } else if (!volumes_.contains(mountPoint)) {
       using Kind = catalog::VolumeRoot::Kind;
       volumes_.emplace(
           mountPoint,
