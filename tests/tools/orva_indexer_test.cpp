@@ -376,6 +376,28 @@ TEST_F(IndexerTest, AMountBelowTheVolumeIsFollowed) {
   EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
 }
 
+TEST_F(IndexerTest, AFolderThatIsMountedAtTwoPlacesIsFollowedAtBoth) {
+  const Volume volume("A", "64m");
+  Write(volume.Path() + "/One/Inside/a.jpg");
+  fs::create_directory(volume.Path() + "/Two");
+  ASSERT_EQ(mount((volume.Path() + "/One").c_str(), (volume.Path() + "/Two").c_str(), nullptr,
+                  MS_BIND, nullptr),
+            0);
+  StartService();
+  StartIndexer();
+  ASSERT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  ASSERT_TRUE(Await([&] { return State(volume.Path()) == "watching"; }));
+  Write(volume.Path() + "/One/b.jpg");
+  Write(volume.Path() + "/One/Inside/c.jpg");
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  Write(volume.Path() + "/Two/New/d.jpg");
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  ASSERT_EQ(umount2((volume.Path() + "/Two").c_str(), 0), 0);
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  Write(volume.Path() + "/One/New/e.jpg");
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+}
+
 /// Random operations on the files and folders of a volume.
 class Operations {
 public:
