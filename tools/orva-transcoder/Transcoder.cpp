@@ -8,6 +8,7 @@
 #include "orvautil/Core.h"
 #include "orvautil/Exception.h"
 #include "service/Log.h"
+#include "service/Turns.h"
 
 #include <nlohmann/json.hpp>
 
@@ -180,17 +181,12 @@ void Transcoder::LookAgain() {
 /// Stages batches, from one volume after the other.
 void Transcoder::StageNext() {
   while (!pausedUntil_ && running_.size() <= processors_) {
-    // The volumes after the last one, then the others.
-    auto next = volumes_.upper_bound(lastStaged_);
-    bool isStaged = false;
-    for (std::size_t i = 0; i < volumes_.size() && !isStaged; ++i) {
-      next = next == volumes_.end() ? volumes_.begin() : next;
-      isStaged = Stage(next->second);
-      ++next;
-    }
-    if (!isStaged) {
+    const auto staged = service::NextInTurn(volumes_, lastStaged_,
+                                            [this](auto& entry) { return Stage(entry.second); });
+    if (staged == volumes_.end()) {
       return;
     }
+    lastStaged_ = staged->first;
   }
 }
 
@@ -205,7 +201,6 @@ bool Transcoder::Stage(Known& known) {
     hasMoreWork_ = hasMoreWork_ || (volume.HasWork() && running_.empty());
     return false;
   }
-  lastStaged_ = volume.MountPoint();
   Start(std::move(batch));
   return true;
 }
