@@ -9,6 +9,7 @@
 
 #include "CatalogSchema.h"
 #include "Renditions.h"
+#include "Sql.h"
 #include "UntrustedCatalog.h"
 #include "VolumeRoot.h"
 #include "orva-indexer/Locator.h"
@@ -724,8 +725,20 @@ protected:
     FinishPhotos(volume_.Path());
   }
 
+  void Fail(const std::string& reason) {
+    const auto database = catalog::OpenCatalog(volume_.Path());
+    db::Transaction transaction(*database, catalog::BUSY_TIMEOUT);
+    catalog::Execute(*database, "UPDATE Files SET status = 1");
+    const auto waiting = catalog::NewestWaiting(*database, 1);
+    ASSERT_EQ(waiting.size(), 1U);
+    EXPECT_TRUE(catalog::MarkFailed(*database, waiting.front(), reason,
+                                    catalog::NextStamp(*database, std::time(nullptr))));
+    transaction.Commit();
+  }
+
   std::string Status() const {
-    const Lines status = Query(volume_.Path(), "SELECT status FROM Files WHERE name = 'a.jpg'");
+    const Lines status =
+        Query(volume_.Path(), "SELECT status FROM Files WHERE name = 'a.jpg' AND isDeleted = 0");
     return status.size() == 1 ? status.front() : "unknown";
   }
   bool AwaitWaiting() {
@@ -799,6 +812,18 @@ TEST_F(RenditionAccessTest, WhatIsNotARenditionDoesNotMatter) {
   EXPECT_EQ(LaterStatus(), "3");
   fs::remove_all(TheVolume().Path() + "/.orva/renditions");
   EXPECT_EQ(LaterStatus(), "3");
+}
+
+TEST_F(RenditionAccessTest, APhotoThatCouldNotBeOpenedWaitsAgainWhenItsPermissionsChange) {
+  Start();
+  Fail("cannot be opened: Permission denied");
+  EXPECT_EQ(LaterStatus(), "2");
+  ASSERT_EQ(chmod(Photo().c_str(), 0640), 0);
+  EXPECT_TRUE(AwaitWaiting());
+  EXPECT_THAT(Query(TheVolume().Path(), "SELECT count(*) FROM Failures"), ElementsAre("0"));
+  Fail("not an image, or damaged");
+  ASSERT_EQ(chmod(Photo().c_str(), 0644), 0);
+  EXPECT_EQ(LaterStatus(), "2");
 }
 
 TEST_F(RenditionAccessTest, APhotoWithAnotherOwnerIsRenderedAgain) {

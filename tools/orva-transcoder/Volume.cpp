@@ -373,7 +373,7 @@ bool Volume::StagePhoto(const Opened& volume, const WaitingPhoto& photo, Batch& 
   const int problem = file ? 0 : errno;
   if (problem == EACCES || problem == EPERM || problem == EIO) {
     batch.photos.push_back(
-        {.photo = photo, .status = status, .failure = "cannot be opened: " + ErrorText(problem)});
+        {.photo = photo, .status = status, .failure = catalog::NOT_OPENED + ErrorText(problem)});
     return true;
   }
   if (!file || fstat(file.Get(), &status) != 0 || !IsPhoto(status, photo)) {
