@@ -16,6 +16,7 @@
 #include <cerrno>
 #include <chrono>
 #include <csignal>
+#include <ctime>
 #include <sstream>
 #include <thread>
 
@@ -303,6 +304,18 @@ TEST_F(Renditions, AShortQueueIsSharedOutAmongTheProcessors) {
   for (const std::string& name : names) {
     EXPECT_EQ(StateOf(name), "finished");
   }
+}
+
+TEST_F(Renditions, StampsThatAreAheadOfTheClockAreWaitedFor) {
+  CopyAll({"a.jpg", "b.jpg"});
+  AddAllWaiting({"a.jpg", "b.jpg"});
+  fs::rename(At("b.jpg"), At("later"));
+  Query("UPDATE Identity SET newestStamp = strftime('%s', 'now') + 5");
+  Announce("scanned");
+  ASSERT_TRUE(Await([this] { return StateOf("a.jpg") == "finished"; }));
+  fs::rename(At("later"), At("b.jpg"));
+  RenderAll();
+  EXPECT_LE(Number("SELECT newestStamp FROM Identity"), std::time(nullptr) + 3);
 }
 
 TEST_F(Renditions, TheVolumeCanBeUnmountedBetweenTwoPiecesOfWork) {

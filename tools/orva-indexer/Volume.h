@@ -142,7 +142,6 @@ private:
   void CheckIdentity(const db::DB& catalog, const Found& found);
   Result WorkOn(const catalog::VolumeRoot& root, const std::function<void()>& pulse,
                 const Found& found, std::time_t latest);
-  void WaitForClock(Clock::time_point begin);
   void WalkNext(catalog::FolderIndexer& indexer);
   void FinishWalk(Result& result, long long files);
   void Opened(const Folder& folder, int descriptor);

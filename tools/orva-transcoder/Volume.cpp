@@ -48,6 +48,7 @@ constexpr std::size_t MOST_LISTED = 50;       // waiting photos in one query
 constexpr std::size_t MOST_EXAMINED = 1000;   // photos in one piece of work
 constexpr std::size_t MOST_REMOVALS = 10'000; // in one piece of work
 constexpr std::chrono::seconds RETRY(60);
+constexpr std::chrono::seconds BUSY_RETRY(1);
 constexpr std::chrono::milliseconds PIECE(200);
 // A photo is postponed for 15, 30, ... 480 s: 16 minutes. If the reason was a shortage of memory,
 // it has usually passed by then.
@@ -180,7 +181,7 @@ void Volume::Attempt(const std::function<void()>& work) {
 
 void Volume::Report(const std::string& problem, bool isBusy) {
   isBusy_ = isBusy;
-  lookAgainAt_ = Clock::now() + (isBusy_ ? std::chrono::seconds(1) : RETRY);
+  lookAgainAt_ = Clock::now() + (isBusy_ ? BUSY_RETRY : RETRY);
   if (isBusy_ || problem == problem_) {
     return;
   }
@@ -428,20 +429,29 @@ bool Volume::StagePhoto(const Opened& volume, const WaitingPhoto& photo, Batch& 
   }
 }
 
-Volume::Stored Volume::Store(Batch& batch) {
-  auto stored = Stored::Later;
+Volume::Stored Volume::Store(const std::vector<Batch*>& batches) {
   isBusy_ = false;
   Attempt([&] {
     const auto volume = Open();
-    if (volume && volume->identity == batch.identity) {
-      const std::set<long long> written = WriteRenditions(*volume, batch);
-      PostponeOrFail(batch);
-      MarkResults(*volume, batch, written);
-      problem_.clear();
+    std::vector<Batch*> useful = batches;
+    std::erase_if(useful, [&volume](const Batch* batch) {
+      return !volume || volume->identity != batch->identity;
+    });
+    if (useful.empty()) {
+      return;
     }
-    stored = Stored::Done;
+    std::set<long long> written;
+    for (Batch* const batch : useful) {
+      written.merge(WriteRenditions(*volume, *batch));
+      PostponeOrFail(*batch);
+    }
+    MarkResults(*volume, useful, written);
+    problem_.clear();
   });
-  return isBusy_ ? stored : Stored::Done;
+  if (isBusy_) {
+    storeAt_ = Clock::now() + BUSY_RETRY;
+  }
+  return isBusy_ ? Stored::Later : Stored::Done;
 }
 
 std::set<long long> Volume::WriteRenditions(const Opened& volume, Batch& batch) {
@@ -471,33 +481,36 @@ std::set<long long> Volume::WriteRenditions(const Opened& volume, Batch& batch) 
   return written;
 }
 
-void Volume::MarkResults(const Opened& volume, const Batch& batch,
+void Volume::MarkResults(const Opened& volume, const std::vector<Batch*>& batches,
                          const std::set<long long>& written) {
   std::vector<long long> withoutRendition;
   std::size_t changes = 0;
   {
     db::Transaction transaction(*volume.catalog, catalog::BUSY_TIMEOUT);
     const std::time_t stamp = catalog::NextStamp(*volume.catalog, std::time(nullptr));
-    for (const BatchPhoto& photo : batch.photos) {
-      const long long id = photo.photo.id;
-      if (photo.isOutdated) {
-        continue;
-      }
-      if (!photo.failure.empty()) {
-        if (catalog::MarkFailed(*volume.catalog, photo.photo, photo.failure, stamp)) {
-          withoutRendition.push_back(id);
-          ++changes;
+    for (const Batch* const batch : batches) {
+      for (const BatchPhoto& photo : batch->photos) {
+        const long long id = photo.photo.id;
+        if (photo.isOutdated) {
+          continue;
         }
-      } else if (written.contains(id)) {
-        if (catalog::MarkFinished(*volume.catalog, photo.photo, stamp)) {
-          ++changes;
-        } else if (!catalog::IsOnVolume(*volume.catalog, id)) {
-          withoutRendition.push_back(id); // its removal was perhaps handled before
+        if (!photo.failure.empty()) {
+          if (catalog::MarkFailed(*volume.catalog, photo.photo, photo.failure, stamp)) {
+            withoutRendition.push_back(id);
+            ++changes;
+          }
+        } else if (written.contains(id)) {
+          if (catalog::MarkFinished(*volume.catalog, photo.photo, stamp)) {
+            ++changes;
+          } else if (!catalog::IsOnVolume(*volume.catalog, id)) {
+            withoutRendition.push_back(id); // its removal was perhaps handled before
+          }
         }
       }
     }
     if (changes > 0) {
       transaction.Commit();
+      storeAt_ = Clock::now() + catalog::PauseAfterStamp(stamp, std::time(nullptr));
     }
   }
   changes_ += changes;
