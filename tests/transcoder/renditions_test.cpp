@@ -1,8 +1,11 @@
 #include "transcoder/Photos.h"
 #include "transcoder/TranscoderTest.h"
 
+#include "CatalogSchema.h"
 #include "Sql.h"
+#include "orva-transcoder/Renderer.h"
 #include "orva-transcoder/Volume.h"
+#include "orvadb/Transaction.h"
 #include "orvadb/VolumeDB.h"
 #include "support/OtherUsers.h"
 
@@ -316,6 +319,30 @@ TEST_F(Renditions, StampsThatAreAheadOfTheClockAreWaitedFor) {
   fs::rename(At("later"), At("b.jpg"));
   RenderAll();
   EXPECT_LE(Number("SELECT newestStamp FROM Identity"), std::time(nullptr) + 3);
+}
+
+TEST_F(Renditions, NothingIsWrittenWhileTheCatalogIsLocked) {
+  using orva::transcoder::Volume;
+  KillTranscoder();
+  Copy("a.jpg");
+  const long long id = AddWaiting("a.jpg");
+  Volume volume(Root() + '/', catalog::VolumeRoot::Kind::Mount);
+  volume.Look();
+  orva::transcoder::PrepareStaging("/tmp/staging");
+  const auto batch =
+      volume.Stage("/tmp/staging/1", {.photos = 1, .space = 1 << 20, .most = 1 << 20},
+                   [](long long) { return false; });
+  ASSERT_TRUE(batch);
+  orva::transcoder::Render(*batch);
+  {
+    const auto other = catalog::OpenCatalog(Root());
+    const db::Transaction lock(*other, catalog::BUSY_TIMEOUT);
+    EXPECT_EQ(volume.Store({batch.get()}), Volume::Stored::Later);
+    EXPECT_FALSE(fs::exists(RenditionOf(id)));
+  }
+  EXPECT_EQ(volume.Store({batch.get()}), Volume::Stored::Done);
+  EXPECT_TRUE(fs::exists(RenditionOf(id)));
+  EXPECT_EQ(StateOf("a.jpg"), "finished");
 }
 
 TEST_F(Renditions, TheVolumeCanBeUnmountedBetweenTwoPiecesOfWork) {

@@ -48,7 +48,13 @@ constexpr std::size_t MOST_LISTED = 50;       // waiting photos in one query
 constexpr std::size_t MOST_EXAMINED = 1000;   // photos in one piece of work
 constexpr std::size_t MOST_REMOVALS = 10'000; // in one piece of work
 constexpr std::chrono::seconds RETRY(60);
-constexpr std::chrono::seconds BUSY_RETRY(1);
+
+// How long a locked catalog is waited for, in milliseconds: all volumes wait then. The pauses
+// before the next attempts grow with the time since it was found locked.
+constexpr unsigned LOCK_TIMEOUT = 250;
+constexpr std::chrono::milliseconds SHORTEST_LOCK_PAUSE(250);
+constexpr std::chrono::milliseconds LONGEST_LOCK_PAUSE(8000);
+
 constexpr std::chrono::milliseconds PIECE(200);
 // A photo is postponed for 15, 30, ... 480 s: 16 minutes. If the reason was a shortage of memory,
 // it has usually passed by then.
@@ -181,7 +187,14 @@ void Volume::Attempt(const std::function<void()>& work) {
 
 void Volume::Report(const std::string& problem, bool isBusy) {
   isBusy_ = isBusy;
-  lookAgainAt_ = Clock::now() + (isBusy_ ? BUSY_RETRY : RETRY);
+  const auto now = Clock::now();
+  if (isBusy_) {
+    lockedSince_ = lockedSince_.value_or(now);
+    lookAgainAt_ = now + std::clamp<Clock::duration>((now - *lockedSince_) / 8, SHORTEST_LOCK_PAUSE,
+                                                     LONGEST_LOCK_PAUSE);
+  } else {
+    lookAgainAt_ = now + RETRY;
+  }
   if (isBusy_ || problem == problem_) {
     return;
   }
@@ -245,11 +258,12 @@ void Volume::RemoveVanished(const Opened& volume) {
     }
     count = done.size();
     if (count > 0) {
-      db::Transaction transaction(*volume.catalog, catalog::BUSY_TIMEOUT);
+      db::Transaction transaction(*volume.catalog, LOCK_TIMEOUT);
       for (const long long id : done) {
         catalog::ForgetRemovedFile(*volume.catalog, id);
       }
       transaction.Commit();
+      lockedSince_.reset();
     }
   } while (count == MOST_REMOVALS);
 }
@@ -440,16 +454,20 @@ Volume::Stored Volume::Store(const std::vector<Batch*>& batches) {
     if (useful.empty()) {
       return;
     }
+    {
+      const db::Transaction attempt(*volume->catalog, LOCK_TIMEOUT);
+    } // The renditions are written only if it was not locked.
     std::set<long long> written;
     for (Batch* const batch : useful) {
       written.merge(WriteRenditions(*volume, *batch));
       PostponeOrFail(*batch);
     }
     MarkResults(*volume, useful, written);
+    lockedSince_.reset();
     problem_.clear();
   });
   if (isBusy_) {
-    storeAt_ = Clock::now() + BUSY_RETRY;
+    storeAt_ = lookAgainAt_.value_or(storeAt_);
   }
   return isBusy_ ? Stored::Later : Stored::Done;
 }
@@ -549,11 +567,12 @@ void Volume::CheckNextFolder(const Opened& volume, const IsInBatch& isInBatch) {
   std::erase_if(expected, [this](long long id) { return id >= nextToCheck_; });
   const auto missing = CheckFolder(volume.root, first, expected, isInBatch);
   if (!missing.empty()) {
-    db::Transaction transaction(catalog, catalog::BUSY_TIMEOUT);
+    db::Transaction transaction(catalog, LOCK_TIMEOUT);
     for (const long long id : missing) {
       catalog::MarkMissing(catalog, id);
     }
     transaction.Commit();
+    lockedSince_.reset();
     Count(catalog);
     last_.reset();
     isExhausted_ = false;

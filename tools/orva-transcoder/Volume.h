@@ -145,6 +145,7 @@ private:
   bool hasReportedObstacle_ = false;
   std::string problem_; ///< as it was last logged, until renditions are written again
   Clock::time_point storeAt_{};
+  std::optional<Clock::time_point> lockedSince_; ///< the catalog, by another program
   bool isBusy_ = false; ///< another program used the catalog when work last failed
   std::optional<Clock::time_point> lookAgainAt_;
 };
