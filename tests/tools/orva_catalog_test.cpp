@@ -250,6 +250,19 @@ TEST_F(OrvaCatalog, StampsAreTheTimeOfTheRunOrLaterThanAllOthers) {
   EXPECT_EQ(catalog::NextStamp(*database, 1'800'000'002), 1'800'000'002);
 }
 
+TEST(Stamps, TheNextOneWaitsForTheClock) {
+  using std::chrono::seconds;
+  EXPECT_EQ(catalog::PauseAfterStamp(NOW - 5, NOW), seconds(0));
+  EXPECT_EQ(catalog::PauseAfterStamp(NOW + 2, NOW), seconds(0));
+  EXPECT_EQ(catalog::PauseAfterStamp(NOW + 3, NOW), seconds(1));
+  EXPECT_EQ(catalog::PauseAfterStamp(NOW + 10, NOW), seconds(8));
+}
+
+TEST(Stamps, TheNextOneDoesNotWaitForAClockThatWasSetBack) {
+  EXPECT_EQ(catalog::PauseAfterStamp(NOW + 11, NOW), std::chrono::seconds(1));
+  EXPECT_EQ(catalog::PauseAfterStamp(NOW + 1'000'000, NOW), std::chrono::seconds(1));
+}
+
 // --- Index: what is entered --------------------------------------------------------------------
 
 TEST_F(OrvaCatalog, EntersFoldersAndFilesWithRelativePaths) {

@@ -9,8 +9,10 @@
 
 #include "CatalogSchema.h"
 #include "Renditions.h"
+#include "Sql.h"
 #include "UntrustedCatalog.h"
 #include "VolumeRoot.h"
+#include "orva-indexer/Locator.h"
 #include "orva-indexer/Volume.h"
 #include "orvadb/Transaction.h"
 #include "orvadb/VolumeDB.h"
@@ -375,6 +377,28 @@ TEST_F(IndexerTest, AMountBelowTheVolumeIsFollowed) {
   EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
 }
 
+TEST_F(IndexerTest, AFolderThatIsMountedAtTwoPlacesIsFollowedAtBoth) {
+  const Volume volume("A", "64m");
+  Write(volume.Path() + "/One/Inside/a.jpg");
+  fs::create_directory(volume.Path() + "/Two");
+  ASSERT_EQ(mount((volume.Path() + "/One").c_str(), (volume.Path() + "/Two").c_str(), nullptr,
+                  MS_BIND, nullptr),
+            0);
+  StartService();
+  StartIndexer();
+  ASSERT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  ASSERT_TRUE(Await([&] { return State(volume.Path()) == "watching"; }));
+  Write(volume.Path() + "/One/b.jpg");
+  Write(volume.Path() + "/One/Inside/c.jpg");
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  Write(volume.Path() + "/Two/New/d.jpg");
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  ASSERT_EQ(umount2((volume.Path() + "/Two").c_str(), 0), 0);
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  Write(volume.Path() + "/One/New/e.jpg");
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+}
+
 /// Random operations on the files and folders of a volume.
 class Operations {
 public:
@@ -701,8 +725,20 @@ protected:
     FinishPhotos(volume_.Path());
   }
 
+  void Fail(const std::string& reason) {
+    const auto database = catalog::OpenCatalog(volume_.Path());
+    db::Transaction transaction(*database, catalog::BUSY_TIMEOUT);
+    catalog::Execute(*database, "UPDATE Files SET status = 1");
+    const auto waiting = catalog::NewestWaiting(*database, 1);
+    ASSERT_EQ(waiting.size(), 1U);
+    EXPECT_TRUE(catalog::MarkFailed(*database, waiting.front(), reason,
+                                    catalog::NextStamp(*database, std::time(nullptr))));
+    transaction.Commit();
+  }
+
   std::string Status() const {
-    const Lines status = Query(volume_.Path(), "SELECT status FROM Files WHERE name = 'a.jpg'");
+    const Lines status =
+        Query(volume_.Path(), "SELECT status FROM Files WHERE name = 'a.jpg' AND isDeleted = 0");
     return status.size() == 1 ? status.front() : "unknown";
   }
   bool AwaitWaiting() {
@@ -778,6 +814,18 @@ TEST_F(RenditionAccessTest, WhatIsNotARenditionDoesNotMatter) {
   EXPECT_EQ(LaterStatus(), "3");
 }
 
+TEST_F(RenditionAccessTest, APhotoThatCouldNotBeOpenedWaitsAgainWhenItsPermissionsChange) {
+  Start();
+  Fail("cannot be opened: Permission denied");
+  EXPECT_EQ(LaterStatus(), "2");
+  ASSERT_EQ(chmod(Photo().c_str(), 0640), 0);
+  EXPECT_TRUE(AwaitWaiting());
+  EXPECT_THAT(Query(TheVolume().Path(), "SELECT count(*) FROM Failures"), ElementsAre("0"));
+  Fail("not an image, or damaged");
+  ASSERT_EQ(chmod(Photo().c_str(), 0644), 0);
+  EXPECT_EQ(LaterStatus(), "2");
+}
+
 TEST_F(RenditionAccessTest, APhotoWithAnotherOwnerIsRenderedAgain) {
   if (!HasOtherUsers()) {
     GTEST_SKIP() << NO_OTHER_USERS;
@@ -806,6 +854,17 @@ TEST_F(RenditionAccessTest, TheGroupOfAFolderDecidesWhatTheGroupOfAPhotoMayRead)
 }
 
 // --- The merged database -----------------------------------------------------------------------
+
+TEST(Locator, AFileOfAnotherUserNamesNoMaster) {
+  const std::string path = "/tmp/zophotodbmerger.conf";
+  std::ofstream(path) << "zophotos_db_path=/shares/A/.zophotos/zophotos.db\n";
+  EXPECT_EQ(indexer::Locator::Master(), "/shares/A");
+  if (!HasOtherUsers()) {
+    GTEST_SKIP() << NO_OTHER_USERS;
+  }
+  ASSERT_EQ(chown(path.c_str(), 1234, 0), 0);
+  EXPECT_EQ(indexer::Locator::Master(), std::nullopt);
+}
 
 /// The indexer and the daemon, with a master volume that keeps its merged database. It is plugged
 /// before the volumes of the tests, in the order of their names.

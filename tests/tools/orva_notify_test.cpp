@@ -358,6 +358,15 @@ TEST(MountInfo, HoldsOnlyWhatIsDirectlyBelowShares) {
                           Pair("/shares/B", MountIdentity{31, "0:6"})));
 }
 
+TEST(MountInfo, SharesAndTheDirectoriesAboveItContainTheVolumes) {
+  for (const char* const path : {"/", "/shares", "/shares/", "//shares/./", "/shares/A/.."}) {
+    EXPECT_TRUE(ContainsShares(path)) << path;
+  }
+  for (const char* const path : {"/share", "/shares/A", "/shares2/", "/srv/shares", "/shares/A/"}) {
+    EXPECT_FALSE(ContainsShares(path)) << path;
+  }
+}
+
 TEST(MountInfo, DecodesTheKernelsEscapes) {
   EXPECT_THAT(VolumesOf("31 1 0:6 /a\\040b /shares/My\\040Photos\\011\\012\\134040 rw - tmpfs x y\n"
                         "32 1 0:6 / /shares/tail\\04 rw - tmpfs x y\n"

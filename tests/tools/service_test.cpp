@@ -1,5 +1,6 @@
 #include "service/Log.h"
 #include "service/StatusFile.h"
+#include "service/Turns.h"
 
 #include "system/Syslog.h"
 
@@ -14,6 +15,7 @@
 #include <filesystem>
 #include <fstream>
 #include <iterator>
+#include <map>
 #include <string>
 
 namespace {
@@ -26,6 +28,30 @@ using testing::ElementsAre;
 using testing::EndsWith;
 using testing::HasSubstr;
 namespace fs = std::filesystem;
+
+// --- Turns -------------------------------------------------------------------------------------
+
+TEST(Turns, EachElementForWhichTheConditionHoldsIsNextOnce) {
+  const std::map<std::string, bool> elements = {
+      {"a", true}, {"b", false}, {"c", true}, {"d", true}};
+  std::string order;
+  std::string last = "b"; // may be absent
+  for (int turn = 0; turn < 5; ++turn) {
+    last = orva::service::NextInTurn(elements, last, [](const auto& element) {
+             return element.second;
+           })->first;
+    order += last;
+  }
+  EXPECT_EQ(order, "cdacd");
+}
+
+TEST(Turns, NothingIsNextIfTheConditionHoldsForNoElement) {
+  const std::map<std::string, int> elements = {{"a", 1}, {"b", 2}};
+  for (const char* const last : {"", "a", "b", "c"}) {
+    EXPECT_EQ(orva::service::NextInTurn(elements, last, [](const auto&) { return false; }),
+              elements.end());
+  }
+}
 
 // --- Printable ---------------------------------------------------------------------------------
 

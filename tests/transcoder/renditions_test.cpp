@@ -1,8 +1,11 @@
 #include "transcoder/Photos.h"
 #include "transcoder/TranscoderTest.h"
 
+#include "CatalogSchema.h"
 #include "Sql.h"
+#include "orva-transcoder/Renderer.h"
 #include "orva-transcoder/Volume.h"
+#include "orvadb/Transaction.h"
 #include "orvadb/VolumeDB.h"
 #include "support/OtherUsers.h"
 
@@ -16,6 +19,7 @@
 #include <cerrno>
 #include <chrono>
 #include <csignal>
+#include <ctime>
 #include <sstream>
 #include <thread>
 
@@ -305,6 +309,42 @@ TEST_F(Renditions, AShortQueueIsSharedOutAmongTheProcessors) {
   }
 }
 
+TEST_F(Renditions, StampsThatAreAheadOfTheClockAreWaitedFor) {
+  CopyAll({"a.jpg", "b.jpg"});
+  AddAllWaiting({"a.jpg", "b.jpg"});
+  fs::rename(At("b.jpg"), At("later"));
+  Query("UPDATE Identity SET newestStamp = strftime('%s', 'now') + 5");
+  Announce("scanned");
+  ASSERT_TRUE(Await([this] { return StateOf("a.jpg") == "finished"; }));
+  fs::rename(At("later"), At("b.jpg"));
+  RenderAll();
+  EXPECT_LE(Number("SELECT newestStamp FROM Identity"), std::time(nullptr) + 3);
+}
+
+TEST_F(Renditions, NothingIsWrittenWhileTheCatalogIsLocked) {
+  using orva::transcoder::Volume;
+  KillTranscoder();
+  Copy("a.jpg");
+  const long long id = AddWaiting("a.jpg");
+  Volume volume(Root() + '/', catalog::VolumeRoot::Kind::Mount);
+  volume.Look();
+  orva::transcoder::PrepareStaging("/tmp/staging");
+  const auto batch =
+      volume.Stage("/tmp/staging/1", {.photos = 1, .space = 1 << 20, .most = 1 << 20},
+                   [](long long) { return false; });
+  ASSERT_TRUE(batch);
+  orva::transcoder::Render(*batch);
+  {
+    const auto other = catalog::OpenCatalog(Root());
+    const db::Transaction lock(*other, catalog::BUSY_TIMEOUT);
+    EXPECT_EQ(volume.Store({batch.get()}), Volume::Stored::Later);
+    EXPECT_FALSE(fs::exists(RenditionOf(id)));
+  }
+  EXPECT_EQ(volume.Store({batch.get()}), Volume::Stored::Done);
+  EXPECT_TRUE(fs::exists(RenditionOf(id)));
+  EXPECT_EQ(StateOf("a.jpg"), "finished");
+}
+
 TEST_F(Renditions, TheVolumeCanBeUnmountedBetweenTwoPiecesOfWork) {
   MakeSlowPhoto(At("a.png"));
   AddWaiting("a.png");
@@ -363,6 +403,23 @@ TEST_F(Renditions, NothingIsWrittenWhereNothingIsMounted) {
   AnnounceDirectory("/shares/Bare");
   RenderAll();
   EXPECT_TRUE(fs::exists(Rendition("a.jpg")));
+}
+
+TEST_F(Renditions, TheFolderOfTheVolumesIsNoVolume) {
+  UseRoot("/shares");
+  Copy("a.jpg");
+  AddWaiting("a.jpg");
+  AnnounceDirectory("/shares");
+  EXPECT_TRUE(Await([this] {
+    const Lines logged = Logged();
+    return std::ranges::find(logged, "/shares/: not rendered: the volumes are below it") !=
+           logged.end();
+  }));
+  UseRoot(TheVolume().Path());
+  Copy("b.jpg");
+  AddWaiting("b.jpg");
+  RenderAll();
+  EXPECT_FALSE(fs::exists("/shares/.orva/renditions"));
 }
 
 TEST_F(Renditions, AVolumeThatBecomesFullIsReportedOnceAndTriedAgain) {

@@ -221,6 +221,15 @@ std::time_t NextStamp(const db::DB& catalog, std::time_t now) {
   return stamp;
 }
 
+std::chrono::seconds PauseAfterStamp(std::time_t stamp, std::time_t now) {
+  using std::chrono::seconds;
+  constexpr std::time_t MOST_AHEAD = 2;
+  constexpr std::time_t LONGEST_PAUSE = 10;
+  const std::time_t ahead = stamp - now;
+  // If they are farther ahead, the clock was set back.
+  return ahead > LONGEST_PAUSE ? seconds(1) : seconds(std::max<std::time_t>(ahead - MOST_AHEAD, 0));
+}
+
 void Checkpoint(const db::DB& catalog) {
   SelectNumber(catalog, "PRAGMA wal_checkpoint(TRUNCATE)");
 }

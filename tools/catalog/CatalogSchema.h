@@ -1,5 +1,6 @@
 #pragma once
 
+#include <chrono>
 #include <ctime>
 #include <memory>
 #include <string>
@@ -64,6 +65,10 @@ std::time_t NewestStamp(const db::DB& catalog);
 /// every stamp in the catalog, also within one second and after the clock was set back: a reader
 /// looks for later stamps than it has seen.
 std::time_t NextStamp(const db::DB& catalog, std::time_t now);
+
+/// How long a service waits after a commit at `now` that took `stamp`, before it takes another one.
+/// So stamps stay close to the clock: catalogs with stamps far in the future are refused.
+std::chrono::seconds PauseAfterStamp(std::time_t stamp, std::time_t now);
 
 /// Moves all commits from the write-ahead log into the catalog's file, unless a reader still needs
 /// the log. A volume that is mounted read-only afterwards can then be read without it.

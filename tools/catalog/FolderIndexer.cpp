@@ -2,6 +2,7 @@
 
 #include "CatalogSchema.h"
 #include "CatalogWriter.h"
+#include "Renditions.h"
 #include "Sql.h"
 #include "UntrustedCatalog.h"
 #include "VolumeRoot.h"
@@ -329,10 +330,10 @@ FolderIndexer::FileChanges FolderIndexer::CompareFiles(const IndexedFolder& fold
     }
   };
 
-  db::Statement row(catalog_,
-                    "SELECT id, path, name, lastModifiedDate, size, isDeleted, status, category, "
-                    "isBackup, isHidden, isSystem FROM Files INDEXED BY Files_folder "
-                    "WHERE folderId = ? ORDER BY name");
+  db::Statement row(
+      catalog_, "SELECT id, path, name, lastModifiedDate, size, isDeleted, status, category, "
+                "isBackup, isHidden, isSystem, lastUpdatedDate FROM Files INDEXED BY Files_folder "
+                "WHERE folderId = ? ORDER BY name");
   row.BindInt64(1, folder.id);
   RenditionAccess renditions(volume_, folder.path);
   std::vector<std::pair<const Entry*, long long>> tombstones;
@@ -367,7 +368,8 @@ FolderIndexer::FileChanges FolderIndexer::CompareFiles(const IndexedFolder& fold
     const bool isDeleted = known.isDeleted;
     const bool isChanged = isDeleted || folder.revived || !IsUpToDate(row, folder, *entry) ||
                            (known.status == RENDERED && newPhotos_ == NewPhotos::Waiting &&
-                            renditions.IsOutdated(known.id, entry->access));
+                            renditions.IsOutdated(known.id, entry->access)) ||
+                           (known.status == UNRENDERABLE && MayBeOpenedNow(row, *entry));
     if (!(isChanged && write(*entry, known)) && !isDeleted) {
       ++summary_.rows; // it stays as it is
     }
@@ -399,6 +401,13 @@ bool FolderIndexer::IsUpToDate(const db::Statement& row, const IndexedFolder& fo
          row.IsInteger(3) && row.IsInteger(4) &&
          row.GetInt(7) == CategoryOf(ExtensionOf(entry.name)) && row.GetBool(8) == flags.isBackup &&
          row.GetBool(9) == flags.isHidden && row.GetBool(10) == flags.isSystem;
+}
+
+/// Whether a photo that could not be opened has other permissions since. A ctime in the future says
+/// nothing: it would be later than each failure.
+bool FolderIndexer::MayBeOpenedNow(const db::Statement& row, const Entry& entry) const {
+  const std::time_t changed = entry.access.changed.tv_sec;
+  return changed >= row.GetTime(11) && changed <= now_ && WasNotOpened(catalog_, row.GetInt64(0));
 }
 
 void FolderIndexer::UpdateFile(const IndexedFolder& folder, const FileChange& change) {

@@ -54,10 +54,10 @@ struct IndexedFolder {
 };
 
 /// Brings the rows of single folders up to date with the volume. Lists a folder and reads its rows;
-/// memory grows with the largest folder on the
-/// volume only, whatever the catalog holds. An object belongs to one transaction of its caller,
-/// on the catalog's thread. Links are not followed; file systems mounted below the volume are.
-/// Failures of the database are thrown as std::string, others as util::Exception.
+/// memory grows with the largest folder on the volume only, whatever the catalog holds. An object
+/// belongs to one transaction of its caller, on the catalog's thread. Links are not followed; file
+/// systems mounted below the volume are. Failures of the database are thrown as std::string, others
+/// as util::Exception.
 class FolderIndexer {
 public:
   /// What tells whether a file is still changing.
@@ -160,6 +160,7 @@ private:
                              const FolderRow* known);
   FileChanges CompareFiles(const IndexedFolder& folder, const Listing& listing);
   bool IsUpToDate(const db::Statement& row, const IndexedFolder& folder, const Entry& entry) const;
+  bool MayBeOpenedNow(const db::Statement& row, const Entry& entry) const;
   void UpdateFile(const IndexedFolder& folder, const FileChange& change);
   void DeleteFile(const FileRow& file);
   void MarkFolderDeleted(long long id);

@@ -113,6 +113,12 @@ bool MarkFailed(const db::DB& catalog, const WaitingPhoto& photo, const std::str
   return true;
 }
 
+bool WasNotOpened(const db::DB& catalog, long long fileId) {
+  return SelectNumber(catalog,
+                      "SELECT count(*) FROM Failures WHERE fileId = ? AND instr(reason, ?) = 1",
+                      fileId, std::string(NOT_OPENED)) != 0;
+}
+
 void MarkMissing(const db::DB& catalog, long long fileId) {
   Execute(catalog, "UPDATE Files SET status = 1 WHERE id = ? AND status = 3 AND isDeleted = 0",
           fileId);

@@ -42,6 +42,13 @@ bool MarkFinished(const db::DB& catalog, const WaitingPhoto& photo, std::time_t 
 bool MarkFailed(const db::DB& catalog, const WaitingPhoto& photo, const std::string& reason,
                 std::time_t stamp);
 
+/// Begin of the reason when a photo could not be opened: it waits again when its permissions
+/// change.
+inline constexpr char NOT_OPENED[] = "cannot be opened: ";
+
+/// Whether the photo has failed for this reason.
+bool WasNotOpened(const db::DB& catalog, long long fileId);
+
 /// Lets the photo wait again if it is finished: its rendition is missing.
 void MarkMissing(const db::DB& catalog, long long fileId);
 

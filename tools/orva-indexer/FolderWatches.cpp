@@ -6,9 +6,11 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <array>
 #include <cstring>
 #include <iterator>
+#include <utility>
 
 namespace orva::indexer {
 namespace {
@@ -31,19 +33,27 @@ bool FolderWatches::Add(const std::string& path, int descriptor) {
   if (watch == -1) {
     return false;
   }
-  const auto former = byPath_.find(path);
-  if (former != byPath_.end() && former->second.watch != watch) {
-    byWatch_.erase(former->second.watch);
-    inotify_rm_watch(inotify_.Get(), former->second.watch);
+  const auto [entry, isNew] = byPath_.try_emplace(path, Watched{.watch = watch});
+  if (isNew || entry->second.watch != watch) {
+    if (!isNew) {
+      End(path, std::exchange(entry->second.watch, watch));
+    }
+    byWatch_.emplace(watch, path);
   }
-  // A folder has one watch, also when it was moved.
-  const auto elsewhere = byWatch_.find(watch);
-  if (elsewhere != byWatch_.end() && elsewhere->second != path) {
-    byPath_.erase(elsewhere->second);
-  }
-  byWatch_[watch] = path;
-  byPath_[path].watch = watch;
   return true;
+}
+
+/// Ends the watch at this path. It is kept while another path leads to the same folder.
+void FolderWatches::End(const std::string& path, int watch) {
+  const auto [begin, end] = byWatch_.equal_range(watch);
+  const auto entry =
+      std::find_if(begin, end, [&](const auto& item) { return item.second == path; });
+  if (entry != end) {
+    byWatch_.erase(entry);
+  }
+  if (!byWatch_.contains(watch)) {
+    inotify_rm_watch(inotify_.Get(), watch);
+  }
 }
 
 bool FolderWatches::HasOtherAccess(const std::string& path, int descriptor) {
@@ -64,8 +74,7 @@ bool FolderWatches::HasOtherAccess(const std::string& path, int descriptor) {
 void FolderWatches::Forget(const std::string& path) {
   auto entry = byPath_.lower_bound(path);
   while (entry != byPath_.end() && entry->first.starts_with(path)) {
-    byWatch_.erase(entry->second.watch);
-    inotify_rm_watch(inotify_.Get(), entry->second.watch);
+    End(entry->first, entry->second.watch);
     entry = byPath_.erase(entry);
   }
 }
@@ -87,16 +96,17 @@ std::vector<FolderWatches::Event> FolderWatches::Read() {
         events.push_back({.mask = header.mask});
         continue;
       }
-      const auto watch = byWatch_.find(header.wd);
-      if (watch == byWatch_.end()) {
-        continue;
+      const auto [begin, end] = byWatch_.equal_range(header.wd);
+      for (auto watch = begin; watch != end; ++watch) {
+        events.push_back({.mask = header.mask,
+                          .folder = watch->second,
+                          .name = header.len > 0 ? name : std::string()});
+        if ((header.mask & IN_IGNORED) != 0) {
+          byPath_.erase(watch->second);
+        }
       }
-      events.push_back({.mask = header.mask,
-                        .folder = watch->second,
-                        .name = header.len > 0 ? name : std::string()});
       if ((header.mask & IN_IGNORED) != 0) {
-        byPath_.erase(watch->second);
-        byWatch_.erase(watch);
+        byWatch_.erase(begin, end);
       }
     }
   }

@@ -55,8 +55,12 @@ private:
     gid_t group = 0;
   };
 
+  void End(const std::string& path, int watch);
+
   util::FileDescriptor inotify_;
-  std::unordered_map<int, std::string> byWatch_;
+  /// A folder has one watch, also if several paths lead to it: it is mounted at another place, or
+  /// was just moved.
+  std::unordered_multimap<int, std::string> byWatch_;
   std::map<std::string, Watched> byPath_;
 };
 

@@ -65,11 +65,12 @@ bool Locator::HasChanged() {
 }
 
 std::optional<std::string> Locator::Master() {
-  // Any user can create something in /tmp.
+  // Any user can create something in /tmp. The daemon runs as root, or as the indexer's user.
   const util::FileDescriptor file(
       open(PATH, O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
   struct stat status = {};
-  if (!file || fstat(file.Get(), &status) != 0 || !S_ISREG(status.st_mode)) {
+  if (!file || fstat(file.Get(), &status) != 0 || !S_ISREG(status.st_mode) ||
+      (status.st_uid != 0 && status.st_uid != geteuid())) {
     return std::nullopt;
   }
   std::string line(8192, '\0');

@@ -19,7 +19,7 @@ public:
   bool HasChanged();
 
   /// The path of the volume with the merged database, without a separator at its end; nothing if
-  /// the file names none.
+  /// the file names none, or if another user owns it.
   static std::optional<std::string> Master();
 
 private:

@@ -5,6 +5,7 @@
 #include "orvautil/Exception.h"
 #include "orvautil/Path.h"
 #include "service/Log.h"
+#include "service/Turns.h"
 
 #include <nlohmann/json.hpp>
 
@@ -45,12 +46,6 @@ constexpr char SHARES[] = "/shares";
 constexpr char NO_VOLUME[] = "-";
 
 constexpr char MOUNT_INFO[] = "/proc/self/mountinfo";
-
-/// Whether the mount point is /shares, or above it.
-bool ContainsVolumes(const std::string& mountPoint) {
-  const std::string path = std::filesystem::path(mountPoint).lexically_normal();
-  return (std::string(SHARES) + '/').starts_with(path);
-}
 
 util::FileDescriptor OpenMountInfo() {
   return notify::CheckedDescriptor(open(MOUNT_INFO, O_RDONLY | O_CLOEXEC), MOUNT_INFO);
@@ -211,7 +206,7 @@ void Service::Plug(const std::string& mountPoint, bool isDirectory) {
     }
     Forget(mountPoint);
   }
-  if (ContainsVolumes(mountPoint)) {
+  if (notify::ContainsShares(mountPoint)) {
     LogError("Volume " + Printable(mountPoint) + ": not indexed: the volumes are below it");
     return;
   }
@@ -261,20 +256,27 @@ void Service::Forget(const std::string& mountPoint) {
 
 // --- Work --------------------------------------------------------------------------------------
 
-/// Does one piece of work, on each volume in turn.
+/// Does one piece of work. Walks of whole volumes alternate with changes, so that a change waits
+/// for one piece of one walk at most. Of either kind, each volume has its turn.
 void Service::WorkOnNext() {
   const auto now = Clock::now();
-  const auto isDue = [now](const auto& entry) { return entry.second->volume.NextWork() <= now; };
-  const auto after = volumes_.upper_bound(lastWorked_);
-  auto next = std::find_if(after, volumes_.end(), isDue);
+  const auto find = [this, now](bool isWalk) {
+    return service::NextInTurn(volumes_, lastWorked_[isWalk ? 1 : 0], [&](const auto& entry) {
+      const Volume& volume = entry.second->volume;
+      return volume.NextWork() <= now && volume.IsWalkingAll() == isWalk;
+    });
+  };
+  auto next = find(!wasWalk_);
   if (next == volumes_.end()) {
-    next = std::find_if(volumes_.begin(), after, isDue);
-    if (next == after) {
-      return;
-    }
+    next = find(wasWalk_);
   }
-  lastWorked_ = next->first;
+  if (next == volumes_.end()) {
+    return;
+  }
+  const std::string mountPoint = next->first;
   Known& known = *next->second;
+  wasWalk_ = known.volume.IsWalkingAll();
+  lastWorked_[wasWalk_ ? 1 : 0] = mountPoint;
   working_ = &known;
   const auto found = [this](const db::DB& catalog) {
     remembered_.ForgetOtherStates(working_->volume.MountPoint(), catalog);
@@ -282,7 +284,7 @@ void Service::WorkOnNext() {
   const Volume::Result result = known.volume.Work([this] { Pulse(); }, found, LatestStamp(known));
   working_ = nullptr;
   if (result.isGone) {
-    Forget(lastWorked_);
+    Forget(mountPoint);
   } else {
     AnnounceResult(known, result);
   }

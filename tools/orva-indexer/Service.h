@@ -9,6 +9,7 @@
 #include "orvautil/FileDescriptor.h"
 #include "service/StatusFile.h"
 
+#include <array>
 #include <chrono>
 #include <map>
 #include <memory>
@@ -84,7 +85,8 @@ private:
   Locator locator_;
   std::map<std::string, std::unique_ptr<Known>> volumes_; ///< by mount point, ending in "/"
   std::vector<notifications::Notification> received_;
-  std::string lastWorked_; ///< mount point
+  bool wasWalk_ = false;                  ///< the last piece of work
+  std::array<std::string, 2> lastWorked_; ///< mount points, of the last change and the last walk
   const Known* working_ = nullptr;
   bool isStopped_ = false;
   Clock::time_point inputRead_{};

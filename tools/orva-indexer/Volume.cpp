@@ -49,10 +49,6 @@ constexpr auto MOST_WORK = 2s;
 /// Between two pieces of work, so that the volume can be unmounted.
 constexpr auto REST = 200ms;
 
-/// If the stamps are ahead of the clock all the same, because the transcoder takes some too, the
-/// work waits for the clock. If they are farther ahead, the clock was set back.
-constexpr std::time_t LONGEST_WAIT = 10; // seconds
-
 /// A file that was created but neither written nor closed may be a link, for which there is no
 /// other event. One that was written and not closed may have been truncated by its name.
 constexpr auto LONGEST_EMPTY = 8s;
@@ -379,7 +375,8 @@ Volume::Result Volume::WorkOn(const VolumeRoot& root, const std::function<void()
     state_ = std::move(state);
     result.hasChanged = indexer.HasChanged();
     if (result.hasChanged) {
-      WaitForClock(begin);
+      const auto pause = catalog::PauseAfterStamp(state_.newestStamp, std::time(nullptr));
+      notBefore_ = std::max(begin + MOST_WORK, Clock::now() + pause);
     }
     files_ += indexer.Summary().added + indexer.Summary().revived - indexer.Summary().deleted;
     if (const auto& unreadable = indexer.Summary().unreadable; !unreadable.empty()) {
@@ -405,15 +402,6 @@ Volume::Result Volume::WorkOn(const VolumeRoot& root, const std::function<void()
     throw;
   }
   return result;
-}
-
-/// After a commit that took a stamp, of a piece of work that began at `begin`.
-void Volume::WaitForClock(Clock::time_point begin) {
-  notBefore_ = begin + MOST_WORK;
-  const std::time_t ahead = state_.newestStamp - std::time(nullptr);
-  if (ahead > 0 && ahead <= LONGEST_WAIT) {
-    notBefore_ = std::max(notBefore_, Clock::now() + std::chrono::seconds(ahead));
-  }
 }
 
 std::unique_ptr<db::VolumeDB> Volume::OpenCatalog(const VolumeRoot& root, std::time_t latest) {

@@ -87,6 +87,9 @@ public:
   /// Whether no folder is being walked or waits to be walked now.
   bool IsIdle() const noexcept { return ready_.empty() && !isWalkingAll_; }
 
+  /// Whether a walk of all folders has not ended.
+  bool IsWalkingAll() const noexcept { return isWalkingAll_; }
+
   /// Walks folders for at most two seconds and commits. Calls `pulse` often. `latest` is the time
   /// of the latest stamp that its catalog may have.
   Result Work(const std::function<void()>& pulse, const Found& found, std::time_t latest);
@@ -139,7 +142,6 @@ private:
   void CheckIdentity(const db::DB& catalog, const Found& found);
   Result WorkOn(const catalog::VolumeRoot& root, const std::function<void()>& pulse,
                 const Found& found, std::time_t latest);
-  void WaitForClock(Clock::time_point begin);
   void WalkNext(catalog::FolderIndexer& indexer);
   void FinishWalk(Result& result, long long files);
   void Opened(const Folder& folder, int descriptor);

@@ -38,7 +38,7 @@ std::string Directory(const char* variable, const char* standard) {
   return value != nullptr && *value == '/' ? value : standard;
 }
 
-/// Whoever uses the volumes comes first. It does no harm if this is refused.
+/// Other programs on the volumes come first. It does no harm if this is refused.
 void LowerPriority() {
   constexpr int WHO_PROCESS = 1; // linux/ioprio.h
   constexpr int CLASS_IDLE = 3 << 13;

@@ -1,5 +1,6 @@
 #include "orva-notify/MountInfo.h"
 
+#include <filesystem>
 #include <istream>
 #include <sstream>
 
@@ -46,6 +47,11 @@ bool IsDirectlyBelowShares(const std::string& path) {
   const std::string start = SHARES + "/";
   return path.size() > start.size() && path.starts_with(start) &&
          path.find('/', start.size()) == std::string::npos;
+}
+
+bool ContainsShares(const std::string& directory) {
+  const std::filesystem::path path = std::filesystem::path(directory) / ""; // ends in "/"
+  return (SHARES + '/').starts_with(path.lexically_normal().native());
 }
 
 Volumes ReadVolumes(std::istream& mountInfo) {

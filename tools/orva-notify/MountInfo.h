@@ -22,6 +22,10 @@ using Volumes = std::map<std::string, MountIdentity>;
 /// Whether `path`, which is canonical, is directly below /shares.
 bool IsDirectlyBelowShares(const std::string& path);
 
+/// Whether the directory is /shares, or above it: it contains the volumes, so it is no volume whose
+/// photos are indexed and rendered.
+bool ContainsShares(const std::string& directory);
+
 /// Reads a table in the format of /proc/self/mountinfo. Returns the visible mount points directly
 /// below /shares. Malformed lines are skipped.
 Volumes ReadVolumes(std::istream& mountInfo);

@@ -3,10 +3,12 @@
 #include "Renderer.h"
 
 #include "orva-notify/Control.h"
+#include "orva-notify/MountInfo.h"
 #include "orva-notify/Notification.h"
 #include "orvautil/Core.h"
 #include "orvautil/Exception.h"
 #include "service/Log.h"
+#include "service/Turns.h"
 
 #include <nlohmann/json.hpp>
 
@@ -18,6 +20,7 @@
 #include <array>
 #include <cerrno>
 #include <exception>
+#include <iterator>
 #include <ranges>
 #include <system_error>
 #include <utility>
@@ -33,9 +36,9 @@ constexpr long long MOST_BYTES = 128LL << 20;                   // of several ph
 // render.
 constexpr std::size_t MOST_PHOTOS = 50;
 constexpr std::size_t FEWEST_PHOTOS = 10;
+constexpr std::size_t BATCHES_PER_PROCESSOR = 4; // including those that are rendered
 constexpr std::size_t ANNOUNCED_CHANGES = 500;
 constexpr std::chrono::seconds ANNOUNCE_INTERVAL(2);
-constexpr std::chrono::seconds STORE_AGAIN(1);
 constexpr std::chrono::seconds SEND_AGAIN(5);
 constexpr std::chrono::seconds ERROR_PAUSE(60);
 
@@ -83,7 +86,10 @@ void Transcoder::Handle(const Notification& notification) {
     sendAgainAt_.reset();
     return;
   case Event::Plugged:
-    if (!volumes_.contains(mountPoint)) {
+    if (notify::ContainsShares(mountPoint)) {
+      service::LogError(service::Printable(mountPoint) +
+                        ": not rendered: the volumes are below it");
+    } else if (!volumes_.contains(mountPoint)) {
       using Kind = catalog::VolumeRoot::Kind;
       volumes_.emplace(
           mountPoint,
@@ -112,45 +118,57 @@ void Transcoder::StoreRendered() {
   eventfd_t count = 0;
   eventfd_read(wake_.Get(), &count);
   std::erase_if(running_, [this](const auto& running) {
-    return IsRendered(*running) && StoreBatch(*running);
+    return IsRendered(*running) && IsUseless(*running->batch);
   });
+  for (auto& [mountPoint, known] : volumes_) {
+    StoreRendered(known);
+  }
 }
 
-/// Returns false if that has to be done again.
-bool Transcoder::StoreBatch(Running& running) {
-  const Batch& batch = *running.batch;
-  if (!batch.error.empty()) {
-    if (batch.error != error_) {
-      error_ = batch.error;
-      service::LogError(service::Printable(error_));
-    }
-    pausedUntil_ = Clock::now() + ERROR_PAUSE;
-    return true;
+/// Whether nothing was rendered, or the volume is gone.
+bool Transcoder::IsUseless(const Batch& batch) {
+  if (batch.error.empty()) {
+    return !volumes_.contains(batch.mountPoint);
   }
-  const auto known = volumes_.find(batch.mountPoint);
-  if (known == volumes_.end()) {
-    return true;
+  if (batch.error != error_) {
+    error_ = batch.error;
+    service::LogError(service::Printable(error_));
   }
-  if (running.storeAgainAt && Clock::now() < *running.storeAgainAt) {
-    WakeAt(*running.storeAgainAt);
-    return false;
+  pausedUntil_ = Clock::now() + ERROR_PAUSE;
+  return true;
+}
+
+/// Stores all batches of the volume that are rendered, if it is time.
+void Transcoder::StoreRendered(Known& known) {
+  Volume& volume = known.volume;
+  const auto rendered =
+      std::stable_partition(running_.begin(), running_.end(), [&](const auto& running) {
+        return running->batch->mountPoint != volume.MountPoint() || !IsRendered(*running);
+      });
+  if (rendered == running_.end()) {
+    return;
+  }
+  if (Clock::now() < volume.StoreAt()) {
+    WakeAt(volume.StoreAt());
+    return;
   }
   error_.clear();
-  Volume& volume = known->second.volume;
-  if (volume.Store(*running.batch) == Volume::Stored::Later) {
-    running.storeAgainAt = Clock::now() + STORE_AGAIN;
-    WakeAt(*running.storeAgainAt);
-    return false;
+  std::vector<Batch*> batches;
+  std::transform(rendered, running_.end(), std::back_inserter(batches),
+                 [](const auto& running) { return running->batch.get(); });
+  if (volume.Store(batches) == Volume::Stored::Later) {
+    WakeAt(volume.StoreAt());
+    return;
   }
+  running_.erase(rendered, running_.end());
   const std::size_t changes = volume.TakeChanges();
   if (changes > 0) {
-    if (known->second.changes == 0) {
-      known->second.changedAt = Clock::now();
+    if (known.changes == 0) {
+      known.changedAt = Clock::now();
     }
-    known->second.changes += changes;
-    known->second.isEndDue = true;
+    known.changes += changes;
+    known.isEndDue = true;
   }
-  return true;
 }
 
 void Transcoder::LookAgain() {
@@ -175,18 +193,13 @@ void Transcoder::LookAgain() {
 
 /// Stages batches, from one volume after the other.
 void Transcoder::StageNext() {
-  while (!pausedUntil_ && running_.size() <= processors_) {
-    // The volumes after the last one, then the others.
-    auto next = volumes_.upper_bound(lastStaged_);
-    bool isStaged = false;
-    for (std::size_t i = 0; i < volumes_.size() && !isStaged; ++i) {
-      next = next == volumes_.end() ? volumes_.begin() : next;
-      isStaged = Stage(next->second);
-      ++next;
-    }
-    if (!isStaged) {
+  while (!pausedUntil_ && HasRoom()) {
+    const auto staged = service::NextInTurn(volumes_, lastStaged_,
+                                            [this](auto& entry) { return Stage(entry.second); });
+    if (staged == volumes_.end()) {
       return;
     }
+    lastStaged_ = staged->first;
   }
 }
 
@@ -201,7 +214,6 @@ bool Transcoder::Stage(Known& known) {
     hasMoreWork_ = hasMoreWork_ || (volume.HasWork() && running_.empty());
     return false;
   }
-  lastStaged_ = volume.MountPoint();
   Start(std::move(batch));
   return true;
 }
@@ -224,6 +236,14 @@ void Transcoder::Start(std::unique_ptr<Batch> batch) {
 bool Transcoder::IsRendered(const Running& running) {
   const std::lock_guard lock(mutex_);
   return running.isRendered;
+}
+
+/// Whether another batch may be staged. Some batches more may be rendered and not stored yet.
+bool Transcoder::HasRoom() {
+  const auto unrendered = std::ranges::count_if(
+      running_, [this](const auto& running) { return !IsRendered(*running); });
+  return static_cast<std::size_t>(unrendered) <= processors_ &&
+         running_.size() <= BATCHES_PER_PROCESSOR * processors_;
 }
 
 bool Transcoder::IsRendering(const std::string& mountPoint) const {
@@ -274,7 +294,7 @@ BatchLimits Transcoder::LimitsOfNext(const Volume& volume) const {
 
 /// When there is nothing to stage.
 void Transcoder::CheckRenditions() {
-  if (running_.size() > processors_) {
+  if (!HasRoom()) {
     return;
   }
   for (auto& [mountPoint, known] : volumes_) {

@@ -23,7 +23,8 @@ namespace orva::transcoder {
 
 /// The service: renders the photos that wait on all volumes. One thread does everything with the
 /// volumes; one thread for each batch waits for the programs that render it. There is one batch
-/// more than processors, so that photos are copied while others are rendered.
+/// more than processors, so that photos are copied while others are rendered. Batches that are
+/// rendered may wait until they are stored.
 class Transcoder {
 public:
   using Clock = std::chrono::steady_clock;
@@ -53,13 +54,13 @@ private:
     std::unique_ptr<Batch> batch;
     std::jthread thread{};
     bool isRendered = false; ///< guarded by mutex_ until the thread has ended
-    std::optional<Clock::time_point> storeAgainAt{};
   };
 
   void Receive();
   void Handle(const notifications::Notification& notification);
   void StoreRendered();
-  bool StoreBatch(Running& running);
+  void StoreRendered(Known& known);
+  bool IsUseless(const Batch& batch);
   void LookAgain();
   void StageNext();
   bool Stage(Known& known);
@@ -73,6 +74,7 @@ private:
 
   void Start(std::unique_ptr<Batch> batch);
   bool IsRendered(const Running& running);
+  bool HasRoom();
   bool IsRendering(const std::string& mountPoint) const;
   Volume::IsInBatch InBatchOf(const std::string& mountPoint) const;
   long long FreeSpace() const;

@@ -48,6 +48,13 @@ constexpr std::size_t MOST_LISTED = 50;       // waiting photos in one query
 constexpr std::size_t MOST_EXAMINED = 1000;   // photos in one piece of work
 constexpr std::size_t MOST_REMOVALS = 10'000; // in one piece of work
 constexpr std::chrono::seconds RETRY(60);
+
+// How long a locked catalog is waited for, in milliseconds: all volumes wait then. The pauses
+// before the next attempts grow with the time since it was found locked.
+constexpr unsigned LOCK_TIMEOUT = 250;
+constexpr std::chrono::milliseconds SHORTEST_LOCK_PAUSE(250);
+constexpr std::chrono::milliseconds LONGEST_LOCK_PAUSE(8000);
+
 constexpr std::chrono::milliseconds PIECE(200);
 // A photo is postponed for 15, 30, ... 480 s: 16 minutes. If the reason was a shortage of memory,
 // it has usually passed by then.
@@ -180,7 +187,14 @@ void Volume::Attempt(const std::function<void()>& work) {
 
 void Volume::Report(const std::string& problem, bool isBusy) {
   isBusy_ = isBusy;
-  lookAgainAt_ = Clock::now() + (isBusy_ ? std::chrono::seconds(1) : RETRY);
+  const auto now = Clock::now();
+  if (isBusy_) {
+    lockedSince_ = lockedSince_.value_or(now);
+    lookAgainAt_ = now + std::clamp<Clock::duration>((now - *lockedSince_) / 8, SHORTEST_LOCK_PAUSE,
+                                                     LONGEST_LOCK_PAUSE);
+  } else {
+    lookAgainAt_ = now + RETRY;
+  }
   if (isBusy_ || problem == problem_) {
     return;
   }
@@ -244,11 +258,12 @@ void Volume::RemoveVanished(const Opened& volume) {
     }
     count = done.size();
     if (count > 0) {
-      db::Transaction transaction(*volume.catalog, catalog::BUSY_TIMEOUT);
+      db::Transaction transaction(*volume.catalog, LOCK_TIMEOUT);
       for (const long long id : done) {
         catalog::ForgetRemovedFile(*volume.catalog, id);
       }
       transaction.Commit();
+      lockedSince_.reset();
     }
   } while (count == MOST_REMOVALS);
 }
@@ -373,7 +388,7 @@ bool Volume::StagePhoto(const Opened& volume, const WaitingPhoto& photo, Batch& 
   const int problem = file ? 0 : errno;
   if (problem == EACCES || problem == EPERM || problem == EIO) {
     batch.photos.push_back(
-        {.photo = photo, .status = status, .failure = "cannot be opened: " + ErrorText(problem)});
+        {.photo = photo, .status = status, .failure = catalog::NOT_OPENED + ErrorText(problem)});
     return true;
   }
   if (!file || fstat(file.Get(), &status) != 0 || !IsPhoto(status, photo)) {
@@ -428,20 +443,33 @@ bool Volume::StagePhoto(const Opened& volume, const WaitingPhoto& photo, Batch& 
   }
 }
 
-Volume::Stored Volume::Store(Batch& batch) {
-  auto stored = Stored::Later;
+Volume::Stored Volume::Store(const std::vector<Batch*>& batches) {
   isBusy_ = false;
   Attempt([&] {
     const auto volume = Open();
-    if (volume && volume->identity == batch.identity) {
-      const std::set<long long> written = WriteRenditions(*volume, batch);
-      PostponeOrFail(batch);
-      MarkResults(*volume, batch, written);
-      problem_.clear();
+    std::vector<Batch*> useful = batches;
+    std::erase_if(useful, [&volume](const Batch* batch) {
+      return !volume || volume->identity != batch->identity;
+    });
+    if (useful.empty()) {
+      return;
     }
-    stored = Stored::Done;
+    {
+      const db::Transaction attempt(*volume->catalog, LOCK_TIMEOUT);
+    } // The renditions are written only if it was not locked.
+    std::set<long long> written;
+    for (Batch* const batch : useful) {
+      written.merge(WriteRenditions(*volume, *batch));
+      PostponeOrFail(*batch);
+    }
+    MarkResults(*volume, useful, written);
+    lockedSince_.reset();
+    problem_.clear();
   });
-  return isBusy_ ? stored : Stored::Done;
+  if (isBusy_) {
+    storeAt_ = lookAgainAt_.value_or(storeAt_);
+  }
+  return isBusy_ ? Stored::Later : Stored::Done;
 }
 
 std::set<long long> Volume::WriteRenditions(const Opened& volume, Batch& batch) {
@@ -471,33 +499,36 @@ std::set<long long> Volume::WriteRenditions(const Opened& volume, Batch& batch) 
   return written;
 }
 
-void Volume::MarkResults(const Opened& volume, const Batch& batch,
+void Volume::MarkResults(const Opened& volume, const std::vector<Batch*>& batches,
                          const std::set<long long>& written) {
   std::vector<long long> withoutRendition;
   std::size_t changes = 0;
   {
     db::Transaction transaction(*volume.catalog, catalog::BUSY_TIMEOUT);
     const std::time_t stamp = catalog::NextStamp(*volume.catalog, std::time(nullptr));
-    for (const BatchPhoto& photo : batch.photos) {
-      const long long id = photo.photo.id;
-      if (photo.isOutdated) {
-        continue;
-      }
-      if (!photo.failure.empty()) {
-        if (catalog::MarkFailed(*volume.catalog, photo.photo, photo.failure, stamp)) {
-          withoutRendition.push_back(id);
-          ++changes;
+    for (const Batch* const batch : batches) {
+      for (const BatchPhoto& photo : batch->photos) {
+        const long long id = photo.photo.id;
+        if (photo.isOutdated) {
+          continue;
         }
-      } else if (written.contains(id)) {
-        if (catalog::MarkFinished(*volume.catalog, photo.photo, stamp)) {
-          ++changes;
-        } else if (!catalog::IsOnVolume(*volume.catalog, id)) {
-          withoutRendition.push_back(id); // its removal was perhaps handled before
+        if (!photo.failure.empty()) {
+          if (catalog::MarkFailed(*volume.catalog, photo.photo, photo.failure, stamp)) {
+            withoutRendition.push_back(id);
+            ++changes;
+          }
+        } else if (written.contains(id)) {
+          if (catalog::MarkFinished(*volume.catalog, photo.photo, stamp)) {
+            ++changes;
+          } else if (!catalog::IsOnVolume(*volume.catalog, id)) {
+            withoutRendition.push_back(id); // its removal was perhaps handled before
+          }
         }
       }
     }
     if (changes > 0) {
       transaction.Commit();
+      storeAt_ = Clock::now() + catalog::PauseAfterStamp(stamp, std::time(nullptr));
     }
   }
   changes_ += changes;
@@ -536,11 +567,12 @@ void Volume::CheckNextFolder(const Opened& volume, const IsInBatch& isInBatch) {
   std::erase_if(expected, [this](long long id) { return id >= nextToCheck_; });
   const auto missing = CheckFolder(volume.root, first, expected, isInBatch);
   if (!missing.empty()) {
-    db::Transaction transaction(catalog, catalog::BUSY_TIMEOUT);
+    db::Transaction transaction(catalog, LOCK_TIMEOUT);
     for (const long long id : missing) {
       catalog::MarkMissing(catalog, id);
     }
     transaction.Commit();
+    lockedSince_.reset();
     Count(catalog);
     last_.reset();
     isExhausted_ = false;

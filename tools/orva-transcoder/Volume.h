@@ -60,12 +60,14 @@ public:
 
   /// Result of Store.
   enum class Stored {
-    Done,  ///< including the case that the batch has become useless
-    Later, ///< another program uses the catalog: the same call may work in some seconds
+    Done,  ///< including the case that the batches have become useless
+    Later, ///< another program uses the catalog: the same call may work at StoreAt
   };
 
-  /// Writes the renditions of a batch to the volume and its results to the catalog.
-  Stored Store(Batch& batch);
+  /// Writes the renditions of the batches to the volume and their results to the catalog, with one
+  /// stamp. Not before StoreAt.
+  Stored Store(const std::vector<Batch*>& batches);
+  Clock::time_point StoreAt() const noexcept { return storeAt_; }
 
   /// Whether the renditions on the volume still have to be compared with the catalog.
   bool HasUncheckedRenditions() const;
@@ -119,7 +121,8 @@ private:
                   Room& room);
   /// Returns the ids of the photos whose renditions are in their places.
   std::set<long long> WriteRenditions(const Opened& volume, Batch& batch);
-  void MarkResults(const Opened& volume, const Batch& batch, const std::set<long long>& written);
+  void MarkResults(const Opened& volume, const std::vector<Batch*>& batches,
+                   const std::set<long long>& written);
   void ReportObstacle(const std::string& text);
   void CheckNextFolder(const Opened& volume, const IsInBatch& isInBatch);
   void CheckNextOtherFolder(const Opened& volume, const IsInBatch& isInBatch);
@@ -141,6 +144,8 @@ private:
   bool isChecked_ = true; ///< all renditions are
   bool hasReportedObstacle_ = false;
   std::string problem_; ///< as it was last logged, until renditions are written again
+  Clock::time_point storeAt_{};
+  std::optional<Clock::time_point> lockedSince_; ///< the catalog, by another program
   bool isBusy_ = false; ///< another program used the catalog when work last failed
   std::optional<Clock::time_point> lookAgainAt_;
 };
