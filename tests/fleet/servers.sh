@@ -37,6 +37,8 @@ save_blocks() {
   done >queries-clickhouse.sql
   blocks "$page" sql 'Removing an appliance' >remove.sql
   blocks "$page" sh 'Removing an appliance' >remove-clickhouse.sh
+  [[ $(cat -- * | wc --lines) == "$(awk '/^```/ { inside = !inside; next } inside' "$page" | wc --lines)" ]] ||
+    fail "$page has a block that is not saved here, or is saved twice"
 }
 
 # The names of the shards. No interface has these addresses: a server takes a shard with its own port and an
@@ -135,7 +137,6 @@ start_shard() {
   shards[$1]=$!
   await on_shard "$1" "SELECT 1"
 }
-
 
 # on_shard NUMBER SQL: runs one statement there.
 on_shard() { curl --silent --show-error --fail-with-body "http://shard$1:8123/" --data-binary "$2"; }

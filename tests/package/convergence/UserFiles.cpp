@@ -115,7 +115,7 @@ void UserFiles::Change(Random& random, UserFiles& other) {
   }
 }
 
-/// As cp does, or as programs that write a temporary file first.
+/// Copies as cp does, or as programs that write a temporary file first.
 void UserFiles::CopyAny(Random& random) {
   const std::string path = NewPath(random);
   const std::size_t index = AnyTemplate(random);
@@ -185,7 +185,7 @@ void UserFiles::TouchFile(Random& random) const {
   }
 }
 
-/// Which is never indexed.
+/// A link or a FIFO, which are never indexed.
 void UserFiles::MakeSpecialFile(Random& random) {
   const std::string path = NewPath(random);
   if (IsTaken(path)) {

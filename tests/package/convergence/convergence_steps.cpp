@@ -310,7 +310,7 @@ TEST_F(Convergent, ALargeFileThatIsCopiedSlowlyWaitsUntilItIsClosed) {
     for (int i = 0; i < chunks; ++i) {
       film << zeros << std::flush;
       photo << "more" << std::flush;
-      const std::string other = "beside" + std::to_string(i) + ".jpg";
+      const std::string other = "meanwhile" + std::to_string(i) + ".jpg";
       disk.Copy(static_cast<std::size_t>(i) % 8, other);
       ASSERT_TRUE(Await([&] { return IsMerged(disk, other); }));
       ASSERT_THAT(CatalogRows(disk, "film.mov"), IsEmpty());
@@ -515,7 +515,6 @@ TEST_F(Convergent, TheMasterIsPulled) {
 
 /// Runs SQL on a catalog.
 void ChangeCatalog(const std::string& volume, const std::string& sql) {
-
   SQLite::Database(volume + "/.orva/orva.db", SQLite::OPEN_READWRITE, 10'000).exec(sql);
 }
 
@@ -716,7 +715,7 @@ TEST_F(Convergent, AVolumeWhoseNamesAreExchangedAllTheTimeLeadsNowhereElse) {
     fs::remove_all(link);
   }
   // Volumes in trouble are looked at again when something is mounted.
-  Unmount(root + "/../Disk");
+  Unmount(DISK);
   MountDisk("A");
   ExpectConvergence(root + "|src/orvadb/|" + UNMOUNTED);
   Unmount(root);
