@@ -628,7 +628,7 @@ class Tree {
     }
   }
 
-  // The top of the tree is a single folder.
+  // A single folder shows its folders at once.
   openOnly() {
     if (this.list.children.length === 1) {
       this.list.querySelector(".toggle")?.click();
