@@ -5,6 +5,7 @@
 #include "hostile/SpecialFile.h"
 #include "support/OtherUsers.h"
 #include "support/Programs.h"
+#include "system/PeakMemory.h"
 
 #include <poll.h>
 #include <sys/mount.h>
@@ -26,17 +27,6 @@ class WebHostile : public WebTest {
 protected:
   std::string Target(const std::string& path, const std::string& file) const {
     return "/photos/" + IdOf(path) + file;
-  }
-
-  /// Kibibytes of a line of the program's status.
-  long Memory(const std::string& name) const {
-    std::ifstream status("/proc/" + std::to_string(web->Pid()) + "/status");
-    for (std::string line; std::getline(status, line);) {
-      if (line.starts_with(name + ":")) {
-        return std::stol(line.substr(name.size() + 1));
-      }
-    }
-    return -1;
   }
 
   /// Stops the daemon, changes its database, and lets zophotos-web start with that.
@@ -215,7 +205,7 @@ TEST_F(WebHostile, AThousandConnectionsTakeLittleMemory) {
   }
   EXPECT_EQ(200, Get("/").status);
   if (!AreProgramsSanitized()) {
-    EXPECT_LT(Memory("VmHWM"), 96 << 10);
+    EXPECT_LT(PeakOf(web->Pid()), 96 << 10);
   }
 }
 

@@ -628,7 +628,7 @@ class Tree {
     }
   }
 
-  // A single folder shows its folders at once.
+  // The top of the tree is a single folder.
   openOnly() {
     if (this.list.children.length === 1) {
       this.list.querySelector(".toggle")?.click();
