@@ -6,6 +6,7 @@
 #include <linux/audit.h>
 #include <linux/filter.h>
 #include <linux/seccomp.h>
+#include <sys/mount.h>
 #include <sys/prctl.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
@@ -106,6 +107,29 @@ TEST_P(VolumeRootTest, OpensNothingOutside) {
   EXPECT_EQ(std::to_string(EXDEV), Open("../outside"));
   EXPECT_EQ(std::to_string(EXDEV), Open("a/../../outside"));
   EXPECT_EQ(std::to_string(EXDEV), Open(outside.string()));
+  EXPECT_EQ(std::to_string(EXDEV), Open(".."));
+  // The system sees a path up to its first NUL.
+  EXPECT_EQ(std::to_string(EXDEV), Open(std::string("..\0", 3), O_PATH));
+  EXPECT_EQ(std::to_string(EXDEV), Open(std::string("..\0/", 4), O_PATH));
+}
+
+TEST_P(VolumeRootTest, FollowsNoLinkOfTheProcessFileSystem) {
+  ASSERT_EQ(0, mount("proc", (root / "a").c_str(), "proc", 0, nullptr));
+  EXPECT_EQ(std::to_string(ELOOP), Open("a/self/root"));
+  const std::string process = "a/" + std::to_string(getpid());
+  EXPECT_EQ("folder", Open(process));
+  EXPECT_EQ(std::to_string(ELOOP), Open(process + "/root"));
+  EXPECT_EQ(std::to_string(ELOOP), Open(process + "/root/tmp/outside"));
+  EXPECT_EQ(std::to_string(ELOOP), Open(process + "/cwd/"));
+  EXPECT_EQ(0, umount((root / "a").c_str()));
+}
+
+TEST_P(VolumeRootTest, DoesNotWaitForAFifo) {
+  ASSERT_EQ(0, mkfifo((root / "fifo").c_str(), 0600));
+  EXPECT_EQ("", Open("fifo"));
+  EXPECT_EQ(std::to_string(ENXIO), Open("fifo", O_WRONLY));
+  EXPECT_EQ(std::to_string(ENOTDIR), Open("fifo/file"));
+  EXPECT_EQ(std::to_string(ENOTDIR), Open("fifo/"));
 }
 
 TEST_P(VolumeRootTest, SaysWhatIsMissing) {

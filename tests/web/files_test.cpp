@@ -12,6 +12,7 @@
 
 #include <fcntl.h>
 #include <grp.h>
+#include <malloc.h>
 #include <sys/mount.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
@@ -147,6 +148,26 @@ TEST_F(WebFiles, OfPagesAreLookedUpTogether) {
   // Was looked up with a.jpg: the content of the catalog does not matter any more.
   catalog.Rows().Run("DELETE FROM Files");
   EXPECT_EQ("rendition b", Rendition("sea/b.jpg"));
+}
+
+// As after the election of another master: the ids of photos are given again.
+TEST_F(WebFiles, AreNotMixedUpWhenAnotherPhotoHasTheId) {
+  EXPECT_EQ("rendition a", Rendition("a.jpg"));
+  Photo other = PhotoAt("sea/b.jpg");
+  other.id = PhotoAt("a.jpg").id;
+  EXPECT_EQ("rendition b", ContentOf(files.OpenRendition(other)));
+}
+
+TEST_F(WebFiles, ThatAreExpectedTakeLittleMemory) {
+  const std::size_t before = mallinfo2().uordblks;
+  for (int i = 0; i < 50; ++i) {
+    const std::string mountPoint = "/shares/" + std::to_string(i) + '/';
+    for (int page = 0; page < 10; ++page) {
+      const std::string folder = std::string(4000, 'x') + std::to_string(page) + '/';
+      files.Expect(std::vector<Photo>(100, PhotoAt(folder + "a.jpg", mountPoint)));
+    }
+  }
+  EXPECT_LT(mallinfo2().uordblks, before + (16 << 20));
 }
 
 TEST_F(WebFiles, AreLookedUpAgainInAnotherCatalog) {

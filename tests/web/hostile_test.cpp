@@ -5,6 +5,7 @@
 #include "hostile/SpecialFile.h"
 #include "support/OtherUsers.h"
 #include "support/Programs.h"
+#include "system/PeakMemory.h"
 
 #include <poll.h>
 #include <sys/mount.h>
@@ -28,15 +29,23 @@ protected:
     return "/photos/" + IdOf(path) + file;
   }
 
-  /// Kibibytes of a line of the program's status.
-  long Memory(const std::string& name) const {
-    std::ifstream status("/proc/" + std::to_string(web->Pid()) + "/status");
-    for (std::string line; std::getline(status, line);) {
-      if (line.starts_with(name + ":")) {
-        return std::stol(line.substr(name.size() + 1));
-      }
+  /// Stops the daemon, changes its database, and lets zophotos-web start with that.
+  void Craft(const Lines& statements) {
+    appliance.Shutdown();
+    const Database merged("/shares/A//.zophotos/zophotos.db");
+    for (const std::string& sql : statements) {
+      merged.Run(sql);
     }
-    return -1;
+    StopWeb();
+    fs::remove_all("/tmp/cache");
+    // The daemon's end empties the locator.
+    std::ofstream("/tmp/zophotodbmerger.conf") << LocatorOn(a.Path());
+    StartWeb();
+    const auto end = std::chrono::steady_clock::now() + DEADLINE;
+    while (GetJson("/api/status").at("state") != "current" &&
+           std::chrono::steady_clock::now() < end) {
+      poll(nullptr, 0, 20);
+    }
   }
 
   static inline const std::string ONE = "/shares/A/sea/one.jpg";
@@ -77,30 +86,17 @@ TEST_F(WebHostile, FoldersThatBecomeLinksAreNotFollowed) {
 TEST_F(WebHostile, CraftedDatabasesLeadNowhereElse) {
   Write("/tmp/secret.jpg", "secret");
   Write("/shares/secret.jpg", "secret");
-  appliance.Shutdown();
-  const Database merged("/shares/A//.zophotos/zophotos.db");
-  merged.Run("UPDATE Folders SET name = '/shares/A/../../tmp/' WHERE name = '/shares/A/sea/'");
-  merged.Run("INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT "
-             "folder_id, '../secret.jpg', 5, volume, 6 FROM Folders WHERE name = '/shares/A/'");
-  merged.Run("INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT "
-             "folder_id, '.orva/orva.db', 5, volume, 6 FROM Folders WHERE name = '/shares/A/'");
-  merged.Run("INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT "
-             "folder_id, 'secret.jpg', 5, '/', 6 FROM Folders WHERE name = '/shares/'");
-  merged.Run(
-      "INSERT INTO Folders(parent_folder_id, name, modified_date, volume) VALUES(1, '/tmp/', "
-      "0, '/tmp/'), (1, '/shares/A/x/', 0, '/shares/')");
-  merged.Run("INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT "
-             "folder_id, 'secret.jpg', 5, volume, 6 FROM Folders WHERE name = '/tmp/'");
-  StopWeb();
-  fs::remove_all("/tmp/cache");
-  // The daemon's end empties the locator.
-  std::ofstream("/tmp/zophotodbmerger.conf") << LocatorOn(a.Path());
-  StartWeb();
-  const auto end = std::chrono::steady_clock::now() + DEADLINE;
-  while (GetJson("/api/status").at("state") != "current" &&
-         std::chrono::steady_clock::now() < end) {
-    poll(nullptr, 0, 20);
-  }
+  Craft({"UPDATE Folders SET name = '/shares/A/../../tmp/' WHERE name = '/shares/A/sea/'",
+         "INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT "
+         "folder_id, '../secret.jpg', 5, volume, 6 FROM Folders WHERE name = '/shares/A/'",
+         "INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT "
+         "folder_id, '.orva/orva.db', 5, volume, 6 FROM Folders WHERE name = '/shares/A/'",
+         "INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT "
+         "folder_id, 'secret.jpg', 5, '/', 6 FROM Folders WHERE name = '/shares/'",
+         "INSERT INTO Folders(parent_folder_id, name, modified_date, volume) VALUES(1, '/tmp/', "
+         "0, '/tmp/'), (1, '/shares/A/x/', 0, '/shares/')",
+         "INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT "
+         "folder_id, 'secret.jpg', 5, volume, 6 FROM Folders WHERE name = '/tmp/'"});
   const Json photos = GetJson("/api/photos").at("photos");
   EXPECT_FALSE(photos.empty());
   for (const Json& photo : photos) {
@@ -112,6 +108,15 @@ TEST_F(WebHostile, CraftedDatabasesLeadNowhereElse) {
     }
     EXPECT_EQ(200, Get("/photos/" + id).status) << photo;
   }
+}
+
+TEST_F(WebHostile, FoldersOutsideTheTreeAreAtItsTop) {
+  Craft({"INSERT INTO Folders(parent_folder_id, name, modified_date, volume) VALUES(999, "
+         "'/elsewhere/', 0, '/elsewhere/')"});
+  const Json folders = GetJson("/api/folders").at("folders");
+  ASSERT_EQ(2U, folders.size());
+  EXPECT_EQ("/elsewhere/", folders.at(0).at("path"));
+  EXPECT_EQ("/shares/", folders.at(1).at("path"));
 }
 
 TEST_F(WebHostile, VolumesPulledDuringADownloadEndNothingElse) {
@@ -200,7 +205,7 @@ TEST_F(WebHostile, AThousandConnectionsTakeLittleMemory) {
   }
   EXPECT_EQ(200, Get("/").status);
   if (!AreProgramsSanitized()) {
-    EXPECT_LT(Memory("VmHWM"), 96 << 10);
+    EXPECT_LT(PeakOf(web->Pid()), 96 << 10);
   }
 }
 

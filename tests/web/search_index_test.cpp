@@ -164,6 +164,17 @@ TEST(SearchIndex, ASampleFindsThePrefixesThatManyPhotosHave) {
   }
 }
 
+TEST(SearchIndex, ASampleFindsPrefixesThatReturnInAPeriod) {
+  constexpr int photos = 1'000'000;
+  web::PrefixSample sample(photos);
+  for (int i = 0; i < photos; ++i) {
+    if (sample.Next()) {
+      sample.Add(std::to_string(1000 + i % 1000)); // as cameras number photos, folder by folder
+    }
+  }
+  EXPECT_THAT(sample.Frequent(), ::testing::IsSupersetOf({"10", "102", "155", "199"}));
+}
+
 TEST(SearchIndex, FewPhotosHaveNoFrequentPrefixes) {
   web::PrefixSample sample(1000);
   for (int i = 0; i < 1000; ++i) {

@@ -156,6 +156,8 @@ TEST_F(WebServer, SendsTheSecurityHeadersWithEachResponse) {
     const HttpResponse response = connection.ReadHeaders();
     EXPECT_THAT(response.Header("content-security-policy"), StartsWith("default-src 'self'"));
     EXPECT_THAT(response.Header("content-security-policy"), HasSubstr("frame-ancestors 'none'"));
+    EXPECT_THAT(response.Header("content-security-policy"),
+                HasSubstr("require-trusted-types-for 'script'; trusted-types 'none'"));
     EXPECT_EQ("nosniff", response.Header("x-content-type-options"));
     EXPECT_EQ("no-referrer", response.Header("referrer-policy"));
     EXPECT_EQ("same-origin", response.Header("cross-origin-resource-policy"));

@@ -3,8 +3,12 @@
 #include "SnapshotTest.h"
 
 #include "hostile/CraftedDatabase.h"
+#include "support/Programs.h"
+#include "system/PeakMemory.h"
 
 #include <gmock/gmock.h>
+
+#include <unistd.h>
 
 #include <filesystem>
 #include <fstream>
@@ -214,6 +218,26 @@ TEST_F(HostileDatabase, TheNumberOfVolumesIsLimited) {
   EXPECT_THAT(reader_->Volumes(), SizeIs(1000));
   EXPECT_THAT(Names(InVolume("/shares/V1/")), SizeIs(1));
   EXPECT_THAT(Names(InVolume("/shares/V14000/")), IsEmpty());
+}
+
+TEST_F(HostileDatabase, ManyVolumesWithLongNamesTakeLittleMemory) {
+  merged_->Run("BEGIN");
+  for (int i = 0; i < 15'000; ++i) {
+    const std::string volume = "/shares/" + std::to_string(i) + std::string(4000, 'x') + "/";
+    merged_->AddFile(folder_, "1.jpg", i, volume);
+    merged_->Run("INSERT INTO Statistics(volume, photos_xcoded, photos_total, last_updated_time) "
+                 "VALUES(?, 1, 1, 1)",
+                 {volume});
+  }
+  merged_->Run("COMMIT");
+  const PeakMemory peak(getpid());
+  Start();
+  Update();
+  EXPECT_EQ(snapshot_->Status().state, State::Current);
+  EXPECT_THAT(reader_->Volumes(), SizeIs(1000));
+  if (!AreProgramsSanitized()) {
+    EXPECT_LT(peak.Growth(), 64 << 10);
+  }
 }
 
 TEST_F(HostileDatabase, StatisticsOfAnyTypeAreShown) {

@@ -76,9 +76,10 @@ util::FileDescriptor VolumeRoot::Open(const std::string& path, int flags, mode_t
   how.flags = static_cast<std::uint64_t>(flags);
   how.mode = mode;
   how.resolve = RESOLVE_BENEATH | RESOLVE_NO_SYMLINKS;
-  const std::string relative = path.empty() ? "." : path;
+  // Ends at the first NUL, as for the system: "..\0" is "..".
+  const char* const relative = path.empty() ? "." : path.c_str();
   util::FileDescriptor file(
-      static_cast<int>(syscall(SYS_openat2, root_.Get(), relative.c_str(), &how, sizeof how)));
+      static_cast<int>(syscall(SYS_openat2, root_.Get(), relative, &how, sizeof how)));
   // systemd refuses openat2 to services with RestrictSUIDSGID=yes, so to those with
   // DynamicUser=yes.
   return file || errno != ENOSYS ? std::move(file)

@@ -44,7 +44,7 @@ constexpr std::chrono::seconds LONGEST_STEP(5);
 constexpr int LONGEST_VALUE = 100'000;
 
 constexpr std::size_t LONGEST_NAME = 4096;
-constexpr int MOST_STATISTICS = 10'000;
+constexpr int MOST_STATISTICS = 1'000;
 
 /// Interrupts the connection's statements if they still run after LONGEST_STEP.
 class WorkLimit {

@@ -9,7 +9,7 @@
 #include <fcntl.h>
 #include <sys/stat.h>
 
-#include <algorithm>
+#include <utility>
 
 namespace orva::web {
 namespace {
@@ -31,73 +31,77 @@ std::string ReasonOf(const std::string& message) {
   return message.substr(begin, message.find(" (extended code ", begin) - begin);
 }
 
-} // namespace
-
-const std::int64_t* RenditionIds::Found::Find(PhotoId photo) const {
-  for (const auto* const ids : {&newer_, &older_}) {
-    const auto found = ids->find(photo);
-    if (found != ids->end()) {
-      return &found->second;
-    }
-  }
-  return nullptr;
-}
-
-void RenditionIds::Found::Add(PhotoId photo, std::int64_t id) {
-  if (newer_.size() >= MOST / 2) {
-    older_ = std::exchange(newer_, {});
-  }
-  newer_[photo] = id;
-}
-
-void RenditionIds::Expect(const std::vector<Photo>& photos) {
-  for (const Photo& photo : photos) {
-    const auto path = Locate(photo);
-    if (!path) {
-      continue;
-    }
-    const auto volume = VolumeAt(path->root);
-    const std::lock_guard lock(mutex_);
-    if (volume->found.Find(photo.id) == nullptr) {
-      volume->expected.emplace_back(photo.id, path->relative);
-    }
-    if (volume->expected.size() > MOST_EXPECTED) {
-      volume->expected.pop_front();
-    }
-  }
-}
-
-std::optional<std::int64_t> RenditionIds::Find(PhotoId photo, const VolumePath& path,
-                                               const catalog::VolumeRoot& volume) {
-  const auto known = VolumeAt(path.root);
-  auto catalog = Identify(volume);
-  if (!catalog) {
-    return std::nullopt;
-  }
-  if (const auto id = FindKnown(*known, *catalog, photo)) {
-    return id;
-  }
-  const std::lock_guard lookUp(known->lookUp);
-  catalog = Identify(volume);
-  if (!catalog) {
-    return std::nullopt;
-  }
-  if (const auto id = FindKnown(*known, *catalog, photo)) {
-    return id; // by another thread meanwhile
-  }
-  LookUp(*known, *catalog, photo, path, volume);
-  return FindKnown(*known, *catalog, photo);
-}
-
-std::optional<RenditionIds::Identity> RenditionIds::Identify(const catalog::VolumeRoot& volume) {
+/// Identifies the catalog of a volume; nothing if it has none.
+std::optional<std::string> Identify(const catalog::VolumeRoot& volume) {
   const util::FileDescriptor file = volume.Open(core::GetCatalogPath(""), O_PATH);
   struct statx status {};
   if (!file || statx(file.Get(), "", AT_EMPTY_PATH, STATX_INO | STATX_BTIME, &status) != 0) {
     return std::nullopt;
   }
-  return Identity{.device = std::uint64_t{status.stx_dev_major} << 32 | status.stx_dev_minor,
-                  .inode = status.stx_ino,
-                  .birth = status.stx_btime.tv_sec * 1'000'000'000 + status.stx_btime.tv_nsec};
+  std::string identity;
+  for (const std::uint64_t number :
+       {std::uint64_t{status.stx_dev_major}, std::uint64_t{status.stx_dev_minor},
+        std::uint64_t{status.stx_ino}, static_cast<std::uint64_t>(status.stx_btime.tv_sec),
+        std::uint64_t{status.stx_btime.tv_nsec}}) {
+    identity += std::to_string(number) + ' ';
+  }
+  return identity;
+}
+
+} // namespace
+
+std::optional<std::int64_t> RenditionIds::Found::Find(const std::string& key) const {
+  for (const auto* const ids : {&newer_, &older_}) {
+    const auto found = ids->find(key);
+    if (found != ids->end()) {
+      return found->second;
+    }
+  }
+  return std::nullopt;
+}
+
+void RenditionIds::Found::Add(const std::string& key, std::int64_t id) {
+  constexpr std::size_t OVERHEAD = 100;
+  if (bytes_ >= MOST_BYTES) {
+    older_ = std::exchange(newer_, {});
+    bytes_ = 0;
+  }
+  newer_[key] = id;
+  bytes_ += key.size() + OVERHEAD;
+}
+
+void RenditionIds::Expect(const std::vector<Photo>& photos) {
+  const std::lock_guard lock(mutex_);
+  for (const Photo& photo : photos) {
+    if (auto path = Locate(photo)) {
+      expected_.push_back(std::move(*path));
+    }
+    if (expected_.size() > MOST_EXPECTED) {
+      expected_.pop_front();
+    }
+  }
+}
+
+std::optional<std::int64_t> RenditionIds::Find(const VolumePath& path,
+                                               const catalog::VolumeRoot& volume) {
+  auto catalog = Identify(volume);
+  if (!catalog) {
+    return std::nullopt;
+  }
+  if (const auto id = FindKnown(*catalog, path)) {
+    return id;
+  }
+  const auto known = VolumeAt(path.root);
+  const std::lock_guard lookUp(known->lookUp);
+  catalog = Identify(volume);
+  if (!catalog) {
+    return std::nullopt;
+  }
+  if (const auto id = FindKnown(*catalog, path)) {
+    return id; // by another thread meanwhile
+  }
+  LookUp(*known, *catalog, path, volume);
+  return FindKnown(*catalog, path);
 }
 
 std::shared_ptr<RenditionIds::Volume> RenditionIds::VolumeAt(const std::string& root) {
@@ -112,41 +116,49 @@ std::shared_ptr<RenditionIds::Volume> RenditionIds::VolumeAt(const std::string& 
   return volume;
 }
 
-std::optional<std::int64_t> RenditionIds::FindKnown(Volume& volume, const Identity& catalog,
-                                                    PhotoId photo) {
+std::optional<std::int64_t> RenditionIds::FindKnown(const std::string& catalog,
+                                                    const VolumePath& path) {
   const std::lock_guard lock(mutex_);
-  if (volume.catalog != catalog) {
-    volume.catalog = catalog;
-    volume.found = {};
-  }
-  const std::int64_t* const id = volume.found.Find(photo);
-  return id == nullptr ? std::nullopt : std::optional(*id);
+  return found_.Find(catalog + path.relative);
 }
 
-/// Reads the ids of `photo` and of those that are expected.
-void RenditionIds::LookUp(Volume& known, const Identity& catalog, PhotoId photo,
-                          const VolumePath& path, const catalog::VolumeRoot& volume) {
-  std::vector<PhotoId> photos{photo};
+/// The path, and those that are expected on the same volume and not known, the latest first.
+std::vector<std::string> RenditionIds::TakeExpected(const std::string& catalog,
+                                                    const VolumePath& path) {
   std::vector<std::string> paths{path.relative};
+  const std::lock_guard lock(mutex_);
+  for (auto expected = expected_.end();
+       expected != expected_.begin() && paths.size() < MOST_AT_ONCE;) {
+    --expected;
+    if (expected->root != path.root) {
+      continue;
+    }
+    if (!found_.Find(catalog + expected->relative)) {
+      paths.push_back(std::move(expected->relative));
+    }
+    expected = expected_.erase(expected);
+  }
+  return paths;
+}
+
+/// Reads the ids of the photo at `path` and of those that are expected.
+void RenditionIds::LookUp(Volume& known, const std::string& catalog, const VolumePath& path,
+                          const catalog::VolumeRoot& volume) {
   {
     const std::lock_guard lock(mutex_);
     if (Clock::now() < known.nextTry) {
       return;
     }
-    while (!known.expected.empty() && photos.size() < MOST_AT_ONCE) {
-      photos.push_back(known.expected.back().first);
-      paths.push_back(std::move(known.expected.back().second));
-      known.expected.pop_back();
-    }
   }
+  const std::vector<std::string> paths = TakeExpected(catalog, path);
   try {
     const auto ids = FindFileIds(volume, paths, watch_);
     const bool isSame = Identify(volume) == catalog;
     const std::lock_guard lock(mutex_);
     known.hasFailed = false;
-    for (std::size_t i = 0; isSame && i < photos.size(); ++i) {
+    for (std::size_t i = 0; isSame && i < paths.size(); ++i) {
       if (ids[i]) {
-        known.found.Add(photos[i], *ids[i]);
+        found_.Add(catalog + paths[i], *ids[i]);
       }
     }
   } catch (const std::string& reason) {

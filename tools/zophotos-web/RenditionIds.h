@@ -4,9 +4,6 @@
 #include "VolumePaths.h"
 #include "WorkWatch.h"
 
-#include <sys/types.h>
-
-#include <array>
 #include <chrono>
 #include <cstddef>
 #include <cstdint>
@@ -18,7 +15,6 @@
 #include <optional>
 #include <string>
 #include <unordered_map>
-#include <utility>
 #include <vector>
 
 namespace orva::catalog {
@@ -42,53 +38,42 @@ public:
 
   /// The id of the photo at `path` on `volume`. Nothing if the catalog does not have it, or cannot
   /// be read at the moment.
-  std::optional<std::int64_t> Find(PhotoId photo, const VolumePath& path,
-                                   const catalog::VolumeRoot& volume);
+  std::optional<std::int64_t> Find(const VolumePath& path, const catalog::VolumeRoot& volume);
 
 private:
   using Clock = std::chrono::steady_clock;
 
-  /// Identifies a catalog file.
-  struct Identity {
-    std::uint64_t device = 0;
-    std::uint64_t inode = 0;
-    std::int64_t birth = 0; ///< nanoseconds since the epoch; 0 for unknown
-
-    bool operator==(const Identity&) const = default;
-  };
-
-  /// Ids that were found. Forgets the older ones when there are many.
+  /// Ids that were found, by catalog and path. Forgets the older ones when there are many.
   class Found {
   public:
-    const std::int64_t* Find(PhotoId photo) const;
-    void Add(PhotoId photo, std::int64_t id);
+    std::optional<std::int64_t> Find(const std::string& key) const;
+    void Add(const std::string& key, std::int64_t id);
 
   private:
-    static constexpr std::size_t MOST = 20'000;
-    std::unordered_map<PhotoId, std::int64_t> newer_;
-    std::unordered_map<PhotoId, std::int64_t> older_;
+    static constexpr std::size_t MOST_BYTES = 2 << 20; ///< of each of the two
+    std::unordered_map<std::string, std::int64_t> newer_;
+    std::unordered_map<std::string, std::int64_t> older_;
+    std::size_t bytes_ = 0; ///< of newer_
   };
 
   struct Volume {
-    std::mutex lookUp; ///< held while the catalog is read; taken before mutex_
-    Identity catalog;  ///< that `found` is of
-    Found found;
-    std::deque<std::pair<PhotoId, std::string>> expected; ///< and paths on the volume
-    Clock::time_point nextTry{};                          ///< after a failure
+    std::mutex lookUp;         ///< held while the catalog is read; taken before mutex_
+    Clock::time_point nextTry; ///< after a failure
     bool hasFailed = false;
   };
 
-  static std::optional<Identity> Identify(const catalog::VolumeRoot& volume);
-
   std::shared_ptr<Volume> VolumeAt(const std::string& root);
-  std::optional<std::int64_t> FindKnown(Volume& volume, const Identity& catalog, PhotoId photo);
-  void LookUp(Volume& known, const Identity& catalog, PhotoId photo, const VolumePath& path,
+  std::optional<std::int64_t> FindKnown(const std::string& catalog, const VolumePath& path);
+  std::vector<std::string> TakeExpected(const std::string& catalog, const VolumePath& path);
+  void LookUp(Volume& known, const std::string& catalog, const VolumePath& path,
               const catalog::VolumeRoot& volume);
 
   Log log_;
   WorkWatch watch_;
   std::mutex mutex_;                                       ///< of the following, and what it holds
   std::map<std::string, std::shared_ptr<Volume>> volumes_; ///< by their folders
+  std::deque<VolumePath> expected_;
+  Found found_;
 };
 
 } // namespace orva::web

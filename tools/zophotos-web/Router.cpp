@@ -94,6 +94,13 @@ Json FirstId(const std::vector<Photo>& photos) {
   return photos.empty() ? Json() : Json(std::to_string(photos.front().id));
 }
 
+/// The folder whose folders are the top of the tree: the one that contains the volumes. -1, for all
+/// folders without a parent, if a crafted database has others.
+std::int64_t TopOf(const Readers::Lease& reader) {
+  const std::vector<Folder> top = reader->Folders(-1, "", 2);
+  return top.size() == 1 && top.front().path == "/shares/" ? top.front().id : -1;
+}
+
 /// The path of the folder that a list of folders continues after.
 std::string PathAfter(const Readers::Lease& reader, const std::optional<std::int64_t>& folder) {
   const auto found = folder ? reader->FindFolder(*folder) : std::nullopt;
@@ -245,8 +252,9 @@ Response Router::FoldersView(const Target& target, std::optional<std::int64_t> f
       }
       view.ancestors = reader->Ancestors(*folder);
     }
-    view.folders = reader->Folders(
-        folder.value_or(-1), PathAfter(reader, ParseId(target, "after_folder")), PAGE_SIZE + 1);
+    view.folders =
+        reader->Folders(folder ? *folder : TopOf(reader),
+                        PathAfter(reader, ParseId(target, "after_folder")), PAGE_SIZE + 1);
     view.hasMoreFolders = CutOff(view.folders, PAGE_SIZE, false);
   }
   if (folder) {
@@ -332,7 +340,8 @@ Response Router::PhotoJson(const Target& target, PhotoId id) {
 Response Router::FoldersJson(const Target& target) {
   const std::size_t count = ParseCount(target);
   const Readers::Lease reader(readers_);
-  auto folders = reader->Folders(ParseId(target, "parent").value_or(-1),
+  const auto parent = ParseId(target, "parent");
+  auto folders = reader->Folders(parent ? *parent : TopOf(reader),
                                  PathAfter(reader, ParseId(target, "after")), count + 1);
   const bool more = CutOff(folders, count, false);
   return JsonText({{"folders", Array(folders)}, {"more", more}});

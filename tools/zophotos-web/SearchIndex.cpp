@@ -16,11 +16,9 @@ namespace {
 /// Bytes of a word that count.
 constexpr std::size_t LONGEST_WORD = 64;
 
-/// A prefix of so many bytes is frequent if more photos than this have it. To collect so many
-/// photos takes some 20 milliseconds. There are few short prefixes.
-constexpr std::int64_t FrequentFrom(std::size_t length) {
-  return length == 1 ? 8'000 : length == 2 ? 32'000 : 64'000;
-}
+/// A prefix is frequent if more photos than this have it. To collect so many photos takes some
+/// milliseconds.
+constexpr std::int64_t FREQUENT_FROM = 8'000;
 constexpr std::size_t LONGEST_PREFIX = 16;
 
 constexpr std::int64_t SAMPLED_PHOTOS = 20'000;
@@ -294,7 +292,8 @@ std::optional<std::string> FrequentPrefixes::Find(std::string_view word, std::si
 }
 
 PrefixSample::PrefixSample(std::int64_t photos)
-    : interval_(std::max<std::int64_t>(photos / SAMPLED_PHOTOS, 1)) {}
+    : interval_(static_cast<std::uint_fast32_t>(
+          std::clamp<std::int64_t>(photos / SAMPLED_PHOTOS, 1, std::minstd_rand::max()))) {}
 
 void PrefixSample::Add(std::string_view words) {
   ForEachWord(words, [this](std::string_view word) {
@@ -325,7 +324,7 @@ std::vector<std::string> PrefixSample::Frequent() const {
         count += word->second;
       }
       // A single word, or words with a longer common prefix, are searched for under their own name.
-      if (count * interval_ > FrequentFrom(length) && std::next(begin) != end &&
+      if (count * static_cast<std::int64_t>(interval_) > FREQUENT_FROM && std::next(begin) != end &&
           IsBoundary(begin->first, length) &&
           CommonPrefix(begin->first, std::prev(end)->first) == length) {
         prefixes.emplace_back(prefix);

@@ -5,6 +5,7 @@
 #include <cstdint>
 #include <functional>
 #include <optional>
+#include <random>
 #include <string>
 #include <string_view>
 #include <unordered_map>
@@ -56,8 +57,8 @@ public:
   /// A sample of about `photos` photos.
   explicit PrefixSample(std::int64_t photos);
 
-  /// Whether the next photo belongs to the sample.
-  bool Next() { return next_++ % interval_ == 0; }
+  /// Whether the next photo belongs to the sample. At random: cameras and folders have periods.
+  bool Next() { return random_() % interval_ == 0; }
 
   /// Adds the words of a photo in the sample. Marks of volumes and folders do not count.
   void Add(std::string_view words);
@@ -72,8 +73,8 @@ private:
     }
   };
 
-  std::int64_t interval_;
-  std::int64_t next_ = 0;
+  std::uint_fast32_t interval_;
+  std::minstd_rand random_; ///< always the same numbers
   std::unordered_map<std::string, std::int64_t, Hash, std::equal_to<>> counts_;
 };
 

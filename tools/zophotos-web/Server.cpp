@@ -24,7 +24,8 @@ constexpr unsigned SILENCE = 30;                    // seconds
 /// read what we send.
 constexpr std::array<std::pair<const char*, const char*>, 7> SECURITY{
     {{"Content-Security-Policy", "default-src 'self'; object-src 'none'; base-uri 'none'; "
-                                 "form-action 'self'; frame-ancestors 'none'"},
+                                 "form-action 'self'; frame-ancestors 'none'; "
+                                 "require-trusted-types-for 'script'; trusted-types 'none'"},
      {"X-Content-Type-Options", "nosniff"},
      {"X-Frame-Options", "DENY"},
      {"Referrer-Policy", "no-referrer"},

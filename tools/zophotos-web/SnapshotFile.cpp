@@ -18,7 +18,7 @@ constexpr int APPLICATION = 0x5A505753;
 constexpr int FORMAT = 1;
 
 /// A crafted database may have any number of volumes.
-constexpr std::size_t MOST_VOLUMES = 10'000;
+constexpr std::int64_t MOST_VOLUMES = 1'000;
 
 /// Bytes of the words of folders to keep.
 constexpr std::size_t MOST_FOLDER_WORDS = 8 << 20;
@@ -224,8 +224,8 @@ std::optional<std::int64_t> SnapshotFile::VolumeNumber(std::string_view mountPoi
   if (query.executeStep()) {
     number = query.getColumn(0).getInt64();
   } else {
-    if (NumberIn(database_, "SELECT count(*) FROM Volumes") >=
-        static_cast<std::int64_t>(MOST_VOLUMES)) {
+    // No row is ever removed.
+    if (NumberIn(database_, "SELECT ifnull(max(number), 0) FROM Volumes") >= MOST_VOLUMES) {
       return std::nullopt;
     }
     SQLite::Statement& insert = Prepared("INSERT INTO Volumes(mountPoint) VALUES(?)");
