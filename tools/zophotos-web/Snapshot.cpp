@@ -66,6 +66,20 @@ void Log(const std::string& line) {
 
 } // namespace
 
+const char* NameOf(State state) {
+  switch (state) {
+  case State::NoDatabase:
+    return "no_database";
+  case State::Building:
+    return "building";
+  case State::Current:
+    return "current";
+  case State::Failed:
+    break;
+  }
+  return "failed";
+}
+
 /// Finds what is missing among the ids of the merged database.
 template <typename Id>
 class Missing {
