@@ -110,6 +110,21 @@ TEST_F(WebHostile, CraftedDatabasesLeadNowhereElse) {
   }
 }
 
+TEST_F(WebHostile, ADatabaseThatCannotBeReadIsLoggedOnce) {
+  StopWeb();
+  fs::remove_all("/tmp/cache");
+  appliance.Shutdown();
+  Write("/shares/A/.zophotos/zophotos.db", std::string(1000, 'x'));
+  std::ofstream("/tmp/zophotodbmerger.conf") << LocatorOn(a.Path());
+  web = std::make_unique<Program>(Program::Arguments{ProgramPath("zophotos-web"), "--cache",
+                                                     "/tmp/cache", "--listen", "127.0.0.1:0"});
+  const Lines lines{web->ReadLine(), web->ReadLine()};
+  EXPECT_THAT(lines, ::testing::UnorderedElementsAre(HasSubstr("file is not a database"),
+                                                     HasSubstr("listening on")));
+  web->Signal(SIGTERM);
+  EXPECT_EQ("(end)", web->ReadLine());
+}
+
 TEST_F(WebHostile, FoldersOutsideTheTreeAreAtItsTop) {
   Craft({"INSERT INTO Folders(parent_folder_id, name, modified_date, volume) VALUES(999, "
          "'/elsewhere/', 0, '/elsewhere/')"});

@@ -207,9 +207,6 @@ private:
     constexpr std::chrono::seconds longest(60);
     pause_ = std::clamp<std::chrono::seconds>(pause_ * 2, std::chrono::seconds(1), longest);
     nextTry_ = Clock::now() + pause_;
-    if (Status().reason != reason) {
-      Log(reason);
-    }
     SetStatus(State::Failed, reason);
   }
 
