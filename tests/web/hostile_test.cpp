@@ -86,17 +86,16 @@ TEST_F(WebHostile, FoldersThatBecomeLinksAreNotFollowed) {
 TEST_F(WebHostile, CraftedDatabasesLeadNowhereElse) {
   Write("/tmp/secret.jpg", "secret");
   Write("/shares/secret.jpg", "secret");
+  const std::string add =
+      "INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT folder_id, ";
+  const std::string addFolders =
+      "INSERT INTO Folders(parent_folder_id, name, modified_date, volume) VALUES";
   Craft({"UPDATE Folders SET name = '/shares/A/../../tmp/' WHERE name = '/shares/A/sea/'",
-         "INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT "
-         "folder_id, '../secret.jpg', 5, volume, 6 FROM Folders WHERE name = '/shares/A/'",
-         "INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT "
-         "folder_id, '.orva/orva.db', 5, volume, 6 FROM Folders WHERE name = '/shares/A/'",
-         "INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT "
-         "folder_id, 'secret.jpg', 5, '/', 6 FROM Folders WHERE name = '/shares/'",
-         "INSERT INTO Folders(parent_folder_id, name, modified_date, volume) VALUES(1, '/tmp/', "
-         "0, '/tmp/'), (1, '/shares/A/x/', 0, '/shares/')",
-         "INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT "
-         "folder_id, 'secret.jpg', 5, volume, 6 FROM Folders WHERE name = '/tmp/'"});
+         add + "'../secret.jpg', 5, volume, 6 FROM Folders WHERE name = '/shares/A/'",
+         add + "'.orva/orva.db', 5, volume, 6 FROM Folders WHERE name = '/shares/A/'",
+         add + "'secret.jpg', 5, '/', 6 FROM Folders WHERE name = '/shares/'",
+         addFolders + "(1, '/tmp/', 0, '/tmp/'), (1, '/shares/A/x/', 0, '/shares/')",
+         add + "'secret.jpg', 5, volume, 6 FROM Folders WHERE name = '/tmp/'"});
   const Json photos = GetJson("/api/photos").at("photos");
   EXPECT_FALSE(photos.empty());
   for (const Json& photo : photos) {
