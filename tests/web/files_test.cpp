@@ -158,6 +158,15 @@ TEST_F(WebFiles, AreNotMixedUpWhenAnotherPhotoHasTheId) {
   EXPECT_EQ("rendition b", ContentOf(files.OpenRendition(other)));
 }
 
+TEST_F(WebFiles, AreLookedUpAgainForAnotherPhotoAtTheSamePath) {
+  EXPECT_EQ("rendition a", Rendition("a.jpg"));
+  catalog.Rows().Run("UPDATE Files SET isDeleted = 1 WHERE path = 'a.jpg'");
+  catalog.Rows().Run("UPDATE Files SET path = 'a.jpg' WHERE path = 'sea/b.jpg'");
+  Photo other = PhotoAt("a.jpg");
+  ++other.id;
+  EXPECT_EQ("rendition b", ContentOf(files.OpenRendition(other)));
+}
+
 TEST_F(WebFiles, ThatAreExpectedTakeLittleMemory) {
   const std::size_t before = mallinfo2().uordblks;
   for (int i = 0; i < 50; ++i) {

@@ -86,17 +86,16 @@ TEST_F(WebHostile, FoldersThatBecomeLinksAreNotFollowed) {
 TEST_F(WebHostile, CraftedDatabasesLeadNowhereElse) {
   Write("/tmp/secret.jpg", "secret");
   Write("/shares/secret.jpg", "secret");
+  const std::string add =
+      "INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT folder_id, ";
+  const std::string addFolders =
+      "INSERT INTO Folders(parent_folder_id, name, modified_date, volume) VALUES";
   Craft({"UPDATE Folders SET name = '/shares/A/../../tmp/' WHERE name = '/shares/A/sea/'",
-         "INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT "
-         "folder_id, '../secret.jpg', 5, volume, 6 FROM Folders WHERE name = '/shares/A/'",
-         "INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT "
-         "folder_id, '.orva/orva.db', 5, volume, 6 FROM Folders WHERE name = '/shares/A/'",
-         "INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT "
-         "folder_id, 'secret.jpg', 5, '/', 6 FROM Folders WHERE name = '/shares/'",
-         "INSERT INTO Folders(parent_folder_id, name, modified_date, volume) VALUES(1, '/tmp/', "
-         "0, '/tmp/'), (1, '/shares/A/x/', 0, '/shares/')",
-         "INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT "
-         "folder_id, 'secret.jpg', 5, volume, 6 FROM Folders WHERE name = '/tmp/'"});
+         add + "'../secret.jpg', 5, volume, 6 FROM Folders WHERE name = '/shares/A/'",
+         add + "'.orva/orva.db', 5, volume, 6 FROM Folders WHERE name = '/shares/A/'",
+         add + "'secret.jpg', 5, '/', 6 FROM Folders WHERE name = '/shares/'",
+         addFolders + "(1, '/tmp/', 0, '/tmp/'), (1, '/shares/A/x/', 0, '/shares/')",
+         add + "'secret.jpg', 5, volume, 6 FROM Folders WHERE name = '/tmp/'"});
   const Json photos = GetJson("/api/photos").at("photos");
   EXPECT_FALSE(photos.empty());
   for (const Json& photo : photos) {
@@ -108,6 +107,21 @@ TEST_F(WebHostile, CraftedDatabasesLeadNowhereElse) {
     }
     EXPECT_EQ(200, Get("/photos/" + id).status) << photo;
   }
+}
+
+TEST_F(WebHostile, ADatabaseThatCannotBeReadIsLoggedOnce) {
+  StopWeb();
+  fs::remove_all("/tmp/cache");
+  appliance.Shutdown();
+  Write("/shares/A/.zophotos/zophotos.db", std::string(1000, 'x'));
+  std::ofstream("/tmp/zophotodbmerger.conf") << LocatorOn(a.Path());
+  web = std::make_unique<Program>(Program::Arguments{ProgramPath("zophotos-web"), "--cache",
+                                                     "/tmp/cache", "--listen", "127.0.0.1:0"});
+  const Lines lines{web->ReadLine(), web->ReadLine()};
+  EXPECT_THAT(lines, ::testing::UnorderedElementsAre(HasSubstr("file is not a database"),
+                                                     HasSubstr("listening on")));
+  web->Signal(SIGTERM);
+  EXPECT_EQ("(end)", web->ReadLine());
 }
 
 TEST_F(WebHostile, FoldersOutsideTheTreeAreAtItsTop) {

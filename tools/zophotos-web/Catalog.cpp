@@ -20,7 +20,7 @@ namespace {
 /// Milliseconds. Writers in WAL mode do not block readers.
 constexpr int BUSY_TIMEOUT = 500;
 
-/// What changes when somebody writes to a file; zero if there is none.
+/// What changes when a file is written; zero if there is none.
 struct FileState {
   dev_t device = 0;
   ino_t inode = 0;

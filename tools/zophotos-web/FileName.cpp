@@ -1,8 +1,8 @@
 #include "FileName.h"
 
-#include "zophotos/Text.h"
+#include "Request.h"
 
-#include "orvautil/FormatString.h"
+#include "zophotos/Text.h"
 
 namespace orva::web {
 namespace {
@@ -21,18 +21,6 @@ std::string AsciiName(std::string_view name) {
   return ascii;
 }
 
-std::string EncodeName(std::string_view name) {
-  std::string encoded;
-  for (const char c : name) {
-    if (IsPlainCharacter(c)) {
-      encoded += c;
-    } else {
-      encoded += util::FormatString("%%%02X", static_cast<unsigned char>(c));
-    }
-  }
-  return encoded;
-}
-
 } // namespace
 
 std::string Attachment(std::string_view name) {
@@ -44,7 +32,7 @@ std::string Attachment(std::string_view name) {
     }
   }
   return "attachment; filename=\"" + AsciiName(printable) + "\"; filename*=UTF-8''" +
-         EncodeName(printable);
+         PercentEncoded(printable);
 }
 
 } // namespace orva::web

@@ -23,20 +23,6 @@ std::string_view FolderName(std::string_view path) {
   return path.substr(path.rfind('/') + 1);
 }
 
-const char* StateName(SnapshotStatus::State state) {
-  switch (state) {
-  case SnapshotStatus::State::NoDatabase:
-    return "no_database";
-  case SnapshotStatus::State::Building:
-    return "building";
-  case SnapshotStatus::State::Current:
-    return "current";
-  case SnapshotStatus::State::Failed:
-    break;
-  }
-  return "failed";
-}
-
 } // namespace
 
 Json ToJson(const Photo& photo) {
@@ -81,7 +67,7 @@ Json ToJson(const Month& month) {
 }
 
 Json ToJson(const SnapshotStatus& status) {
-  return {{"state", StateName(status.state)},
+  return {{"state", NameOf(status.state)},
           {"done", status.done},
           {"total", status.total},
           {"reason", ToUtf8(status.reason)}};

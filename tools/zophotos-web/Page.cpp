@@ -123,20 +123,6 @@ Html Notice(const SnapshotStatus& status) {
   return html;
 }
 
-std::string StateText(SnapshotStatus::State state) {
-  switch (state) {
-  case SnapshotStatus::State::Building:
-    return "building";
-  case SnapshotStatus::State::Failed:
-    return "failed";
-  case SnapshotStatus::State::NoDatabase:
-    return "no_database";
-  case SnapshotStatus::State::Current:
-    break;
-  }
-  return "current";
-}
-
 Html Link(Section section, Section here, const std::string& address, const std::string& text) {
   Html html;
   html << "<li><a href=\"" << address << "\"";
@@ -191,7 +177,7 @@ std::string Document(const Site& site, Section section, const std::string& title
   }
   html << "</header>\n"
           "<div id=\"notice\" class=\"notice\" role=\"status\" data-state=\""
-       << StateText(site.snapshot.state) << "\">" << Notice(site.snapshot)
+       << std::string(NameOf(site.snapshot.state)) << "\">" << Notice(site.snapshot)
        << "</div>\n"
           "<main id=\"main\" tabindex=\"-1\">\n"
        << main

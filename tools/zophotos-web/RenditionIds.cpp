@@ -17,7 +17,7 @@ namespace {
 constexpr std::size_t MOST_VOLUMES = 256;
 constexpr std::size_t MOST_EXPECTED = 1'000;
 
-/// How many are looked up at once: the first of them is waited for.
+/// How many are looked up at once, while a request waits.
 constexpr std::size_t MOST_AT_ONCE = 200;
 
 /// After a catalog could not be read.
@@ -74,7 +74,7 @@ void RenditionIds::Expect(const std::vector<Photo>& photos) {
   const std::lock_guard lock(mutex_);
   for (const Photo& photo : photos) {
     if (auto path = Locate(photo)) {
-      expected_.push_back(std::move(*path));
+      expected_.push_back({.photo = photo.id, .path = std::move(*path)});
     }
     if (expected_.size() > MOST_EXPECTED) {
       expected_.pop_front();
@@ -82,13 +82,14 @@ void RenditionIds::Expect(const std::vector<Photo>& photos) {
   }
 }
 
-std::optional<std::int64_t> RenditionIds::Find(const VolumePath& path,
+std::optional<std::int64_t> RenditionIds::Find(PhotoId photo, const VolumePath& path,
                                                const catalog::VolumeRoot& volume) {
+  const Wanted wanted{.photo = photo, .path = path};
   auto catalog = Identify(volume);
   if (!catalog) {
     return std::nullopt;
   }
-  if (const auto id = FindKnown(*catalog, path)) {
+  if (const auto id = FindKnown(wanted.KeyIn(*catalog))) {
     return id;
   }
   const auto known = VolumeAt(path.root);
@@ -97,11 +98,11 @@ std::optional<std::int64_t> RenditionIds::Find(const VolumePath& path,
   if (!catalog) {
     return std::nullopt;
   }
-  if (const auto id = FindKnown(*catalog, path)) {
+  if (const auto id = FindKnown(wanted.KeyIn(*catalog))) {
     return id; // by another thread meanwhile
   }
-  LookUp(*known, *catalog, path, volume);
-  return FindKnown(*catalog, path);
+  LookUp(*known, *catalog, wanted, volume);
+  return FindKnown(wanted.KeyIn(*catalog));
 }
 
 std::shared_ptr<RenditionIds::Volume> RenditionIds::VolumeAt(const std::string& root) {
@@ -116,33 +117,32 @@ std::shared_ptr<RenditionIds::Volume> RenditionIds::VolumeAt(const std::string& 
   return volume;
 }
 
-std::optional<std::int64_t> RenditionIds::FindKnown(const std::string& catalog,
-                                                    const VolumePath& path) {
+std::optional<std::int64_t> RenditionIds::FindKnown(const std::string& key) {
   const std::lock_guard lock(mutex_);
-  return found_.Find(catalog + path.relative);
+  return found_.Find(key);
 }
 
-/// The path, and those that are expected on the same volume and not known, the latest first.
-std::vector<std::string> RenditionIds::TakeExpected(const std::string& catalog,
-                                                    const VolumePath& path) {
-  std::vector<std::string> paths{path.relative};
+/// Photos that are expected on a volume and not known, the latest first.
+std::vector<RenditionIds::Wanted> RenditionIds::TakeExpected(const std::string& catalog,
+                                                             const std::string& root) {
+  std::vector<Wanted> photos;
   const std::lock_guard lock(mutex_);
   for (auto expected = expected_.end();
-       expected != expected_.begin() && paths.size() < MOST_AT_ONCE;) {
+       expected != expected_.begin() && photos.size() < MOST_AT_ONCE;) {
     --expected;
-    if (expected->root != path.root) {
+    if (expected->path.root != root) {
       continue;
     }
-    if (!found_.Find(catalog + expected->relative)) {
-      paths.push_back(std::move(expected->relative));
+    if (!found_.Find(expected->KeyIn(catalog))) {
+      photos.push_back(std::move(*expected));
     }
     expected = expected_.erase(expected);
   }
-  return paths;
+  return photos;
 }
 
-/// Reads the ids of the photo at `path` and of those that are expected.
-void RenditionIds::LookUp(Volume& known, const std::string& catalog, const VolumePath& path,
+/// Reads the ids of `wanted` and of those that are expected.
+void RenditionIds::LookUp(Volume& known, const std::string& catalog, const Wanted& wanted,
                           const catalog::VolumeRoot& volume) {
   {
     const std::lock_guard lock(mutex_);
@@ -150,22 +150,28 @@ void RenditionIds::LookUp(Volume& known, const std::string& catalog, const Volum
       return;
     }
   }
-  const std::vector<std::string> paths = TakeExpected(catalog, path);
+  std::vector<Wanted> photos = TakeExpected(catalog, wanted.path.root);
+  photos.push_back(wanted);
+  std::vector<std::string> paths;
+  paths.reserve(photos.size());
+  for (const Wanted& photo : photos) {
+    paths.push_back(photo.path.relative);
+  }
   try {
     const auto ids = FindFileIds(volume, paths, watch_);
     const bool isSame = Identify(volume) == catalog;
     const std::lock_guard lock(mutex_);
     known.hasFailed = false;
-    for (std::size_t i = 0; isSame && i < paths.size(); ++i) {
+    for (std::size_t i = 0; isSame && i < photos.size(); ++i) {
       if (ids[i]) {
-        found_.Add(catalog + paths[i], *ids[i]);
+        found_.Add(photos[i].KeyIn(catalog), *ids[i]);
       }
     }
   } catch (const std::string& reason) {
     const std::lock_guard lock(mutex_);
     known.nextTry = Clock::now() + PAUSE;
     if (!std::exchange(known.hasFailed, true)) {
-      log_("cannot read the catalog of " + path.root + ": " + ReasonOf(reason));
+      log_("cannot read the catalog of " + wanted.path.root + ": " + ReasonOf(reason));
     }
   }
 }

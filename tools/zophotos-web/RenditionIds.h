@@ -38,12 +38,24 @@ public:
 
   /// The id of the photo at `path` on `volume`. Nothing if the catalog does not have it, or cannot
   /// be read at the moment.
-  std::optional<std::int64_t> Find(const VolumePath& path, const catalog::VolumeRoot& volume);
+  std::optional<std::int64_t> Find(PhotoId photo, const VolumePath& path,
+                                   const catalog::VolumeRoot& volume);
 
 private:
   using Clock = std::chrono::steady_clock;
 
-  /// Ids that were found, by catalog and path. Forgets the older ones when there are many.
+  struct Wanted {
+    PhotoId photo = 0;
+    VolumePath path;
+
+    /// Identifies the photo among those of all catalogs. A path can have another photo later, and
+    /// an id of a photo can be used again.
+    std::string KeyIn(const std::string& catalog) const {
+      return catalog + std::to_string(photo) + ' ' + path.relative;
+    }
+  };
+
+  /// Ids that were found, by Wanted::KeyIn. Forgets the older ones when there are many.
   class Found {
   public:
     std::optional<std::int64_t> Find(const std::string& key) const;
@@ -63,16 +75,16 @@ private:
   };
 
   std::shared_ptr<Volume> VolumeAt(const std::string& root);
-  std::optional<std::int64_t> FindKnown(const std::string& catalog, const VolumePath& path);
-  std::vector<std::string> TakeExpected(const std::string& catalog, const VolumePath& path);
-  void LookUp(Volume& known, const std::string& catalog, const VolumePath& path,
+  std::optional<std::int64_t> FindKnown(const std::string& key);
+  std::vector<Wanted> TakeExpected(const std::string& catalog, const std::string& root);
+  void LookUp(Volume& known, const std::string& catalog, const Wanted& wanted,
               const catalog::VolumeRoot& volume);
 
   Log log_;
   WorkWatch watch_;
   std::mutex mutex_;                                       ///< of the following, and what it holds
   std::map<std::string, std::shared_ptr<Volume>> volumes_; ///< by their folders
-  std::deque<VolumePath> expected_;
+  std::deque<Wanted> expected_;
   Found found_;
 };
 

@@ -1,5 +1,7 @@
 #include "Request.h"
 
+#include "orvautil/FormatString.h"
+
 #include <algorithm>
 #include <charconv>
 #include <cstddef>
@@ -97,6 +99,20 @@ std::optional<Target> ParseTarget(std::string_view text) {
     }
   }
   return target;
+}
+
+std::string PercentEncoded(std::string_view text) {
+  constexpr std::string_view PLAIN = "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz"
+                                     "0123456789-._~";
+  std::string encoded;
+  for (const char c : text) {
+    if (PLAIN.find(c) != std::string_view::npos) {
+      encoded += c;
+    } else {
+      encoded += util::FormatString("%%%02X", static_cast<unsigned char>(c));
+    }
+  }
+  return encoded;
 }
 
 std::optional<std::int64_t> ParseNumber(std::string_view text) {

@@ -23,6 +23,10 @@ struct Target {
 /// one parameter twice.
 std::optional<Target> ParseTarget(std::string_view text);
 
+/// The text as a value of the query, or in a header: every byte that is no plain character is an
+/// escape.
+std::string PercentEncoded(std::string_view text);
+
 /// A number as we print it: decimal, without leading zeros or a plus sign. Nothing for any other
 /// text.
 std::optional<std::int64_t> ParseNumber(std::string_view text);

@@ -21,7 +21,7 @@ constexpr int NOT_MODIFIED = 304;
 constexpr int BAD_REQUEST = 400;
 constexpr int NOT_FOUND = 404;
 
-/// A document whose content changes: nobody keeps it.
+/// A document whose content changes. No cache may keep it.
 Response DataDocument(std::string type, std::string text) {
   return {
       .type = std::move(type), .body = std::move(text), .headers = {{"Cache-Control", "no-store"}}};
@@ -43,7 +43,7 @@ Response NoFolder(const Target& target) {
   return Router::Refuse(NOT_FOUND, target.path, "There is no such folder.");
 }
 
-/// A response that is kept, but only used after the server was asked whether it is still current.
+/// A response that browsers keep, and use again when the server says that it is current.
 std::vector<std::pair<std::string, std::string>> KeptHeaders(std::string_view tag) {
   return {{"ETag", std::string(tag)}, {"Cache-Control", "private, no-cache"}};
 }

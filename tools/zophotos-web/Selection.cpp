@@ -1,30 +1,11 @@
 #include "zophotos-web/Selection.h"
 
+#include "Request.h"
+
 #include <array>
 #include <cstdio>
-#include <string_view>
 
 namespace orva::web {
-
-namespace {
-
-std::string PercentEncoded(std::string_view text) {
-  constexpr std::string_view plain = "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz"
-                                     "0123456789-._~";
-  std::string encoded;
-  for (const char character : text) {
-    if (plain.find(character) != std::string_view::npos) {
-      encoded += character;
-    } else {
-      std::array<char, 4> code{};
-      std::snprintf(code.data(), code.size(), "%%%02X", static_cast<unsigned char>(character));
-      encoded += code.data();
-    }
-  }
-  return encoded;
-}
-
-} // namespace
 
 std::string MonthText(const Selection& selection) {
   std::array<char, 32> text{};

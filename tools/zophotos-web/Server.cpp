@@ -71,7 +71,7 @@ MHD_Result Collect(void* headers, MHD_ValueKind /*kind*/, const char* key, std::
   Headers& all = *static_cast<Headers*>(headers);
   const std::string_view name(key, keySize);
   const std::string_view text(value == nullptr ? "" : value, valueSize);
-  // Others may read "Content-Length :" as we do not.
+  // A proxy may take "Content-Length :" for the header without the space.
   all.areMalformed = all.areMalformed || !std::ranges::all_of(name, IsNameCharacter);
   if (IsEqual(name, "host")) {
     ++all.hosts;

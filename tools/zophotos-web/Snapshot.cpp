@@ -66,6 +66,20 @@ void Log(const std::string& line) {
 
 } // namespace
 
+const char* NameOf(State state) {
+  switch (state) {
+  case State::NoDatabase:
+    return "no_database";
+  case State::Building:
+    return "building";
+  case State::Current:
+    return "current";
+  case State::Failed:
+    break;
+  }
+  return "failed";
+}
+
 /// Finds what is missing among the ids of the merged database.
 template <typename Id>
 class Missing {
@@ -193,9 +207,6 @@ private:
     constexpr std::chrono::seconds longest(60);
     pause_ = std::clamp<std::chrono::seconds>(pause_ * 2, std::chrono::seconds(1), longest);
     nextTry_ = Clock::now() + pause_;
-    if (Status().reason != reason) {
-      Log(reason);
-    }
     SetStatus(State::Failed, reason);
   }
 

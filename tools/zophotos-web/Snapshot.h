@@ -23,6 +23,9 @@ struct SnapshotStatus {
   std::string reason;     ///< of NoDatabase and Failed; not escaped
 };
 
+/// The state for programs: "no_database", "building", "current" or "failed".
+const char* NameOf(SnapshotStatus::State state);
+
 /// A private copy of the merged database with a search index, in a directory of its own. It is
 /// read by any number of SnapshotReaders, which never touch the merged database. The directory is a
 /// cache: whatever it holds may be removed while no process uses it.

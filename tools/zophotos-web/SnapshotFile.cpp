@@ -382,7 +382,7 @@ void SnapshotFile::RemovePhotos(const std::vector<std::int64_t>& ids) {
     if (!query.executeStep()) {
       continue;
     }
-    // The index forgets only what it is told to have.
+    // FTS5 needs the text of the row that it is to delete.
     const std::string name = query.getColumn(2).getString();
     const std::string& text =
         SearchText(query.getColumn(0).getInt64(), query.getColumn(1).getInt64(), name);

@@ -21,7 +21,7 @@ void AddActivity(Volume& volume, const zophotos::VolumeActivity& activity) {
     volume.failed = activity.rendering->failed;
     volume.isRendering = activity.rendering->isActive;
   }
-  // To be watched is what every volume is.
+  // The usual state of a volume needs no words.
   std::string text = Describe(activity);
   for (const std::string_view usual : {"watched; ", "watched", "-"}) {
     if (text.starts_with(usual)) {

@@ -93,7 +93,7 @@ std::optional<VolumeFile> VolumeFiles::OpenOriginal(const Photo& photo) const {
 std::optional<VolumeFile> VolumeFiles::OpenRendition(const Photo& photo) {
   const auto path = Locate(photo);
   const auto volume = path ? OpenRoot(path->root) : std::nullopt;
-  const auto id = volume ? ids_.Find(*path, *volume) : std::nullopt;
+  const auto id = volume ? ids_.Find(photo.id, *path, *volume) : std::nullopt;
   auto file = id ? Open(*volume, catalog::RenditionPath(*id)) : std::nullopt;
   return file && file->size <= MOST_RENDITION ? std::move(file) : std::nullopt;
 }
