@@ -1,6 +1,10 @@
 #include "transcoder/Photos.h"
 #include "transcoder/TranscoderTest.h"
 
+#include "CatalogSchema.h"
+#include "Renditions.h"
+#include "orvadb/Transaction.h"
+#include "orvadb/VolumeDB.h"
 #include "support/Programs.h"
 #include "system/Appliance.h"
 #include "system/Messages.h"
@@ -10,6 +14,8 @@
 
 namespace {
 
+namespace catalog = orva::catalog;
+namespace db = orva::db;
 namespace test = orva::test;
 using namespace orva::test;
 using testing::HasSubstr;
@@ -122,6 +128,23 @@ TEST_F(Announcements, VolumesTakeTurns) {
   RenderAll();
   UseRoot("/shares/A");
   EXPECT_GT(Waiting(), 600);
+}
+
+TEST_F(Announcements, AVolumeWhoseCatalogIsLockedDoesNotHoldUpOthers) {
+  const Volume second("B", "100m");
+  AddPhotos(400);
+  const auto first = catalog::OpenCatalog(Root());
+  {
+    const db::Transaction lock(*first, catalog::BUSY_TIMEOUT);
+    Announce("scanned");
+    ASSERT_TRUE(Await([] { return Status().find("\"rendering\":true") != std::string::npos; }));
+    UseRoot(second.Path());
+    AddPhotos(30);
+    RenderAll();
+    EXPECT_EQ(catalog::CountWaiting(*first), 400);
+  }
+  UseRoot("/shares/A");
+  EXPECT_TRUE(Await([this] { return Waiting() == 0; })) << Status();
 }
 
 TEST_F(Announcements, TheDaemonListsAPhotoOnlyWithItsRendition) {

@@ -366,10 +366,12 @@ FolderIndexer::FileChanges FolderIndexer::CompareFiles(const IndexedFolder& fold
       continue;
     }
     const bool isDeleted = known.isDeleted;
-    const bool isChanged = isDeleted || folder.revived || !IsUpToDate(row, folder, *entry) ||
-                           (known.status == RENDERED && newPhotos_ == NewPhotos::Waiting &&
-                            renditions.IsOutdated(known.id, entry->access)) ||
-                           (known.status == UNRENDERABLE && MayBeOpenedNow(row, *entry));
+    const bool isToBeRendered =
+        newPhotos_ == NewPhotos::Waiting &&
+        ((known.status == RENDERED && renditions.IsOutdated(known.id, entry->access)) ||
+         (known.status == UNRENDERABLE && MayBeOpenedNow(row, *entry)));
+    const bool isChanged =
+        isDeleted || folder.revived || isToBeRendered || !IsUpToDate(row, folder, *entry);
     if (!(isChanged && write(*entry, known)) && !isDeleted) {
       ++summary_.rows; // it stays as it is
     }

@@ -55,7 +55,7 @@ constexpr auto LONGEST_EMPTY = 8s;
 constexpr auto LONGEST_OPEN = 600s;
 
 /// How long a locked catalog is waited for, in milliseconds: all volumes wait then. The next
-/// attempts come after pauses, each twice as long as the one before.
+/// attempts come after pauses that grow with the time since it was found locked.
 constexpr unsigned BUSY_TIMEOUT = 100;
 constexpr Clock::duration SHORTEST_BUSY_PAUSE = 250ms;
 constexpr Clock::duration LONGEST_BUSY_PAUSE = 8s;
@@ -369,7 +369,6 @@ Volume::Result Volume::WorkOn(const VolumeRoot& root, const std::function<void()
     catalog::CatalogState state = catalog::StateOf(*database);
     transaction.Commit();
     isUncommitted_ = false;
-    busyPause_ = {};
     lockedSince_.reset();
     isLockLogged_ = false;
     state_ = std::move(state);
@@ -563,11 +562,10 @@ void Volume::Fail(Trouble trouble, const std::string& reason, bool isMedium) {
 /// Another program has locked the catalog.
 void Volume::WaitForLock() {
   const auto now = Clock::now();
-  busyPause_ = std::clamp(busyPause_ * 2, SHORTEST_BUSY_PAUSE, LONGEST_BUSY_PAUSE);
-  notBefore_ = now + busyPause_;
-  if (!lockedSince_) {
-    lockedSince_ = now;
-  } else if (now - *lockedSince_ >= LONGEST_LOCK && !std::exchange(isLockLogged_, true)) {
+  lockedSince_ = lockedSince_.value_or(now);
+  const auto locked = now - *lockedSince_;
+  notBefore_ = now + std::min(SHORTEST_BUSY_PAUSE + locked, LONGEST_BUSY_PAUSE);
+  if (locked >= LONGEST_LOCK && !std::exchange(isLockLogged_, true)) {
     LogError(name_ + ": another program has locked its catalog; it is not updated until this ends");
   }
 }

@@ -171,7 +171,6 @@ private:
   std::unordered_map<std::string, Look> looks_;
   Clock::time_point notBefore_{};                ///< no work earlier
   Clock::time_point nextWalk_{};                 ///< of all folders, where they are not watched
-  Clock::duration busyPause_{};                  ///< before the next attempt to lock the catalog
   std::optional<Clock::time_point> lockedSince_; ///< by another program
   bool isLockLogged_ = false;
   bool isStampWanted_ = false;

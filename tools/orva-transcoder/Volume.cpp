@@ -52,8 +52,8 @@ constexpr std::chrono::seconds RETRY(60);
 // How long a locked catalog is waited for, in milliseconds: all volumes wait then. The pauses
 // before the next attempts grow with the time since it was found locked.
 constexpr unsigned LOCK_TIMEOUT = 250;
-constexpr std::chrono::milliseconds SHORTEST_LOCK_PAUSE(250);
-constexpr std::chrono::milliseconds LONGEST_LOCK_PAUSE(8000);
+constexpr Volume::Clock::duration SHORTEST_LOCK_PAUSE = std::chrono::milliseconds(250);
+constexpr Volume::Clock::duration LONGEST_LOCK_PAUSE = std::chrono::seconds(8);
 
 constexpr std::chrono::milliseconds PIECE(200);
 // A photo is postponed for 15, 30, ... 480 s: 16 minutes. If the reason was a shortage of memory,
@@ -190,8 +190,8 @@ void Volume::Report(const std::string& problem, bool isBusy) {
   const auto now = Clock::now();
   if (isBusy_) {
     lockedSince_ = lockedSince_.value_or(now);
-    lookAgainAt_ = now + std::clamp<Clock::duration>((now - *lockedSince_) / 8, SHORTEST_LOCK_PAUSE,
-                                                     LONGEST_LOCK_PAUSE);
+    lookAgainAt_ =
+        now + std::min(SHORTEST_LOCK_PAUSE + (now - *lockedSince_) / 8, LONGEST_LOCK_PAUSE);
   } else {
     lookAgainAt_ = now + RETRY;
   }
