@@ -273,6 +273,53 @@ TEST_F(ChangingSnapshot, AnotherFileAtTheSamePathReplacesEverything) {
   EXPECT_THAT(Names(), ElementsAre("new.jpg"));
 }
 
+// Pages that are still open have the ids of the former database.
+TEST_F(ChangingSnapshot, AnIdNeverMeansThePhotoOfAnotherDatabase) {
+  for (const char* const name : {"1.jpg", "2.jpg", "3.jpg"}) {
+    merged_->AddFile(a_, name, 100, A);
+  }
+  Update();
+  const auto former = reader_->Photos({}, std::nullopt, 10);
+  path_ = "/tmp/other/zophotos.db";
+  {
+    MergedFile other(path_);
+    const std::int64_t folder = other.AddVolume(A);
+    for (const char* const name : {"3.jpg", "1.jpg", "2.jpg"}) {
+      other.AddFile(folder, name, 100, A);
+    }
+  }
+  EXPECT_TRUE(Update());
+  EXPECT_THAT(Names(), ElementsAre("2.jpg", "1.jpg", "3.jpg"));
+  for (const web::Photo& photo : former) {
+    EXPECT_EQ(reader_->Find(photo.id), std::nullopt) << photo.name;
+  }
+  // The same with another file at the same path.
+  const auto second = reader_->Photos({}, std::nullopt, 10);
+  fs::rename(MERGED, path_);
+  EXPECT_TRUE(Update());
+  EXPECT_THAT(Names(), ElementsAre("3.jpg", "2.jpg", "1.jpg"));
+  for (const web::Photo& photo : second) {
+    EXPECT_EQ(reader_->Find(photo.id), std::nullopt) << photo.name;
+  }
+}
+
+TEST_F(ChangingSnapshot, IdsStayWhenTheSnapshotIsBuiltAgain) {
+  for (const char* const name : {"1.jpg", "2.jpg", "3.jpg"}) {
+    merged_->AddFile(a_, name, 100, A);
+  }
+  Update();
+  const auto before = reader_->Photos({}, std::nullopt, 10);
+  reader_.reset();
+  snapshot_.reset();
+  fs::remove_all(CACHE);
+  Start();
+  Update();
+  EXPECT_EQ(reader_->Photos({}, std::nullopt, 10), before);
+  merged_->RemoveFile(2);
+  EXPECT_TRUE(Update());
+  EXPECT_THAT(Names(), ElementsAre("3.jpg", "1.jpg"));
+}
+
 TEST_F(ChangingSnapshot, IsEmptyWithoutAMergedDatabase) {
   merged_->AddFile(a_, "1.jpg", 1, A);
   Update();

@@ -286,7 +286,8 @@ private:
         StopIfAsked(stop);
       }
       Missing<std::uint32_t> missing(std::move(ids));
-      file_->ForEachPhoto([&](std::int64_t id) { missing.Check(id, id & 0x7FFF'FFFF); });
+      file_->ForEachPhoto(
+          [&](std::int64_t id) { missing.Check(id, RowOf(id, state.firstNumber)); });
       if (state.changes + static_cast<std::int64_t>(missing.Ids().size()) > mostChanges) {
         return false;
       }
@@ -313,6 +314,7 @@ private:
     directory_.RemoveOthers(number_);
     SnapshotFile file = SnapshotFile::Create(directory_.File(number_ + 1));
     SnapshotState& state = file.State();
+    state.firstNumber = FirstNumber(identity);
     const std::int64_t version = source.DataVersion();
     const std::int64_t total = source.ReadSummary().files;
     const auto show = [&](std::int64_t done) {

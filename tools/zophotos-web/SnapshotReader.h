@@ -13,7 +13,8 @@
 namespace orva::web {
 
 /// Identifies a photo in the snapshot, and sorts by modification time. Never negative. A photo has
-/// another id after the election of another master or a purge of its volume.
+/// another id after the election of another master or a purge of its volume; its former id then
+/// means no other photo.
 using PhotoId = std::int64_t;
 
 struct Photo {
