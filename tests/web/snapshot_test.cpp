@@ -1,5 +1,6 @@
 // What readers see of the snapshot while the merged database changes.
 
+#include "SlowFile.h"
 #include "SnapshotTest.h"
 
 #include <gmock/gmock.h>
@@ -348,6 +349,28 @@ TEST_F(ChangingSnapshot, ALockedDatabaseIsReadLater) {
   merged_->Run("COMMIT");
   EXPECT_TRUE(Update());
   EXPECT_THAT(Names(), ElementsAre("2.jpg", "1.jpg"));
+}
+
+// A merge that wants to commit waits for the lock.
+TEST_F(ChangingSnapshot, OfASlowDiskLocksTheDatabaseForAShortTimeOnly) {
+  merged_->Run("BEGIN");
+  for (int i = 0; i < 30'000; ++i) {
+    merged_->AddFile(a_, "Photo_" + std::to_string(i) + ".jpg", i, A);
+  }
+  for (int i = 0; i < 300; ++i) {
+    merged_->AddFolder(a_, A + std::to_string(i) + std::string(4000, 'x') + '/', A);
+    merged_->SetStatistics("/shares/" + std::to_string(i) + std::string(4000, 'x') + '/', 1, 1, 1);
+  }
+  merged_->Run("COMMIT");
+  const SlowFile slow(MERGED);
+  for (const char* const change : {"first", "second"}) {
+    merged_->AddFile(a_, std::string(change) + ".jpg", 50'000, A);
+    const int before = slow.Reads();
+    EXPECT_TRUE(snapshot_->Update());
+    EXPECT_LT(300, slow.Reads() - before) << change;
+    EXPECT_GT(50, slow.MostReadsLocked()) << change;
+  }
+  EXPECT_THAT(Names(WithWords("second")), ElementsAre("second.jpg"));
 }
 
 TEST_F(ChangingSnapshot, KeepsTheMergedDatabaseClosed) {

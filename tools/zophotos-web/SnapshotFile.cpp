@@ -483,17 +483,17 @@ bool SnapshotFile::HasRows(std::int64_t volume) {
   return hasPhotos;
 }
 
-bool SnapshotFile::ReplaceStatistics(const std::vector<StatisticsRow>& rows) {
+bool SnapshotFile::ReplaceStatistics(const Statistics& statistics) {
   using Values = std::array<std::int64_t, 4>;
   std::map<std::string, Values> wanted;
-  for (const StatisticsRow& row : rows) {
+  for (const auto& [mountPoint, row] : statistics) {
     SQLite::Statement& query = Prepared("SELECT number FROM Volumes WHERE mountPoint = ?");
-    BindText(query, 1, row.volume);
+    BindText(query, 1, mountPoint);
     const bool isKnown = query.executeStep();
     const std::int64_t number = isKnown ? query.getColumn(0).getInt64() : 0;
     query.reset();
     const bool isGone = row.mergedUpTo == 0 && !(isKnown && HasRows(number));
-    wanted[row.volume] = {row.transcoded, row.total, row.mergedUpTo, isGone ? 1 : 0};
+    wanted[mountPoint] = {row.transcoded, row.total, row.mergedUpTo, isGone ? 1 : 0};
   }
   std::map<std::string, Values> present;
   SQLite::Statement query(database_, "SELECT * FROM Statistics");

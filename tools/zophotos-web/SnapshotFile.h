@@ -138,7 +138,7 @@ public:
   void AdoptFolders();
 
   /// Returns whether that changed anything.
-  bool ReplaceStatistics(const std::vector<StatisticsRow>& rows);
+  bool ReplaceStatistics(const Statistics& statistics);
 
   /// Makes the file safe to be read while it is written.
   void Complete();
