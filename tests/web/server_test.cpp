@@ -326,6 +326,17 @@ TEST_F(WebServer, LimitsTheEventStreamsAndServesOthersMeanwhile) {
   }
 }
 
+TEST_F(WebServer, GivesThePlacesOfClosedStreamsToOthersAtOnce) {
+  for (int round = 0; round < 3; ++round) {
+    std::list<HttpConnection> streams;
+    for (std::size_t i = 0; i < EventStreams::MOST; ++i) {
+      streams.emplace_back(port).Send(HttpGet("/events"));
+      EXPECT_EQ(200, streams.back().ReadHeaders().status) << round << ' ' << i;
+      streams.back().ReadUntil("event: change");
+    }
+  }
+}
+
 TEST_F(WebServer, EndsWhileStreamsAndDownloadsRun) {
   HttpConnection stream(port);
   stream.Send(HttpGet("/events"));
