@@ -337,6 +337,15 @@ TEST_F(WebServer, GivesThePlacesOfClosedStreamsToOthersAtOnce) {
   }
 }
 
+TEST_F(WebServer, SendsNoEventsForHead) {
+  HttpConnection connection(port);
+  connection.Send("HEAD /events HTTP/1.1\r\nHost: localhost\r\n\r\n" + HttpGet("/b"));
+  const HttpResponse response = connection.Read(true);
+  EXPECT_EQ(200, response.status);
+  EXPECT_EQ("text/event-stream", response.Header("content-type"));
+  EXPECT_EQ("content of /b", connection.Read().body);
+}
+
 TEST_F(WebServer, EndsWhileStreamsAndDownloadsRun) {
   HttpConnection stream(port);
   stream.Send(HttpGet("/events"));

@@ -40,7 +40,8 @@ using MhdResponse = std::unique_ptr<MHD_Response, ResponseReleaser>;
 
 /// A request, from its first line until the response is sent.
 struct Exchange {
-  std::string text;                 ///< the target as it was sent
+  std::string text; ///< the target as it was sent
+  bool isHead = false;
   std::optional<Request> request{}; ///< nothing until it is checked
 };
 
@@ -228,7 +229,11 @@ struct Server::Calls {
     }
     try {
       if (current->request) {
-        return Send(self, connection, Answer(self, *current->request));
+        Response response = Answer(self, *current->request);
+        if (current->isHead && std::holds_alternative<EventStream>(response.body)) {
+          response.body = std::string(); // libmicrohttpd would send the end of a stream
+        }
+        return Send(self, connection, std::move(response));
       }
       const auto refusal = CheckRequest(self, connection, method, *current);
       return refusal ? Refuse(self, connection, *refusal, current->text) : MHD_YES;
@@ -243,6 +248,7 @@ struct Server::Calls {
                                              std::string_view method, Exchange& exchange) {
     Headers headers;
     MHD_get_connection_values_n(connection, MHD_HEADER_KIND, &Collect, &headers);
+    exchange.isHead = method == "HEAD";
     auto refusal = Check(headers, self.hosts_, SocketOf(connection), method);
     auto target = ParseTarget(exchange.text);
     if (!refusal && !target) {
