@@ -95,8 +95,9 @@ public:
   /// The folders that contain a folder, from the top; at most 100.
   std::vector<Folder> Ancestors(std::int64_t folder);
 
-  /// By mount point; at most 1,000.
-  std::vector<VolumeRow> Volumes();
+  /// By mount point; at most 1,000. The last one is the first whose name, with those before it, has
+  /// more than `mostBytes` bytes.
+  std::vector<VolumeRow> Volumes(std::size_t mostBytes = SIZE_MAX);
 
   /// The months that have photos, in local time, newest first. Only the folder and the volume
   /// of the filter count.
