@@ -9,6 +9,7 @@
 
 #include <poll.h>
 #include <sys/mount.h>
+#include <sys/socket.h>
 
 #include <chrono>
 #include <filesystem>
@@ -249,6 +250,34 @@ TEST_F(WebHostile, LongNamesMakeShortPagesThatLeadToAllPhotos) {
     const HttpResponse response = Get(target);
     EXPECT_GT(500, response.status) << target.substr(0, 100);
     EXPECT_GT(most, response.body.size()) << target.substr(0, 100);
+  }
+}
+
+TEST_F(WebHostile, ManyClientsThatDoNotReadTakeLittleMemory) {
+  Craft({"WITH RECURSIVE n(i) AS (SELECT 1 UNION ALL SELECT i + 1 FROM n WHERE i < 300) "
+         "INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT "
+         "(SELECT folder_id FROM Folders WHERE name = '/shares/A/'), "
+         "i || replace(hex(zeroblob(2000)), '00', char(1, 2)) , i, '/shares/A/', 6 FROM n",
+         "WITH RECURSIVE n(i) AS (SELECT 1 UNION ALL SELECT i + 1 FROM n WHERE i < 10000) "
+         "INSERT INTO Statistics(volume, photos_xcoded, photos_total, last_updated_time) SELECT "
+         "'/shares/' || i || replace(hex(zeroblob(2000)), '00', char(1, 2)) || '/', 1, 1, 1 "
+         "FROM n"});
+  std::string requests;
+  for (int i = 0; i < 2; ++i) {
+    requests += HttpGet("/api/photos?count=200") + HttpGet("/volumes");
+  }
+  std::list<HttpConnection> clients;
+  for (int i = 0; i < 300; ++i) {
+    const int size = 4096;
+    setsockopt(clients.emplace_back(port).Socket(), SOL_SOCKET, SO_RCVBUF, &size, sizeof size);
+    clients.back().Send(requests);
+    if (i % 50 == 0) {
+      EXPECT_EQ(200, Get("/api/status").status);
+    }
+  }
+  EXPECT_EQ(200, Get("/api/status").status);
+  if (!AreProgramsSanitized()) {
+    EXPECT_LT(PeakOf(web->Pid()), 96 << 10);
   }
 }
 

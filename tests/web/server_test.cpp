@@ -130,6 +130,9 @@ private:
                                .offset = offset,
                                .size = path == "/part" ? 10 : LARGE}};
     }
+    if (path == "/large") {
+      return {.type = "text/plain", .body = std::string(16 << 20, 'x')};
+    }
     if (path == "/events") {
       return {.type = "text/event-stream", .body = EventStream()};
     }
@@ -377,6 +380,25 @@ TEST_F(WebServer, ServesOthersDuringManyConnections) {
     }
   }
   EXPECT_EQ(200, Get("/a").status);
+}
+
+TEST_F(WebServer, HasABoundForTheResponsesThatAreNotRead) {
+  std::list<HttpConnection> clients;
+  int status = 200;
+  while (status == 200 && clients.size() < 10) {
+    clients.emplace_back(port).Send(HttpGet("/large"));
+    const HttpResponse response = clients.back().ReadHeaders();
+    status = response.status;
+    EXPECT_EQ(status == 503 ? "5" : "", response.Header("retry-after"));
+  }
+  EXPECT_EQ(503, status);
+  EXPECT_EQ("content of /a", Get("/a").body);
+  clients.clear();
+  const auto end = std::chrono::steady_clock::now() + test::DEADLINE;
+  while (Get("/large").status != 200 && std::chrono::steady_clock::now() < end) {
+    poll(nullptr, 0, 20);
+  }
+  EXPECT_EQ(200, Get("/large").status);
 }
 
 TEST_F(WebServer, EndsConnectionsThatSendTooSlowly) {
