@@ -9,6 +9,7 @@
 
 #include <poll.h>
 #include <sys/mount.h>
+#include <sys/socket.h>
 
 #include <chrono>
 #include <filesystem>
@@ -208,6 +209,90 @@ TEST_F(WebHostile, UsersSeeOnlyWhatTheirServerMayRead) {
   EXPECT_EQ("rendition of top.jpg", Get(Target("/shares/A/top.jpg", "/rendition")).body);
   EXPECT_EQ(404, Get(Target(ONE, "/rendition")).status);
   EXPECT_EQ(404, Get(Target(ONE, "/original")).status);
+}
+
+TEST_F(WebHostile, LongNamesMakeShortPagesThatLeadToAllPhotos) {
+  Craft({"WITH RECURSIVE n(i) AS (SELECT 1 UNION ALL SELECT i + 1 FROM n WHERE i < 300) "
+         "INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT "
+         "(SELECT folder_id FROM Folders WHERE name = '/shares/A/'), "
+         "i || replace(hex(zeroblob(2000)), '00', char(1, 2)) , i, '/shares/A/', 6 FROM n",
+         "WITH RECURSIVE n(i) AS (SELECT 1 UNION ALL SELECT i + 1 FROM n WHERE i < 300) "
+         "INSERT INTO Folders(parent_folder_id, name, modified_date, volume) SELECT folder_id, "
+         "name || i || replace(hex(zeroblob(1900)), '00', char(1, 2)) || '/', 0, volume FROM "
+         "Folders, n WHERE name = '/shares/A/'",
+         "WITH RECURSIVE n(i) AS (SELECT 1 UNION ALL SELECT i + 1 FROM n WHERE i < 2000) "
+         "INSERT INTO Statistics(volume, photos_xcoded, photos_total, last_updated_time) SELECT "
+         "'/shares/' || i || replace(hex(zeroblob(2000)), '00', char(1, 2)) || '/', 1, 1, 1 "
+         "FROM n"});
+  constexpr std::size_t most = 2 << 20;
+  for (const char* const newest : {"before", "after"}) {
+    const std::string direction = newest;
+    std::size_t photos = 0;
+    std::string id = direction == "before" ? "" : "0";
+    for (bool more = true; more;) {
+      const HttpResponse response = Get("/api/photos?count=200&" + direction + "=" + id);
+      ASSERT_EQ(200, response.status);
+      EXPECT_GT(most, response.body.size());
+      const Json page = Json::parse(response.body);
+      const Json& list = page.at("photos");
+      ASSERT_FALSE(list.empty());
+      photos += list.size();
+      id = (direction == "before" ? list.back() : list.front()).at("id");
+      more = page.at("more");
+    }
+    EXPECT_EQ(303U, photos);
+  }
+  std::size_t folders = 0;
+  std::string query = "?parent=" + std::string(GetJson("/api/folders").at("folders")[0].at("id"));
+  std::string after;
+  for (bool more = true; more;) {
+    const Json page = GetJson("/api/folders" + query + after);
+    folders += page.at("folders").size();
+    after = "&after=" + std::string(page.at("folders").back().at("id"));
+    more = page.at("more");
+  }
+  EXPECT_EQ(301U, folders);
+  const Json volumes = GetJson("/api/volumes");
+  EXPECT_TRUE(volumes.at("more"));
+  EXPECT_FALSE(volumes.at("volumes").empty());
+  EXPECT_THAT(Get("/volumes").body, HasSubstr("There may be more volumes"));
+  const std::string folder = query.substr(query.find('=') + 1);
+  const std::string words = "/search?words=" + std::string(10'000, 'x') + "&volume=";
+  for (const std::string& target :
+       {std::string("/"), std::string("/volumes"), std::string("/search?volume=/shares/A/"),
+        "/folders/" + folder, std::string("/api/volumes"), words}) {
+    const HttpResponse response = Get(target);
+    EXPECT_GT(500, response.status) << target.substr(0, 100);
+    EXPECT_GT(most, response.body.size()) << target.substr(0, 100);
+  }
+}
+
+TEST_F(WebHostile, ManyClientsThatDoNotReadTakeLittleMemory) {
+  Craft({"WITH RECURSIVE n(i) AS (SELECT 1 UNION ALL SELECT i + 1 FROM n WHERE i < 300) "
+         "INSERT INTO Files(folder_id, name, modified_date, volume, created_date) SELECT "
+         "(SELECT folder_id FROM Folders WHERE name = '/shares/A/'), "
+         "i || replace(hex(zeroblob(2000)), '00', char(1, 2)) , i, '/shares/A/', 6 FROM n",
+         "WITH RECURSIVE n(i) AS (SELECT 1 UNION ALL SELECT i + 1 FROM n WHERE i < 10000) "
+         "INSERT INTO Statistics(volume, photos_xcoded, photos_total, last_updated_time) SELECT "
+         "'/shares/' || i || replace(hex(zeroblob(2000)), '00', char(1, 2)) || '/', 1, 1, 1 "
+         "FROM n"});
+  std::string requests;
+  for (int i = 0; i < 2; ++i) {
+    requests += HttpGet("/api/photos?count=200") + HttpGet("/volumes");
+  }
+  std::list<HttpConnection> clients;
+  for (int i = 0; i < 300; ++i) {
+    const int size = 4096;
+    setsockopt(clients.emplace_back(port).Socket(), SOL_SOCKET, SO_RCVBUF, &size, sizeof size);
+    clients.back().Send(requests);
+    if (i % 50 == 0) {
+      EXPECT_EQ(200, Get("/api/status").status);
+    }
+  }
+  EXPECT_EQ(200, Get("/api/status").status);
+  if (!AreProgramsSanitized()) {
+    EXPECT_LT(PeakOf(web->Pid()), 96 << 10);
+  }
 }
 
 TEST_F(WebHostile, AThousandConnectionsTakeLittleMemory) {

@@ -130,6 +130,9 @@ private:
                                .offset = offset,
                                .size = path == "/part" ? 10 : LARGE}};
     }
+    if (path == "/large") {
+      return {.type = "text/plain", .body = std::string(16 << 20, 'x')};
+    }
     if (path == "/events") {
       return {.type = "text/event-stream", .body = EventStream()};
     }
@@ -326,6 +329,26 @@ TEST_F(WebServer, LimitsTheEventStreamsAndServesOthersMeanwhile) {
   }
 }
 
+TEST_F(WebServer, GivesThePlacesOfClosedStreamsToOthersAtOnce) {
+  for (int round = 0; round < 3; ++round) {
+    std::list<HttpConnection> streams;
+    for (std::size_t i = 0; i < EventStreams::MOST; ++i) {
+      streams.emplace_back(port).Send(HttpGet("/events"));
+      EXPECT_EQ(200, streams.back().ReadHeaders().status) << round << ' ' << i;
+      streams.back().ReadUntil("event: change");
+    }
+  }
+}
+
+TEST_F(WebServer, SendsNoEventsForHead) {
+  HttpConnection connection(port);
+  connection.Send("HEAD /events HTTP/1.1\r\nHost: localhost\r\n\r\n" + HttpGet("/b"));
+  const HttpResponse response = connection.Read(true);
+  EXPECT_EQ(200, response.status);
+  EXPECT_EQ("text/event-stream", response.Header("content-type"));
+  EXPECT_EQ("content of /b", connection.Read().body);
+}
+
 TEST_F(WebServer, EndsWhileStreamsAndDownloadsRun) {
   HttpConnection stream(port);
   stream.Send(HttpGet("/events"));
@@ -357,6 +380,25 @@ TEST_F(WebServer, ServesOthersDuringManyConnections) {
     }
   }
   EXPECT_EQ(200, Get("/a").status);
+}
+
+TEST_F(WebServer, HasABoundForTheResponsesThatAreNotRead) {
+  std::list<HttpConnection> clients;
+  int status = 200;
+  while (status == 200 && clients.size() < 10) {
+    clients.emplace_back(port).Send(HttpGet("/large"));
+    const HttpResponse response = clients.back().ReadHeaders();
+    status = response.status;
+    EXPECT_EQ(status == 503 ? "5" : "", response.Header("retry-after"));
+  }
+  EXPECT_EQ(503, status);
+  EXPECT_EQ("content of /a", Get("/a").body);
+  clients.clear();
+  const auto end = std::chrono::steady_clock::now() + test::DEADLINE;
+  while (Get("/large").status != 200 && std::chrono::steady_clock::now() < end) {
+    poll(nullptr, 0, 20);
+  }
+  EXPECT_EQ(200, Get("/large").status);
 }
 
 TEST_F(WebServer, EndsConnectionsThatSendTooSlowly) {

@@ -1,5 +1,6 @@
 // What readers see of the snapshot while the merged database changes.
 
+#include "SlowFile.h"
 #include "SnapshotTest.h"
 
 #include <gmock/gmock.h>
@@ -273,6 +274,53 @@ TEST_F(ChangingSnapshot, AnotherFileAtTheSamePathReplacesEverything) {
   EXPECT_THAT(Names(), ElementsAre("new.jpg"));
 }
 
+// Pages that are still open have the ids of the former database.
+TEST_F(ChangingSnapshot, AnIdNeverMeansThePhotoOfAnotherDatabase) {
+  for (const char* const name : {"1.jpg", "2.jpg", "3.jpg"}) {
+    merged_->AddFile(a_, name, 100, A);
+  }
+  Update();
+  const auto former = reader_->Photos({}, std::nullopt, 10);
+  path_ = "/tmp/other/zophotos.db";
+  {
+    MergedFile other(path_);
+    const std::int64_t folder = other.AddVolume(A);
+    for (const char* const name : {"3.jpg", "1.jpg", "2.jpg"}) {
+      other.AddFile(folder, name, 100, A);
+    }
+  }
+  EXPECT_TRUE(Update());
+  EXPECT_THAT(Names(), ElementsAre("2.jpg", "1.jpg", "3.jpg"));
+  for (const web::Photo& photo : former) {
+    EXPECT_EQ(reader_->Find(photo.id), std::nullopt) << photo.name;
+  }
+  // The same with another file at the same path.
+  const auto second = reader_->Photos({}, std::nullopt, 10);
+  fs::rename(MERGED, path_);
+  EXPECT_TRUE(Update());
+  EXPECT_THAT(Names(), ElementsAre("3.jpg", "2.jpg", "1.jpg"));
+  for (const web::Photo& photo : second) {
+    EXPECT_EQ(reader_->Find(photo.id), std::nullopt) << photo.name;
+  }
+}
+
+TEST_F(ChangingSnapshot, IdsStayWhenTheSnapshotIsBuiltAgain) {
+  for (const char* const name : {"1.jpg", "2.jpg", "3.jpg"}) {
+    merged_->AddFile(a_, name, 100, A);
+  }
+  Update();
+  const auto before = reader_->Photos({}, std::nullopt, 10);
+  reader_.reset();
+  snapshot_.reset();
+  fs::remove_all(CACHE);
+  Start();
+  Update();
+  EXPECT_EQ(reader_->Photos({}, std::nullopt, 10), before);
+  merged_->RemoveFile(2);
+  EXPECT_TRUE(Update());
+  EXPECT_THAT(Names(), ElementsAre("3.jpg", "1.jpg"));
+}
+
 TEST_F(ChangingSnapshot, IsEmptyWithoutAMergedDatabase) {
   merged_->AddFile(a_, "1.jpg", 1, A);
   Update();
@@ -301,6 +349,28 @@ TEST_F(ChangingSnapshot, ALockedDatabaseIsReadLater) {
   merged_->Run("COMMIT");
   EXPECT_TRUE(Update());
   EXPECT_THAT(Names(), ElementsAre("2.jpg", "1.jpg"));
+}
+
+// A merge that wants to commit waits for the lock.
+TEST_F(ChangingSnapshot, OfASlowDiskLocksTheDatabaseForAShortTimeOnly) {
+  merged_->Run("BEGIN");
+  for (int i = 0; i < 30'000; ++i) {
+    merged_->AddFile(a_, "Photo_" + std::to_string(i) + ".jpg", i, A);
+  }
+  for (int i = 0; i < 300; ++i) {
+    merged_->AddFolder(a_, A + std::to_string(i) + std::string(4000, 'x') + '/', A);
+    merged_->SetStatistics("/shares/" + std::to_string(i) + std::string(4000, 'x') + '/', 1, 1, 1);
+  }
+  merged_->Run("COMMIT");
+  const SlowFile slow(MERGED);
+  for (const char* const change : {"first", "second"}) {
+    merged_->AddFile(a_, std::string(change) + ".jpg", 50'000, A);
+    const int before = slow.Reads();
+    EXPECT_TRUE(snapshot_->Update());
+    EXPECT_LT(300, slow.Reads() - before) << change;
+    EXPECT_GT(50, slow.MostReadsLocked()) << change;
+  }
+  EXPECT_THAT(Names(WithWords("second")), ElementsAre("second.jpg"));
 }
 
 TEST_F(ChangingSnapshot, KeepsTheMergedDatabaseClosed) {

@@ -2,6 +2,11 @@
 
 #include <microhttpd.h>
 
+#include <poll.h>
+
+#include <algorithm>
+#include <vector>
+
 namespace orva::web {
 
 void EventStreams::PublishVersion(std::int64_t version) {
@@ -20,6 +25,7 @@ void EventStreams::PublishVolumes() {
 
 void EventStreams::KeepAlive() {
   const std::lock_guard lock(mutex_);
+  EndGone();
   for (Stream& stream : streams_) {
     if (Clock::now() - stream.lastSent >= SILENCE) {
       Resume(stream);
@@ -36,11 +42,17 @@ void EventStreams::Close() {
 MHD_Response* EventStreams::Open(MHD_Connection* connection) {
   constexpr std::size_t BLOCK = 1024;
   const std::lock_guard lock(mutex_);
-  if (isClosed_ || streams_.size() >= MOST) {
+  if (streams_.size() >= MOST) {
+    EndGone();
+  }
+  if (isClosed_ || std::ranges::count(streams_, false, &Stream::isGone) >= std::ptrdiff_t{MOST}) {
     return nullptr;
   }
+  const int socket =
+      MHD_get_connection_info(connection, MHD_CONNECTION_INFO_CONNECTION_FD)->connect_fd;
   streams_.push_back({.all = *this,
                       .connection = connection,
+                      .socket = socket,
                       .unsent = "retry: 3000\n\n",
                       .sentVolumes = volumes_});
   MHD_Response* const response =
@@ -57,6 +69,9 @@ std::ptrdiff_t EventStreams::Read(void* stream, std::uint64_t /*position*/, char
   const std::lock_guard lock(self.all.mutex_);
   if (self.all.isClosed_) {
     return MHD_CONTENT_READER_END_OF_STREAM;
+  }
+  if (self.isGone) {
+    return MHD_CONTENT_READER_END_WITH_ERROR;
   }
   self.all.Collect(self);
   if (self.unsent.empty()) {
@@ -104,6 +119,24 @@ void EventStreams::Resume(Stream& stream) {
 void EventStreams::ResumeAll() {
   for (Stream& stream : streams_) {
     Resume(stream);
+  }
+}
+
+/// Ends the streams whose clients are gone. libmicrohttpd does not look at the sockets of suspended
+/// connections.
+void EventStreams::EndGone() {
+  std::vector<pollfd> sockets;
+  sockets.reserve(streams_.size());
+  for (const Stream& stream : streams_) {
+    sockets.push_back({.fd = stream.socket, .events = POLLRDHUP, .revents = 0});
+  }
+  poll(sockets.data(), sockets.size(), 0);
+  auto state = sockets.begin();
+  for (Stream& stream : streams_) {
+    if ((state++->revents & (POLLRDHUP | POLLHUP | POLLERR)) != 0) {
+      stream.isGone = true;
+      Resume(stream);
+    }
   }
 }
 

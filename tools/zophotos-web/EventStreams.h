@@ -19,7 +19,7 @@ public:
   static constexpr std::size_t MOST = 256;
 
   /// A stream without events gets a comment after this time, so that clients and proxies know that
-  /// it is alive, and so that we notice when the client is gone.
+  /// it is alive.
   static constexpr std::chrono::seconds SILENCE{25};
 
   EventStreams() = default;
@@ -34,7 +34,7 @@ public:
   /// volumes has changed.
   void PublishVolumes();
 
-  /// Sends the comments that are due.
+  /// Sends the comments that are due, and ends the streams whose clients are gone.
   void KeepAlive();
 
   /// Ends all streams, and accepts no more.
@@ -50,11 +50,13 @@ private:
   struct Stream {
     EventStreams& all;
     MHD_Connection* connection;
+    int socket;
     std::string unsent{};          ///< text that did not fit
     std::int64_t sentVersion = -1; ///< -1: none
     std::uint64_t sentVolumes = 0; ///< counts as volumes_ does
     Clock::time_point lastSent = Clock::now();
     bool isSuspended = false;
+    bool isGone = false; ///< the client
   };
 
   static std::ptrdiff_t Read(void* stream, std::uint64_t position, char* buffer, std::size_t size);
@@ -63,6 +65,7 @@ private:
   void Collect(Stream& stream) const;
   static void Resume(Stream& stream);
   void ResumeAll();
+  void EndGone();
 
   std::mutex mutex_;
   std::list<Stream> streams_;

@@ -21,7 +21,6 @@
 #include <condition_variable>
 #include <limits>
 #include <mutex>
-#include <set>
 #include <stop_token>
 #include <thread>
 
@@ -44,7 +43,7 @@ constexpr std::chrono::seconds LONGEST_STEP(5);
 constexpr int LONGEST_VALUE = 100'000;
 
 constexpr std::size_t LONGEST_NAME = 4096;
-constexpr int MOST_STATISTICS = 1'000;
+constexpr std::size_t MOST_STATISTICS = 1'000;
 
 /// Interrupts the connection's statements if they still run after LONGEST_STEP.
 class WorkLimit {
@@ -185,12 +184,11 @@ FileRow ReadFile(const SQLite::Statement& row) {
 /// The time for which one call may lock the database.
 class LockedTime {
 public:
-  /// Whether it is over. Looks at the clock once for some rows.
-  bool IsOver() { return ++rows_ % 64 == 0 && Clock::now() >= end_; }
+  /// Whether it is over. To be called after each row: on a slow disk, each may take milliseconds.
+  bool IsOver() const { return Clock::now() >= end_; }
 
 private:
   Clock::time_point end_ = Clock::now() + LOCKED;
-  unsigned rows_ = 0;
 };
 
 /// Calls `visit` for each row of `query` after the id `after`, which it advances. A row with a
@@ -198,7 +196,7 @@ private:
 /// because the time was over.
 template <typename Visit>
 bool ReadRows(SQLite::Database& database, const char* sql, const char* nextId, std::int64_t& after,
-              LockedTime& time, const Visit& visit) {
+              const LockedTime& time, const Visit& visit) {
   for (;;) {
     SQLite::Statement query(database, sql);
     query.bind(1, after);
@@ -237,6 +235,8 @@ constexpr const char* NEXT_FOLDER =
     "SELECT folder_id FROM Folders WHERE folder_id > ? ORDER BY folder_id LIMIT 1";
 constexpr const char* NEXT_FILE =
     "SELECT file_id FROM Files WHERE file_id > ? ORDER BY file_id LIMIT 1";
+constexpr const char* NEXT_STATISTICS =
+    "SELECT id FROM Statistics WHERE id > ? ORDER BY id LIMIT 1";
 
 /// Where SQLite counts the changes of a file.
 constexpr std::size_t CHANGE_COUNTER = 24;
@@ -349,7 +349,7 @@ std::int64_t MergedSource::DataVersion() {
 bool MergedSource::ReadMore(Position& position, MergedRows& rows) {
   return Try([&] {
     const SQLite::Transaction oneState(database_);
-    LockedTime time;
+    const LockedTime time;
     return ReadRows(database_,
                     "SELECT folder_id, parent_folder_id, name, volume FROM Folders "
                     "WHERE folder_id > ? ORDER BY folder_id",
@@ -370,7 +370,7 @@ bool MergedSource::ReadMore(Position& position, MergedRows& rows) {
 
 bool MergedSource::ReadFolderIds(std::int64_t& after, std::vector<std::int64_t>& ids) {
   return Try([&] {
-    LockedTime time;
+    const LockedTime time;
     return ReadRows(database_,
                     "SELECT folder_id FROM Folders WHERE folder_id > ? ORDER BY folder_id",
                     NEXT_FOLDER, after, time,
@@ -380,7 +380,7 @@ bool MergedSource::ReadFolderIds(std::int64_t& after, std::vector<std::int64_t>&
 
 bool MergedSource::ReadFileIds(std::int64_t& after, std::vector<std::uint32_t>& ids) {
   return Try([&] {
-    LockedTime time;
+    const LockedTime time;
     return ReadRows(database_, "SELECT file_id FROM Files WHERE file_id > ? ORDER BY file_id",
                     NEXT_FILE, after, time, [&](std::int64_t id, const SQLite::Statement*) {
                       ids.push_back(static_cast<std::uint32_t>(id & 0x7FFF'FFFF));
@@ -388,44 +388,47 @@ bool MergedSource::ReadFileIds(std::int64_t& after, std::vector<std::uint32_t>& 
   });
 }
 
-std::vector<StatisticsRow> MergedSource::ReadStatistics() {
-  std::vector<StatisticsRow> rows;
-  std::set<std::string, std::less<>> volumes;
-  SQLite::Statement query(database_, "SELECT volume, photos_xcoded, photos_total, "
-                                     "last_updated_time FROM Statistics ORDER BY id LIMIT ?");
-  query.bind(1, MOST_STATISTICS);
-  for (;;) {
-    const int code = query.tryExecuteStep();
-    if (code == SQLITE_DONE || code == SQLITE_TOOBIG) {
-      return rows;
-    }
-    if (code != SQLITE_ROW) {
-      throw SQLite::Exception(database_.getHandle(), code);
-    }
-    // Only the first row of each volume counts, as for the daemon.
-    const auto volume = Text(query, 0);
-    if (volume && IsSoundText(*volume) && volumes.emplace(*volume).second) {
-      rows.push_back({.volume = std::string(*volume),
-                      .transcoded = Integer(query, 1).value_or(0),
-                      .total = Integer(query, 2).value_or(0),
-                      .mergedUpTo = Integer(query, 3).value_or(0)});
-    }
-  }
+bool MergedSource::ReadStatistics(std::int64_t& after, Statistics& statistics) {
+  return Try([&] {
+    const LockedTime time;
+    const bool hasMore = ReadRows(
+        database_,
+        "SELECT id, volume, photos_xcoded, photos_total, last_updated_time FROM Statistics "
+        "WHERE id > ? ORDER BY id",
+        NEXT_STATISTICS, after, time, [&](std::int64_t, const SQLite::Statement* row) {
+          const auto volume = row == nullptr ? std::nullopt : Text(*row, 1);
+          // Only the first row of each volume counts, as for the daemon.
+          if (volume && IsSoundText(*volume) && statistics.size() < MOST_STATISTICS) {
+            statistics.try_emplace(std::string(*volume),
+                                   StatisticsRow{.transcoded = Integer(*row, 2).value_or(0),
+                                                 .total = Integer(*row, 3).value_or(0),
+                                                 .mergedUpTo = Integer(*row, 4).value_or(0)});
+          }
+        });
+    return hasMore && statistics.size() < MOST_STATISTICS;
+  });
 }
 
-MergedSource::Summary MergedSource::ReadSummary() {
+std::int64_t MergedSource::EstimateFiles() {
+  constexpr std::int64_t FILES_ON_A_PAGE = 40;
+  return Try([this] {
+    const std::int64_t last =
+        Number(database_, "SELECT ifnull((SELECT max(file_id) FROM Files), 0)");
+    return std::clamp<std::int64_t>(last, 0,
+                                    FILES_ON_A_PAGE * Number(database_, "PRAGMA page_count"));
+  });
+}
+
+MergedSource::State MergedSource::ReadState() {
   return Try([this] {
     const SQLite::Transaction oneState(database_);
-    // SQLite reads only the headers of the pages for count(*).
-    Summary summary{.files = Number(database_, "SELECT count(*) FROM Files"),
-                    .folders = Number(database_, "SELECT count(*) FROM Folders"),
-                    .lastFile =
-                        Number(database_, "SELECT ifnull((SELECT seq FROM sqlite_sequence WHERE "
-                                          "name = 'Files' AND typeof(seq) = 'integer'), 0)"),
-                    .statistics = ReadStatistics(),
-                    .identity = IdentifyOpen(database_, path_)};
-    summary.dataVersion = Number(database_, "PRAGMA data_version");
-    return summary;
+    // A crafted database may have any number of sequences.
+    State state{.lastFile = Number(database_, "SELECT ifnull((SELECT seq FROM (SELECT name, seq "
+                                              "FROM sqlite_sequence LIMIT 100) WHERE name = "
+                                              "'Files' AND typeof(seq) = 'integer'), 0)"),
+                .identity = IdentifyOpen(database_, path_)};
+    state.dataVersion = Number(database_, "PRAGMA data_version");
+    return state;
   });
 }
 

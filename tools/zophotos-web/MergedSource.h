@@ -4,6 +4,8 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <functional>
+#include <map>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -57,11 +59,13 @@ private:
 
 /// A row of Statistics.
 struct StatisticsRow {
-  std::string volume;
   std::int64_t transcoded = 0;
   std::int64_t total = 0;
   std::int64_t mergedUpTo = 0;
 };
+
+/// By volume.
+using Statistics = std::map<std::string, StatisticsRow, std::less<>>;
 
 /// Identifies a file, and its content at a time. Valid until the next start of the system.
 struct SourceIdentity {
@@ -76,8 +80,8 @@ struct SourceIdentity {
 std::optional<SourceIdentity> Identify(const std::string& path);
 
 /// The merged database, open to be read in place. It is untrusted: the work of each call is
-/// limited, and so is the memory. Each call locks the database for about 20 milliseconds at most,
-/// ReadSummary for as long as SQLite counts rows. All operations throw zophotos::Failure.
+/// limited, and so is the memory. Each call locks the database for about 20 milliseconds at most.
+/// All operations throw zophotos::Failure.
 class MergedSource {
 public:
   explicit MergedSource(const std::string& path);
@@ -100,22 +104,23 @@ public:
   bool ReadFolderIds(std::int64_t& after, std::vector<std::int64_t>& ids);
   bool ReadFileIds(std::int64_t& after, std::vector<std::uint32_t>& ids);
 
-  /// What a consistent state of the database has.
-  struct Summary {
+  /// Adds the first row of each volume with a larger id than `after`, which it advances, up to
+  /// 1,000 volumes. Returns whether there are more.
+  bool ReadStatistics(std::int64_t& after, Statistics& statistics);
+
+  /// About how many files there are. Counting them takes as long as reading all their ids.
+  std::int64_t EstimateFiles();
+
+  struct State {
     std::int64_t dataVersion = 0;
-    std::int64_t files = 0;
-    std::int64_t folders = 0;
-    std::int64_t lastFile = 0; ///< largest id that a file ever had
-    std::vector<StatisticsRow> statistics;
+    std::int64_t lastFile = 0;              ///< largest id that a file ever had
     std::optional<SourceIdentity> identity; ///< of the file at the path
   };
-  Summary ReadSummary();
+  State ReadState();
 
 private:
   template <typename Work>
   auto Try(const Work& work);
-
-  std::vector<StatisticsRow> ReadStatistics();
 
   std::string path_;
   SQLite::Database database_;

@@ -610,6 +610,10 @@ std::string VolumesPage(const Site& site) {
     main << VolumeCard(volume);
   }
   main << "</ul>\n<template id=\"volume\">" << VolumeCard({}) << "</template>\n";
+  if (site.mayHaveMoreVolumes) {
+    main << "<p>There may be more volumes: this page shows the first "
+         << Grouped(static_cast<std::int64_t>(site.volumes.size())) << ".</p>\n";
+  }
   return Document(site, Section::Volumes, "Volumes", main);
 }
 

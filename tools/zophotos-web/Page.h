@@ -17,6 +17,7 @@ namespace orva::web {
 struct Site {
   SnapshotStatus snapshot;
   std::vector<Volume> volumes;
+  bool mayHaveMoreVolumes = false; ///< these are the first ones
 };
 
 /// A part of a list of photos, newest first.

@@ -15,6 +15,12 @@ namespace orva::web {
 namespace {
 
 constexpr std::size_t PAGE_SIZE = 100; // photos or folders
+constexpr std::size_t MOST_VOLUMES = 1'000;
+constexpr std::size_t MOST_ANCESTORS = 100;
+
+/// Bytes of the names and paths in one list, which are several times as many in the response. A
+/// list with more has fewer items.
+constexpr std::size_t MOST_BYTES = 64 << 10;
 constexpr std::string_view API = "/api/";
 
 constexpr int NOT_MODIFIED = 304;
@@ -70,15 +76,40 @@ bool Skip(std::string_view& text, std::string_view prefix) {
   return true;
 }
 
-/// Removes one of the two ends of a list that has one item more than wanted. Returns whether it
-/// had.
+std::size_t BytesOf(const Photo& photo) {
+  return photo.path.size() + photo.name.size() + photo.volume.size();
+}
+
+std::size_t BytesOf(const Folder& folder) {
+  return folder.path.size() + folder.volume.size();
+}
+
+std::size_t BytesOf(const VolumeRow& volume) {
+  return volume.mountPoint.size();
+}
+
+std::size_t BytesOf(const Volume& volume) {
+  return volume.mountPoint.size() + volume.activity.size();
+}
+
+/// Shortens a list at one end to at most `count` items and MOST_BYTES, but not to nothing. Each
+/// item has `more` bytes in addition. Returns whether the list was longer.
 template <typename Item>
-bool CutOff(std::vector<Item>& items, std::size_t count, bool atBegin) {
-  const bool more = items.size() > count;
-  if (more) {
-    items.erase(atBegin ? items.begin() : items.end() - 1);
+bool CutOff(std::vector<Item>& items, std::size_t count, bool atBegin, std::size_t more = 0) {
+  std::size_t kept = 0;
+  std::size_t bytes = 0;
+  while (kept < std::min(count, items.size())) {
+    bytes += BytesOf(atBegin ? items[items.size() - 1 - kept] : items[kept]) + more;
+    if (kept > 0 && bytes > MOST_BYTES) {
+      break;
+    }
+    ++kept;
   }
-  return more;
+  const bool isLonger = kept < items.size();
+  const auto surplus = static_cast<std::ptrdiff_t>(items.size() - kept);
+  items.erase(atBegin ? items.begin() : items.end() - surplus,
+              atBegin ? items.begin() + surplus : items.end());
+  return isLonger;
 }
 
 template <typename Item>
@@ -105,6 +136,13 @@ std::int64_t TopOf(const Readers::Lease& reader) {
 std::string PathAfter(const Readers::Lease& reader, const std::optional<std::int64_t>& folder) {
   const auto found = folder ? reader->FindFolder(*folder) : std::nullopt;
   return found ? found->path : "";
+}
+
+/// The folders that contain a folder: the nearest ones, from the top.
+std::vector<Folder> AncestorsOf(const Readers::Lease& reader, std::int64_t folder) {
+  std::vector<Folder> ancestors = reader->Ancestors(folder);
+  CutOff(ancestors, MOST_ANCESTORS, true);
+  return ancestors;
 }
 
 /// The part of the file that the request asks for.
@@ -250,7 +288,7 @@ Response Router::FoldersView(const Target& target, std::optional<std::int64_t> f
       if (!view.folder) {
         return NoFolder(target);
       }
-      view.ancestors = reader->Ancestors(*folder);
+      view.ancestors = AncestorsOf(reader, *folder);
     }
     view.folders =
         reader->Folders(folder ? *folder : TopOf(reader),
@@ -354,7 +392,7 @@ Response Router::FolderJson(std::int64_t id) {
     return Refuse(NOT_FOUND, API, "There is no such folder.");
   }
   Json document = ToJson(*folder);
-  document["ancestors"] = Array(reader->Ancestors(id));
+  document["ancestors"] = Array(AncestorsOf(reader, id));
   return JsonText(document);
 }
 
@@ -364,7 +402,8 @@ Response Router::MonthsJson(const Target& target) {
 }
 
 Response Router::VolumesJson() {
-  return JsonText({{"volumes", Array(MakeSite().volumes)}});
+  const Site site = MakeSite();
+  return JsonText({{"volumes", Array(site.volumes)}, {"more", site.mayHaveMoreVolumes}});
 }
 
 Response Router::StatusJson() {
@@ -375,8 +414,14 @@ Response Router::StatusJson() {
 
 /// What all pages show.
 Site Router::MakeSite() {
-  return {.snapshot = snapshot_.Status(),
-          .volumes = Combine(Readers::Lease(readers_)->Volumes(), zophotos::ReadActivity())};
+  std::vector<VolumeRow> rows = Readers::Lease(readers_)->Volumes(MOST_BYTES);
+  // The snapshot has no more than these.
+  const bool isFull = rows.size() >= MOST_VOLUMES || CutOff(rows, MOST_VOLUMES, false);
+  Site site{.snapshot = snapshot_.Status(),
+            .volumes = Combine(rows, zophotos::ReadActivity()),
+            .mayHaveMoreVolumes = isFull};
+  site.mayHaveMoreVolumes = CutOff(site.volumes, MOST_VOLUMES, false) || isFull;
+  return site;
 }
 
 /// The part of a list that the request asks for: the newest photos, those before one, or those
@@ -389,14 +434,16 @@ PhotoList Router::MakeList(const Target& target, const Filter& filter, std::size
   }
   PhotoList list;
   const Readers::Lease reader(readers_);
+  // Each photo's link on a page repeats the filter.
+  const std::size_t inLink = filter.words.size() + (filter.volume ? filter.volume->size() : 0);
   if (after) {
     list.photos = reader->PhotosAfter(filter, *after, count + 1);
-    list.hasNewer = CutOff(list.photos, count, true);
+    list.hasNewer = CutOff(list.photos, count, true, inLink);
     const PhotoId last = list.photos.empty() ? *after : list.photos.back().id;
     list.hasOlder = !reader->Photos(filter, last, 1).empty();
   } else {
     list.photos = reader->Photos(filter, before, count + 1);
-    list.hasOlder = CutOff(list.photos, count, false);
+    list.hasOlder = CutOff(list.photos, count, false, inLink);
     if (before) {
       const PhotoId first = list.photos.empty() ? *before : list.photos.front().id;
       list.hasNewer = !reader->PhotosAfter(filter, first, 1).empty();

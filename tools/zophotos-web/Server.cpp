@@ -20,6 +20,14 @@ namespace {
 constexpr std::size_t CONNECTION_MEMORY = 16 << 10; // bytes: bounds the headers of a request
 constexpr unsigned SILENCE = 30;                    // seconds
 
+/// A text with more than SMALL_TEXT bytes is not sent while texts with MOST_UNSENT bytes wait for
+/// clients that do not read them.
+constexpr std::size_t SMALL_TEXT = 8 << 10;
+constexpr std::size_t MOST_UNSENT = 16 << 20;
+
+/// Seconds after which a client that was refused may try again.
+constexpr const char* RETRY_AFTER = "5";
+
 /// What all responses have. Nothing may be loaded from elsewhere, and no other site may show or
 /// read what we send.
 constexpr std::array<std::pair<const char*, const char*>, 7> SECURITY{
@@ -40,7 +48,8 @@ using MhdResponse = std::unique_ptr<MHD_Response, ResponseReleaser>;
 
 /// A request, from its first line until the response is sent.
 struct Exchange {
-  std::string text;                 ///< the target as it was sent
+  std::string text; ///< the target as it was sent
+  bool isHead = false;
   std::optional<Request> request{}; ///< nothing until it is checked
 };
 
@@ -93,14 +102,32 @@ MHD_Result Collect(void* headers, MHD_ValueKind /*kind*/, const char* key, std::
   return MHD_YES;
 }
 
-void ReleaseText(void* text) {
-  std::unique_ptr<std::string>(static_cast<std::string*>(text)).reset();
+/// The body of a response, which is counted while it lives.
+class TextBody {
+public:
+  TextBody(std::string text, std::atomic<std::size_t>& unsent)
+      : text_(std::move(text)), unsent_(unsent) {
+    unsent_ += text_.capacity();
+  }
+  TextBody(const TextBody&) = delete;
+  TextBody& operator=(const TextBody&) = delete;
+  ~TextBody() { unsent_ -= text_.capacity(); }
+
+  std::string& Text() noexcept { return text_; }
+
+private:
+  std::string text_;
+  std::atomic<std::size_t>& unsent_;
+};
+
+void ReleaseText(void* body) {
+  std::unique_ptr<TextBody>(static_cast<TextBody*>(body)).reset();
 }
 
-MhdResponse MakeTextBody(std::string text) {
-  auto owner = std::make_unique<std::string>(std::move(text));
+MhdResponse MakeTextBody(std::string text, std::atomic<std::size_t>& unsent) {
+  auto owner = std::make_unique<TextBody>(std::move(text), unsent);
   MhdResponse response(MHD_create_response_from_buffer_with_free_callback_cls(
-      owner->size(), owner->data(), &ReleaseText, owner.get()));
+      owner->Text().size(), owner->Text().data(), &ReleaseText, owner.get()));
   if (response) {
     static_cast<void>(owner.release()); // by ReleaseText
   }
@@ -228,7 +255,11 @@ struct Server::Calls {
     }
     try {
       if (current->request) {
-        return Send(self, connection, Answer(self, *current->request));
+        Response response = Answer(self, *current->request);
+        if (current->isHead && std::holds_alternative<EventStream>(response.body)) {
+          response.body = std::string(); // libmicrohttpd would send the end of a stream
+        }
+        return Send(self, connection, current->request->target.path, std::move(response));
       }
       const auto refusal = CheckRequest(self, connection, method, *current);
       return refusal ? Refuse(self, connection, *refusal, current->text) : MHD_YES;
@@ -243,6 +274,7 @@ struct Server::Calls {
                                              std::string_view method, Exchange& exchange) {
     Headers headers;
     MHD_get_connection_values_n(connection, MHD_HEADER_KIND, &Collect, &headers);
+    exchange.isHead = method == "HEAD";
     auto refusal = Check(headers, self.hosts_, SocketOf(connection), method);
     auto target = ParseTarget(exchange.text);
     if (!refusal && !target) {
@@ -275,7 +307,7 @@ struct Server::Calls {
     if (refusal.status == MHD_HTTP_METHOD_NOT_ALLOWED) {
       response.headers.emplace_back("Allow", "GET, HEAD");
     }
-    return Send(self, connection, std::move(response));
+    return Send(self, connection, target, std::move(response));
   }
 
   static MhdResponse MakeBody(Server& self, MHD_Connection* connection, Response& response) {
@@ -285,8 +317,11 @@ struct Server::Calls {
       return MakeFileBody(std::move(*part));
     }
     if (auto* const text = std::get_if<std::string>(&response.body)) {
+      if (text->size() > SMALL_TEXT && self.unsentTexts_ > MOST_UNSENT) {
+        return {};
+      }
       current.SendResponse(text->size());
-      return MakeTextBody(std::move(*text));
+      return MakeTextBody(std::move(*text), self.unsentTexts_);
     }
     MhdResponse events(self.events_.Open(connection));
     if (events) {
@@ -295,11 +330,21 @@ struct Server::Calls {
     return events;
   }
 
-  static MHD_Result Send(Server& self, MHD_Connection* connection, Response response) {
+  static Response Busy(const Server& self, const std::string& path, const char* reason) {
+    Response response = self.handlers_.refuse(MHD_HTTP_SERVICE_UNAVAILABLE, path, reason);
+    response.headers.emplace_back("Retry-After", RETRY_AFTER);
+    return response;
+  }
+
+  /// Sends the response to a request for `path`.
+  static MHD_Result Send(Server& self, MHD_Connection* connection, const std::string& path,
+                         Response response) {
     MhdResponse body = MakeBody(self, connection, response);
-    if (!body && std::holds_alternative<EventStream>(response.body)) {
-      response = self.handlers_.refuse(MHD_HTTP_SERVICE_UNAVAILABLE, "/api/events",
-                                       "Too many clients wait for events.");
+    if (!body && !std::holds_alternative<FilePart>(response.body)) {
+      response = Busy(self, path,
+                      std::holds_alternative<EventStream>(response.body)
+                          ? "Too many clients wait for events."
+                          : "Too many responses wait for clients.");
       body = MakeBody(self, connection, response);
     }
     if (!body) {

@@ -8,6 +8,8 @@
 
 #include "orvautil/FileDescriptor.h"
 
+#include <atomic>
+#include <cstddef>
 #include <functional>
 #include <string>
 #include <thread>
@@ -46,7 +48,8 @@ private:
 
   AllowedHosts hosts_;
   Handlers handlers_;
-  unsigned limit_; ///< of connections
+  unsigned limit_;                           ///< of connections
+  std::atomic<std::size_t> unsentTexts_ = 0; ///< bytes of the texts that responses have
   EventStreams events_;
   Connections connections_;
   MHD_Daemon* daemon_ = nullptr; ///< owned

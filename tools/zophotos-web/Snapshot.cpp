@@ -261,10 +261,11 @@ private:
         return false;
       }
     }
-    const MergedSource::Summary summary = source.ReadSummary();
     const std::int64_t folders = state.folders;
-    if (summary.lastFile < state.position.file ||
-        !RemoveMissing(source, summary, mostChanges, stop)) {
+    const auto left = RemoveMissing(source, mostChanges, stop);
+    const Statistics statistics = ReadStatistics(source, stop);
+    const MergedSource::State sourceState = source.ReadState();
+    if (!left || sourceState.lastFile < state.position.file) {
       file_->Rollback();
       return false;
     }
@@ -272,12 +273,12 @@ private:
     if (hasChanged) {
       file_->AdoptFolders();
     }
-    hasChanged = file_->ReplaceStatistics(summary.statistics) || hasChanged ||
-                 state.changes != changesBefore;
-    SetSource(state, identity, summary, version);
-    if (summary.dataVersion == version) {
-      state.filesLeftOut = summary.files - state.photos;
-      state.foldersLeftOut = summary.folders - state.folders;
+    hasChanged =
+        file_->ReplaceStatistics(statistics) || hasChanged || state.changes != changesBefore;
+    SetSource(state, identity, sourceState, version);
+    if (sourceState.dataVersion == version) {
+      state.filesLeftOut = left->files - state.photos;
+      state.foldersLeftOut = left->folders - state.folders;
     }
     if (hasChanged) {
       state.version = std::max(state.version + 1, Now());
@@ -286,28 +287,42 @@ private:
     return true;
   }
 
-  /// Counts are enough to see that something is missing: everything new has been added.
-  bool RemoveMissing(MergedSource& source, const MergedSource::Summary& summary,
-                     std::int64_t mostChanges, const std::stop_token& stop) {
+  /// Rows of the merged database.
+  struct RowCounts {
+    std::int64_t files = 0;
+    std::int64_t folders = 0;
+  };
+
+  /// Removes what the merged database does not have any more, and returns how many rows it has;
+  /// nothing if there is too much to remove. Everything new has been added, so equal counts mean
+  /// that nothing is missing.
+  std::optional<RowCounts> RemoveMissing(MergedSource& source, std::int64_t mostChanges,
+                                         const std::stop_token& stop) {
     const SnapshotState& state = file_->State();
-    if (summary.files != state.photos + state.filesLeftOut) {
+    RowCounts left;
+    {
       std::vector<std::uint32_t> ids;
       ids.reserve(static_cast<std::size_t>(std::max<std::int64_t>(state.photos, 0)));
       for (std::int64_t after = 0; source.ReadFileIds(after, ids);) {
         StopIfAsked(stop);
       }
-      Missing<std::uint32_t> missing(std::move(ids));
-      file_->ForEachPhoto([&](std::int64_t id) { missing.Check(id, id & 0x7FFF'FFFF); });
-      if (state.changes + static_cast<std::int64_t>(missing.Ids().size()) > mostChanges) {
-        return false;
+      left.files = std::ssize(ids);
+      if (left.files != state.photos + state.filesLeftOut) {
+        Missing<std::uint32_t> missing(std::move(ids));
+        file_->ForEachPhoto(
+            [&](std::int64_t id) { missing.Check(id, RowOf(id, state.firstNumber)); });
+        if (state.changes + std::ssize(missing.Ids()) > mostChanges) {
+          return std::nullopt;
+        }
+        file_->RemovePhotos(missing.Ids());
       }
-      file_->RemovePhotos(missing.Ids());
     }
-    if (summary.folders != state.folders + state.foldersLeftOut) {
-      std::vector<std::int64_t> ids;
-      for (std::int64_t after = 0; source.ReadFolderIds(after, ids);) {
-        StopIfAsked(stop);
-      }
+    std::vector<std::int64_t> ids;
+    for (std::int64_t after = 0; source.ReadFolderIds(after, ids);) {
+      StopIfAsked(stop);
+    }
+    left.folders = std::ssize(ids);
+    if (left.folders != state.folders + state.foldersLeftOut) {
       Missing<std::int64_t> missing(std::move(ids));
       file_->ForEachFolder([&](std::int64_t id) { missing.Check(id, id); });
       for (const std::int64_t id : missing.Ids()) {
@@ -315,7 +330,15 @@ private:
         file_->RemoveFolder(id);
       }
     }
-    return true;
+    return left;
+  }
+
+  static Statistics ReadStatistics(MergedSource& source, const std::stop_token& stop) {
+    Statistics statistics;
+    for (std::int64_t after = 0; source.ReadStatistics(after, statistics);) {
+      StopIfAsked(stop);
+    }
+    return statistics;
   }
 
   /// Makes a new snapshot next to the present one and replaces that.
@@ -324,8 +347,9 @@ private:
     directory_.RemoveOthers(number_);
     SnapshotFile file = SnapshotFile::Create(directory_.File(number_ + 1));
     SnapshotState& state = file.State();
+    state.firstNumber = FirstNumber(identity);
     const std::int64_t version = source.DataVersion();
-    const std::int64_t total = source.ReadSummary().files;
+    const std::int64_t total = source.EstimateFiles();
     const auto show = [&](std::int64_t done) {
       StopIfAsked(stop);
       const std::lock_guard lock(mutex_);
@@ -338,9 +362,8 @@ private:
     file.SetFrequentPrefixes(sample.Frequent());
     file.AdoptFolders();
     file.IndexAll([&](std::int64_t done) { show(state.photos + done); });
-    const MergedSource::Summary summary = source.ReadSummary();
-    file.ReplaceStatistics(summary.statistics);
-    SetSource(state, identity, summary, version);
+    file.ReplaceStatistics(ReadStatistics(source, stop));
+    SetSource(state, identity, source.ReadState(), version);
     if (state.filesLeftOut != 0 || state.foldersLeftOut != 0) {
       Log("left out " + zophotos::Count(state.filesLeftOut, "file") + " and " +
           zophotos::Count(state.foldersLeftOut, "folder") +
@@ -388,12 +411,13 @@ private:
 
   /// Remembers what the snapshot agrees with, if nothing was changed while it was read.
   static void SetSource(SnapshotState& state, const SourceIdentity& identity,
-                        const MergedSource::Summary& summary, std::int64_t version) {
+                        const MergedSource::State& sourceState, std::int64_t version) {
     // Otherwise another file may have come to this path before it was opened.
-    const bool isSameFile = summary.identity && summary.identity->file == identity.file;
+    const bool isSameFile = sourceState.identity && sourceState.identity->file == identity.file;
     state.source = isSameFile ? identity : SourceIdentity();
-    state.source.content =
-        isSameFile && summary.dataVersion == version ? summary.identity->content : std::string();
+    state.source.content = isSameFile && sourceState.dataVersion == version
+                               ? sourceState.identity->content
+                               : std::string();
   }
 
   bool IsEmpty() { return file_->State().source.file.empty() && file_->State().folders == 0; }

@@ -15,7 +15,7 @@ namespace {
 
 /// Marks the file as ours; the second number changes with the tables.
 constexpr int APPLICATION = 0x5A505753;
-constexpr int FORMAT = 1;
+constexpr int FORMAT = 2;
 
 /// A crafted database may have any number of volumes.
 constexpr std::int64_t MOST_VOLUMES = 1'000;
@@ -33,8 +33,8 @@ constexpr int PAGES_TO_TIDY = 100;
 
 constexpr const char* TABLES = R"(
 CREATE TABLE State(version INTEGER, folder INTEGER, file INTEGER, photos INTEGER, folders INTEGER,
-  filesLeftOut INTEGER, foldersLeftOut INTEGER, changes INTEGER, boot TEXT, sourceFile TEXT,
-  sourceContent TEXT, isComplete INTEGER);
+  filesLeftOut INTEGER, foldersLeftOut INTEGER, changes INTEGER, firstNumber INTEGER, boot TEXT,
+  sourceFile TEXT, sourceContent TEXT, isComplete INTEGER);
 CREATE TABLE Photos(id INTEGER PRIMARY KEY, folder INTEGER, volume INTEGER, name TEXT);
 CREATE TABLE Folders(id INTEGER PRIMARY KEY, parent INTEGER, path TEXT, volume INTEGER);
 CREATE INDEX FoldersByParent ON Folders(parent, path);
@@ -44,7 +44,7 @@ CREATE TABLE Volumes(number INTEGER PRIMARY KEY, mountPoint TEXT UNIQUE);
 CREATE TABLE Statistics(mountPoint TEXT PRIMARY KEY, transcoded INTEGER, total INTEGER,
   mergedUpTo INTEGER, isGone INTEGER) WITHOUT ROWID;
 CREATE TABLE Prefixes(prefix TEXT PRIMARY KEY) WITHOUT ROWID;
-INSERT INTO State VALUES(0, 0, 0, 0, 0, 0, 0, 0, '', '', '', 0);
+INSERT INTO State VALUES(0, 0, 0, 0, 0, 0, 0, 0, 0, '', '', '', 0);
 )";
 
 void Configure(SQLite::Database& database) {
@@ -88,8 +88,18 @@ FrequentPrefixes ReadFrequentPrefixes(SQLite::Database& database) {
   return FrequentPrefixes(prefixes);
 }
 
-void PhotoBatch::Add(const FileRow& file, std::int64_t volume) {
-  rows_.push_back({.id = MakePhotoId(file.modified, file.id),
+std::int64_t FirstNumber(const SourceIdentity& source) {
+  // FNV-1a, then mixed: the identities of two files differ in a few digits.
+  std::uint64_t hash = 0xCBF2'9CE4'8422'2325;
+  for (const char c : source.file) {
+    hash = (hash ^ static_cast<unsigned char>(c)) * 0x100'0000'01B3;
+  }
+  hash = (hash ^ hash >> 33) * 0xFF51'AFD7'ED55'8CCD;
+  return static_cast<std::int64_t>(hash >> 34);
+}
+
+void PhotoBatch::Add(std::int64_t id, const FileRow& file, std::int64_t volume) {
+  rows_.push_back({.id = id,
                    .folder = file.folder,
                    .volume = static_cast<std::uint32_t>(volume),
                    .nameSize = static_cast<std::uint32_t>(file.name.size()),
@@ -158,7 +168,7 @@ SQLite::Statement& SnapshotFile::Prepared(const char* sql) {
 
 void SnapshotFile::LoadState() {
   SQLite::Statement row(database_, "SELECT version, folder, file, photos, folders, filesLeftOut, "
-                                   "foldersLeftOut, changes, boot, sourceFile, "
+                                   "foldersLeftOut, changes, firstNumber, boot, sourceFile, "
                                    "sourceContent FROM State");
   row.executeStep();
   state_ = {
@@ -169,19 +179,21 @@ void SnapshotFile::LoadState() {
       .filesLeftOut = row.getColumn(5).getInt64(),
       .foldersLeftOut = row.getColumn(6).getInt64(),
       .changes = row.getColumn(7).getInt64(),
-      .boot = row.getColumn(8).getString(),
-      .source = {.file = row.getColumn(9).getString(), .content = row.getColumn(10).getString()}};
+      .firstNumber = row.getColumn(8).getInt64(),
+      .boot = row.getColumn(9).getString(),
+      .source = {.file = row.getColumn(10).getString(), .content = row.getColumn(11).getString()}};
 }
 
 void SnapshotFile::SaveState() {
   SQLite::Statement& update =
       Prepared("UPDATE State SET version = ?, folder = ?, file = ?, photos = ?, folders = ?, "
-               "filesLeftOut = ?, foldersLeftOut = ?, changes = ?, boot = ?, sourceFile = ?, "
+               "filesLeftOut = ?, foldersLeftOut = ?, changes = ?, firstNumber = ?, boot = ?, "
+               "sourceFile = ?, "
                "sourceContent = ?");
   int index = 0;
   for (const std::int64_t number :
        {state_.version, state_.position.folder, state_.position.file, state_.photos, state_.folders,
-        state_.filesLeftOut, state_.foldersLeftOut, state_.changes}) {
+        state_.filesLeftOut, state_.foldersLeftOut, state_.changes, state_.firstNumber}) {
     update.bind(++index, number);
   }
   update.bind(++index, state_.boot);
@@ -258,7 +270,8 @@ bool SnapshotFile::Collect(const FileRow& file, PhotoBatch& batch) {
   const auto volume =
       file.isSound && WordsOf(file.folder).exists ? VolumeNumber(file.volume) : std::nullopt;
   if (volume) {
-    batch.Add(file, *volume);
+    const std::int64_t number = (file.id & 0x7FFF'FFFF) + state_.firstNumber;
+    batch.Add(MakePhotoId(file.modified, number), file, *volume);
   } else {
     ++state_.filesLeftOut;
   }
@@ -470,17 +483,17 @@ bool SnapshotFile::HasRows(std::int64_t volume) {
   return hasPhotos;
 }
 
-bool SnapshotFile::ReplaceStatistics(const std::vector<StatisticsRow>& rows) {
+bool SnapshotFile::ReplaceStatistics(const Statistics& statistics) {
   using Values = std::array<std::int64_t, 4>;
   std::map<std::string, Values> wanted;
-  for (const StatisticsRow& row : rows) {
+  for (const auto& [mountPoint, row] : statistics) {
     SQLite::Statement& query = Prepared("SELECT number FROM Volumes WHERE mountPoint = ?");
-    BindText(query, 1, row.volume);
+    BindText(query, 1, mountPoint);
     const bool isKnown = query.executeStep();
     const std::int64_t number = isKnown ? query.getColumn(0).getInt64() : 0;
     query.reset();
     const bool isGone = row.mergedUpTo == 0 && !(isKnown && HasRows(number));
-    wanted[row.volume] = {row.transcoded, row.total, row.mergedUpTo, isGone ? 1 : 0};
+    wanted[mountPoint] = {row.transcoded, row.total, row.mergedUpTo, isGone ? 1 : 0};
   }
   std::map<std::string, Values> present;
   SQLite::Statement query(database_, "SELECT * FROM Statistics");

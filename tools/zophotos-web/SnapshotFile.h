@@ -24,17 +24,26 @@ SQLite::Database OpenForReading(const std::string& path);
 /// The frequent prefixes of the search index in an open snapshot.
 FrequentPrefixes ReadFrequentPrefixes(SQLite::Database& database);
 
-/// A photo's id: the time and the lower 31 bits of its row's id. Never negative: FTS5 (SQLite 3.40)
-/// writes beyond its memory when it merges lists with negative ids.
-constexpr std::int64_t MakePhotoId(std::int64_t modified, std::int64_t file) {
+/// A photo's id: the time and 31 bits that tell photos of the same time apart. Never negative: FTS5
+/// (SQLite 3.40) writes beyond its memory when it merges lists with negative ids.
+constexpr std::int64_t MakePhotoId(std::int64_t modified, std::int64_t number) {
   constexpr std::int64_t smallestTime = -0x8000'0000LL;
-  return (modified - smallestTime) << 31 | (file & 0x7FFF'FFFF);
+  return (modified - smallestTime) << 31 | (number & 0x7FFF'FFFF);
 }
 
 /// The time in a photo's id.
 constexpr std::int64_t TimeOf(std::int64_t id) {
   return (id >> 31) - 0x8000'0000LL;
 }
+
+/// The lower 31 bits of the id of a photo's row.
+constexpr std::int64_t RowOf(std::int64_t id, std::int64_t firstNumber) {
+  return (id - firstNumber) & 0x7FFF'FFFF;
+}
+
+/// Another merged database gives the ids of rows to other photos. The numbers in its photos' ids
+/// begin elsewhere among 2^30, so that an id from a page that is still open finds no other photo.
+std::int64_t FirstNumber(const SourceIdentity& source);
 
 /// What a snapshot's file says about itself.
 struct SnapshotState {
@@ -44,9 +53,10 @@ struct SnapshotState {
   std::int64_t folders = 0;
   std::int64_t filesLeftOut = 0; ///< rows of the merged database that the snapshot does not have
   std::int64_t foldersLeftOut = 0;
-  std::int64_t changes = 0; ///< photos added and removed since it was built
-  std::string boot;         ///< identifies the start of the system
-  SourceIdentity source;    ///< what the snapshot agrees with; the content may be empty
+  std::int64_t changes = 0;     ///< photos added and removed since it was built
+  std::int64_t firstNumber = 0; ///< in photos' ids, of the row 0
+  std::string boot;             ///< identifies the start of the system
+  SourceIdentity source;        ///< what the snapshot agrees with; the content may be empty
 };
 
 /// Photos to be added, in memory.
@@ -60,7 +70,7 @@ public:
     std::size_t name; ///< its place in the names
   };
 
-  void Add(const FileRow& file, std::int64_t volume);
+  void Add(std::int64_t id, const FileRow& file, std::int64_t volume);
   void Sort();
   void Clear();
 
@@ -128,7 +138,7 @@ public:
   void AdoptFolders();
 
   /// Returns whether that changed anything.
-  bool ReplaceStatistics(const std::vector<StatisticsRow>& rows);
+  bool ReplaceStatistics(const Statistics& statistics);
 
   /// Makes the file safe to be read while it is written.
   void Complete();

@@ -385,19 +385,21 @@ std::vector<Folder> SnapshotReader::Ancestors(std::int64_t folder) {
   });
 }
 
-std::vector<VolumeRow> SnapshotReader::Volumes() {
+std::vector<VolumeRow> SnapshotReader::Volumes(std::size_t mostBytes) {
   return implementation_->Read([&] {
     SQLite::Statement& query =
         implementation_->Prepared("SELECT mountPoint, transcoded, total, mergedUpTo, isGone FROM "
                                   "Statistics ORDER BY mountPoint LIMIT ?");
     query.bind(1, static_cast<int>(MOST_ROWS));
     std::vector<VolumeRow> volumes;
-    while (query.executeStep()) {
+    std::size_t bytes = 0;
+    while (bytes <= mostBytes && query.executeStep()) {
       volumes.push_back({.mountPoint = query.getColumn(0).getString(),
                          .transcoded = query.getColumn(1).getInt64(),
                          .total = query.getColumn(2).getInt64(),
                          .mergedUpTo = query.getColumn(3).getInt64(),
                          .isGone = query.getColumn(4).getInt() != 0});
+      bytes += volumes.back().mountPoint.size();
     }
     return volumes;
   });

@@ -13,7 +13,8 @@
 namespace orva::web {
 
 /// Identifies a photo in the snapshot, and sorts by modification time. Never negative. A photo has
-/// another id after the election of another master or a purge of its volume.
+/// another id after the election of another master or a purge of its volume; its former id then
+/// means no other photo.
 using PhotoId = std::int64_t;
 
 struct Photo {
@@ -94,8 +95,9 @@ public:
   /// The folders that contain a folder, from the top; at most 100.
   std::vector<Folder> Ancestors(std::int64_t folder);
 
-  /// By mount point; at most 1,000.
-  std::vector<VolumeRow> Volumes();
+  /// By mount point; at most 1,000. The last one is the first whose name, with those before it, has
+  /// more than `mostBytes` bytes.
+  std::vector<VolumeRow> Volumes(std::size_t mostBytes = SIZE_MAX);
 
   /// The months that have photos, in local time, newest first. Only the folder and the volume
   /// of the filter count.

@@ -11,6 +11,7 @@
 
 #include "commandline/UsageError.h"
 
+#include <malloc.h>
 #include <sys/stat.h>
 
 #include <csignal>
@@ -100,6 +101,8 @@ void Serve(const web::Options& options) {
 
 int main(int count, char* arguments[]) {
   std::signal(SIGPIPE, SIG_IGN);
+  // The memory of long responses goes back to the system at once.
+  mallopt(M_MMAP_THRESHOLD, 1 << 20);
   try {
     zophotos::UseUtf8();
     if (const auto options = web::ParseOptions({arguments + 1, arguments + count})) {

@@ -16,7 +16,7 @@
 //                               in that direction
 //   /api/photos/ID?words=&...   PHOTO with "newer": "ID" or null, "older": "ID" or null
 //   /api/folders?parent=ID&after=ID&count=100    {"folders": [FOLDER, ...], "more": true}
-//   /api/volumes                {"volumes": [VOLUME, ...]}
+//   /api/volumes                {"volumes": [VOLUME, ...], "more": false}
 //   /api/status                 {"state": "no_database", "building", "current" or "failed",
 //                               "done": 0, "total": 0, "reason": text, "version": 1}
 //   /api/events                 "event: change" with the version as its data, first and after each
