@@ -311,7 +311,7 @@ private:
   void Build(MergedSource& source, const SourceIdentity& identity, const std::stop_token& stop) {
     SetStatus(State::Building);
     directory_.RemoveOthers(number_);
-    SnapshotFile file = SnapshotFile::Create(directory_.File(number_ + 1));
+    SnapshotFile file = CreateNext();
     SnapshotState& state = file.State();
     const std::int64_t version = source.DataVersion();
     const std::int64_t total = source.ReadSummary().files;
@@ -388,12 +388,17 @@ private:
   bool IsEmpty() { return file_->State().source.file.empty() && file_->State().folders == 0; }
 
   void PublishEmpty() {
-    SnapshotFile file = SnapshotFile::Create(directory_.File(number_ + 1));
+    SnapshotFile file = CreateNext();
     file.Begin();
     Publish(std::move(file));
   }
 
-  /// Ends the transaction of a new snapshot, and makes it the present one.
+  SnapshotFile CreateNext() {
+    nextNumber_ = directory_.FreeNumber(number_);
+    return SnapshotFile::Create(directory_.File(nextNumber_));
+  }
+
+  /// Ends the transaction of a snapshot that CreateNext made, and makes it the present one.
   void Publish(SnapshotFile file) {
     const std::int64_t former = file_ ? file_->State().version : 0;
     file.State().version = std::max(former + 1, Now());
@@ -402,7 +407,7 @@ private:
     file.Complete();
     file_.reset();
     file_.emplace(std::move(file));
-    ++number_;
+    number_ = nextNumber_;
     {
       const std::lock_guard lock(mutex_);
       path_ = file_->Path();
@@ -413,7 +418,8 @@ private:
   CacheDirectory directory_;
   const FindPath findPath_;
   const std::string boot_;
-  std::uint64_t number_ = 0; ///< of the present file
+  std::uint64_t number_ = 0;     ///< of the present file
+  std::uint64_t nextNumber_ = 0; ///< of the file that CreateNext made
   std::optional<SnapshotFile> file_;
   bool mustBuild_ = false;
   bool isTidy_ = false; ///< the search index, since the last change
