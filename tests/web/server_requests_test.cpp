@@ -154,6 +154,16 @@ TEST(WebQuery, SelectsPhotos) {
   EXPECT_FALSE(SelectionOf("month=2025").month);
 }
 
+TEST(WebQuery, RefusesMoreWordsThanASearchMayHave) {
+  std::string words;
+  for (char c = 'a'; c <= 'z'; ++c) {
+    words += std::string(1, c) + c + '+';
+  }
+  EXPECT_NO_THROW(SelectionOf("words=" + words + words));
+  EXPECT_THROW(SelectionOf("words=" + words + "1+2+3+4+5+6+7"), BadQuery);
+  EXPECT_THROW(SelectionOf("words=" + std::string(4097, 'a')), BadQuery);
+}
+
 TEST(WebQuery, RefusesMalformedNumbersAndMonths) {
   for (const char* const query :
        {"folder=x", "folder=1.5", "month=2026-13", "month=2026-00", "month=2026-1", "month=20",

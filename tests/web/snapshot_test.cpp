@@ -145,7 +145,6 @@ TEST_F(ChangingSnapshot, FiltersByVolumeFolderTimeAndWordsTogether) {
   EXPECT_THAT(Names(InVolume("/shares/C/")), IsEmpty());
   EXPECT_THAT(Names(WithWords("beach")), ElementsAre("beach 3.jpg", "beach 2.jpg", "beach 1.jpg"));
   EXPECT_THAT(Names(WithWords("BEA trip")), ElementsAre("beach 2.jpg"));
-  EXPECT_THAT(Names(WithWords("shares")), IsEmpty()); // only words below the volume count
   web::Filter filter = InVolume(A);
   filter.words = "beach";
   EXPECT_THAT(Names(filter), ElementsAre("beach 2.jpg", "beach 1.jpg"));
@@ -158,6 +157,34 @@ TEST_F(ChangingSnapshot, FiltersByVolumeFolderTimeAndWordsTogether) {
   EXPECT_THAT(Names(filter), ElementsAre("beach 2.jpg"));
   filter.times = {300, 200};
   EXPECT_THAT(Names(filter), IsEmpty());
+}
+
+TEST_F(ChangingSnapshot, WordsOfTheMountPointCount) {
+  const std::string camera = "/shares/Cam\xC3\xA9ra 2/";
+  const std::int64_t other = merged_->AddVolume(camera);
+  const std::int64_t trip = merged_->AddFolder(a_, "/shares/A/Camping/", A);
+  merged_->AddFile(a_, "1.jpg", 100, A);
+  merged_->AddFile(trip, "2.jpg", 200, A);
+  merged_->AddFile(other, "3.jpg", 300, camera);
+  Update();
+  EXPECT_THAT(Names(WithWords("shares")), ElementsAre("3.jpg", "2.jpg", "1.jpg"));
+  EXPECT_THAT(Names(WithWords("/SHARES/A/Camping/2.jpg")), ElementsAre("2.jpg"));
+  EXPECT_THAT(Names(WithWords("camera")), ElementsAre("3.jpg"));
+  EXPECT_THAT(Names(WithWords("cam")), ElementsAre("3.jpg", "2.jpg"));
+  EXPECT_THAT(Names(WithWords("camera 2")), ElementsAre("3.jpg"));
+  EXPECT_THAT(Names(WithWords("camera 1")), IsEmpty());
+  EXPECT_THAT(Names(WithWords("shares x")), IsEmpty());
+  web::Filter filter = InVolume(camera);
+  filter.words = "cam";
+  EXPECT_THAT(Names(filter), ElementsAre("3.jpg"));
+  filter.words = "a";
+  EXPECT_THAT(Names(filter), IsEmpty());
+  filter = InVolume(A);
+  filter.words = "a";
+  EXPECT_THAT(Names(filter), ElementsAre("2.jpg", "1.jpg"));
+  merged_->AddFile(merged_->AddVolume("/shares/New/"), "new.jpg", 1, "/shares/New/");
+  Update();
+  EXPECT_THAT(Names(WithWords("new shares")), ElementsAre("new.jpg"));
 }
 
 TEST_F(ChangingSnapshot, TimesOutsideOf32BitsFindWhatIsInside) {

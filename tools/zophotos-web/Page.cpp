@@ -152,7 +152,7 @@ Html SearchField() {
   Html html;
   html << R"(<form class="find" role="search" action="/search"><label class="unseen" for="find">)"
        << "Search photos"
-       << R"(</label><input id="find" type="search" name="words" maxlength="200" )"
+       << R"(</label><input id="find" type="search" name="words" maxlength="1000" )"
        << R"(placeholder="Search photos" autocomplete="off" enterkeyhint="search">)"
        << R"(<button type="submit" aria-label="Search">)" << Icon("search") << "</button></form>";
   return html;
@@ -412,7 +412,7 @@ Html SearchForm(const Site& site, const Selection& selection, const std::vector<
   Html html;
   html << R"(<form class="search" role="search" action="/search"><p class="field words">)"
        << R"(<label for="words">Words in the path</label><input id="words" type="search" )"
-       << R"(name="words" maxlength="200" autocomplete="off" enterkeyhint="search" value=")"
+       << R"(name="words" maxlength="1000" autocomplete="off" enterkeyhint="search" value=")"
        << selection.words << R"("></p><p class="field"><label for="volume-field">Volume</label>)"
        << R"(<select id="volume-field" name="volume">)"
        << Option("", "All volumes", !selection.volume);
@@ -560,7 +560,7 @@ std::string SearchPage(const Site& site, const Selection& selection,
   } else {
     if (list.photos.empty()) {
       main
-          << "<p class=\"nothing\">No photo matches. Each word must be the beginning of a word in the path of a photo.</p>\n";
+          << "<p class=\"nothing\">No photo matches. Each word must be the beginning of a word in the path of a photo. A word has only letters or only digits.</p>\n";
     }
     main << Photos(list, Address("/search", selection), selection);
   }

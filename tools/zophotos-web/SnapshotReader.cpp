@@ -131,8 +131,9 @@ public:
     if (filter.folder && *filter.folder <= 0) {
       return std::nullopt;
     }
-    return MatchExpression(terms, frequent_,
-                           [this](const std::string& from) { return NextWord(from); });
+    return MatchExpression(terms,
+                           filter.words.empty() ? std::vector<VolumeWords>() : AllVolumeWords(),
+                           frequent_, [this](const std::string& from) { return NextWord(from); });
   }
 
   std::int64_t Version() {
@@ -280,6 +281,22 @@ private:
     return word;
   }
 
+  /// The words of all mount points. They are kept for the present version.
+  const std::vector<VolumeWords>& AllVolumeWords() {
+    const std::int64_t version = Version();
+    if (volumeWords_.empty() || version != volumeWordsVersion_) {
+      volumeWords_.clear();
+      SQLite::Statement& query = Prepared("SELECT number, mountPoint FROM Volumes");
+      while (query.executeStep()) {
+        VolumeWords& volume = volumeWords_.emplace_back();
+        volume.volume = query.getColumn(0).getInt64();
+        AppendWords(query.getColumn(1).getString(), volume.words);
+      }
+      volumeWordsVersion_ = version;
+    }
+    return volumeWords_;
+  }
+
   void Open(const std::string& path) {
     Close();
     database_.emplace(OpenForReading(path));
@@ -293,6 +310,7 @@ private:
     statements_.clear();
     database_.reset();
     nextWords_.clear();
+    volumeWords_.clear();
   }
 
   const Snapshot& snapshot_;
@@ -302,6 +320,8 @@ private:
   FrequentPrefixes frequent_;
   std::map<std::string, std::optional<std::string>> nextWords_;
   std::int64_t wordsVersion_ = 0;
+  std::vector<VolumeWords> volumeWords_;
+  std::int64_t volumeWordsVersion_ = 0;
 };
 
 SnapshotReader::SnapshotReader(const Snapshot& snapshot)
