@@ -42,6 +42,23 @@ void ParseMonth(std::string_view text, Selection& selection) {
   }
 }
 
+/// Reads the conditions "month" and "year", which have to agree.
+void ParseTime(const Target& target, Selection& selection) {
+  if (const std::string_view month = ValueOf(target, "month"); !month.empty()) {
+    ParseMonth(month, selection);
+  }
+  if (const std::string_view text = ValueOf(target, "year"); !text.empty()) {
+    const auto year = ParseDigits(text, YEAR_DIGITS, 1, LAST_YEAR);
+    if (!year) {
+      throw BadQuery("A year is written as 2026.");
+    }
+    if (selection.year.value_or(*year) != *year) {
+      throw BadQuery("The month is not in the year.");
+    }
+    selection.year = year;
+  }
+}
+
 /// The words of a search. A search that ignored some of them would find too much.
 std::string ParseWords(const Target& target) {
   std::string words(ValueOf(target, "words"));
@@ -71,11 +88,7 @@ Selection ParseSelection(const Target& target) {
     selection.volume = volume;
   }
   selection.folder = ParseId(target, "folder");
-  if (const std::string_view month = ValueOf(target, "month"); !month.empty()) {
-    ParseMonth(month, selection);
-  } else if (const std::string_view year = ValueOf(target, "year"); !year.empty()) {
-    ParseMonth(year.substr(0, year.find('-')), selection);
-  }
+  ParseTime(target, selection);
   return selection;
 }
 
