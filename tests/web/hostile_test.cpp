@@ -119,6 +119,26 @@ TEST_F(WebHostile, FoldersOutsideTheTreeAreAtItsTop) {
   EXPECT_EQ("/shares/", folders.at(1).at("path"));
 }
 
+TEST_F(WebHostile, PagesOfFoldersHaveAllFoldersWithTheSamePath) {
+  std::string parent = GetJson("/api/folders").at("folders").at(0).at("id");
+  const std::string twin = "INSERT INTO Folders(parent_folder_id, name, modified_date, volume) "
+                           "SELECT parent_folder_id, name, modified_date, volume FROM Folders "
+                           "WHERE name = '/shares/A/sea/' LIMIT 1";
+  Craft({twin, twin});
+  Lines ids;
+  std::string after;
+  for (bool more = true; more;) {
+    const Json page = GetJson("/api/folders?count=1&parent=" + parent + "&after=" + after);
+    more = page.at("more");
+    ASSERT_EQ(1U, page.at("folders").size());
+    EXPECT_EQ("/shares/A/sea/", page.at("folders").at(0).at("path"));
+    after = page.at("folders").at(0).at("id");
+    ids.push_back(after);
+    ASSERT_LE(ids.size(), 3U);
+  }
+  EXPECT_EQ(3U, ids.size());
+}
+
 TEST_F(WebHostile, VolumesPulledDuringADownloadEndNothingElse) {
   const Volume b("B", "300m");
   Catalog onB(b);

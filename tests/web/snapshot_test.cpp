@@ -229,15 +229,15 @@ TEST_F(ChangingSnapshot, ShowsTheFolderTree) {
                         .volume = "<DUMMY>",
                         .hasFolders = true,
                         .hasPhotos = false};
-  EXPECT_THAT(reader_->Folders(-1, "", 10), ElementsAre(top));
+  EXPECT_THAT(reader_->Folders(-1, {}, 10), ElementsAre(top));
   const web::Folder last{.id = rome,
                          .parent = trips,
                          .path = "/shares/A/Trips/Rome/",
                          .volume = A,
                          .hasFolders = false,
                          .hasPhotos = true};
-  EXPECT_THAT(reader_->Folders(trips, "", 10), ElementsAre(last));
-  EXPECT_THAT(reader_->Folders(trips, last.path, 10), IsEmpty());
+  EXPECT_THAT(reader_->Folders(trips, {}, 10), ElementsAre(last));
+  EXPECT_THAT(reader_->Folders(trips, last, 10), IsEmpty());
   EXPECT_EQ(reader_->FindFolder(rome), last);
   std::vector<std::int64_t> ids;
   for (const web::Folder& folder : reader_->Ancestors(rome)) {

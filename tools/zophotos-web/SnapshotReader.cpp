@@ -369,15 +369,16 @@ std::optional<Photo> SnapshotReader::Find(PhotoId id) {
   return implementation_->Read([&] { return implementation_->Find(id); });
 }
 
-std::vector<Folder> SnapshotReader::Folders(std::int64_t parent, const std::string& afterPath,
+std::vector<Folder> SnapshotReader::Folders(std::int64_t parent, const std::optional<Folder>& after,
                                             std::size_t count) {
   return implementation_->Read([&] {
     SQLite::Statement& query = implementation_->Prepared(
         "SELECT f.id, f.parent, f.path, v.mountPoint FROM Folders f JOIN Volumes v ON v.number = "
-        "f.volume WHERE f.parent = ? AND f.path > ? ORDER BY f.path, f.id LIMIT ?");
+        "f.volume WHERE f.parent = ? AND (f.path, f.id) > (?, ?) ORDER BY f.path, f.id LIMIT ?");
     query.bind(1, parent);
-    query.bind(2, afterPath);
-    query.bind(3, LimitOf(count));
+    query.bind(2, after ? after->path : "");
+    query.bind(3, after ? after->id : 0);
+    query.bind(4, LimitOf(count));
     std::vector<Folder> folders;
     while (query.executeStep()) {
       folders.push_back(implementation_->ReadFolder(query));

@@ -87,7 +87,8 @@ public:
 
   /// Folders in `parent`, in the order of their paths' bytes, at most `count`; only those that come
   /// after `afterPath`, which may be empty.
-  std::vector<Folder> Folders(std::int64_t parent, const std::string& afterPath, std::size_t count);
+  std::vector<Folder> Folders(std::int64_t parent, const std::optional<Folder>& after,
+                              std::size_t count);
 
   std::optional<Folder> FindFolder(std::int64_t id);
 
