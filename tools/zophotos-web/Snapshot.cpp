@@ -333,7 +333,7 @@ private:
     if (state.filesLeftOut != 0 || state.foldersLeftOut != 0) {
       Log("left out " + zophotos::Count(state.filesLeftOut, "file") + " and " +
           zophotos::Count(state.foldersLeftOut, "folder") +
-          " that the daemon cannot have merged: " + identity.file);
+          " that the daemon cannot have merged: " + source.Path());
     }
     Publish(std::move(file));
     mustBuild_ = false;
