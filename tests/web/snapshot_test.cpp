@@ -2,8 +2,11 @@
 
 #include "SnapshotTest.h"
 
+#include "system/Deadline.h"
+
 #include <gmock/gmock.h>
 
+#include <chrono>
 #include <cstdlib>
 #include <ctime>
 #include <filesystem>
@@ -185,6 +188,26 @@ TEST_F(ChangingSnapshot, WordsOfTheMountPointCount) {
   merged_->AddFile(merged_->AddVolume("/shares/New/"), "new.jpg", 1, "/shares/New/");
   Update();
   EXPECT_THAT(Names(WithWords("new shares")), ElementsAre("new.jpg"));
+}
+
+TEST_F(ChangingSnapshot, ADatabaseThatStaysLockedIsAFailureUntilItIsNot) {
+  merged_->AddFile(a_, "1.jpg", 100, A);
+  Update();
+  merged_->AddFile(a_, "2.jpg", 200, A);
+  merged_->Run("BEGIN EXCLUSIVE");
+  EXPECT_FALSE(Update());
+  EXPECT_EQ(snapshot_->Status().state, State::Current); // as during a merge
+  const auto end = std::chrono::steady_clock::now() + DEADLINE;
+  while (snapshot_->Status().state == State::Current && std::chrono::steady_clock::now() < end) {
+    Update();
+  }
+  EXPECT_EQ(snapshot_->Status().state, State::Failed);
+  EXPECT_THAT(snapshot_->Status().reason, HasSubstr("is locked"));
+  EXPECT_THAT(Names(), ElementsAre("1.jpg"));
+  merged_->Run("COMMIT");
+  EXPECT_TRUE(Update());
+  EXPECT_EQ(snapshot_->Status().state, State::Current);
+  EXPECT_THAT(Names(), ElementsAre("2.jpg", "1.jpg"));
 }
 
 TEST_F(ChangingSnapshot, TimesOutsideOf32BitsFindWhatIsInside) {

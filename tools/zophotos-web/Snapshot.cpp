@@ -28,6 +28,9 @@ namespace {
 using Clock = std::chrono::steady_clock;
 using State = SnapshotStatus::State;
 
+/// A merge locks the database for less than this. After it, the status says that it is locked.
+constexpr std::chrono::seconds LONGEST_LOCK(5);
+
 /// Bytes of photos to sort in memory while a snapshot is built.
 constexpr std::size_t LARGEST_BATCH = 16 << 20;
 
@@ -178,6 +181,9 @@ private:
   }
 
   void Fail(const zophotos::Failure& failure) {
+    if (failure.Status() != zophotos::ExitStatus::Locked) {
+      lockedSince_.reset();
+    }
     if (failure.Status() == zophotos::ExitStatus::NoDatabase) {
       if (mustBuild_ || !IsEmpty()) {
         PublishEmpty();
@@ -186,6 +192,10 @@ private:
       SetStatus(State::NoDatabase, failure.what());
     } else if (failure.Status() != zophotos::ExitStatus::Locked) {
       FailLater(failure.what());
+    } else if (!lockedSince_) {
+      lockedSince_ = Clock::now();
+    } else if (Clock::now() - *lockedSince_ > LONGEST_LOCK) {
+      SetStatus(State::Failed, failure.what());
     }
   }
 
@@ -202,6 +212,7 @@ private:
   void Succeed() {
     pause_ = {};
     nextTry_ = {};
+    lockedSince_.reset();
     SetStatus(State::Current);
   }
 
@@ -427,6 +438,7 @@ private:
   std::optional<SourceIdentity> failed_; ///< what the last try was for
   std::chrono::seconds pause_{};
   Clock::time_point nextTry_;
+  std::optional<Clock::time_point> lockedSince_;
 
   mutable std::mutex mutex_;
   SnapshotStatus status_;
