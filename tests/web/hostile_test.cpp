@@ -216,6 +216,47 @@ TEST_F(WebHostile, UsersSeeOnlyWhatTheirServerMayRead) {
   EXPECT_EQ(404, Get(Target(ONE, "/original")).status);
 }
 
+TEST_F(WebHostile, ADatabaseThatTheServerMayNotReadIsNamed) {
+  if (!HasOtherUsers()) {
+    GTEST_SKIP() << NO_OTHER_USERS;
+  }
+  const std::string database = "/shares/A/.zophotos/zophotos.db";
+  StopWeb();
+  fs::remove_all("/tmp/cache");
+  const auto expectRefused = [this](const fs::path& path) {
+    const fs::perms before = fs::status(path).permissions();
+    fs::permissions(path, fs::perms::owner_all);
+    StartWeb({}, {"setpriv", "--reuid=65534", "--regid=65534", "--clear-groups"});
+    const auto end = std::chrono::steady_clock::now() + DEADLINE;
+    while (GetJson("/api/status").at("state") != "failed" &&
+           std::chrono::steady_clock::now() < end) {
+      poll(nullptr, 0, 20);
+    }
+    EXPECT_THAT(GetJson("/api/status").at("reason").get<std::string>(),
+                HasSubstr("zophotos.db: permission denied: the user of zophotos-web has to be able "
+                          "to read this file and to enter all folders above it"));
+    fs::permissions(path, before);
+    EXPECT_TRUE(AwaitPhotos(3)) << path;
+    EXPECT_EQ(0, StopWeb());
+    fs::remove_all("/tmp/cache");
+  };
+  expectRefused(database);
+  expectRefused("/shares/A/.zophotos");
+  StartWeb();
+}
+
+TEST_F(WebHostile, ACacheOfAnotherUserIsRefused) {
+  if (!HasOtherUsers()) {
+    GTEST_SKIP() << NO_OTHER_USERS;
+  }
+  const Outcome outcome =
+      test::Run({"setpriv", "--reuid=65534", "--regid=65534", "--clear-groups",
+                 ProgramPath("zophotos-web"), "--listen", "127.0.0.1:0", "--cache", "/tmp/cache"});
+  EXPECT_EQ(1, outcome.status);
+  EXPECT_THAT(outcome.error + outcome.output,
+              HasSubstr("cannot use the cache directory /tmp/cache: Permission denied"));
+}
+
 TEST_F(WebHostile, AThousandConnectionsTakeLittleMemory) {
   std::list<HttpConnection> clients;
   const std::string target = Target(ONE, "/rendition");
@@ -246,7 +287,8 @@ TEST_F(WebHostile, AddressesOfOtherMachinesAreRefused) {
   fs::remove_all("/tmp/cache");
   web = std::make_unique<Program>(
       Program::Arguments{ProgramPath("zophotos-web"), "--cache", "/tmp/cache", "--listen",
-                         "0.0.0.0:0", "--allow-everybody", "--host", "photos.example.org"});
+                         "0.0.0.0:0", "--allow-everybody", "--host", "photos.example.org", "--host",
+                         "[2001:db8::1]", "--host", "fe80::1"});
   EXPECT_THAT(web->ReadLineWith("listening on"), HasSubstr("http://0.0.0.0:"));
 }
 
