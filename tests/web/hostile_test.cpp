@@ -283,13 +283,21 @@ TEST_F(WebHostile, AddressesOfOtherMachinesAreRefused) {
   }
   EXPECT_EQ(2, run({"--listen", "example.org:80"}).status);
   EXPECT_EQ(2, run({"--host", "a b"}).status);
+  EXPECT_EQ(2, run({"--host", "fe80::g"}).status);
   StopWeb();
   fs::remove_all("/tmp/cache");
   web = std::make_unique<Program>(
       Program::Arguments{ProgramPath("zophotos-web"), "--cache", "/tmp/cache", "--listen",
                          "0.0.0.0:0", "--allow-everybody", "--host", "photos.example.org", "--host",
                          "[2001:db8::1]", "--host", "fe80::1"});
-  EXPECT_THAT(web->ReadLineWith("listening on"), HasSubstr("http://0.0.0.0:"));
+  const std::string line = web->ReadLineWith("listening on");
+  EXPECT_THAT(line, HasSubstr("http://0.0.0.0:"));
+  port = static_cast<std::uint16_t>(std::stoul(line.substr(line.find("0.0.0.0:") + 8)));
+  for (const char* const host : {"photos.example.org", "[2001:db8::1]:8480", "[fe80::1]"}) {
+    HttpConnection connection(port);
+    connection.Send(std::string("GET /api/status HTTP/1.1\r\nHost: ") + host + "\r\n\r\n");
+    EXPECT_EQ(200, connection.Read().status) << host;
+  }
 }
 
 TEST_F(WebHostile, OneCacheHasOneServer) {
