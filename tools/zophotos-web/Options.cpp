@@ -69,7 +69,8 @@ std::optional<Options> ParseOptions(std::vector<std::string> arguments) {
                  "Keep the snapshot in this directory instead of ~/.cache/zophotos-web")
       ->type_name("DIRECTORY")
       ->check(commandline::NotEmpty());
-  app.footer("Exit status: 0 stopped by a signal; 1 failed; 2 wrong command line.\n"
+  app.footer("Exit status: 0 stopped by a signal; 1 failed; 2 wrong command line;\n"
+             "3 other machines can reach the address.\n"
              "See zophotos-web(8).");
   if (!commandline::Parse(app, std::move(arguments), false)) {
     return std::nullopt;
