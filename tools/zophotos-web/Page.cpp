@@ -111,11 +111,10 @@ Html Notice(const SnapshotStatus& status) {
          << NameText(status.reason) << "</p>";
     break;
   case SnapshotStatus::State::NoDatabase:
-    html << "<p>There is no merged database at the moment";
-    if (!status.reason.empty()) {
-      html << ": " << NameText(status.reason);
-    }
-    html << "</p>";
+    html << "<p>"
+         << (status.reason.empty() ? "There is no merged database at the moment."
+                                   : NameText(status.reason))
+         << "</p>";
     break;
   case SnapshotStatus::State::Current:
     break;
@@ -556,7 +555,7 @@ std::string SearchPage(const Site& site, const Selection& selection,
   Html main;
   main << "<h1>Search</h1>\n" << SearchForm(site, selection, months);
   if (selection == Selection()) {
-    main << Calendar(months);
+    main << (months.empty() ? Empty(site) : Calendar(months));
   } else {
     if (list.photos.empty()) {
       main
