@@ -20,14 +20,14 @@ Shown ReadAll(const web::Snapshot& snapshot) {
   while (!parents.empty()) {
     const std::int64_t parent = parents.back();
     parents.pop_back();
-    std::string after;
+    std::optional<web::Folder> after;
     for (auto folders = reader.Folders(parent, after, page); !folders.empty();
          folders = reader.Folders(parent, after, page)) {
       shown.folders.insert(shown.folders.end(), folders.begin(), folders.end());
       for (const web::Folder& folder : folders) {
         parents.push_back(folder.id);
       }
-      after = folders.back().path;
+      after = folders.back();
     }
   }
   shown.volumes = reader.Volumes();

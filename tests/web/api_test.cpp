@@ -55,6 +55,8 @@ TEST_F(WebApi, SelectsByWordsVolumeFolderAndMonth) {
               ElementsAre("/shares/A/sea/deep/two.jpg", "/shares/A/sea/one.jpg"));
   EXPECT_THAT(Paths("?words=SEA+on"), ElementsAre("/shares/A/sea/one.jpg"));
   EXPECT_THAT(Paths("?words=absent"), IsEmpty());
+  EXPECT_THAT(Paths("?words=/shares/A/sea/one.jpg"), ElementsAre("/shares/A/sea/one.jpg"));
+  EXPECT_EQ(3U, Paths("?words=shares").size());
   EXPECT_THAT(Paths("?volume=/shares/B/"), IsEmpty());
   EXPECT_EQ(3U, Paths("?volume=/shares/A/").size());
   EXPECT_EQ(3U, Paths("?month=2001-09").size());
@@ -128,15 +130,16 @@ TEST_F(WebApi, ForgetsTheDatabaseOfAnUnpluggedMaster) {
 
 TEST_F(WebApi, RefusesUnknownIdsAndMalformedQueries) {
   const std::vector<std::pair<std::string, int>> expected{
-      {"/api/photos/1", 404},         {"/api/photos/x", 404},
-      {"/api/photos/", 404},          {"/api/photos/01", 404},
-      {"/api/photos/1/", 404},        {"/api/photos/..", 404},
-      {"/api/folders/99999", 404},    {"/api/folders/-", 404},
-      {"/api/nothing", 404},          {"/api/", 404},
-      {"/api/photos?count=0", 400},   {"/api/photos?count=201", 400},
-      {"/api/photos?before=x", 400},  {"/api/photos?before=1&after=2", 400},
-      {"/api/photos?month=13", 400},  {"/api/folders?parent=x", 400},
-      {"/api/photos?words=%zz", 400}, {"/api/photos?folder=1e3", 400}};
+      {"/api/photos/1", 404},          {"/api/photos/x", 404},
+      {"/api/photos/", 404},           {"/api/photos/01", 404},
+      {"/api/photos/1/", 404},         {"/api/photos/..", 404},
+      {"/api/folders/99999", 404},     {"/api/folders/-", 404},
+      {"/api/nothing", 404},           {"/api/", 404},
+      {"/api/photos?count=0", 400},    {"/api/photos?count=201", 400},
+      {"/api/photos?before=x", 400},   {"/api/photos?before=1&after=2", 400},
+      {"/api/photos?month=13", 400},   {"/api/folders?parent=x", 400},
+      {"/api/photos?words=%zz", 400},  {"/api/photos?folder=1e3", 400},
+      {"/api/folders?after=9999", 404}};
   for (const auto& [target, status] : expected) {
     const HttpResponse response = Get(target);
     EXPECT_EQ(status, response.status) << target;
@@ -144,8 +147,9 @@ TEST_F(WebApi, RefusesUnknownIdsAndMalformedQueries) {
   }
   for (const char* const target :
        {"/photos/1", "/photos/x", "/photos/", "/photos/1/rendition", "/photos/1/original",
-        "/folders/99999", "/folders/x", "/nothing", "//", "/../etc/passwd", "/photos/../../etc",
-        "/photos/%2e%2e/%2e%2e", "/style.css/", "/.", "/photos/1/rendition/../original"}) {
+        "/folders/99999", "/folders/x", "/folders?after_folder=99999", "/nothing", "//",
+        "/../etc/passwd", "/photos/../../etc", "/photos/%2e%2e/%2e%2e", "/style.css/", "/.",
+        "/photos/1/rendition/../original"}) {
     const HttpResponse response = Get(target);
     EXPECT_EQ(404, response.status) << target;
     EXPECT_THAT(response.Header("content-type"), HasSubstr("text/html")) << target;

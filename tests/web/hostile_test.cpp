@@ -134,6 +134,26 @@ TEST_F(WebHostile, FoldersOutsideTheTreeAreAtItsTop) {
   EXPECT_EQ("/shares/", folders.at(1).at("path"));
 }
 
+TEST_F(WebHostile, PagesOfFoldersHaveAllFoldersWithTheSamePath) {
+  std::string parent = GetJson("/api/folders").at("folders").at(0).at("id");
+  const std::string twin = "INSERT INTO Folders(parent_folder_id, name, modified_date, volume) "
+                           "SELECT parent_folder_id, name, modified_date, volume FROM Folders "
+                           "WHERE name = '/shares/A/sea/' LIMIT 1";
+  Craft({twin, twin});
+  Lines ids;
+  std::string after;
+  for (bool more = true; more;) {
+    const Json page = GetJson("/api/folders?count=1&parent=" + parent + "&after=" + after);
+    more = page.at("more");
+    ASSERT_EQ(1U, page.at("folders").size());
+    EXPECT_EQ("/shares/A/sea/", page.at("folders").at(0).at("path"));
+    after = page.at("folders").at(0).at("id");
+    ids.push_back(after);
+    ASSERT_LE(ids.size(), 3U);
+  }
+  EXPECT_EQ(3U, ids.size());
+}
+
 TEST_F(WebHostile, VolumesPulledDuringADownloadEndNothingElse) {
   const Volume b("B", "300m");
   Catalog onB(b);
@@ -295,6 +315,47 @@ TEST_F(WebHostile, ManyClientsThatDoNotReadTakeLittleMemory) {
   }
 }
 
+TEST_F(WebHostile, ADatabaseThatTheServerMayNotReadIsNamed) {
+  if (!HasOtherUsers()) {
+    GTEST_SKIP() << NO_OTHER_USERS;
+  }
+  const std::string database = "/shares/A/.zophotos/zophotos.db";
+  StopWeb();
+  fs::remove_all("/tmp/cache");
+  const auto expectRefused = [this](const fs::path& path) {
+    const fs::perms before = fs::status(path).permissions();
+    fs::permissions(path, fs::perms::owner_all);
+    StartWeb({}, {"setpriv", "--reuid=65534", "--regid=65534", "--clear-groups"});
+    const auto end = std::chrono::steady_clock::now() + DEADLINE;
+    while (GetJson("/api/status").at("state") != "failed" &&
+           std::chrono::steady_clock::now() < end) {
+      poll(nullptr, 0, 20);
+    }
+    EXPECT_THAT(GetJson("/api/status").at("reason").get<std::string>(),
+                HasSubstr("zophotos.db: permission denied: the user of zophotos-web has to be able "
+                          "to read this file and to enter all folders above it"));
+    fs::permissions(path, before);
+    EXPECT_TRUE(AwaitPhotos(3)) << path;
+    EXPECT_EQ(0, StopWeb());
+    fs::remove_all("/tmp/cache");
+  };
+  expectRefused(database);
+  expectRefused("/shares/A/.zophotos");
+  StartWeb();
+}
+
+TEST_F(WebHostile, ACacheOfAnotherUserIsRefused) {
+  if (!HasOtherUsers()) {
+    GTEST_SKIP() << NO_OTHER_USERS;
+  }
+  const Outcome outcome =
+      test::Run({"setpriv", "--reuid=65534", "--regid=65534", "--clear-groups",
+                 ProgramPath("zophotos-web"), "--listen", "127.0.0.1:0", "--cache", "/tmp/cache"});
+  EXPECT_EQ(1, outcome.status);
+  EXPECT_THAT(outcome.error + outcome.output,
+              HasSubstr("cannot use the cache directory /tmp/cache: Permission denied"));
+}
+
 TEST_F(WebHostile, AThousandConnectionsTakeLittleMemory) {
   std::list<HttpConnection> clients;
   const std::string target = Target(ONE, "/rendition");
@@ -316,17 +377,26 @@ TEST_F(WebHostile, AddressesOfOtherMachinesAreRefused) {
   };
   for (const char* const address : {"0.0.0.0:0", "[::]:0"}) {
     const Outcome outcome = run({"--listen", address});
-    EXPECT_EQ(1, outcome.status);
+    EXPECT_EQ(3, outcome.status);
     EXPECT_THAT(outcome.error + outcome.output, HasSubstr("--allow-everybody"));
   }
   EXPECT_EQ(2, run({"--listen", "example.org:80"}).status);
   EXPECT_EQ(2, run({"--host", "a b"}).status);
+  EXPECT_EQ(2, run({"--host", "fe80::g"}).status);
   StopWeb();
   fs::remove_all("/tmp/cache");
   web = std::make_unique<Program>(
       Program::Arguments{ProgramPath("zophotos-web"), "--cache", "/tmp/cache", "--listen",
-                         "0.0.0.0:0", "--allow-everybody", "--host", "photos.example.org"});
-  EXPECT_THAT(web->ReadLineWith("listening on"), HasSubstr("http://0.0.0.0:"));
+                         "0.0.0.0:0", "--allow-everybody", "--host", "photos.example.org", "--host",
+                         "[2001:db8::1]", "--host", "fe80::1"});
+  const std::string line = web->ReadLineWith("listening on");
+  EXPECT_THAT(line, HasSubstr("http://0.0.0.0:"));
+  port = static_cast<std::uint16_t>(std::stoul(line.substr(line.find("0.0.0.0:") + 8)));
+  for (const char* const host : {"photos.example.org", "[2001:db8::1]:8480", "[fe80::1]"}) {
+    HttpConnection connection(port);
+    connection.Send(std::string("GET /api/status HTTP/1.1\r\nHost: ") + host + "\r\n\r\n");
+    EXPECT_EQ(200, connection.Read().status) << host;
+  }
 }
 
 TEST_F(WebHostile, OneCacheHasOneServer) {

@@ -262,7 +262,9 @@ TEST(Page, SaysWhatIsWrongWithTheDatabase) {
       .state = SnapshotStatus::State::Building, .done = 1234, .total = 56789, .reason = {}};
   EXPECT_THAT(VolumesPage(site), HasSubstr("being built: 1,234 of about 56,789."));
   site.snapshot = {.state = SnapshotStatus::State::NoDatabase, .reason = "no <master>"};
-  EXPECT_THAT(VolumesPage(site), HasSubstr("no merged database at the moment: no &lt;master&gt;"));
+  EXPECT_THAT(VolumesPage(site), HasSubstr("<p>no &lt;master&gt;</p>"));
+  site.snapshot.reason = {};
+  EXPECT_THAT(VolumesPage(site), HasSubstr("<p>There is no merged database at the moment.</p>"));
   site.snapshot.state = SnapshotStatus::State::Current;
   EXPECT_THAT(VolumesPage(site), Not(HasSubstr("at the moment")));
 }
@@ -287,6 +289,12 @@ TEST(SearchPage, OffersTheMonthsWhenNothingIsAskedFor) {
   const std::string html = SearchPage({}, {}, {{.year = 2026, .month = 11}}, {});
   EXPECT_THAT(html, HasSubstr("<a href=\"/search?month=2026-11\">November</a>"));
   EXPECT_THAT(html, Not(HasSubstr("No photo matches.")));
+}
+
+TEST(SearchPage, SaysWhatToDoIfThereAreNoPhotos) {
+  EXPECT_THAT(SearchPage({}, {}, {}, {}), HasSubstr("id=\"empty\""));
+  EXPECT_THAT(SearchPage({}, {}, {{.year = 2026, .month = 11}}, {}),
+              Not(HasSubstr("id=\"empty\"")));
 }
 
 TEST(SearchPage, OffersOnlyVolumesThatAFormCanSend) {

@@ -30,7 +30,7 @@ std::string Marks(const FrequentPrefixes& frequent, const std::string& words) {
 /// The expression for `words`, if the index has these ones.
 std::optional<std::string> Expression(const std::string& words, const std::set<std::string>& index,
                                       const FrequentPrefixes& frequent = {}) {
-  return web::MatchExpression({.words = words, .volume = std::nullopt, .folder = std::nullopt},
+  return web::MatchExpression({.words = words, .volume = std::nullopt, .folder = std::nullopt}, {},
                               frequent, [&](const std::string& from) {
                                 const auto found = index.lower_bound(from);
                                 return found == index.end() ? std::nullopt : std::optional(*found);
@@ -125,26 +125,29 @@ TEST(SearchIndex, ATextIsNeverSyntax) {
               Optional(std::string("(\"1\") AND (\"2\") AND (\"3\")")));
 }
 
-TEST(SearchIndex, ATextWithoutWordsDoesNotRestrict) {
-  EXPECT_THAT(Expression(" - \"*\" ", {"a"}), Optional(std::string()));
+TEST(SearchIndex, ATextWithoutWordsFindsNothing) {
+  EXPECT_EQ(Expression(" - \"*\" ", {"a"}), std::nullopt);
+  EXPECT_EQ(Expression("\xF0\x9F\x98\x80", {"a"}), std::nullopt);
+  EXPECT_THAT(Expression("", {"a"}), Optional(std::string()));
+  EXPECT_THAT(Expression(" \t ", {"a"}), Optional(std::string()));
 }
 
 TEST(SearchIndex, AWordThatAnotherBeginsWithAddsNothing) {
   EXPECT_THAT(Expression("im img i", {"img"}), Optional(std::string("(\"img\")")));
 }
 
-TEST(SearchIndex, OnlyTheFirstWordsOfALongTextCount) {
+TEST(SearchIndex, AllWordsOfALongTextCount) {
   std::string text;
   std::set<std::string> index;
   for (char c = 'a'; c <= 'z'; ++c) {
     text += std::string(1, c) + ' ';
     index.insert(std::string(1, c));
   }
-  const auto expression = Expression(text, index);
+  const auto expression = Expression(text + text, index);
   ASSERT_TRUE(expression);
-  EXPECT_NE(expression->find("\"h\""), std::string::npos);
-  EXPECT_EQ(expression->find("\"i\""), std::string::npos);
-  EXPECT_EQ(Expression(std::string(2000, ' ') + "a", {}), std::optional<std::string>(""));
+  EXPECT_NE(expression->find("\"i\""), std::string::npos);
+  EXPECT_EQ(expression->find("\"z\""), expression->rfind("\"z\""));
+  EXPECT_EQ(Expression(std::string(2000, ' ') + "a", {}), std::nullopt);
 }
 
 TEST(SearchIndex, ASampleFindsThePrefixesThatManyPhotosHave) {

@@ -152,12 +152,24 @@ TEST(WebQuery, SelectsPhotos) {
   EXPECT_EQ(2025, SelectionOf("year=2025").year);
   EXPECT_EQ(2025, SelectionOf("month=2025").year);
   EXPECT_FALSE(SelectionOf("month=2025").month);
+  EXPECT_EQ(9, SelectionOf("month=2017-09&year=2017").month);
+}
+
+TEST(WebQuery, RefusesMoreWordsThanASearchMayHave) {
+  std::string words;
+  for (char c = 'a'; c <= 'z'; ++c) {
+    words += std::string(1, c) + c + '+';
+  }
+  EXPECT_NO_THROW(SelectionOf("words=" + words + words));
+  EXPECT_THROW(SelectionOf("words=" + words + "1+2+3+4+5+6+7"), BadQuery);
+  EXPECT_THROW(SelectionOf("words=" + std::string(4097, 'a')), BadQuery);
 }
 
 TEST(WebQuery, RefusesMalformedNumbersAndMonths) {
   for (const char* const query :
        {"folder=x", "folder=1.5", "month=2026-13", "month=2026-00", "month=2026-1", "month=20",
-        "month=2026-11-01", "month=-2026", "year=0", "year=x", "month=0000-01"}) {
+        "month=2026-11-01", "month=-2026", "year=0", "year=x", "month=0000-01", "year=2017-junk",
+        "year=2017-05", "year=20170", "month=2017-09&year=2016", "month=2017&year=2016"}) {
     EXPECT_THROW(SelectionOf(query), BadQuery) << query;
   }
   for (const char* const query : {"count=0", "count=201", "count=x", "count=-1"}) {

@@ -288,6 +288,30 @@ TEST_F(WebServer, LimitsTheHeaders) {
   EXPECT_EQ(200, Get("/a", "X: " + std::string(8'000, 'a') + "\r\n").status);
 }
 
+TEST_F(WebServer, TakesFifteenKibibytesOfHeadersAndTwoHundredOfThem) {
+  EXPECT_EQ(200, Get("/a", "X: " + std::string((15 << 10) - 100, 'a') + "\r\n").status);
+  std::string many;
+  for (int i = 0; i < 195; ++i) {
+    many += "X" + std::to_string(i) + ": y\r\n";
+  }
+  EXPECT_EQ(200, Get("/a", many).status);
+}
+
+TEST_F(WebServer, RefusesRequestsWithNulBytes) {
+  using namespace std::string_literals;
+  for (const std::string& bytes :
+       {"GET /a HTTP/1.1\r\nHost: localhost\0.evil.example\r\n\r\n"s,
+        "GET /a HTTP/1.1\r\nHost: localhost\0\r\n\r\n"s,
+        "GET /a\0/../b HTTP/1.1\r\nHost: localhost\r\n\r\n"s,
+        "GET /a?b=1\0&c=2 HTTP/1.1\r\nHost: localhost\r\n\r\n"s,
+        "GET /a\0 HTTP/1.1\r\nHost: localhost\r\n\r\n"s,
+        "GET /a HTTP/1.1\r\nHost: localhost\r\nX\0: y\r\n\r\n"s,
+        "GET /a HTTP/1.1\r\nHost: localhost\r\nX: y\0Transfer-Encoding: chunked\r\n\r\n"s}) {
+    EXPECT_EQ(400, StatusOf(bytes)) << bytes;
+  }
+  EXPECT_THAT(Requests(), IsEmpty());
+}
+
 TEST_F(WebServer, AnswersAndLogsWhatTheHandlerThrows) {
   for (const char* const path : {"/throws", "/throws-text"}) {
     const HttpResponse response = Get(path);

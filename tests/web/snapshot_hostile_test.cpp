@@ -171,7 +171,7 @@ TEST_F(HostileDatabase, CyclesOfFoldersEnd) {
   Update();
   EXPECT_THAT(reader_->Ancestors(10), SizeIs(100));
   EXPECT_THAT(reader_->Ancestors(12), SizeIs(100));
-  EXPECT_THAT(reader_->Folders(12, "", 10), SizeIs(1));
+  EXPECT_THAT(reader_->Folders(12, {}, 10), SizeIs(1));
 }
 
 TEST_F(HostileDatabase, FoldersWithoutParentsAreBelowTheNearestOne) {

@@ -3,8 +3,11 @@
 #include "SlowFile.h"
 #include "SnapshotTest.h"
 
+#include "system/Deadline.h"
+
 #include <gmock/gmock.h>
 
+#include <chrono>
 #include <cstdlib>
 #include <ctime>
 #include <filesystem>
@@ -146,7 +149,6 @@ TEST_F(ChangingSnapshot, FiltersByVolumeFolderTimeAndWordsTogether) {
   EXPECT_THAT(Names(InVolume("/shares/C/")), IsEmpty());
   EXPECT_THAT(Names(WithWords("beach")), ElementsAre("beach 3.jpg", "beach 2.jpg", "beach 1.jpg"));
   EXPECT_THAT(Names(WithWords("BEA trip")), ElementsAre("beach 2.jpg"));
-  EXPECT_THAT(Names(WithWords("shares")), IsEmpty()); // only words below the volume count
   web::Filter filter = InVolume(A);
   filter.words = "beach";
   EXPECT_THAT(Names(filter), ElementsAre("beach 2.jpg", "beach 1.jpg"));
@@ -159,6 +161,54 @@ TEST_F(ChangingSnapshot, FiltersByVolumeFolderTimeAndWordsTogether) {
   EXPECT_THAT(Names(filter), ElementsAre("beach 2.jpg"));
   filter.times = {300, 200};
   EXPECT_THAT(Names(filter), IsEmpty());
+}
+
+TEST_F(ChangingSnapshot, WordsOfTheMountPointCount) {
+  const std::string camera = "/shares/Cam\xC3\xA9ra 2/";
+  const std::int64_t other = merged_->AddVolume(camera);
+  const std::int64_t trip = merged_->AddFolder(a_, "/shares/A/Camping/", A);
+  merged_->AddFile(a_, "1.jpg", 100, A);
+  merged_->AddFile(trip, "2.jpg", 200, A);
+  merged_->AddFile(other, "3.jpg", 300, camera);
+  Update();
+  EXPECT_THAT(Names(WithWords("shares")), ElementsAre("3.jpg", "2.jpg", "1.jpg"));
+  EXPECT_THAT(Names(WithWords("/SHARES/A/Camping/2.jpg")), ElementsAre("2.jpg"));
+  EXPECT_THAT(Names(WithWords("camera")), ElementsAre("3.jpg"));
+  EXPECT_THAT(Names(WithWords("cam")), ElementsAre("3.jpg", "2.jpg"));
+  EXPECT_THAT(Names(WithWords("camera 2")), ElementsAre("3.jpg"));
+  EXPECT_THAT(Names(WithWords("camera 1")), IsEmpty());
+  EXPECT_THAT(Names(WithWords("shares x")), IsEmpty());
+  web::Filter filter = InVolume(camera);
+  filter.words = "cam";
+  EXPECT_THAT(Names(filter), ElementsAre("3.jpg"));
+  filter.words = "a";
+  EXPECT_THAT(Names(filter), IsEmpty());
+  filter = InVolume(A);
+  filter.words = "a";
+  EXPECT_THAT(Names(filter), ElementsAre("2.jpg", "1.jpg"));
+  merged_->AddFile(merged_->AddVolume("/shares/New/"), "new.jpg", 1, "/shares/New/");
+  Update();
+  EXPECT_THAT(Names(WithWords("new shares")), ElementsAre("new.jpg"));
+}
+
+TEST_F(ChangingSnapshot, ADatabaseThatStaysLockedIsAFailureUntilItIsNot) {
+  merged_->AddFile(a_, "1.jpg", 100, A);
+  Update();
+  merged_->AddFile(a_, "2.jpg", 200, A);
+  merged_->Run("BEGIN EXCLUSIVE");
+  EXPECT_FALSE(Update());
+  EXPECT_EQ(snapshot_->Status().state, State::Current); // as during a merge
+  const auto end = std::chrono::steady_clock::now() + DEADLINE;
+  while (snapshot_->Status().state == State::Current && std::chrono::steady_clock::now() < end) {
+    Update();
+  }
+  EXPECT_EQ(snapshot_->Status().state, State::Failed);
+  EXPECT_THAT(snapshot_->Status().reason, HasSubstr("is locked"));
+  EXPECT_THAT(Names(), ElementsAre("1.jpg"));
+  merged_->Run("COMMIT");
+  EXPECT_TRUE(Update());
+  EXPECT_EQ(snapshot_->Status().state, State::Current);
+  EXPECT_THAT(Names(), ElementsAre("2.jpg", "1.jpg"));
 }
 
 TEST_F(ChangingSnapshot, TimesOutsideOf32BitsFindWhatIsInside) {
@@ -203,15 +253,15 @@ TEST_F(ChangingSnapshot, ShowsTheFolderTree) {
                         .volume = "<DUMMY>",
                         .hasFolders = true,
                         .hasPhotos = false};
-  EXPECT_THAT(reader_->Folders(-1, "", 10), ElementsAre(top));
+  EXPECT_THAT(reader_->Folders(-1, {}, 10), ElementsAre(top));
   const web::Folder last{.id = rome,
                          .parent = trips,
                          .path = "/shares/A/Trips/Rome/",
                          .volume = A,
                          .hasFolders = false,
                          .hasPhotos = true};
-  EXPECT_THAT(reader_->Folders(trips, "", 10), ElementsAre(last));
-  EXPECT_THAT(reader_->Folders(trips, last.path, 10), IsEmpty());
+  EXPECT_THAT(reader_->Folders(trips, {}, 10), ElementsAre(last));
+  EXPECT_THAT(reader_->Folders(trips, last, 10), IsEmpty());
   EXPECT_EQ(reader_->FindFolder(rome), last);
   std::vector<std::int64_t> ids;
   for (const web::Folder& folder : reader_->Ancestors(rome)) {

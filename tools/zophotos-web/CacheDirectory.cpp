@@ -5,6 +5,7 @@
 #include <sys/stat.h>
 
 #include <algorithm>
+#include <array>
 #include <cerrno>
 #include <charconv>
 #include <filesystem>
@@ -24,6 +25,13 @@ constexpr std::string_view END = ".db";
   throw std::runtime_error("cannot use the cache directory " + path + ": " + reason);
 }
 
+/// What the names of a snapshot's file and of those that SQLite puts next to it end with.
+constexpr std::array<std::string_view, 4> SUFFIXES{"", "-journal", "-shm", "-wal"};
+
+std::string NameOf(std::uint64_t number) {
+  return std::string(BEGIN) + std::to_string(number) + std::string(END);
+}
+
 /// The number of a snapshot's file, or of one that SQLite puts next to it.
 std::optional<std::uint64_t> NumberOf(std::string_view name) {
   if (!name.starts_with(BEGIN)) {
@@ -31,12 +39,17 @@ std::optional<std::uint64_t> NumberOf(std::string_view name) {
   }
   std::uint64_t number = 0;
   const char* const begin = name.data() + BEGIN.size();
-  const char* const end = name.data() + name.size();
-  const auto [rest, error] = std::from_chars(begin, end, number);
-  if (error != std::errc() || !std::string_view(rest, end).starts_with(END)) {
+  const auto [rest, error] = std::from_chars(begin, name.data() + name.size(), number);
+  if (error != std::errc()) {
     return std::nullopt;
   }
-  return number;
+  const bool isOurs = std::ranges::any_of(
+      SUFFIXES, [&](std::string_view suffix) { return name == NameOf(number).append(suffix); });
+  return isOurs ? std::optional(number) : std::nullopt;
+}
+
+bool IsRegular(const std::filesystem::directory_entry& entry) {
+  return entry.symlink_status().type() == std::filesystem::file_type::regular;
 }
 
 } // namespace
@@ -47,14 +60,15 @@ CacheDirectory::CacheDirectory(const std::string& path) {
   }
   const util::FileDescriptor directory(open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
   struct stat status {};
-  if (fstat(directory.Get(), &status) != 0) {
+  if (!directory || fstat(directory.Get(), &status) != 0) {
     Refuse(path, std::generic_category().message(errno));
   }
   if (status.st_uid != geteuid()) {
     Refuse(path, "it belongs to another user");
   }
-  if ((status.st_mode & (S_IRWXG | S_IRWXO)) != 0 && fchmod(directory.Get(), S_IRWXU) != 0) {
-    Refuse(path, std::generic_category().message(errno));
+  if ((status.st_mode & (S_IRWXG | S_IRWXO)) != 0) {
+    Refuse(path, "other users may use it; name a directory that does not exist yet or has mode "
+                 "0700");
   }
   lock_.Reset(openat(directory.Get(), "lock",
                      O_RDWR | O_CREAT | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC, S_IRUSR | S_IWUSR));
@@ -69,15 +83,14 @@ CacheDirectory::CacheDirectory(const std::string& path) {
 }
 
 std::string CacheDirectory::File(std::uint64_t number) const {
-  return path_ + '/' + std::string(BEGIN) + std::to_string(number) + std::string(END);
+  return path_ + '/' + NameOf(number);
 }
 
 std::vector<std::uint64_t> CacheDirectory::Numbers() const {
   std::vector<std::uint64_t> numbers;
   for (const auto& entry : std::filesystem::directory_iterator(path_)) {
     const auto number = NumberOf(entry.path().filename().string());
-    if (number && entry.path() == File(*number) &&
-        entry.symlink_status().type() == std::filesystem::file_type::regular) {
+    if (number && entry.path() == File(*number) && IsRegular(entry)) {
       numbers.push_back(*number);
     }
   }
@@ -85,16 +98,30 @@ std::vector<std::uint64_t> CacheDirectory::Numbers() const {
   return numbers;
 }
 
+std::uint64_t CacheDirectory::FreeNumber(std::uint64_t after) const {
+  const auto isTaken = [this](std::uint64_t number) {
+    return std::ranges::any_of(SUFFIXES, [&](std::string_view suffix) {
+      const std::string name = File(number).append(suffix);
+      return std::filesystem::exists(std::filesystem::symlink_status(name));
+    });
+  };
+  std::uint64_t number = after + 1;
+  while (isTaken(number)) {
+    ++number;
+  }
+  return number;
+}
+
 void CacheDirectory::RemoveOthers(std::uint64_t kept) const {
   std::vector<std::filesystem::path> others;
   for (const auto& entry : std::filesystem::directory_iterator(path_)) {
-    const std::string name = entry.path().filename().string();
-    if (name.starts_with(BEGIN) && NumberOf(name) != kept) {
+    const auto number = NumberOf(entry.path().filename().string());
+    if (number && *number != kept && IsRegular(entry)) {
       others.push_back(entry.path());
     }
   }
   for (const auto& other : others) {
-    std::filesystem::remove_all(other);
+    std::filesystem::remove(other);
   }
 }
 

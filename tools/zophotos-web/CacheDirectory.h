@@ -11,8 +11,9 @@ namespace orva::web {
 /// The directory of the snapshot, locked for this process.
 class CacheDirectory {
 public:
-  /// Creates the directory if its parent exists. Only its owner may use it afterwards. Throws
-  /// std::runtime_error if it belongs to another user, or if another process has locked it.
+  /// Creates the directory, for its owner only, if it is missing and its parent exists. Throws
+  /// std::runtime_error if the directory belongs to another user, if other users may use it, or if
+  /// another process has locked it.
   explicit CacheDirectory(const std::string& path);
 
   /// The path of the snapshot's file with this number.
@@ -21,8 +22,11 @@ public:
   /// The numbers of the snapshots' files that exist, ascending.
   std::vector<std::uint64_t> Numbers() const;
 
-  /// Removes everything that has the name of a snapshot's file, apart from that with the number
-  /// `kept`. Other names stay.
+  /// The first number after `after` that no name in the directory has.
+  std::uint64_t FreeNumber(std::uint64_t after) const;
+
+  /// Removes the regular files that have the names of snapshots' files, apart from those with the
+  /// number `kept`. Everything else stays.
   void RemoveOthers(std::uint64_t kept) const;
 
 private:

@@ -7,7 +7,6 @@
 #include <unistd.h>
 
 #include <cstdlib>
-#include <stdexcept>
 #include <string_view>
 
 namespace orva::web {
@@ -51,9 +50,9 @@ util::FileDescriptor OpenListeningSocket(const Options& options) {
   const auto address = passed ? SocketAddress::Of(passed.Get())
                               : SocketAddress::Parse(options.listen.value_or("127.0.0.1:8480"));
   if (!address || (!address->IsLoopback() && !options.allowsEverybody)) {
-    throw std::runtime_error("other machines can reach " + (address ? address->Url() : "") +
-                             ", and everybody who reaches it sees all photos; if that is wanted, "
-                             "add --allow-everybody");
+    throw AddressRefused("other machines can reach " + (address ? address->Url() : "") +
+                         ", and everybody who reaches it sees all photos; if that is wanted, "
+                         "add --allow-everybody");
   }
   return passed ? std::move(passed) : address->Listen();
 }

@@ -17,6 +17,7 @@
 
 #include <algorithm>
 #include <array>
+#include <cerrno>
 #include <chrono>
 #include <condition_variable>
 #include <limits>
@@ -93,7 +94,17 @@ void RequirePlainTable(SQLite::Database& database, const std::string& path, cons
                           zophotos::Explain(error, path));
 }
 
+/// SQLite only says that it cannot open the file.
+void RequirePermission(const std::string& path) {
+  if (access(path.c_str(), R_OK) != 0 && errno == EACCES) {
+    throw zophotos::Failure(zophotos::ExitStatus::Failed,
+                            path + ": permission denied: the user of zophotos-web has to be able "
+                                   "to read this file and to enter all folders above it");
+  }
+}
+
 SQLite::Database OpenSource(const std::string& path) try {
+  RequirePermission(path);
   SQLite::Database database = zophotos::OpenDatabase(path);
   database.setBusyTimeout(BUSY_TIMEOUT);
   sqlite3_limit(database.getHandle(), SQLITE_LIMIT_LENGTH, LONGEST_VALUE);

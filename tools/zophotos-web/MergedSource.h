@@ -86,6 +86,8 @@ class MergedSource {
 public:
   explicit MergedSource(const std::string& path);
 
+  const std::string& Path() const noexcept { return path_; }
+
   /// Changes with each commit of the daemon.
   std::int64_t DataVersion();
 

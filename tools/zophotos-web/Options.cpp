@@ -5,6 +5,8 @@
 
 #include "commandline/Parse.h"
 
+#include <arpa/inet.h>
+
 #include <utility>
 
 namespace orva::web {
@@ -21,12 +23,22 @@ CLI::Validator AddressAndPort() {
           ""};
 }
 
+/// A host name in lower case or an address; one of IPv6 may have brackets.
+bool IsHost(const std::string& text) {
+  in6_addr address{};
+  const bool hasBrackets = text.starts_with('[') && text.ends_with(']');
+  const std::string plain = hasBrackets ? text.substr(1, text.size() - 2) : text;
+  return inet_pton(AF_INET6, plain.c_str(), &address) == 1 ||
+         (HostName(text) == text && !text.empty());
+}
+
 /// For Option::check.
 CLI::Validator HostNames() {
   return {[](const std::string& text) {
-            return HostName(text) == text && !text.empty()
-                       ? std::string()
-                       : "takes a host name in lower case, without a port, not '" + text + "'";
+            return IsHost(text) ? std::string()
+                                : "takes a host name in lower case or an address, without a "
+                                  "port, not '" +
+                                      text + "'";
           },
           ""};
 }
@@ -48,7 +60,8 @@ std::optional<Options> ParseOptions(std::vector<std::string> arguments) {
                "Allow an address that other machines can reach: everybody who reaches it sees all "
                "photos");
   app.add_option("--host", options.hosts,
-                 "A name by which browsers know this server, as behind a proxy; may be repeated")
+                 "A name or address by which browsers know this server, as behind a proxy; may be "
+                 "repeated")
       ->type_name("NAME")
       ->check(HostNames())
       ->multi_option_policy(CLI::MultiOptionPolicy::TakeAll);
@@ -56,7 +69,8 @@ std::optional<Options> ParseOptions(std::vector<std::string> arguments) {
                  "Keep the snapshot in this directory instead of ~/.cache/zophotos-web")
       ->type_name("DIRECTORY")
       ->check(commandline::NotEmpty());
-  app.footer("Exit status: 0 stopped by a signal; 1 failed; 2 wrong command line.\n"
+  app.footer("Exit status: 0 stopped by a signal; 1 failed; 2 wrong command line;\n"
+             "3 other machines can reach the address.\n"
              "See zophotos-web(8).");
   if (!commandline::Parse(app, std::move(arguments), false)) {
     return std::nullopt;

@@ -111,11 +111,10 @@ Html Notice(const SnapshotStatus& status) {
          << NameText(status.reason) << "</p>";
     break;
   case SnapshotStatus::State::NoDatabase:
-    html << "<p>There is no merged database at the moment";
-    if (!status.reason.empty()) {
-      html << ": " << NameText(status.reason);
-    }
-    html << "</p>";
+    html << "<p>"
+         << (status.reason.empty() ? "There is no merged database at the moment."
+                                   : NameText(status.reason))
+         << "</p>";
     break;
   case SnapshotStatus::State::Current:
     break;
@@ -138,7 +137,7 @@ Html SearchField() {
   Html html;
   html << R"(<form class="find" role="search" action="/search"><label class="unseen" for="find">)"
        << "Search photos"
-       << R"(</label><input id="find" type="search" name="words" maxlength="200" )"
+       << R"(</label><input id="find" type="search" name="words" maxlength="1000" )"
        << R"(placeholder="Search photos" autocomplete="off" enterkeyhint="search">)"
        << R"(<button type="submit" aria-label="Search">)" << Icon("search") << "</button></form>";
   return html;
@@ -398,7 +397,7 @@ Html SearchForm(const Site& site, const Selection& selection, const std::vector<
   Html html;
   html << R"(<form class="search" role="search" action="/search"><p class="field words">)"
        << R"(<label for="words">Words in the path</label><input id="words" type="search" )"
-       << R"(name="words" maxlength="200" autocomplete="off" enterkeyhint="search" value=")"
+       << R"(name="words" maxlength="1000" autocomplete="off" enterkeyhint="search" value=")"
        << selection.words << R"("></p><p class="field"><label for="volume-field">Volume</label>)"
        << R"(<select id="volume-field" name="volume">)"
        << Option("", "All volumes", !selection.volume);
@@ -542,11 +541,11 @@ std::string SearchPage(const Site& site, const Selection& selection,
   Html main;
   main << "<h1>Search</h1>\n" << SearchForm(site, selection, months);
   if (selection == Selection()) {
-    main << Calendar(months);
+    main << (months.empty() ? Empty(site) : Calendar(months));
   } else {
     if (list.photos.empty()) {
       main
-          << "<p class=\"nothing\">No photo matches. Each word must be the beginning of a word in the path of a photo.</p>\n";
+          << "<p class=\"nothing\">No photo matches. Each word must be the beginning of a word in the path of a photo. A word has only letters or only digits.</p>\n";
     }
     main << Photos(list, Address("/search", selection), selection);
   }

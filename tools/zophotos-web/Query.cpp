@@ -1,5 +1,7 @@
 #include "Query.h"
 
+#include "SearchIndex.h"
+
 #include <algorithm>
 #include <array>
 #include <ctime>
@@ -9,6 +11,7 @@
 namespace orva::web {
 namespace {
 
+constexpr std::size_t YEAR_DIGITS = 4;
 constexpr int LAST_YEAR = 9999;
 constexpr int MONTHS_PER_YEAR = 12;
 
@@ -29,7 +32,6 @@ std::optional<int> ParseDigits(std::string_view text, std::size_t digits, int le
 
 /// Reads "2026-11" or "2026".
 void ParseMonth(std::string_view text, Selection& selection) {
-  constexpr std::size_t YEAR_DIGITS = 4;
   selection.year = ParseDigits(text.substr(0, YEAR_DIGITS), YEAR_DIGITS, 1, LAST_YEAR);
   const std::string_view rest = text.substr(std::min(YEAR_DIGITS, text.size()));
   if (rest.starts_with('-')) {
@@ -38,6 +40,33 @@ void ParseMonth(std::string_view text, Selection& selection) {
   if (!selection.year || (!rest.empty() && !selection.month)) {
     throw BadQuery("A month is written as 2026-11, or 2026 for the whole year.");
   }
+}
+
+/// Reads the conditions "month" and "year", which have to agree.
+void ParseTime(const Target& target, Selection& selection) {
+  if (const std::string_view month = ValueOf(target, "month"); !month.empty()) {
+    ParseMonth(month, selection);
+  }
+  if (const std::string_view text = ValueOf(target, "year"); !text.empty()) {
+    const auto year = ParseDigits(text, YEAR_DIGITS, 1, LAST_YEAR);
+    if (!year) {
+      throw BadQuery("A year is written as 2026.");
+    }
+    if (selection.year.value_or(*year) != *year) {
+      throw BadQuery("The month is not in the year.");
+    }
+    selection.year = year;
+  }
+}
+
+/// The words of a search. A search that ignored some of them would find too much.
+std::string ParseWords(const Target& target) {
+  std::string words(ValueOf(target, "words"));
+  if (words.size() > LONGEST_SEARCH || SearchWords(words).size() > MOST_SEARCH_WORDS) {
+    throw BadQuery("A search may have at most " + std::to_string(MOST_SEARCH_WORDS) +
+                   " different words and " + std::to_string(LONGEST_SEARCH) + " bytes.");
+  }
+  return words;
 }
 
 /// The first second of a month in local time. The 13th month is the first one of the next year.
@@ -54,16 +83,12 @@ std::int64_t BeginOfMonth(int year, int month) {
 
 Selection ParseSelection(const Target& target) {
   Selection selection;
-  selection.words = ValueOf(target, "words");
+  selection.words = ParseWords(target);
   if (const std::string_view volume = ValueOf(target, "volume"); !volume.empty()) {
     selection.volume = volume;
   }
   selection.folder = ParseId(target, "folder");
-  if (const std::string_view month = ValueOf(target, "month"); !month.empty()) {
-    ParseMonth(month, selection);
-  } else if (const std::string_view year = ValueOf(target, "year"); !year.empty()) {
-    ParseMonth(year.substr(0, year.find('-')), selection);
-  }
+  ParseTime(target, selection);
   return selection;
 }
 

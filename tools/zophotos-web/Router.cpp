@@ -49,6 +49,9 @@ Response NoFolder(const Target& target) {
   return Router::Refuse(NOT_FOUND, target.path, "There is no such folder.");
 }
 
+/// A parameter names a folder that does not exist.
+struct UnknownFolder {};
+
 /// A response that browsers keep, and use again when the server says that it is current.
 std::vector<std::pair<std::string, std::string>> KeptHeaders(std::string_view tag) {
   return {{"ETag", std::string(tag)}, {"Cache-Control", "private, no-cache"}};
@@ -128,14 +131,20 @@ Json FirstId(const std::vector<Photo>& photos) {
 /// The folder whose folders are the top of the tree: the one that contains the volumes. -1, for all
 /// folders without a parent, if a crafted database has others.
 std::int64_t TopOf(const Readers::Lease& reader) {
-  const std::vector<Folder> top = reader->Folders(-1, "", 2);
+  const std::vector<Folder> top = reader->Folders(-1, {}, 2);
   return top.size() == 1 && top.front().path == "/shares/" ? top.front().id : -1;
 }
 
-/// The path of the folder that a list of folders continues after.
-std::string PathAfter(const Readers::Lease& reader, const std::optional<std::int64_t>& folder) {
-  const auto found = folder ? reader->FindFolder(*folder) : std::nullopt;
-  return found ? found->path : "";
+/// The folder that a list of folders continues after, of the parameter `name`. Throws
+/// UnknownFolder.
+std::optional<Folder> FolderAfter(const Readers::Lease& reader, const Target& target,
+                                  const std::string& name) {
+  const auto id = ParseId(target, name);
+  auto folder = id ? reader->FindFolder(*id) : std::nullopt;
+  if (id && !folder) {
+    throw UnknownFolder();
+  }
+  return folder;
 }
 
 /// The folders that contain a folder: the nearest ones, from the top.
@@ -184,6 +193,8 @@ Response Router::Answer(const Request& request) {
     return AnswerPage(request, path);
   } catch (const BadQuery& error) {
     return Refuse(BAD_REQUEST, request.target.path, error.what());
+  } catch (const UnknownFolder&) {
+    return NoFolder(request.target);
   }
 }
 
@@ -290,9 +301,8 @@ Response Router::FoldersView(const Target& target, std::optional<std::int64_t> f
       }
       view.ancestors = AncestorsOf(reader, *folder);
     }
-    view.folders =
-        reader->Folders(folder ? *folder : TopOf(reader),
-                        PathAfter(reader, ParseId(target, "after_folder")), PAGE_SIZE + 1);
+    view.folders = reader->Folders(folder ? *folder : TopOf(reader),
+                                   FolderAfter(reader, target, "after_folder"), PAGE_SIZE + 1);
     view.hasMoreFolders = CutOff(view.folders, PAGE_SIZE, false);
   }
   if (folder) {
@@ -380,7 +390,7 @@ Response Router::FoldersJson(const Target& target) {
   const Readers::Lease reader(readers_);
   const auto parent = ParseId(target, "parent");
   auto folders = reader->Folders(parent ? *parent : TopOf(reader),
-                                 PathAfter(reader, ParseId(target, "after")), count + 1);
+                                 FolderAfter(reader, target, "after"), count + 1);
   const bool more = CutOff(folders, count, false);
   return JsonText({{"folders", Array(folders)}, {"more", more}});
 }

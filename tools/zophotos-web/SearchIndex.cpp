@@ -24,10 +24,6 @@ constexpr std::size_t LONGEST_PREFIX = 16;
 constexpr std::int64_t SAMPLED_PHOTOS = 20'000;
 constexpr std::size_t MOST_SAMPLED_WORDS = 200'000;
 
-/// Bytes and words of a search that count.
-constexpr std::size_t LONGEST_SEARCH = 1'000;
-constexpr std::size_t MOST_WORDS = 8;
-
 /// If at most so many words of the index begin with a word, the search names them.
 constexpr std::size_t MOST_ALTERNATIVES = 8;
 
@@ -174,24 +170,8 @@ std::size_t CommonPrefix(std::string_view a, std::string_view b) {
   return static_cast<std::size_t>(end - a.begin());
 }
 
-/// The different words of a search, without those that others begin with: these match as well.
-std::vector<std::string> SearchWords(std::string_view text) {
-  std::string words;
-  AppendWords(text.substr(0, LONGEST_SEARCH), words);
-  std::vector<std::string> first;
-  ForEachWord(words, [&](std::string_view word) {
-    if (first.size() < MOST_WORDS) {
-      first.emplace_back(word);
-    }
-  });
-  std::ranges::sort(first);
-  std::vector<std::string> result;
-  for (std::size_t i = 0; i < first.size(); ++i) {
-    if (i + 1 == first.size() || !first[i + 1].starts_with(first[i])) {
-      result.push_back(first[i]);
-    }
-  }
-  return result;
+bool IsBlank(std::string_view text) {
+  return text.find_first_not_of(" \t\r\n") == std::string_view::npos;
 }
 
 /// In quotation marks nothing is an operator. No word has one.
@@ -220,6 +200,41 @@ std::optional<std::string> PrefixExpression(const std::string& word,
     from = prefix ? *prefix + '\xFF' : *next + '\x01';
   }
   return Quoted(word) + " *";
+}
+
+/// Whether one of the words begins with `word`.
+bool HasPrefix(std::string_view words, std::string_view word) {
+  bool has = false;
+  ForEachWord(words, [&](std::string_view other) { has = has || other.starts_with(word); });
+  return has;
+}
+
+/// The expression for the photos that have a word with this beginning below their volume or in its
+/// mount point. Empty if these are all photos; nothing if there are none.
+std::optional<std::string> WordExpression(const std::string& word, const SearchTerms& terms,
+                                          const std::vector<VolumeWords>& volumes,
+                                          const FrequentPrefixes& frequent,
+                                          const NextWord& nextWord) {
+  std::string marks;
+  std::size_t candidates = 0;
+  std::size_t matches = 0;
+  for (const VolumeWords& volume : volumes) {
+    if (!terms.volume || *terms.volume == volume.volume) {
+      ++candidates;
+      if (HasPrefix(volume.words, word)) {
+        ++matches;
+        marks += (marks.empty() ? "" : " OR ") + Quoted(VolumeMark(volume.volume));
+      }
+    }
+  }
+  if (matches != 0 && matches == candidates) {
+    return std::string();
+  }
+  const auto below = PrefixExpression(word, frequent, nextWord);
+  if (!below) {
+    return matches == 0 ? std::nullopt : std::optional(marks);
+  }
+  return matches == 0 ? *below : *below + " OR " + marks;
 }
 
 } // namespace
@@ -335,6 +350,21 @@ std::vector<std::string> PrefixSample::Frequent() const {
   return prefixes;
 }
 
+std::vector<std::string> SearchWords(std::string_view text) {
+  std::string words;
+  AppendWords(text, words);
+  std::vector<std::string> all;
+  ForEachWord(words, [&](std::string_view word) { all.emplace_back(word); });
+  std::ranges::sort(all);
+  std::vector<std::string> result;
+  for (std::size_t i = 0; i < all.size(); ++i) {
+    if (i + 1 == all.size() || !all[i + 1].starts_with(all[i])) {
+      result.push_back(all[i]);
+    }
+  }
+  return result;
+}
+
 std::string VolumeMark(std::int64_t volume) {
   return VOLUME_MARK + std::to_string(volume);
 }
@@ -344,6 +374,7 @@ std::string FolderMark(std::int64_t folder) {
 }
 
 std::optional<std::string> MatchExpression(const SearchTerms& terms,
+                                           const std::vector<VolumeWords>& volumes,
                                            const FrequentPrefixes& frequent,
                                            const NextWord& nextWord) {
   std::string expression;
@@ -356,12 +387,18 @@ std::optional<std::string> MatchExpression(const SearchTerms& terms,
   if (terms.folder) {
     add(Quoted(FolderMark(*terms.folder)));
   }
-  for (const std::string& word : SearchWords(terms.words)) {
-    const auto part = PrefixExpression(word, frequent, nextWord);
+  const std::vector<std::string> words = SearchWords(terms.words);
+  if (words.empty() && !IsBlank(terms.words)) {
+    return std::nullopt;
+  }
+  for (const std::string& word : words) {
+    const auto part = WordExpression(word, terms, volumes, frequent, nextWord);
     if (!part) {
       return std::nullopt;
     }
-    add('(' + *part + ')');
+    if (!part->empty()) {
+      add('(' + *part + ')');
+    }
   }
   return expression;
 }

@@ -82,6 +82,20 @@ private:
 std::string VolumeMark(std::int64_t volume);
 std::string FolderMark(std::int64_t folder);
 
+/// What a search may have: bytes, and words that SearchWords finds.
+inline constexpr std::size_t LONGEST_SEARCH = 4'096;
+inline constexpr std::size_t MOST_SEARCH_WORDS = 32;
+
+/// The different words of a search, sorted. A word that another one begins with is left out: it
+/// matches as well.
+std::vector<std::string> SearchWords(std::string_view text);
+
+/// The words of a volume's mount point, which the index does not have.
+struct VolumeWords {
+  std::int64_t volume = 0; ///< its number
+  std::string words;       ///< as AppendWords writes them
+};
+
 /// What a search asks for.
 struct SearchTerms {
   std::string_view words; ///< any text
@@ -93,8 +107,10 @@ struct SearchTerms {
 using NextWord = std::function<std::optional<std::string>(const std::string& from)>;
 
 /// The expression for MATCH that finds the photos for which all terms hold; nothing if there can be
-/// none. Empty if the terms do not restrict anything. Only the first words of a long text count.
+/// none. Empty if the terms do not restrict anything. A text that has no words and is not blank
+/// matches nothing. `volumes` are all volumes of the index.
 std::optional<std::string> MatchExpression(const SearchTerms& terms,
+                                           const std::vector<VolumeWords>& volumes,
                                            const FrequentPrefixes& frequent,
                                            const NextWord& nextWord);
 

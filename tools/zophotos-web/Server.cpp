@@ -19,6 +19,7 @@ namespace {
 
 constexpr std::size_t CONNECTION_MEMORY = 16 << 10; // bytes: bounds the headers of a request
 constexpr unsigned SILENCE = 30;                    // seconds
+constexpr std::size_t LINE_END = 2;                 // bytes
 
 /// A text with more than SMALL_TEXT bytes is not sent while texts with MOST_UNSENT bytes wait for
 /// clients that do not read them.
@@ -57,6 +58,7 @@ struct Exchange {
 struct Headers {
   int hosts = 0;
   std::string host;
+  std::size_t size = 0; ///< of their lines, in bytes
   bool areMalformed = false;
   bool hasBody = false;
   bool isFromOtherSite = false;
@@ -82,6 +84,7 @@ MHD_Result Collect(void* headers, MHD_ValueKind /*kind*/, const char* key, std::
   const std::string_view text(value == nullptr ? "" : value, valueSize);
   // A proxy may take "Content-Length :" for the header without the space.
   all.areMalformed = all.areMalformed || !std::ranges::all_of(name, IsNameCharacter);
+  all.size += name.size() + std::string_view(": ").size() + text.size() + LINE_END;
   if (IsEqual(name, "host")) {
     ++all.hosts;
     all.host = text;
@@ -153,6 +156,11 @@ int SocketOf(MHD_Connection* connection) {
   return MHD_get_connection_info(connection, MHD_CONNECTION_INFO_CONNECTION_FD)->connect_fd;
 }
 
+/// The bytes of a request up to its body.
+std::size_t SizeOf(MHD_Connection* connection) {
+  return MHD_get_connection_info(connection, MHD_CONNECTION_INFO_REQUEST_HEADER_SIZE)->header_size;
+}
+
 /// As many connections as this process may have open files for: each may send a file.
 unsigned ConnectionLimit(unsigned wanted) {
   constexpr rlim_t RESERVE = 64;
@@ -189,6 +197,9 @@ struct Refusal {
 /// Why a request is refused; nothing if it is not.
 std::optional<Refusal> Check(const Headers& headers, const AllowedHosts& hosts, int socket,
                              std::string_view method) {
+  if (headers.areMalformed) {
+    return Refusal{MHD_HTTP_BAD_REQUEST, "The request is malformed."};
+  }
   if (headers.hosts != 1) {
     return Refusal{MHD_HTTP_BAD_REQUEST, "The request must have one Host header."};
   }
@@ -196,9 +207,6 @@ std::optional<Refusal> Check(const Headers& headers, const AllowedHosts& hosts, 
     return Refusal{MHD_HTTP_MISDIRECTED_REQUEST,
                    "This server is not known by the name in the Host header. The option --host "
                    "gives it another name."};
-  }
-  if (headers.areMalformed) {
-    return Refusal{MHD_HTTP_BAD_REQUEST, "A header of the request is malformed."};
   }
   if (headers.hasBody) {
     return Refusal{MHD_HTTP_BAD_REQUEST, "A request must not have a body."};
@@ -246,7 +254,7 @@ struct Server::Calls {
 
   /// Called when the headers of a request are read, and again when it is complete.
   static MHD_Result Handle(void* server, MHD_Connection* connection, const char* /*url*/,
-                           const char* method, const char* /*version*/, const char* /*upload*/,
+                           const char* method, const char* version, const char* /*upload*/,
                            std::size_t* /*uploadSize*/, void** exchange) noexcept {
     Server& self = *static_cast<Server*>(server);
     auto* const current = static_cast<Exchange*>(*exchange);
@@ -261,7 +269,7 @@ struct Server::Calls {
         }
         return Send(self, connection, current->request->target.path, std::move(response));
       }
-      const auto refusal = CheckRequest(self, connection, method, *current);
+      const auto refusal = CheckRequest(self, connection, method, version, *current);
       return refusal ? Refuse(self, connection, *refusal, current->text) : MHD_YES;
     } catch (const std::exception& error) {
       self.handlers_.log(error.what());
@@ -271,10 +279,15 @@ struct Server::Calls {
 
   /// Fills the request in.
   static std::optional<Refusal> CheckRequest(const Server& self, MHD_Connection* connection,
-                                             std::string_view method, Exchange& exchange) {
+                                             std::string_view method, std::string_view version,
+                                             Exchange& exchange) {
     Headers headers;
     MHD_get_connection_values_n(connection, MHD_HEADER_KIND, &Collect, &headers);
     exchange.isHead = method == "HEAD";
+    const std::size_t lines = method.size() + 1 + exchange.text.size() + 1 + version.size() +
+                              LINE_END + headers.size + LINE_END;
+    // libmicrohttpd cuts texts off at NUL bytes, and a proxy may read what follows.
+    headers.areMalformed = headers.areMalformed || SizeOf(connection) > lines;
     auto refusal = Check(headers, self.hosts_, SocketOf(connection), method);
     auto target = ParseTarget(exchange.text);
     if (!refusal && !target) {

@@ -28,6 +28,9 @@ namespace {
 using Clock = std::chrono::steady_clock;
 using State = SnapshotStatus::State;
 
+/// A merge locks the database for less than this. After it, the status says that it is locked.
+constexpr std::chrono::seconds LONGEST_LOCK(5);
+
 /// Bytes of photos to sort in memory while a snapshot is built.
 constexpr std::size_t LARGEST_BATCH = 16 << 20;
 
@@ -192,6 +195,9 @@ private:
   }
 
   void Fail(const zophotos::Failure& failure) {
+    if (failure.Status() != zophotos::ExitStatus::Locked) {
+      lockedSince_.reset();
+    }
     if (failure.Status() == zophotos::ExitStatus::NoDatabase) {
       if (mustBuild_ || !IsEmpty()) {
         PublishEmpty();
@@ -200,6 +206,10 @@ private:
       SetStatus(State::NoDatabase, failure.what());
     } else if (failure.Status() != zophotos::ExitStatus::Locked) {
       FailLater(failure.what());
+    } else if (!lockedSince_) {
+      lockedSince_ = Clock::now();
+    } else if (Clock::now() - *lockedSince_ > LONGEST_LOCK) {
+      SetStatus(State::Failed, failure.what());
     }
   }
 
@@ -213,6 +223,7 @@ private:
   void Succeed() {
     pause_ = {};
     nextTry_ = {};
+    lockedSince_.reset();
     SetStatus(State::Current);
   }
 
@@ -345,7 +356,7 @@ private:
   void Build(MergedSource& source, const SourceIdentity& identity, const std::stop_token& stop) {
     SetStatus(State::Building);
     directory_.RemoveOthers(number_);
-    SnapshotFile file = SnapshotFile::Create(directory_.File(number_ + 1));
+    SnapshotFile file = CreateNext();
     SnapshotState& state = file.State();
     state.firstNumber = FirstNumber(identity);
     const std::int64_t version = source.DataVersion();
@@ -367,7 +378,7 @@ private:
     if (state.filesLeftOut != 0 || state.foldersLeftOut != 0) {
       Log("left out " + zophotos::Count(state.filesLeftOut, "file") + " and " +
           zophotos::Count(state.foldersLeftOut, "folder") +
-          " that the daemon cannot have merged: " + identity.file);
+          " that the daemon cannot have merged: " + source.Path());
     }
     Publish(std::move(file));
     mustBuild_ = false;
@@ -423,12 +434,17 @@ private:
   bool IsEmpty() { return file_->State().source.file.empty() && file_->State().folders == 0; }
 
   void PublishEmpty() {
-    SnapshotFile file = SnapshotFile::Create(directory_.File(number_ + 1));
+    SnapshotFile file = CreateNext();
     file.Begin();
     Publish(std::move(file));
   }
 
-  /// Ends the transaction of a new snapshot, and makes it the present one.
+  SnapshotFile CreateNext() {
+    nextNumber_ = directory_.FreeNumber(number_);
+    return SnapshotFile::Create(directory_.File(nextNumber_));
+  }
+
+  /// Ends the transaction of a snapshot that CreateNext made, and makes it the present one.
   void Publish(SnapshotFile file) {
     const std::int64_t former = file_ ? file_->State().version : 0;
     file.State().version = std::max(former + 1, Now());
@@ -437,7 +453,7 @@ private:
     file.Complete();
     file_.reset();
     file_.emplace(std::move(file));
-    ++number_;
+    number_ = nextNumber_;
     {
       const std::lock_guard lock(mutex_);
       path_ = file_->Path();
@@ -448,7 +464,8 @@ private:
   CacheDirectory directory_;
   const FindPath findPath_;
   const std::string boot_;
-  std::uint64_t number_ = 0; ///< of the present file
+  std::uint64_t number_ = 0;     ///< of the present file
+  std::uint64_t nextNumber_ = 0; ///< of the file that CreateNext made
   std::optional<SnapshotFile> file_;
   bool mustBuild_ = false;
   bool isTidy_ = false; ///< the search index, since the last change
@@ -456,6 +473,7 @@ private:
   std::optional<SourceIdentity> failed_; ///< what the last try was for
   std::chrono::seconds pause_{};
   Clock::time_point nextTry_;
+  std::optional<Clock::time_point> lockedSince_;
 
   mutable std::mutex mutex_;
   SnapshotStatus status_;

@@ -35,8 +35,8 @@ public:
   using FindPath = std::function<std::string()>;
 
   /// Uses `directory`, which is created if its parent exists. Continues with the snapshot that is
-  /// there; what is damaged, of another version or of unknown origin is removed. Throws
-  /// std::runtime_error if another process uses the directory, or if it cannot be used.
+  /// there. Files with the names of snapshots that are damaged or of another version are removed.
+  /// Throws std::runtime_error if another process uses the directory, or if it cannot be used.
   Snapshot(const std::string& directory, FindPath findPath);
   ~Snapshot();
   Snapshot(const Snapshot&) = delete;

@@ -131,8 +131,9 @@ public:
     if (filter.folder && *filter.folder <= 0) {
       return std::nullopt;
     }
-    return MatchExpression(terms, frequent_,
-                           [this](const std::string& from) { return NextWord(from); });
+    return MatchExpression(terms,
+                           filter.words.empty() ? std::vector<VolumeWords>() : AllVolumeWords(),
+                           frequent_, [this](const std::string& from) { return NextWord(from); });
   }
 
   std::int64_t Version() {
@@ -280,6 +281,22 @@ private:
     return word;
   }
 
+  /// The words of all mount points. They are kept for the present version.
+  const std::vector<VolumeWords>& AllVolumeWords() {
+    const std::int64_t version = Version();
+    if (volumeWords_.empty() || version != volumeWordsVersion_) {
+      volumeWords_.clear();
+      SQLite::Statement& query = Prepared("SELECT number, mountPoint FROM Volumes");
+      while (query.executeStep()) {
+        VolumeWords& volume = volumeWords_.emplace_back();
+        volume.volume = query.getColumn(0).getInt64();
+        AppendWords(query.getColumn(1).getString(), volume.words);
+      }
+      volumeWordsVersion_ = version;
+    }
+    return volumeWords_;
+  }
+
   void Open(const std::string& path) {
     Close();
     database_.emplace(OpenForReading(path));
@@ -293,6 +310,7 @@ private:
     statements_.clear();
     database_.reset();
     nextWords_.clear();
+    volumeWords_.clear();
   }
 
   const Snapshot& snapshot_;
@@ -302,6 +320,8 @@ private:
   FrequentPrefixes frequent_;
   std::map<std::string, std::optional<std::string>> nextWords_;
   std::int64_t wordsVersion_ = 0;
+  std::vector<VolumeWords> volumeWords_;
+  std::int64_t volumeWordsVersion_ = 0;
 };
 
 SnapshotReader::SnapshotReader(const Snapshot& snapshot)
@@ -349,15 +369,16 @@ std::optional<Photo> SnapshotReader::Find(PhotoId id) {
   return implementation_->Read([&] { return implementation_->Find(id); });
 }
 
-std::vector<Folder> SnapshotReader::Folders(std::int64_t parent, const std::string& afterPath,
+std::vector<Folder> SnapshotReader::Folders(std::int64_t parent, const std::optional<Folder>& after,
                                             std::size_t count) {
   return implementation_->Read([&] {
     SQLite::Statement& query = implementation_->Prepared(
         "SELECT f.id, f.parent, f.path, v.mountPoint FROM Folders f JOIN Volumes v ON v.number = "
-        "f.volume WHERE f.parent = ? AND f.path > ? ORDER BY f.path, f.id LIMIT ?");
+        "f.volume WHERE f.parent = ? AND (f.path, f.id) > (?, ?) ORDER BY f.path, f.id LIMIT ?");
     query.bind(1, parent);
-    query.bind(2, afterPath);
-    query.bind(3, LimitOf(count));
+    query.bind(2, after ? after->path : "");
+    query.bind(3, after ? after->id : 0);
+    query.bind(4, LimitOf(count));
     std::vector<Folder> folders;
     while (query.executeStep()) {
       folders.push_back(implementation_->ReadFolder(query));

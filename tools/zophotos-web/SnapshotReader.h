@@ -86,9 +86,10 @@ public:
 
   std::optional<Photo> Find(PhotoId id);
 
-  /// Folders in `parent`, in the order of their paths' bytes, at most `count`; only those that come
-  /// after `afterPath`, which may be empty.
-  std::vector<Folder> Folders(std::int64_t parent, const std::string& afterPath, std::size_t count);
+  /// Folders in `parent`, in the order of their paths' bytes and ids, at most `count`; with `after`,
+  /// only those that follow it.
+  std::vector<Folder> Folders(std::int64_t parent, const std::optional<Folder>& after,
+                              std::size_t count);
 
   std::optional<Folder> FindFolder(std::int64_t id);
 

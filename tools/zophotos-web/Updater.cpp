@@ -31,7 +31,9 @@ void Updater::Update(const std::stop_token& stop) {
   snapshot_.Update(stop);
   events_.PublishVersion(reader_.Version());
   const SnapshotStatus status = snapshot_.Status();
-  if (std::exchange(state_, status.state) != status.state) {
+  const bool hasOtherState = std::exchange(state_, status.state) != status.state;
+  const bool hasOtherReason = std::exchange(reason_, status.reason) != status.reason;
+  if (hasOtherState || hasOtherReason) {
     events_.PublishVolumes();
   }
   Log(status.state == SnapshotStatus::State::Failed ? status.reason : "");

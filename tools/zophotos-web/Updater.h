@@ -25,6 +25,7 @@ private:
   std::function<void(const std::string&)> log_;
   SnapshotReader reader_;
   SnapshotStatus::State state_ = SnapshotStatus::State::Building;
+  std::string reason_;
   std::string problem_; ///< that was logged last; empty for none
   std::jthread thread_;
 };

@@ -27,6 +27,9 @@ namespace {
 
 using namespace orva;
 
+/// The unit file has this number: another start would end in the same way.
+constexpr int EXIT_REFUSED = 3;
+
 /// Writes a line to standard error, which is the journal when systemd runs the program. Any thread.
 void Log(const std::string& text) {
   static std::mutex mutex;
@@ -112,6 +115,9 @@ int main(int count, char* arguments[]) {
   } catch (const commandline::UsageError& error) {
     commandline::Report(error, zophotos::Printable);
     return commandline::EXIT_USAGE;
+  } catch (const web::AddressRefused& error) {
+    Log(error.what());
+    return EXIT_REFUSED;
   } catch (const std::exception& error) {
     Log(error.what());
     return EXIT_FAILURE;

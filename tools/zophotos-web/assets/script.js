@@ -807,12 +807,14 @@ async function updateEmpty(status, volumes, grid, list) {
   const isPreparing = volumes.some((volume) =>
     !volume.gone && (volume.total > 0 || volume.waiting > 0));
   const kind = status.state === "building" ? "building" : isPreparing ? "preparing" : "none";
-  const hasFolders = async () => (await fetchJson("/api/folders?count=1")).folders.length > 0;
+  const hasItems = async () => location.pathname === "/search"
+    ? (await fetchJson("/api/months")).months.length > 0
+    : (await fetchJson("/api/folders?count=1")).folders.length > 0;
   if (grid !== null) {
     empty.hidden = grid.photos.length > 0;
   } else if (list !== null) {
     empty.hidden = list.children.length > 0;
-  } else if (await hasFolders()) {
+  } else if (await hasItems()) {
     location.reload();
   }
   if (!empty.hidden && kind !== empty.dataset.kind) {
@@ -828,8 +830,9 @@ function updateNotice(status) {
       : "The list of photos is being built.",
     failed: "The merged database cannot be read, so this page may be out of date: " +
       shown(status.reason),
-    no_database: `There is no merged database at the moment${status.reason === "" ? "" : ": "}` +
-      shown(status.reason),
+    no_database: status.reason === ""
+      ? "There is no merged database at the moment."
+      : shown(status.reason),
   }[status.state];
   if (notice.textContent !== (text ?? "")) {
     const paragraph = document.createElement("p");
