@@ -172,9 +172,9 @@ private:
     Read("grid page" + when, [&] { page({}); });
     Read("grid page in the middle" + when, [&] { reader.Photos({}, middle, PAGE); });
     web::Filter folder;
-    folder.folder = reader.Folders(1, "", 1).at(0).id + 1;
+    folder.folder = reader.Folders(1, {}, 1).at(0).id + 1;
     Read("photos of a folder" + when, [&] { page(folder); });
-    Read("folders of a volume" + when, [&] { reader.Folders(*folder.folder - 1, "", PAGE); });
+    Read("folders of a volume" + when, [&] { reader.Folders(*folder.folder - 1, {}, PAGE); });
     web::Filter volume;
     volume.volume = library_.MountPoint();
     Read("photos of a volume" + when, [&] { page(volume); });
