@@ -684,6 +684,28 @@ TEST_F(IndexerTest, AReadOnlyVolumeIsIndexedWhenItBecomesWritable) {
   EXPECT_EQ(LogLines("read-only").size(), 1U);
 }
 
+TEST_F(IndexerTest, ACatalogThatWasDamagedTwiceInARowIsMadeAgainAtTheNextRetry) {
+  const Volume volume("A", "64m");
+  Write(volume.Path() + "/a.jpg");
+  indexer::Volume indexed(volume.Path() + "/", catalog::VolumeRoot::Kind::Mount);
+  const auto work = [&indexed] {
+    indexed.Work([] {}, [](const db::DB&) {}, std::time(nullptr));
+    return std::string(indexed.Status().state);
+  };
+  const auto damage = [&volume] { Write(CatalogOf(volume.Path()), std::string(100'000, 'x')); };
+  damage();
+  EXPECT_EQ(work(), "walking");
+  damage();
+  EXPECT_EQ(work(), "unusable");
+  EXPECT_GT(indexed.NextWork(), indexer::Clock::now() + std::chrono::seconds(30));
+  damage();
+  EXPECT_EQ(work(), "unusable");
+  work();
+  EXPECT_TRUE(indexed.IsWalked());
+  EXPECT_NE(std::string(indexed.Status().state), "unusable");
+  EXPECT_EQ(LogLines("renamed").size(), 2U);
+}
+
 TEST_F(IndexerTest, AFullVolumeIsIndexedWhenThereIsSpace) {
   Volume volume("A", "1m");
   Write(volume.Path() + "/a.jpg");
