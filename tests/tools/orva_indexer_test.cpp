@@ -26,6 +26,7 @@
 #include <unistd.h>
 
 #include <array>
+#include <cerrno>
 #include <chrono>
 #include <csignal>
 #include <ctime>
@@ -34,6 +35,8 @@
 #include <iterator>
 #include <random>
 #include <string>
+#include <system_error>
+#include <utility>
 #include <vector>
 
 namespace orva::test {
@@ -888,6 +891,29 @@ TEST(Locator, AFileOfAnotherUserNamesNoMaster) {
   EXPECT_EQ(indexer::Locator::Master(), std::nullopt);
 }
 
+/// A folder that is mounted at `mountPoint` while the object lives. It is created if it is missing,
+/// and stays.
+class PluggedFolder {
+public:
+  PluggedFolder(const std::string& folder, std::string mountPoint)
+      : mountPoint_(std::move(mountPoint)) {
+    fs::create_directories(folder);
+    fs::create_directories(mountPoint_);
+    if (mount(folder.c_str(), mountPoint_.c_str(), nullptr, MS_BIND, nullptr) != 0) {
+      throw std::system_error(errno, std::generic_category(), mountPoint_);
+    }
+  }
+  PluggedFolder(const PluggedFolder&) = delete;
+  PluggedFolder& operator=(const PluggedFolder&) = delete;
+  ~PluggedFolder() {
+    umount2(mountPoint_.c_str(), MNT_DETACH);
+    rmdir(mountPoint_.c_str());
+  }
+
+private:
+  const std::string mountPoint_;
+};
+
 /// The indexer and the daemon, with a master volume that keeps its merged database. It is plugged
 /// before the volumes of the tests, in the order of their names.
 class IndexerAndDaemonTest : public IndexerTest {
@@ -902,12 +928,20 @@ protected:
 
   void StartServiceAndDaemon() {
     StartService();
+    StartDaemon();
+  }
+
+  void StartDaemon() {
     daemon_ = std::make_unique<DaemonProcess>("/tmp/daemon", "/tmp/daemon.out");
   }
 
   /// Ends all programs, the service first.
   void Stop() {
     StopIndexer();
+    StopServiceAndDaemon();
+  }
+
+  void StopServiceAndDaemon() {
     Service().Signal(SIGTERM);
     Service().WaitForEnd();
     StopDaemon();
@@ -994,6 +1028,42 @@ TEST_F(IndexerAndDaemonTest, DisksThatWereSwappedWhileNothingRanAreMergedFromThe
   Start();
   EXPECT_THAT(AwaitMerged(second.Path(), {"second.jpg"}), IsEmpty());
   EXPECT_THAT(Events(second.Path()), Contains("Purged"));
+}
+
+TEST_F(IndexerAndDaemonTest, DisksThatWereSwappedTwiceAreMergedFromTheBeginning) {
+  const std::string disk = "/shares/Disk";
+  {
+    const PluggedFolder first("/tmp/first", disk);
+    Write(disk + "/first.jpg");
+    Start();
+    ASSERT_THAT(AwaitMerged(disk, {"first.jpg"}), IsEmpty());
+    Stop();
+  }
+  {
+    const PluggedFolder second("/tmp/second", disk);
+    Write(disk + "/second.jpg");
+    Start();
+    ASSERT_THAT(AwaitMerged(disk, {"second.jpg"}), IsEmpty());
+    ASSERT_TRUE(AwaitAllRemembered(disk));
+    Stop();
+  }
+  {
+    const PluggedFolder first("/tmp/first", disk);
+    Write(disk + "/new.jpg");
+    // The daemon starts so late that nothing can be announced as purged.
+    StartService();
+    StartIndexer();
+    ASSERT_THAT(AwaitCatalog(disk), IsEmpty());
+    FinishPhotos(disk);
+    ASSERT_TRUE(Await([&] { return Count(Events(disk), "End") > 0; }));
+    StopIndexer();
+    StartDaemon();
+    ASSERT_TRUE(Await([&] { return Count(Merged(), "new.jpg|" + disk + "/") == 1; }));
+    StopServiceAndDaemon();
+  }
+  const PluggedFolder second("/tmp/second", disk);
+  Start();
+  EXPECT_THAT(AwaitMerged(disk, {"second.jpg"}), IsEmpty());
 }
 
 TEST_F(IndexerAndDaemonTest, ACatalogFromABackupIsMergedFromTheBeginning) {

@@ -36,10 +36,9 @@ void RememberedCatalogs::Store(const std::string& master, const std::string& mou
 }
 
 /// The stamps stay: they say how late it may be.
-void RememberedCatalogs::ForgetOtherStates(const std::string& mountPoint, const db::DB& catalog) {
-  const std::string identity = catalog::Identity(catalog);
+void RememberedCatalogs::ForgetOthers(const std::string& mountPoint, const db::DB& catalog) {
   for (auto& [key, stored] : catalogs_) {
-    if (key.second == mountPoint && stored.identity == identity &&
+    if (key.second == mountPoint && !stored.identity.empty() &&
         !catalog::HasBeenIn(catalog, stored)) {
       stored.identity.clear();
       unsaved_.insert(key);

@@ -29,9 +29,10 @@ public:
 
   void Store(const std::string& master, const std::string& mountPoint, const Catalog& catalog);
 
-  /// `catalog` was found at `mountPoint`. Forgets for all masters what was announced there of the
-  /// same catalog in states that it was not in: it was replaced by a copy of an earlier time.
-  void ForgetOtherStates(const std::string& mountPoint, const db::DB& catalog);
+  /// `catalog` was found at `mountPoint`. Forgets for all masters what was announced there of other
+  /// catalogs, and of the same one in states that it was not in: it was replaced by a copy of an
+  /// earlier time.
+  void ForgetOthers(const std::string& mountPoint, const db::DB& catalog);
 
   /// A catalog of ours has this stamp, also if nobody merges it.
   void StoreStamp(std::time_t stamp);
