@@ -1066,6 +1066,41 @@ TEST_F(IndexerAndDaemonTest, DisksThatWereSwappedTwiceAreMergedFromTheBeginning)
   EXPECT_THAT(AwaitMerged(disk, {"second.jpg"}), IsEmpty());
 }
 
+TEST_F(IndexerAndDaemonTest, AMasterFromABackupGetsTheRowsOfTheDisksThatAreThere) {
+  const std::string master = "/shares/Big";
+  const std::string disk = "/shares/Disk";
+  const auto copy = [](const std::string& from, const std::string& to) {
+    for (const auto& entry : fs::directory_iterator(from)) {
+      fs::copy(entry, to + "/" + entry.path().filename().string(), fs::copy_options::recursive);
+    }
+  };
+  {
+    const PluggedFolder first("/tmp/first", disk);
+    Write(disk + "/first.jpg");
+    Start();
+    ASSERT_THAT(AwaitMerged(disk, {"first.jpg"}), IsEmpty());
+    ASSERT_TRUE(AwaitRemembered());
+    Stop();
+  }
+  fs::create_directory("/tmp/backup");
+  copy(master, "/tmp/backup");
+  const PluggedFolder second("/tmp/second", disk);
+  Write(disk + "/second.jpg");
+  Start();
+  ASSERT_THAT(AwaitMerged(disk, {"second.jpg"}), IsEmpty());
+  Write(master + "/new.txt");
+  ASSERT_THAT(AwaitCatalog(master), IsEmpty());
+  ASSERT_TRUE(AwaitAllRemembered(master));
+  ASSERT_TRUE(AwaitAllRemembered(disk));
+  Stop();
+  for (const auto& entry : fs::directory_iterator(master)) {
+    fs::remove_all(entry);
+  }
+  copy("/tmp/backup", master);
+  Start();
+  EXPECT_THAT(AwaitMerged(disk, {"second.jpg"}), IsEmpty());
+}
+
 TEST_F(IndexerAndDaemonTest, ACatalogFromABackupIsMergedFromTheBeginning) {
   const Volume volume("Disk", "64m");
   Write(volume.Path() + "/a.jpg");
