@@ -26,6 +26,7 @@
 #include <unistd.h>
 
 #include <array>
+#include <cerrno>
 #include <chrono>
 #include <csignal>
 #include <ctime>
@@ -34,6 +35,8 @@
 #include <iterator>
 #include <random>
 #include <string>
+#include <system_error>
+#include <utility>
 #include <vector>
 
 namespace orva::test {
@@ -684,6 +687,28 @@ TEST_F(IndexerTest, AReadOnlyVolumeIsIndexedWhenItBecomesWritable) {
   EXPECT_EQ(LogLines("read-only").size(), 1U);
 }
 
+TEST_F(IndexerTest, ACatalogThatWasDamagedTwiceInARowIsMadeAgainAtTheNextRetry) {
+  const Volume volume("A", "64m");
+  Write(volume.Path() + "/a.jpg");
+  indexer::Volume indexed(volume.Path() + "/", catalog::VolumeRoot::Kind::Mount);
+  const auto work = [&indexed] {
+    indexed.Work([] {}, [](const db::DB&) {}, std::time(nullptr));
+    return std::string(indexed.Status().state);
+  };
+  const auto damage = [&volume] { Write(CatalogOf(volume.Path()), std::string(100'000, 'x')); };
+  damage();
+  EXPECT_EQ(work(), "walking");
+  damage();
+  EXPECT_EQ(work(), "unusable");
+  EXPECT_GT(indexed.NextWork(), indexer::Clock::now() + std::chrono::seconds(30));
+  damage();
+  EXPECT_EQ(work(), "unusable");
+  work();
+  EXPECT_TRUE(indexed.IsWalked());
+  EXPECT_NE(std::string(indexed.Status().state), "unusable");
+  EXPECT_EQ(LogLines("renamed").size(), 2U);
+}
+
 TEST_F(IndexerTest, AFullVolumeIsIndexedWhenThereIsSpace) {
   Volume volume("A", "1m");
   Write(volume.Path() + "/a.jpg");
@@ -866,6 +891,29 @@ TEST(Locator, AFileOfAnotherUserNamesNoMaster) {
   EXPECT_EQ(indexer::Locator::Master(), std::nullopt);
 }
 
+/// A folder that is mounted at `mountPoint` while the object lives. It is created if it is missing,
+/// and stays.
+class PluggedFolder {
+public:
+  PluggedFolder(const std::string& folder, std::string mountPoint)
+      : mountPoint_(std::move(mountPoint)) {
+    fs::create_directories(folder);
+    fs::create_directories(mountPoint_);
+    if (mount(folder.c_str(), mountPoint_.c_str(), nullptr, MS_BIND, nullptr) != 0) {
+      throw std::system_error(errno, std::generic_category(), mountPoint_);
+    }
+  }
+  PluggedFolder(const PluggedFolder&) = delete;
+  PluggedFolder& operator=(const PluggedFolder&) = delete;
+  ~PluggedFolder() {
+    umount2(mountPoint_.c_str(), MNT_DETACH);
+    rmdir(mountPoint_.c_str());
+  }
+
+private:
+  const std::string mountPoint_;
+};
+
 /// The indexer and the daemon, with a master volume that keeps its merged database. It is plugged
 /// before the volumes of the tests, in the order of their names.
 class IndexerAndDaemonTest : public IndexerTest {
@@ -880,12 +928,20 @@ protected:
 
   void StartServiceAndDaemon() {
     StartService();
+    StartDaemon();
+  }
+
+  void StartDaemon() {
     daemon_ = std::make_unique<DaemonProcess>("/tmp/daemon", "/tmp/daemon.out");
   }
 
   /// Ends all programs, the service first.
   void Stop() {
     StopIndexer();
+    StopServiceAndDaemon();
+  }
+
+  void StopServiceAndDaemon() {
     Service().Signal(SIGTERM);
     Service().WaitForEnd();
     StopDaemon();
@@ -972,6 +1028,77 @@ TEST_F(IndexerAndDaemonTest, DisksThatWereSwappedWhileNothingRanAreMergedFromThe
   Start();
   EXPECT_THAT(AwaitMerged(second.Path(), {"second.jpg"}), IsEmpty());
   EXPECT_THAT(Events(second.Path()), Contains("Purged"));
+}
+
+TEST_F(IndexerAndDaemonTest, DisksThatWereSwappedTwiceAreMergedFromTheBeginning) {
+  const std::string disk = "/shares/Disk";
+  {
+    const PluggedFolder first("/tmp/first", disk);
+    Write(disk + "/first.jpg");
+    Start();
+    ASSERT_THAT(AwaitMerged(disk, {"first.jpg"}), IsEmpty());
+    Stop();
+  }
+  {
+    const PluggedFolder second("/tmp/second", disk);
+    Write(disk + "/second.jpg");
+    Start();
+    ASSERT_THAT(AwaitMerged(disk, {"second.jpg"}), IsEmpty());
+    ASSERT_TRUE(AwaitAllRemembered(disk));
+    Stop();
+  }
+  {
+    const PluggedFolder first("/tmp/first", disk);
+    Write(disk + "/new.jpg");
+    // The daemon starts so late that nothing can be announced as purged.
+    StartService();
+    StartIndexer();
+    ASSERT_THAT(AwaitCatalog(disk), IsEmpty());
+    FinishPhotos(disk);
+    ASSERT_TRUE(Await([&] { return Count(Events(disk), "End") > 0; }));
+    StopIndexer();
+    StartDaemon();
+    ASSERT_TRUE(Await([&] { return Count(Merged(), "new.jpg|" + disk + "/") == 1; }));
+    StopServiceAndDaemon();
+  }
+  const PluggedFolder second("/tmp/second", disk);
+  Start();
+  EXPECT_THAT(AwaitMerged(disk, {"second.jpg"}), IsEmpty());
+}
+
+TEST_F(IndexerAndDaemonTest, AMasterFromABackupGetsTheRowsOfTheDisksThatAreThere) {
+  const std::string master = "/shares/Big";
+  const std::string disk = "/shares/Disk";
+  const auto copy = [](const std::string& from, const std::string& to) {
+    for (const auto& entry : fs::directory_iterator(from)) {
+      fs::copy(entry, to + "/" + entry.path().filename().string(), fs::copy_options::recursive);
+    }
+  };
+  {
+    const PluggedFolder first("/tmp/first", disk);
+    Write(disk + "/first.jpg");
+    Start();
+    ASSERT_THAT(AwaitMerged(disk, {"first.jpg"}), IsEmpty());
+    ASSERT_TRUE(AwaitRemembered());
+    Stop();
+  }
+  fs::create_directory("/tmp/backup");
+  copy(master, "/tmp/backup");
+  const PluggedFolder second("/tmp/second", disk);
+  Write(disk + "/second.jpg");
+  Start();
+  ASSERT_THAT(AwaitMerged(disk, {"second.jpg"}), IsEmpty());
+  Write(master + "/new.txt");
+  ASSERT_THAT(AwaitCatalog(master), IsEmpty());
+  ASSERT_TRUE(AwaitAllRemembered(master));
+  ASSERT_TRUE(AwaitAllRemembered(disk));
+  Stop();
+  for (const auto& entry : fs::directory_iterator(master)) {
+    fs::remove_all(entry);
+  }
+  copy("/tmp/backup", master);
+  Start();
+  EXPECT_THAT(AwaitMerged(disk, {"second.jpg"}), IsEmpty());
 }
 
 TEST_F(IndexerAndDaemonTest, ACatalogFromABackupIsMergedFromTheBeginning) {

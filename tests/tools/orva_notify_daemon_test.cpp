@@ -166,6 +166,107 @@ TEST_F(OrvaNotifyDaemon, ADirectoryThatIsNoVolumeAfterARestartLeavesTheMergedDat
   unsetenv("STATE_DIRECTORY");
 }
 
+/// A volume that stays, and one that is removed.
+class OrvaNotifyRemoval : public OrvaNotifyDaemon {
+protected:
+  OrvaNotifyRemoval() {
+    setenv("STATE_DIRECTORY", "/tmp/orva_notify_state", 1);
+    fs::create_directories("/tmp/orva_notify_state");
+    Catalog onA(a_);
+    Catalog onB(b_);
+    AddPhotos(onA, 10);
+    AddPhotos(onB, 10);
+  }
+  ~OrvaNotifyRemoval() override {
+    unsetenv("STATE_DIRECTORY");
+    fs::remove_all("/tmp/orva_notify_state");
+  }
+
+  /// Starts the programs, and merges both volumes.
+  void Start() {
+    Serve({"--watch"});
+    StartDaemon();
+    Handle(Scanned(a_.Path()));
+    Handle(End(a_.Path()));
+    Handle(End(b_.Path()));
+    ASSERT_EQ(FilesOf(b_).size(), 10U);
+  }
+
+  void StopService() {
+    service_->Signal(SIGTERM);
+    EXPECT_EQ(service_->WaitForEnd(), 0);
+    EXPECT_EQ(daemon_->AwaitEnd(), Exited(0));
+  }
+
+  /// Expects that only the photos of the volume that stays are merged.
+  void ExpectRemoval() {
+    Handle();
+    EXPECT_EQ(FilesOf(b_).size(), 0U);
+    EXPECT_EQ(FilesOf(a_).size(), 10U);
+  }
+
+  const Volume a_{"A", "150g"};
+  Volume b_{"B", "1g"};
+};
+
+TEST_F(OrvaNotifyRemoval, WhileNothingRunsIsAnnouncedAfterTheStart) {
+  Start();
+  StopService();
+  b_.Unmount();
+  Serve({"--watch"});
+  StartDaemon();
+  Handle(Scanned(a_.Path()));
+  ExpectRemoval();
+}
+
+TEST_F(OrvaNotifyRemoval, WhileTheDaemonDoesNotRunIsAnnouncedAfterItsStart) {
+  Start();
+  KillDaemon();
+  service_->ReadLineWith("gone");
+  b_.Unmount();
+  EXPECT_EQ(service_->ReadLineWith("seen"), "unplugged seen: /shares/B");
+  StartDaemon();
+  ExpectRemoval();
+}
+
+TEST_F(OrvaNotifyRemoval, WhileTheDaemonDoesNotRunIsAnnouncedAfterTheStartOfBoth) {
+  Start();
+  KillDaemon();
+  service_->ReadLineWith("gone");
+  b_.Unmount();
+  EXPECT_EQ(service_->ReadLineWith("seen"), "unplugged seen: /shares/B");
+  service_->Signal(SIGKILL);
+  service_->WaitForEnd();
+  Serve({"--watch"});
+  StartDaemon();
+  Handle(Scanned(a_.Path()));
+  ExpectRemoval();
+}
+
+TEST_F(OrvaNotifyRemoval, ThatTheDaemonDidNotHandleIsAnnouncedToTheNextOne) {
+  Start();
+  kill(daemon_->Pid(), SIGSTOP);
+  b_.Unmount();
+  EXPECT_EQ(service_->ReadLineWith("Unplugged"), "sent to 1 client: " + Unplugged(b_.Path()));
+  KillDaemon();
+  StartDaemon();
+  ExpectRemoval();
+}
+
+TEST_F(OrvaNotifyRemoval, OfADiskThatIsBackIsNotAnnounced) {
+  Start();
+  KillDaemon();
+  service_->ReadLineWith("gone");
+  b_.Unmount();
+  EXPECT_EQ(service_->ReadLineWith("seen"), "unplugged seen: /shares/B");
+  const Volume back("B", "1g");
+  EXPECT_EQ(service_->ReadLineWith("seen"), "plugged seen: /shares/B");
+  StartDaemon();
+  Handle();
+  EXPECT_EQ(FilesOf(b_).size(), 10U);
+  EXPECT_EQ(FilesOf(a_).size(), 10U);
+}
+
 TEST_F(OrvaNotifyDaemon, IsCompleteAgainAfterItWasKilledWhileItIsTold) {
   Serve({"--watch"});
   const Volume a("A", "150g");

@@ -36,11 +36,13 @@ void RememberedCatalogs::Store(const std::string& master, const std::string& mou
 }
 
 /// The stamps stay: they say how late it may be.
-void RememberedCatalogs::ForgetOtherStates(const std::string& mountPoint, const db::DB& catalog) {
+void RememberedCatalogs::ForgetOthers(const std::string& mountPoint, const db::DB& catalog) {
   const std::string identity = catalog::Identity(catalog);
+  const bool isMasterReplaced = IsMasterReplaced(identity, catalog);
   for (auto& [key, stored] : catalogs_) {
-    if (key.second == mountPoint && stored.identity == identity &&
-        !catalog::HasBeenIn(catalog, stored)) {
+    const auto& [master, place] = key;
+    const bool isOther = place == mountPoint && !catalog::HasBeenIn(catalog, stored);
+    if (!stored.identity.empty() && (isOther || (isMasterReplaced && master == identity))) {
       stored.identity.clear();
       unsaved_.insert(key);
     }
@@ -48,6 +50,14 @@ void RememberedCatalogs::ForgetOtherStates(const std::string& mountPoint, const 
   if (!unsaved_.empty()) {
     Save();
   }
+}
+
+bool RememberedCatalogs::IsMasterReplaced(const std::string& identity,
+                                          const db::DB& catalog) const {
+  return std::ranges::any_of(catalogs_, [&](const auto& entry) {
+    return entry.first.first == identity && entry.second.identity == identity &&
+           !catalog::HasBeenIn(catalog, entry.second);
+  });
 }
 
 void RememberedCatalogs::StoreStamp(std::time_t stamp) {

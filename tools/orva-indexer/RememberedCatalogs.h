@@ -29,9 +29,11 @@ public:
 
   void Store(const std::string& master, const std::string& mountPoint, const Catalog& catalog);
 
-  /// `catalog` was found at `mountPoint`. Forgets for all masters what was announced there of the
-  /// same catalog in states that it was not in: it was replaced by a copy of an earlier time.
-  void ForgetOtherStates(const std::string& mountPoint, const db::DB& catalog);
+  /// `catalog` was found at `mountPoint`. Forgets for all masters what was announced there of other
+  /// catalogs, and of the same one in states that it was not in: it was replaced by a copy of an
+  /// earlier time. The catalog of a master may be such a copy, and thus its merged database: then
+  /// all that was announced for this master is forgotten.
+  void ForgetOthers(const std::string& mountPoint, const db::DB& catalog);
 
   /// A catalog of ours has this stamp, also if nobody merges it.
   void StoreStamp(std::time_t stamp);
@@ -42,6 +44,7 @@ public:
 private:
   using Key = std::pair<std::string, std::string>; ///< master and mount point
 
+  bool IsMasterReplaced(const std::string& identity, const db::DB& catalog) const;
   void Open();
   void Read(const std::string& path);
   void Save();

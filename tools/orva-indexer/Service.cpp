@@ -279,7 +279,7 @@ void Service::WorkOnNext() {
   lastWorked_[wasWalk_ ? 1 : 0] = mountPoint;
   working_ = &known;
   const auto found = [this](const db::DB& catalog) {
-    remembered_.ForgetOtherStates(working_->volume.MountPoint(), catalog);
+    remembered_.ForgetOthers(working_->volume.MountPoint(), catalog);
   };
   const Volume::Result result = known.volume.Work([this] { Pulse(); }, found, LatestStamp(known));
   working_ = nullptr;

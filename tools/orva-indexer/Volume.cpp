@@ -341,6 +341,7 @@ Volume::Result Volume::WorkOn(const VolumeRoot& root, const std::function<void()
     StartAgain();
   }
   if (std::exchange(isRetry_, false)) {
+    wasJustSetAside_ = false;
     StartAgain();
   }
   try {

@@ -100,6 +100,7 @@ void Client::DiscardInput() {
 
 void Client::BecomeObserver() {
   isObserver_ = true;
+  held_.reset();
   for (auto& entry : queue_) {
     entry.handling.reset();
   }

@@ -7,6 +7,7 @@
 #include <deque>
 #include <memory>
 #include <string>
+#include <utility>
 
 namespace orva::notify {
 
@@ -50,6 +51,9 @@ public:
   /// before the mark, SendQueued() counts it in `handling`. Not for observers.
   void QueueMark(const std::shared_ptr<Handling>& handling);
 
+  /// Holds a reference until the client has disconnected or is an observer. Replaces the last one.
+  void Hold(std::shared_ptr<const Handling> handling) { held_ = std::move(handling); }
+
   /// Sends as much of the queue as the client's buffer takes, up to a mark that is not reached.
   void SendQueued();
 
@@ -83,6 +87,7 @@ private:
   const unsigned number_;
   bool isObserver_ = false;
   bool reportsReading_ = false;
+  std::shared_ptr<const Handling> held_;
   std::deque<Entry> queue_;
   std::size_t sentOfFirst_ = 0;
   std::size_t queuedBytes_ = 0;

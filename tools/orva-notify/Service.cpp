@@ -122,6 +122,7 @@ void Service::FollowVolumes() {
   }
   if (plugged != changes.begin()) {
     SendEnds();
+    NoteUnplugged();
   }
   for (auto change = plugged; change != changes.end(); ++change) {
     Print("plugged seen: " + Printable(change->mountPoint));
@@ -134,16 +135,12 @@ void Service::AcceptClients() {
     clients_.push_back(std::make_unique<Client>(std::move(connection), ++lastNumber_));
     Client& client = *clients_.back();
     Print(FormatString("client %u connected", client.Number()));
-    bool isScanned = false;
     for (const auto& announcement : memory_.Replay()) {
-      isScanned = isScanned || announcement.event == Event::Scanned;
       const std::string message = Compose(announcement);
       Queue(client, std::make_shared<const std::string>(Frame(message)));
       Print(FormatString("sent to client %u: %s", client.Number(), message.c_str()));
     }
-    if (isScanned) {
-      SendGone();
-    }
+    SendGone();
   }
 }
 
@@ -182,14 +179,13 @@ void Service::Perform(ControlConnection& request) {
     request.Answer(DropAll());
     return;
   }
-  const std::size_t count = SendToAll(received.message);
-  if (const auto announcement = received.raw ? std::nullopt : Recognize(received.message)) {
-    Remember(*announcement);
-    if (announcement->event == Event::Unplugged) {
-      SendEnds();
-    } else if (announcement->event != Event::Plugged) {
-      SendGone();
-    }
+  const auto announcement = received.raw ? std::nullopt : Recognize(received.message);
+  const std::size_t count = announcement ? Announce(*announcement) : SendToAll(received.message);
+  if (announcement && announcement->event == Event::Unplugged) {
+    SendEnds();
+    NoteUnplugged();
+  } else if (announcement && announcement->event != Event::Plugged) {
+    SendGone();
   }
   if (received.handled) {
     request.AwaitHandling(count, QueueMarks());
@@ -203,45 +199,85 @@ std::size_t Service::CountClients() const {
       std::ranges::count_if(clients_, [](const auto& client) { return !client->IsObserver(); }));
 }
 
-void Service::Announce(const Announcement& announcement) {
-  SendToAll(Compose(announcement));
+std::size_t Service::Announce(const Announcement& announcement) {
   Remember(announcement);
+  return SendToAll(Compose(announcement));
 }
 
 void Service::Remember(const Announcement& announcement) {
-  if (!memory_.Remember(announcement)) {
+  const bool isRemembered = memory_.Remember(announcement);
+  if (!isRemembered) {
     Print(FormatString("not remembered, %zu volumes or %zu bytes of mount points are the limit: ",
                        VolumeMemory::MAXIMUM_VOLUMES, VolumeMemory::MAXIMUM_BYTES) +
           Printable(announcement.mountPoint));
   }
-  const bool isPlugged = announcement.event == Event::Plugged;
-  if (isPlugged && announcement.kind == VolumeKind::Directory) {
-    announced_.Add(announcement.mountPoint);
-  } else if (isPlugged || announcement.event == Event::Unplugged) {
-    announced_.Remove(announcement.mountPoint);
+  if (announcement.event == Event::Unplugged) {
+    announced_.Unplug(announcement.mountPoint);
+  } else if (announcement.event == Event::Plugged && isRemembered) {
+    announced_.Plug(announcement.mountPoint);
+    for (Removal& removal : removals_) {
+      std::erase_if(removal.mountPoints, [this](const std::string& mountPoint) {
+        return !announced_.Gone().contains(mountPoint);
+      });
+    }
   }
 }
 
 // The daemon removes the rows of an unplugged volume only after another one was scanned.
 void Service::SendGone() {
-  if (announced_.Gone().empty() || goneHandling_ || CountClients() == 0) {
+  auto gone = UnsentGone();
+  if (gone.empty() || !CanRemove()) {
     return;
   }
-  for (const std::string& path : announced_.Gone()) {
-    SendToAll(Compose(Event::Unplugged, path));
+  for (const std::string& mountPoint : gone) {
+    SendToAll(Compose(Event::Unplugged, mountPoint));
   }
   SendEnds();
-  goneHandling_ = QueueMarks();
+  removals_.push_back({.mountPoints = std::move(gone), .handling = QueueMarks(), .isMarked = true});
+}
+
+bool Service::CanRemove() const {
+  return CountClients() > 0 && memory_.HasScanned();
+}
+
+// The clients have just been told of them. No mark follows, which would be one more message.
+void Service::NoteUnplugged() {
+  auto gone = UnsentGone();
+  if (gone.empty() || !CanRemove()) {
+    return;
+  }
+  auto removal = std::ranges::find(removals_, false, &Removal::isMarked);
+  if (removal == removals_.end()) {
+    removal = removals_.insert(
+        removal, {.mountPoints = {}, .handling = std::make_shared<Handling>(), .isMarked = false});
+  }
+  removal->mountPoints.merge(gone);
+  for (const auto& client : clients_) {
+    if (!client->IsObserver()) {
+      client->Hold(removal->handling);
+    }
+  }
+}
+
+std::set<std::string> Service::UnsentGone() const {
+  std::set<std::string> gone = announced_.Gone();
+  for (const Removal& removal : removals_) {
+    for (const std::string& mountPoint : removal.mountPoints) {
+      gone.erase(mountPoint);
+    }
+  }
+  return gone;
 }
 
 void Service::ForgetGone() {
-  if (!goneHandling_ || goneHandling_.use_count() > 1) {
-    return;
-  }
-  if (std::exchange(goneHandling_, nullptr)->handled > 0) {
-    while (!announced_.Gone().empty()) {
-      announced_.Remove(std::string(*announced_.Gone().begin()));
+  for (const Removal& removal : removals_) {
+    if (removal.handling->handled > 0) {
+      announced_.Forget(removal.mountPoints);
     }
+  }
+  const auto ended = [](const Removal& removal) { return removal.handling.use_count() == 1; };
+  if (std::erase_if(removals_, ended) > 0) {
+    SendGone();
   }
 }
 

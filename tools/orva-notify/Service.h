@@ -1,6 +1,6 @@
 #pragma once
 
-#include "orva-notify/AnnouncedDirectories.h"
+#include "orva-notify/AnnouncedVolumes.h"
 #include "orva-notify/Client.h"
 #include "orva-notify/Control.h"
 #include "orva-notify/ListeningSocket.h"
@@ -10,6 +10,7 @@
 
 #include <cstddef>
 #include <memory>
+#include <set>
 #include <string>
 #include <vector>
 
@@ -22,7 +23,7 @@ public:
   /// Listens on `address` for clients and on ControlAddress(address) for requests. From now on,
   /// SIGINT and SIGTERM stop the service. With `watch`, mounts and unmounts directly below /shares
   /// are announced, and, in any case, the changes of `directories`; see VolumeWatch.
-  /// `stateDirectory` is what AnnouncedDirectories keeps; empty for none. Throws util::Exception
+  /// `stateDirectory` is what AnnouncedVolumes keeps; empty for none. Throws util::Exception
   /// and std::filesystem::filesystem_error.
   Service(const std::string& address, bool watch, const std::vector<std::string>& directories,
           const std::string& stateDirectory);
@@ -31,6 +32,15 @@ public:
   void Run();
 
 private:
+  /// Volumes that are gone, as they were announced to the clients. If all of these disconnect
+  /// before one has handled it, the next one gets it again.
+  struct Removal {
+    std::set<std::string> mountPoints;
+    std::shared_ptr<const Handling> handling;
+    /// Else the clients hold `handling`, and it is not known whether they have handled it.
+    bool isMarked;
+  };
+
   bool IsAskedToStop();
   void Wait();
   void ReadRequests();
@@ -41,11 +51,14 @@ private:
 
   std::size_t CountClients() const;
   void Perform(ControlConnection& request);
-  void Announce(const Announcement& announcement);
+  std::size_t Announce(const Announcement& announcement);
   void Remember(const Announcement& announcement);
   void SendEnds();
   void SendGone();
+  bool CanRemove() const;
+  void NoteUnplugged();
   void ForgetGone();
+  std::set<std::string> UnsentGone() const;
   std::shared_ptr<const Handling> QueueMarks();
   std::size_t SendToAll(const std::string& message);
   std::size_t DropAll();
@@ -60,9 +73,9 @@ private:
   ListeningSocket notification_;
   VolumeWatch volumes_;
   VolumeMemory memory_;
-  AnnouncedDirectories announced_;
-  std::shared_ptr<const Handling> goneHandling_; ///< of SendGone
-  util::FileDescriptor readers_; ///< of epoll: the clients that are waited for have read something
+  AnnouncedVolumes announced_;
+  std::vector<Removal> removals_; ///< that no client has handled yet
+  util::FileDescriptor readers_;  ///< of epoll: the clients that are waited for have read something
   std::vector<std::unique_ptr<Client>> clients_;
   std::vector<std::unique_ptr<ControlConnection>> requests_;
   unsigned lastNumber_ = 0;

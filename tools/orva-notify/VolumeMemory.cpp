@@ -70,6 +70,10 @@ std::vector<Announcement> VolumeMemory::Ends() const {
   return Select(Event::End, &Volume::ended);
 }
 
+bool VolumeMemory::HasScanned() const {
+  return std::ranges::any_of(volumes_, &Volume::scanned);
+}
+
 std::vector<VolumeMemory::Volume>::iterator VolumeMemory::Find(const std::string& mountPoint) {
   return std::ranges::find_if(
       volumes_, [&](const Volume& volume) { return IsSame(volume.mountPoint, mountPoint); });

@@ -27,6 +27,9 @@ public:
   /// End for each volume that has ended: a new master is filled with them.
   std::vector<Announcement> Ends() const;
 
+  /// Whether a volume was scanned. The daemon removes rows only then.
+  bool HasScanned() const;
+
 private:
   struct Volume {
     std::string mountPoint; ///< as it was first announced
