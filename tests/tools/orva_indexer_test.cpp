@@ -34,6 +34,7 @@
 #include <iterator>
 #include <random>
 #include <string>
+#include <utility>
 #include <vector>
 
 namespace orva::test {
@@ -218,6 +219,67 @@ TEST_F(IndexerTest, AChangeIsAnnouncedOnce) {
   EXPECT_THAT(Query(volume.Path(), "SELECT path FROM Files ORDER BY path"),
               ElementsAre("Pictures/a.jpg", "Pictures/b.jpg"));
   EXPECT_EQ(Count(Events(volume.Path()), "Scanned"), 1);
+}
+
+/// The work on a volume in the test's own process, without the other programs.
+class VolumeWorkTest : public IndexerTest {
+protected:
+  VolumeWorkTest() {
+    EXPECT_TRUE(WorkUntil([this] { return volume_.IsWalked(); }));
+  }
+
+  std::string At(const std::string& path) const { return disk_.Path() + '/' + path; }
+
+  /// Works as the service does until `condition` holds. False after the deadline.
+  bool WorkUntil(const std::function<bool()>& condition) {
+    return Await([&] {
+      volume_.ReadEvents();
+      if (volume_.NextWork() <= indexer::Clock::now()) {
+        const auto result = volume_.Work([] {}, [](const db::DB&) {}, std::time(nullptr));
+        changes_ += result.hasChanged ? 1 : 0;
+      }
+      return condition();
+    });
+  }
+
+  /// Works until a query of the catalog has this result.
+  bool WorkUntilFound(const std::string& sql, const Lines& rows) {
+    return WorkUntil([&] { return Query(disk_.Path(), sql) == rows; });
+  }
+
+  indexer::Volume& TheVolume() { return volume_; }
+  test::Volume& Disk() { return disk_; }
+
+  /// Pieces of work after which the volume is announced, since the last call.
+  int TakeChanges() { return std::exchange(changes_, 0); }
+
+private:
+  test::Volume disk_{"A", "64m"};
+  indexer::Volume volume_{disk_.Path() + '/', catalog::VolumeRoot::Kind::Mount};
+  int changes_ = 0;
+};
+
+TEST_F(VolumeWorkTest, OnlyChangesOfPhotosAndFoldersAreAnnounced) {
+  constexpr char SIZES[] = "SELECT path, size FROM Files WHERE isDeleted = 0 ORDER BY path";
+  Write(At("Notes/a.txt"), "1");
+  ASSERT_TRUE(WorkUntilFound(SIZES, {"Notes/a.txt|1"}));
+  EXPECT_GT(TakeChanges(), 0); // of the folder
+  Write(At("Notes/a.txt"), "12");
+  ASSERT_TRUE(WorkUntilFound(SIZES, {"Notes/a.txt|2"}));
+  Write(At("Notes/b.txt"), "1");
+  ASSERT_TRUE(WorkUntilFound(SIZES, {"Notes/a.txt|2", "Notes/b.txt|1"}));
+  fs::remove(At("Notes/a.txt"));
+  ASSERT_TRUE(WorkUntilFound(SIZES, {"Notes/b.txt|1"}));
+  EXPECT_EQ(TakeChanges(), 0);
+  Write(At("Notes/c.jpg"), "1");
+  ASSERT_TRUE(WorkUntilFound(SIZES, {"Notes/b.txt|1", "Notes/c.jpg|1"}));
+  EXPECT_GT(TakeChanges(), 0);
+  fs::remove(At("Notes/c.jpg"));
+  ASSERT_TRUE(WorkUntilFound(SIZES, {"Notes/b.txt|1"}));
+  EXPECT_GT(TakeChanges(), 0);
+  fs::remove_all(At("Notes"));
+  ASSERT_TRUE(WorkUntilFound(SIZES, {}));
+  EXPECT_GT(TakeChanges(), 0);
 }
 
 TEST_F(IndexerTest, PhotosThatArriveOneByOneTakeFewStamps) {

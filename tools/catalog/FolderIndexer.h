@@ -105,6 +105,10 @@ public:
   /// Whether a row was changed.
   bool HasChanged() const noexcept { return stamp_ != 0; }
 
+  /// Whether photos or folders were changed. Merged databases and the transcoder read nothing else,
+  /// and of a folder only whether it is there.
+  bool HasVisibleChanges() const noexcept { return hasVisibleChanges_; }
+
 private:
   /// A file or folder found in a folder.
   struct Entry {
@@ -176,6 +180,7 @@ private:
   const std::time_t now_;
   const Hooks hooks_;
   std::time_t stamp_ = 0; ///< 0 until the first change
+  bool hasVisibleChanges_ = false;
   long long nextFolderId_ = 1;
   long long nextFileId_ = 1;
   std::vector<std::string> leftAlone_; ///< paths, without a trailing separator

@@ -373,8 +373,8 @@ Volume::Result Volume::WorkOn(const VolumeRoot& root, const std::function<void()
     lockedSince_.reset();
     isLockLogged_ = false;
     state_ = std::move(state);
-    result.hasChanged = indexer.HasChanged();
-    if (result.hasChanged) {
+    result.hasChanged = indexer.HasVisibleChanges();
+    if (indexer.HasChanged()) {
       const auto pause = catalog::PauseAfterStamp(state_.newestStamp, std::time(nullptr));
       notBefore_ = std::max(begin + MOST_WORK, Clock::now() + pause);
     }

@@ -40,7 +40,7 @@ public:
   /// What a piece of work has changed.
   struct Result {
     bool isGone = false;      ///< the volume is not there any more
-    bool hasChanged = false;  ///< rows were committed
+    bool hasChanged = false;  ///< changes were committed that other programs can see
     bool isFirstWalk = false; ///< the first whole walk of this catalog has ended
   };
 
