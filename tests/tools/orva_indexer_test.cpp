@@ -761,6 +761,30 @@ TEST_F(IndexerTest, AFullVolumeIsIndexedWhenThereIsSpace) {
   EXPECT_EQ(LogLines(": full").size(), 1U);
 }
 
+TEST_F(VolumeWorkTest, AFullVolumeIsWalkedWhenSomeSpaceHasBecomeFree) {
+  Write(At("a.jpg"));
+  ASSERT_THAT(WorkUntilFound("SELECT path FROM Files", {"a.jpg"}), true);
+  for (int i = 0; i < 2000; ++i) { // more rows than there is space for
+    Write(At("Pictures/" + std::to_string(i) + ".jpg"), "");
+  }
+  std::ofstream filler(At(".orva/filler"));
+  while (filler << std::string(4096, 'x') << std::flush) {
+  }
+  filler.close();
+  ASSERT_TRUE(WorkUntil([&] { return TheVolume().Status().state == std::string("read-only"); }))
+      << testing::PrintToString(LogLines()) << TheVolume().Status().state;
+  for (int check = 0; check < 2; ++check) {
+    const auto next = TheVolume().NextWork();
+    EXPECT_LT(next, indexer::Clock::now() + std::chrono::seconds(5));
+    ASSERT_TRUE(WorkUntil([&] { return TheVolume().NextWork() > next; }));
+    EXPECT_EQ(TheVolume().Status().state, std::string("read-only"));
+  }
+  fs::remove(At(".orva/filler"));
+  EXPECT_TRUE(WorkUntilFound("SELECT count(*) FROM Files", {"2001"}));
+  EXPECT_EQ(LogLines(": full").size(), 1U);
+  EXPECT_EQ(LogLines("indexed again").size(), 1U);
+}
+
 // --- Renditions --------------------------------------------------------------------------------
 
 /// The indexer and a volume with a photo whose rendition is finished.

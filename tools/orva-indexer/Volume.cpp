@@ -64,6 +64,7 @@ constexpr Clock::duration LONGEST_BUSY_PAUSE = 8s;
 constexpr auto LONGEST_LOCK = 5s;
 
 constexpr auto RETRY = 60s;
+constexpr auto SPACE_CHECK = 2s; ///< of a full volume
 constexpr auto SHORT_RETRY = 1s;
 
 /// A walk on a timer takes at most a twentieth of the time.
@@ -203,6 +204,7 @@ void Volume::CheckLater(const std::string& folder, Clock::time_point when) {
 void Volume::HandleMounts(const std::set<std::string>& mountPoints) {
   if (trouble_ != Trouble::None) {
     notBefore_ = {};
+    retryAt_ = {};
   }
   std::set<std::string> mounts;
   for (auto mount = mountPoints.upper_bound(path_ + '/');
@@ -290,6 +292,9 @@ Volume::Result Volume::Work(const std::function<void()>& pulse, const Found& fou
   if (isUnmounted_) {
     return {.isGone = true};
   }
+  if (IsStillFull(*root)) {
+    return {};
+  }
   try {
     const Result result = WorkOn(*root, pulse, found, latest);
     if (!ready_.empty()) {
@@ -312,6 +317,8 @@ Volume::Result Volume::Work(const std::function<void()>& pulse, const Found& fou
       break;
     case CatalogProblem::Full:
       Fail(Trouble::ReadOnly, "full; its catalog is not updated until this changes");
+      spaceWhenFull_ = root->FreeSpace();
+      notBefore_ = Clock::now() + SPACE_CHECK;
       break;
     default:
       if (!root->IsInPlace()) {
@@ -557,7 +564,19 @@ void Volume::Fail(Trouble trouble, const std::string& reason, bool isMedium) {
   StartAgain();
   watches_.reset();
   isRetry_ = true;
-  notBefore_ = Clock::now() + RETRY;
+  retryAt_ = Clock::now() + RETRY;
+  notBefore_ = retryAt_;
+}
+
+/// Whether no space has become free since the volume was found full.
+bool Volume::IsStillFull(const VolumeRoot& root) {
+  const auto now = Clock::now();
+  if (spaceWhenFull_ && now < retryAt_ && root.FreeSpace() <= *spaceWhenFull_) {
+    notBefore_ = std::min(now + SPACE_CHECK, retryAt_);
+    return true;
+  }
+  spaceWhenFull_.reset();
+  return false;
 }
 
 /// Another program has locked the catalog.

@@ -149,6 +149,7 @@ private:
   bool IsComplete(const Folder& folder, const std::string& name,
                   const catalog::FolderIndexer::FileState& state);
   void Fail(Trouble trouble, const std::string& reason, bool isMedium = false);
+  bool IsStillFull(const catalog::VolumeRoot& root);
   void Recover();
   void WaitForLock();
 
@@ -190,7 +191,9 @@ private:
   std::string unreadableExample_;
   long long files_ = 0; ///< on the volume, as far as known
   Trouble trouble_ = Trouble::None;
-  bool isRetry_ = false; ///< of a volume with trouble, which is not watched yet
+  Clock::time_point retryAt_{};            ///< of a volume with trouble
+  std::optional<long long> spaceWhenFull_; ///< bytes that were free; nothing if it is not full
+  bool isRetry_ = false;                   ///< of a volume with trouble, which is not watched yet
   bool wasJustSetAside_ = false;
 };
 
