@@ -32,6 +32,7 @@
 #include <fstream>
 #include <functional>
 #include <iterator>
+#include <optional>
 #include <random>
 #include <string>
 #include <utility>
@@ -224,8 +225,12 @@ TEST_F(IndexerTest, AChangeIsAnnouncedOnce) {
 /// The work on a volume in the test's own process, without the other programs.
 class VolumeWorkTest : public IndexerTest {
 protected:
-  VolumeWorkTest() {
-    EXPECT_TRUE(WorkUntil([this] { return volume_.IsWalked(); }));
+  VolumeWorkTest() { Restart(); }
+
+  /// Begins as after a start of the indexer.
+  void Restart() {
+    volume_.emplace(disk_.Path() + '/', catalog::VolumeRoot::Kind::Mount);
+    EXPECT_TRUE(WorkUntil([this] { return volume_->IsWalked(); }));
   }
 
   std::string At(const std::string& path) const { return disk_.Path() + '/' + path; }
@@ -233,9 +238,9 @@ protected:
   /// Works as the service does until `condition` holds. False after the deadline.
   bool WorkUntil(const std::function<bool()>& condition) {
     return Await([&] {
-      volume_.ReadEvents();
-      if (volume_.NextWork() <= indexer::Clock::now()) {
-        const auto result = volume_.Work([] {}, [](const db::DB&) {}, std::time(nullptr));
+      volume_->ReadEvents();
+      if (volume_->NextWork() <= indexer::Clock::now()) {
+        const auto result = volume_->Work([] {}, [](const db::DB&) {}, std::time(nullptr));
         changes_ += result.hasChanged ? 1 : 0;
       }
       return condition();
@@ -247,7 +252,7 @@ protected:
     return WorkUntil([&] { return Query(disk_.Path(), sql) == rows; });
   }
 
-  indexer::Volume& TheVolume() { return volume_; }
+  indexer::Volume& TheVolume() { return *volume_; }
   test::Volume& Disk() { return disk_; }
 
   /// Pieces of work after which the volume is announced, since the last call.
@@ -255,7 +260,7 @@ protected:
 
 private:
   test::Volume disk_{"A", "64m"};
-  indexer::Volume volume_{disk_.Path() + '/', catalog::VolumeRoot::Kind::Mount};
+  std::optional<indexer::Volume> volume_;
   int changes_ = 0;
 };
 
@@ -325,6 +330,36 @@ TEST_F(IndexerTest, AFileWaitsWhileItIsWrittenAndOthersDoNot) {
   EXPECT_TRUE(Await([&] {
     return Query(volume.Path(), "SELECT size FROM Files WHERE path = 'slow.jpg'") == Lines{"10"};
   }));
+}
+
+TEST_F(VolumeWorkTest, AFileThatIsTruncatedByItsNameIsEnteredSoon) {
+  constexpr char SIZE[] = "SELECT size FROM Files WHERE path = 'a.jpg'";
+  Write(At("a.jpg"), "whole");
+  ASSERT_TRUE(WorkUntilFound(SIZE, {"5"}));
+  ASSERT_EQ(truncate(At("a.jpg").c_str(), 3), 0);
+  EXPECT_TRUE(WorkUntilFound(SIZE, {"3"}));
+  // While another program writes it, it waits.
+  std::ofstream slow(At("a.jpg"), std::ios::app);
+  slow << "more" << std::flush;
+  Write(At("b.jpg"));
+  ASSERT_TRUE(WorkUntilFound("SELECT count(*) FROM Files", {"2"}));
+  EXPECT_EQ(Query(Disk().Path(), SIZE), Lines{"3"});
+  slow.close();
+  EXPECT_TRUE(WorkUntilFound(SIZE, {"7"}));
+}
+
+TEST_F(VolumeWorkTest, APhotoThatIsBeingWrittenWhenTheIndexerStartsWaits) {
+  constexpr char FILES[] = "SELECT path, size FROM Files ORDER BY path";
+  std::ofstream slow(At("slow.jpg"));
+  slow << "half" << std::flush;
+  Write(At("a.jpg"), "1");
+  Restart();
+  ASSERT_TRUE(WorkUntilFound(FILES, {"a.jpg|1"}));
+  Write(At("b.jpg"), "1");
+  ASSERT_TRUE(WorkUntilFound(FILES, {"a.jpg|1", "b.jpg|1"}));
+  slow << " whole";
+  slow.close();
+  EXPECT_TRUE(WorkUntilFound(FILES, {"a.jpg|1", "b.jpg|1", "slow.jpg|10"}));
 }
 
 TEST_F(IndexerTest, ALinkIsEnteredAlthoughItIsNeverClosed) {

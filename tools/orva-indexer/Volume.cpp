@@ -1,5 +1,7 @@
 #include "Volume.h"
 
+#include "Classification.h"
+#include "OpenFiles.h"
 #include "Sql.h"
 
 #include "orvadb/Transaction.h"
@@ -50,7 +52,7 @@ constexpr auto MOST_WORK = 2s;
 constexpr auto REST = 200ms;
 
 /// A file that was created but neither written nor closed may be a link, for which there is no
-/// other event. One that was written and not closed may have been truncated by its name.
+/// other event. One that was written and not closed waits no longer even if it is still open.
 constexpr auto LONGEST_EMPTY = 8s;
 constexpr auto LONGEST_OPEN = 600s;
 
@@ -246,6 +248,7 @@ void Volume::WalkAll() {
   walkedFolders_ = 0;
   walkedFiles_ = 0;
   unreadable_ = 0;
+  asked_ = 0;
 }
 
 Clock::time_point Volume::NextWork() const {
@@ -361,9 +364,9 @@ Volume::Result Volume::WorkOn(const VolumeRoot& root, const std::function<void()
         *database, root, catalog::NewPhotos::Waiting, std::time(nullptr),
         {.opened = [this](const Folder& folder, int descriptor) { Opened(folder, descriptor); },
          .isComplete =
-             [this](const Folder& folder, const std::string& name,
-                    const FolderIndexer::FileState& state) {
-               return IsComplete(folder, name, state);
+             [this, &root](const Folder& folder, const std::string& name,
+                           const FolderIndexer::FileState& state) {
+               return IsComplete(root, folder, name, state);
              },
          .pulse = pulse});
     isUncommitted_ = true;
@@ -511,25 +514,17 @@ void Volume::GiveUpWatches(int error) {
 }
 
 /// Whether nobody writes the file any more. Otherwise its folder is looked at again.
-bool Volume::IsComplete(const Folder& folder, const std::string& name,
+bool Volume::IsComplete(const VolumeRoot& root, const Folder& folder, const std::string& name,
                         const FolderIndexer::FileState& state) {
   const auto now = Clock::now();
   const std::string path = folder.path + name;
-  const auto open = openFiles_.find(path);
-  if (open != openFiles_.end()) {
-    const auto end = open->second.written +
-                     (open->second.hasContent ? Clock::duration(LONGEST_OPEN) : LONGEST_EMPTY);
-    if (now < end) {
-      CheckLater(folder.path, end);
-      return false;
-    }
-    openFiles_.erase(open);
-  }
-
   timespec clock = {};
   clock_gettime(CLOCK_REALTIME, &clock);
   const auto age = std::chrono::seconds(clock.tv_sec - state.statusChanged.tv_sec) +
                    std::chrono::nanoseconds(clock.tv_nsec - state.statusChanged.tv_nsec);
+  if (IsBeingWritten(root, folder.path, name, age)) {
+    return false;
+  }
   if (age >= QUIET) {
     looks_.erase(path);
     return true;
@@ -551,6 +546,38 @@ bool Volume::IsComplete(const Folder& folder, const std::string& name,
     look->second = {state, now};
   }
   CheckLater(folder.path, look->second.when + QUIET);
+  return false;
+}
+
+/// Whether a program has the file open and has written it in the last LONGEST_OPEN. `age`: since
+/// its last change.
+bool Volume::IsBeingWritten(const VolumeRoot& root, const std::string& folder,
+                            const std::string& name, Clock::duration age) {
+  const auto now = Clock::now();
+  const std::string path = folder + name;
+  const auto open = openFiles_.find(path);
+  if (open != openFiles_.end()) {
+    const bool hasContent = open->second.hasContent;
+    const auto end =
+        open->second.written + (hasContent ? Clock::duration(LONGEST_OPEN) : LONGEST_EMPTY);
+    // It may have been truncated by its name, or on another machine: then nobody closes it.
+    if (now < end && !(hasContent && IsOpenForWriting(root, path) == false)) {
+      CheckLater(folder, end);
+      return true;
+    }
+    openFiles_.erase(open);
+    return false;
+  }
+  // Events from before this walk are not known.
+  if (isWalkingAll_ && age >= 0s && age < LONGEST_OPEN && asked_ < MOST_FILES &&
+      catalog::CategoryOf(catalog::ExtensionOf(name)) == catalog::PHOTO) {
+    ++asked_;
+    if (IsOpenForWriting(root, path) == true) {
+      openFiles_[path] = {.written = now - age, .hasContent = true};
+      CheckLater(folder, now - age + LONGEST_OPEN);
+      return true;
+    }
+  }
   return false;
 }
 

@@ -146,8 +146,10 @@ private:
   void FinishWalk(Result& result, long long files);
   void Opened(const Folder& folder, int descriptor);
   void GiveUpWatches(int error);
-  bool IsComplete(const Folder& folder, const std::string& name,
+  bool IsComplete(const catalog::VolumeRoot& root, const Folder& folder, const std::string& name,
                   const catalog::FolderIndexer::FileState& state);
+  bool IsBeingWritten(const catalog::VolumeRoot& root, const std::string& folder,
+                      const std::string& name, Clock::duration age);
   void Fail(Trouble trouble, const std::string& reason, bool isMedium = false);
   bool IsStillFull(const catalog::VolumeRoot& root);
   void Recover();
@@ -169,6 +171,7 @@ private:
   bool isUncommitted_ = false; ///< folders were walked, and that is not committed
   std::map<std::string, Pending> pending_;
   std::unordered_map<std::string, OpenFile> openFiles_;
+  std::size_t asked_ = 0; ///< files of this walk, whether they are open for writing
   std::unordered_map<std::string, Look> looks_;
   Clock::time_point notBefore_{};                ///< no work earlier
   Clock::time_point nextWalk_{};                 ///< of all folders, where they are not watched
