@@ -332,6 +332,38 @@ TEST_F(IndexerTest, AFileWaitsWhileItIsWrittenAndOthersDoNot) {
   }));
 }
 
+TEST_F(VolumeWorkTest, APhotoThatIsReplacedByOneOfTheSameSizeAndTimeIsRenderedAgain) {
+  constexpr char STATES[] = "SELECT path, status FROM Files WHERE isDeleted = 0 ORDER BY path";
+  const auto time = fs::file_time_type::clock::now() - std::chrono::hours(1);
+  const auto write = [&](const std::string& name, const std::string& content) {
+    Write(At(name), content);
+    fs::last_write_time(At(name), time);
+  };
+  const auto finish = [&](const std::string& name) {
+    ASSERT_TRUE(WorkUntil([&] {
+      const auto next = TheVolume().NextWork();
+      return next > indexer::Clock::now() + std::chrono::seconds(5) &&
+             Query(Disk().Path(), "SELECT count(*) FROM Files WHERE isDeleted = 0 AND path = '" +
+                                      name + "'") == Lines{"1"};
+    }));
+    FinishPhotos(Disk().Path());
+  };
+  write("a.jpg", "one");
+  write("b.jpg", "two");
+  finish("b.jpg");
+  ASSERT_EQ(Query(Disk().Path(), STATES), (Lines{"a.jpg|3", "b.jpg|3"}));
+  fs::rename(At("b.jpg"), At("a.jpg"));
+  EXPECT_TRUE(WorkUntilFound(STATES, {"a.jpg|1"}));
+  finish("a.jpg");
+  write("a.jpg", "new");
+  EXPECT_TRUE(WorkUntilFound(STATES, {"a.jpg|1"}));
+  finish("a.jpg");
+  // A program that opens it for writing and writes nothing changes nothing.
+  std::fstream(At("a.jpg"), std::ios::in | std::ios::out).close();
+  Write(At("c.txt"));
+  EXPECT_TRUE(WorkUntilFound(STATES, {"a.jpg|3", "c.txt|1"}));
+}
+
 TEST_F(VolumeWorkTest, AFileThatIsTruncatedByItsNameIsEnteredSoon) {
   constexpr char SIZE[] = "SELECT size FROM Files WHERE path = 'a.jpg'";
   Write(At("a.jpg"), "whole");

@@ -368,10 +368,12 @@ FolderIndexer::FileChanges FolderIndexer::CompareFiles(const IndexedFolder& fold
       continue;
     }
     const bool isDeleted = known.isDeleted;
-    const bool isChanged = isDeleted || folder.revived || !IsUpToDate(row, folder, *entry) ||
-                           (known.status == RENDERED && newPhotos_ == NewPhotos::Waiting &&
-                            renditions.IsOutdated(known.id, entry->access)) ||
-                           (known.status == UNRENDERABLE && MayBeOpenedNow(row, *entry));
+    const bool isChanged =
+        isDeleted || folder.revived || !IsUpToDate(row, folder, *entry) ||
+        (known.status == RENDERED && newPhotos_ == NewPhotos::Waiting &&
+         renditions.IsOutdated(known.id, entry->access)) ||
+        (known.status == UNRENDERABLE && MayBeOpenedNow(row, *entry)) ||
+        (known.status != INDEXED && hooks_.wasWritten && hooks_.wasWritten(folder, entry->name));
     if (!(isChanged && write(*entry, known)) && !isDeleted) {
       ++summary_.rows; // it stays as it is
     }

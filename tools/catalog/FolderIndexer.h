@@ -78,6 +78,9 @@ public:
     /// Whether a new or changed file of the folder may be entered. Otherwise its row stays as it
     /// is.
     std::function<bool(const IndexedFolder&, const std::string&, const FileState&)> isComplete{};
+    /// Whether a photo of the folder was written or replaced since its row was. Then it has
+    /// changed, even if it has the same size and time.
+    std::function<bool(const IndexedFolder&, const std::string&)> wasWritten{};
     /// Called often. What it throws ends the update.
     std::function<void()> pulse{};
   };

@@ -107,6 +107,10 @@ std::string FolderOf(const std::string& path) {
   return end == std::string::npos ? std::string() : path.substr(0, end + 1);
 }
 
+bool IsPhoto(const std::string& name) {
+  return catalog::CategoryOf(catalog::ExtensionOf(name)) == catalog::PHOTO;
+}
+
 bool IsProductFolder(const FolderWatches::Event& event) {
   static const std::string home = core::GetORVA_HOME("");
   return event.folder.empty() && (event.name == home || event.name == ".zophotos");
@@ -178,6 +182,10 @@ void Volume::Handle(const FolderWatches::Event& event) {
 
 void Volume::NoteFile(const FolderWatches::Event& event) {
   const std::string path = event.folder + event.name;
+  if ((event.mask & (IN_CREATE | IN_MODIFY | IN_MOVED_TO)) != 0 && IsPhoto(event.name) &&
+      written_.size() < MOST_FILES) {
+    written_.insert(path);
+  }
   if ((event.mask & (IN_CREATE | IN_MODIFY)) != 0) {
     if (openFiles_.size() < MOST_FILES) {
       OpenFile& file = openFiles_[path];
@@ -366,10 +374,20 @@ Volume::Result Volume::WorkOn(const VolumeRoot& root, const std::function<void()
          .isComplete =
              [this, &root](const Folder& folder, const std::string& name,
                            const FolderIndexer::FileState& state) {
-               return IsComplete(root, folder, name, state);
+               const bool isComplete = IsComplete(root, folder, name, state);
+               if (isComplete && written_.erase(folder.path + name) > 0) {
+                 uncommitted_.push_back(folder.path + name);
+               }
+               return isComplete;
+             },
+         .wasWritten =
+             [this](const Folder& folder, const std::string& name) {
+               return written_.contains(folder.path + name);
              },
          .pulse = pulse});
     isUncommitted_ = true;
+    written_.insert(uncommitted_.begin(), uncommitted_.end()); // of a piece that failed
+    uncommitted_.clear();
     while (!ready_.empty() && Clock::now() - begin < MOST_WORK) {
       WalkNext(indexer);
     }
@@ -379,6 +397,10 @@ Volume::Result Volume::WorkOn(const VolumeRoot& root, const std::function<void()
     catalog::CatalogState state = catalog::StateOf(*database);
     transaction.Commit();
     isUncommitted_ = false;
+    uncommitted_.clear();
+    if (ready_.empty() && pending_.empty()) {
+      written_.clear(); // the rest has no row, or one that waits
+    }
     busyPause_ = {};
     lockedSince_.reset();
     isLockLogged_ = false;
@@ -569,8 +591,7 @@ bool Volume::IsBeingWritten(const VolumeRoot& root, const std::string& folder,
     return false;
   }
   // Events from before this walk are not known.
-  if (isWalkingAll_ && age >= 0s && age < LONGEST_OPEN && asked_ < MOST_FILES &&
-      catalog::CategoryOf(catalog::ExtensionOf(name)) == catalog::PHOTO) {
+  if (isWalkingAll_ && age >= 0s && age < LONGEST_OPEN && asked_ < MOST_FILES && IsPhoto(name)) {
     ++asked_;
     if (IsOpenForWriting(root, path) == true) {
       openFiles_[path] = {.written = now - age, .hasContent = true};

@@ -19,6 +19,7 @@
 #include <set>
 #include <string>
 #include <unordered_map>
+#include <unordered_set>
 #include <vector>
 
 namespace orva::indexer {
@@ -171,7 +172,10 @@ private:
   bool isUncommitted_ = false; ///< folders were walked, and that is not committed
   std::map<std::string, Pending> pending_;
   std::unordered_map<std::string, OpenFile> openFiles_;
-  std::size_t asked_ = 0; ///< files of this walk, whether they are open for writing
+  /// Paths of photos that were written or replaced since their rows were.
+  std::unordered_set<std::string> written_;
+  std::vector<std::string> uncommitted_; ///< those whose rows were written since the last commit
+  std::size_t asked_ = 0;                ///< files of this walk, whether they are open for writing
   std::unordered_map<std::string, Look> looks_;
   Clock::time_point notBefore_{};                ///< no work earlier
   Clock::time_point nextWalk_{};                 ///< of all folders, where they are not watched
