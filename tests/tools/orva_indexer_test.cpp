@@ -33,6 +33,7 @@
 #include <fstream>
 #include <functional>
 #include <iterator>
+#include <optional>
 #include <random>
 #include <string>
 #include <system_error>
@@ -223,6 +224,71 @@ TEST_F(IndexerTest, AChangeIsAnnouncedOnce) {
   EXPECT_EQ(Count(Events(volume.Path()), "Scanned"), 1);
 }
 
+/// The work on a volume in the test's own process, without the other programs.
+class VolumeWorkTest : public IndexerTest {
+protected:
+  VolumeWorkTest() { Restart(); }
+
+  /// Begins as after a start of the indexer.
+  void Restart() {
+    volume_.emplace(disk_.Path() + '/', catalog::VolumeRoot::Kind::Mount);
+    EXPECT_TRUE(WorkUntil([this] { return volume_->IsWalked(); }));
+  }
+
+  std::string At(const std::string& path) const { return disk_.Path() + '/' + path; }
+
+  /// Works as the service does until `condition` holds. False after the deadline.
+  bool WorkUntil(const std::function<bool()>& condition) {
+    return Await([&] {
+      volume_->ReadEvents();
+      if (volume_->NextWork() <= indexer::Clock::now()) {
+        const auto result = volume_->Work([] {}, [](const db::DB&) {}, std::time(nullptr));
+        changes_ += result.hasChanged ? 1 : 0;
+      }
+      return condition();
+    });
+  }
+
+  /// Works until a query of the catalog has this result.
+  bool WorkUntilFound(const std::string& sql, const Lines& rows) {
+    return WorkUntil([&] { return Query(disk_.Path(), sql) == rows; });
+  }
+
+  indexer::Volume& TheVolume() { return *volume_; }
+  test::Volume& Disk() { return disk_; }
+
+  /// Pieces of work after which the volume is announced, since the last call.
+  int TakeChanges() { return std::exchange(changes_, 0); }
+
+private:
+  test::Volume disk_{"A", "64m"};
+  std::optional<indexer::Volume> volume_;
+  int changes_ = 0;
+};
+
+TEST_F(VolumeWorkTest, OnlyChangesOfPhotosAndFoldersAreAnnounced) {
+  constexpr char SIZES[] = "SELECT path, size FROM Files WHERE isDeleted = 0 ORDER BY path";
+  Write(At("Notes/a.txt"), "1");
+  ASSERT_TRUE(WorkUntilFound(SIZES, {"Notes/a.txt|1"}));
+  EXPECT_GT(TakeChanges(), 0); // of the folder
+  Write(At("Notes/a.txt"), "12");
+  ASSERT_TRUE(WorkUntilFound(SIZES, {"Notes/a.txt|2"}));
+  Write(At("Notes/b.txt"), "1");
+  ASSERT_TRUE(WorkUntilFound(SIZES, {"Notes/a.txt|2", "Notes/b.txt|1"}));
+  fs::remove(At("Notes/a.txt"));
+  ASSERT_TRUE(WorkUntilFound(SIZES, {"Notes/b.txt|1"}));
+  EXPECT_EQ(TakeChanges(), 0);
+  Write(At("Notes/c.jpg"), "1");
+  ASSERT_TRUE(WorkUntilFound(SIZES, {"Notes/b.txt|1", "Notes/c.jpg|1"}));
+  EXPECT_GT(TakeChanges(), 0);
+  fs::remove(At("Notes/c.jpg"));
+  ASSERT_TRUE(WorkUntilFound(SIZES, {"Notes/b.txt|1"}));
+  EXPECT_GT(TakeChanges(), 0);
+  fs::remove_all(At("Notes"));
+  ASSERT_TRUE(WorkUntilFound(SIZES, {}));
+  EXPECT_GT(TakeChanges(), 0);
+}
+
 TEST_F(IndexerTest, PhotosThatArriveOneByOneTakeFewStamps) {
   const Volume volume("A", "64m");
   fs::create_directory(volume.Path() + "/Pictures");
@@ -266,6 +332,68 @@ TEST_F(IndexerTest, AFileWaitsWhileItIsWrittenAndOthersDoNot) {
   EXPECT_TRUE(Await([&] {
     return Query(volume.Path(), "SELECT size FROM Files WHERE path = 'slow.jpg'") == Lines{"10"};
   }));
+}
+
+TEST_F(VolumeWorkTest, APhotoThatIsReplacedByOneOfTheSameSizeAndTimeIsRenderedAgain) {
+  constexpr char STATES[] = "SELECT path, status FROM Files WHERE isDeleted = 0 ORDER BY path";
+  const auto time = fs::file_time_type::clock::now() - std::chrono::hours(1);
+  const auto write = [&](const std::string& name, const std::string& content) {
+    Write(At(name), content);
+    fs::last_write_time(At(name), time);
+  };
+  const auto finish = [&](const std::string& name) {
+    ASSERT_TRUE(WorkUntil([&] {
+      const auto next = TheVolume().NextWork();
+      return next > indexer::Clock::now() + std::chrono::seconds(5) &&
+             Query(Disk().Path(), "SELECT count(*) FROM Files WHERE isDeleted = 0 AND path = '" +
+                                      name + "'") == Lines{"1"};
+    }));
+    FinishPhotos(Disk().Path());
+  };
+  write("a.jpg", "one");
+  write("b.jpg", "two");
+  finish("b.jpg");
+  ASSERT_EQ(Query(Disk().Path(), STATES), (Lines{"a.jpg|3", "b.jpg|3"}));
+  fs::rename(At("b.jpg"), At("a.jpg"));
+  EXPECT_TRUE(WorkUntilFound(STATES, {"a.jpg|1"}));
+  finish("a.jpg");
+  write("a.jpg", "new");
+  EXPECT_TRUE(WorkUntilFound(STATES, {"a.jpg|1"}));
+  finish("a.jpg");
+  // A program that opens it for writing and writes nothing changes nothing.
+  std::fstream(At("a.jpg"), std::ios::in | std::ios::out).close();
+  Write(At("c.txt"));
+  EXPECT_TRUE(WorkUntilFound(STATES, {"a.jpg|3", "c.txt|1"}));
+}
+
+TEST_F(VolumeWorkTest, AFileThatIsTruncatedByItsNameIsEnteredSoon) {
+  constexpr char SIZE[] = "SELECT size FROM Files WHERE path = 'a.jpg'";
+  Write(At("a.jpg"), "whole");
+  ASSERT_TRUE(WorkUntilFound(SIZE, {"5"}));
+  ASSERT_EQ(truncate(At("a.jpg").c_str(), 3), 0);
+  EXPECT_TRUE(WorkUntilFound(SIZE, {"3"}));
+  // While another program writes it, it waits.
+  std::ofstream slow(At("a.jpg"), std::ios::app);
+  slow << "more" << std::flush;
+  Write(At("b.jpg"));
+  ASSERT_TRUE(WorkUntilFound("SELECT count(*) FROM Files", {"2"}));
+  EXPECT_EQ(Query(Disk().Path(), SIZE), Lines{"3"});
+  slow.close();
+  EXPECT_TRUE(WorkUntilFound(SIZE, {"7"}));
+}
+
+TEST_F(VolumeWorkTest, APhotoThatIsBeingWrittenWhenTheIndexerStartsWaits) {
+  constexpr char FILES[] = "SELECT path, size FROM Files ORDER BY path";
+  std::ofstream slow(At("slow.jpg"));
+  slow << "half" << std::flush;
+  Write(At("a.jpg"), "1");
+  Restart();
+  ASSERT_TRUE(WorkUntilFound(FILES, {"a.jpg|1"}));
+  Write(At("b.jpg"), "1");
+  ASSERT_TRUE(WorkUntilFound(FILES, {"a.jpg|1", "b.jpg|1"}));
+  slow << " whole";
+  slow.close();
+  EXPECT_TRUE(WorkUntilFound(FILES, {"a.jpg|1", "b.jpg|1", "slow.jpg|10"}));
 }
 
 TEST_F(IndexerTest, ALinkIsEnteredAlthoughItIsNeverClosed) {
@@ -722,6 +850,30 @@ TEST_F(IndexerTest, AFullVolumeIsIndexedWhenThereIsSpace) {
   volume.Resize(64 << 20);
   EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
   EXPECT_EQ(LogLines(": full").size(), 1U);
+}
+
+TEST_F(VolumeWorkTest, AFullVolumeIsWalkedWhenSomeSpaceHasBecomeFree) {
+  Write(At("a.jpg"));
+  ASSERT_THAT(WorkUntilFound("SELECT path FROM Files", {"a.jpg"}), true);
+  for (int i = 0; i < 2000; ++i) { // more rows than there is space for
+    Write(At("Pictures/" + std::to_string(i) + ".jpg"), "");
+  }
+  std::ofstream filler(At(".orva/filler"));
+  while (filler << std::string(4096, 'x') << std::flush) {
+  }
+  filler.close();
+  ASSERT_TRUE(WorkUntil([&] { return TheVolume().Status().state == std::string("read-only"); }))
+      << testing::PrintToString(LogLines()) << TheVolume().Status().state;
+  for (int check = 0; check < 2; ++check) {
+    const auto next = TheVolume().NextWork();
+    EXPECT_LT(next, indexer::Clock::now() + std::chrono::seconds(5));
+    ASSERT_TRUE(WorkUntil([&] { return TheVolume().NextWork() > next; }));
+    EXPECT_EQ(TheVolume().Status().state, std::string("read-only"));
+  }
+  fs::remove(At(".orva/filler"));
+  EXPECT_TRUE(WorkUntilFound("SELECT count(*) FROM Files", {"2001"}));
+  EXPECT_EQ(LogLines(": full").size(), 1U);
+  EXPECT_EQ(LogLines("indexed again").size(), 1U);
 }
 
 // --- Renditions --------------------------------------------------------------------------------

@@ -28,6 +28,7 @@ namespace {
 namespace catalog = orva::catalog;
 namespace db = orva::db;
 namespace test = orva::test;
+namespace transcoder = orva::transcoder;
 using namespace orva::test;
 using testing::Contains;
 using testing::HasSubstr;
@@ -468,6 +469,42 @@ TEST_F(Renditions, AFullVolumeIsReportedOnceAndTriedAgain) {
   EXPECT_EQ(
       std::ranges::count_if(
           logged, [](const std::string& line) { return line.find("No space") < line.size(); }),
+      1);
+}
+
+TEST_F(Renditions, AFullVolumeIsTriedAgainWhenSomeSpaceHasBecomeFree) {
+  Copy("a.jpg");
+  AddWaiting("a.jpg");
+  std::ofstream(At("filler")) << std::string(8 << 20, 'x');
+  TheVolume().Resize(TheVolume().Used() + (256 << 10));
+  using Clock = transcoder::Volume::Clock;
+  transcoder::Volume volume(Root() + '/', catalog::VolumeRoot::Kind::Mount);
+  const transcoder::BatchLimits limits{
+      .photos = 1, .bytes = 1 << 20, .space = 1 << 20, .most = 1 << 20};
+  const auto stage = [&] {
+    return volume.Stage("/tmp/batch", limits, [](long long) { return false; });
+  };
+  volume.Look();
+  EXPECT_EQ(stage(), nullptr);
+  for (int check = 0; check < 2; ++check) {
+    const auto next = volume.LookAgainAt();
+    ASSERT_TRUE(next);
+    EXPECT_LT(*next, Clock::now() + std::chrono::seconds(5));
+    ASSERT_TRUE(Await([&] { return Clock::now() >= *next; }));
+    volume.LookAgain();
+    EXPECT_FALSE(volume.HasWork());
+  }
+  fs::remove(At("filler"));
+  ASSERT_TRUE(Await([&] {
+    if (volume.LookAgainAt() && Clock::now() >= *volume.LookAgainAt()) {
+      volume.LookAgain();
+    }
+    return volume.HasWork();
+  }));
+  EXPECT_NE(stage(), nullptr);
+  EXPECT_EQ(
+      std::ranges::count_if(
+          Logged(), [](const std::string& line) { return line.find("No space") < line.size(); }),
       1);
 }
 

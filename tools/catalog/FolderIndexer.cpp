@@ -287,6 +287,8 @@ IndexedFolder FolderIndexer::UpdateFolder(const IndexedFolder& parent, const Ent
       known->folder.lastModifiedDate == entry.lastModifiedDate) {
     return known->folder;
   }
+  hasVisibleChanges_ =
+      hasVisibleChanges_ || known == nullptr || known->isDeleted || known->folder.flags != flags;
   db::Folder folder;
   folder.id = known != nullptr ? known->folder.id : nextFolderId_++;
   folder.folderId = parent.id;
@@ -369,7 +371,8 @@ FolderIndexer::FileChanges FolderIndexer::CompareFiles(const IndexedFolder& fold
     const bool isToBeRendered =
         newPhotos_ == NewPhotos::Waiting &&
         ((known.status == RENDERED && renditions.IsOutdated(known.id, entry->access)) ||
-         (known.status == UNRENDERABLE && MayBeOpenedNow(row, *entry)));
+         (known.status == UNRENDERABLE && MayBeOpenedNow(row, *entry)) ||
+         (known.status != INDEXED && hooks_.wasWritten && hooks_.wasWritten(folder, entry->name)));
     const bool isChanged =
         isDeleted || folder.revived || isToBeRendered || !IsUpToDate(row, folder, *entry);
     if (!(isChanged && write(*entry, known)) && !isDeleted) {
@@ -427,6 +430,7 @@ void FolderIndexer::UpdateFile(const IndexedFolder& folder, const FileChange& ch
   const Category category = CategoryOf(extension);
   const Flags flags = FlagsOf(entry.name, folder.flags);
   const bool isFinished = category == PHOTO && newPhotos_ == NewPhotos::Finished;
+  hasVisibleChanges_ = hasVisibleChanges_ || category == PHOTO;
   const long long id = change.row ? change.row->id : nextFileId_++;
   StoreFile(catalog_, catalog::FileRow{.id = id,
                                        .folderId = folder.id,
@@ -459,6 +463,7 @@ void FolderIndexer::DeleteFile(const FileRow& file) {
   Execute(catalog_, "UPDATE Transcodings SET status = ?, lastUpdatedDate = ? WHERE sourceId = ?",
           static_cast<int>(WITHDRAWN), Stamp(), file.id);
   if (file.isPhoto) {
+    hasVisibleChanges_ = true;
     Execute(catalog_, "INSERT OR IGNORE INTO Removals(fileId) VALUES(?)", file.id);
   }
   if (file.status == UNRENDERABLE) {
@@ -468,12 +473,14 @@ void FolderIndexer::DeleteFile(const FileRow& file) {
 }
 
 void FolderIndexer::MarkFolderDeleted(long long id) {
+  hasVisibleChanges_ = true;
   Execute(catalog_, "UPDATE Folders SET isDeleted = 1, lastUpdatedDate = ? WHERE id = ?", Stamp(),
           id);
 }
 
 /// Marks a folder and all that is below it deleted.
 void FolderIndexer::DeleteTree(const std::string& path) {
+  hasVisibleChanges_ = true;
   const std::string end = EndOfTree(path);
   summary_.deleted += SelectNumber(
       catalog_, "SELECT count(*) FROM Files WHERE path >= ? AND path < ? AND isDeleted = 0", path,

@@ -78,6 +78,9 @@ public:
     /// Whether a new or changed file of the folder may be entered. Otherwise its row stays as it
     /// is.
     std::function<bool(const IndexedFolder&, const std::string&, const FileState&)> isComplete{};
+    /// Whether a photo of the folder was written or replaced since its row was. Then it has
+    /// changed, even if it has the same size and time.
+    std::function<bool(const IndexedFolder&, const std::string&)> wasWritten{};
     /// Called often. What it throws ends the update.
     std::function<void()> pulse{};
   };
@@ -104,6 +107,10 @@ public:
 
   /// Whether a row was changed.
   bool HasChanged() const noexcept { return stamp_ != 0; }
+
+  /// Whether photos or folders were changed. Merged databases and the transcoder read nothing else,
+  /// and of a folder only whether it is there.
+  bool HasVisibleChanges() const noexcept { return hasVisibleChanges_; }
 
 private:
   /// A file or folder found in a folder.
@@ -176,6 +183,7 @@ private:
   const std::time_t now_;
   const Hooks hooks_;
   std::time_t stamp_ = 0; ///< 0 until the first change
+  bool hasVisibleChanges_ = false;
   long long nextFolderId_ = 1;
   long long nextFileId_ = 1;
   std::vector<std::string> leftAlone_; ///< paths, without a trailing separator

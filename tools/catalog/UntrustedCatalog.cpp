@@ -176,6 +176,9 @@ void Rename(int home, const std::string& from, const std::string& to) {
 
 CatalogProblem ProblemOf(const std::string& failure) {
   const int code = ExtendedCode(failure);
+  if (code == SQLITE_IOERR_SHMSIZE) { // no space for the log's index
+    return CatalogProblem::Full;
+  }
   switch (code & 0xFF) {
   case SQLITE_READONLY:
     return CatalogProblem::ReadOnly;

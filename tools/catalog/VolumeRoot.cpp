@@ -5,6 +5,7 @@
 #include <fcntl.h>
 #include <linux/openat2.h>
 #include <sys/stat.h>
+#include <sys/statvfs.h>
 #include <sys/syscall.h>
 #include <unistd.h>
 
@@ -84,6 +85,13 @@ util::FileDescriptor VolumeRoot::Open(const std::string& path, int flags, mode_t
   // DynamicUser=yes.
   return file || errno != ENOSYS ? std::move(file)
                                  : OpenByComponents(root_.Get(), relative, flags, mode);
+}
+
+long long VolumeRoot::FreeSpace() const {
+  struct statvfs status {};
+  return fstatvfs(root_.Get(), &status) == 0
+             ? static_cast<long long>(status.f_bfree) * static_cast<long long>(status.f_frsize)
+             : 0;
 }
 
 bool VolumeRoot::IsInPlace() const {

@@ -32,6 +32,9 @@ public:
   /// wait for a FIFO. Returns no descriptor, with errno, when that fails.
   util::FileDescriptor Open(const std::string& path, int flags, mode_t mode = 0) const;
 
+  /// Bytes that are free, including those that are reserved; 0 if that is not known.
+  long long FreeSpace() const;
+
   /// Whether the volume is still at its path.
   bool IsInPlace() const;
 

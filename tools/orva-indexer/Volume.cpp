@@ -1,5 +1,7 @@
 #include "Volume.h"
 
+#include "Classification.h"
+#include "OpenFiles.h"
 #include "Sql.h"
 
 #include "orvadb/Transaction.h"
@@ -50,7 +52,7 @@ constexpr auto MOST_WORK = 2s;
 constexpr auto REST = 200ms;
 
 /// A file that was created but neither written nor closed may be a link, for which there is no
-/// other event. One that was written and not closed may have been truncated by its name.
+/// other event. One that was written and not closed waits no longer even if it is still open.
 constexpr auto LONGEST_EMPTY = 8s;
 constexpr auto LONGEST_OPEN = 600s;
 
@@ -64,6 +66,7 @@ constexpr Clock::duration LONGEST_BUSY_PAUSE = 8s;
 constexpr auto LONGEST_LOCK = 5s;
 
 constexpr auto RETRY = 60s;
+constexpr auto SPACE_CHECK = 2s; ///< of a full volume
 constexpr auto SHORT_RETRY = 1s;
 
 /// A walk on a timer takes at most a twentieth of the time.
@@ -102,6 +105,10 @@ bool HasNoEvents(const VolumeRoot& root) {
 std::string FolderOf(const std::string& path) {
   const std::size_t end = path.rfind('/', path.size() - 2);
   return end == std::string::npos ? std::string() : path.substr(0, end + 1);
+}
+
+bool IsPhoto(const std::string& name) {
+  return catalog::CategoryOf(catalog::ExtensionOf(name)) == catalog::PHOTO;
 }
 
 bool IsProductFolder(const FolderWatches::Event& event) {
@@ -175,6 +182,10 @@ void Volume::Handle(const FolderWatches::Event& event) {
 
 void Volume::NoteFile(const FolderWatches::Event& event) {
   const std::string path = event.folder + event.name;
+  if ((event.mask & (IN_CREATE | IN_MODIFY | IN_MOVED_TO)) != 0 && IsPhoto(event.name) &&
+      written_.size() < MOST_FILES) {
+    written_.insert(path);
+  }
   if ((event.mask & (IN_CREATE | IN_MODIFY)) != 0) {
     if (openFiles_.size() < MOST_FILES) {
       OpenFile& file = openFiles_[path];
@@ -203,6 +214,7 @@ void Volume::CheckLater(const std::string& folder, Clock::time_point when) {
 void Volume::HandleMounts(const std::set<std::string>& mountPoints) {
   if (trouble_ != Trouble::None) {
     notBefore_ = {};
+    retryAt_ = {};
   }
   std::set<std::string> mounts;
   for (auto mount = mountPoints.upper_bound(path_ + '/');
@@ -244,6 +256,7 @@ void Volume::WalkAll() {
   walkedFolders_ = 0;
   walkedFiles_ = 0;
   unreadable_ = 0;
+  asked_ = 0;
 }
 
 Clock::time_point Volume::NextWork() const {
@@ -290,6 +303,9 @@ Volume::Result Volume::Work(const std::function<void()>& pulse, const Found& fou
   if (isUnmounted_) {
     return {.isGone = true};
   }
+  if (IsStillFull(*root)) {
+    return {};
+  }
   try {
     const Result result = WorkOn(*root, pulse, found, latest);
     if (!ready_.empty()) {
@@ -312,6 +328,8 @@ Volume::Result Volume::Work(const std::function<void()>& pulse, const Found& fou
       break;
     case CatalogProblem::Full:
       Fail(Trouble::ReadOnly, "full; its catalog is not updated until this changes");
+      spaceWhenFull_ = root->FreeSpace();
+      notBefore_ = Clock::now() + SPACE_CHECK;
       break;
     default:
       if (!root->IsInPlace()) {
@@ -355,12 +373,22 @@ Volume::Result Volume::WorkOn(const VolumeRoot& root, const std::function<void()
         *database, root, catalog::NewPhotos::Waiting, std::time(nullptr),
         {.opened = [this](const Folder& folder, int descriptor) { Opened(folder, descriptor); },
          .isComplete =
-             [this](const Folder& folder, const std::string& name,
-                    const FolderIndexer::FileState& state) {
-               return IsComplete(folder, name, state);
+             [this, &root](const Folder& folder, const std::string& name,
+                           const FolderIndexer::FileState& state) {
+               const bool isComplete = IsComplete(root, folder, name, state);
+               if (isComplete && written_.erase(folder.path + name) > 0) {
+                 uncommitted_.push_back(folder.path + name);
+               }
+               return isComplete;
+             },
+         .wasWritten =
+             [this](const Folder& folder, const std::string& name) {
+               return written_.contains(folder.path + name);
              },
          .pulse = pulse});
     isUncommitted_ = true;
+    written_.insert(uncommitted_.begin(), uncommitted_.end()); // of a piece that failed
+    uncommitted_.clear();
     while (!ready_.empty() && Clock::now() - begin < MOST_WORK) {
       WalkNext(indexer);
     }
@@ -370,11 +398,15 @@ Volume::Result Volume::WorkOn(const VolumeRoot& root, const std::function<void()
     catalog::CatalogState state = catalog::StateOf(*database);
     transaction.Commit();
     isUncommitted_ = false;
+    uncommitted_.clear();
+    if (ready_.empty() && pending_.empty()) {
+      written_.clear(); // the rest has no row, or one that waits
+    }
     lockedSince_.reset();
     isLockLogged_ = false;
     state_ = std::move(state);
-    result.hasChanged = indexer.HasChanged();
-    if (result.hasChanged) {
+    result.hasChanged = indexer.HasVisibleChanges();
+    if (indexer.HasChanged()) {
       const auto pause = catalog::PauseAfterStamp(state_.newestStamp, std::time(nullptr));
       notBefore_ = std::max(begin + MOST_WORK, Clock::now() + pause);
     }
@@ -504,25 +536,17 @@ void Volume::GiveUpWatches(int error) {
 }
 
 /// Whether nobody writes the file any more. Otherwise its folder is looked at again.
-bool Volume::IsComplete(const Folder& folder, const std::string& name,
+bool Volume::IsComplete(const VolumeRoot& root, const Folder& folder, const std::string& name,
                         const FolderIndexer::FileState& state) {
   const auto now = Clock::now();
   const std::string path = folder.path + name;
-  const auto open = openFiles_.find(path);
-  if (open != openFiles_.end()) {
-    const auto end = open->second.written +
-                     (open->second.hasContent ? Clock::duration(LONGEST_OPEN) : LONGEST_EMPTY);
-    if (now < end) {
-      CheckLater(folder.path, end);
-      return false;
-    }
-    openFiles_.erase(open);
-  }
-
   timespec clock = {};
   clock_gettime(CLOCK_REALTIME, &clock);
   const auto age = std::chrono::seconds(clock.tv_sec - state.statusChanged.tv_sec) +
                    std::chrono::nanoseconds(clock.tv_nsec - state.statusChanged.tv_nsec);
+  if (IsBeingWritten(root, folder.path, name, age)) {
+    return false;
+  }
   if (age >= QUIET) {
     looks_.erase(path);
     return true;
@@ -547,6 +571,37 @@ bool Volume::IsComplete(const Folder& folder, const std::string& name,
   return false;
 }
 
+/// Whether a program has the file open and has written it in the last LONGEST_OPEN. `age`: since
+/// its last change.
+bool Volume::IsBeingWritten(const VolumeRoot& root, const std::string& folder,
+                            const std::string& name, Clock::duration age) {
+  const auto now = Clock::now();
+  const std::string path = folder + name;
+  const auto open = openFiles_.find(path);
+  if (open != openFiles_.end()) {
+    const bool hasContent = open->second.hasContent;
+    const auto end =
+        open->second.written + (hasContent ? Clock::duration(LONGEST_OPEN) : LONGEST_EMPTY);
+    // It may have been truncated by its name, or on another machine: then nobody closes it.
+    if (now < end && !(hasContent && IsOpenForWriting(root, path) == false)) {
+      CheckLater(folder, end);
+      return true;
+    }
+    openFiles_.erase(open);
+    return false;
+  }
+  // Events from before this walk are not known.
+  if (isWalkingAll_ && age >= 0s && age < LONGEST_OPEN && asked_ < MOST_FILES && IsPhoto(name)) {
+    ++asked_;
+    if (IsOpenForWriting(root, path) == true) {
+      openFiles_[path] = {.written = now - age, .hasContent = true};
+      CheckLater(folder, now - age + LONGEST_OPEN);
+      return true;
+    }
+  }
+  return false;
+}
+
 // --- Trouble -----------------------------------------------------------------------------------
 
 /// `isMedium`: perhaps the medium was pulled, and is unmounted next.
@@ -557,7 +612,19 @@ void Volume::Fail(Trouble trouble, const std::string& reason, bool isMedium) {
   StartAgain();
   watches_.reset();
   isRetry_ = true;
-  notBefore_ = Clock::now() + RETRY;
+  retryAt_ = Clock::now() + RETRY;
+  notBefore_ = retryAt_;
+}
+
+/// Whether no space has become free since the volume was found full.
+bool Volume::IsStillFull(const VolumeRoot& root) {
+  const auto now = Clock::now();
+  if (spaceWhenFull_ && now < retryAt_ && root.FreeSpace() <= *spaceWhenFull_) {
+    notBefore_ = std::min(now + SPACE_CHECK, retryAt_);
+    return true;
+  }
+  spaceWhenFull_.reset();
+  return false;
 }
 
 /// Another program has locked the catalog.

@@ -19,6 +19,7 @@
 #include <set>
 #include <string>
 #include <unordered_map>
+#include <unordered_set>
 #include <vector>
 
 namespace orva::indexer {
@@ -40,7 +41,7 @@ public:
   /// What a piece of work has changed.
   struct Result {
     bool isGone = false;      ///< the volume is not there any more
-    bool hasChanged = false;  ///< rows were committed
+    bool hasChanged = false;  ///< changes were committed that other programs can see
     bool isFirstWalk = false; ///< the first whole walk of this catalog has ended
   };
 
@@ -146,9 +147,12 @@ private:
   void FinishWalk(Result& result, long long files);
   void Opened(const Folder& folder, int descriptor);
   void GiveUpWatches(int error);
-  bool IsComplete(const Folder& folder, const std::string& name,
+  bool IsComplete(const catalog::VolumeRoot& root, const Folder& folder, const std::string& name,
                   const catalog::FolderIndexer::FileState& state);
+  bool IsBeingWritten(const catalog::VolumeRoot& root, const std::string& folder,
+                      const std::string& name, Clock::duration age);
   void Fail(Trouble trouble, const std::string& reason, bool isMedium = false);
+  bool IsStillFull(const catalog::VolumeRoot& root);
   void Recover();
   void WaitForLock();
 
@@ -168,6 +172,10 @@ private:
   bool isUncommitted_ = false; ///< folders were walked, and that is not committed
   std::map<std::string, Pending> pending_;
   std::unordered_map<std::string, OpenFile> openFiles_;
+  /// Paths of photos that were written or replaced since their rows were.
+  std::unordered_set<std::string> written_;
+  std::vector<std::string> uncommitted_; ///< those whose rows were written since the last commit
+  std::size_t asked_ = 0;                ///< files of this walk, whether they are open for writing
   std::unordered_map<std::string, Look> looks_;
   Clock::time_point notBefore_{};                ///< no work earlier
   Clock::time_point nextWalk_{};                 ///< of all folders, where they are not watched
@@ -189,7 +197,9 @@ private:
   std::string unreadableExample_;
   long long files_ = 0; ///< on the volume, as far as known
   Trouble trouble_ = Trouble::None;
-  bool isRetry_ = false; ///< of a volume with trouble, which is not watched yet
+  Clock::time_point retryAt_{};            ///< of a volume with trouble
+  std::optional<long long> spaceWhenFull_; ///< bytes that were free; nothing if it is not full
+  bool isRetry_ = false;                   ///< of a volume with trouble, which is not watched yet
   bool wasJustSetAside_ = false;
 };
 

@@ -30,6 +30,9 @@ using util::FileDescriptor;
 constexpr int MOST_ENTRIES = 100'000;
 
 [[noreturn]] void ThrowError(const catalog::VolumeRoot& root, const std::string& path) {
+  if (errno == ENOSPC || errno == EDQUOT) {
+    throw VolumeFull(root);
+  }
   throw util::Exception(root.Path() + '/' + path + ": " + std::generic_category().message(errno));
 }
 
@@ -122,6 +125,9 @@ void ForEachEntry(const FileDescriptor& folder, Visit visit) {
 }
 
 } // namespace
+
+VolumeFull::VolumeFull(const catalog::VolumeRoot& root)
+    : Exception(root.Path() + ": " + std::generic_category().message(ENOSPC)) {}
 
 RenditionWriter::~RenditionWriter() {
   for (const Unpublished& rendition : unpublished_) {

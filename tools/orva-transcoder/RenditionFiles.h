@@ -1,5 +1,6 @@
 #pragma once
 
+#include "orvautil/Exception.h"
 #include "orvautil/FileDescriptor.h"
 
 #include <sys/stat.h>
@@ -19,9 +20,15 @@ class VolumeRoot;
 // opened for writing. Used by one thread at a time.
 namespace orva::transcoder {
 
+/// A volume that is full. what() is the same for all of its files.
+class VolumeFull : public util::Exception {
+public:
+  explicit VolumeFull(const catalog::VolumeRoot& root);
+};
+
 /// Writes renditions to a volume: first all under temporary names, then Publish. Temporary files
 /// that were not published are removed with the object. Failures that concern the whole volume,
-/// such as a full one, are thrown as util::Exception.
+/// are thrown as util::Exception, or as VolumeFull.
 class RenditionWriter {
 public:
   explicit RenditionWriter(const catalog::VolumeRoot& root) : root_(root) {}

@@ -183,7 +183,7 @@ void Transcoder::LookAgain() {
   }
   for (auto& [mountPoint, known] : volumes_) {
     if (known.volume.LookAgainAt() && Clock::now() >= *known.volume.LookAgainAt()) {
-      known.volume.Look();
+      known.volume.LookAgain();
     }
     if (known.volume.LookAgainAt()) {
       WakeAt(*known.volume.LookAgainAt());

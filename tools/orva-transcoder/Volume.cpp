@@ -48,6 +48,7 @@ constexpr std::size_t MOST_LISTED = 50;       // waiting photos in one query
 constexpr std::size_t MOST_EXAMINED = 1000;   // photos in one piece of work
 constexpr std::size_t MOST_REMOVALS = 10'000; // in one piece of work
 constexpr std::chrono::seconds RETRY(60);
+constexpr std::chrono::seconds SPACE_CHECK(2); // of a full volume
 
 // How long a locked catalog is waited for, in milliseconds: all volumes wait then. The pauses
 // before the next attempts grow with the time since it was found locked.
@@ -177,15 +178,33 @@ void Volume::Attempt(const std::function<void()>& work) {
   try {
     work();
     lookAgainAt_.reset();
+    spaceWhenFull_.reset();
     return;
   } catch (const std::string& failure) { // the database layer's
-    Report(failure, catalog::ProblemOf(failure) == catalog::CatalogProblem::Busy);
+    using catalog::CatalogProblem;
+    const CatalogProblem problem = catalog::ProblemOf(failure);
+    if (problem == CatalogProblem::Full) {
+      ReportFull(ErrorText(ENOSPC));
+    } else {
+      Report(failure, problem == CatalogProblem::Busy);
+    }
+  } catch (const VolumeFull& failure) {
+    ReportFull(failure.what());
   } catch (const std::exception& failure) {
     Report(failure.what(), false);
   }
 }
 
-void Volume::Report(const std::string& problem, bool isBusy) {
+void Volume::ReportFull(const std::string& problem) {
+  Report(problem, false);
+  spaceWhenFull_ = FreeSpace();
+  retryAt_ = *lookAgainAt_;
+  lookAgainAt_ = Clock::now() + SPACE_CHECK;
+}
+
+void Volume::Report(const std::string& failure, bool isBusy) {
+  const std::string path = PathOf(mountPoint_);
+  const std::string problem = failure.starts_with(path) ? failure : path + ": " + failure;
   isBusy_ = isBusy;
   const auto now = Clock::now();
   if (isBusy_) {
@@ -199,8 +218,7 @@ void Volume::Report(const std::string& problem, bool isBusy) {
     return;
   }
   problem_ = problem;
-  const std::string path = PathOf(mountPoint_);
-  const std::string line = Printable(problem.starts_with(path) ? problem : path + ": " + problem);
+  const std::string line = Printable(problem);
   if (IsThere()) {
     LogError(line);
   } else if (!wasThere_) {
@@ -209,11 +227,24 @@ void Volume::Report(const std::string& problem, bool isBusy) {
 }
 
 bool Volume::IsThere() const {
+  return FreeSpace().has_value();
+}
+
+/// Bytes; nothing if the volume is not there.
+std::optional<long long> Volume::FreeSpace() const {
   try {
-    const VolumeRoot root(PathOf(mountPoint_), kind_);
-    return true;
+    return VolumeRoot(PathOf(mountPoint_), kind_).FreeSpace();
   } catch (const util::Exception&) {
-    return false;
+    return std::nullopt;
+  }
+}
+
+void Volume::LookAgain() {
+  const auto now = Clock::now();
+  if (spaceWhenFull_ && now < retryAt_ && FreeSpace() <= spaceWhenFull_) {
+    lookAgainAt_ = std::min(now + SPACE_CHECK, retryAt_);
+  } else {
+    Look();
   }
 }
 
@@ -281,7 +312,7 @@ std::unique_ptr<Batch> Volume::Stage(const std::string& path, const BatchLimits&
     struct statvfs fileSystem {};
     if (fstatvfs(volume->root.Descriptor(), &fileSystem) == 0 &&
         fileSystem.f_bavail < LARGEST_RENDITION / fileSystem.f_frsize) {
-      throw util::Exception(volume->root.Path() + ": " + ErrorText(ENOSPC));
+      throw VolumeFull(volume->root);
     }
     Batch next{
         .mountPoint = mountPoint_, .identity = volume->identity, .folder = StagingFolder(path)};

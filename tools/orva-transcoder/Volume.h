@@ -76,8 +76,11 @@ public:
   /// is removed.
   void CheckRenditions(const IsInBatch& isInBatch);
 
-  /// When the volume has to be looked at again although nothing was announced.
+  /// When LookAgain is due although nothing was announced.
   std::optional<Clock::time_point> LookAgainAt() const;
+
+  /// Looks for photos that wait, unless the volume is still full.
+  void LookAgain();
 
   /// Photos that were finished or have failed since the last call.
   std::size_t TakeChanges();
@@ -105,8 +108,10 @@ private:
   /// Returns nothing if the catalog is missing, not one of ours, or just being made.
   std::optional<Opened> Open();
   bool IsThere() const;
+  std::optional<long long> FreeSpace() const;
   void Attempt(const std::function<void()>& work);
-  void Report(const std::string& problem, bool isBusy);
+  void Report(const std::string& failure, bool isBusy);
+  void ReportFull(const std::string& problem);
   void Count(const db::VolumeDB& catalog);
   void RemoveVanished(const Opened& volume);
   /// Leaves the photo out for some time. Returns false if that was done often enough.
@@ -148,6 +153,8 @@ private:
   std::optional<Clock::time_point> lockedSince_; ///< the catalog, by another program
   bool isBusy_ = false; ///< another program used the catalog when work last failed
   std::optional<Clock::time_point> lookAgainAt_;
+  std::optional<long long> spaceWhenFull_; ///< bytes that were free; nothing if it is not full
+  Clock::time_point retryAt_{};            ///< of a full volume
 };
 
 } // namespace orva::transcoder
