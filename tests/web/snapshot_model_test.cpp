@@ -29,13 +29,16 @@ std::vector<std::string> WordsOf(const std::string& text) {
   return result;
 }
 
-/// Whether the path has words that begin with all the words of `search`.
+/// Whether the path has words that begin with all the words of `search`. A text without a word
+/// finds nothing.
 bool Matches(const web::Photo& photo, const std::string& search) {
-  const std::vector<std::string> words = WordsOf(photo.path.substr(photo.volume.size()));
-  return std::ranges::all_of(WordsOf(search), [&](const std::string& wanted) {
-    return std::ranges::any_of(words,
-                               [&](const std::string& word) { return word.starts_with(wanted); });
-  });
+  const std::vector<std::string> words = WordsOf(photo.path);
+  const std::vector<std::string> searched = WordsOf(search);
+  return (!searched.empty() || search.empty()) &&
+         std::ranges::all_of(searched, [&](const std::string& wanted) {
+           return std::ranges::any_of(
+               words, [&](const std::string& word) { return word.starts_with(wanted); });
+         });
 }
 
 class RandomChanges : public SnapshotTest, public ::testing::WithParamInterface<int> {
