@@ -23,8 +23,10 @@
 #include <list>
 #include <memory>
 #include <mutex>
+#include <shared_mutex>
 #include <stdexcept>
 #include <string>
+#include <thread>
 #include <vector>
 
 namespace orva::web {
@@ -107,6 +109,7 @@ protected:
     });
   }
 
+  std::shared_mutex disk; ///< locked while it is slow
   std::uint16_t port = 0;
   std::unique_ptr<Server> server;
 
@@ -129,6 +132,19 @@ private:
               .body = FilePart{.file = util::FileDescriptor(dup(file_.Get())),
                                .offset = offset,
                                .size = path == "/part" ? 10 : LARGE}};
+    }
+    if (path == "/slow" || path == "/quick") {
+      return {.body = DiskWork{.volume = path, .make = [this, path] {
+                                 if (path == "/slow") {
+                                   const std::shared_lock wait(disk);
+                                 }
+                                 return Response{.type = "text/plain", .body = "file of " + path};
+                               }}};
+    }
+    if (path == "/disk-throws") {
+      return {.body = DiskWork{.volume = path, .make = []() -> Response {
+                                 throw std::runtime_error("disk out of order");
+                               }}};
     }
     if (path == "/large") {
       return {.type = "text/plain", .body = std::string(16 << 20, 'x')};
@@ -423,6 +439,66 @@ TEST_F(WebServer, HasABoundForTheResponsesThatAreNotRead) {
     poll(nullptr, 0, 20);
   }
   EXPECT_EQ(200, Get("/large").status);
+}
+
+TEST_F(WebServer, ServesEverythingElseWhileADiskIsSlow) {
+  std::list<HttpConnection> kept;
+  for (unsigned i = 0; i < 4 * Server::THREADS; ++i) {
+    kept.emplace_back(port).Send(HttpGet("/a"));
+    EXPECT_EQ(200, kept.back().Read().status);
+  }
+  std::unique_lock slow(disk);
+  std::list<HttpConnection> waiting;
+  for (int i = 0; i < 60; ++i) {
+    waiting.emplace_back(port).Send(HttpGet("/slow"));
+  }
+  for (HttpConnection& connection : kept) {
+    connection.Send(HttpGet("/a") + HttpGet("/quick"));
+    EXPECT_EQ("content of /a", connection.Read().body);
+    EXPECT_EQ("file of /quick", connection.Read().body);
+  }
+  // Those that have to wait too long are refused.
+  std::vector<pollfd> sockets;
+  for (const HttpConnection& connection : waiting) {
+    sockets.push_back({.fd = connection.Socket(), .events = POLLIN, .revents = 0});
+  }
+  const auto isAnswered = [](const pollfd& socket) { return socket.revents != 0; };
+  const std::size_t refused = waiting.size() - DiskThreads::MOST_PER_VOLUME;
+  const auto end = std::chrono::steady_clock::now() + test::DEADLINE;
+  while (static_cast<std::size_t>(std::ranges::count_if(sockets, isAnswered)) < refused &&
+         std::chrono::steady_clock::now() < end) {
+    poll(nullptr, 0, 50);
+    poll(sockets.data(), sockets.size(), 0);
+  }
+  EXPECT_EQ(refused, std::ranges::count_if(sockets, isAnswered));
+  slow.unlock();
+  auto socket = sockets.begin();
+  for (HttpConnection& connection : waiting) {
+    const HttpResponse response = connection.Read();
+    const bool isRefused = isAnswered(*socket++);
+    EXPECT_EQ(isRefused ? 503 : 200, response.status);
+    EXPECT_EQ(isRefused ? "5" : "", response.Header("retry-after"));
+  }
+}
+
+TEST_F(WebServer, AnswersAndLogsWhatADiskThrows) {
+  EXPECT_EQ(500, Get("/disk-throws").status);
+  EXPECT_THAT(Log(), ElementsAre("disk out of order"));
+}
+
+TEST_F(WebServer, EndsWhileRequestsWaitForADisk) {
+  std::unique_lock slow(disk);
+  std::list<HttpConnection> waiting;
+  for (int i = 0; i < 20; ++i) {
+    waiting.emplace_back(port).Send(HttpGet("/slow"));
+  }
+  EXPECT_EQ("file of /quick", Get("/quick").body);
+  std::jthread end([this] { server.reset(); });
+  slow.unlock();
+  end.join();
+  for (HttpConnection& connection : waiting) {
+    connection.ReadToEnd();
+  }
 }
 
 TEST_F(WebServer, EndsConnectionsThatSendTooSlowly) {

@@ -3,6 +3,7 @@
 #include "orvautil/FileDescriptor.h"
 
 #include <cstdint>
+#include <functional>
 #include <string>
 #include <utility>
 #include <variant>
@@ -20,11 +21,20 @@ struct FilePart {
 /// The events of EventStreams, until the client goes.
 struct EventStream {};
 
+struct Response;
+
+/// A response that may have to wait for the disk of a volume. `make` is called in another thread;
+/// it must not return another one of these.
+struct DiskWork {
+  std::string volume;
+  std::function<Response()> make;
+};
+
 /// What a request is answered with. The server adds the headers that all responses have.
 struct Response {
   int status = 200;
   std::string type{}; ///< of the body
-  std::variant<std::string, FilePart, EventStream> body{};
+  std::variant<std::string, FilePart, EventStream, DiskWork> body{};
   std::vector<std::pair<std::string, std::string>> headers{}; ///< more of them
 };
 

@@ -336,7 +336,12 @@ Response Router::Rendition(const Request& request, PhotoId id) {
   if (!photo) {
     return NoPhoto(request.target);
   }
-  auto file = files_.OpenRendition(*photo);
+  return {.body = DiskWork{.volume = photo->volume,
+                           .make = [this, request, photo] { return Rendition(request, *photo); }}};
+}
+
+Response Router::Rendition(const Request& request, const Photo& photo) {
+  auto file = files_.OpenRendition(photo);
   if (!file) {
     return Refuse(NOT_FOUND, request.target.path, "The rendition of this photo cannot be read.");
   }
@@ -352,7 +357,12 @@ Response Router::Original(const Request& request, PhotoId id) {
   if (!photo) {
     return NoPhoto(request.target);
   }
-  auto file = files_.OpenOriginal(*photo);
+  return {.body = DiskWork{.volume = photo->volume,
+                           .make = [this, request, photo] { return Original(request, *photo); }}};
+}
+
+Response Router::Original(const Request& request, const Photo& photo) {
+  auto file = files_.OpenOriginal(photo);
   if (!file) {
     return Refuse(NOT_FOUND, request.target.path, "This photo cannot be read.");
   }
@@ -361,7 +371,7 @@ Response Router::Original(const Request& request, PhotoId id) {
   }
   // The browser saves it, whatever it is.
   Response response = ServeFile(std::move(*file), request, "application/octet-stream");
-  response.headers.emplace_back("Content-Disposition", Attachment(photo->name));
+  response.headers.emplace_back("Content-Disposition", Attachment(photo.name));
   return response;
 }
 

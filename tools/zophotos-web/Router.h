@@ -39,6 +39,8 @@ private:
   Response PhotoView(const Target& target, PhotoId id);
   Response Rendition(const Request& request, PhotoId id);
   Response Original(const Request& request, PhotoId id);
+  Response Rendition(const Request& request, const Photo& photo);
+  Response Original(const Request& request, const Photo& photo);
 
   Response PhotosJson(const Target& target);
   Response PhotoJson(const Target& target, PhotoId id);

@@ -52,6 +52,7 @@ struct Exchange {
   std::string text; ///< the target as it was sent
   bool isHead = false;
   std::optional<Request> request{}; ///< nothing until it is checked
+  std::optional<Response> ready{};  ///< made by another thread, while the connection is suspended
 };
 
 /// The headers that matter to us.
@@ -263,7 +264,14 @@ struct Server::Calls {
     }
     try {
       if (current->request) {
-        Response response = Answer(self, *current->request);
+        Response response = current->ready ? std::move(*current->ready)
+                                           : Answer(self, current->request->target.path, [&] {
+                                               return self.handlers_.answer(*current->request);
+                                             });
+        if (auto* const work = std::get_if<DiskWork>(&response.body)) {
+          Defer(self, connection, *current, std::move(*work));
+          return MHD_YES; // this is called again
+        }
         if (current->isHead && std::holds_alternative<EventStream>(response.body)) {
           response.body = std::string(); // libmicrohttpd would send the end of a stream
         }
@@ -300,16 +308,33 @@ struct Server::Calls {
     return refusal;
   }
 
-  static Response Answer(const Server& self, const Request& request) {
+  /// What `make` returns, or the error that it throws, for the request of `path`.
+  static Response Answer(const Server& self, const std::string& path,
+                         const std::function<Response()>& make) {
     try {
-      return self.handlers_.answer(request);
+      return make();
     } catch (const std::exception& error) {
       self.handlers_.log(error.what());
     } catch (const std::string& error) { // the database layer's
       self.handlers_.log(error);
     }
-    return self.handlers_.refuse(MHD_HTTP_INTERNAL_SERVER_ERROR, request.target.path,
+    return self.handlers_.refuse(MHD_HTTP_INTERNAL_SERVER_ERROR, path,
                                  "This failed. The log of zophotos-web says why.");
+  }
+
+  /// Suspends the connection until another thread has made the response.
+  static void Defer(Server& self, MHD_Connection* connection, Exchange& exchange, DiskWork work) {
+    const auto run = [&self, connection, &exchange, make = std::move(work.make)](bool mayRun) {
+      const std::string& path = exchange.request->target.path;
+      exchange.ready = mayRun ? Answer(self, path, make)
+                              : Busy(self, path, "The disk of this photo is too slow.");
+      MHD_resume_connection(connection);
+    };
+    ConnectionOf(connection)->SendResponse(0);
+    MHD_suspend_connection(connection);
+    if (!self.disks_.Add(work.volume, run)) {
+      run(false);
+    }
   }
 
   /// Ends the connection: what follows the headers is not read.
@@ -400,6 +425,7 @@ Server::Server(util::FileDescriptor listener, AllowedHosts hosts, Handlers handl
     RunClock(stop, [this] {
       connections_.ShutDownLate();
       events_.KeepAlive();
+      disks_.EndLate();
     });
   });
 }
@@ -407,6 +433,7 @@ Server::Server(util::FileDescriptor listener, AllowedHosts hosts, Handlers handl
 Server::~Server() {
   clock_.request_stop();
   clock_.join();
+  disks_.Stop();
   events_.Close();
   // libmicrohttpd would shut the socket down, and systemd could not go on listening.
   const util::FileDescriptor listener(MHD_quiesce_daemon(daemon_));

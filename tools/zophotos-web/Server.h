@@ -2,6 +2,7 @@
 
 #include "AllowedHosts.h"
 #include "Connections.h"
+#include "DiskThreads.h"
 #include "EventStreams.h"
 #include "Request.h"
 #include "Response.h"
@@ -19,7 +20,7 @@ struct MHD_Daemon;
 namespace orva::web {
 
 /// The HTTP server: takes connections, checks requests, and sends responses. A few threads serve
-/// all connections.
+/// all connections. Connections whose responses wait for a disk are suspended.
 class Server {
 public:
   static constexpr unsigned THREADS = 4;
@@ -52,6 +53,7 @@ private:
   std::atomic<std::size_t> unsentTexts_ = 0; ///< bytes of the texts that responses have
   EventStreams events_;
   Connections connections_;
+  DiskThreads disks_;
   MHD_Daemon* daemon_ = nullptr; ///< owned
   std::jthread clock_;           ///< ends what takes too long
 };

@@ -95,7 +95,12 @@ std::optional<VolumeFile> VolumeFiles::OpenRendition(const Photo& photo) {
   const auto volume = path ? OpenRoot(path->root) : std::nullopt;
   const auto id = volume ? ids_.Find(photo.id, *path, *volume) : std::nullopt;
   auto file = id ? Open(*volume, catalog::RenditionPath(*id)) : std::nullopt;
-  return file && file->size <= MOST_RENDITION ? std::move(file) : std::nullopt;
+  if (!file || file->size > MOST_RENDITION) {
+    return std::nullopt;
+  }
+  // The thread that sends it must not wait for the disk.
+  readahead(file->file.Get(), 0, file->size);
+  return file;
 }
 
 } // namespace orva::web
