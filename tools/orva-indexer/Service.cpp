@@ -425,22 +425,31 @@ bool Service::IsPurgeOwed(const Known& known, const std::string& master) const {
 }
 
 void Service::Remember(const Known& known, const std::string& master) {
+  const bool isOther = IsPurgeOwed(known, master);
   remembered_.Store(master, known.volume.MountPoint(), known.volume.State());
+  // A backup of the master that was made before has rows of another catalog.
+  Known* const volume = isOther ? MasterVolume() : nullptr;
+  if (volume != nullptr && volume->volume.Identity() == master) {
+    volume->volume.TakeStamp();
+  }
+}
+
+/// The volume that is the master; null if the shares root is, or while it is not known.
+Service::Known* Service::MasterVolume() const {
+  const auto path = Locator::Master();
+  const auto found = path ? volumes_.find(*path + '/') : volumes_.end();
+  return found == volumes_.end() ? nullptr : found->second.get();
 }
 
 /// The identity of the catalog on the master volume; nothing while that is not known.
 std::optional<std::string> Service::Master() const {
-  const auto path = Locator::Master();
-  if (!path) {
-    return std::nullopt;
-  }
-  if (*path == SHARES) {
+  if (Locator::Master() == SHARES) {
     return NO_VOLUME;
   }
-  const auto found = volumes_.find(*path + '/');
-  return found == volumes_.end() || found->second->volume.Identity().empty()
+  const Known* const volume = MasterVolume();
+  return volume == nullptr || volume->volume.Identity().empty()
              ? std::nullopt
-             : std::optional(found->second->volume.Identity());
+             : std::optional(volume->volume.Identity());
 }
 
 // --- Status ------------------------------------------------------------------------------------

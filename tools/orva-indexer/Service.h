@@ -72,6 +72,7 @@ private:
   void PurgeOrEnd(Known& known);
   bool IsPurgeOwed(const Known& known, const std::string& master) const;
   void Remember(const Known& known, const std::string& master);
+  Known* MasterVolume() const;
   std::optional<std::string> Master() const;
   std::time_t LatestStamp(const Known& known) const;
   void PublishStatus();

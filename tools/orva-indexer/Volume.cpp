@@ -261,7 +261,7 @@ void Volume::WalkAll() {
 
 Clock::time_point Volume::NextWork() const {
   auto next = Clock::time_point::max();
-  if (!ready_.empty() || isUnmounted_ || isStampWanted_) {
+  if (!ready_.empty() || isUnmounted_ || isStampWanted_ || isStampDue_) {
     next = Clock::time_point::min();
   }
   if (!watches_ && ready_.empty()) {
@@ -395,8 +395,12 @@ Volume::Result Volume::WorkOn(const VolumeRoot& root, const std::function<void()
     walkTime_ += Clock::now() - begin;
     const bool isEnd = isWalkingAll_ && ready_.empty();
     const long long files = isEnd ? indexer.DeleteUnreachableRows(walkedFolders_, walkedFiles_) : 0;
+    if (isStampDue_) {
+      catalog::NextStamp(*database, std::time(nullptr));
+    }
     catalog::CatalogState state = catalog::StateOf(*database);
     transaction.Commit();
+    isStampDue_ = false;
     isUncommitted_ = false;
     uncommitted_.clear();
     if (ready_.empty() && pending_.empty()) {

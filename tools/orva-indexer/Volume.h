@@ -102,6 +102,10 @@ public:
   /// Another program has written to the catalog: reads its newest stamp.
   void ReadStamp() { isStampWanted_ = true; }
 
+  /// Gives out a stamp in the catalog with the next piece of work, so that a copy of it of an
+  /// earlier time is recognized.
+  void TakeStamp() { isStampDue_ = true; }
+
   VolumeStatus Status() const;
 
 private:
@@ -182,6 +186,7 @@ private:
   std::optional<Clock::time_point> lockedSince_; ///< by another program
   bool isLockLogged_ = false;
   bool isStampWanted_ = false;
+  bool isStampDue_ = false;     ///< of TakeStamp
   bool hasOtherAccess_ = false; ///< the folder that is walked lets other users pass than before
 
   dev_t device_ = 0; ///< of the root, as it was walked

@@ -497,6 +497,28 @@ TEST_F(Convergent, DisksAreSwappedWhileTheDaemonIsDown) {
   ExpectConvergence(UNMOUNTED);
 }
 
+TEST_F(Convergent, ADiskIsRemovedWhileNothingRuns) {
+  // The master stays, and its database keeps the rows of the disk.
+  ASSERT_TRUE(DatabasePath().starts_with(BIG)) << DatabasePath();
+  const std::vector<std::string> units = {"orva-notify", "zophotodbmerger", "orva-indexer",
+                                          "orva-transcoder"};
+  for (auto unit = units.rbegin(); unit != units.rend(); ++unit) {
+    Sys().services.Control("stop", *unit);
+  }
+  Unmount(DISK);
+  Sys().plugged = {&Sys().photos, &Sys().big};
+  for (const std::string& unit : units) {
+    Sys().services.Control("start", unit);
+  }
+  ASSERT_TRUE(Await([] { return Sys().services.AreActive(); }));
+  ExpectConvergence(UNMOUNTED);
+  ASSERT_TRUE(DatabasePath().starts_with(BIG)) << DatabasePath();
+  MountDisk("A");
+  Sys().plugged = {&Sys().photos, &Sys().diskA, &Sys().big};
+  Change(20);
+  ExpectConvergence(UNMOUNTED);
+}
+
 TEST_F(Convergent, TheMasterIsPulled) {
   ASSERT_TRUE(DatabasePath().starts_with(BIG)) << DatabasePath();
   Change(20);
