@@ -364,6 +364,19 @@ TEST_F(VolumeWorkTest, APhotoThatIsReplacedByOneOfTheSameSizeAndTimeIsRenderedAg
   EXPECT_TRUE(WorkUntilFound(STATES, {"a.jpg|3", "c.txt|1"}));
 }
 
+TEST_F(IndexerTest, AChangeOfAFileIsEnteredUnderItsOtherNamesToo) {
+  const Volume volume("A", "64m");
+  Write(volume.Path() + "/One/a.jpg", "1");
+  fs::create_directory(volume.Path() + "/Two");
+  fs::create_hard_link(volume.Path() + "/One/a.jpg", volume.Path() + "/Two/b.jpg");
+  StartService();
+  StartIndexerIn({"PROBE_CLOCK_SPEED=20"}); // the walk of all folders is on a timer
+  ASSERT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  ASSERT_TRUE(Await([&] { return State(volume.Path()) == "watching"; }));
+  Write(volume.Path() + "/One/a.jpg", "12");
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+}
+
 TEST_F(VolumeWorkTest, AFileThatIsTruncatedByItsNameIsEnteredSoon) {
   constexpr char SIZE[] = "SELECT size FROM Files WHERE path = 'a.jpg'";
   Write(At("a.jpg"), "whole");
