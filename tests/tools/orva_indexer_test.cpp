@@ -287,6 +287,20 @@ TEST_F(VolumeWorkTest, OnlyChangesOfPhotosAndFoldersAreAnnounced) {
   EXPECT_GT(TakeChanges(), 0);
 }
 
+TEST_F(IndexerTest, ACatalogIsMadeAgainWhenItsFolderIsRemoved) {
+  const Volume volume("A", "64m");
+  Write(volume.Path() + "/Pictures/a.jpg");
+  StartService();
+  StartIndexer();
+  ASSERT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  ASSERT_TRUE(Await([&] { return State(volume.Path()) == "watching"; }));
+  fs::remove_all(volume.Path() + "/.orva");
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  ASSERT_TRUE(Await([&] { return Count(Events(volume.Path()), "Scanned") == 2; }));
+  fs::rename(volume.Path() + "/.orva", "/shares/A/elsewhere");
+  EXPECT_TRUE(Await([&] { return fs::exists(CatalogOf(volume.Path())); }));
+}
+
 TEST_F(IndexerTest, PhotosThatArriveOneByOneTakeFewStamps) {
   const Volume volume("A", "64m");
   fs::create_directory(volume.Path() + "/Pictures");

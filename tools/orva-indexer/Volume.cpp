@@ -177,6 +177,8 @@ void Volume::Handle(const FolderWatches::Event& event) {
       NoteFile(event);
     }
     MarkDirty(event.folder);
+  } else if ((event.mask & (IN_DELETE | IN_MOVED_FROM)) != 0) {
+    MarkDirty(""); // makes the catalog again
   }
 }
 
