@@ -289,6 +289,20 @@ TEST_F(VolumeWorkTest, OnlyChangesOfPhotosAndFoldersAreAnnounced) {
   EXPECT_GT(TakeChanges(), 0);
 }
 
+TEST_F(IndexerTest, ACatalogIsMadeAgainWhenItsFolderIsRemoved) {
+  const Volume volume("A", "64m");
+  Write(volume.Path() + "/Pictures/a.jpg");
+  StartService();
+  StartIndexer();
+  ASSERT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  ASSERT_TRUE(Await([&] { return State(volume.Path()) == "watching"; }));
+  fs::remove_all(volume.Path() + "/.orva");
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  ASSERT_TRUE(Await([&] { return Count(Events(volume.Path()), "Scanned") == 2; }));
+  fs::rename(volume.Path() + "/.orva", "/shares/A/elsewhere");
+  EXPECT_TRUE(Await([&] { return fs::exists(CatalogOf(volume.Path())); }));
+}
+
 TEST_F(IndexerTest, PhotosThatArriveOneByOneTakeFewStamps) {
   const Volume volume("A", "64m");
   fs::create_directory(volume.Path() + "/Pictures");
@@ -364,6 +378,19 @@ TEST_F(VolumeWorkTest, APhotoThatIsReplacedByOneOfTheSameSizeAndTimeIsRenderedAg
   std::fstream(At("a.jpg"), std::ios::in | std::ios::out).close();
   Write(At("c.txt"));
   EXPECT_TRUE(WorkUntilFound(STATES, {"a.jpg|3", "c.txt|1"}));
+}
+
+TEST_F(IndexerTest, AChangeOfAFileIsEnteredUnderItsOtherNamesToo) {
+  const Volume volume("A", "64m");
+  Write(volume.Path() + "/One/a.jpg", "1");
+  fs::create_directory(volume.Path() + "/Two");
+  fs::create_hard_link(volume.Path() + "/One/a.jpg", volume.Path() + "/Two/b.jpg");
+  StartService();
+  StartIndexerIn({"PROBE_CLOCK_SPEED=20"}); // the walk of all folders is on a timer
+  ASSERT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  ASSERT_TRUE(Await([&] { return State(volume.Path()) == "watching"; }));
+  Write(volume.Path() + "/One/a.jpg", "12");
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
 }
 
 TEST_F(VolumeWorkTest, AFileThatIsTruncatedByItsNameIsEnteredSoon) {

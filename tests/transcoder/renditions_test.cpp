@@ -427,6 +427,22 @@ TEST_F(Renditions, TheFolderOfTheVolumesIsNoVolume) {
   EXPECT_FALSE(fs::exists("/shares/.orva/renditions"));
 }
 
+TEST_F(Renditions, AreMadeAgainWhenTheirFolderWasRemoved) {
+  Copy("a.jpg");
+  AddWaiting("a.jpg");
+  RenderAll();
+  Announce("end");
+  ASSERT_TRUE(fs::exists(Rendition("a.jpg")));
+  Copy("b.jpg");
+  AddWaiting("b.jpg");
+  RenderAll(); // the folder was seen now
+  fs::remove_all(At(".orva/renditions"));
+  Announce("end");
+  EXPECT_TRUE(
+      Await([this] { return fs::exists(Rendition("a.jpg")) && fs::exists(Rendition("b.jpg")); }));
+  EXPECT_TRUE(Await([this] { return Waiting() == 0; }));
+}
+
 TEST_F(Renditions, AVolumeThatBecomesFullIsReportedOnceAndTriedAgain) {
   // There is enough space for one rendition, but not for all.
   RunChecked({"vips", "gaussnoise", "/tmp/noise.v", "1500", "1500", "--sigma", "90"});

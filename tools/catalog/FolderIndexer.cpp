@@ -200,6 +200,7 @@ void FolderIndexer::Examine(const IndexedFolder& folder, int descriptor, const c
     listing.files.push_back({.name = name,
                              .lastModifiedDate = found.st_mtime,
                              .size = found.st_size,
+                             .isLinked = found.st_nlink > 1,
                              .access = {.mode = found.st_mode,
                                         .owner = found.st_uid,
                                         .group = found.st_gid,
@@ -425,6 +426,7 @@ void FolderIndexer::UpdateFile(const IndexedFolder& folder, const FileChange& ch
     // When a folder was deleted, its files left the photo database, too. When it comes back, they
     // are written again although they have not changed.
     ++summary_.changed;
+    summary_.linked += entry.isLinked ? 1 : 0;
   }
   const std::string extension = ExtensionOf(entry.name);
   const Category category = CategoryOf(extension);

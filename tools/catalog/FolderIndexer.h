@@ -32,6 +32,7 @@ struct IndexSummary {
   long long changed = 0;
   long long deleted = 0;
   long long revived = 0;
+  long long linked = 0; ///< of those that were changed, files with several names
 
   /// A message for each folder or file that could not be read. Its rows and those of what is below
   /// it are unchanged, because it may still exist.
@@ -120,7 +121,8 @@ private:
     bool isKnown = true; ///< false: its row must stay as it is
     std::time_t lastModifiedDate = 0;
     long long size = 0;
-    PhotoAccess access{}; ///< of a file
+    bool isLinked = false; ///< a file with several names
+    PhotoAccess access{};  ///< of a file
   };
   /// What the catalog says about one of them.
   struct FolderRow {

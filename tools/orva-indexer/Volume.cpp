@@ -177,6 +177,8 @@ void Volume::Handle(const FolderWatches::Event& event) {
       NoteFile(event);
     }
     MarkDirty(event.folder);
+  } else if ((event.mask & (IN_DELETE | IN_MOVED_FROM)) != 0) {
+    MarkDirty(""); // makes the catalog again
   }
 }
 
@@ -248,6 +250,7 @@ void Volume::StartAgain() {
 }
 
 void Volume::WalkAll() {
+  isWalkWanted_ = false;
   pending_.clear();
   ready_.clear();
   ready_.push_back({.path = "", .recursive = true});
@@ -264,7 +267,7 @@ Clock::time_point Volume::NextWork() const {
   if (!ready_.empty() || isUnmounted_ || isStampWanted_ || isStampDue_) {
     next = Clock::time_point::min();
   }
-  if (!watches_ && ready_.empty()) {
+  if (IsWalkNeeded() && ready_.empty()) {
     next = std::min(next, nextWalk_);
   }
   for (const auto& [folder, pending] : pending_) {
@@ -278,6 +281,10 @@ void Volume::TakeDue() {
   if (!watches_ && ready_.empty() && now >= nextWalk_ && isWalked_) {
     // The watch limit may have been raised.
     StartAgain();
+    return;
+  }
+  if (isWalkWanted_ && ready_.empty() && now >= nextWalk_ && isWalked_) {
+    WalkAll();
     return;
   }
   for (auto entry = pending_.begin(); entry != pending_.end();) {
@@ -488,8 +495,12 @@ void Volume::WalkNext(FolderIndexer& indexer) {
   }
   folder->revived = task.revived;
   const long long rows = indexer.Summary().rows;
+  const long long linked = indexer.Summary().linked;
   hasOtherAccess_ = false;
   std::vector<Folder> inside = indexer.Update(*folder);
+  if (!task.recursive && indexer.Summary().linked > linked) {
+    isWalkWanted_ = true; // the event was about one of the file's names
+  }
   if (isWalkingAll_) {
     walkedFolders_ += static_cast<long long>(inside.size());
     walkedFiles_ += indexer.Summary().rows - rows;

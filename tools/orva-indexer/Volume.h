@@ -142,6 +142,7 @@ private:
   void Handle(const FolderWatches::Event& event);
   void NoteFile(const FolderWatches::Event& event);
   void TakeDue();
+  bool IsWalkNeeded() const { return !watches_ || isWalkWanted_; }
   std::unique_ptr<db::VolumeDB> OpenCatalog(const catalog::VolumeRoot& root, std::time_t latest);
   void SetAside(const catalog::VolumeRoot& root, const std::string& reason);
   void CheckIdentity(const db::DB& catalog, const Found& found);
@@ -182,7 +183,8 @@ private:
   std::size_t asked_ = 0;                ///< files of this walk, whether they are open for writing
   std::unordered_map<std::string, Look> looks_;
   Clock::time_point notBefore_{};                ///< no work earlier
-  Clock::time_point nextWalk_{};                 ///< of all folders, where they are not watched
+  Clock::time_point nextWalk_{};                 ///< of all folders, if one is needed
+  bool isWalkWanted_ = false;                    ///< also where the folders are watched
   std::optional<Clock::time_point> lockedSince_; ///< by another program
   bool isLockLogged_ = false;
   bool isStampWanted_ = false;

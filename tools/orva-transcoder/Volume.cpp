@@ -259,7 +259,8 @@ void Volume::Look() {
       return;
     }
     Count(*volume->catalog);
-    if (identity_ != volume->identity) {
+    if (const bool wereRemoved = WereRenditionsRemoved(*volume);
+        wereRemoved || identity_ != volume->identity) {
       identity_ = volume->identity;
       isChecked_ = false;
       nextToCheck_ = 0;
@@ -274,6 +275,18 @@ void Volume::Look() {
 void Volume::Count(const db::VolumeDB& catalog) {
   waiting_ = static_cast<std::size_t>(catalog::CountWaiting(catalog));
   failed_ = static_cast<std::size_t>(catalog::CountFailed(catalog));
+}
+
+/// Whether the folder of the renditions is not the one that was there.
+bool Volume::WereRenditionsRemoved(const Opened& volume) {
+  const util::FileDescriptor folder = volume.root.Open(catalog::RENDITIONS, O_PATH);
+  struct stat status {};
+  const auto former = renditions_;
+  renditions_.reset();
+  if (folder && fstat(folder.Get(), &status) == 0) {
+    renditions_ = {status.st_dev, status.st_ino};
+  }
+  return former && renditions_ != former;
 }
 
 void Volume::RemoveVanished(const Opened& volume) {

@@ -5,6 +5,8 @@
 #include "Renditions.h"
 #include "VolumeRoot.h"
 
+#include <sys/types.h>
+
 #include <chrono>
 #include <cstddef>
 #include <ctime>
@@ -14,6 +16,7 @@
 #include <optional>
 #include <set>
 #include <string>
+#include <utility>
 #include <vector>
 
 namespace orva::db {
@@ -113,6 +116,7 @@ private:
   void Report(const std::string& failure, bool isBusy);
   void ReportFull(const std::string& problem);
   void Count(const db::VolumeDB& catalog);
+  bool WereRenditionsRemoved(const Opened& volume);
   void RemoveVanished(const Opened& volume);
   /// Leaves the photo out for some time. Returns false if that was done often enough.
   bool Postpone(const catalog::WaitingPhoto& photo, const std::string& reason);
@@ -143,7 +147,8 @@ private:
   std::optional<catalog::WaitingPhoto> last_; ///< that was staged or left out
   std::map<long long, Postponed> postponed_;  ///< by id
   std::optional<Clock::time_point> endPostponementsAt_;
-  long long nextToCheck_ = 0; ///< id
+  std::optional<std::pair<dev_t, ino_t>> renditions_; ///< the folder, when last looked at
+  long long nextToCheck_ = 0;                         ///< id
   /// First ids of the folders that are examined after those that the catalog needs.
   std::optional<std::vector<long long>> otherFolders_;
   bool isChecked_ = true; ///< all renditions are
