@@ -33,7 +33,7 @@ public:
 
 private:
   void Save();
-  bool Write(const std::string& file) const;
+  bool Write(const std::string& copy) const;
 
   const std::string directory_;
   const std::string file_;
