@@ -303,6 +303,25 @@ TEST_F(IndexerTest, ACatalogIsMadeAgainWhenItsFolderIsRemoved) {
   EXPECT_TRUE(Await([&] { return fs::exists(CatalogOf(volume.Path())); }));
 }
 
+TEST_F(IndexerTest, AChangeOfADiskThatIsMountedTwiceIsAnnouncedForBothVolumes) {
+  const Volume volume("A", "64m");
+  Write(volume.Path() + "/a.jpg");
+  StartService();
+  StartIndexer();
+  ASSERT_TRUE(Await([&] { return Count(Events(volume.Path()), "End") == 1; }));
+  fs::create_directory("/shares/B");
+  ASSERT_EQ(mount(volume.Path().c_str(), "/shares/B", nullptr, MS_BIND, nullptr), 0);
+  ASSERT_TRUE(Await([&] { return Count(Events("/shares/B"), "End") == 1; }));
+  for (const std::string path : {"/shares/A", "/shares/B"}) {
+    const long endsOfA = Count(Events(volume.Path()), "End");
+    const long endsOfB = Count(Events("/shares/B"), "End");
+    Write(path + "/b.jpg", path);
+    EXPECT_TRUE(Await([&] { return Count(Events(volume.Path()), "End") > endsOfA; }));
+    EXPECT_TRUE(Await([&] { return Count(Events("/shares/B"), "End") > endsOfB; }));
+  }
+  umount2("/shares/B", MNT_DETACH);
+}
+
 TEST_F(IndexerTest, PhotosThatArriveOneByOneTakeFewStamps) {
   const Volume volume("A", "64m");
   fs::create_directory(volume.Path() + "/Pictures");

@@ -12,6 +12,8 @@
 #include <gmock/gmock.h>
 #include <nlohmann/json.hpp>
 
+#include <sys/mount.h>
+
 namespace {
 
 namespace catalog = orva::catalog;
@@ -40,6 +42,22 @@ TEST_F(Announcements, TheEndIsAnnouncedWhenNoPhotoWaits) {
   Announce("scanned");
   ASSERT_TRUE(AwaitSent("Name=\"End\" MountPoint=\"/shares/A\""));
   EXPECT_EQ(Waiting(), 0);
+}
+
+TEST_F(Announcements, ADiskThatIsMountedTwiceIsAnnouncedAsBothVolumes) {
+  const std::string other = "/shares/B";
+  AddAllWaiting({}); // makes the catalog
+  fs::create_directory(other);
+  ASSERT_EQ(mount(Root().c_str(), other.c_str(), nullptr, MS_BIND, nullptr), 0);
+  TranscoderTest::Announce("plugged", other);
+  TranscoderTest::Announce("scanned", other);
+  Announce("scanned");
+  ASSERT_TRUE(AwaitSent("Name=\"End\" MountPoint=\"/shares/A\""));
+  AddPhotos(3);
+  Announce("transcoded");
+  EXPECT_TRUE(AwaitSent("Name=\"End\" MountPoint=\"/shares/B\""));
+  EXPECT_EQ(Waiting(), 0);
+  umount2(other.c_str(), MNT_DETACH);
 }
 
 TEST_F(Announcements, NothingIsAnnouncedBeforeTheVolumeWasScanned) {

@@ -287,6 +287,18 @@ void Service::WorkOnNext() {
     Forget(mountPoint);
   } else {
     AnnounceResult(known, result);
+    if (result.hasChanged) {
+      AnnounceOtherMounts(known);
+    }
+  }
+}
+
+/// A disk that is mounted twice is two volumes with one catalog. Only one of them finds a change.
+void Service::AnnounceOtherMounts(const Known& changed) {
+  for (const auto& [mountPoint, known] : volumes_) {
+    if (known.get() != &changed && known->volume.Identity() == changed.volume.Identity()) {
+      AnnounceResult(*known, {.hasChanged = true});
+    }
   }
 }
 

@@ -63,6 +63,7 @@ private:
   void AnnounceAgain();
   void WorkOnNext();
   void AnnounceResult(Known& known, const Volume::Result& result);
+  void AnnounceOtherMounts(const Known& changed);
   void AnnounceChanges(Known& known);
   void AnnounceScanned(Known& known);
   void Announce(Known& known, notify::Event event, bool handled = false);

@@ -162,13 +162,24 @@ void Transcoder::StoreRendered(Known& known) {
   }
   running_.erase(rendered, running_.end());
   const std::size_t changes = volume.TakeChanges();
-  if (changes > 0) {
-    if (known.changes == 0) {
-      known.changedAt = Clock::now();
-    }
-    known.changes += changes;
-    known.isEndDue = true;
+  if (changes == 0) {
+    return;
   }
+  for (auto& [mountPoint, other] : volumes_) {
+    // A disk that is mounted twice is two volumes with one catalog.
+    const std::string& identity = other.volume.Identity();
+    if (&other == &known || (!identity.empty() && identity == volume.Identity())) {
+      AddChanges(other, changes);
+    }
+  }
+}
+
+void Transcoder::AddChanges(Known& known, std::size_t changes) {
+  if (known.changes == 0) {
+    known.changedAt = Clock::now();
+  }
+  known.changes += changes;
+  known.isEndDue = true;
 }
 
 void Transcoder::LookAgain() {

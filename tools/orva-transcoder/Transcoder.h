@@ -60,6 +60,7 @@ private:
   void Handle(const notifications::Notification& notification);
   void StoreRendered();
   void StoreRendered(Known& known);
+  static void AddChanges(Known& known, std::size_t changes);
   bool IsUseless(const Batch& batch);
   void LookAgain();
   void StageNext();

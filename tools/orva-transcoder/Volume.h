@@ -46,6 +46,8 @@ public:
   Volume(std::string mountPoint, catalog::VolumeRoot::Kind kind);
 
   const std::string& MountPoint() const noexcept { return mountPoint_; }
+  /// The identity of its catalog; empty while that is not known.
+  const std::string& Identity() const noexcept { return identity_; }
   std::size_t Waiting() const noexcept { return waiting_; }
   std::size_t Failed() const noexcept { return failed_; }
 
