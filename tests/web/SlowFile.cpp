@@ -4,11 +4,10 @@
 
 #include <algorithm>
 #include <chrono>
-#include <cstring>
 #include <new>
+#include <optional>
 #include <stdexcept>
 #include <thread>
-#include <utility>
 
 namespace orva::test {
 
@@ -27,75 +26,76 @@ struct Watch {
   int most = 0;
 };
 
-Watch* watch = nullptr;
-sqlite3_vfs* systems = nullptr;
-sqlite3_vfs slow;
-sqlite3_io_methods methods;
+std::optional<Watch> watch;
+sqlite3_vfs* systemVfs = nullptr;
+sqlite3_vfs slowVfs;
+sqlite3_io_methods slowMethods;
 
-sqlite3_file* Real(sqlite3_file* file) {
+sqlite3_file* RealFile(sqlite3_file* file) {
   return reinterpret_cast<sqlite3_file*>(reinterpret_cast<WatchedFile*>(file) + 1);
 }
 
-int Read(sqlite3_file* file, void* buffer, int size, sqlite3_int64 offset) {
-  if (watch != nullptr && reinterpret_cast<WatchedFile*>(file)->isSlow) {
+int ReadSlowly(sqlite3_file* file, void* buffer, int size, sqlite3_int64 offset) {
+  if (watch && reinterpret_cast<WatchedFile*>(file)->isSlow) {
     std::this_thread::sleep_for(std::chrono::milliseconds(1));
     ++watch->reads;
     watch->most = std::max(watch->most, ++watch->locked);
   }
-  return Real(file)->pMethods->xRead(Real(file), buffer, size, offset);
+  return RealFile(file)->pMethods->xRead(RealFile(file), buffer, size, offset);
 }
 
-int Unlock(sqlite3_file* file, int level) {
-  if (watch != nullptr && reinterpret_cast<WatchedFile*>(file)->isSlow &&
-      level == SQLITE_LOCK_NONE) {
+int UnlockWatched(sqlite3_file* file, int level) {
+  if (watch && reinterpret_cast<WatchedFile*>(file)->isSlow && level == SQLITE_LOCK_NONE) {
     watch->locked = 0;
   }
-  return Real(file)->pMethods->xUnlock(Real(file), level);
+  return RealFile(file)->pMethods->xUnlock(RealFile(file), level);
 }
 
 void SetMethods() {
-  methods.iVersion = 1;
-  methods.xClose = [](sqlite3_file* file) { return Real(file)->pMethods->xClose(Real(file)); };
-  methods.xRead = &Read;
-  methods.xWrite = [](sqlite3_file* file, const void* bytes, int size, sqlite3_int64 offset) {
-    return Real(file)->pMethods->xWrite(Real(file), bytes, size, offset);
+  slowMethods.iVersion = 1;
+  slowMethods.xClose = [](sqlite3_file* file) {
+    return RealFile(file)->pMethods->xClose(RealFile(file));
   };
-  methods.xTruncate = [](sqlite3_file* file, sqlite3_int64 size) {
-    return Real(file)->pMethods->xTruncate(Real(file), size);
+  slowMethods.xRead = &ReadSlowly;
+  slowMethods.xWrite = [](sqlite3_file* file, const void* bytes, int size, sqlite3_int64 offset) {
+    return RealFile(file)->pMethods->xWrite(RealFile(file), bytes, size, offset);
   };
-  methods.xSync = [](sqlite3_file* file, int flags) {
-    return Real(file)->pMethods->xSync(Real(file), flags);
+  slowMethods.xTruncate = [](sqlite3_file* file, sqlite3_int64 size) {
+    return RealFile(file)->pMethods->xTruncate(RealFile(file), size);
   };
-  methods.xFileSize = [](sqlite3_file* file, sqlite3_int64* size) {
-    return Real(file)->pMethods->xFileSize(Real(file), size);
+  slowMethods.xSync = [](sqlite3_file* file, int flags) {
+    return RealFile(file)->pMethods->xSync(RealFile(file), flags);
   };
-  methods.xLock = [](sqlite3_file* file, int level) {
-    return Real(file)->pMethods->xLock(Real(file), level);
+  slowMethods.xFileSize = [](sqlite3_file* file, sqlite3_int64* size) {
+    return RealFile(file)->pMethods->xFileSize(RealFile(file), size);
   };
-  methods.xUnlock = &Unlock;
-  methods.xCheckReservedLock = [](sqlite3_file* file, int* isReserved) {
-    return Real(file)->pMethods->xCheckReservedLock(Real(file), isReserved);
+  slowMethods.xLock = [](sqlite3_file* file, int level) {
+    return RealFile(file)->pMethods->xLock(RealFile(file), level);
   };
-  methods.xFileControl = [](sqlite3_file* file, int operation, void* argument) {
-    return Real(file)->pMethods->xFileControl(Real(file), operation, argument);
+  slowMethods.xUnlock = &UnlockWatched;
+  slowMethods.xCheckReservedLock = [](sqlite3_file* file, int* isReserved) {
+    return RealFile(file)->pMethods->xCheckReservedLock(RealFile(file), isReserved);
   };
-  methods.xSectorSize = [](sqlite3_file* file) {
-    return Real(file)->pMethods->xSectorSize(Real(file));
+  slowMethods.xFileControl = [](sqlite3_file* file, int operation, void* argument) {
+    return RealFile(file)->pMethods->xFileControl(RealFile(file), operation, argument);
   };
-  methods.xDeviceCharacteristics = [](sqlite3_file* file) {
-    return Real(file)->pMethods->xDeviceCharacteristics(Real(file));
+  slowMethods.xSectorSize = [](sqlite3_file* file) {
+    return RealFile(file)->pMethods->xSectorSize(RealFile(file));
+  };
+  slowMethods.xDeviceCharacteristics = [](sqlite3_file* file) {
+    return RealFile(file)->pMethods->xDeviceCharacteristics(RealFile(file));
   };
 }
 
 /// Only databases that are opened to be read are watched: others may use a write-ahead log.
-int Open(sqlite3_vfs* /*vfs*/, const char* name, sqlite3_file* file, int flags, int* outFlags) {
-  if (name == nullptr || watch == nullptr || watch->path != name ||
-      (flags & SQLITE_OPEN_READONLY) == 0) {
-    return systems->xOpen(systems, name, file, flags, outFlags);
+int OpenWatched(sqlite3_vfs* /*vfs*/, const char* name, sqlite3_file* file, int flags,
+                int* outFlags) {
+  if (name == nullptr || !watch || watch->path != name || (flags & SQLITE_OPEN_READONLY) == 0) {
+    return systemVfs->xOpen(systemVfs, name, file, flags, outFlags);
   }
   auto* const watched = new (file) WatchedFile{.base = {}, .isSlow = true};
-  const int code = systems->xOpen(systems, name, Real(file), flags, outFlags);
-  watched->base.pMethods = Real(file)->pMethods == nullptr ? nullptr : &methods;
+  const int code = systemVfs->xOpen(systemVfs, name, RealFile(file), flags, outFlags);
+  watched->base.pMethods = RealFile(file)->pMethods == nullptr ? nullptr : &slowMethods;
   return code;
 }
 
@@ -103,21 +103,21 @@ int Open(sqlite3_vfs* /*vfs*/, const char* name, sqlite3_file* file, int flags, 
 
 SlowFile::SlowFile(const std::string& path) {
   SetMethods();
-  systems = sqlite3_vfs_find(nullptr);
-  slow = *systems;
-  slow.zName = "slow";
-  slow.szOsFile += static_cast<int>(sizeof(WatchedFile));
-  slow.xOpen = &Open;
-  watch = new Watch{.path = path};
-  if (sqlite3_vfs_register(&slow, 1) != SQLITE_OK) {
+  systemVfs = sqlite3_vfs_find(nullptr);
+  slowVfs = *systemVfs;
+  slowVfs.zName = "slow";
+  slowVfs.szOsFile += static_cast<int>(sizeof(WatchedFile));
+  slowVfs.xOpen = &OpenWatched;
+  watch = Watch{.path = path};
+  if (sqlite3_vfs_register(&slowVfs, 1) != SQLITE_OK) {
     throw std::runtime_error("cannot register the slow disk");
   }
 }
 
 SlowFile::~SlowFile() {
-  sqlite3_vfs_unregister(&slow);
-  sqlite3_vfs_register(systems, 1);
-  delete std::exchange(watch, nullptr);
+  sqlite3_vfs_unregister(&slowVfs);
+  sqlite3_vfs_register(systemVfs, 1);
+  watch.reset();
 }
 
 int SlowFile::Reads() const noexcept {

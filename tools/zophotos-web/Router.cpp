@@ -15,12 +15,12 @@ namespace orva::web {
 namespace {
 
 constexpr std::size_t PAGE_SIZE = 100; // photos or folders
-constexpr std::size_t MOST_VOLUMES = 1'000;
-constexpr std::size_t MOST_ANCESTORS = 100;
+constexpr std::size_t MOST_SHOWN_VOLUMES = 1'000;
+constexpr std::size_t MOST_SHOWN_ANCESTORS = 100;
 
 /// Bytes of the names and paths in one list, which are several times as many in the response. A
 /// list with more has fewer items.
-constexpr std::size_t MOST_BYTES = 64 << 10;
+constexpr std::size_t MOST_LIST_BYTES = 64 << 10;
 constexpr std::string_view API = "/api/";
 
 constexpr int NOT_MODIFIED = 304;
@@ -95,15 +95,15 @@ std::size_t BytesOf(const Volume& volume) {
   return volume.mountPoint.size() + volume.activity.size();
 }
 
-/// Shortens a list at one end to at most `count` items and MOST_BYTES, but not to nothing. Each
-/// item has `more` bytes in addition. Returns whether the list was longer.
+/// Shortens a list at one end to at most `count` items and MOST_LIST_BYTES, but not to nothing.
+/// Each item has `more` bytes in addition. Returns whether the list was longer.
 template <typename Item>
 bool CutOff(std::vector<Item>& items, std::size_t count, bool atBegin, std::size_t more = 0) {
   std::size_t kept = 0;
   std::size_t bytes = 0;
   while (kept < std::min(count, items.size())) {
     bytes += BytesOf(atBegin ? items[items.size() - 1 - kept] : items[kept]) + more;
-    if (kept > 0 && bytes > MOST_BYTES) {
+    if (kept > 0 && bytes > MOST_LIST_BYTES) {
       break;
     }
     ++kept;
@@ -150,7 +150,7 @@ std::optional<Folder> FolderAfter(const Readers::Lease& reader, const Target& ta
 /// The folders that contain a folder: the nearest ones, from the top.
 std::vector<Folder> AncestorsOf(const Readers::Lease& reader, std::int64_t folder) {
   std::vector<Folder> ancestors = reader->Ancestors(folder);
-  CutOff(ancestors, MOST_ANCESTORS, true);
+  CutOff(ancestors, MOST_SHOWN_ANCESTORS, true);
   return ancestors;
 }
 
@@ -434,13 +434,13 @@ Response Router::StatusJson() {
 
 /// What all pages show.
 Site Router::MakeSite() {
-  std::vector<VolumeRow> rows = Readers::Lease(readers_)->Volumes(MOST_BYTES);
+  std::vector<VolumeRow> rows = Readers::Lease(readers_)->Volumes(MOST_LIST_BYTES);
   // The snapshot has no more than these.
-  const bool isFull = rows.size() >= MOST_VOLUMES || CutOff(rows, MOST_VOLUMES, false);
+  const bool isFull = rows.size() >= MOST_SHOWN_VOLUMES || CutOff(rows, MOST_SHOWN_VOLUMES, false);
   Site site{.snapshot = snapshot_.Status(),
             .volumes = Combine(rows, zophotos::ReadActivity()),
             .mayHaveMoreVolumes = isFull};
-  site.mayHaveMoreVolumes = CutOff(site.volumes, MOST_VOLUMES, false) || isFull;
+  site.mayHaveMoreVolumes = CutOff(site.volumes, MOST_SHOWN_VOLUMES, false) || isFull;
   return site;
 }
 
