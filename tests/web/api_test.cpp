@@ -121,6 +121,16 @@ TEST_F(WebApi, TellsOfMergesAndOfTheServices) {
   events->ReadUntil("event: volumes\n");
 }
 
+TEST_F(WebApi, TellsThatTheSnapshotIsBuilt) {
+  const auto events = OpenEvents();
+  const std::string database = "/shares/A/.zophotos/zophotos.db";
+  fs::copy_file(database, database + ".copy");
+  fs::rename(database + ".copy", database);
+  events->ReadUntil("event: volumes\n");
+  events->ReadUntil("event: change\n");
+  EXPECT_TRUE(AwaitPhotos(3));
+}
+
 TEST_F(WebApi, ForgetsTheDatabaseOfAnUnpluggedMaster) {
   const auto events = OpenEvents();
   appliance.Handle(Unplugged(a.Path()));

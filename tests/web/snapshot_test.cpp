@@ -68,6 +68,16 @@ TEST_F(ChangingSnapshot, PhotosOfTheSameTimeAreOrderedByTheirRows) {
   EXPECT_THAT(Names(), ElementsAre("3.jpg", "2.jpg", "1.jpg"));
 }
 
+TEST_F(ChangingSnapshot, TellsThatItBuildsBeforeItDoes) {
+  std::vector<State> states;
+  const auto tell = [&] { states.push_back(snapshot_->Status().state); };
+  EXPECT_TRUE(snapshot_->Update({}, tell));
+  EXPECT_THAT(states, ElementsAre(State::Building));
+  merged_->AddFile(a_, "1.jpg", 100, A);
+  EXPECT_TRUE(snapshot_->Update({}, tell));
+  EXPECT_THAT(states, SizeIs(1));
+}
+
 TEST_F(ChangingSnapshot, AnUpdateWithoutAChangeChangesNothing) {
   merged_->AddFile(a_, "1.jpg", 100, A);
   EXPECT_TRUE(Update());

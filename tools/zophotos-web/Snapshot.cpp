@@ -125,14 +125,14 @@ public:
     }
   }
 
-  bool Update(const std::stop_token& stop) {
+  bool Update(const std::stop_token& stop, const std::function<void()>& tellBuild) {
     const std::int64_t before = file_->State().version;
     if (damaged_.exchange(false)) {
       Log("the snapshot " + File() + " is damaged; building it again");
       mustBuild_ = true;
     }
     try {
-      UpdateFrom(FindDatabase(), stop);
+      UpdateFrom(FindDatabase(), stop, tellBuild);
     } catch (const Stopped&) {
       Discard();
     } catch (const zophotos::Failure& failure) {
@@ -227,7 +227,8 @@ private:
     SetStatus(State::Current);
   }
 
-  void UpdateFrom(const std::string& path, const std::stop_token& stop) {
+  void UpdateFrom(const std::string& path, const std::stop_token& stop,
+                  const std::function<void()>& tellBuild) {
     const auto identity = Identify(path);
     if (identity == failed_ && Clock::now() < nextTry_) {
       return;
@@ -242,6 +243,10 @@ private:
     MergedSource source(path);
     const bool isOther = !identity || identity->file != file_->State().source.file;
     if (mustBuild_ || isOther || !Continue(source, *identity, stop)) {
+      SetStatus(State::Building);
+      if (tellBuild) {
+        tellBuild();
+      }
       Build(source, identity.value_or(SourceIdentity()), stop);
     }
     Succeed();
@@ -354,7 +359,6 @@ private:
 
   /// Makes a new snapshot next to the present one and replaces that.
   void Build(MergedSource& source, const SourceIdentity& identity, const std::stop_token& stop) {
-    SetStatus(State::Building);
     directory_.RemoveOthers(number_);
     SnapshotFile file = CreateNext();
     SnapshotState& state = file.State();
@@ -486,8 +490,8 @@ Snapshot::Snapshot(const std::string& directory, FindPath findPath)
 
 Snapshot::~Snapshot() = default;
 
-bool Snapshot::Update(const std::stop_token& stop) {
-  return implementation_->Update(stop);
+bool Snapshot::Update(const std::stop_token& stop, const std::function<void()>& tellBuild) {
+  return implementation_->Update(stop, tellBuild);
 }
 
 SnapshotStatus Snapshot::Status() const {

@@ -45,8 +45,9 @@ public:
   /// Brings the snapshot up to date if the locator or the merged database has changed. Locks the
   /// merged database for about 20 milliseconds at a time, and does not keep it open afterwards.
   /// Returns whether readers see a change. Errors become the status; after an error, the next try
-  /// may be a minute later. One thread; `stop` ends a long update early.
-  bool Update(const std::stop_token& stop = {});
+  /// may be a minute later. One thread; `stop` ends a long update early. Calls `tellBuild` when the
+  /// status has become Building.
+  bool Update(const std::stop_token& stop = {}, const std::function<void()>& tellBuild = {});
 
   /// Any thread.
   SnapshotStatus Status() const;

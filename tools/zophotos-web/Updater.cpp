@@ -28,15 +28,21 @@ void Updater::Run(const std::stop_token& stop) {
 }
 
 void Updater::Update(const std::stop_token& stop) {
-  snapshot_.Update(stop);
+  snapshot_.Update(stop, [this] { PublishStatus(); });
   events_.PublishVersion(reader_.Version());
+  PublishStatus();
+  const SnapshotStatus status = snapshot_.Status();
+  Log(status.state == SnapshotStatus::State::Failed ? status.reason : "");
+}
+
+/// Tells the pages of another status.
+void Updater::PublishStatus() {
   const SnapshotStatus status = snapshot_.Status();
   const bool hasOtherState = std::exchange(state_, status.state) != status.state;
   const bool hasOtherReason = std::exchange(reason_, status.reason) != status.reason;
   if (hasOtherState || hasOtherReason) {
     events_.PublishVolumes();
   }
-  Log(status.state == SnapshotStatus::State::Failed ? status.reason : "");
 }
 
 /// Logs a problem once. An empty one ends the problem.

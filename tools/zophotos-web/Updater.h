@@ -18,6 +18,7 @@ public:
 private:
   void Run(const std::stop_token& stop);
   void Update(const std::stop_token& stop);
+  void PublishStatus();
   void Log(const std::string& problem);
 
   Snapshot& snapshot_;
