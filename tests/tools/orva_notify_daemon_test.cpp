@@ -26,7 +26,6 @@ namespace {
 
 using namespace orva;
 using namespace orva::test;
-using notify::Request;
 namespace fs = std::filesystem;
 
 void AddPhotos(Catalog& catalog, int count) {
