@@ -424,6 +424,7 @@ void Volume::AddUnopened(BatchPhoto photo, int error, Batch& batch) {
   case ENOENT:
   case ENOTDIR:
   case ELOOP:
+  case EXDEV:  // a crafted row: the path leads out of the volume
     return;    // the indexer will notice that
   case EAGAIN: // another program has a lease on it
   case EINTR:
