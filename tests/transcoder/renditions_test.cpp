@@ -427,6 +427,17 @@ TEST_F(Renditions, TheFolderOfTheVolumesIsNoVolume) {
   EXPECT_FALSE(fs::exists("/shares/.orva/renditions"));
 }
 
+TEST_F(Renditions, APhotoWhosePathIsTooLongFails) {
+  std::string path;
+  for (int folder = 0; folder < 30; ++folder) {
+    path += std::string(200, 'x') + '/';
+  }
+  AddWaiting(path + "a.jpg");
+  Announce("scanned");
+  EXPECT_TRUE(Await([&] { return Waiting() == 0; }));
+  EXPECT_EQ(StateOf(path + "a.jpg"), "failed: cannot be opened: File name too long");
+}
+
 TEST_F(Renditions, AreMadeAgainWhenTheirFolderWasRemoved) {
   Copy("a.jpg");
   AddWaiting("a.jpg");

@@ -417,6 +417,28 @@ void Volume::PostponeOrFail(Batch& batch) {
   }
 }
 
+/// Adds a photo that cannot be opened to the batch, unless it is gone or the reason may pass.
+void Volume::AddUnopened(BatchPhoto photo, int error, Batch& batch) {
+  photo.failure = catalog::NOT_OPENED + ErrorText(error);
+  switch (error) {
+  case ENOENT:
+  case ENOTDIR:
+  case ELOOP:
+  case EXDEV:  // a crafted row: the path leads out of the volume
+    return;    // the indexer will notice that
+  case EAGAIN: // another program has a lease on it
+  case EINTR:
+  case EMFILE:
+  case ENFILE:
+  case ENOMEM:
+  case ESTALE:
+    LeaveOut(std::move(photo), batch);
+    return;
+  default:
+    batch.photos.push_back(std::move(photo));
+  }
+}
+
 bool Volume::StagePhoto(const Opened& volume, const WaitingPhoto& photo, Batch& batch, Room& room) {
   const std::size_t number = batch.photos.size();
   if (number >= room.limits.photos) {
@@ -425,17 +447,19 @@ bool Volume::StagePhoto(const Opened& volume, const WaitingPhoto& photo, Batch& 
   // To open a device may have an effect: look before.
   struct stat status {};
   const util::FileDescriptor entry = volume.root.Open(photo.path, O_PATH);
-  if (!entry || fstat(entry.Get(), &status) != 0 || !IsPhoto(status, photo)) {
+  if (!entry) {
+    AddUnopened({.photo = photo}, errno, batch);
+    return true;
+  }
+  if (fstat(entry.Get(), &status) != 0 || !IsPhoto(status, photo)) {
     return true; // the indexer will notice what has changed
   }
   const util::FileDescriptor file = volume.root.Open(photo.path, O_RDONLY);
-  const int problem = file ? 0 : errno;
-  if (problem == EACCES || problem == EPERM || problem == EIO) {
-    batch.photos.push_back(
-        {.photo = photo, .status = status, .failure = catalog::NOT_OPENED + ErrorText(problem)});
+  if (!file) {
+    AddUnopened({.photo = photo, .status = status}, errno, batch);
     return true;
   }
-  if (!file || fstat(file.Get(), &status) != 0 || !IsPhoto(status, photo)) {
+  if (fstat(file.Get(), &status) != 0 || !IsPhoto(status, photo)) {
     return true;
   }
   if (status.st_size > LARGEST_PHOTO) {
@@ -523,8 +547,11 @@ std::set<long long> Volume::WriteRenditions(const Opened& volume, Batch& batch) 
     BatchPhoto& photo = batch.photos[number];
     const util::FileDescriptor file = volume.root.Open(photo.photo.path, O_PATH);
     struct stat status {};
-    photo.isOutdated =
-        !file || fstat(file.Get(), &status) != 0 || !IsSameContent(status, photo.status);
+    if (file) {
+      photo.isOutdated = fstat(file.Get(), &status) != 0 || !IsSameContent(status, photo.status);
+    } else {
+      photo.isOutdated = photo.status.st_nlink != 0; // it could be opened before
+    }
     if (photo.isOutdated || !photo.obstacle.empty() || !photo.failure.empty()) {
       continue;
     }

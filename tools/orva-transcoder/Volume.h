@@ -126,6 +126,7 @@ private:
   void EndPostponements();
   void PostponeOrFail(Batch& batch);
   void LeaveOut(BatchPhoto photo, Batch& batch);
+  void AddUnopened(BatchPhoto photo, int error, Batch& batch);
   /// Adds the photo to the batch, or leaves it out until the next message. Returns false if the
   /// batch has no room for it.
   bool StagePhoto(const Opened& volume, const catalog::WaitingPhoto& photo, Batch& batch,
