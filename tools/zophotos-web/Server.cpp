@@ -264,9 +264,10 @@ struct Server::Calls {
     }
     try {
       if (current->request) {
+        const Request& request = *current->request;
         Response response = current->ready ? std::move(*current->ready)
-                                           : Answer(self, current->request->target.path, [&] {
-                                               return self.handlers_.answer(*current->request);
+                                           : Answer(self, request.target.path, [&self, &request] {
+                                               return self.handlers_.answer(request);
                                              });
         if (auto* const work = std::get_if<DiskWork>(&response.body)) {
           Defer(self, connection, *current, std::move(*work));
@@ -275,7 +276,7 @@ struct Server::Calls {
         if (current->isHead && std::holds_alternative<EventStream>(response.body)) {
           response.body = std::string(); // libmicrohttpd would send the end of a stream
         }
-        return Send(self, connection, current->request->target.path, std::move(response));
+        return Send(self, connection, request.target.path, std::move(response));
       }
       const auto refusal = CheckRequest(self, connection, method, version, *current);
       return refusal ? Refuse(self, connection, *refusal, current->text) : MHD_YES;
