@@ -170,11 +170,11 @@ private:
   bool isLimitLogged_ = false;
   bool hasNoEvents_ = false; ///< the file system reports no changes of others
   bool isUnmounted_ = false;
+  bool isUncommitted_ = false;   ///< folders were walked, and that is not committed
   std::set<std::string> mounts_; ///< below the volume, as paths of folders
   Clock::time_point eventsRead_{};
 
-  std::vector<Task> ready_;    ///< the last one is next
-  bool isUncommitted_ = false; ///< folders were walked, and that is not committed
+  std::vector<Task> ready_; ///< the last one is next
   std::map<std::string, Pending> pending_;
   std::unordered_map<std::string, OpenFile> openFiles_;
   /// Paths of photos that were written or replaced since their rows were.
@@ -184,9 +184,9 @@ private:
   std::unordered_map<std::string, Look> looks_;
   Clock::time_point notBefore_{};                ///< no work earlier
   Clock::time_point nextWalk_{};                 ///< of all folders, if one is needed
-  bool isWalkWanted_ = false;                    ///< also where the folders are watched
   std::optional<Clock::time_point> lockedSince_; ///< by another program
   bool isLockLogged_ = false;
+  bool isWalkWanted_ = false; ///< also where the folders are watched
   bool isStampWanted_ = false;
   bool isStampDue_ = false;     ///< of TakeStamp
   bool hasOtherAccess_ = false; ///< the folder that is walked lets other users pass than before
@@ -204,10 +204,10 @@ private:
   std::string unreadableExample_;
   long long files_ = 0; ///< on the volume, as far as known
   Trouble trouble_ = Trouble::None;
+  bool isRetry_ = false; ///< of a volume with trouble, which is not watched yet
+  bool wasJustSetAside_ = false;
   Clock::time_point retryAt_{};            ///< of a volume with trouble
   std::optional<long long> spaceWhenFull_; ///< bytes that were free; nothing if it is not full
-  bool isRetry_ = false;                   ///< of a volume with trouble, which is not watched yet
-  bool wasJustSetAside_ = false;
 };
 
 } // namespace orva::indexer

@@ -86,8 +86,8 @@ public:
 
   std::optional<Photo> Find(PhotoId id);
 
-  /// Folders in `parent`, in the order of their paths' bytes and ids, at most `count`; with `after`,
-  /// only those that follow it.
+  /// Folders in `parent`, in the order of their paths' bytes and ids, at most `count`; with
+  /// `after`, only those that follow it.
   std::vector<Folder> Folders(std::int64_t parent, const std::optional<Folder>& after,
                               std::size_t count);
 

@@ -502,8 +502,8 @@ TEST_F(Convergent, ADiskIsRemovedWhileNothingRuns) {
   ASSERT_TRUE(DatabasePath().starts_with(BIG)) << DatabasePath();
   const std::vector<std::string> units = {"orva-notify", "zophotodbmerger", "orva-indexer",
                                           "orva-transcoder"};
-  for (auto unit = units.rbegin(); unit != units.rend(); ++unit) {
-    Sys().services.Control("stop", *unit);
+  for (const std::string& unit : std::vector<std::string>(units.rbegin(), units.rend())) {
+    Sys().services.Control("stop", unit);
   }
   Unmount(DISK);
   Sys().plugged = {&Sys().photos, &Sys().big};
