@@ -898,6 +898,24 @@ TEST_F(IndexerTest, AFullVolumeIsIndexedWhenThereIsSpace) {
   EXPECT_EQ(LogLines(": full").size(), 1U);
 }
 
+TEST_F(IndexerTest, AVolumeWithoutFreeInodesKeepsItsCatalog) {
+  Volume volume("A", "8m,nr_inodes=40");
+  Write(volume.Path() + "/a.jpg");
+  StartService();
+  StartIndexer();
+  ASSERT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  int fillers = 0;
+  while (std::ofstream(volume.Path() + "/filler" + std::to_string(fillers))) {
+    ++fillers;
+  }
+  ASSERT_TRUE(AwaitLog("/shares/A/: full"));
+  fs::remove(volume.Path() + "/filler0");
+  fs::remove(volume.Path() + "/filler1");
+  fs::remove(volume.Path() + "/filler2");
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  EXPECT_THAT(LogLines("set-aside"), IsEmpty());
+}
+
 TEST_F(VolumeWorkTest, AFullVolumeIsWalkedWhenSomeSpaceHasBecomeFree) {
   Write(At("a.jpg"));
   ASSERT_THAT(WorkUntilFound("SELECT path FROM Files", {"a.jpg"}), true);

@@ -200,6 +200,12 @@ CatalogProblem ProblemOf(const std::string& failure) {
   }
 }
 
+CatalogProblem ProblemOf(const std::string& failure, const VolumeRoot& volume) {
+  return (ExtendedCode(failure) & 0xFF) == SQLITE_CANTOPEN && volume.FreeSpace() == 0
+             ? CatalogProblem::Full
+             : ProblemOf(failure);
+}
+
 std::unique_ptr<db::VolumeDB> ConnectToCatalog(const VolumeRoot& volume) {
   return std::make_unique<LimitedCatalog>(volume.Path());
 }
@@ -211,7 +217,7 @@ std::unique_ptr<db::VolumeDB> OpenUntrustedCatalog(const VolumeRoot& volume, std
   try {
     return Open(volume, latest, busyTimeout);
   } catch (const std::string& failure) {
-    throw CatalogError(ProblemOf(failure), failure);
+    throw CatalogError(ProblemOf(failure, volume), failure);
   }
 }
 

@@ -40,6 +40,9 @@ private:
 /// What a failure of the database layer on a catalog means.
 CatalogProblem ProblemOf(const std::string& failure);
 
+/// The same for the catalog of this volume, which may have no space for a log.
+CatalogProblem ProblemOf(const std::string& failure, const VolumeRoot& volume);
+
 /// Connects to the catalog of a volume that anybody may have prepared, for writing, and checks
 /// nothing. Values much longer than ours cannot be read: they would take much memory. Throws
 /// std::string.

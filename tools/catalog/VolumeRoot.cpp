@@ -89,9 +89,12 @@ util::FileDescriptor VolumeRoot::Open(const std::string& path, int flags, mode_t
 
 long long VolumeRoot::FreeSpace() const {
   struct statvfs status {};
-  return fstatvfs(root_.Get(), &status) == 0
-             ? static_cast<long long>(status.f_bfree) * static_cast<long long>(status.f_frsize)
-             : 0;
+  if (fstatvfs(root_.Get(), &status) != 0) {
+    return 0;
+  }
+  const bool hasInode = status.f_files == 0 || status.f_ffree != 0; // 0 files: made as needed
+  return hasInode ? static_cast<long long>(status.f_bfree) * static_cast<long long>(status.f_frsize)
+                  : 0;
 }
 
 bool VolumeRoot::IsInPlace() const {

@@ -32,7 +32,8 @@ public:
   /// wait for a FIFO. Returns no descriptor, with errno, when that fails.
   util::FileDescriptor Open(const std::string& path, int flags, mode_t mode = 0) const;
 
-  /// Bytes that are free, including those that are reserved; 0 if that is not known.
+  /// Bytes that are free for files, including those that are reserved; 0 if there is no inode for
+  /// another file, or if that is not known.
   long long FreeSpace() const;
 
   /// Whether the volume is still at its path.

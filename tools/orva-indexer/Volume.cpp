@@ -431,7 +431,7 @@ Volume::Result Volume::WorkOn(const VolumeRoot& root, const std::function<void()
       FinishWalk(result, files);
     }
   } catch (const std::string& failure) {
-    const CatalogProblem problem = catalog::ProblemOf(failure);
+    const CatalogProblem problem = catalog::ProblemOf(failure, root);
     if (problem == CatalogProblem::Foreign && root.IsInPlace()) {
       SetAside(root, failure);
       return {};
