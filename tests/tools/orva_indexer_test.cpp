@@ -442,6 +442,21 @@ TEST_F(VolumeWorkTest, APhotoThatIsBeingWrittenWhenTheIndexerStartsWaits) {
   EXPECT_TRUE(WorkUntilFound(FILES, {"a.jpg|1", "b.jpg|1", "slow.jpg|10"}));
 }
 
+TEST_F(VolumeWorkTest, APhotoWhoseEndOfWritingIsNotReportedIsEntered) {
+  constexpr char FILES[] = "SELECT path, size FROM Files ORDER BY path";
+  fs::create_directories(At("1"));
+  fs::create_directories(At("2"));
+  std::ofstream slow(At("1/slow.jpg"));
+  slow << "half" << std::flush;
+  fs::create_hard_link(At("1/slow.jpg"), At("2/link.jpg"));
+  Write(At("a.jpg"), "1");
+  Restart();
+  ASSERT_TRUE(WorkUntilFound(FILES, {"a.jpg|1"}));
+  slow << " whole";
+  slow.close(); // reported for the other name
+  EXPECT_TRUE(WorkUntilFound(FILES, {"1/slow.jpg|10", "2/link.jpg|10", "a.jpg|1"}));
+}
+
 TEST_F(IndexerTest, ALinkIsEnteredAlthoughItIsNeverClosed) {
   const Volume volume("A", "64m");
   Write("/tmp/elsewhere.jpg");

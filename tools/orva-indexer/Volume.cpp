@@ -111,6 +111,12 @@ bool IsPhoto(const std::string& name) {
   return catalog::CategoryOf(catalog::ExtensionOf(name)) == catalog::PHOTO;
 }
 
+/// When to look again at a file that is open, by the time since it was written.
+Clock::time_point NextCheck(Clock::time_point written) {
+  const auto now = Clock::now();
+  return now + std::max<Clock::duration>(LATEST, (now - written) / 2);
+}
+
 bool IsProductFolder(const FolderWatches::Event& event) {
   static const std::string home = core::GetORVA_HOME("");
   return event.folder.empty() && (event.name == home || event.name == ".zophotos");
@@ -597,9 +603,10 @@ bool Volume::IsBeingWritten(const VolumeRoot& root, const std::string& folder,
     const bool hasContent = open->second.hasContent;
     const auto end =
         open->second.written + (hasContent ? Clock::duration(LONGEST_OPEN) : LONGEST_EMPTY);
-    // It may have been truncated by its name, or on another machine: then nobody closes it.
+    // It may have been truncated by its name, or on another machine: then nobody closes it. The end
+    // may also be missed: it is reported for another name, or while the folder is not watched.
     if (now < end && !(hasContent && IsOpenForWriting(root, path) == false)) {
-      CheckLater(folder, end);
+      CheckLater(folder, std::min(end, NextCheck(open->second.written)));
       return true;
     }
     openFiles_.erase(open);
@@ -610,7 +617,7 @@ bool Volume::IsBeingWritten(const VolumeRoot& root, const std::string& folder,
     ++asked_;
     if (IsOpenForWriting(root, path) == true) {
       openFiles_[path] = {.written = now - age, .hasContent = true};
-      CheckLater(folder, now - age + LONGEST_OPEN);
+      CheckLater(folder, NextCheck(now - age));
       return true;
     }
   }
