@@ -82,9 +82,7 @@ TEST_F(CatalogFileTest, HardLinkAsTheSharedMemoryChangesNoOtherFile) {
 }
 
 TEST_F(CatalogFileTest, HardLinkAsTheJournalChangesNoOtherFile) {
-  if (!HasOtherUsers()) {
-    GTEST_SKIP() << NO_OTHER_USERS;
-  }
+  SKIP_WITHOUT_OTHER_USERS();
   MakeCatalog();
   fs::create_hard_link(VICTIM, CATALOG + "-journal");
   EXPECT_EQ(0, chown(CATALOG.c_str(), 1, 1));

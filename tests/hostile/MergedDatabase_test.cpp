@@ -333,9 +333,7 @@ TEST_F(MergedDatabaseTest, JournalDoesNotEnlargeTheDatabase) {
 }
 
 TEST_F(MergedDatabaseTest, HardLinkAsTheJournalChangesNoOtherFile) {
-  if (!HasOtherUsers()) {
-    GTEST_SKIP() << NO_OTHER_USERS;
-  }
+  SKIP_WITHOUT_OTHER_USERS();
   fs::remove(MERGED + "-journal");
   fs::create_hard_link(VICTIM, MERGED + "-journal");
   ASSERT_EQ(0, chown(MERGED.c_str(), 1, 1));

@@ -1,8 +1,7 @@
 // An untrusted user who replaces names as fast as possible, until standard input ends. The command
 // line has groups of arguments, separated by "--": the directory of the private files, a pool
 // directory on the same file system, and the paths to replace. Says "ready" once the pool is full,
-// and at the end how many names it has replaced. Ends with status 77 where it cannot become that
-// user.
+// and at the end how many names it has replaced.
 
 #include "Replacement.h"
 
@@ -141,7 +140,7 @@ int main(int count, char** arguments) {
       setresgid(UNTRUSTED_USER, UNTRUSTED_USER, UNTRUSTED_USER) != 0 ||
       setresuid(UNTRUSTED_USER, UNTRUSTED_USER, UNTRUSTED_USER) != 0) {
     std::cout << "this user cannot become another one: " << std::strerror(errno) << std::endl;
-    return 77;
+    return EXIT_FAILURE;
   }
   // The leak sanitizer reads the memory of its own process.
   prctl(PR_SET_DUMPABLE, 1);

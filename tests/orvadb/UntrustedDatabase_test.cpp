@@ -321,9 +321,7 @@ class LogFileTest : public SideFileTest {};
 
 TEST_P(LogFileTest, FileOfAnotherUserIsNotUsed) {
   std::ofstream(Name()) << "theirs";
-  if (!test::HasOtherUsers()) {
-    GTEST_SKIP() << test::NO_OTHER_USERS;
-  }
+  SKIP_WITHOUT_OTHER_USERS();
   ASSERT_EQ(chown(Name().c_str(), 1, 1), 0);
   ExpectRefused("belongs to another user");
   EXPECT_EQ(fs::file_size(Name()), 6U);
@@ -364,9 +362,7 @@ TEST_F(UntrustedDatabaseTest, FileFoundAtTheNameOfALogKeepsItsOwnerAndMode) {
   std::ofstream(path + "-journal") << "private";
   fs::permissions(path + "-journal", fs::perms::owner_read);
   const util::FileDescriptor found(open((path + "-journal").c_str(), O_RDONLY));
-  if (!test::HasOtherUsers()) {
-    GTEST_SKIP() << test::NO_OTHER_USERS;
-  }
+  SKIP_WITHOUT_OTHER_USERS();
   ASSERT_EQ(chown(path.c_str(), 1, 1), 0);
   FailureOf("SELECT a FROM t");
   FailureOf("INSERT INTO t VALUES(1, 2)");
@@ -384,9 +380,7 @@ TEST_F(UntrustedDatabaseTest, FileWithAnotherNameIsRead) {
 }
 
 TEST_F(UntrustedDatabaseTest, DatabaseOfAnotherUserIsWrittenWithALogOfTheSameUser) {
-  if (!test::HasOtherUsers()) {
-    GTEST_SKIP() << test::NO_OTHER_USERS;
-  }
+  SKIP_WITHOUT_OTHER_USERS();
   ASSERT_EQ(chown(path.c_str(), 1, 1), 0);
   EXPECT_EQ(FailureOf("INSERT INTO t VALUES(1, 2)"), "");
   std::ofstream(path + "-journal") << "x";

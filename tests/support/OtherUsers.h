@@ -1,12 +1,13 @@
 #pragma once
 
+#include <gtest/gtest.h>
+
 #include <fstream>
-#include <string>
 
 namespace orva::test {
 
-/// Whether the private root has users other than root. For an ordinary user it is a user namespace,
-/// where only one user is known: no file can belong to another one.
+/// Whether the private root has users other than root. For an ordinary user it is a user namespace
+/// with one user: the system lets only root map more of them, so no file can belong to another one.
 inline bool HasOtherUsers() {
   std::ifstream map("/proc/self/uid_map");
   unsigned long inside = 0;
@@ -15,7 +16,10 @@ inline bool HasOtherUsers() {
   return map >> inside >> outside >> count && count > 1;
 }
 
-/// Why a test is skipped there.
-inline const std::string NO_OTHER_USERS = "a private root of an ordinary user has only one user";
-
 } // namespace orva::test
+
+/// Skips a test about files and programs of other users where there are none. A macro, because it
+/// returns from the test. As root, and so in continuous integration, the test always runs.
+#define SKIP_WITHOUT_OTHER_USERS()                                                                 \
+  if (!::orva::test::HasOtherUsers())                                                              \
+  GTEST_SKIP() << "a private root of an ordinary user has only one user"

@@ -1083,9 +1083,7 @@ TEST_F(RenditionAccessTest, APhotoThatCouldNotBeOpenedWaitsAgainWhenItsPermissio
 }
 
 TEST_F(RenditionAccessTest, APhotoWithAnotherOwnerIsRenderedAgain) {
-  if (!HasOtherUsers()) {
-    GTEST_SKIP() << NO_OTHER_USERS;
-  }
+  SKIP_WITHOUT_OTHER_USERS();
   Start();
   ASSERT_EQ(chown(Photo().c_str(), 1234, 2345), 0);
   EXPECT_TRUE(AwaitWaiting());
@@ -1095,9 +1093,7 @@ TEST_F(RenditionAccessTest, APhotoWithAnotherOwnerIsRenderedAgain) {
 }
 
 TEST_F(RenditionAccessTest, TheGroupOfAFolderDecidesWhatTheGroupOfAPhotoMayRead) {
-  if (!HasOtherUsers()) {
-    GTEST_SKIP() << NO_OTHER_USERS;
-  }
+  SKIP_WITHOUT_OTHER_USERS();
   const std::string folder = TheVolume().Path() + "/Holiday/Beach";
   ASSERT_EQ(chown(folder.c_str(), 0, 2345), 0);
   ASSERT_EQ(chmod(folder.c_str(), 0750), 0);
@@ -1115,9 +1111,7 @@ TEST(Locator, AFileOfAnotherUserNamesNoMaster) {
   const std::string path = "/tmp/zophotodbmerger.conf";
   std::ofstream(path) << "zophotos_db_path=/shares/A/.zophotos/zophotos.db\n";
   EXPECT_EQ(indexer::Locator::Master(), "/shares/A");
-  if (!HasOtherUsers()) {
-    GTEST_SKIP() << NO_OTHER_USERS;
-  }
+  SKIP_WITHOUT_OTHER_USERS();
   ASSERT_EQ(chown(path.c_str(), 1234, 0), 0);
   EXPECT_EQ(indexer::Locator::Master(), std::nullopt);
 }

@@ -238,9 +238,7 @@ TEST_F(ZophotosFailed, ReportsALogOnAReadOnlyVolume) {
 }
 
 TEST_F(ZophotosFailed, ReportsACatalogWithoutPermission) {
-  if (!HasOtherUsers()) {
-    GTEST_SKIP() << NO_OTHER_USERS;
-  }
+  SKIP_WITHOUT_OTHER_USERS();
   const Arguments command{"setpriv", "--reuid", "65534", "--clear-groups", ProgramPath("zophotos"),
                           "failed"};
   fs::permissions(CatalogOf(b), fs::perms::none);

@@ -231,9 +231,7 @@ TEST_F(HostileVolumes, AnErrorOfTheDatabaseNamesItsVolume) {
 }
 
 TEST_F(HostileVolumes, FoldersThatAreSwappedAllTheTimeAreNotLeft) {
-  if (!HasOtherUsers()) {
-    GTEST_SKIP() << NO_OTHER_USERS;
-  }
+  SKIP_WITHOUT_OTHER_USERS();
   Lines names;
   for (int i = 0; i < 120; ++i) {
     names.push_back(std::to_string(i) + ".jpg");

@@ -71,9 +71,7 @@ TEST_F(Renditions, AreInFoldersOfAThousandById) {
 }
 
 TEST_F(Renditions, GetTheOwnerOfThePhotoAndItsPermissionToRead) {
-  if (!HasOtherUsers()) {
-    GTEST_SKIP() << NO_OTHER_USERS;
-  }
+  SKIP_WITHOUT_OTHER_USERS();
   CopyAll({"private.jpg", "group.jpg", "open.jpg"});
   chmod(At("private.jpg").c_str(), 0600);
   chmod(At("group.jpg").c_str(), 04770);

@@ -81,9 +81,7 @@ TEST_F(Sandbox, InheritsNoOpenFiles) {
 }
 
 TEST_F(Sandbox, HasNoPrivilegesAndOwnsNothing) {
-  if (!test::HasOtherUsers()) {
-    GTEST_SKIP() << test::NO_OTHER_USERS;
-  }
+  SKIP_WITHOUT_OTHER_USERS();
   EXPECT_EQ(Shell("id -u; id -g; id -G").output, "65533\n65533\n65533\n");
   Shell("echo x >/out/mine");
   struct stat status {};

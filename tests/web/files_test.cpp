@@ -381,9 +381,7 @@ TEST_F(WebFiles, ChangeNothingNextToACatalogAfterACrash) {
 }
 
 TEST_F(WebFiles, AreFoundByAUserWhoCannotWrite) {
-  if (!test::HasOtherUsers()) {
-    GTEST_SKIP() << test::NO_OTHER_USERS;
-  }
+  SKIP_WITHOUT_OTHER_USERS();
   UseLog();
   EXPECT_EQ("rendition a", RenditionForOtherUser());
   // Without the logs, as they are when all writers have ended.
@@ -397,9 +395,7 @@ TEST_F(WebFiles, AreFoundByAUserWhoCannotWrite) {
 }
 
 TEST_F(WebFiles, AreMissingIfTheUserMayNotReadTheCatalog) {
-  if (!test::HasOtherUsers()) {
-    GTEST_SKIP() << test::NO_OTHER_USERS;
-  }
+  SKIP_WITHOUT_OTHER_USERS();
   fs::permissions("/shares/A/.orva/orva.db", fs::perms::owner_read);
   EXPECT_EQ("(none)", RenditionForOtherUser());
 }

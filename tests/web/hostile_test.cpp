@@ -216,9 +216,7 @@ TEST_F(WebHostile, LockedCatalogsDelayNobody) {
 }
 
 TEST_F(WebHostile, UsersSeeOnlyWhatTheirServerMayRead) {
-  if (!HasOtherUsers()) {
-    GTEST_SKIP() << NO_OTHER_USERS;
-  }
+  SKIP_WITHOUT_OTHER_USERS();
   const std::string rendition = RenditionOf(onA, a.Path(), "sea/one.jpg");
   fs::permissions(ONE, fs::perms::owner_read);
   fs::permissions(rendition, fs::perms::owner_read);
@@ -316,9 +314,7 @@ TEST_F(WebHostile, ManyClientsThatDoNotReadTakeLittleMemory) {
 }
 
 TEST_F(WebHostile, ADatabaseThatTheServerMayNotReadIsNamed) {
-  if (!HasOtherUsers()) {
-    GTEST_SKIP() << NO_OTHER_USERS;
-  }
+  SKIP_WITHOUT_OTHER_USERS();
   const std::string database = "/shares/A/.zophotos/zophotos.db";
   StopWeb();
   fs::remove_all("/tmp/cache");
@@ -345,9 +341,7 @@ TEST_F(WebHostile, ADatabaseThatTheServerMayNotReadIsNamed) {
 }
 
 TEST_F(WebHostile, ACacheOfAnotherUserIsRefused) {
-  if (!HasOtherUsers()) {
-    GTEST_SKIP() << NO_OTHER_USERS;
-  }
+  SKIP_WITHOUT_OTHER_USERS();
   const Outcome outcome =
       test::Run({"setpriv", "--reuid=65534", "--regid=65534", "--clear-groups",
                  ProgramPath("zophotos-web"), "--listen", "127.0.0.1:0", "--cache", "/tmp/cache"});

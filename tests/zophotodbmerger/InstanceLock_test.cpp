@@ -75,9 +75,7 @@ TEST(InstanceLock, RepairsTheModeOfItsFile) {
 }
 
 TEST(InstanceLock, IsHeldWhenTheFileOfRootCannotBeOpened) {
-  if (!HasOtherUsers()) {
-    GTEST_SKIP() << NO_OTHER_USERS;
-  }
+  SKIP_WITHOUT_OTHER_USERS();
   { const InstanceLock root; }
   setfsuid(1000); // without the privilege to open every file
   EXPECT_TRUE(InstanceLock().IsHeldByAnother());
@@ -105,9 +103,7 @@ void MakeFile(const std::string& path, mode_t mode = 0600) {
 }
 
 void GiveAway(const std::string& path) {
-  if (!HasOtherUsers()) {
-    GTEST_SKIP() << NO_OTHER_USERS;
-  }
+  SKIP_WITHOUT_OTHER_USERS();
   ASSERT_EQ(0, chown(path.c_str(), 65534, 65534));
 }
 

@@ -238,9 +238,7 @@ TEST_F(PhotoDBNewDirectoryTest, DirectoryWithContentInItsPlaceKeepsItsMode) {
 }
 
 TEST_F(PhotoDBNewDirectoryTest, DirectoryOfAnotherUserInItsPlaceKeepsItsMode) {
-  if (!HasOtherUsers()) {
-    GTEST_SKIP() << NO_OTHER_USERS;
-  }
+  SKIP_WITHOUT_OTHER_USERS();
   const std::string other = MakeDirectory("/shares/Vol/private");
   chmod(other.c_str(), 0700);
   ASSERT_EQ(0, chown(other.c_str(), 1000, 1000));
@@ -260,9 +258,7 @@ TEST_F(PhotoDBNewDirectoryTest, LinkInItsPlaceIsNotFollowed) {
 }
 
 TEST_F(PhotoDBNewDirectoryTest, FileSystemMayReportItsOwnOwner) {
-  if (!HasOtherUsers()) {
-    GTEST_SKIP() << NO_OTHER_USERS;
-  }
+  SKIP_WITHOUT_OTHER_USERS();
   ASSERT_EQ(0, chown(LOCATION.c_str(), 1000, 1000));
   // What this user creates has another owner than the effective user, as on such a file system.
   EXPECT_EQ("", Construct(1000, AfterCreation(), [] {}));
@@ -270,9 +266,7 @@ TEST_F(PhotoDBNewDirectoryTest, FileSystemMayReportItsOwnOwner) {
 }
 
 TEST_F(PhotoDBNewDirectoryTest, DirectoryWhoseModeCannotBeChangedIsRemovedAgain) {
-  if (!HasOtherUsers()) {
-    GTEST_SKIP() << NO_OTHER_USERS;
-  }
+  SKIP_WITHOUT_OTHER_USERS();
   ASSERT_EQ(0, chown(LOCATION.c_str(), 1000, 1000));
   const auto changesTheMode = [](const SystemCall& call) {
     return call.number == SYS_fchmod || call.number == SYS_fchmodat;

@@ -54,9 +54,7 @@ TEST_F(LocatorTest, ShorterLineReplacesALongerOne) {
 }
 
 TEST_F(LocatorTest, FileOfAnotherUserIsWritten) {
-  if (!HasOtherUsers()) {
-    GTEST_SKIP() << NO_OTHER_USERS;
-  }
+  SKIP_WITHOUT_OTHER_USERS();
   std::ofstream(LOCATOR_PATH) << "theirs";
   ASSERT_EQ(0, chown(LOCATOR_PATH.c_str(), 1, 1));
   updateLocatorFile("/shares/Vol/");
