@@ -127,6 +127,12 @@ bool IndexerTest::Await(const std::function<bool()>& condition) {
   return condition();
 }
 
+Lines IndexerTest::StartAndAwaitCatalog(const std::string& volume) {
+  StartService();
+  StartIndexer();
+  return AwaitCatalog(volume);
+}
+
 Lines IndexerTest::AwaitCatalog(const std::string& volume) {
   Lines expected;
   Lines found;

@@ -47,6 +47,9 @@ protected:
   /// Waits until the catalog describes what is on the volume, and lists the differences otherwise.
   Lines AwaitCatalog(const std::string& volume);
 
+  /// Starts the notification service and the indexer first.
+  Lines StartAndAwaitCatalog(const std::string& volume);
+
   /// Waits for a line of the indexer in the system log that contains `text`.
   bool AwaitLog(const std::string& text);
 

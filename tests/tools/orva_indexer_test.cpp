@@ -129,9 +129,7 @@ TEST_F(IndexerTest, TheFolderOfTheVolumesIsNoVolume) {
 TEST_F(IndexerTest, AVolumeCanBeUnmountedWhileItIsWatched) {
   const Volume volume("A", "64m");
   Write(volume.Path() + "/Pictures/a.jpg");
-  StartService();
-  StartIndexer();
-  ASSERT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  ASSERT_THAT(StartAndAwaitCatalog(volume.Path()), IsEmpty());
   ASSERT_TRUE(Await([&] { return State(volume.Path()) == "watching"; }));
   EXPECT_TRUE(Await([&] { return umount2(volume.Path().c_str(), 0) == 0; }));
   EXPECT_TRUE(AwaitLog("/shares/A/: gone"));
@@ -161,9 +159,7 @@ TEST_F(IndexerTest, AVolumeThatVanishesDuringItsWalkIsNoError) {
 TEST_F(IndexerTest, EverythingIsAnnouncedAgainWhenTheServiceComesBack) {
   const Volume volume("A", "64m");
   Write(volume.Path() + "/a.jpg");
-  StartService();
-  StartIndexer();
-  ASSERT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  ASSERT_THAT(StartAndAwaitCatalog(volume.Path()), IsEmpty());
   ASSERT_TRUE(Await([&] { return State(volume.Path()) == "watching"; }));
   Service().Signal(SIGTERM);
   ASSERT_EQ(Service().WaitForEnd(), 0);
@@ -212,9 +208,7 @@ TEST_F(IndexerTest, StartsBeforeTheService) {
 TEST_F(IndexerTest, AChangeIsAnnouncedOnce) {
   const Volume volume("A", "64m");
   Write(volume.Path() + "/Pictures/a.jpg");
-  StartService();
-  StartIndexer();
-  ASSERT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  ASSERT_THAT(StartAndAwaitCatalog(volume.Path()), IsEmpty());
   ASSERT_TRUE(Await([&] { return State(volume.Path()) == "watching"; }));
   const long ends = Count(Events(volume.Path()), "End");
   Write(volume.Path() + "/Pictures/b.jpg");
@@ -292,9 +286,7 @@ TEST_F(VolumeWorkTest, OnlyChangesOfPhotosAndFoldersAreAnnounced) {
 TEST_F(IndexerTest, ACatalogIsMadeAgainWhenItsFolderIsRemoved) {
   const Volume volume("A", "64m");
   Write(volume.Path() + "/Pictures/a.jpg");
-  StartService();
-  StartIndexer();
-  ASSERT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  ASSERT_THAT(StartAndAwaitCatalog(volume.Path()), IsEmpty());
   ASSERT_TRUE(Await([&] { return State(volume.Path()) == "watching"; }));
   fs::remove_all(volume.Path() + "/.orva");
   EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
@@ -557,9 +549,7 @@ TEST_F(IndexerTest, WhereThereAreNoEventsTheVolumeIsWalkedOnATimer) {
 TEST_F(IndexerTest, AMountBelowTheVolumeIsFollowed) {
   const Volume volume("A", "64m");
   Write(volume.Path() + "/Inside/a.jpg");
-  StartService();
-  StartIndexer();
-  ASSERT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  ASSERT_THAT(StartAndAwaitCatalog(volume.Path()), IsEmpty());
   ASSERT_TRUE(Await([&] { return State(volume.Path()) == "watching"; }));
   const std::string inside = volume.Path() + "/Inside";
   ASSERT_EQ(mount("inside", inside.c_str(), "tmpfs", 0, "size=1m"), 0);
@@ -576,9 +566,7 @@ TEST_F(IndexerTest, AFolderThatIsMountedAtTwoPlacesIsFollowedAtBoth) {
   ASSERT_EQ(mount((volume.Path() + "/One").c_str(), (volume.Path() + "/Two").c_str(), nullptr,
                   MS_BIND, nullptr),
             0);
-  StartService();
-  StartIndexer();
-  ASSERT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  ASSERT_THAT(StartAndAwaitCatalog(volume.Path()), IsEmpty());
   ASSERT_TRUE(Await([&] { return State(volume.Path()) == "watching"; }));
   Write(volume.Path() + "/One/b.jpg");
   Write(volume.Path() + "/One/Inside/c.jpg");
@@ -751,9 +739,7 @@ TEST_F(IndexerTest, ACatalogThatStaysLockedIsLoggedOnceAndUpdatedLater) {
   const Volume other("B", "64m");
   Write(locked.Path() + "/first.jpg");
   Write(other.Path() + "/first.jpg");
-  StartService();
-  StartIndexer();
-  ASSERT_THAT(AwaitCatalog(locked.Path()), IsEmpty());
+  ASSERT_THAT(StartAndAwaitCatalog(locked.Path()), IsEmpty());
   ASSERT_THAT(AwaitCatalog(other.Path()), IsEmpty());
   {
     Database writer(CatalogOf(locked.Path()));
@@ -810,9 +796,7 @@ TEST_F(IndexerTest, FilesAndFoldersFromTheFutureAndThePastAreEnteredOnce) {
   setTime("/Future", IN_2100);
   setTime("/Past/a.jpg", -IN_2100);
   setTime("/Past", -IN_2100);
-  StartService();
-  StartIndexer();
-  ASSERT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  ASSERT_THAT(StartAndAwaitCatalog(volume.Path()), IsEmpty());
   EXPECT_THAT(Query(volume.Path(), "SELECT path, lastModifiedDate FROM Files ORDER BY path"),
               ElementsAre("Future/a.jpg|4102444800", "Past/a.jpg|-4102444800"));
   constexpr char STAMPS[] = "SELECT path, lastUpdatedDate FROM Files WHERE name = 'a.jpg'";
@@ -844,9 +828,7 @@ TEST_F(IndexerTest, FilesAreEnteredAfterTheClockWasSetBack) {
 TEST_F(IndexerTest, ACatalogThatNobodyMergesIsKnownAgainWhenTheClockWasSetBack) {
   const Volume volume("A", "64m");
   Write(volume.Path() + "/a.jpg");
-  StartService();
-  StartIndexer();
-  ASSERT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  ASSERT_THAT(StartAndAwaitCatalog(volume.Path()), IsEmpty());
   ASSERT_TRUE(Await([&] { return Count(Events(volume.Path()), "End") > 0; }));
   // What was announced is remembered before the next announcement.
   const long ends = Count(Events(volume.Path()), "End");
@@ -916,9 +898,7 @@ TEST_F(IndexerTest, AFullVolumeIsIndexedWhenThereIsSpace) {
 TEST_F(IndexerTest, AVolumeWithoutFreeInodesKeepsItsCatalog) {
   Volume volume("A", "8m,nr_inodes=40");
   Write(volume.Path() + "/a.jpg");
-  StartService();
-  StartIndexer();
-  ASSERT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  ASSERT_THAT(StartAndAwaitCatalog(volume.Path()), IsEmpty());
   int fillers = 0;
   while (std::ofstream(volume.Path() + "/filler" + std::to_string(fillers))) {
     ++fillers;
@@ -1366,9 +1346,7 @@ TEST_F(IndexerAndDaemonTest, ACatalogFromABackupThatWasUpdatedSinceIsMergedFromT
   fs::copy_file("/tmp/backup.db", CatalogOf(volume.Path()), fs::copy_options::overwrite_existing);
   Write(volume.Path() + "/c.jpg");
   // The catalog gets new stamps before anything can be announced as purged.
-  StartService();
-  StartIndexer();
-  ASSERT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  ASSERT_THAT(StartAndAwaitCatalog(volume.Path()), IsEmpty());
   Indexer().Signal(SIGKILL);
   Indexer().WaitForEnd();
   Service().Signal(SIGTERM);

@@ -16,6 +16,7 @@
 #include <poll.h>
 #include <sys/stat.h>
 
+#include <algorithm>
 #include <chrono>
 #include <ctime>
 #include <stdexcept>
@@ -201,6 +202,21 @@ TranscoderTest::Lines TranscoderTest::Logged() const {
     lines.push_back(line.text);
   }
   return lines;
+}
+
+bool TranscoderTest::AwaitLogged(const std::string& line) const {
+  return Await([&] {
+    const Lines logged = Logged();
+    return std::ranges::find(logged, line) != logged.end();
+  });
+}
+
+void TranscoderTest::CopyPhoto(const std::string& name) const {
+  static const std::string photo = "/tmp/photo.jpg";
+  if (!fs::exists(photo)) {
+    MakePhoto(photo, 600, 400);
+  }
+  fs::copy_file(photo, At(name));
 }
 
 std::string TranscoderTest::Status() {

@@ -44,6 +44,9 @@ protected:
   /// Uses another folder as the volume from now on.
   void UseRoot(const std::string& root) { root_ = root; }
 
+  /// Copies /tmp/photo.jpg to the volume; unless the test has made it, a photo of 600 x 400 pixels.
+  void CopyPhoto(const std::string& name) const;
+
   /// Enters the file into the catalog as a photo that waits, or as one that has changed. Returns
   /// its id.
   long long AddWaiting(const std::string& path) const;
@@ -75,6 +78,8 @@ protected:
 
   /// The lines of the transcoder in the system log.
   Lines Logged() const;
+  /// Waits until this is one of them.
+  bool AwaitLogged(const std::string& line) const;
 
   /// What is in status.json.
   static std::string Status();

@@ -28,9 +28,6 @@ class HostileVolumes : public TranscoderTest {
 protected:
   void SetUp() override {
     TranscoderTest::SetUp();
-    if (IsSkipped()) {
-      return;
-    }
     MakePhoto("/tmp/photo.jpg", 600, 400);
     fs::create_directories("/tmp/outside/0");
     WriteBytes("/tmp/outside/1.jpg", "outside");
@@ -43,13 +40,9 @@ protected:
   }
 
   void TearDown() override {
-    if (!IsSkipped()) {
-      EXPECT_EQ(Outside(), outside_);
-    }
+    EXPECT_EQ(Outside(), outside_);
     TranscoderTest::TearDown();
   }
-
-  void CopyPhoto(const std::string& name) const { fs::copy_file("/tmp/photo.jpg", At(name)); }
 
   /// Renders a photo, the second one, in a volume where `replace` has changed something. The
   /// renditions were compared with the catalog before, which removes links and other files.

@@ -36,17 +36,9 @@ namespace fs = std::filesystem;
 
 class Renditions : public TranscoderTest {
 protected:
-  void SetUp() override {
-    TranscoderTest::SetUp();
-    if (!IsSkipped()) {
-      MakePhoto("/tmp/photo.jpg", 600, 400);
-    }
-  }
-
-  void Copy(const std::string& name) const { fs::copy_file("/tmp/photo.jpg", At(name)); }
   void CopyAll(const Lines& names) const {
     for (const std::string& name : names) {
-      Copy(name);
+      CopyPhoto(name);
     }
   }
 
@@ -88,7 +80,7 @@ TEST_F(Renditions, GetTheOwnerOfThePhotoAndItsPermissionToRead) {
 }
 
 TEST_F(Renditions, OfAPhotoThatBecomesPrivateBecomesPrivate) {
-  Copy("a.jpg");
+  CopyPhoto("a.jpg");
   AddWaiting("a.jpg");
   RenderAll();
   ASSERT_EQ(StatusOf(Rendition("a.jpg")).st_mode & 07777, 0444U);
@@ -101,8 +93,8 @@ TEST_F(Renditions, OfAPhotoThatBecomesPrivateBecomesPrivate) {
 TEST_F(Renditions, OfPhotosInAPrivateFolderArePrivate) {
   fs::create_directories(At("private/below"));
   fs::create_directories(At("group/below"));
-  Copy("private/below/a.jpg");
-  Copy("group/below/a.jpg");
+  CopyPhoto("private/below/a.jpg");
+  CopyPhoto("group/below/a.jpg");
   chmod(At("private").c_str(), 0700);
   chmod(At("group").c_str(), 0750);
   AddAllWaiting({"private/below/a.jpg", "group/below/a.jpg"});
@@ -113,7 +105,7 @@ TEST_F(Renditions, OfPhotosInAPrivateFolderArePrivate) {
 
 TEST_F(Renditions, AFailedPhotoIsNotTriedAgainUntilItChanges) {
   WriteBytes(At("a.jpg"), "no image");
-  Copy("b.jpg");
+  CopyPhoto("b.jpg");
   AddWaiting("a.jpg");
   RenderAll();
   const long long stamp = Number("SELECT lastUpdatedDate FROM Transcodings");
@@ -121,7 +113,7 @@ TEST_F(Renditions, AFailedPhotoIsNotTriedAgainUntilItChanges) {
   RenderAll();
   EXPECT_EQ(Number("SELECT lastUpdatedDate FROM Transcodings WHERE sourceId = 1"), stamp);
   fs::remove(At("a.jpg"));
-  Copy("a.jpg");
+  CopyPhoto("a.jpg");
   AddWaiting("a.jpg");
   RenderAll();
   EXPECT_EQ(StateOf("a.jpg"), "finished");
@@ -130,7 +122,7 @@ TEST_F(Renditions, AFailedPhotoIsNotTriedAgainUntilItChanges) {
 TEST_F(Renditions, APhotoThatCannotBeOpenedFails) {
   KillTranscoder();
   StartTranscoder({"setpriv", "--bounding-set", "-dac_override,-dac_read_search"});
-  Copy("a.jpg");
+  CopyPhoto("a.jpg");
   chmod(At("a.jpg").c_str(), 0);
   AddWaiting("a.jpg");
   RenderAll();
@@ -138,7 +130,7 @@ TEST_F(Renditions, APhotoThatCannotBeOpenedFails) {
 }
 
 TEST_F(Renditions, AFailedChangeRemovesTheOldRendition) {
-  Copy("a.jpg");
+  CopyPhoto("a.jpg");
   AddWaiting("a.jpg");
   RenderAll();
   ASSERT_TRUE(fs::exists(Rendition("a.jpg")));
@@ -244,7 +236,7 @@ TEST_F(Renditions, APhotoThatDiffersFromTheCatalogWaitsForTheIndexer) {
   EXPECT_TRUE(AwaitSent("\"End\""));
   EXPECT_EQ(StateOf("a.jpg"), "waiting");
   fs::remove(At("a.jpg"));
-  Copy("a.jpg");
+  CopyPhoto("a.jpg");
   AddWaiting("a.jpg");
   RenderAll();
   EXPECT_EQ(StateOf("a.jpg"), "finished");
@@ -256,7 +248,7 @@ TEST_F(Renditions, APhotoThatIsReplacedWhileItIsRenderedIsRenderedAgain) {
   Announce("scanned");
   ASSERT_TRUE(Await([] { return Status().find("\"rendering\":true") != std::string::npos; }));
   fs::remove(At("a.png"));
-  fs::copy_file("/tmp/photo.jpg", At("a.png"));
+  CopyPhoto("a.png");
   AddWaiting("a.png");
   RenderAll();
   EXPECT_EQ(HeaderOf(Rendition("a.png")).width, 600);
@@ -323,7 +315,7 @@ TEST_F(Renditions, StampsThatAreAheadOfTheClockAreWaitedFor) {
 TEST_F(Renditions, NothingIsWrittenWhileTheCatalogIsLocked) {
   using orva::transcoder::Volume;
   KillTranscoder();
-  Copy("a.jpg");
+  CopyPhoto("a.jpg");
   const long long id = AddWaiting("a.jpg");
   Volume volume(Root() + '/', catalog::VolumeRoot::Kind::Mount);
   volume.Look();
@@ -383,7 +375,7 @@ TEST_F(Renditions, ACatalogThatIsBeingMadeIsNoError) {
   Announce("scanned");
   ASSERT_TRUE(AwaitSent("\"End\""));
   EXPECT_THAT(Logged(), testing::IsEmpty());
-  Copy("a.jpg");
+  CopyPhoto("a.jpg");
   AddWaiting("a.jpg");
   RenderAll();
   EXPECT_TRUE(fs::exists(Rendition("a.jpg")));
@@ -392,15 +384,12 @@ TEST_F(Renditions, ACatalogThatIsBeingMadeIsNoError) {
 TEST_F(Renditions, NothingIsWrittenWhereNothingIsMounted) {
   fs::create_directories("/shares/Bare");
   UseRoot("/shares/Bare");
-  Copy("a.jpg");
+  CopyPhoto("a.jpg");
   AddWaiting("a.jpg");
   Announce("plugged");
   Announce("scanned");
   // Another volume is looked at later.
-  EXPECT_TRUE(Await([this] {
-    const Lines logged = Logged();
-    return std::ranges::find(logged, "/shares/Bare: nothing is mounted there") != logged.end();
-  }));
+  EXPECT_TRUE(AwaitLogged("/shares/Bare: nothing is mounted there"));
   EXPECT_FALSE(fs::exists("/shares/Bare/.orva/renditions"));
   Announce("unplugged");
   AnnounceDirectory("/shares/Bare");
@@ -410,16 +399,12 @@ TEST_F(Renditions, NothingIsWrittenWhereNothingIsMounted) {
 
 TEST_F(Renditions, TheFolderOfTheVolumesIsNoVolume) {
   UseRoot("/shares");
-  Copy("a.jpg");
+  CopyPhoto("a.jpg");
   AddWaiting("a.jpg");
   AnnounceDirectory("/shares");
-  EXPECT_TRUE(Await([this] {
-    const Lines logged = Logged();
-    return std::ranges::find(logged, "/shares/: not rendered: the volumes are below it") !=
-           logged.end();
-  }));
+  EXPECT_TRUE(AwaitLogged("/shares/: not rendered: the volumes are below it"));
   UseRoot(TheVolume().Path());
-  Copy("b.jpg");
+  CopyPhoto("b.jpg");
   AddWaiting("b.jpg");
   RenderAll();
   EXPECT_FALSE(fs::exists("/shares/.orva/renditions"));
@@ -437,12 +422,12 @@ TEST_F(Renditions, APhotoWhosePathIsTooLongFails) {
 }
 
 TEST_F(Renditions, AreMadeAgainWhenTheirFolderWasRemoved) {
-  Copy("a.jpg");
+  CopyPhoto("a.jpg");
   AddWaiting("a.jpg");
   RenderAll();
   Announce("end");
   ASSERT_TRUE(fs::exists(Rendition("a.jpg")));
-  Copy("b.jpg");
+  CopyPhoto("b.jpg");
   AddWaiting("b.jpg");
   RenderAll(); // the folder was seen now
   fs::remove_all(At(".orva/renditions"));
@@ -498,7 +483,7 @@ TEST_F(Renditions, AFullVolumeIsReportedOnceAndTriedAgain) {
 }
 
 TEST_F(Renditions, AFullVolumeIsTriedAgainWhenSomeSpaceHasBecomeFree) {
-  Copy("a.jpg");
+  CopyPhoto("a.jpg");
   AddWaiting("a.jpg");
   std::ofstream(At("filler")) << std::string(8 << 20, 'x');
   TheVolume().Resize(TheVolume().Used() + (256 << 10));
@@ -534,7 +519,7 @@ TEST_F(Renditions, AFullVolumeIsTriedAgainWhenSomeSpaceHasBecomeFree) {
 }
 
 TEST_F(Renditions, AReadOnlyVolumeIsReportedOnceAndTriedAgain) {
-  Copy("a.jpg");
+  CopyPhoto("a.jpg");
   AddWaiting("a.jpg");
   TheVolume().MakeReadOnly();
   Announce("scanned");

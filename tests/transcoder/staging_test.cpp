@@ -17,13 +17,6 @@ constexpr std::uintmax_t MIB = 1 << 20;
 
 class Staging : public TranscoderTest {
 protected:
-  void SetUp() override {
-    TranscoderTest::SetUp();
-    if (!IsSkipped()) {
-      MakePhoto("/tmp/photo.jpg", 600, 400);
-    }
-  }
-
   void TearDown() override {
     TranscoderTest::TearDown();
     umount2(RUNTIME, MNT_DETACH);
@@ -31,7 +24,7 @@ protected:
 
   /// A photo with so many bytes: what follows the image is ignored.
   void MakeLarge(const std::string& name, std::uintmax_t size) const {
-    fs::copy_file("/tmp/photo.jpg", At(name));
+    CopyPhoto(name);
     fs::resize_file(At(name), size);
   }
 };
