@@ -449,6 +449,40 @@ TEST_F(VolumeWorkTest, APhotoWhoseEndOfWritingIsNotReportedIsEntered) {
   EXPECT_TRUE(WorkUntilFound(FILES, {"1/slow.jpg|10", "2/link.jpg|10", "a.jpg|1"}));
 }
 
+TEST_F(VolumeWorkTest, APhotoThatIsBeingWrittenWaitsAlsoInARenamedFolder) {
+  constexpr char FILES[] = "SELECT path, size FROM Files WHERE isDeleted = 0 ORDER BY path";
+  fs::create_directories(At("1"));
+  std::ofstream slow(At("1/slow.jpg"));
+  slow << "half" << std::flush;
+  Write(At("a.jpg"), "1");
+  ASSERT_TRUE(WorkUntilFound(FILES, {"a.jpg|1"}));
+  fs::rename(At("1"), At("2"));
+  Write(At("2/b.jpg"), "1");
+  ASSERT_TRUE(WorkUntilFound(FILES, {"2/b.jpg|1", "a.jpg|1"}));
+  slow << " whole";
+  slow.close();
+  EXPECT_TRUE(WorkUntilFound(FILES, {"2/b.jpg|1", "2/slow.jpg|10", "a.jpg|1"}));
+}
+
+TEST_F(VolumeWorkTest, FilesOfARenamedFolderAreForgotten) {
+  constexpr char FILES[] = "SELECT path FROM Files WHERE path NOT LIKE '%.txt' AND isDeleted = 0 "
+                           "ORDER BY path";
+  Write(At("1/a.jpg"));
+  ASSERT_TRUE(WorkUntilFound(FILES, {"1/a.jpg"}));
+  // As many files as are remembered at most, which nobody closes.
+  for (int file = 0; file < 10'000; ++file) {
+    fs::create_hard_link(At("1/a.jpg"), At("1/" + std::to_string(file) + ".txt"));
+  }
+  Write(At("b.jpg"));
+  ASSERT_TRUE(WorkUntilFound(FILES, {"1/a.jpg", "b.jpg"}));
+  fs::rename(At("1"), At("2"));
+  ASSERT_TRUE(WorkUntilFound(FILES, {"2/a.jpg", "b.jpg"}));
+  std::ofstream slow(At("slow.jpg"));
+  slow << "half" << std::flush;
+  Write(At("z.jpg"));
+  EXPECT_TRUE(WorkUntilFound(FILES, {"2/a.jpg", "b.jpg", "z.jpg"}));
+}
+
 TEST_F(IndexerTest, ALinkIsEnteredAlthoughItIsNeverClosed) {
   const Volume volume("A", "64m");
   Write("/tmp/elsewhere.jpg");

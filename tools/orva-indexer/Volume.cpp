@@ -167,7 +167,7 @@ void Volume::Handle(const FolderWatches::Event& event) {
     isUnmounted_ = true;
     notBefore_ = {};
   } else if ((event.mask & IN_UNMOUNT) != 0) { // a file system mounted below the volume
-    watches_->Forget(event.folder);
+    Unwatch(event.folder);
     MarkDirty(FolderOf(event.folder));
   } else if ((event.mask & (IN_IGNORED | IN_DELETE_SELF | IN_MOVE_SELF)) != 0) {
     if (event.folder.empty() && (event.mask & IN_IGNORED) == 0) {
@@ -177,7 +177,7 @@ void Volume::Handle(const FolderWatches::Event& event) {
     if ((event.mask & IN_ISDIR) != 0) {
       if ((event.mask & (IN_MOVED_FROM | IN_MOVED_TO | IN_DELETE | IN_CREATE)) != 0) {
         // Also for a new folder: another one may have had its name.
-        watches_->Forget(event.folder + event.name + '/');
+        Unwatch(event.folder + event.name + '/');
       }
     } else {
       NoteFile(event);
@@ -202,6 +202,16 @@ void Volume::NoteFile(const FolderWatches::Event& event) {
     }
   } else if ((event.mask & (IN_CLOSE_WRITE | IN_MOVED_FROM | IN_MOVED_TO | IN_DELETE)) != 0) {
     openFiles_.erase(path);
+  }
+}
+
+/// Ends the watches of a folder and of those below it. The end of writing of their files is not
+/// reported any more.
+void Volume::Unwatch(const std::string& folder) {
+  watches_->Forget(folder);
+  auto file = openFiles_.lower_bound(folder);
+  while (file != openFiles_.end() && file->first.starts_with(folder)) {
+    file = openFiles_.erase(file);
   }
 }
 
@@ -235,7 +245,7 @@ void Volume::HandleMounts(const std::set<std::string>& mountPoints) {
   for (const std::string& folder : changed) {
     if (watches_) {
       // A folder that is not watched is walked when the one above is listed.
-      watches_->Forget(folder);
+      Unwatch(folder);
       MarkDirty(FolderOf(folder));
     }
   }
@@ -416,6 +426,9 @@ Volume::Result Volume::WorkOn(const VolumeRoot& root, const std::function<void()
     isStampDue_ = false;
     isUncommitted_ = false;
     uncommitted_.clear();
+    if (ready_.empty()) {
+      asked_ = 0;
+    }
     if (ready_.empty() && pending_.empty()) {
       written_.clear(); // the rest has no row, or one that waits
     }
@@ -494,7 +507,7 @@ void Volume::WalkNext(FolderIndexer& indexer) {
   if (!folder) {
     // The folder above has not been listed since this one has appeared.
     if (watches_) {
-      watches_->Forget(task.path);
+      Unwatch(task.path);
     }
     ready_.push_back({.path = FolderOf(task.path)});
     return;
@@ -539,6 +552,7 @@ void Volume::FinishWalk(Result& result, long long files) {
 }
 
 void Volume::Opened(const Folder& folder, int descriptor) {
+  wasWatched_ = watches_ && watches_->Has(folder.path);
   if (watches_ && !watches_->Add(folder.path, descriptor)) {
     GiveUpWatches(errno);
   }
@@ -612,8 +626,8 @@ bool Volume::IsBeingWritten(const VolumeRoot& root, const std::string& folder,
     openFiles_.erase(open);
     return false;
   }
-  // Events from before this walk are not known.
-  if (isWalkingAll_ && age >= 0s && age < LONGEST_OPEN && asked_ < MOST_FILES && IsPhoto(name)) {
+  // Events from before the folder was watched are not known.
+  if (!wasWatched_ && age >= 0s && age < LONGEST_OPEN && asked_ < MOST_FILES && IsPhoto(name)) {
     ++asked_;
     if (IsOpenForWriting(root, path) == true) {
       openFiles_[path] = {.written = now - age, .hasContent = true};
