@@ -768,6 +768,28 @@ TEST_F(IndexerTest, FoldersAreWalkedAgainIfTheirCommitFailsOnABusyCatalog) {
   EXPECT_THAT(ErrorLines(), IsEmpty());
 }
 
+TEST_F(IndexerTest, AFolderThatCannotBeReadIsLoggedOnceWheneverItAppears) {
+  const Volume volume("A", "64m");
+  Write(volume.Path() + "/first.jpg");
+  ASSERT_THAT(StartAndAwaitCatalog(volume.Path()), IsEmpty());
+  ASSERT_THAT(ErrorLines(), IsEmpty());
+  const auto current = fs::current_path();
+  fs::current_path(volume.Path());
+  for (int depth = 0; depth < 17; ++depth) { // 4,267 bytes
+    const std::string name(250, 'd');
+    ASSERT_EQ(mkdir(name.c_str(), 0755), 0);
+    fs::current_path(name);
+  }
+  fs::current_path(current);
+  EXPECT_TRUE(AwaitLog("1 files or folders cannot be read, for example " + volume.Path()));
+  Write(volume.Path() + "/second.jpg");
+  ASSERT_TRUE(Await([&] {
+    return Query(volume.Path(), "SELECT path FROM Files ORDER BY path") ==
+           (Lines{"first.jpg", "second.jpg"});
+  }));
+  EXPECT_THAT(ErrorLines(), ElementsAre(HasSubstr("cannot be read")));
+}
+
 TEST_F(IndexerTest, ACatalogThatStaysLockedIsLoggedOnceAndUpdatedLater) {
   const Volume locked("A", "64m");
   const Volume other("B", "64m");

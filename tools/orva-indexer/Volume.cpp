@@ -445,6 +445,9 @@ Volume::Result Volume::WorkOn(const VolumeRoot& root, const std::function<void()
       unreadable_ += static_cast<long long>(unreadable.size());
       unreadableExample_ = unreadable.front();
     }
+    if (!isWalkingAll_) {
+      LogUnreadable();
+    }
     // An event may have begun another walk.
     if (isEnd && ready_.empty()) {
       FinishWalk(result, files);
@@ -543,12 +546,18 @@ void Volume::FinishWalk(Result& result, long long files) {
                                  files_, std::chrono::duration<double>(walkTime_).count(),
                                  watches_ ? "" : "; its changes are looked for on a timer"));
   }
-  if (result.isFirstWalk && unreadable_ > 0) {
+  isUnreadableLogged_ = isUnreadableLogged_ && unreadable_ > 0 && !result.isFirstWalk;
+  LogUnreadable();
+  Recover();
+}
+
+/// Logs that files or folders cannot be read, unless that was logged since all could be.
+void Volume::LogUnreadable() {
+  if (unreadable_ > 0 && !std::exchange(isUnreadableLogged_, true)) {
     LogError(name_ +
              FormatString(": %lld files or folders cannot be read, for example ", unreadable_) +
              Printable(unreadableExample_));
   }
-  Recover();
 }
 
 void Volume::Opened(const Folder& folder, int descriptor) {

@@ -151,6 +151,7 @@ private:
                 const Found& found, std::time_t latest);
   void WalkNext(catalog::FolderIndexer& indexer);
   void FinishWalk(Result& result, long long files);
+  void LogUnreadable();
   void Opened(const Folder& folder, int descriptor);
   void GiveUpWatches(int error);
   bool IsComplete(const catalog::VolumeRoot& root, const Folder& folder, const std::string& name,
@@ -204,6 +205,7 @@ private:
   long long walkedFiles_ = 0;
   long long unreadable_ = 0; ///< folders and files, in this walk
   std::string unreadableExample_;
+  bool isUnreadableLogged_ = false;
   long long files_ = 0; ///< on the volume, as far as known
   Trouble trouble_ = Trouble::None;
   bool isRetry_ = false; ///< of a volume with trouble, which is not watched yet
