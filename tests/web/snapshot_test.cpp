@@ -7,11 +7,17 @@
 
 #include <gmock/gmock.h>
 
+#include <sys/mount.h>
+
+#include <algorithm>
 #include <chrono>
 #include <cstdlib>
 #include <ctime>
 #include <filesystem>
 #include <fstream>
+#include <iostream>
+#include <sstream>
+#include <thread>
 
 namespace orva::test {
 namespace {
@@ -461,6 +467,126 @@ TEST_F(ChangingSnapshot, ManyChangesMakeANewFile) {
   merged_->Run("DELETE FROM Files WHERE name < 'Photo_9'");
   EXPECT_TRUE(Update());
   EXPECT_THAT(ReadAll(*snapshot_), ::testing::Eq(ReadAll(*BuildAnother())));
+}
+
+/// A snapshot that many updates have changed, each of them less than a new one would be faster.
+class RenewedSnapshot : public ChangingSnapshot {
+protected:
+  /// Adds photos that are newer than all others, and follows.
+  void AddPhotos(int count) {
+    merged_->Run("BEGIN");
+    for (const int end = photos_ + count; photos_ < end; ++photos_) {
+      merged_->AddFile(a_, NameOf(photos_), 1000 + photos_, A);
+    }
+    merged_->Run("COMMIT");
+    snapshot_->Update({}, [this] { ++builds_; });
+  }
+
+  static std::string NameOf(int photo) { return "Photo_" + std::to_string(photo) + ".jpg"; }
+
+  std::string Newest() { return reader_->Photos({}, std::nullopt, 1).front().name; }
+
+  /// Until one photo more begins a renewal.
+  void ChangeMuch() {
+    AddPhotos(1);
+    builds_ = 0;
+    AddPhotos(10'000);
+    AddPhotos(10'000);
+  }
+
+  static std::ptrdiff_t Snapshots() {
+    return std::ranges::count_if(fs::directory_iterator(CACHE), [](const auto& entry) {
+      return entry.path().extension() == ".db";
+    });
+  }
+
+  /// Begins a renewal, and waits until it has a file. The next update after its end removes that,
+  /// or uses it.
+  void AwaitRenewal() {
+    snapshot_->Update();
+    while (Snapshots() == 1) {
+      std::this_thread::yield();
+    }
+  }
+
+  int photos_ = 0;
+  int builds_ = 0; ///< for which readers have to wait
+};
+
+TEST_F(RenewedSnapshot, IsFollowedUntilTheNewOneIsThere) {
+  ChangeMuch();
+  const std::string file = snapshot_->File();
+  do {
+    AddPhotos(1);
+    ASSERT_EQ(Newest(), NameOf(photos_ - 1));
+    ASSERT_EQ(snapshot_->Status().state, State::Current);
+  } while (snapshot_->File() == file);
+  EXPECT_EQ(builds_, 0);
+  EXPECT_EQ(Snapshots(), 1);
+  EXPECT_EQ(ReadAll(*snapshot_), ReadAll(*BuildAnother()));
+  EXPECT_FALSE(Update());
+}
+
+TEST_F(RenewedSnapshot, IsLeftForAnotherDatabase) {
+  ChangeMuch();
+  merged_->AddFile(a_, "last.jpg", 1'000'000, A);
+  AwaitRenewal();
+  path_ = "/tmp/other/zophotos.db";
+  MergedFile other(path_);
+  other.AddFile(other.AddVolume(B), "new.jpg", 1, B);
+  EXPECT_TRUE(Update());
+  EXPECT_THAT(Names(), ElementsAre("new.jpg"));
+  EXPECT_EQ(Snapshots(), 1);
+  path_.clear();
+  EXPECT_TRUE(Update());
+  EXPECT_THAT(Names(), IsEmpty());
+}
+
+/// In a file system of its own.
+class RenewedSnapshotOnASmallDisk : public RenewedSnapshot {
+protected:
+  RenewedSnapshotOnASmallDisk() {
+    fs::create_directories(CACHE);
+    EXPECT_EQ(mount("cache", CACHE.c_str(), "tmpfs", 0, "size=64m,nr_inodes=64,mode=700"), 0);
+  }
+  ~RenewedSnapshotOnASmallDisk() override {
+    reader_.reset();
+    snapshot_.reset();
+    EXPECT_EQ(umount(CACHE.c_str()), 0);
+  }
+};
+
+TEST_F(RenewedSnapshotOnASmallDisk, IsNotRenewedWithoutSpace) {
+  ChangeMuch();
+  constexpr std::uintmax_t ENOUGH_TO_FOLLOW = 1 << 20;
+  const auto available = fs::space(CACHE).available;
+  ASSERT_GT(available, ENOUGH_TO_FOLLOW);
+  std::ofstream(CACHE + "/ballast") << std::string(available - ENOUGH_TO_FOLLOW, '1');
+  for (int i = 0; i < 10; ++i) {
+    AddPhotos(1);
+    EXPECT_EQ(Newest(), NameOf(photos_ - 1));
+    EXPECT_EQ(Snapshots(), 1);
+  }
+  EXPECT_EQ(builds_, 0);
+}
+
+TEST_F(RenewedSnapshotOnASmallDisk, StaysAsItIsIfTheNewOneCannotBeWritten) {
+  ChangeMuch();
+  int inodes = 0;
+  while (std::ofstream(CACHE + "/inode-" + std::to_string(inodes))) {
+    ++inodes;
+  }
+  ASSERT_GT(inodes, 0);
+  std::ostringstream log;
+  std::streambuf* const former = std::cerr.rdbuf(log.rdbuf());
+  while (log.str().empty()) {
+    AddPhotos(1);
+    EXPECT_EQ(Newest(), NameOf(photos_ - 1));
+  }
+  std::cerr.rdbuf(former);
+  EXPECT_THAT(log.str(), HasSubstr("cannot renew the snapshot: "));
+  EXPECT_EQ(builds_, 0);
+  EXPECT_EQ(snapshot_->Status().state, State::Current);
 }
 
 TEST_F(ChangingSnapshot, AStoppedUpdateIsMadeLater) {

@@ -14,10 +14,14 @@
 #include <atomic>
 #include <chrono>
 #include <cstddef>
+#include <filesystem>
 #include <fstream>
+#include <future>
 #include <iostream>
 #include <mutex>
 #include <optional>
+#include <stdexcept>
+#include <thread>
 #include <utility>
 #include <vector>
 
@@ -34,11 +38,21 @@ constexpr std::chrono::seconds LONGEST_LOCK(5);
 /// Bytes of photos to sort in memory while a snapshot is built.
 constexpr std::size_t LARGEST_BATCH = 16 << 20;
 
-/// Changed photos after which a snapshot is built again. That is faster than to make so many
-/// changes, and the search index again knows the frequent prefixes.
+/// Photos that one update changes at most. To build the snapshot again is faster than to make more
+/// changes.
 std::int64_t MostChanges(std::int64_t photos) {
   return std::max<std::int64_t>(20'000, photos / 8);
 }
+
+/// Photos changed by any number of updates, after which a snapshot is renewed. The new search index
+/// knows the prefixes that are frequent now.
+std::int64_t ChangesToRenew(std::int64_t photos) {
+  return std::max<std::int64_t>(20'000, photos / 32);
+}
+
+/// After a renewal that failed, or without space for one; later pauses are twice as long.
+constexpr std::chrono::seconds SHORTEST_RENEWAL_PAUSE(60);
+constexpr std::chrono::seconds LONGEST_RENEWAL_PAUSE(3600);
 
 /// Ends an update because the caller wants it to stop.
 struct Stopped {};
@@ -105,6 +119,26 @@ public:
 private:
   std::vector<Id> ids_;
   std::vector<std::int64_t> missing_;
+};
+
+/// A snapshot that a thread makes while the present one is read and updated. Abandoned when
+/// destroyed.
+class Renewal {
+public:
+  using Make = std::packaged_task<SnapshotFile(const std::stop_token&)>;
+
+  explicit Renewal(Make make) : made_(make.get_future()), thread_(std::move(make)) {}
+
+  bool IsReady() const {
+    return made_.wait_for(std::chrono::seconds(0)) == std::future_status::ready;
+  }
+
+  /// Waits for the snapshot. Throws what making it has thrown.
+  SnapshotFile Take() { return made_.get(); }
+
+private:
+  std::future<SnapshotFile> made_;
+  std::jthread thread_;
 };
 
 class Snapshot::Implementation {
@@ -181,7 +215,9 @@ private:
     } catch (const SQLite::Exception&) {
       mustBuild_ = true;
     }
-    directory_.RemoveOthers(number_);
+    if (!renewal_) {
+      directory_.RemoveOthers(number_);
+    }
   }
 
   /// An error here is no reason for a pause.
@@ -234,32 +270,55 @@ private:
       return;
     }
     failed_ = identity;
-    if (!mustBuild_ && identity && *identity == file_->State().source) {
+    const bool isRenewed = renewal_ && renewal_->IsReady();
+    if (IsCurrent(identity) && !isRenewed) {
       isTidy_ = isTidy_ || !file_->Tidy();
-      Succeed();
-      return;
+    } else {
+      isTidy_ = false;
+      MergedSource source(path);
+      if (isRenewed && identity) {
+        AdoptRenewal(source, *identity, stop);
+      }
+      if (!IsCurrent(identity)) {
+        FollowOrBuild(source, identity, stop, tellBuild);
+      }
     }
-    isTidy_ = false;
-    MergedSource source(path);
+    Succeed();
+    if (!renewal_ && file_->State().changes > ChangesToRenew(file_->State().photos) &&
+        Clock::now() >= renewAt_) {
+      if (HasSpaceForRenewal()) {
+        StartRenewal(path);
+      } else {
+        RenewLater();
+      }
+    }
+  }
+
+  bool IsCurrent(const std::optional<SourceIdentity>& identity) {
+    return !mustBuild_ && identity && *identity == file_->State().source;
+  }
+
+  void FollowOrBuild(MergedSource& source, const std::optional<SourceIdentity>& identity,
+                     const std::stop_token& stop, const std::function<void()>& tellBuild) {
     const bool isOther = !identity || identity->file != file_->State().source.file;
-    if (mustBuild_ || isOther || !Continue(source, *identity, stop)) {
+    if (mustBuild_ || isOther || !Continue(*file_, source, *identity, stop)) {
       SetStatus(State::Building);
       if (tellBuild) {
         tellBuild();
       }
       Build(source, identity.value_or(SourceIdentity()), stop);
     }
-    Succeed();
   }
 
   /// Adds what is new in the merged database and removes what it does not have any more. Its rows
   /// never change, and ids are never used twice. Returns whether that was possible.
-  bool Continue(MergedSource& source, const SourceIdentity& identity, const std::stop_token& stop) {
-    SnapshotState& state = file_->State();
+  static bool Continue(SnapshotFile& file, MergedSource& source, const SourceIdentity& identity,
+                       const std::stop_token& stop) {
+    SnapshotState& state = file.State();
     const std::int64_t version = source.DataVersion();
-    const std::int64_t mostChanges = MostChanges(state.photos);
     const std::int64_t changesBefore = state.changes;
-    file_->Begin();
+    const std::int64_t mostChanges = changesBefore + MostChanges(state.photos);
+    file.Begin();
     bool hasChanged = false;
     MergedRows rows;
     PhotoBatch batch;
@@ -268,29 +327,28 @@ private:
       rows.Clear();
       more = source.ReadMore(state.position, rows);
       hasChanged = hasChanged || !rows.folders.empty();
-      AddRows(*file_, rows, batch, nullptr);
+      AddRows(file, rows, batch, nullptr);
       batch.Sort();
-      file_->AddPhotos(batch, true);
+      file.AddPhotos(batch, true);
       batch.Clear();
       if (state.changes > mostChanges) {
-        file_->Rollback();
+        file.Rollback();
         return false;
       }
     }
     const std::int64_t folders = state.folders;
-    const auto left = RemoveMissing(source, mostChanges, stop);
-    const Statistics statistics = ReadStatistics(source, stop);
+    const auto left = RemoveMissing(file, source, mostChanges, stop);
+    const Statistics statistics = ReadStatistics(source, [&] { StopIfAsked(stop); });
     const MergedSource::State sourceState = source.ReadState();
     if (!left || sourceState.lastFile < state.position.file) {
-      file_->Rollback();
+      file.Rollback();
       return false;
     }
     hasChanged = hasChanged || state.folders != folders;
     if (hasChanged) {
-      file_->AdoptFolders();
+      file.AdoptFolders();
     }
-    hasChanged =
-        file_->ReplaceStatistics(statistics) || hasChanged || state.changes != changesBefore;
+    hasChanged = file.ReplaceStatistics(statistics) || hasChanged || state.changes != changesBefore;
     SetSource(state, identity, sourceState, version);
     if (sourceState.dataVersion == version) {
       state.filesLeftOut = left->files - state.photos;
@@ -299,7 +357,7 @@ private:
     if (hasChanged) {
       state.version = std::max(state.version + 1, Now());
     }
-    file_->Commit();
+    file.Commit();
     return true;
   }
 
@@ -312,9 +370,10 @@ private:
   /// Removes what the merged database does not have any more, and returns how many rows it has;
   /// nothing if there is too much to remove. Everything new has been added, so equal counts mean
   /// that nothing is missing.
-  std::optional<RowCounts> RemoveMissing(MergedSource& source, std::int64_t mostChanges,
-                                         const std::stop_token& stop) {
-    const SnapshotState& state = file_->State();
+  static std::optional<RowCounts> RemoveMissing(SnapshotFile& file, MergedSource& source,
+                                                std::int64_t mostChanges,
+                                                const std::stop_token& stop) {
+    const SnapshotState& state = file.State();
     RowCounts left;
     {
       std::vector<std::uint32_t> ids;
@@ -325,12 +384,12 @@ private:
       left.files = std::ssize(ids);
       if (left.files != state.photos + state.filesLeftOut) {
         Missing<std::uint32_t> missing(std::move(ids));
-        file_->ForEachPhoto(
+        file.ForEachPhoto(
             [&](std::int64_t id) { missing.Check(id, RowOf(id, state.firstNumber)); });
         if (state.changes + std::ssize(missing.Ids()) > mostChanges) {
           return std::nullopt;
         }
-        file_->RemovePhotos(missing.Ids());
+        file.RemovePhotos(missing.Ids());
       }
     }
     std::vector<std::int64_t> ids;
@@ -340,45 +399,33 @@ private:
     left.folders = std::ssize(ids);
     if (left.folders != state.folders + state.foldersLeftOut) {
       Missing<std::int64_t> missing(std::move(ids));
-      file_->ForEachFolder([&](std::int64_t id) { missing.Check(id, id); });
+      file.ForEachFolder([&](std::int64_t id) { missing.Check(id, id); });
       for (const std::int64_t id : missing.Ids()) {
         StopIfAsked(stop);
-        file_->RemoveFolder(id);
+        file.RemoveFolder(id);
       }
     }
     return left;
   }
 
-  static Statistics ReadStatistics(MergedSource& source, const std::stop_token& stop) {
+  static Statistics ReadStatistics(MergedSource& source, const std::function<void()>& pulse) {
     Statistics statistics;
     for (std::int64_t after = 0; source.ReadStatistics(after, statistics);) {
-      StopIfAsked(stop);
+      pulse();
     }
     return statistics;
   }
 
   /// Makes a new snapshot next to the present one and replaces that.
   void Build(MergedSource& source, const SourceIdentity& identity, const std::stop_token& stop) {
-    directory_.RemoveOthers(number_);
     SnapshotFile file = CreateNext();
-    SnapshotState& state = file.State();
-    state.firstNumber = FirstNumber(identity);
-    const std::int64_t version = source.DataVersion();
-    const std::int64_t total = source.EstimateFiles();
-    const auto show = [&](std::int64_t done) {
+    Fill(file, source, identity, [&](std::int64_t done, std::int64_t total) {
       StopIfAsked(stop);
       const std::lock_guard lock(mutex_);
-      status_.done = std::min(done / 2, total);
+      status_.done = done;
       status_.total = total;
-    };
-    file.Begin();
-    PrefixSample sample(total);
-    CopyRows(source, file, sample, show);
-    file.SetFrequentPrefixes(sample.Frequent());
-    file.AdoptFolders();
-    file.IndexAll([&](std::int64_t done) { show(state.photos + done); });
-    file.ReplaceStatistics(ReadStatistics(source, stop));
-    SetSource(state, identity, source.ReadState(), version);
+    });
+    const SnapshotState& state = file.State();
     if (state.filesLeftOut != 0 || state.foldersLeftOut != 0) {
       Log("left out " + zophotos::Count(state.filesLeftOut, "file") + " and " +
           zophotos::Count(state.foldersLeftOut, "folder") +
@@ -388,8 +435,29 @@ private:
     mustBuild_ = false;
   }
 
-  void CopyRows(MergedSource& source, SnapshotFile& file, PrefixSample& sample,
-                const std::function<void(std::int64_t)>& show) {
+  /// Called often while a snapshot is filled. What it throws ends that.
+  using Progress = std::function<void(std::int64_t done, std::int64_t total)>;
+
+  /// Fills a new snapshot in a transaction that it begins.
+  static void Fill(SnapshotFile& file, MergedSource& source, const SourceIdentity& identity,
+                   const Progress& progress) {
+    SnapshotState& state = file.State();
+    state.firstNumber = FirstNumber(identity);
+    const std::int64_t version = source.DataVersion();
+    const std::int64_t total = source.EstimateFiles();
+    const auto show = [&](std::int64_t done) { progress(std::min(done / 2, total), total); };
+    file.Begin();
+    PrefixSample sample(total);
+    CopyRows(source, file, sample, show);
+    file.SetFrequentPrefixes(sample.Frequent());
+    file.AdoptFolders();
+    file.IndexAll([&](std::int64_t done) { show(state.photos + done); });
+    file.ReplaceStatistics(ReadStatistics(source, [&] { show(2 * total); }));
+    SetSource(state, identity, source.ReadState(), version);
+  }
+
+  static void CopyRows(MergedSource& source, SnapshotFile& file, PrefixSample& sample,
+                       const std::function<void(std::int64_t)>& show) {
     MergedRows rows;
     PhotoBatch batch;
     const auto flush = [&] {
@@ -444,11 +512,66 @@ private:
   }
 
   SnapshotFile CreateNext() {
+    EndRenewal();
     nextNumber_ = directory_.FreeNumber(number_);
     return SnapshotFile::Create(directory_.File(nextNumber_));
   }
 
-  /// Ends the transaction of a snapshot that CreateNext made, and makes it the present one.
+  /// The thread leaves the boot's identity out, so that a file that was not adopted is not used.
+  void StartRenewal(const std::string& path) {
+    EndRenewal();
+    nextNumber_ = directory_.FreeNumber(number_);
+    renewal_.emplace(
+        Renewal::Make([path, next = directory_.File(nextNumber_)](const std::stop_token& stop) {
+          const auto identity = Identify(path);
+          MergedSource source(path);
+          SnapshotFile file = SnapshotFile::Create(next);
+          Fill(file, source, identity.value_or(SourceIdentity()),
+               [&stop](std::int64_t, std::int64_t) { StopIfAsked(stop); });
+          file.Commit();
+          file.Complete();
+          return file;
+        }));
+  }
+
+  /// Space for as much as the present file has, and as much again: the present one is changed
+  /// meanwhile, and other programs need some.
+  bool HasSpaceForRenewal() {
+    std::error_code error;
+    const auto available = std::filesystem::space(file_->Path(), error).available;
+    return !error && available / 2 > static_cast<std::uintmax_t>(file_->Bytes());
+  }
+
+  void RenewLater() {
+    renewalPause_ = std::clamp(renewalPause_ * 2, SHORTEST_RENEWAL_PAUSE, LONGEST_RENEWAL_PAUSE);
+    renewAt_ = Clock::now() + renewalPause_;
+  }
+
+  void EndRenewal() {
+    renewal_.reset();
+    directory_.RemoveOthers(number_);
+  }
+
+  /// Makes the renewed snapshot the present one, with what has changed meanwhile. If it cannot be
+  /// used, the present one stays.
+  void AdoptRenewal(MergedSource& source, const SourceIdentity& identity,
+                    const std::stop_token& stop) {
+    try {
+      SnapshotFile file = std::exchange(renewal_, std::nullopt)->Take();
+      if (file.State().source.file == identity.file && Continue(file, source, identity, stop)) {
+        file.Begin();
+        Publish(std::move(file));
+        renewalPause_ = {};
+        return;
+      }
+    } catch (const std::runtime_error& error) { // of the merged database or the snapshot
+      Log(std::string("cannot renew the snapshot: ") + error.what());
+    }
+    RenewLater();
+    directory_.RemoveOthers(number_);
+  }
+
+  /// Ends the transaction of a snapshot with the number nextNumber_, and makes it the present one.
   void Publish(SnapshotFile file) {
     const std::int64_t former = file_ ? file_->State().version : 0;
     file.State().version = std::max(former + 1, Now());
@@ -469,8 +592,11 @@ private:
   const FindPath findPath_;
   const std::string boot_;
   std::uint64_t number_ = 0;     ///< of the present file
-  std::uint64_t nextNumber_ = 0; ///< of the file that CreateNext made
+  std::uint64_t nextNumber_ = 0; ///< of the file that is made next, or by the renewal
   std::optional<SnapshotFile> file_;
+  std::optional<Renewal> renewal_;
+  Clock::time_point renewAt_; ///< not earlier
+  std::chrono::seconds renewalPause_{};
   bool mustBuild_ = false;
   bool isTidy_ = false; ///< the search index, since the last change
 

@@ -154,6 +154,10 @@ std::optional<SnapshotFile> SnapshotFile::Open(const std::string& path) {
   }
 }
 
+std::int64_t SnapshotFile::Bytes() {
+  return NumberIn(database_, "PRAGMA page_count") * NumberIn(database_, "PRAGMA page_size");
+}
+
 SQLite::Statement& SnapshotFile::Prepared(const char* sql) {
   auto found = statements_.find(std::string_view(sql));
   if (found == statements_.end()) {

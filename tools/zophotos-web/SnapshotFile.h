@@ -102,6 +102,9 @@ public:
   const std::string& Path() const noexcept { return path_; }
   SnapshotState& State() noexcept { return state_; }
 
+  /// The size of the database, in bytes.
+  std::int64_t Bytes();
+
   void Begin();
   /// Saves the state as well.
   void Commit();
