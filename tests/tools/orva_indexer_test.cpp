@@ -464,23 +464,48 @@ TEST_F(VolumeWorkTest, APhotoThatIsBeingWrittenWaitsAlsoInARenamedFolder) {
   EXPECT_TRUE(WorkUntilFound(FILES, {"2/b.jpg|1", "2/slow.jpg|10", "a.jpg|1"}));
 }
 
-TEST_F(VolumeWorkTest, FilesOfARenamedFolderAreForgotten) {
-  constexpr char FILES[] = "SELECT path FROM Files WHERE path NOT LIKE '%.txt' AND isDeleted = 0 "
-                           "ORDER BY path";
-  Write(At("1/a.jpg"));
-  ASSERT_TRUE(WorkUntilFound(FILES, {"1/a.jpg"}));
-  // As many files as are remembered at most, which nobody closes.
-  for (int file = 0; file < 10'000; ++file) {
-    fs::create_hard_link(At("1/a.jpg"), At("1/" + std::to_string(file) + ".txt"));
+TEST_F(VolumeWorkTest, APhotoThatIsBeingWrittenWaitsAlsoUnderAnotherName) {
+  constexpr char FILES[] = "SELECT path, size FROM Files ORDER BY path";
+  std::ofstream slow(At("slow.part"));
+  slow << "half" << std::flush;
+  fs::rename(At("slow.part"), At("slow.jpg"));
+  Write(At("a.jpg"), "1");
+  ASSERT_TRUE(WorkUntilFound(FILES, {"a.jpg|1"}));
+  Write(At("b.jpg"), "1");
+  ASSERT_TRUE(WorkUntilFound(FILES, {"a.jpg|1", "b.jpg|1"}));
+  slow << " whole";
+  slow.close();
+  EXPECT_TRUE(WorkUntilFound(FILES, {"a.jpg|1", "b.jpg|1", "slow.jpg|10"}));
+}
+
+TEST_F(VolumeWorkTest, APhotoThatIsStillEmptyWaitsUntilItIsClosed) {
+  constexpr char FILES[] = "SELECT path FROM Files ORDER BY path";
+  std::ofstream slow(At("slow.jpg"));
+  Lines others;
+  for (const std::string name : {"a.jpg", "b.jpg", "c.jpg", "d.jpg", "e.jpg"}) { // 2 s each
+    Write(At(name));
+    others.push_back(name);
+    ASSERT_TRUE(WorkUntilFound(FILES, others));
   }
-  Write(At("b.jpg"));
-  ASSERT_TRUE(WorkUntilFound(FILES, {"1/a.jpg", "b.jpg"}));
-  fs::rename(At("1"), At("2"));
-  ASSERT_TRUE(WorkUntilFound(FILES, {"2/a.jpg", "b.jpg"}));
+  slow << "whole";
+  slow.close();
+  others.emplace_back("slow.jpg");
+  EXPECT_TRUE(WorkUntilFound(FILES, others));
+}
+
+TEST_F(VolumeWorkTest, ManyLinksDoNotLetUnfinishedPhotosIn) {
+  constexpr char FILES[] = "SELECT path FROM Files ORDER BY path";
+  Write(At("links/a.jpg"));
+  ASSERT_TRUE(WorkUntilFound(FILES, {"links/a.jpg"}));
+  for (int link = 0; link < 10'001; ++link) {
+    fs::create_symlink("nowhere", At("links/" + std::to_string(link)));
+  }
+  Write(At("links/b.jpg"));
+  ASSERT_TRUE(WorkUntilFound(FILES, {"links/a.jpg", "links/b.jpg"}));
   std::ofstream slow(At("slow.jpg"));
   slow << "half" << std::flush;
   Write(At("z.jpg"));
-  EXPECT_TRUE(WorkUntilFound(FILES, {"2/a.jpg", "b.jpg", "z.jpg"}));
+  EXPECT_TRUE(WorkUntilFound(FILES, {"links/a.jpg", "links/b.jpg", "z.jpg"}));
 }
 
 TEST_F(IndexerTest, ALinkIsEnteredAlthoughItIsNeverClosed) {

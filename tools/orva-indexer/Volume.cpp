@@ -111,10 +111,10 @@ bool IsPhoto(const std::string& name) {
   return catalog::CategoryOf(catalog::ExtensionOf(name)) == catalog::PHOTO;
 }
 
-/// When to look again at a file that is open, by the time since it was written.
-Clock::time_point NextCheck(Clock::time_point written) {
-  const auto now = Clock::now();
-  return now + std::max<Clock::duration>(LATEST, (now - written) / 2);
+/// When to look again at a file that is open, by the time since it was written. Usually its end is
+/// reported before, but not if it was renamed meanwhile or its folder was not watched.
+Clock::time_point NextCheck(Clock::duration age) {
+  return Clock::now() + std::max<Clock::duration>(LATEST, age / 2);
 }
 
 bool IsProductFolder(const FolderWatches::Event& event) {
@@ -167,7 +167,7 @@ void Volume::Handle(const FolderWatches::Event& event) {
     isUnmounted_ = true;
     notBefore_ = {};
   } else if ((event.mask & IN_UNMOUNT) != 0) { // a file system mounted below the volume
-    Unwatch(event.folder);
+    watches_->Forget(event.folder);
     MarkDirty(FolderOf(event.folder));
   } else if ((event.mask & (IN_IGNORED | IN_DELETE_SELF | IN_MOVE_SELF)) != 0) {
     if (event.folder.empty() && (event.mask & IN_IGNORED) == 0) {
@@ -177,7 +177,7 @@ void Volume::Handle(const FolderWatches::Event& event) {
     if ((event.mask & IN_ISDIR) != 0) {
       if ((event.mask & (IN_MOVED_FROM | IN_MOVED_TO | IN_DELETE | IN_CREATE)) != 0) {
         // Also for a new folder: another one may have had its name.
-        Unwatch(event.folder + event.name + '/');
+        watches_->Forget(event.folder + event.name + '/');
       }
     } else {
       NoteFile(event);
@@ -202,16 +202,6 @@ void Volume::NoteFile(const FolderWatches::Event& event) {
     }
   } else if ((event.mask & (IN_CLOSE_WRITE | IN_MOVED_FROM | IN_MOVED_TO | IN_DELETE)) != 0) {
     openFiles_.erase(path);
-  }
-}
-
-/// Ends the watches of a folder and of those below it. The end of writing of their files is not
-/// reported any more.
-void Volume::Unwatch(const std::string& folder) {
-  watches_->Forget(folder);
-  auto file = openFiles_.lower_bound(folder);
-  while (file != openFiles_.end() && file->first.starts_with(folder)) {
-    file = openFiles_.erase(file);
   }
 }
 
@@ -245,7 +235,7 @@ void Volume::HandleMounts(const std::set<std::string>& mountPoints) {
   for (const std::string& folder : changed) {
     if (watches_) {
       // A folder that is not watched is walked when the one above is listed.
-      Unwatch(folder);
+      watches_->Forget(folder);
       MarkDirty(FolderOf(folder));
     }
   }
@@ -426,11 +416,10 @@ Volume::Result Volume::WorkOn(const VolumeRoot& root, const std::function<void()
     isStampDue_ = false;
     isUncommitted_ = false;
     uncommitted_.clear();
-    if (ready_.empty()) {
-      asked_ = 0;
-    }
     if (ready_.empty() && pending_.empty()) {
-      written_.clear(); // the rest has no row, or one that waits
+      // The rest has no row, or one that waits.
+      written_.clear();
+      openFiles_.clear();
     }
     lockedSince_.reset();
     isLockLogged_ = false;
@@ -510,7 +499,7 @@ void Volume::WalkNext(FolderIndexer& indexer) {
   if (!folder) {
     // The folder above has not been listed since this one has appeared.
     if (watches_) {
-      Unwatch(task.path);
+      watches_->Forget(task.path);
     }
     ready_.push_back({.path = FolderOf(task.path)});
     return;
@@ -561,7 +550,6 @@ void Volume::LogUnreadable() {
 }
 
 void Volume::Opened(const Folder& folder, int descriptor) {
-  wasWatched_ = watches_ && watches_->Has(folder.path);
   if (watches_ && !watches_->Add(folder.path, descriptor)) {
     GiveUpWatches(errno);
   }
@@ -621,29 +609,28 @@ bool Volume::IsBeingWritten(const VolumeRoot& root, const std::string& folder,
                             const std::string& name, Clock::duration age) {
   const auto now = Clock::now();
   const std::string path = folder + name;
-  const auto open = openFiles_.find(path);
-  if (open != openFiles_.end()) {
-    const bool hasContent = open->second.hasContent;
-    const auto end =
-        open->second.written + (hasContent ? Clock::duration(LONGEST_OPEN) : LONGEST_EMPTY);
-    // It may have been truncated by its name, or on another machine: then nobody closes it. The end
-    // may also be missed: it is reported for another name, or while the folder is not watched.
-    if (now < end && !(hasContent && IsOpenForWriting(root, path) == false)) {
-      CheckLater(folder, std::min(end, NextCheck(open->second.written)));
-      return true;
+  // A whole walk may find any number of new files.
+  if (IsPhoto(name) && age >= 0s && age < LONGEST_OPEN &&
+      (!isWalkingAll_ || ++asked_ <= MOST_FILES)) {
+    if (const auto isOpen = IsOpenForWriting(root, path)) {
+      if (*isOpen) {
+        CheckLater(folder, NextCheck(age));
+      }
+      return *isOpen;
     }
-    openFiles_.erase(open);
+  }
+  // It is not known, except from events.
+  const auto open = openFiles_.find(path);
+  if (open == openFiles_.end()) {
     return false;
   }
-  // Events from before the folder was watched are not known.
-  if (!wasWatched_ && age >= 0s && age < LONGEST_OPEN && asked_ < MOST_FILES && IsPhoto(name)) {
-    ++asked_;
-    if (IsOpenForWriting(root, path) == true) {
-      openFiles_[path] = {.written = now - age, .hasContent = true};
-      CheckLater(folder, NextCheck(now - age));
-      return true;
-    }
+  const auto end = open->second.written +
+                   (open->second.hasContent ? Clock::duration(LONGEST_OPEN) : LONGEST_EMPTY);
+  if (now < end) {
+    CheckLater(folder, std::min(end, NextCheck(now - open->second.written)));
+    return true;
   }
+  openFiles_.erase(open);
   return false;
 }
 

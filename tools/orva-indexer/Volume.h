@@ -137,7 +137,6 @@ private:
 
   void StartAgain();
   void WalkAll();
-  void Unwatch(const std::string& folder);
   void MarkDirty(const std::string& folder);
   void CheckLater(const std::string& folder, Clock::time_point when);
   void Handle(const FolderWatches::Event& event);
@@ -178,7 +177,7 @@ private:
 
   std::vector<Task> ready_; ///< the last one is next
   std::map<std::string, Pending> pending_;
-  std::map<std::string, OpenFile> openFiles_; ///< by path, in folders that are watched
+  std::unordered_map<std::string, OpenFile> openFiles_; ///< as events say
   /// Paths of photos that were written or replaced since their rows were.
   std::unordered_set<std::string> written_;
   std::vector<std::string> uncommitted_; ///< those whose rows were written since the last commit
@@ -191,7 +190,6 @@ private:
   bool isWalkWanted_ = false; ///< also where the folders are watched
   bool isStampWanted_ = false;
   bool isStampDue_ = false;     ///< of TakeStamp
-  bool wasWatched_ = false;     ///< the folder that is walked was before
   bool hasOtherAccess_ = false; ///< the folder that is walked lets other users pass than before
 
   dev_t device_ = 0; ///< of the root, as it was walked
