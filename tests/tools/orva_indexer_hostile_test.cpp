@@ -5,7 +5,10 @@
 #include "system/PeakMemory.h"
 
 #include "CatalogSchema.h"
+#include "FolderIndexer.h"
 #include "Indexer.h"
+#include "Sql.h"
+#include "VolumeRoot.h"
 #include "orvadb/VolumeDB.h"
 
 #include <gmock/gmock.h>
@@ -243,6 +246,53 @@ TEST_F(HostileIndexerTest, LongNamesInACatalogTakeLittleMemory) {
   if (!AreProgramsSanitized()) {
     EXPECT_LT(PeakOf(Indexer().Pid()), 96 << 10); // KiB
   }
+}
+
+TEST_F(HostileIndexerTest, ALargeCatalogWithoutIndexesTakesLittleMemory) {
+  const Volume volume("A", "2g");
+  Write(volume.Path() + "/Pictures/a.jpg");
+  MakeCatalog(volume.Path());
+  Change(
+      volume.Path(),
+      {"DROP INDEX Folders_path",
+       "WITH RECURSIVE n(i) AS (VALUES(100) UNION ALL SELECT i + 1 FROM n WHERE i < 50099), "
+       "named(i, name) AS (SELECT i, format('%d%.*c', i, 2000, 'x') FROM n) "
+       "INSERT INTO Folders SELECT i, -1, name || '/', name, 4, 1, 0, 0, 0, 0, 1, 1 FROM named"});
+  StartService();
+  StartIndexer();
+  EXPECT_THAT(AwaitCatalog(volume.Path()), IsEmpty());
+  EXPECT_THAT(ErrorLines(), ElementsAre(HasSubstr("it is large and has no indexes")));
+  if (!AreProgramsSanitized()) {
+    EXPECT_LT(PeakOf(Indexer().Pid()), 96 << 10); // KiB
+  }
+}
+
+TEST_F(HostileIndexerTest, ManyRowsWithoutFilesAreRemovedInPieces) {
+  const Volume volume("A", "2g");
+  Write(volume.Path() + "/Pictures/a.jpg");
+  MakeCatalog(volume.Path());
+  const std::string numbers =
+      "WITH RECURSIVE n(i) AS (VALUES(1000) UNION ALL SELECT i + 1 FROM n WHERE i < 151000) ";
+  Change(volume.Path(),
+         {numbers + "INSERT INTO Folders "
+                    "SELECT i, -1, i || '/', i, 4, 1, 0, 0, 0, 0, 1, 1 FROM n",
+          numbers +
+              "INSERT INTO Files SELECT i, -1, i || '.jpg', i || '.jpg', 3, 1, 0, 0, 0, 0, 1, "
+              "1, 'jpg', 1 FROM n"});
+  const auto catalog = catalog::OpenCatalog(volume.Path());
+  const catalog::VolumeRoot root(volume.Path(), catalog::VolumeRoot::Kind::Mount);
+  catalog::FolderIndexer indexer(*catalog, root, catalog::NewPhotos::Waiting, std::time(nullptr),
+                                 {});
+  int unfinished = 0;
+  for (; indexer.Update({}).empty(); ++unfinished) {
+    ASSERT_FALSE(indexer.IsFinished());
+  }
+  EXPECT_TRUE(indexer.IsFinished());
+  EXPECT_EQ(unfinished, 2); // one with files, one with folders
+  EXPECT_EQ(indexer.Summary().folders, 1);
+  EXPECT_EQ(indexer.Summary().deleted, 150'001);
+  EXPECT_EQ(catalog::SelectNumber(*catalog, "SELECT count(*) FROM Folders WHERE isDeleted = 0"), 1);
+  EXPECT_EQ(catalog::SelectNumber(*catalog, "SELECT count(*) FROM Files WHERE isDeleted = 0"), 1);
 }
 
 TEST_F(HostileIndexerTest, AVolumeIsNotIndexedWhileItsFolderOfTheProductIsNone) {

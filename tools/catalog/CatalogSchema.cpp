@@ -148,6 +148,12 @@ bool HasOwnSchema(const db::DB& catalog) {
   return own;
 }
 
+bool HasIndexes(const db::DB& catalog) {
+  return std::ranges::all_of(INDEXES, [&catalog](const std::string& sql) {
+    return SelectNumber(catalog, "SELECT count(*) FROM sqlite_schema WHERE sql = ?", sql) != 0;
+  });
+}
+
 void CreateSchema(const db::DB& catalog, unsigned busyTimeout) {
   db::Transaction transaction(catalog, busyTimeout);
   CreateTables(catalog);

@@ -25,6 +25,9 @@ std::unique_ptr<db::VolumeDB> OpenCatalog(const std::string& mountPoint);
 /// made, with the same definition. In others, writing a row may do anything.
 bool HasOwnSchema(const db::DB& catalog);
 
+/// Whether the catalog with our schema has all indexes.
+bool HasIndexes(const db::DB& catalog);
+
 /// Creates the tables, indexes and the identity that are missing. Waits `busyTimeout` milliseconds
 /// for other programs.
 void CreateSchema(const db::DB& catalog, unsigned busyTimeout = BUSY_TIMEOUT);

@@ -23,12 +23,16 @@
 #include <memory>
 #include <string_view>
 #include <system_error>
+#include <tuple>
 
 namespace orva::catalog {
 namespace {
 
 /// How often the caller's pulse is called: once for so many names or rows.
 constexpr std::size_t NAMES_PER_PULSE = 256;
+
+/// Vanished files, and folders, of one folder that an update marks deleted.
+constexpr std::size_t MOST_VANISHED = 100'000;
 
 /// Bytes of the longest name on any file system.
 constexpr std::size_t LONGEST_NAME = 1024;
@@ -101,6 +105,7 @@ void FolderIndexer::Pulse(std::size_t count) const {
 
 std::vector<IndexedFolder> FolderIndexer::Update(const IndexedFolder& folder) {
   Pulse(0);
+  isFinished_ = true;
   util::FileDescriptor descriptor = volume_.Open(folder.path, O_RDONLY | O_DIRECTORY);
   struct stat status = {};
   if (!descriptor || fstat(descriptor.Get(), &status) != 0) {
@@ -121,6 +126,7 @@ std::vector<IndexedFolder> FolderIndexer::Update(const IndexedFolder& folder) {
   }
 
   const Listing listing = List(folder, descriptor.Release());
+  const auto [files, photos, rows] = std::tuple(summary_.files, summary_.photos, summary_.rows);
   const FileChanges changes = CompareFiles(folder, listing);
   std::size_t count = 0;
   for (const FileChange& change : changes.written) {
@@ -131,7 +137,14 @@ std::vector<IndexedFolder> FolderIndexer::Update(const IndexedFolder& folder) {
     DeleteFile(file);
     Pulse(++count);
   }
-  return UpdateFolders(folder, listing);
+  std::vector<IndexedFolder> folders;
+  if (isFinished_) {
+    folders = UpdateFolders(folder, listing);
+  }
+  if (!isFinished_) { // they are counted when this is repeated
+    std::tie(summary_.files, summary_.photos, summary_.rows) = std::tie(files, photos, rows);
+  }
+  return folders;
 }
 
 std::optional<IndexedFolder> FolderIndexer::Find(const std::string& path) const {
@@ -236,6 +249,10 @@ FolderIndexer::FolderRows FolderIndexer::ReadFolderRows(const IndexedFolder& fol
                                                  .isSystem = row.GetBool(6)},
                                        .lastModifiedDate = row.GetTime(3)},
                             .isDeleted = isDeleted});
+    } else if (!isDeleted && listing.isWhole &&
+               rows.vanished.size() + rows.crafted.size() >= MOST_VANISHED) {
+      rows.areAll = false;
+      break;
     } else if (!isDeleted && listing.isWhole) {
       (name.size() > LONGEST_NAME ? rows.crafted : rows.vanished).push_back(id);
     }
@@ -262,6 +279,10 @@ std::vector<IndexedFolder> FolderIndexer::UpdateFolders(const IndexedFolder& fol
   for (const long long id : rows.crafted) {
     MarkFolderDeleted(id); // what is below it cannot be reached then
     Pulse(0);
+  }
+  isFinished_ = rows.areAll;
+  if (!isFinished_) {
+    return {};
   }
   std::vector<IndexedFolder> folders;
   folders.reserve(listing.folders.size());
@@ -362,7 +383,9 @@ FolderIndexer::FileChanges FolderIndexer::CompareFiles(const IndexedFolder& fold
     const bool isThere = entry != listing.files.end() && entry->name == name;
     FileRow known{.id = row.GetInt64(0), .status = row.GetInt(6), .isDeleted = row.GetBool(5)};
     if (!isThere) {
-      if (!known.isDeleted && listing.isWhole) {
+      if (!known.isDeleted && listing.isWhole && changes.vanished.size() >= MOST_VANISHED) {
+        isFinished_ = false;
+      } else if (!known.isDeleted && listing.isWhole) {
         known.isPhoto = IsPhoto(name);
         changes.vanished.push_back(known);
       }
@@ -480,33 +503,55 @@ void FolderIndexer::MarkFolderDeleted(long long id) {
           id);
 }
 
-/// Marks a folder and all that is below it deleted.
+/// Marks a folder and all that is below it deleted. In parts: SQLite keeps the ids of rows that a
+/// statement changes in memory.
 void FolderIndexer::DeleteTree(const std::string& path) {
+  constexpr int PART = 10'000;
   hasVisibleChanges_ = true;
   const std::string end = EndOfTree(path);
-  summary_.deleted += SelectNumber(
-      catalog_, "SELECT count(*) FROM Files WHERE path >= ? AND path < ? AND isDeleted = 0", path,
-      end);
-  Execute(catalog_,
-          "UPDATE Transcodings SET status = ?, lastUpdatedDate = ? WHERE sourceId IN "
-          "(SELECT id FROM Files WHERE path >= ? AND path < ? AND isDeleted = 0)",
-          static_cast<int>(WITHDRAWN), Stamp(), path, end);
-  Execute(catalog_,
-          "INSERT OR IGNORE INTO Removals(fileId) SELECT id FROM Files "
-          "WHERE path >= ? AND path < ? AND isDeleted = 0 AND category = 3",
-          path, end);
-  Execute(catalog_,
-          "DELETE FROM Failures WHERE fileId IN "
-          "(SELECT id FROM Files WHERE path >= ? AND path < ? AND isDeleted = 0 AND status = 2)",
-          path, end);
-  Execute(catalog_,
-          "UPDATE Files SET isDeleted = 1, status = ?, lastUpdatedDate = ? "
-          "WHERE path >= ? AND path < ? AND isDeleted = 0",
-          static_cast<int>(INDEXED), Stamp(), path, end);
+  for (std::string begin = path; begin < end;) {
+    std::string next = end;
+    {
+      db::Statement row(catalog_, "SELECT path FROM Files WHERE path >= ? AND path < ? "
+                                  "ORDER BY path LIMIT 1 OFFSET ?");
+      row.BindText(1, begin);
+      row.BindText(2, end);
+      row.BindInt64(3, PART);
+      if (row.Fetch() && row.IsText(0)) {
+        next = row.GetText(0);
+      }
+    }
+    DeleteFiles(begin, next);
+    begin = std::move(next);
+    Pulse(0);
+  }
   Execute(catalog_,
           "UPDATE Folders SET isDeleted = 1, lastUpdatedDate = ? "
           "WHERE path >= ? AND path < ? AND isDeleted = 0",
           Stamp(), path, end);
+}
+
+/// Marks the files with paths from `begin` to before `end` deleted.
+void FolderIndexer::DeleteFiles(const std::string& begin, const std::string& end) {
+  summary_.deleted += SelectNumber(
+      catalog_, "SELECT count(*) FROM Files WHERE path >= ? AND path < ? AND isDeleted = 0", begin,
+      end);
+  Execute(catalog_,
+          "UPDATE Transcodings SET status = ?, lastUpdatedDate = ? WHERE sourceId IN "
+          "(SELECT id FROM Files WHERE path >= ? AND path < ? AND isDeleted = 0)",
+          static_cast<int>(WITHDRAWN), Stamp(), begin, end);
+  Execute(catalog_,
+          "INSERT OR IGNORE INTO Removals(fileId) SELECT id FROM Files "
+          "WHERE path >= ? AND path < ? AND isDeleted = 0 AND category = 3",
+          begin, end);
+  Execute(catalog_,
+          "DELETE FROM Failures WHERE fileId IN "
+          "(SELECT id FROM Files WHERE path >= ? AND path < ? AND isDeleted = 0 AND status = 2)",
+          begin, end);
+  Execute(catalog_,
+          "UPDATE Files SET isDeleted = 1, status = ?, lastUpdatedDate = ? "
+          "WHERE path >= ? AND path < ? AND isDeleted = 0",
+          static_cast<int>(INDEXED), Stamp(), begin, end);
 }
 
 long long FolderIndexer::DeleteUnreachableRows(long long folders, long long files) {

@@ -106,6 +106,10 @@ public:
 
   const IndexSummary& Summary() const noexcept { return summary_; }
 
+  /// Whether the last update has done everything. Otherwise, many rows had vanished, and the folder
+  /// has to be updated again.
+  bool IsFinished() const noexcept { return isFinished_; }
+
   /// Whether a row was changed.
   bool HasChanged() const noexcept { return stamp_ != 0; }
 
@@ -135,6 +139,7 @@ private:
     std::vector<FolderRow> known;    ///< by name
     std::vector<long long> vanished; ///< ids
     std::vector<long long> crafted;  ///< ids; their names are too long for any file system
+    bool areAll = true;              ///< otherwise, some more have vanished
   };
   struct FileRow {
     long long id = 0;
@@ -174,6 +179,7 @@ private:
   void DeleteFile(const FileRow& file);
   void MarkFolderDeleted(long long id);
   void DeleteTree(const std::string& path);
+  void DeleteFiles(const std::string& begin, const std::string& end);
   void DeleteUnreachableFolders();
   void DeleteUnreachableFiles();
   void LeaveAlone(const std::string& path, const std::string& reason);
@@ -186,6 +192,7 @@ private:
   const Hooks hooks_;
   std::time_t stamp_ = 0; ///< 0 until the first change
   bool hasVisibleChanges_ = false;
+  bool isFinished_ = true;
   long long nextFolderId_ = 1;
   long long nextFileId_ = 1;
   std::vector<std::string> leftAlone_; ///< paths, without a trailing separator

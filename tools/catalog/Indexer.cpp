@@ -24,6 +24,9 @@ IndexSummary Indexer::Run() {
     const IndexedFolder folder = std::move(waiting.back());
     waiting.pop_back();
     std::vector<IndexedFolder> inside = indexer.Update(folder);
+    while (!indexer.IsFinished()) {
+      inside = indexer.Update(folder);
+    }
     if (inside.empty() && progress_) {
       progress_(indexer.Summary());
     }

@@ -29,6 +29,10 @@ namespace {
 /// Bytes of the longest text or row. The longest of ours has a path twice, and a reason.
 constexpr int LONGEST_VALUE = 16 << 10;
 
+/// Bytes. To make an index takes as much memory as the index. Catalogs of earlier versions lack
+/// some.
+constexpr long long LARGEST_WITHOUT_INDEXES = 64 << 20;
+
 constexpr std::array<const char*, 4> SUFFIXES = {"", "-wal", "-shm", "-journal"};
 
 /// How many catalogs are kept that were set aside.
@@ -126,11 +130,18 @@ void RefuseImplausibleContent(const db::DB& catalog, std::time_t latest) {
   }
 }
 
+/// Bytes of the catalog.
+long long SizeOf(const db::DB& catalog) {
+  return SelectNumber(catalog, "PRAGMA page_count") * SelectNumber(catalog, "PRAGMA page_size");
+}
+
 std::unique_ptr<db::VolumeDB> Open(const VolumeRoot& volume, std::time_t latest,
                                    unsigned busyTimeout) {
   auto catalog = ConnectToCatalog(volume);
   SelectNumber(*catalog, util::FormatString("PRAGMA busy_timeout = %u", busyTimeout).c_str());
   Require(HasOwnSchema(*catalog), "it has tables, indexes, triggers or views of others");
+  Require(HasIndexes(*catalog) || SizeOf(*catalog) <= LARGEST_WITHOUT_INDEXES,
+          "it is large and has no indexes");
   Execute(*catalog, "PRAGMA cache_size = -16384");
   SelectNumber(*catalog, "PRAGMA journal_mode = WAL");
   CreateSchema(*catalog, busyTimeout);

@@ -509,6 +509,10 @@ void Volume::WalkNext(FolderIndexer& indexer) {
   const long long linked = indexer.Summary().linked;
   hasOtherAccess_ = false;
   std::vector<Folder> inside = indexer.Update(*folder);
+  if (!indexer.IsFinished()) {
+    ready_.push_back(task);
+    return;
+  }
   if (!task.recursive && indexer.Summary().linked > linked) {
     isWalkWanted_ = true; // the event was about one of the file's names
   }
