@@ -189,7 +189,8 @@ class Grid {
     const needsNewer = this.hasNewer && box.top > -NEAR;
     if (needsOlder || needsNewer) {
       this.isLooking = true;
-      const hasSucceeded = await this.run(() => needsOlder ? this.addOlder() : this.addNewer());
+      const hasSucceeded = await this.run(() => this.photos.length === 0 ? this.compare()
+        : needsOlder ? this.addOlder() : this.addNewer());
       this.isLooking = false;
       return hasSucceeded && this.look();
     }
@@ -339,13 +340,14 @@ class Grid {
   // Follows a change of the list. What is above the lower end of the window stays as it is while the
   // user looks at it: new photos there are only told of, and photos that have left are greyed.
   async compare() {
-    const isFree = this.photos.length === 0 || (this.isAtTop() && !this.hasNewer);
+    const isEmpty = this.photos.length === 0;
+    const isFree = isEmpty || (this.isAtTop() && !this.hasNewer);
     const last = this.photos.at(-1)?.id;
-    let parameters = this.hasNewer ? `&before=${BigInt(this.photos[0].id) + 1n}` : "";
+    let parameters = this.hasNewer && !isEmpty ? `&before=${BigInt(this.photos[0].id) + 1n}` : "";
     let all = [];
     let isMore = true;
     while (isMore && all.length < MOST && (all.length === 0 || !this.hasOlder ||
-           isNewer(all.at(-1).id, last))) {
+           (!isEmpty && isNewer(all.at(-1).id, last)))) {
       const { photos, more } = await this.fetchPhotos(parameters);
       all.push(...photos);
       isMore = more && photos.length > 0;
@@ -353,6 +355,7 @@ class Grid {
     }
     if (isFree) {
       this.tell(0, false);
+      this.hasNewer = false;
       this.hasOlder = isMore;
       this.show(all, false);
       return;
