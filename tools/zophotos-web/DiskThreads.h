@@ -13,11 +13,11 @@
 
 namespace orva::web {
 
-/// Threads for work that may wait for the disk of a volume. A slow disk delays only work on its own
-/// volume. Any thread.
+/// Threads for work that may wait for the disk of a volume. Slow disks delay only work on their own
+/// volumes, unless eight or more are slow: these can take all threads. Any thread.
 class DiskThreads {
 public:
-  static constexpr std::size_t THREADS = 4;
+  static constexpr std::size_t THREADS = 16;
   static constexpr std::size_t MOST_PER_VOLUME = 2; ///< of the threads
   static constexpr std::size_t MOST_WAITING = 300;
   static constexpr std::chrono::seconds LONGEST_WAIT{10};
