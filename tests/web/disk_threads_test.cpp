@@ -34,6 +34,12 @@ protected:
     }
   }
 
+  /// Adds as much work on one of these volumes as is accepted.
+  void FillUp() {
+    while (threads_.Add("/shares/Slow0/", [](bool /*mayRun*/) {})) {
+    }
+  }
+
   /// Waits until this many threads run the slow work.
   bool AwaitSlowWork(std::size_t count) {
     std::size_t running = 0;
@@ -76,6 +82,14 @@ TEST_F(SlowDisks, DelayWorkOnAnotherDiskWhenTheyTakeAllThreads) {
   std::future<bool> quick = AddQuickWork();
   EXPECT_EQ(std::future_status::timeout, quick.wait_for(std::chrono::seconds(0)));
   BecomeFast();
+  EXPECT_TRUE(quick.get());
+}
+
+TEST_F(SlowDisks, DelayNoWorkOnAnotherDiskWhenTooMuchWaitsForThem) {
+  AddSlowWork(1);
+  FillUp();
+  std::future<bool> quick = AddQuickWork();
+  ASSERT_EQ(std::future_status::ready, quick.wait_for(test::DEADLINE));
   EXPECT_TRUE(quick.get());
 }
 

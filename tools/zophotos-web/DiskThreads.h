@@ -19,7 +19,7 @@ class DiskThreads {
 public:
   static constexpr std::size_t THREADS = 16;
   static constexpr std::size_t MOST_PER_VOLUME = 2; ///< of the threads
-  static constexpr std::size_t MOST_WAITING = 300;
+  static constexpr std::size_t MOST_WAITING = 300;  ///< for a volume
   static constexpr std::chrono::seconds LONGEST_WAIT{10};
 
   /// Called once: with true in one of the threads, or with false when the work waited too long.
@@ -31,7 +31,7 @@ public:
   DiskThreads& operator=(const DiskThreads&) = delete;
   ~DiskThreads() { Stop(); }
 
-  /// Returns false, and drops the work, if too much of it waits.
+  /// Returns false, and drops the work, if too much waits for this volume.
   bool Add(const std::string& volume, Work work);
 
   /// Ends the work that has waited too long.
