@@ -720,7 +720,13 @@ class Tree {
     if (list === null && !isOpen) {
       list = document.createElement("ul");
       item.append(list);
-      await this.fill(list, item.dataset.id, "");
+      try {
+        await this.fill(list, item.dataset.id, "");
+      } catch {
+        list.remove(); // the next click tries again
+        button.setAttribute("aria-expanded", "false");
+        return;
+      }
     }
     if (list !== null) {
       list.hidden = button.getAttribute("aria-expanded") === "false";
@@ -746,9 +752,9 @@ class Tree {
       button.type = "button";
       button.className = "button";
       button.textContent = "More folders";
-      button.addEventListener("click", async () => {
-        await this.fill(list, parent, `&after=${answer.folders.at(-1).id}`);
-        rest.remove();
+      button.addEventListener("click", () => {
+        this.fill(list, parent, `&after=${answer.folders.at(-1).id}`)
+          .then(() => rest.remove(), () => {}); // the next click tries again
       });
       rest.append(button);
       list.append(rest);
