@@ -13,7 +13,8 @@ DiskThreads::DiskThreads() {
 
 bool DiskThreads::Add(const std::string& volume, Work work) {
   const std::lock_guard lock(mutex_);
-  if (isStopping_ || waiting_.size() >= MOST_WAITING) {
+  const auto waits = std::ranges::count(waiting_, volume, &Waiting::volume);
+  if (isStopping_ || static_cast<std::size_t>(waits) >= MOST_WAITING) {
     return false;
   }
   waiting_.push_back({.volume = volume, .work = std::move(work), .since = Clock::now()});

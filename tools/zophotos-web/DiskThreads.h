@@ -13,13 +13,13 @@
 
 namespace orva::web {
 
-/// Threads for work that may wait for the disk of a volume. A slow disk delays only work on its own
-/// volume. Any thread.
+/// Threads for work that may wait for the disk of a volume. Slow disks delay only work on their own
+/// volumes, unless eight or more are slow: these can take all threads. Any thread.
 class DiskThreads {
 public:
-  static constexpr std::size_t THREADS = 4;
+  static constexpr std::size_t THREADS = 16;
   static constexpr std::size_t MOST_PER_VOLUME = 2; ///< of the threads
-  static constexpr std::size_t MOST_WAITING = 300;
+  static constexpr std::size_t MOST_WAITING = 300;  ///< for a volume
   static constexpr std::chrono::seconds LONGEST_WAIT{10};
 
   /// Called once: with true in one of the threads, or with false when the work waited too long.
@@ -31,7 +31,7 @@ public:
   DiskThreads& operator=(const DiskThreads&) = delete;
   ~DiskThreads() { Stop(); }
 
-  /// Returns false, and drops the work, if too much of it waits.
+  /// Returns false, and drops the work, if too much waits for this volume.
   bool Add(const std::string& volume, Work work);
 
   /// Ends the work that has waited too long.

@@ -15,6 +15,38 @@ DESKTOP = (1280, 800)
 PHONE = (320, 640)
 
 
+# Gives the test control of a page: it says which requests fail, when the server sends an event and
+# when the pauses of the page end.
+CONTROL = """
+  window.failing = null; // pattern of the addresses whose requests fail
+  const fetchReally = window.fetch;
+  window.fetch = async (address) =>
+    failing?.test(address) ? new Response("", { status: 503 }) : fetchReally(address);
+  const timers = new Map();
+  let lastTimer = 0;
+  window.setTimeout = (work, delay) => {
+    timers.set(++lastTimer, { work, delay });
+    return lastTimer;
+  };
+  window.clearTimeout = (timer) => timers.delete(timer);
+  window.pauses = () => [...timers.values()].map(({ delay }) => Math.round(delay / 1000)).join();
+  window.endPauses = () => {
+    const ended = [...timers.values()];
+    timers.clear();
+    ended.forEach(({ work }) => work());
+  };
+  window.EventSource = class extends EventTarget {
+    constructor() {
+      super();
+      window.send = (event) => this.dispatchEvent(new Event(event));
+    }
+    close() {
+      window.send = null;
+    }
+  };
+"""
+
+
 class Browser:
     def __init__(self):
         options = webdriver.ChromeOptions()
@@ -61,8 +93,22 @@ class Browser:
     def command(self, name, **parameters):
         return self.driver.execute_cdp_cmd(name, parameters)
 
+    def open_controlled(self, path):
+        """Opens the page with what CONTROL defines."""
+        script = self.command("Page.addScriptToEvaluateOnNewDocument", source=CONTROL)
+        try:
+            self.open(path)
+        finally:
+            self.command("Page.removeScriptToEvaluateOnNewDocument", identifier=script["identifier"])
+
     def open(self, path):
         self.driver.get(BASE + path)
+
+    def open_controlled(self, path):
+        """Opens the page with what CONTROL defines."""
+        script = self.command("Page.addScriptToEvaluateOnNewDocument", source=CONTROL)
+        self.open(path)
+        self.command("Page.removeScriptToEvaluateOnNewDocument", **script)
 
     def run(self, script, *arguments):
         return self.driver.execute_script(script, *arguments)

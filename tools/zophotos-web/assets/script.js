@@ -28,6 +28,8 @@ const MOST = 600; // photos in a grid at a time: those far away are removed and 
 const NEAR = 1500; // pixels from an end of the grid at which more photos are fetched
 const CALM = 500; // milliseconds between two updates
 const RETRY = 30000; // milliseconds until the next try when the server has too many clients
+const FIRST_PAUSE = 5000; // milliseconds after an update that failed; doubled after each further one
+const LONGEST_PAUSE = 60000;
 const MOST_IN_STRIP = 24; // volumes above the newest photos
 const MONTHS = ["January", "February", "March", "April", "May", "June", "July", "August",
   "September", "October", "November", "December"];
@@ -35,7 +37,7 @@ const MONTHS = ["January", "February", "March", "April", "May", "June", "July", 
 async function fetchJson(address, options) {
   const response = await fetch(address, options);
   if (!response.ok) {
-    throw new Error(`${address}: ${response.status}`);
+    throw new Error(`${address}: ${response.status}`, { cause: response.status });
   }
   return response.json();
 }
@@ -122,6 +124,7 @@ class Grid {
       tile,
     }));
     this.working = Promise.resolve();
+    this.onFailure = () => {};
     this.makeNews();
     let isWaiting = false;
     const look = () => {
@@ -152,9 +155,16 @@ class Grid {
     this.root.before(region);
   }
 
-  // Runs one change at a time.
+  // Runs one change at a time. Returns whether it succeeded.
   run(change) {
-    this.working = this.working.then(change).catch(() => this.showLinks());
+    this.working = this.working.then(change).then(() => {
+      this.links.hidden = true;
+      return true;
+    }, () => {
+      this.showLinks();
+      this.onFailure();
+      return false;
+    });
     return this.working;
   }
 
@@ -169,30 +179,25 @@ class Grid {
     this.links.hidden = false;
   }
 
-  // Fetches photos where the user is close to an end.
-  look() {
+  // Fetches photos where the user is close to an end. Returns whether it succeeded.
+  async look() {
     if (this.isLooking) {
-      return;
+      return true;
     }
     const box = this.root.getBoundingClientRect();
     const needsOlder = this.hasOlder && box.bottom < innerHeight + NEAR;
     const needsNewer = this.hasNewer && box.top > -NEAR;
     if (needsOlder || needsNewer) {
       this.isLooking = true;
-      const more = needsOlder ? () => this.addOlder() : () => this.addNewer();
-      let hasFailed = true;
-      this.run(async () => {
-        await more();
-        hasFailed = false;
-      }).then(() => {
-        this.isLooking = false;
-        if (!hasFailed) {
-          this.look();
-        }
-      });
-    } else if (!this.news.hidden && !this.hasNewer && this.isAtTop()) {
-      this.run(() => this.compare());
+      const hasSucceeded = await this.run(() => this.photos.length === 0 ? this.compare()
+        : needsOlder ? this.addOlder() : this.addNewer());
+      this.isLooking = false;
+      return hasSucceeded && this.look();
     }
+    if (!this.news.hidden && !this.hasNewer && this.isAtTop()) {
+      return this.run(() => this.compare());
+    }
+    return true;
   }
 
   isAtTop() {
@@ -335,13 +340,14 @@ class Grid {
   // Follows a change of the list. What is above the lower end of the window stays as it is while the
   // user looks at it: new photos there are only told of, and photos that have left are greyed.
   async compare() {
-    const isFree = this.photos.length === 0 || (this.isAtTop() && !this.hasNewer);
+    const isEmpty = this.photos.length === 0;
+    const isFree = isEmpty || (this.isAtTop() && !this.hasNewer);
     const last = this.photos.at(-1)?.id;
-    let parameters = this.hasNewer ? `&before=${BigInt(this.photos[0].id) + 1n}` : "";
+    let parameters = this.hasNewer && !isEmpty ? `&before=${BigInt(this.photos[0].id) + 1n}` : "";
     let all = [];
     let isMore = true;
     while (isMore && all.length < MOST && (all.length === 0 || !this.hasOlder ||
-           isNewer(all.at(-1).id, last))) {
+           (!isEmpty && isNewer(all.at(-1).id, last)))) {
       const { photos, more } = await this.fetchPhotos(parameters);
       all.push(...photos);
       isMore = more && photos.length > 0;
@@ -349,6 +355,7 @@ class Grid {
     }
     if (isFree) {
       this.tell(0, false);
+      this.hasNewer = false;
       this.hasOlder = isMore;
       this.show(all, false);
       return;
@@ -391,8 +398,9 @@ class Grid {
     });
   }
 
-  refresh() {
-    return this.run(() => this.compare());
+  // Returns whether it succeeded.
+  async refresh() {
+    return await this.run(() => this.compare()) && this.look();
   }
 
   // Arrow keys move the focus from photo to photo.
@@ -429,6 +437,7 @@ class Viewer {
     this.query = query;
     this.image = article.querySelector("img.large");
     this.id = null;
+    this.onFailure = () => {};
     this.image.addEventListener("error", () => this.setMissing(true));
     this.image.addEventListener("load", () => this.setMissing(false));
     for (const direction of ["newer", "older"]) {
@@ -469,6 +478,7 @@ class Viewer {
     }
     if (photo === null) {
       this.setMissing(true);
+      this.onFailure();
       return;
     }
     this.fill(photo);
@@ -494,7 +504,10 @@ class Viewer {
   async fetchPhoto(id) {
     try {
       return await fetchJson(withQuery(`/api/photos/${id}`, this.query));
-    } catch {
+    } catch (error) {
+      if (error.cause !== 404) {
+        throw error;
+      }
       const neighbour = async (direction) => {
         const address = withQuery(`/api/photos?count=1&${direction}=${id}`, this.query);
         return (await fetchJson(address)).photos[0]?.id ?? null;
@@ -707,7 +720,13 @@ class Tree {
     if (list === null && !isOpen) {
       list = document.createElement("ul");
       item.append(list);
-      await this.fill(list, item.dataset.id, "");
+      try {
+        await this.fill(list, item.dataset.id, "");
+      } catch {
+        list.remove(); // the next click tries again
+        button.setAttribute("aria-expanded", "false");
+        return;
+      }
     }
     if (list !== null) {
       list.hidden = button.getAttribute("aria-expanded") === "false";
@@ -733,9 +752,9 @@ class Tree {
       button.type = "button";
       button.className = "button";
       button.textContent = "More folders";
-      button.addEventListener("click", async () => {
-        await this.fill(list, parent, `&after=${answer.folders.at(-1).id}`);
-        rest.remove();
+      button.addEventListener("click", () => {
+        this.fill(list, parent, `&after=${answer.folders.at(-1).id}`)
+          .then(() => rest.remove(), () => {}); // the next click tries again
       });
       rest.append(button);
       list.append(rest);
@@ -848,48 +867,55 @@ function follow(grid, viewer) {
   const list = document.querySelector(".strip ul, ul.volumes");
   let source = null;
   let arePhotosDue = false;
-  let isPlanned = false;
+  let timer = null; // of the next update
+  let planned = Infinity; // when it ends
   let last = 0;
+  let pause = FIRST_PAUSE;
 
   const update = async () => {
-    isPlanned = false;
+    planned = Infinity;
     last = performance.now();
     const withPhotos = arePhotosDue;
     arePhotosDue = false;
-    let isBuilding = false;
     try {
       const status = await fetchJson("/api/status");
       const { volumes } = await fetchJson("/api/volumes");
-      isBuilding = status.state === "building";
       updateNotice(status);
       if (list !== null) {
         updateVolumes(list, volumes);
       }
-      if (withPhotos && grid !== null) {
-        await grid.refresh();
+      if (withPhotos && grid !== null && !await grid.refresh()) {
+        throw new Error("photos are missing");
       }
       if (withPhotos) {
         await viewer?.refresh();
       }
       await updateEmpty(status, volumes, grid, list);
+      pause = FIRST_PAUSE;
+      if (status.state === "building") {
+        plan(true);
+      }
     } catch {
-      // The server is away. It sends an event when it is back.
-    }
-    if (isBuilding) {
-      plan(true);
+      retry(withPhotos);
+      pause = Math.min(2 * pause, LONGEST_PAUSE);
     }
   };
-  const plan = (withPhotos) => {
+  const plan = (withPhotos, time = last + CALM) => {
     arePhotosDue ||= withPhotos;
-    if (!isPlanned && !document.hidden) {
-      isPlanned = true;
-      setTimeout(update, Math.max(0, last + CALM - performance.now()));
+    if (!document.hidden && time < planned) {
+      clearTimeout(timer);
+      planned = time;
+      timer = setTimeout(update, Math.max(0, time - performance.now()));
     }
   };
+  // The stream of events stays open when only a request fails, so the server sends no event then.
+  const retry = (withPhotos) => plan(withPhotos, performance.now() + pause);
   const connect = () => {
     if (document.hidden) {
       source?.close();
       source = null;
+      clearTimeout(timer);
+      planned = Infinity;
     } else if (source === null) {
       source = new EventSource("/api/events");
       source.addEventListener("change", () => plan(true));
@@ -903,6 +929,11 @@ function follow(grid, viewer) {
       });
     }
   };
+  for (const part of [grid, viewer]) {
+    if (part !== null) {
+      part.onFailure = () => retry(true);
+    }
+  }
   document.addEventListener("visibilitychange", connect);
   // A page in the browser's cache of pages has no connection either.
   addEventListener("pagehide", () => {
