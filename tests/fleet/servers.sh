@@ -1,4 +1,4 @@
-# shellcheck shell=bash disable=SC2034,SC2154
+# shellcheck shell=bash disable=SC1090,SC2034,SC2154
 # Sourced by the tests of doc/fleet.md in a private root, after tests/manual/appliance.sh: the blocks of
 # the page, and servers of their own.
 page=$checkout/doc/fleet.md
@@ -131,6 +131,19 @@ XML
 XML
 }
 
+# make_test_shard NUMBER: feeds of the test are longer than a block of this server, like large feeds with the
+# usual settings.
+make_test_shard() {
+  make_shard "$1"
+  cat >"$servers/shard$1/users.d/blocks.xml" <<'END'
+<yandex><profiles><default>
+  <max_block_size>2</max_block_size>
+  <max_insert_block_size>2</max_insert_block_size>
+  <min_insert_block_size_rows>2</min_insert_block_size_rows>
+</default></profiles></yandex>
+END
+}
+
 declare -A shards
 start_shard() {
   clickhouse-server --config-file="$servers/shard$1/config.xml" >>"$servers/shard$1/output" 2>&1 &
@@ -149,6 +162,29 @@ kill_shard() {
 stop_shard() {
   kill "${shards[$1]}"
   wait "${shards[$1]}"
+}
+
+# is_done NUMBER: whether all mutations of that shard are done.
+is_done() { [[ $(on_shard "$1" 'SELECT count() FROM system.mutations WHERE NOT is_done') == 0 ]]; }
+
+# --- What the page does ------------------------------------------------------------------------
+
+# add APPLIANCE SHARD: the blocks of the page, for any appliance.
+declare -A shard_of
+add() {
+  shard_of[$1]=$2
+  sql postgres --set appliance="$1" < <(sed '/^\\set/d' add.sql)
+  add_to_shard "$1" "$2"
+}
+add_to_shard() { (appliance=$1 shard=$2 && source <(sed '/^appliance=/d' add-clickhouse.sh)); }
+remove_from_shard() { (appliance=$1 shard=$2 && source <(sed '/^appliance=/d' remove-clickhouse.sh)); }
+
+# load DATABASE APPLIANCE COMMAND...
+load() {
+  case $1 in
+  postgresql) PGUSER=fleet_load PGAPPNAME=load ./fleet-load-postgresql "${@:2}" ;;
+  clickhouse) ./fleet-load-clickhouse ${2:+"${shard_of[$2]:-shard1}"} "${@:2}" ;;
+  esac
 }
 
 # --- The content -------------------------------------------------------------------------------
