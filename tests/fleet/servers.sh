@@ -131,8 +131,8 @@ XML
 XML
 }
 
-# make_test_shard NUMBER: feeds of the test are longer than a block of this server, like large feeds with the
-# usual settings.
+# make_test_shard NUMBER: a shard with small blocks: without the settings of the loader, each feed of more than a
+# few rows becomes several blocks, as a large one does with the usual settings.
 make_test_shard() {
   make_shard "$1"
   cat >"$servers/shard$1/users.d/blocks.xml" <<'END'
@@ -140,6 +140,8 @@ make_test_shard() {
   <max_block_size>2</max_block_size>
   <max_insert_block_size>2</max_insert_block_size>
   <min_insert_block_size_rows>2</min_insert_block_size_rows>
+  <min_insert_block_size_bytes>2</min_insert_block_size_bytes>
+  <group_by_two_level_threshold>1</group_by_two_level_threshold>
 </default></profiles></yandex>
 END
 }
