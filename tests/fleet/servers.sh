@@ -6,7 +6,9 @@ page=$checkout/doc/fleet.md
 # same WHAT ACTUAL EXPECTED: compares two files.
 same() { diff --text --unified "$3" "$2" >&2 || fail "$1"; }
 
+# save_blocks: saves the blocks in this directory.
 save_blocks() {
+  loaders=$PWD
   blocks "$page" bash 'Feeds' >fleet-feed
   blocks "$page" sh 'PostgreSQL: creating the database' >create.sh
   blocks "$page" sql 'PostgreSQL: creating the database' >create.sql
@@ -184,8 +186,8 @@ remove_from_shard() { (appliance=$1 shard=$2 && source <(sed '/^appliance=/d' re
 # load DATABASE APPLIANCE COMMAND...
 load() {
   case $1 in
-  postgresql) PGUSER=fleet_load PGAPPNAME=load ./fleet-load-postgresql "${@:2}" ;;
-  clickhouse) ./fleet-load-clickhouse ${2:+"${shard_of[$2]:-shard1}"} "${@:2}" ;;
+  postgresql) PGUSER=fleet_load PGAPPNAME=load "$loaders/fleet-load-postgresql" "${@:2}" ;;
+  clickhouse) "$loaders/fleet-load-clickhouse" ${2:+"${shard_of[$2]:-shard1}"} "${@:2}" ;;
   esac
 }
 
