@@ -209,7 +209,7 @@ END
   clickhouse)
     echo path,volume,modified,created
     on_shard 1 "SELECT concat('\"', replaceAll(path, '\"', '\"\"'), '\",\"', volume, '\",', modified, ',', created)
-        FROM fleet.photos WHERE appliance = '${2//\'/\\\'}'
+        FROM fleet.photos WHERE appliance = $(sed "s/[\\\\']/\\\\&/g; 1s/^/'/; \$s/\$/'/" <<<"$2")
        GROUP BY path, volume, modified, created, copy HAVING sum(sign) > 0
        ORDER BY replaceRegexpOne(path, '[^/]*\$', ''), path, modified FORMAT TSVRaw"
     ;;
