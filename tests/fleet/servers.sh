@@ -1,4 +1,4 @@
-# shellcheck shell=bash disable=SC2034,SC2154
+# shellcheck shell=bash disable=SC1090,SC2034,SC2154
 # Sourced by the tests of doc/fleet.md in a private root, after tests/manual/appliance.sh: the blocks of
 # the page, and servers of their own.
 page=$checkout/doc/fleet.md
@@ -6,7 +6,9 @@ page=$checkout/doc/fleet.md
 # same WHAT ACTUAL EXPECTED: compares two files.
 same() { diff --text --unified "$3" "$2" >&2 || fail "$1"; }
 
+# save_blocks: saves the blocks in this directory.
 save_blocks() {
+  loaders=$PWD
   blocks "$page" bash 'Feeds' >fleet-feed
   blocks "$page" sh 'PostgreSQL: creating the database' >create.sh
   blocks "$page" sql 'PostgreSQL: creating the database' >create.sql
@@ -131,6 +133,21 @@ XML
 XML
 }
 
+# make_test_shard NUMBER: a shard with small blocks: without the settings of the loader, each feed of more than a
+# few rows becomes several blocks, as a large one does with the usual settings.
+make_test_shard() {
+  make_shard "$1"
+  cat >"$servers/shard$1/users.d/blocks.xml" <<'END'
+<yandex><profiles><default>
+  <max_block_size>2</max_block_size>
+  <max_insert_block_size>2</max_insert_block_size>
+  <min_insert_block_size_rows>2</min_insert_block_size_rows>
+  <min_insert_block_size_bytes>2</min_insert_block_size_bytes>
+  <group_by_two_level_threshold>1</group_by_two_level_threshold>
+</default></profiles></yandex>
+END
+}
+
 declare -A shards
 start_shard() {
   clickhouse-server --config-file="$servers/shard$1/config.xml" >>"$servers/shard$1/output" 2>&1 &
@@ -151,6 +168,29 @@ stop_shard() {
   wait "${shards[$1]}"
 }
 
+# is_done NUMBER: whether all mutations of that shard are done.
+is_done() { [[ $(on_shard "$1" 'SELECT count() FROM system.mutations WHERE NOT is_done') == 0 ]]; }
+
+# --- What the page does ------------------------------------------------------------------------
+
+# add APPLIANCE SHARD: the blocks of the page, for any appliance.
+declare -A shard_of
+add() {
+  shard_of[$1]=$2
+  sql postgres --set appliance="$1" < <(sed '/^\\set/d' add.sql)
+  add_to_shard "$1" "$2"
+}
+add_to_shard() { (appliance=$1 shard=$2 && source <(sed '/^appliance=/d' add-clickhouse.sh)); }
+remove_from_shard() { (appliance=$1 shard=$2 && source <(sed '/^appliance=/d' remove-clickhouse.sh)); }
+
+# load DATABASE APPLIANCE COMMAND...
+load() {
+  case $1 in
+  postgresql) PGUSER=fleet_load PGAPPNAME=load "$loaders/fleet-load-postgresql" "${@:2}" ;;
+  clickhouse) "$loaders/fleet-load-clickhouse" ${2:+"${shard_of[$2]:-shard1}"} "${@:2}" ;;
+  esac
+}
+
 # --- The content -------------------------------------------------------------------------------
 
 # exported DATABASE APPLIANCE: its photos in the form and order of an export.
@@ -169,7 +209,7 @@ END
   clickhouse)
     echo path,volume,modified,created
     on_shard 1 "SELECT concat('\"', replaceAll(path, '\"', '\"\"'), '\",\"', volume, '\",', modified, ',', created)
-        FROM fleet.photos WHERE appliance = '${2//\'/\\\'}'
+        FROM fleet.photos WHERE appliance = $(sed "s/[\\\\']/\\\\&/g; 1s/^/'/; \$s/\$/'/" <<<"$2")
        GROUP BY path, volume, modified, created, copy HAVING sum(sign) > 0
        ORDER BY replaceRegexpOne(path, '[^/]*\$', ''), path, modified FORMAT TSVRaw"
     ;;
