@@ -32,6 +32,7 @@ struct BatchLimits {
   long long space = 0; ///< bytes for the copy of a single photo
   long long most = 0;  ///< the same when nothing else is there
   bool isOnly = true;  ///< there is no other batch
+  bool isSlow = false; ///< a single slow photo
 };
 
 /// A volume whose photos are rendered. Each operation is one piece of work: it opens the volume and
@@ -55,8 +56,14 @@ public:
   /// of photos that have vanished.
   void Look();
 
-  /// Whether Stage may find photos.
+  /// Whether Stage may find photos that are not slow.
   bool HasWork() const;
+
+  /// Whether Stage may find slow photos: those that a batch did not render in the usual time.
+  bool HasSlow() const;
+
+  /// Whether Stage found no space for the copies when it was last called.
+  bool NeedsSpace() const noexcept { return needsSpace_; }
 
   /// Copies the next photos that wait to a new folder at `path`. Returns nothing if there are none
   /// now, or if there is no space for the copies.
@@ -125,7 +132,12 @@ private:
   bool IsPostponed(const catalog::WaitingPhoto& photo) const;
   void EndPostponements();
   void PostponeOrFail(Batch& batch);
+  bool IsSlow(const catalog::WaitingPhoto& photo) const;
+  void AddSlow(const Batch& batch);
   void LeaveOut(BatchPhoto photo, Batch& batch);
+  /// Both return false if the batch has no room for the next photo.
+  bool StageWaiting(const Opened& volume, const IsInBatch& isInBatch, Batch& batch, Room& room);
+  bool StageSlow(const Opened& volume, const IsInBatch& isInBatch, Batch& batch, Room& room);
   void AddUnopened(BatchPhoto photo, int error, Batch& batch);
   /// Adds the photo to the batch, or leaves it out until the next message. Returns false if the
   /// batch has no room for it.
@@ -146,9 +158,11 @@ private:
   std::size_t waiting_ = 0;
   std::size_t failed_ = 0;
   std::size_t changes_ = 0;
-  bool isExhausted_ = true;                   ///< all that wait were staged or left out
-  std::optional<catalog::WaitingPhoto> last_; ///< that was staged or left out
-  std::map<long long, Postponed> postponed_;  ///< by id
+  bool isExhausted_ = true;                         ///< all that wait were staged or left out
+  std::optional<catalog::WaitingPhoto> last_;       ///< that was staged or left out
+  bool needsSpace_ = false;                         ///< the last batch had no room for a photo
+  std::map<long long, catalog::WaitingPhoto> slow_; ///< by id, until they are staged
+  std::map<long long, Postponed> postponed_;        ///< by id
   std::optional<Clock::time_point> endPostponementsAt_;
   std::optional<std::pair<dev_t, ino_t>> renditions_; ///< the folder, when last looked at
   long long nextToCheck_ = 0;                         ///< id
