@@ -63,7 +63,7 @@ void Transcoder::Run() {
     StoreRendered();
     LookAgain();
     StageNext();
-    CheckRenditions();
+    CleanNext();
     Announce();
     UpdateStatus();
     Wait();
@@ -356,18 +356,32 @@ BatchLimits Transcoder::LimitsOfNext(const Volume& volume) const {
           .isOnly = running_.empty()};
 }
 
-/// When there is nothing to stage.
-void Transcoder::CheckRenditions() {
-  if (!HasRoom()) {
-    return;
+/// Removes renditions without a photo, one piece at a time, from one volume after the other.
+void Transcoder::CleanNext() {
+  const auto cleaned = service::NextInTurn(volumes_, lastCleaned_,
+                                           [this](auto& entry) { return Clean(entry.second); });
+  if (cleaned != volumes_.end()) {
+    lastCleaned_ = cleaned->first;
+    hasMoreWork_ = true;
   }
-  for (auto& [mountPoint, known] : volumes_) {
-    if (known.volume.HasUncheckedRenditions()) {
-      known.volume.CheckRenditions(InBatchOf(mountPoint));
-      hasMoreWork_ = true;
-      return;
-    }
+}
+
+/// Renditions are compared with the catalog only when there is nothing to stage.
+bool Transcoder::Clean(Known& known) {
+  Volume& volume = known.volume;
+  if (!volume.HasVanished() && !(volume.HasUncheckedRenditions() && HasRoom())) {
+    return false;
   }
+  if (Clock::now() < volume.PieceAt()) {
+    WakeAt(volume.PieceAt());
+    return false;
+  }
+  if (volume.HasVanished()) {
+    volume.RemoveVanished();
+  } else {
+    volume.CheckRenditions(InBatchOf(volume.MountPoint()));
+  }
+  return true;
 }
 
 void Transcoder::Announce() {

@@ -69,7 +69,8 @@ private:
   bool Stage(Known& known);
   bool StageSlow(Known& known);
   bool Stage(Known& known, const BatchLimits& limits, bool isAdditional);
-  void CheckRenditions();
+  void CleanNext();
+  bool Clean(Known& known);
   void Announce();
   void Announce(Known& known);
   bool Send(const std::string& message);
@@ -97,6 +98,7 @@ private:
   std::map<std::string, Known> volumes_; ///< by mount point
   std::string lastStaged_;               ///< mount point
   std::string lastStagedSlow_;           ///< the same for slow photos
+  std::string lastCleaned_;              ///< mount point
   unsigned long long batches_ = 0;       ///< so far
   bool isConnected_ = false;
   std::string error_;                            ///< of the last batch with one

@@ -154,6 +154,10 @@ bool Volume::HasSlow() const {
   return !slow_.empty() && !lookAgainAt_;
 }
 
+bool Volume::HasVanished() const {
+  return hasVanished_ && !lookAgainAt_;
+}
+
 bool Volume::HasUncheckedRenditions() const {
   return !isChecked_ && !lookAgainAt_;
 }
@@ -275,7 +279,7 @@ void Volume::Look() {
     }
     last_.reset();
     isExhausted_ = waiting_ == 0;
-    RemoveVanished(*volume);
+    RemoveSomeVanished(*volume);
   });
 }
 
@@ -296,27 +300,40 @@ bool Volume::WereRenditionsRemoved(const Opened& volume) {
   return former && renditions_ != former;
 }
 
-void Volume::RemoveVanished(const Opened& volume) {
-  std::vector<long long> removed;
-  std::size_t count = 0;
-  do {
-    removed = catalog::RemovedFiles(*volume.catalog, MOST_REMOVALS);
-    std::vector<long long> done;
-    for (const long long id : removed) {
-      if (catalog::IsOnVolume(*volume.catalog, id) || RemoveRendition(volume.root, id)) {
-        done.push_back(id);
-      }
+void Volume::RemoveVanished() {
+  Attempt([this] {
+    hasVanished_ = false; // until the next message
+    const auto volume = Open();
+    if (volume && volume->identity == identity_) {
+      RemoveSomeVanished(*volume);
     }
-    count = done.size();
-    if (count > 0) {
-      db::Transaction transaction(*volume.catalog, LOCK_TIMEOUT);
-      for (const long long id : done) {
-        catalog::ForgetRemovedFile(*volume.catalog, id);
-      }
-      transaction.Commit();
-      lockedSince_.reset();
+  });
+}
+
+void Volume::RemoveSomeVanished(const Opened& volume) {
+  const auto end = Clock::now() + PIECE;
+  const std::vector<long long> removed = catalog::RemovedFiles(*volume.catalog, MOST_REMOVALS);
+  std::vector<long long> done;
+  bool isComplete = removed.size() < MOST_REMOVALS;
+  for (const long long id : removed) {
+    if (Clock::now() > end) {
+      isComplete = false;
+      break;
     }
-  } while (count == MOST_REMOVALS);
+    if (catalog::IsOnVolume(*volume.catalog, id) || RemoveRendition(volume.root, id)) {
+      done.push_back(id);
+    }
+  }
+  if (!done.empty()) {
+    db::Transaction transaction(*volume.catalog, LOCK_TIMEOUT);
+    for (const long long id : done) {
+      catalog::ForgetRemovedFile(*volume.catalog, id);
+    }
+    transaction.Commit();
+    lockedSince_.reset();
+  }
+  hasVanished_ = !isComplete && !done.empty();
+  pieceAt_ = hasVanished_ ? Clock::now() + PIECE : pieceAt_;
 }
 
 std::unique_ptr<Batch> Volume::Stage(const std::string& path, const BatchLimits& limits,
@@ -663,6 +680,7 @@ void Volume::CheckRenditions(const IsInBatch& isInBatch) {
     while (!isChecked_ && Clock::now() < end) {
       CheckNextFolder(*volume, isInBatch);
     }
+    pieceAt_ = isChecked_ ? pieceAt_ : Clock::now() + PIECE;
   });
 }
 

@@ -52,9 +52,15 @@ public:
   std::size_t Waiting() const noexcept { return waiting_; }
   std::size_t Failed() const noexcept { return failed_; }
 
-  /// Something has happened on the volume: looks for photos that wait, and removes the renditions
-  /// of photos that have vanished.
+  /// Something has happened on the volume: looks for photos that wait, and removes renditions like
+  /// RemoveVanished.
   void Look();
+
+  /// Whether renditions of photos that have vanished may be left.
+  bool HasVanished() const;
+
+  /// Removes some of them: one piece of work of limited time.
+  void RemoveVanished();
 
   /// Whether Stage may find photos that are not slow.
   bool HasWork() const;
@@ -87,6 +93,10 @@ public:
   /// Compares some of them: a photo without its rendition waits again, and a file without its photo
   /// is removed.
   void CheckRenditions(const IsInBatch& isInBatch);
+
+  /// When RemoveVanished or CheckRenditions is due. In the pause before, the volume can be
+  /// unmounted.
+  Clock::time_point PieceAt() const noexcept { return pieceAt_; }
 
   /// When LookAgain is due although nothing was announced.
   std::optional<Clock::time_point> LookAgainAt() const;
@@ -126,7 +136,7 @@ private:
   void ReportFull(const std::string& problem);
   void Count(const db::VolumeDB& catalog);
   bool WereRenditionsRemoved(const Opened& volume);
-  void RemoveVanished(const Opened& volume);
+  void RemoveSomeVanished(const Opened& volume);
   /// Leaves the photo out for some time. Returns false if that was done often enough.
   bool Postpone(const catalog::WaitingPhoto& photo, const std::string& reason);
   bool IsPostponed(const catalog::WaitingPhoto& photo) const;
@@ -169,6 +179,8 @@ private:
   /// First ids of the folders that are examined after those that the catalog needs.
   std::optional<std::vector<long long>> otherFolders_;
   bool isChecked_ = true; ///< all renditions are
+  bool hasVanished_ = false;
+  Clock::time_point pieceAt_{};
   bool hasReportedObstacle_ = false;
   std::string problem_; ///< as it was last logged, until renditions are written again
   Clock::time_point storeAt_{};
