@@ -42,6 +42,16 @@ protected:
     }
   }
 
+  /// Of files with the ids 1 to `count`, which the catalog does not contain.
+  void AddRemovals(int count) const {
+    constexpr int PART = 5000; // a statement may take a limited number of steps
+    for (int first = 1; first <= count; first += PART) {
+      Query("WITH RECURSIVE n(id) AS (SELECT " + std::to_string(first) +
+            " UNION ALL SELECT id + 1 FROM n LIMIT " + std::to_string(PART) +
+            ") INSERT INTO Removals SELECT id FROM n");
+    }
+  }
+
   struct stat StatusOf(const std::string& path) const {
     struct stat status {};
     EXPECT_EQ(lstat(path.c_str(), &status), 0) << path;
@@ -153,6 +163,45 @@ TEST_F(Renditions, OfVanishedPhotosAreRemoved) {
   EXPECT_TRUE(Await([this] { return Number("SELECT count(*) FROM Removals") == 0; }));
   EXPECT_FALSE(fs::exists(RenditionOf(1)));
   EXPECT_TRUE(fs::exists(RenditionOf(2)));
+}
+
+TEST_F(Renditions, OfManyVanishedPhotosAreRemovedInPieces) {
+  const Volume other("B", "100m");
+  const std::string disk = Root();
+  fs::create_directory("/shares/C");
+  ASSERT_EQ(mount(disk.c_str(), "/shares/C", nullptr, MS_BIND, nullptr), 0);
+  AddAllWaiting({}); // makes the catalog
+  AddRemovals(400000);
+  TranscoderTest::Announce("plugged", "/shares/C");
+  UseRoot(other.Path());
+  CopyPhoto("b.jpg");
+  AddWaiting("b.jpg");
+  RenderAll();
+  EXPECT_EQ(StateOf("b.jpg"), "finished");
+  UseRoot(disk);
+  const long long left = Number("SELECT count(*) FROM Removals");
+  EXPECT_GT(left, 0);
+  EXPECT_TRUE(Await([&] { return Number("SELECT count(*) FROM Removals") < left; }));
+  EXPECT_TRUE(Await([] { return umount2("/shares/C", 0) == 0; })) << errno;
+  EXPECT_GT(Number("SELECT count(*) FROM Removals"), 0);
+}
+
+TEST_F(Renditions, AreRemovedUntilNoneOfAVanishedPhotoIsLeft) {
+  KillTranscoder();
+  AddAllWaiting({});
+  AddRemovals(25000);
+  WriteBytes(RenditionOf(1), "of a vanished photo");
+  WriteBytes(RenditionOf(25000), "of a vanished photo");
+  orva::transcoder::Volume volume(Root() + '/', catalog::VolumeRoot::Kind::Mount);
+  volume.Look();
+  std::size_t pieces = 1;
+  for (; volume.HasVanished(); ++pieces) {
+    volume.RemoveVanished();
+  }
+  EXPECT_GE(pieces, 3U);
+  EXPECT_EQ(Number("SELECT count(*) FROM Removals"), 0);
+  EXPECT_FALSE(fs::exists(RenditionOf(1)));
+  EXPECT_FALSE(fs::exists(RenditionOf(25000)));
 }
 
 TEST_F(Renditions, AreComparedWithTheCatalogWhenTheVolumeAppears) {

@@ -115,6 +115,7 @@ TEST_F(Sandbox, IsEndedWhenItTakesTooLong) {
                                                        .time = std::chrono::seconds(40)});
   EXPECT_TRUE(working.wasTooSlow);
   EXPECT_EQ(working.status, 128 + SIGXCPU);
+  EXPECT_TRUE(Shell("sleep 20", {.isOverdue = [] { return true; }}).wasTooSlow);
   // Background processes end with the program.
   const Ending left = Shell("sleep 1000 & exit 0", {.time = std::chrono::seconds(2)});
   EXPECT_NE(test::Run({"pidof", "sleep"}).status, 0) << left.status;

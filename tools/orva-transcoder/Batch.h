@@ -20,6 +20,7 @@ struct BatchPhoto {
   std::string failure{};
   /// Why it was not rendered, if that may pass: it is tried again later. Otherwise empty.
   std::string obstacle{};
+  bool isSlow = false;     ///< not rendered in the usual time: it is rendered later, alone
   bool isOutdated = false; ///< the photo was changed since: the result is not used
 };
 
@@ -29,6 +30,7 @@ struct Batch {
   std::string identity; ///< of the catalog
   StagingFolder folder;
   std::vector<BatchPhoto> photos{};
+  bool isSlow = false; ///< of one photo that was slow before: only the limits of a photo apply
   /// Why nothing was rendered, although that is not due to the photos; empty otherwise.
   std::string error{};
 };

@@ -12,6 +12,7 @@
 #include <algorithm>
 #include <array>
 #include <charconv>
+#include <chrono>
 #include <csignal>
 #include <cstddef>
 #include <exception>
@@ -46,6 +47,10 @@ for n; do
   fi
   cat "/tmp/$preview" >"/out/$n.jpg"
 done)sh";
+
+// The usual time of each step of a batch. What is not rendered then is slow.
+constexpr std::chrono::seconds USUAL_TIME(5);
+constexpr std::chrono::seconds USUAL_TIME_PER_PHOTO(1); // more, for each one that is done
 
 /// Those of a process that works on `photos` photos.
 Limits LimitsFor(std::size_t photos) {
@@ -150,16 +155,20 @@ std::string Reason(const Ending& ending, const Limits& limits) {
 /// Renders one batch.
 class Rendering {
 public:
-  explicit Rendering(Batch& batch) : batch_(batch), hasProfile_(batch.photos.size(), true) {}
+  explicit Rendering(Batch& batch)
+      : batch_(batch), hasProfile_(batch.photos.size(), true), pixels_(batch.photos.size()) {}
 
   void Run() {
     ExtractPreviews();
     ExamineImages();
-    const Numbers photos = Remaining();
+    BeginStep();
+    Numbers photos = Remaining();
+    // Small ones do not wait for large ones that may be slow.
+    std::ranges::stable_sort(photos, {}, [this](std::size_t number) { return pixels_[number]; });
     for (const bool hasProfile : {false, true}) {
       Numbers alike = photos;
       std::erase_if(alike, [&](std::size_t number) { return hasProfile_[number] != hasProfile; });
-      if (alike.size() > 1) {
+      if (alike.size() > 1 && !IsOverdue()) {
         MakeThumbnails(alike, hasProfile);
       }
     }
@@ -173,24 +182,53 @@ public:
   }
 
 private:
-  /// The photos that have not failed and met no obstacle.
+  using Clock = std::chrono::steady_clock;
+
+  /// The photos that may still be rendered in this batch.
   Numbers Remaining() const {
     Numbers numbers;
     for (std::size_t number = 0; number < batch_.photos.size(); ++number) {
-      if (batch_.photos[number].failure.empty() && batch_.photos[number].obstacle.empty()) {
+      const BatchPhoto& photo = batch_.photos[number];
+      if (photo.failure.empty() && photo.obstacle.empty() && !photo.isSlow) {
         numbers.push_back(number);
       }
     }
     return numbers;
   }
 
+  void BeginStep() { stepBegan_ = Clock::now(); }
+
+  /// Whether this step takes longer than usual for the photos that are done.
+  bool IsOverdue() const {
+    const auto time = Clock::now() - stepBegan_;
+    if (batch_.isSlow || time <= USUAL_TIME) {
+      return false;
+    }
+    std::size_t done = 0;
+    for (std::size_t number = 0; number < batch_.photos.size(); ++number) {
+      done += !batch_.photos[number].failure.empty() || HasOutput(number) ? 1 : 0;
+    }
+    return time > USUAL_TIME + done * USUAL_TIME_PER_PHOTO;
+  }
+
+  /// Leaves the photo to a later batch if this one is overdue.
+  bool IsLeftToLater(std::size_t number) {
+    batch_.photos[number].isSlow = IsOverdue();
+    return batch_.photos[number].isSlow;
+  }
+
   void Fail(std::size_t number, const std::string& reason) {
     batch_.photos[number].failure = reason;
   }
 
-  /// The same for what a program has said. If no program works, something else has killed it, or
-  /// the space for its output is used up, that is not due to the photo.
+  /// The same for what a program has said. Only a photo that was slow before fails for its time. If
+  /// no program works, something else has killed it, or the space for its output is used up, that
+  /// is not due to the photo.
   void Fail(std::size_t number, const Ending& ending, const Limits& limits) {
+    if (ending.wasTooSlow && !batch_.isSlow) {
+      batch_.photos[number].isSlow = true;
+      return;
+    }
     if (!isSandboxTested_) {
       TestSandbox();
       isSandboxTested_ = true;
@@ -214,7 +252,8 @@ private:
   }
 
   Ending Run(std::vector<std::string> command, const Numbers& photos, const char* prefix,
-             const Limits& limits) const {
+             Limits limits) const {
+    limits.isOverdue = [this] { return IsOverdue(); };
     for (const std::size_t number : photos) {
       command.push_back(prefix + std::to_string(number));
     }
@@ -228,19 +267,37 @@ private:
     if (raws.empty()) {
       return;
     }
-    Extract(raws);
+    BeginStep();
+    if (Extract(raws).wasTooSlow) {
+      const auto last = std::ranges::find_if(
+          raws.rbegin(), raws.rend(), [this](std::size_t number) { return HasOutput(number); });
+      if (last != raws.rend()) {
+        batch_.photos[*last].isSlow = !batch_.isSlow; // its preview may be incomplete
+      }
+    }
     for (const std::size_t number : raws) {
-      bool wasKilled = false;
       if (!HasOutput(number)) {
-        wasKilled = Extract({number}).WasKilled(); // it may be missing because of another photo
+        ExtractAlone(number); // it may be missing because of another photo
       }
-      if (wasKilled) {
-        batch_.photos[number].obstacle = KILLED;
-      } else if (HasOutput(number)) {
+    }
+    for (const std::size_t number : Remaining()) {
+      if (batch_.photos[number].isRaw) {
         batch_.folder.UseOutputAsInput(number);
-      } else {
-        Fail(number, "no preview in this raw photo");
       }
+    }
+  }
+
+  void ExtractAlone(std::size_t number) {
+    if (IsLeftToLater(number)) {
+      return;
+    }
+    const Ending ending = Extract({number});
+    if (ending.WasKilled()) {
+      batch_.photos[number].obstacle = KILLED;
+    } else if (ending.wasTooSlow) {
+      Fail(number, ending, LimitsFor(1));
+    } else if (!HasOutput(number)) {
+      Fail(number, "no preview in this raw photo");
     }
   }
 
@@ -262,12 +319,16 @@ private:
     if (photos.empty()) {
       return;
     }
+    BeginStep();
     const std::vector<std::string> command = {"/usr/bin/vipsheader"};
     const auto images = ReadImages(Run(command, photos, "/in/", LimitsFor(photos.size())).output);
     for (const std::size_t number : photos) {
       const auto image = images.find(number);
       if (image != images.end()) {
         Examine(number, image->second);
+        continue;
+      }
+      if (IsLeftToLater(number)) {
         continue;
       }
       const Limits limits = LimitsFor(1);
@@ -284,6 +345,8 @@ private:
   void Examine(std::size_t number, const Image& image) {
     if (image.width > MOST_PIXELS / image.height) {
       Fail(number, util::FormatString("too large: %lld x %lld pixels", image.width, image.height));
+    } else {
+      pixels_[number] = image.width * image.height;
     }
     // JPEG files have this text before each part of a profile.
     hasProfile_[number] = !image.isSrgbJpeg || batch_.folder.InputContains(number, "ICC_PROFILE");
@@ -301,6 +364,9 @@ private:
   }
 
   void MakeThumbnail(std::size_t number) {
+    if (IsLeftToLater(number)) {
+      return;
+    }
     const Ending ending = MakeThumbnails({number}, hasProfile_[number]);
     if (!ending.IsSuccess() || !IsRendition(batch_.folder.OpenOutput(number))) {
       Fail(number, ending, LimitsFor(1));
@@ -308,7 +374,9 @@ private:
   }
 
   Batch& batch_;
-  std::vector<bool> hasProfile_; ///< by number: may have a colour profile, or is not sRGB
+  std::vector<bool> hasProfile_;  ///< by number: may have a colour profile, or is not sRGB
+  std::vector<long long> pixels_; ///< by number
+  Clock::time_point stepBegan_{};
   bool isSandboxTested_ = false;
 };
 

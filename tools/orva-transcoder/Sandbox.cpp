@@ -28,6 +28,7 @@ using Clock = std::chrono::steady_clock;
 constexpr std::size_t KEPT_OUTPUT = std::size_t{64} * 1024;
 constexpr rlim_t MOST_PROCESSES = 1024; // and threads, of all sandboxes
 constexpr int CANNOT_START = 127;
+constexpr std::chrono::milliseconds OVERDUE_CHECK(200);
 
 /// Hides libvips's loadable modules except the one for HEIF: the formats of the others are no
 /// photos, and to load them takes as long as to load the program.
@@ -180,15 +181,17 @@ bool Read(const util::FileDescriptor& pipe, std::string& text) {
 }
 
 /// Reads both pipes to their ends, which come when all processes of the sandbox have ended. Returns
-/// false when `deadline` has passed.
-bool ReadToEnd(Pipe& output, Pipe& error, Ending& ending, Clock::time_point deadline) {
+/// false when `deadline` has passed or the program is overdue.
+bool ReadToEnd(Pipe& output, Pipe& error, Ending& ending, Clock::time_point deadline,
+               const std::function<bool()>& isOverdue) {
   std::array<pollfd, 2> pipes{pollfd{output.reader.Get(), POLLIN, 0},
                               pollfd{error.reader.Get(), POLLIN, 0}};
   while (pipes[0].fd != -1 || pipes[1].fd != -1) {
-    const auto left = std::chrono::ceil<std::chrono::milliseconds>(deadline - Clock::now());
-    if (left.count() <= 0) {
+    auto left = std::chrono::ceil<std::chrono::milliseconds>(deadline - Clock::now());
+    if (left.count() <= 0 || (isOverdue && isOverdue())) {
       return false;
     }
+    left = isOverdue ? std::min(left, OVERDUE_CHECK) : left;
     if (poll(pipes.data(), pipes.size(), static_cast<int>(left.count())) <= 0) {
       continue;
     }
@@ -230,10 +233,10 @@ Ending RunInSandbox(const std::vector<std::string>& command, const SandboxFolder
   error.writer.Reset();
 
   Ending ending;
-  if (!ReadToEnd(output, error, ending, deadline)) {
+  if (!ReadToEnd(output, error, ending, deadline, limits.isOverdue)) {
     ending.wasTooSlow = true;
     process.Kill();
-    ReadToEnd(output, error, ending, Clock::now() + std::chrono::seconds(10));
+    ReadToEnd(output, error, ending, Clock::now() + std::chrono::seconds(10), {});
   }
   ending.status = process.Wait();
   ending.wasTooSlow = ending.wasTooSlow || ending.status == 128 + SIGXCPU;

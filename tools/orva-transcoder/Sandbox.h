@@ -5,6 +5,7 @@
 #include <chrono>
 #include <csignal>
 #include <cstddef>
+#include <functional>
 #include <string>
 #include <vector>
 
@@ -20,6 +21,7 @@ struct Limits {
   std::chrono::seconds time{120};
   std::size_t memory = std::size_t{1} << 30;   ///< bytes of address space of each process
   std::size_t fileSize = std::size_t{4} << 20; ///< bytes of each file that it writes
+  std::function<bool()> isOverdue{};           ///< asked some times a second; true ends the program
 };
 
 /// How a program in a sandbox has ended.

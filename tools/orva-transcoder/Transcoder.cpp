@@ -63,7 +63,7 @@ void Transcoder::Run() {
     StoreRendered();
     LookAgain();
     StageNext();
-    CheckRenditions();
+    CleanNext();
     Announce();
     UpdateStatus();
     Wait();
@@ -204,38 +204,66 @@ void Transcoder::LookAgain() {
 
 /// Stages batches, from one volume after the other.
 void Transcoder::StageNext() {
-  while (!pausedUntil_ && HasRoom()) {
-    const auto staged = service::NextInTurn(volumes_, lastStaged_,
-                                            [this](auto& entry) { return Stage(entry.second); });
-    if (staged == volumes_.end()) {
-      return;
-    }
-    lastStaged_ = staged->first;
+  if (pausedUntil_) {
+    return;
   }
+  const auto stageAll = [this](std::string& last, bool (Transcoder::*stage)(Known&)) {
+    const auto isStaged = [&](auto& entry) { return (this->*stage)(entry.second); };
+    for (auto staged = service::NextInTurn(volumes_, last, isStaged); staged != volumes_.end();
+         staged = service::NextInTurn(volumes_, last, isStaged)) {
+      last = staged->first;
+    }
+  };
+  stageAll(lastStaged_, &Transcoder::Stage);
+  stageAll(lastStagedSlow_, &Transcoder::StageSlow);
 }
 
 bool Transcoder::Stage(Known& known) {
-  Volume& volume = known.volume;
-  if (!volume.HasWork()) {
+  const std::string& mountPoint = known.volume.MountPoint();
+  if (!known.volume.HasWork()) {
     return false;
   }
-  auto batch = volume.Stage(staging_ + '/' + std::to_string(++batches_), LimitsOfNext(volume),
+  const bool isAdditional = !(HasRoom() && HasFreeProcessor()) && MayAdd(mountPoint);
+  return (isAdditional || HasRoom()) && Stage(known, LimitsOfNext(known.volume), isAdditional);
+}
+
+/// Stages a slow photo.
+bool Transcoder::StageSlow(Known& known) {
+  if (!known.volume.HasSlow() || !MayAddSlow(known.volume.MountPoint())) {
+    return false;
+  }
+  BatchLimits limits = LimitsOfNext(known.volume);
+  limits.photos = 1;
+  limits.isSlow = true;
+  return Stage(known, limits, false);
+}
+
+bool Transcoder::Stage(Known& known, const BatchLimits& limits, bool isAdditional) {
+  Volume& volume = known.volume;
+  auto batch = volume.Stage(staging_ + '/' + std::to_string(++batches_), limits,
                             InBatchOf(volume.MountPoint()));
   if (!batch) {
-    hasMoreWork_ = hasMoreWork_ || (volume.HasWork() && running_.empty());
+    hasMoreWork_ = hasMoreWork_ || ((limits.isSlow ? volume.HasSlow() : volume.HasWork()) &&
+                                    (running_.empty() || !volume.NeedsSpace()));
     return false;
   }
-  Start(std::move(batch));
+  Start(std::move(batch), isAdditional);
   return true;
 }
 
-void Transcoder::Start(std::unique_ptr<Batch> batch) {
-  running_.push_back(std::make_unique<Running>(Running{.batch = std::move(batch)}));
+void Transcoder::Start(std::unique_ptr<Batch> batch, bool isAdditional) {
+  running_.push_back(
+      std::make_unique<Running>(Running{.batch = std::move(batch), .isAdditional = isAdditional}));
   Running& running = *running_.back();
   running.thread = std::jthread([this, &running] {
-    processor_.acquire();
+    const bool needsProcessor = !running.isAdditional && !running.batch->isSlow;
+    if (needsProcessor) {
+      processor_.acquire();
+    }
     Render(*running.batch);
-    processor_.release();
+    if (needsProcessor) {
+      processor_.release();
+    }
     {
       const std::lock_guard lock(mutex_);
       running.isRendered = true;
@@ -249,12 +277,37 @@ bool Transcoder::IsRendered(const Running& running) {
   return running.isRendered;
 }
 
-/// Whether another batch may be staged. Some batches more may be rendered and not stored yet.
+/// The batches that need a processor, or wait for one.
+std::size_t Transcoder::Unrendered() {
+  return static_cast<std::size_t>(std::ranges::count_if(running_, [this](const auto& running) {
+    return !running->isAdditional && !running->batch->isSlow && !IsRendered(*running);
+  }));
+}
+
+/// Whether another such batch may be staged. Some batches more may be rendered and not stored yet.
 bool Transcoder::HasRoom() {
-  const auto unrendered = std::ranges::count_if(
-      running_, [this](const auto& running) { return !IsRendered(*running); });
-  return static_cast<std::size_t>(unrendered) <= processors_ &&
-         running_.size() <= BATCHES_PER_PROCESSOR * processors_;
+  return Unrendered() <= processors_ && running_.size() <= BATCHES_PER_PROCESSOR * processors_;
+}
+
+bool Transcoder::HasFreeProcessor() {
+  return Unrendered() < processors_;
+}
+
+/// Whether a batch of this volume may be rendered although no processor is free: other volumes may
+/// keep them for a long time.
+bool Transcoder::MayAdd(const std::string& mountPoint) {
+  return std::ranges::none_of(running_, [&](const auto& running) {
+    return (running->isAdditional && !IsRendered(*running)) ||
+           (!running->batch->isSlow && running->batch->mountPoint == mountPoint);
+  });
+}
+
+/// Whether a slow photo of this volume may be rendered: no other one is.
+bool Transcoder::MayAddSlow(const std::string& mountPoint) {
+  return std::ranges::none_of(running_, [&](const auto& running) {
+    return running->batch->isSlow &&
+           (running->batch->mountPoint == mountPoint || !IsRendered(*running));
+  });
 }
 
 bool Transcoder::IsRendering(const std::string& mountPoint) const {
@@ -293,7 +346,7 @@ BatchLimits Transcoder::LimitsOfNext(const Volume& volume) const {
     staged += running->batch->mountPoint == volume.MountPoint() ? running->batch->photos.size() : 0;
   }
   const std::size_t waiting = volume.Waiting() - std::min(staged, volume.Waiting());
-  const auto batches = static_cast<long long>(processors_) + 1;
+  const auto batches = static_cast<long long>(processors_) + 2; // with an additional one
   const StagingSpace fileSystem = SpaceFor(staging_);
   const long long space = std::min(FreeSpace(), fileSystem.now);
   return {.photos = std::clamp(waiting / processors_, FEWEST_PHOTOS, MOST_PHOTOS),
@@ -303,18 +356,32 @@ BatchLimits Transcoder::LimitsOfNext(const Volume& volume) const {
           .isOnly = running_.empty()};
 }
 
-/// When there is nothing to stage.
-void Transcoder::CheckRenditions() {
-  if (!HasRoom()) {
-    return;
+/// Removes renditions without a photo, one piece at a time, from one volume after the other.
+void Transcoder::CleanNext() {
+  const auto cleaned = service::NextInTurn(volumes_, lastCleaned_,
+                                           [this](auto& entry) { return Clean(entry.second); });
+  if (cleaned != volumes_.end()) {
+    lastCleaned_ = cleaned->first;
+    hasMoreWork_ = true;
   }
-  for (auto& [mountPoint, known] : volumes_) {
-    if (known.volume.HasUncheckedRenditions()) {
-      known.volume.CheckRenditions(InBatchOf(mountPoint));
-      hasMoreWork_ = true;
-      return;
-    }
+}
+
+/// Renditions are compared with the catalog only when there is nothing to stage.
+bool Transcoder::Clean(Known& known) {
+  Volume& volume = known.volume;
+  if (!volume.HasVanished() && !(volume.HasUncheckedRenditions() && HasRoom())) {
+    return false;
   }
+  if (Clock::now() < volume.PieceAt()) {
+    WakeAt(volume.PieceAt());
+    return false;
+  }
+  if (volume.HasVanished()) {
+    volume.RemoveVanished();
+  } else {
+    volume.CheckRenditions(InBatchOf(volume.MountPoint()));
+  }
+  return true;
 }
 
 void Transcoder::Announce() {
@@ -332,7 +399,8 @@ void Transcoder::Announce(Known& known) {
     WakeAt(*sendAgainAt_);
     return;
   }
-  const bool isAtEnd = !known.volume.HasWork() && !known.volume.HasUncheckedRenditions() &&
+  const bool isAtEnd = !known.volume.HasWork() && !known.volume.HasSlow() &&
+                       !known.volume.HasUncheckedRenditions() &&
                        !IsRendering(known.volume.MountPoint());
   if (isAtEnd) {
     if (Send(notify::Compose(Event::End, known.name))) {

@@ -23,7 +23,8 @@ namespace orva::transcoder {
 
 /// The service: renders the photos that wait on all volumes. One thread does everything with the
 /// volumes; one thread for each batch waits for the programs that render it. There is one batch
-/// more than processors, so that photos are copied while others are rendered. Batches that are
+/// more than processors, so that photos are copied while others are rendered. Two more need no free
+/// processor: one of a volume that has no other batch, and one of a slow photo. Batches that are
 /// rendered may wait until they are stored.
 class Transcoder {
 public:
@@ -52,6 +53,7 @@ private:
   /// A batch that is rendered or waits to be stored.
   struct Running {
     std::unique_ptr<Batch> batch;
+    bool isAdditional = false; ///< of a volume without other batches
     std::jthread thread{};
     bool isRendered = false; ///< guarded by mutex_ until the thread has ended
   };
@@ -65,7 +67,10 @@ private:
   void LookAgain();
   void StageNext();
   bool Stage(Known& known);
-  void CheckRenditions();
+  bool StageSlow(Known& known);
+  bool Stage(Known& known, const BatchLimits& limits, bool isAdditional);
+  void CleanNext();
+  bool Clean(Known& known);
   void Announce();
   void Announce(Known& known);
   bool Send(const std::string& message);
@@ -73,9 +78,13 @@ private:
   void Wait();
   void WakeAt(Clock::time_point time);
 
-  void Start(std::unique_ptr<Batch> batch);
+  void Start(std::unique_ptr<Batch> batch, bool isAdditional);
   bool IsRendered(const Running& running);
+  std::size_t Unrendered();
   bool HasRoom();
+  bool HasFreeProcessor();
+  bool MayAdd(const std::string& mountPoint);
+  bool MayAddSlow(const std::string& mountPoint);
   bool IsRendering(const std::string& mountPoint) const;
   Volume::IsInBatch InBatchOf(const std::string& mountPoint) const;
   long long FreeSpace() const;
@@ -88,6 +97,8 @@ private:
   service::StatusFile status_;
   std::map<std::string, Known> volumes_; ///< by mount point
   std::string lastStaged_;               ///< mount point
+  std::string lastStagedSlow_;           ///< the same for slow photos
+  std::string lastCleaned_;              ///< mount point
   unsigned long long batches_ = 0;       ///< so far
   bool isConnected_ = false;
   std::string error_;                            ///< of the last batch with one

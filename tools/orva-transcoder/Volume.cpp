@@ -29,6 +29,7 @@
 #include <array>
 #include <cerrno>
 #include <ctime>
+#include <iterator>
 #include <limits>
 #include <string_view>
 #include <system_error>
@@ -46,6 +47,7 @@ using service::Printable;
 
 constexpr std::size_t MOST_LISTED = 50;       // waiting photos in one query
 constexpr std::size_t MOST_EXAMINED = 1000;   // photos in one piece of work
+constexpr std::size_t MOST_SLOW = 10'000;     // photos; more are rendered like the others
 constexpr std::size_t MOST_REMOVALS = 10'000; // in one piece of work
 constexpr std::chrono::seconds RETRY(60);
 constexpr std::chrono::seconds SPACE_CHECK(2); // of a full volume
@@ -146,6 +148,14 @@ std::size_t Volume::TakeChanges() {
 
 bool Volume::HasWork() const {
   return !isExhausted_ && !lookAgainAt_;
+}
+
+bool Volume::HasSlow() const {
+  return !slow_.empty() && !lookAgainAt_;
+}
+
+bool Volume::HasVanished() const {
+  return hasVanished_ && !lookAgainAt_;
 }
 
 bool Volume::HasUncheckedRenditions() const {
@@ -265,10 +275,11 @@ void Volume::Look() {
       isChecked_ = false;
       nextToCheck_ = 0;
       otherFolders_.reset();
+      slow_.clear();
     }
     last_.reset();
     isExhausted_ = waiting_ == 0;
-    RemoveVanished(*volume);
+    RemoveSomeVanished(*volume);
   });
 }
 
@@ -289,27 +300,40 @@ bool Volume::WereRenditionsRemoved(const Opened& volume) {
   return former && renditions_ != former;
 }
 
-void Volume::RemoveVanished(const Opened& volume) {
-  std::vector<long long> removed;
-  std::size_t count = 0;
-  do {
-    removed = catalog::RemovedFiles(*volume.catalog, MOST_REMOVALS);
-    std::vector<long long> done;
-    for (const long long id : removed) {
-      if (catalog::IsOnVolume(*volume.catalog, id) || RemoveRendition(volume.root, id)) {
-        done.push_back(id);
-      }
+void Volume::RemoveVanished() {
+  Attempt([this] {
+    hasVanished_ = false; // until the next message
+    const auto volume = Open();
+    if (volume && volume->identity == identity_) {
+      RemoveSomeVanished(*volume);
     }
-    count = done.size();
-    if (count > 0) {
-      db::Transaction transaction(*volume.catalog, LOCK_TIMEOUT);
-      for (const long long id : done) {
-        catalog::ForgetRemovedFile(*volume.catalog, id);
-      }
-      transaction.Commit();
-      lockedSince_.reset();
+  });
+}
+
+void Volume::RemoveSomeVanished(const Opened& volume) {
+  const auto end = Clock::now() + PIECE;
+  const std::vector<long long> removed = catalog::RemovedFiles(*volume.catalog, MOST_REMOVALS);
+  std::vector<long long> done;
+  bool isComplete = removed.size() < MOST_REMOVALS;
+  for (const long long id : removed) {
+    if (Clock::now() > end) {
+      isComplete = false;
+      break;
     }
-  } while (count == MOST_REMOVALS);
+    if (catalog::IsOnVolume(*volume.catalog, id) || RemoveRendition(volume.root, id)) {
+      done.push_back(id);
+    }
+  }
+  if (!done.empty()) {
+    db::Transaction transaction(*volume.catalog, LOCK_TIMEOUT);
+    for (const long long id : done) {
+      catalog::ForgetRemovedFile(*volume.catalog, id);
+    }
+    transaction.Commit();
+    lockedSince_.reset();
+  }
+  hasVanished_ = !isComplete && !done.empty();
+  pieceAt_ = hasVanished_ ? Clock::now() + PIECE : pieceAt_;
 }
 
 std::unique_ptr<Batch> Volume::Stage(const std::string& path, const BatchLimits& limits,
@@ -327,32 +351,66 @@ std::unique_ptr<Batch> Volume::Stage(const std::string& path, const BatchLimits&
         fileSystem.f_bavail < LARGEST_RENDITION / fileSystem.f_frsize) {
       throw VolumeFull(volume->root);
     }
-    Batch next{
-        .mountPoint = mountPoint_, .identity = volume->identity, .folder = StagingFolder(path)};
+    Batch next{.mountPoint = mountPoint_,
+               .identity = volume->identity,
+               .folder = StagingFolder(path),
+               .isSlow = limits.isSlow};
     Room room{.limits = limits};
-    std::size_t examined = 0;
-    for (bool isFull = false; !isFull && examined < MOST_EXAMINED;) {
-      const auto photos = last_ ? catalog::NewestWaiting(*volume->catalog, MOST_LISTED, *last_)
-                                : catalog::NewestWaiting(*volume->catalog, MOST_LISTED);
-      for (const WaitingPhoto& photo : photos) {
-        isFull =
-            !isInBatch(photo.id) && !IsPostponed(photo) && !StagePhoto(*volume, photo, next, room);
-        if (isFull) {
-          break;
-        }
-        ++examined;
-        last_ = photo;
-      }
-      if (!isFull && photos.size() < MOST_LISTED) {
-        isExhausted_ = true;
-        break;
-      }
-    }
+    needsSpace_ = limits.isSlow ? !StageSlow(*volume, isInBatch, next, room)
+                                : !StageWaiting(*volume, isInBatch, next, room);
     if (!next.photos.empty()) {
       batch = std::make_unique<Batch>(std::move(next));
     }
   });
   return batch;
+}
+
+bool Volume::StageWaiting(const Opened& volume, const IsInBatch& isInBatch, Batch& batch,
+                          Room& room) {
+  std::size_t examined = 0;
+  while (examined < MOST_EXAMINED) {
+    const auto photos = last_ ? catalog::NewestWaiting(*volume.catalog, MOST_LISTED, *last_)
+                              : catalog::NewestWaiting(*volume.catalog, MOST_LISTED);
+    for (const WaitingPhoto& photo : photos) {
+      if (!isInBatch(photo.id) && !IsSlow(photo) && !IsPostponed(photo) &&
+          !StagePhoto(volume, photo, batch, room)) {
+        return false;
+      }
+      ++examined;
+      last_ = photo;
+    }
+    if (photos.size() < MOST_LISTED) {
+      isExhausted_ = true;
+      break;
+    }
+  }
+  return true;
+}
+
+/// Takes the photos whose ids were given out last.
+bool Volume::StageSlow(const Opened& volume, const IsInBatch& isInBatch, Batch& batch, Room& room) {
+  while (!slow_.empty() && batch.photos.empty()) {
+    const auto last = std::prev(slow_.end());
+    if (!isInBatch(last->first) && !StagePhoto(volume, last->second, batch, room)) {
+      return false;
+    }
+    slow_.erase(last);
+  }
+  return true;
+}
+
+bool Volume::IsSlow(const WaitingPhoto& photo) const {
+  const auto slow = slow_.find(photo.id);
+  return slow != slow_.end() && slow->second.lastModifiedDate == photo.lastModifiedDate &&
+         slow->second.size == photo.size;
+}
+
+void Volume::AddSlow(const Batch& batch) {
+  for (const BatchPhoto& photo : batch.photos) {
+    if (photo.isSlow && !photo.isOutdated && slow_.size() < MOST_SLOW) {
+      slow_.insert_or_assign(photo.photo.id, photo.photo);
+    }
+  }
 }
 
 /// Postpones the photo, or adds it to the batch as failed if that was done often enough.
@@ -531,6 +589,7 @@ Volume::Stored Volume::Store(const std::vector<Batch*>& batches) {
       PostponeOrFail(*batch);
     }
     MarkResults(*volume, useful, written);
+    std::ranges::for_each(useful, [this](const Batch* batch) { AddSlow(*batch); });
     lockedSince_.reset();
     problem_.clear();
   });
@@ -621,6 +680,7 @@ void Volume::CheckRenditions(const IsInBatch& isInBatch) {
     while (!isChecked_ && Clock::now() < end) {
       CheckNextFolder(*volume, isInBatch);
     }
+    pieceAt_ = isChecked_ ? pieceAt_ : Clock::now() + PIECE;
   });
 }
 

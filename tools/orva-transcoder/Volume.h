@@ -32,6 +32,7 @@ struct BatchLimits {
   long long space = 0; ///< bytes for the copy of a single photo
   long long most = 0;  ///< the same when nothing else is there
   bool isOnly = true;  ///< there is no other batch
+  bool isSlow = false; ///< a single slow photo
 };
 
 /// A volume whose photos are rendered. Each operation is one piece of work: it opens the volume and
@@ -51,12 +52,24 @@ public:
   std::size_t Waiting() const noexcept { return waiting_; }
   std::size_t Failed() const noexcept { return failed_; }
 
-  /// Something has happened on the volume: looks for photos that wait, and removes the renditions
-  /// of photos that have vanished.
+  /// Something has happened on the volume: looks for photos that wait, and removes renditions like
+  /// RemoveVanished.
   void Look();
 
-  /// Whether Stage may find photos.
+  /// Whether renditions of photos that have vanished may be left.
+  bool HasVanished() const;
+
+  /// Removes some of them: one piece of work of limited time.
+  void RemoveVanished();
+
+  /// Whether Stage may find photos that are not slow.
   bool HasWork() const;
+
+  /// Whether Stage may find slow photos: those that a batch did not render in the usual time.
+  bool HasSlow() const;
+
+  /// Whether Stage found no space for the copies when it was last called.
+  bool NeedsSpace() const noexcept { return needsSpace_; }
 
   /// Copies the next photos that wait to a new folder at `path`. Returns nothing if there are none
   /// now, or if there is no space for the copies.
@@ -80,6 +93,10 @@ public:
   /// Compares some of them: a photo without its rendition waits again, and a file without its photo
   /// is removed.
   void CheckRenditions(const IsInBatch& isInBatch);
+
+  /// When RemoveVanished or CheckRenditions is due. In the pause before, the volume can be
+  /// unmounted.
+  Clock::time_point PieceAt() const noexcept { return pieceAt_; }
 
   /// When LookAgain is due although nothing was announced.
   std::optional<Clock::time_point> LookAgainAt() const;
@@ -119,13 +136,18 @@ private:
   void ReportFull(const std::string& problem);
   void Count(const db::VolumeDB& catalog);
   bool WereRenditionsRemoved(const Opened& volume);
-  void RemoveVanished(const Opened& volume);
+  void RemoveSomeVanished(const Opened& volume);
   /// Leaves the photo out for some time. Returns false if that was done often enough.
   bool Postpone(const catalog::WaitingPhoto& photo, const std::string& reason);
   bool IsPostponed(const catalog::WaitingPhoto& photo) const;
   void EndPostponements();
   void PostponeOrFail(Batch& batch);
+  bool IsSlow(const catalog::WaitingPhoto& photo) const;
+  void AddSlow(const Batch& batch);
   void LeaveOut(BatchPhoto photo, Batch& batch);
+  /// Both return false if the batch has no room for the next photo.
+  bool StageWaiting(const Opened& volume, const IsInBatch& isInBatch, Batch& batch, Room& room);
+  bool StageSlow(const Opened& volume, const IsInBatch& isInBatch, Batch& batch, Room& room);
   void AddUnopened(BatchPhoto photo, int error, Batch& batch);
   /// Adds the photo to the batch, or leaves it out until the next message. Returns false if the
   /// batch has no room for it.
@@ -146,15 +168,19 @@ private:
   std::size_t waiting_ = 0;
   std::size_t failed_ = 0;
   std::size_t changes_ = 0;
-  bool isExhausted_ = true;                   ///< all that wait were staged or left out
-  std::optional<catalog::WaitingPhoto> last_; ///< that was staged or left out
-  std::map<long long, Postponed> postponed_;  ///< by id
+  bool isExhausted_ = true;                         ///< all that wait were staged or left out
+  std::optional<catalog::WaitingPhoto> last_;       ///< that was staged or left out
+  bool needsSpace_ = false;                         ///< the last batch had no room for a photo
+  std::map<long long, catalog::WaitingPhoto> slow_; ///< by id, until they are staged
+  std::map<long long, Postponed> postponed_;        ///< by id
   std::optional<Clock::time_point> endPostponementsAt_;
   std::optional<std::pair<dev_t, ino_t>> renditions_; ///< the folder, when last looked at
   long long nextToCheck_ = 0;                         ///< id
   /// First ids of the folders that are examined after those that the catalog needs.
   std::optional<std::vector<long long>> otherFolders_;
   bool isChecked_ = true; ///< all renditions are
+  bool hasVanished_ = false;
+  Clock::time_point pieceAt_{};
   bool hasReportedObstacle_ = false;
   std::string problem_; ///< as it was last logged, until renditions are written again
   Clock::time_point storeAt_{};
