@@ -12,6 +12,7 @@
 #include <csignal>
 #include <ctime>
 #include <filesystem>
+#include <set>
 #include <sstream>
 #include <string>
 #include <thread>
@@ -112,6 +113,31 @@ TEST_F(SlowPhotos, AreRenderedOneByOneBesideTheOthers) {
   EXPECT_GT(Waiting(), 0);
   EXPECT_TRUE(Await([slow] { return Programs() == std::vector{slow}; }));
   kill(slow, SIGCONT);
+  RenderAll();
+  for (const std::string& name : names) {
+    EXPECT_EQ(StateOf(name), "finished") << name;
+  }
+}
+
+TEST_F(SlowPhotos, TakeAllProcessorsWhenNoOthersWait) {
+  const std::size_t processors = std::max(std::thread::hardware_concurrency(), 1U);
+  MakePhoto("/tmp/photo.jpg", 3000, 2000);
+  const Lines names = AddPhotos(10);
+  Announce("scanned");
+  const pid_t group = StopProgram();
+  ASSERT_TRUE(Await([group] { return kill(group, 0) != 0; })) << "not ended";
+  std::set<pid_t> stopped;
+  EXPECT_TRUE(Await([&] {
+    for (const pid_t id : Programs()) {
+      kill(id, SIGSTOP);
+      stopped.insert(id);
+    }
+    return Programs().size() == std::min<std::size_t>(processors, 10) &&
+           stopped.size() >= Programs().size();
+  }));
+  for (const pid_t id : stopped) {
+    kill(id, SIGCONT);
+  }
   RenderAll();
   for (const std::string& name : names) {
     EXPECT_EQ(StateOf(name), "finished") << name;

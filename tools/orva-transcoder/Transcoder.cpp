@@ -229,7 +229,7 @@ bool Transcoder::Stage(Known& known) {
 
 /// Stages a slow photo.
 bool Transcoder::StageSlow(Known& known) {
-  if (!known.volume.HasSlow() || !MayAddSlow(known.volume.MountPoint())) {
+  if (!known.volume.HasSlow() || !MayAddSlow()) {
     return false;
   }
   BatchLimits limits = LimitsOfNext(known.volume);
@@ -302,12 +302,17 @@ bool Transcoder::MayAdd(const std::string& mountPoint) {
   });
 }
 
-/// Whether a slow photo of this volume may be rendered: no other one is.
-bool Transcoder::MayAddSlow(const std::string& mountPoint) {
-  return std::ranges::none_of(running_, [&](const auto& running) {
-    return running->batch->isSlow &&
-           (running->batch->mountPoint == mountPoint || !IsRendered(*running));
+/// Whether another slow photo may be rendered: one beside other photos, or one per processor.
+bool Transcoder::MayAddSlow() {
+  const auto slow = std::ranges::count_if(running_, [this](const auto& running) {
+    return running->batch->isSlow && !IsRendered(*running);
   });
+  const bool isAlone =
+      std::ranges::all_of(running_, [](const auto& running) { return running->batch->isSlow; }) &&
+      std::ranges::none_of(volumes_,
+                           [](const auto& entry) { return entry.second.volume.HasWork(); });
+  return static_cast<std::size_t>(slow) < (isAlone ? processors_ : 1) &&
+         running_.size() <= BATCHES_PER_PROCESSOR * processors_;
 }
 
 bool Transcoder::IsRendering(const std::string& mountPoint) const {

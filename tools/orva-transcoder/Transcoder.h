@@ -23,8 +23,8 @@ namespace orva::transcoder {
 
 /// The service: renders the photos that wait on all volumes. One thread does everything with the
 /// volumes; one thread for each batch waits for the programs that render it. There is one batch
-/// more than processors, so that photos are copied while others are rendered. Two more need no free
-/// processor: one of a volume that has no other batch, and one of a slow photo. Batches that are
+/// more than processors, so that photos are copied while others are rendered. Others need no free
+/// processor: one of a volume that has no other batch, and those of slow photos. Batches that are
 /// rendered may wait until they are stored.
 class Transcoder {
 public:
@@ -84,7 +84,7 @@ private:
   bool HasRoom();
   bool HasFreeProcessor();
   bool MayAdd(const std::string& mountPoint);
-  bool MayAddSlow(const std::string& mountPoint);
+  bool MayAddSlow();
   bool IsRendering(const std::string& mountPoint) const;
   Volume::IsInBatch InBatchOf(const std::string& mountPoint) const;
   long long FreeSpace() const;
