@@ -340,8 +340,8 @@ Volume::Result Volume::Work(const std::function<void()>& pulse, const Found& fou
       Fail(Trouble::ReadOnly, "read-only; its catalog is not updated until this changes");
       break;
     case CatalogProblem::Full:
+      spaceWhenFull_ = root->FreeSpace(); // before others can read that it is full
       Fail(Trouble::ReadOnly, "full; its catalog is not updated until this changes");
-      spaceWhenFull_ = root->FreeSpace();
       notBefore_ = Clock::now() + SPACE_CHECK;
       break;
     default:

@@ -206,8 +206,8 @@ void Volume::Attempt(const std::function<void()>& work) {
 }
 
 void Volume::ReportFull(const std::string& problem) {
+  spaceWhenFull_ = FreeSpace(); // before others can read that it is full
   Report(problem, false);
-  spaceWhenFull_ = FreeSpace();
   retryAt_ = *lookAgainAt_;
   lookAgainAt_ = Clock::now() + SPACE_CHECK;
 }
