@@ -163,14 +163,18 @@ private:
 
   const std::string mountPoint_; ///< ends in "/"
   const catalog::VolumeRoot::Kind kind_;
-  bool wasThere_ = false; ///< it was opened before
-  std::string identity_;  ///< of the catalog when it was last looked at
+  bool wasThere_ = false;    ///< it was opened before
+  bool isExhausted_ = true;  ///< all that wait were staged or left out
+  bool needsSpace_ = false;  ///< the last batch had no room for a photo
+  bool isChecked_ = true;    ///< all renditions are
+  bool hasVanished_ = false; ///< photos, whose renditions may be left
+  bool hasReportedObstacle_ = false;
+  bool isBusy_ = false;  ///< another program used the catalog when work last failed
+  std::string identity_; ///< of the catalog when it was last looked at
   std::size_t waiting_ = 0;
   std::size_t failed_ = 0;
   std::size_t changes_ = 0;
-  bool isExhausted_ = true;                         ///< all that wait were staged or left out
   std::optional<catalog::WaitingPhoto> last_;       ///< that was staged or left out
-  bool needsSpace_ = false;                         ///< the last batch had no room for a photo
   std::map<long long, catalog::WaitingPhoto> slow_; ///< by id, until they are staged
   std::map<long long, Postponed> postponed_;        ///< by id
   std::optional<Clock::time_point> endPostponementsAt_;
@@ -178,14 +182,10 @@ private:
   long long nextToCheck_ = 0;                         ///< id
   /// First ids of the folders that are examined after those that the catalog needs.
   std::optional<std::vector<long long>> otherFolders_;
-  bool isChecked_ = true; ///< all renditions are
-  bool hasVanished_ = false;
   Clock::time_point pieceAt_{};
-  bool hasReportedObstacle_ = false;
   std::string problem_; ///< as it was last logged, until renditions are written again
   Clock::time_point storeAt_{};
   std::optional<Clock::time_point> lockedSince_; ///< the catalog, by another program
-  bool isBusy_ = false; ///< another program used the catalog when work last failed
   std::optional<Clock::time_point> lookAgainAt_;
   std::optional<long long> spaceWhenFull_; ///< bytes that were free; nothing if it is not full
   Clock::time_point retryAt_{};            ///< of a full volume
