@@ -22,4 +22,5 @@ inline bool HasOtherUsers() {
 /// returns from the test. As root, and so in continuous integration, the test always runs.
 #define SKIP_WITHOUT_OTHER_USERS()                                                                 \
   if (!::orva::test::HasOtherUsers())                                                              \
-  GTEST_SKIP() << "a private root of an ordinary user has only one user"
+  GTEST_SKIP() << "needs a second user, and only root can map one into a private root; as root, "  \
+                  "scripts/test runs this test"

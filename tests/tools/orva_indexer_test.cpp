@@ -420,18 +420,61 @@ TEST_F(VolumeWorkTest, AFileThatIsTruncatedByItsNameIsEnteredSoon) {
   EXPECT_TRUE(WorkUntilFound(SIZE, {"7"}));
 }
 
-TEST_F(VolumeWorkTest, APhotoThatIsBeingWrittenWhenTheIndexerStartsWaits) {
-  constexpr char FILES[] = "SELECT path, size FROM Files ORDER BY path";
-  std::ofstream slow(At("slow.jpg"));
-  slow << "half" << std::flush;
-  Write(At("a.jpg"), "1");
+/// A photo that a program is writing, among others.
+class UnfinishedPhotoTest : public VolumeWorkTest {
+protected:
+  void Begin(const std::string& path) {
+    fs::create_directories(fs::path(At(path)).parent_path());
+    slow_.open(At(path));
+    slow_ << "half" << std::flush;
+  }
+
+  /// Whether another photo is entered, and the one that is being written is not.
+  bool IsEnteredAlone(const std::string& other) {
+    Write(At(other), "1");
+    found_.push_back(other + "|1");
+    return AreFound();
+  }
+
+  bool IsEnteredAtItsEnd(const std::string& path) {
+    slow_ << " whole";
+    slow_.close();
+    found_.push_back(path + "|10");
+    return AreFound();
+  }
+
+private:
+  bool AreFound() {
+    std::ranges::sort(found_);
+    return WorkUntilFound("SELECT path, size FROM Files WHERE isDeleted = 0 ORDER BY path", found_);
+  }
+
+  std::ofstream slow_;
+  Lines found_;
+};
+
+TEST_F(UnfinishedPhotoTest, WaitsAlsoIfItIsOpenWhenTheIndexerStarts) {
+  Begin("slow.jpg");
   Restart();
-  ASSERT_TRUE(WorkUntilFound(FILES, {"a.jpg|1"}));
-  Write(At("b.jpg"), "1");
-  ASSERT_TRUE(WorkUntilFound(FILES, {"a.jpg|1", "b.jpg|1"}));
-  slow << " whole";
-  slow.close();
-  EXPECT_TRUE(WorkUntilFound(FILES, {"a.jpg|1", "b.jpg|1", "slow.jpg|10"}));
+  ASSERT_TRUE(IsEnteredAlone("a.jpg"));
+  ASSERT_TRUE(IsEnteredAlone("b.jpg"));
+  EXPECT_TRUE(IsEnteredAtItsEnd("slow.jpg"));
+}
+
+TEST_F(UnfinishedPhotoTest, WaitsAlsoInARenamedFolder) {
+  Begin("1/slow.jpg");
+  ASSERT_TRUE(IsEnteredAlone("a.jpg"));
+  fs::rename(At("1"), At("2"));
+  ASSERT_TRUE(IsEnteredAlone("2/b.jpg"));
+  EXPECT_TRUE(IsEnteredAtItsEnd("2/slow.jpg"));
+}
+
+TEST_F(UnfinishedPhotoTest, WaitsAlsoUnderAnotherName) {
+  Begin("slow.part");
+  fs::rename(At("slow.part"), At("slow.jpg"));
+  ASSERT_TRUE(IsEnteredAlone("a.jpg"));
+  ASSERT_TRUE(IsEnteredAlone("b.jpg"));
+  EXPECT_TRUE(IsEnteredAtItsEnd("slow.jpg"));
 }
 
 TEST_F(VolumeWorkTest, APhotoWhoseEndOfWritingIsNotReportedIsEntered) {
@@ -447,35 +490,6 @@ TEST_F(VolumeWorkTest, APhotoWhoseEndOfWritingIsNotReportedIsEntered) {
   slow << " whole";
   slow.close(); // reported for the other name
   EXPECT_TRUE(WorkUntilFound(FILES, {"1/slow.jpg|10", "2/link.jpg|10", "a.jpg|1"}));
-}
-
-TEST_F(VolumeWorkTest, APhotoThatIsBeingWrittenWaitsAlsoInARenamedFolder) {
-  constexpr char FILES[] = "SELECT path, size FROM Files WHERE isDeleted = 0 ORDER BY path";
-  fs::create_directories(At("1"));
-  std::ofstream slow(At("1/slow.jpg"));
-  slow << "half" << std::flush;
-  Write(At("a.jpg"), "1");
-  ASSERT_TRUE(WorkUntilFound(FILES, {"a.jpg|1"}));
-  fs::rename(At("1"), At("2"));
-  Write(At("2/b.jpg"), "1");
-  ASSERT_TRUE(WorkUntilFound(FILES, {"2/b.jpg|1", "a.jpg|1"}));
-  slow << " whole";
-  slow.close();
-  EXPECT_TRUE(WorkUntilFound(FILES, {"2/b.jpg|1", "2/slow.jpg|10", "a.jpg|1"}));
-}
-
-TEST_F(VolumeWorkTest, APhotoThatIsBeingWrittenWaitsAlsoUnderAnotherName) {
-  constexpr char FILES[] = "SELECT path, size FROM Files ORDER BY path";
-  std::ofstream slow(At("slow.part"));
-  slow << "half" << std::flush;
-  fs::rename(At("slow.part"), At("slow.jpg"));
-  Write(At("a.jpg"), "1");
-  ASSERT_TRUE(WorkUntilFound(FILES, {"a.jpg|1"}));
-  Write(At("b.jpg"), "1");
-  ASSERT_TRUE(WorkUntilFound(FILES, {"a.jpg|1", "b.jpg|1"}));
-  slow << " whole";
-  slow.close();
-  EXPECT_TRUE(WorkUntilFound(FILES, {"a.jpg|1", "b.jpg|1", "slow.jpg|10"}));
 }
 
 TEST_F(VolumeWorkTest, APhotoThatIsStillEmptyWaitsUntilItIsClosed) {

@@ -140,7 +140,7 @@ std::unique_ptr<db::VolumeDB> Open(const VolumeRoot& volume, std::time_t latest,
   auto catalog = ConnectToCatalog(volume);
   SelectNumber(*catalog, util::FormatString("PRAGMA busy_timeout = %u", busyTimeout).c_str());
   Require(HasOwnSchema(*catalog), "it has tables, indexes, triggers or views of others");
-  Require(HasIndexes(*catalog) || SizeOf(*catalog) <= LARGEST_WITHOUT_INDEXES,
+  Require(SizeOf(*catalog) <= LARGEST_WITHOUT_INDEXES || HasIndexes(*catalog),
           "it is large and has no indexes");
   Execute(*catalog, "PRAGMA cache_size = -16384");
   SelectNumber(*catalog, "PRAGMA journal_mode = WAL");
